@@ -1,0 +1,60 @@
+#include "host/app/Application.h"
+
+#include <cstdlib>
+#include <dlfcn.h>
+#include <filesystem>
+
+#include "host/core/Registry.h"
+#include "host/core/Tags.h"
+#include "host/flow/Parameter.h"
+
+namespace Orvane {
+
+Application::Application() {
+    // Both fast row paths are on by default; tests switch them to compare.
+    SetAttrsTagList({{AppFastPower, 1}, {AppVectorRows, 1}});
+}
+
+Application *GetApp() {
+    static Application *app = new Application; // lives for the process, like the registry it feeds
+    return app;
+}
+
+bool Application::LoadModule(const std::string &path, std::string &error) {
+    for (const std::string &m : modules_)
+        if (m == path) return true;
+    void *handle = dlopen(path.c_str(), RTLD_NOW | RTLD_LOCAL);
+    if (!handle) {
+        const char *why = dlerror();
+        error = why ? why : ("cannot load " + path);
+        return false;
+    }
+    handles_.push_back(handle);
+    modules_.push_back(path);
+    if (ClassRegistry) ClassRegistry->InitAll();
+    return true;
+}
+
+bool Application::LoadOperators(std::string &error) {
+    if (operatorsLoaded_) return true;
+    std::string path;
+    if (const char *env = std::getenv("ORVANE_OPERATORS"); env && *env) {
+        path = env;
+    } else {
+        Dl_info info{};
+        if (dladdr(reinterpret_cast<void *>(&GetApp), &info) && info.dli_fname)
+            path = (std::filesystem::path(info.dli_fname).parent_path() / "liborvaneoperators.so").string();
+        else
+            path = "liborvaneoperators.so";
+    }
+    operatorsLoaded_ = LoadModule(path, error);
+    return operatorsLoaded_;
+}
+
+uint64_t Application::AttrHash() const {
+    uint64_t h = 0x0a99;
+    for (const TagItem &item : Attrs().Items()) h = HashMix(HashMix(h, item.tag), item.value);
+    return h;
+}
+
+} // namespace Orvane

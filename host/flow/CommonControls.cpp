@@ -1,0 +1,215 @@
+// The common controls the host adds to every tool and applies after its
+// Process: Blend, the per-channel process switches, and the effect mask.
+//
+//   w    = Blend x m, where m is the effect mask's chosen channel at the pixel
+//          (clamped to 0..1, inverted when asked; 1 without a mask)
+//   out  = in + (result - in) x w            per channel that is switched on
+//   out  = in + (result x m - in) x Blend    with "Multiply By Mask"
+//   out  = in                                per channel that is switched off
+//
+// `in` is the tool's main image input (transparent black for tools without
+// one). Outside every data window the same rule runs on the canvas colours,
+// so the output's canvas stays exact.
+#include <algorithm>
+#include <vector>
+
+#include "host/core/Parallel.h"
+#include "host/core/Tags.h"
+#include "host/flow/DataTypes.h"
+#include "host/flow/Operator.h"
+#include "host/flow/Request.h"
+#include "host/image/NewImage.h"
+#include "host/image/PixelConvert.h"
+
+namespace Orvane {
+namespace {
+
+constexpr const char *CommonPageName = "Common Controls";
+
+enum MaskChannel { MaskAlpha, MaskRed, MaskGreen, MaskBlue, MaskLuminance };
+
+double NumberOf(const Request *req, const Input *in, double def) {
+    if (!in) return def;
+    auto *n = dynamic_cast<const Number *>(req->GetInputData(in));
+    return n ? n->value : def;
+}
+
+float MaskValue(const FltPixel &p, int channel, bool invert) {
+    float m;
+    switch (channel) {
+    case MaskRed: m = p.R; break;
+    case MaskGreen: m = p.G; break;
+    case MaskBlue: m = p.B; break;
+    case MaskLuminance: m = 0.2126f * p.R + 0.7152f * p.G + 0.0722f * p.B; break;
+    default: m = p.A; break;
+    }
+    m = std::clamp(m, 0.f, 1.f);
+    return invert ? 1.f - m : m;
+}
+
+struct Mix {
+    float blend;
+    bool process[4];
+    bool multiply;
+    int channel;
+    bool invert;
+
+    FltPixel operator()(const FltPixel &in, const FltPixel &res, const FltPixel *maskPx) const {
+        const float m = maskPx ? MaskValue(*maskPx, channel, invert) : 1.f;
+        const float w = multiply ? blend : blend * m;
+        const float k = multiply ? m : 1.f;
+        const float i[4] = {in.R, in.G, in.B, in.A}, r[4] = {res.R, res.G, res.B, res.A};
+        float o[4];
+        for (int c = 0; c < 4; ++c) o[c] = process[c] ? i[c] + (r[c] * k - i[c]) * w : i[c];
+        return {o[0], o[1], o[2], o[3]};
+    }
+};
+
+} // namespace
+
+void Operator::FinishConstruction() {
+    const bool blend = !RegAttrB(RegNoBlendControls);
+    const bool mask = !RegAttrB(RegNoEffectMask);
+    const Input *mainIn = FindMainInput(1);
+    const bool clipping = mainIn && mainIn->DataType() == CLSID_DataType_Image && RegAttrB(RegSupportsDoD) &&
+                          !FindInput("ClippingMode");
+    if (!blend && !mask && !clipping) return;
+    const int page = AddControlPageTagList(CommonPageName, {});
+    if (clipping)
+        common_.clippingMode = AddInputTagList("Clipping Mode", "ClippingMode",
+                                               {{LinkDataType, CLSID_DataType_OvID},
+                                                {InputControl, CLSID_InputControl_MultiButtonID},
+                                                {ControlPage, page},
+                                                {ButtonsFillRow, 1},
+                                                {InputDefaultId, ClippingMode_None},
+                                                {ListAddItem, "None"},
+                                                {ListItemId, ClippingMode_None},
+                                                {ListAddItem, "Domain"},
+                                                {ListItemId, ClippingMode_Domain},
+                                                {ListAddItem, "Frame"},
+                                                {ListItemId, ClippingMode_Frame}});
+    if (blend) {
+        common_.blend = AddInputTagList("Blend", "Blend",
+                                        {{LinkDataType, CLSID_DataType_Number},
+                                         {InputControl, CLSID_InputControl_Slider},
+                                         {ControlPage, page},
+                                         {InputDefault, 1.0},
+                                         {InputMinAllowed, 0.0},
+                                         {InputMaxAllowed, 1.0},
+                                         {SliderSteps, 101}});
+        static const char *const ids[4] = {"ProcessRed", "ProcessGreen", "ProcessBlue", "ProcessAlpha"};
+        static const char *const labels[4] = {"Process Red", "Process Green", "Process Blue", "Process Alpha"};
+        for (int c = 0; c < 4; ++c)
+            common_.process[c] = AddInputTagList(labels[c], ids[c],
+                                                 {{LinkDataType, CLSID_DataType_Number},
+                                                  {InputControl, CLSID_InputControl_Checkbox},
+                                                  {ControlPage, page},
+                                                  {ControlGroup, 20},
+                                                  {ControlMember, c},
+                                                  {InputDefault, 1.0},
+                                                  {ControlWidth, 0.25}});
+    }
+    if (mask) {
+        common_.effectMask = AddInputTagList("Effect Mask", "EffectMask",
+                                             {{LinkDataType, CLSID_DataType_Mask},
+                                              {InputPriority, PriorityMask},
+                                              {InputRequired, 0},
+                                              {ControlPage, page},
+                                              {LinkMain, 100}});
+        common_.maskChannel = AddInputTagList("Mask Channel", "EffectMaskChannel",
+                                              {{LinkDataType, CLSID_DataType_Number},
+                                               {InputControl, CLSID_InputControl_Combo},
+                                               {ControlPage, page},
+                                               {InputInteger, 1},
+                                               {InputMinAllowed, 0.0},
+                                               {InputMaxAllowed, 4.0},
+                                               {ListAddItem, "Alpha"},
+                                               {ListAddItem, "Red"},
+                                               {ListAddItem, "Green"},
+                                               {ListAddItem, "Blue"},
+                                               {ListAddItem, "Luminance"}});
+        common_.maskInvert = AddInputTagList("Invert Mask", "EffectMaskInvert",
+                                             {{LinkDataType, CLSID_DataType_Number},
+                                              {InputControl, CLSID_InputControl_Checkbox},
+                                              {ControlPage, page}});
+        common_.multiplyByMask = AddInputTagList("Multiply By Mask", "MultiplyByMask",
+                                                 {{LinkDataType, CLSID_DataType_Number},
+                                                  {InputControl, CLSID_InputControl_Checkbox},
+                                                  {ControlPage, page}});
+    }
+}
+
+OvID Operator::GetClippingMode(const Request *req) const {
+    const Input *in = common_.clippingMode ? common_.clippingMode : FindInput("ClippingMode");
+    const auto *id = in ? dynamic_cast<const IDValue *>(req->GetInputData(in)) : nullptr;
+    return id && !id->value.IsNull() ? id->value : ClippingMode_None;
+}
+
+void Operator::PostProcess(Request *req) {
+    Output *out = FindMainOutput();
+    if (!out) return;
+    auto *result = dynamic_cast<Image *>(req->GetOutputData(out));
+    if (!result) return;
+
+    Mix mix;
+    mix.blend = static_cast<float>(NumberOf(req, common_.blend, 1.0));
+    bool allChannels = true;
+    for (int c = 0; c < 4; ++c) {
+        mix.process[c] = NumberOf(req, common_.process[c], 1.0) >= 0.5;
+        allChannels = allChannels && mix.process[c];
+    }
+    mix.multiply = NumberOf(req, common_.multiplyByMask, 0.0) >= 0.5;
+    mix.channel = static_cast<int>(NumberOf(req, common_.maskChannel, 0.0) + 0.5);
+    mix.invert = NumberOf(req, common_.maskInvert, 0.0) >= 0.5;
+    const Image *mask = common_.effectMask ? dynamic_cast<const Image *>(req->GetInputData(common_.effectMask)) : nullptr;
+    if (mix.blend == 1.f && allChannels && !mask) return;
+
+    const Input *mainIn = FindMainInput(1);
+    const Image *src = mainIn ? dynamic_cast<const Image *>(req->GetInputData(mainIn)) : nullptr;
+    if (src == result) return; // passed through: nothing to mix
+
+    const FltPixel clear{};
+    const FltPixel srcCanvas = src ? src->GetCanvasColor() : clear;
+    const FltPixel maskCanvas = mask ? mask->GetCanvasColor() : FltPixel{1, 1, 1, 1};
+    const FltPixel canvas = mix(srcCanvas, result->GetCanvasColor(), mask ? &maskCanvas : nullptr);
+
+    ImgRectI dw = result->DataWindow();
+    if (src) dw |= src->DataWindow();
+    if (mask && !(srcCanvas == result->GetCanvasColor())) dw |= mask->DataWindow();
+    if (const AutoImageRoI roi(req); roi) dw &= roi->rect;
+
+    Ref<Image> mixed = NewImageTagList({{ImgLikeImage, result},
+                                        {ImgDataWindow, &dw},
+                                        {ImgValidWindow, &dw},
+                                        {ImgNoData, req->IsPreCalc() || result->IsNoData()},
+                                        {ImgCanvasColor, &canvas}});
+    if (!mixed) return;
+    mixed->SetScale(result->XScale(), result->YScale());
+    if (!mixed->IsNoData()) {
+        if (!mixed->AllocScanLineData()) {
+            Fail(req, "%s: out of memory (time = %f)\n", Name().c_str(), req->Time());
+            req->SetOutputData(out, nullptr);
+            return;
+        }
+        const Image emptySource(1, 1, DepthRGBAFlt32); // stands for "no input": canvas everywhere
+        const Image &in = src ? *src : emptySource;
+        ParallelRange(
+            dw.y0, dw.y1,
+            [&](int y0, int y1) {
+                const int w = dw.Width();
+                std::vector<FltPixel> a(w), r(w), m(mask ? w : 0);
+                for (int y = y0; y < y1; ++y) {
+                    if (result->CheckAbort()) return;
+                    ReadSpanFlt(in, y, dw.x0, dw.x1, a.data());
+                    ReadSpanFlt(*result, y, dw.x0, dw.x1, r.data());
+                    if (mask) ReadSpanFlt(*mask, y, dw.x0, dw.x1, m.data());
+                    for (int x = 0; x < w; ++x) a[x] = mix(a[x], r[x], mask ? &m[x] : nullptr);
+                    StoreFlt(mixed->Depth(), a.data(), w, mixed->ScanLine(y));
+                }
+            },
+            4);
+    }
+    req->SetOutputData(out, mixed.Get());
+}
+
+} // namespace Orvane

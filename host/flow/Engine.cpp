@@ -1,0 +1,198 @@
+#include "host/flow/Engine.h"
+
+#include <algorithm>
+#include <cstring>
+#include <new>
+#include <vector>
+
+#include "host/app/Application.h"
+#include "host/core/Tags.h"
+#include "host/flow/DataTypes.h"
+#include "host/flow/Operator.h"
+#include "host/flow/OrvaneDoc.h"
+#include "host/flow/RenderTask.h"
+#include "host/flow/Request.h"
+#include "host/flow/ResultCache.h"
+#include "host/image/NewImage.h"
+
+namespace Orvane {
+namespace {
+
+bool IsImageType(OvID type) { return type == CLSID_DataType_Image || type == CLSID_DataType_Mask; }
+
+bool Volatile(const Operator *op) { return op->RegAttrB(RegNoCache) || op->RegAttrB(RegUnpredictable); }
+
+/// The request flags that change a result, with the proxy scale.
+uint32_t Traits(uint32_t flags, const RenderTask *task) {
+    uint32_t t = flags & (ReqFlagPreCalc | ReqFlagProxy | ReqFlagQuick | ReqFlagNoGPU);
+    if ((flags & ReqFlagProxy) && task) t |= static_cast<uint32_t>(std::min(task->proxyScale, 255)) << 16;
+    return t;
+}
+
+std::optional<uint64_t> StateHashOf(const Output *out, double time, int depth) {
+    const Operator *op = out->Owner();
+    if (!op || Volatile(op) || depth > 10000) return std::nullopt;
+    const char *cls = op->ClassID().Text();
+    uint64_t h = HashMix(HashBytes(cls, std::strlen(cls)), static_cast<uint64_t>(out->Index()));
+    for (const auto &in : op->Inputs()) {
+        if (in->IsPassive()) continue;
+        if (in->Link()) {
+            std::optional<uint64_t> up = StateHashOf(in->Link(), time, depth + 1);
+            if (!up) return std::nullopt;
+            h = HashMix(h, *up);
+        } else {
+            h = HashMix(h, in->ValueHash(time));
+        }
+    }
+    return h;
+}
+
+/// An image input of a tool that needs whole frames: the canvas made real
+/// over the frame, or the image itself when it already covers it.
+Ref<Parameter> CoverFrame(const Ref<Parameter> &value, bool precalc) {
+    auto *img = dynamic_cast<Image *>(value.Get());
+    if (!img || img->DataWindow().Contains(img->Frame())) return value;
+    const ImgRectI frame = img->Frame();
+    const ImgRectI dw = img->DataWindow() | frame;
+    const FltPixel canvas = img->GetCanvasColor();
+    Ref<Image> full = NewImageTagList(
+        {{ImgLikeImage, img}, {ImgDataWindow, &dw}, {ImgNoData, precalc}, {ImgCanvasColor, &canvas}});
+    if (!full) return nullptr;
+    if (!precalc) full->ImageCopy(img);
+    return full;
+}
+
+} // namespace
+
+std::optional<uint64_t> StateHash(const Output *out, double time) {
+    if (!out) return std::nullopt;
+    std::optional<uint64_t> h = StateHashOf(out, time, 0);
+    if (h) h = HashMix(*h, GetApp()->AttrHash());
+    return h;
+}
+
+Ref<Parameter> Evaluate(Output *out, double time, const EvalOptions &options) {
+    if (!out || !out->Owner()) return nullptr;
+    Operator *op = out->Owner();
+    RenderTask *task = options.task;
+    auto aborted = [task] { return task && task->IsAborted(); };
+    if (aborted()) return nullptr;
+
+    EvalOptions opt = options;
+    const bool precalc = (opt.flags & ReqFlagPreCalc) != 0;
+    if (precalc || !op->RegAttrB(RegSupportsRoI)) opt.roi.reset();
+
+    ResultCache *cache = op->GetDoc() && opt.useCache ? &op->GetDoc()->Cache() : nullptr;
+    std::optional<uint64_t> state = cache ? StateHash(out, time) : std::nullopt;
+    const CacheKey key{out, time, Traits(opt.flags, task), state.value_or(0)};
+    if (state)
+        if (Ref<Parameter> hit = cache->Find(key, opt.roi)) return hit;
+
+    // The output's domain of definition comes from the pre-calculation pass.
+    std::optional<ImageDomain> ownDoD;
+    if (!precalc && IsImageType(out->DataType())) {
+        EvalOptions pre = opt;
+        pre.flags |= ReqFlagPreCalc;
+        pre.roi.reset();
+        Ref<Parameter> shape = Evaluate(out, time, pre);
+        if (!shape) return nullptr;
+        if (auto *img = dynamic_cast<Image *>(shape.Get())) ownDoD = ImageDomain(img->DataWindow());
+    }
+
+    std::lock_guard<std::recursive_mutex> lock(op->RequestLock());
+    Request req(op, out, time, opt.flags, task);
+    req.SetRoI(opt.roi);
+    req.SetOutputDoD(ownDoD);
+
+    std::vector<int> levels;
+    for (const auto &in : op->Inputs()) levels.push_back(in->Priority());
+    std::sort(levels.begin(), levels.end());
+    levels.erase(std::unique(levels.begin(), levels.end()), levels.end());
+
+    const bool wholeFrames = !op->RegAttrB(RegSupportsDoD);
+    bool timeShifted = false;
+    // Pre-calculated shapes of linked image inputs, reused when the fetch
+    // itself is a pre-calculation at the same time.
+    std::vector<Ref<Parameter>> shapes(op->Inputs().size());
+    std::vector<double> shapeTimes(op->Inputs().size(), TimeUndefined);
+    for (int level : levels) {
+        // Domains and default regions of this level's image inputs.
+        for (const auto &inPtr : op->Inputs()) {
+            Input *in = inPtr.get();
+            if (in->Priority() != level) continue;
+            Request::Slot &slot = req.SlotOf(in);
+            if (slot.given || !in->Link() || !IsImageType(in->DataType())) continue;
+            slot.roi = opt.roi;
+            EvalOptions pre = opt;
+            pre.flags |= ReqFlagPreCalc;
+            pre.roi.reset();
+            Ref<Parameter> shape = Evaluate(in->Link(), slot.time, pre);
+            if (auto *img = dynamic_cast<Image *>(shape.Get()))
+                slot.dod = ImageDomain(wholeFrames ? img->DataWindow() | img->Frame() : img->DataWindow());
+            shapes[in->Index()] = std::move(shape);
+            shapeTimes[in->Index()] = slot.time;
+        }
+        req.SetPri(level);
+        op->CheckRequest(&req);
+        if (aborted()) return nullptr;
+
+        for (const auto &inPtr : op->Inputs()) {
+            Input *in = inPtr.get();
+            if (in->Priority() != level) continue;
+            Request::Slot &slot = req.SlotOf(in);
+            if (slot.given || slot.skip || !in->SendsRequest()) continue;
+            if (slot.time != time) timeShifted = true;
+            if (in->Link()) {
+                EvalOptions up = opt;
+                up.roi = slot.roi;
+                if (slot.flags & InputFlagPreCalc) up.flags |= ReqFlagPreCalc;
+                const bool reuse = (up.flags & ReqFlagPreCalc) && shapes[in->Index()] &&
+                                   shapeTimes[in->Index()] == slot.time;
+                slot.data = reuse ? shapes[in->Index()] : Evaluate(in->Link(), slot.time, up);
+                if (!slot.data) {
+                    if (aborted() || in->IsRequired()) return nullptr;
+                } else if (wholeFrames && IsImageType(in->DataType())) {
+                    slot.data = CoverFrame(slot.data, req.IsPreCalc() || (up.flags & ReqFlagPreCalc));
+                }
+            } else {
+                slot.data = in->ValueAt(slot.time);
+                if (!slot.data && in->IsRequired()) {
+                    if (OrvaneDoc *doc = op->GetDoc())
+                        doc->PrintF(ConsoleError, "%s: input \"%s\" is not connected\n", op->Name().c_str(),
+                                    in->ID().Text());
+                    return nullptr;
+                }
+            }
+            slot.fetched = true;
+        }
+    }
+
+    try {
+        if (precalc) {
+            op->PreCalcPreProcess(&req);
+            op->PreCalcProcess(&req);
+            if (req.GetOutputData(out)) op->PreCalcPostProcess(&req);
+        } else {
+            op->PreProcess(&req);
+            op->Process(&req);
+            if (req.GetOutputData(out)) op->PostProcess(&req);
+        }
+    } catch (const std::bad_alloc &) {
+        if (OrvaneDoc *doc = op->GetDoc())
+            doc->PrintF(ConsoleError, "%s: out of memory (time = %f)\n", op->Name().c_str(), time);
+        return nullptr;
+    }
+    if (aborted()) return nullptr;
+
+    Ref<Parameter> result(req.GetOutputData(out));
+    if (!result) {
+        if (!req.HasOutputData(out))
+            if (OrvaneDoc *doc = op->GetDoc())
+                doc->PrintF(ConsoleError, "%s: produced no result at time %g\n", op->Name().c_str(), time);
+        return nullptr;
+    }
+    if (state && !timeShifted) cache->Store(key, opt.roi, result);
+    return result;
+}
+
+} // namespace Orvane

@@ -1,0 +1,125 @@
+#include "host/flow/Operator.h"
+
+#include <cstdio>
+
+#include "host/core/Parallel.h"
+#include "host/core/Tags.h"
+#include "host/flow/DataTypes.h"
+#include "host/flow/OrvaneDoc.h"
+#include "host/flow/Request.h"
+
+namespace Orvane {
+
+Operator::Operator(const Registry *reg, const ScriptVal &, const TagList &tags) {
+    SetRegistry(reg);
+    doc_ = static_cast<OrvaneDoc *>(tags.GetPtr(ImgDocument));
+}
+
+Operator::~Operator() = default;
+
+OvID Operator::ClassID() const { return GetRegistry() ? GetRegistry()->ID() : OvID(); }
+
+bool Operator::RegAttrB(Tag tag, bool def) const {
+    return GetRegistry() ? GetRegistry()->Tags().GetBool(tag, def) : def;
+}
+
+int Operator::AddControlPageTagList(const char *name, const TagList &tags) {
+    pages_.push_back(PanelPage{name ? name : "", tags});
+    pages_.back().tags.Persist();
+    return static_cast<int>(pages_.size()) - 1;
+}
+
+Input *Operator::AddInputTagList(const char *name, const char *id, const TagList &tags) {
+    if (FindInput(OvID(id))) return nullptr;
+    const int page = static_cast<int>(tags.GetLong(ControlPage, pages_.empty() ? 0 : static_cast<long long>(pages_.size()) - 1));
+    inputs_.push_back(std::make_unique<Input>(this, name ? name : id, OvID(id), tags, static_cast<int>(inputs_.size()), page));
+    return inputs_.back().get();
+}
+
+Output *Operator::AddOutputTagList(const char *name, const char *id, const TagList &tags) {
+    if (FindOutput(OvID(id))) return nullptr;
+    outputs_.push_back(std::make_unique<Output>(this, name ? name : id, OvID(id), tags, static_cast<int>(outputs_.size())));
+    return outputs_.back().get();
+}
+
+void Operator::BeginControlNestTagList(const char *name, const char *id, bool open, const TagList &tags) {
+    const int at = static_cast<int>(inputs_.size());
+    nests_.push_back(ControlNest{name ? name : "", OvID(id), open, at, at, tags});
+    nests_.back().tags.Persist();
+    openNests_.push_back(static_cast<int>(nests_.size()) - 1);
+}
+
+void Operator::EndControlNest() {
+    if (openNests_.empty()) return;
+    nests_[openNests_.back()].endInput = static_cast<int>(inputs_.size());
+    openNests_.pop_back();
+}
+
+Input *Operator::FindInput(OvID id) const {
+    for (const auto &in : inputs_)
+        if (in->ID() == id) return in.get();
+    return nullptr;
+}
+
+Output *Operator::FindOutput(OvID id) const {
+    for (const auto &out : outputs_)
+        if (out->ID() == id) return out.get();
+    return nullptr;
+}
+
+Input *Operator::FindMainInput(int n) const {
+    for (const auto &in : inputs_)
+        if (in->MainIndex() == n) return in.get();
+    return nullptr;
+}
+
+Output *Operator::FindMainOutput(int n) const {
+    for (const auto &out : outputs_)
+        if (out->MainIndex() == n) return out.get();
+    return n == 1 && !outputs_.empty() ? outputs_.front().get() : nullptr;
+}
+
+void Operator::NotifyChanged(Input *, Parameter *, double, TagList *) {}
+void Operator::CheckRequest(Request *) {}
+void Operator::PreProcess(Request *) {}
+
+void Operator::Process(Request *req) {
+    Fail(req, "%s: this tool has no processing of its own\n", Name().c_str());
+    if (Output *out = FindMainOutput()) req->SetOutputData(out, nullptr);
+}
+
+bool Operator::IsGPUEnabled(Request *, bool) { return false; }
+
+bool Operator::RegInit(Registry *) { return true; }
+void Operator::RegCleanup(Registry *) {}
+
+void Operator::Fail(Request *req, const char *fmt, ...) {
+    va_list args;
+    va_start(args, fmt);
+    if (doc_) {
+        doc_->VPrintF(ConsoleError, fmt, args);
+    } else {
+        std::vfprintf(stderr, fmt, args);
+    }
+    va_end(args);
+    (void)req;
+}
+
+void ThreadedOperator::ProcessChunk(Request *, int) {}
+
+void ThreadedOperator::DoMultiProcess(Request *req, int count) {
+    RunChunks(count, [this, req](int i) { ProcessChunk(req, i); });
+}
+
+void ThreadedOperator::RunChunks(int count, const std::function<void(int)> &fn) {
+    if (count <= 0) return;
+    // Chunks of a few rows amortise scheduling; each chunk still runs whole.
+    const int grain = count >= 256 ? 4 : 1;
+    ParallelFor(count, fn, grain);
+}
+
+void ThreadedOperator::DoMultiProcessRange(const std::function<void(int, int)> &fn, int first, int last) {
+    ParallelRange(first, last, fn, 1);
+}
+
+} // namespace Orvane

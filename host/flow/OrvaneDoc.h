@@ -1,0 +1,130 @@
+#pragma once
+// OrvaneDoc: a flow document. It owns the tools (by unique name) and their
+// links, the document preferences (frame format, cache budget, ...), the
+// global time range, and the console where tools report.
+//
+// Console lines are kept in order and passed to an optional listener as they
+// come; tools write failures under ConsoleError (code 60).
+//
+// Thread safety: tools, links and preferences change on the main thread
+// between renders. PrintF may be called from any thread.
+#include <cstdarg>
+#include <functional>
+#include <map>
+#include <mutex>
+#include <string>
+#include <vector>
+
+#include "host/core/Object.h"
+#include "host/core/ScriptVal.h"
+
+namespace Orvane {
+
+class Operator;
+class Request;
+class ResultCache;
+
+/// Console codes.
+constexpr int ConsoleLog = 0;
+constexpr int ConsoleWarning = 50;
+constexpr int ConsoleError = 60;
+
+/// Preferences that tools read with GetPrefLong / GetPrefDouble.
+enum PrefID : int {
+    PREF_FFWidth,
+    PREF_FFHeight,
+    PREF_FFAspectX,
+    PREF_FFAspectY,
+    PREF_FFDepth,
+    PREF_FFFrameRate,
+    PREF_FFFields,
+    PREF_CacheMemoryMB,
+    PREF_UseGPU,
+    PREF_ImageOverlay,
+    PREF_Count
+};
+/// The name of a preference in documents.
+ORVANE_API const char *PrefName(PrefID id);
+
+struct FrameFormat {
+    int width = 1920, height = 1080, depth = 8;
+    double aspectX = 1.0, aspectY = 1.0, frameRate = 24.0;
+    bool fields = false;
+};
+
+struct ConsoleLine {
+    int code;
+    std::string text;
+};
+
+class ORVANE_API OrvaneDoc : public RefObject {
+public:
+    OrvaneDoc();
+    ~OrvaneDoc() override;
+
+    // ---- preferences ----
+    long GetPrefLong(PrefID id) const;
+    double GetPrefDouble(PrefID id) const;
+    void SetPref(PrefID id, double value);
+    /// True when the preference differs from its default.
+    bool PrefIsSet(PrefID id) const;
+    FrameFormat GetFrameFormat() const;
+
+    // ---- console ----
+    void PrintF(int code, const char *fmt, ...) __attribute__((format(printf, 3, 4)));
+    void PrintF(Request *req, int code, const char *fmt, ...) __attribute__((format(printf, 4, 5)));
+    void VPrintF(int code, const char *fmt, va_list args);
+    std::vector<ConsoleLine> ConsoleLines() const;
+    void ClearConsole();
+    void SetConsoleListener(std::function<void(const ConsoleLine &)> listener);
+
+    // ---- time ----
+    double GlobalStart() const { return globalStart_; }
+    double GlobalEnd() const { return globalEnd_; }
+    void SetGlobalRange(double start, double end) {
+        globalStart_ = start;
+        globalEnd_ = end;
+    }
+    double RenderStart() const { return renderStart_; }
+    double RenderEnd() const { return renderEnd_; }
+    void SetRenderRange(double start, double end) {
+        renderStart_ = start;
+        renderEnd_ = end;
+    }
+
+    // ---- tools ----
+    /// Makes a tool of the class (or of the class an old ID names) and adds
+    /// it under `name` (a fresh name from its abbreviation when empty). Null
+    /// for an unknown or abstract class or a name in use.
+    Operator *AddTool(OvID classId, const std::string &name = {});
+    /// Adds a tool made elsewhere; the document takes a reference.
+    bool AddTool(Operator *op, const std::string &name);
+    bool RemoveTool(const std::string &name);
+    Operator *FindTool(const std::string &name) const;
+    /// Tools sorted by name.
+    std::vector<Operator *> Tools() const;
+    /// A name not in use, from `base` and a number ("Blur1").
+    std::string UniqueName(const std::string &base) const;
+
+    /// Tools of classes this program does not know, and top-level entries it
+    /// does not understand, kept as read to be written back unchanged.
+    ScriptVal &KeptTools() { return keptTools_; }
+    ScriptVal &KeptFields() { return keptFields_; }
+    const ScriptVal &KeptTools() const { return keptTools_; }
+    const ScriptVal &KeptFields() const { return keptFields_; }
+
+    /// The result cache shared by this document's renders.
+    ResultCache &Cache() { return *cache_; }
+
+private:
+    double prefs_[PREF_Count];
+    mutable std::mutex consoleLock_;
+    std::vector<ConsoleLine> console_;
+    std::function<void(const ConsoleLine &)> listener_;
+    double globalStart_ = 0, globalEnd_ = 100, renderStart_ = 0, renderEnd_ = 100;
+    std::map<std::string, Ref<Operator>> tools_;
+    std::unique_ptr<ResultCache> cache_;
+    ScriptVal keptTools_ = ScriptVal::Table(), keptFields_ = ScriptVal::Table();
+};
+
+} // namespace Orvane

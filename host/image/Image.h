@@ -1,0 +1,188 @@
+#pragma once
+// Image: the host's picture.
+//
+// Geometry. The image rectangle runs from (0, 0) to (width, height); rows are
+// counted from the bottom. The data window is where pixels exist; it may lie
+// partly or wholly outside the image rectangle. The valid window is the part
+// of the data window a request needed filled. Everything outside the data
+// window has the canvas colour.
+//
+// Storage. Rows are allocated late, by AllocScanLineData, just before the
+// first write; an image made for pre-calculation never gets rows (IsNoData).
+// Row y (data-window coordinates y0..y1-1) starts at the pixel x = x0 of the
+// data window; PixelAddress(x, y) finds any pixel of the window.
+//
+// Auxiliary channels (Z, coverage, IDs, UV, normals, vectors, positions,
+// disparity) live in planes of their own beside the colour rows, sharing the
+// data window, so adding one never changes the colour layout.
+//
+// Ownership: reference counted (Use/Recycle, Ref<Image>). An image handed on
+// unchanged is shared, never copied; a shared image is read only.
+//
+// Thread safety: the rows may be written by several workers at once as long as
+// each writes rows of its own; metadata changes belong to the image's maker
+// before it is handed over.
+#include <atomic>
+#include <memory>
+#include <vector>
+
+#include "host/flow/Parameter.h"
+#include "host/image/Pixel.h"
+#include "host/image/Rect.h"
+
+namespace Orvane {
+
+class OrvaneDoc;
+
+enum class AuxChannelKind : uint8_t {
+    Z,
+    Coverage,
+    ObjectID,
+    MaterialID,
+    U,
+    V,
+    NormalX,
+    NormalY,
+    NormalZ,
+    VectorX,
+    VectorY,
+    BackVectorX,
+    BackVectorY,
+    PositionX,
+    PositionY,
+    PositionZ,
+    DisparityX,
+    DisparityY,
+    Count
+};
+
+class ORVANE_API Image : public Parameter {
+public:
+    /// Use NewImageTagList to make images for requests.
+    Image(int width, int height, int depth);
+    ~Image() override;
+
+    // ---- format ----
+    int Width() const { return width_; }
+    int Height() const { return height_; }
+    int Depth() const { return depth_; }
+    const PixelFormat &Format() const { return format_; }
+    int BytesPerPixel() const { return format_.BytesPerPixel(); }
+    bool IsMask() const { return depth_ <= DepthAFlt32; }
+    bool IsFloat() const { return format_.isFloat; }
+    bool IsAInt8() const { return depth_ == DepthAInt8; }
+    bool IsAInt16() const { return depth_ == DepthAInt16; }
+    bool IsAFlt16() const { return depth_ == DepthAFlt16; }
+    bool IsAFlt32() const { return depth_ == DepthAFlt32; }
+    bool IsRGBAInt32() const { return depth_ == DepthRGBAInt8; }
+    bool IsRGBAInt64() const { return depth_ == DepthRGBAInt16; }
+    bool IsRGBAFlt64() const { return depth_ == DepthRGBAFlt16; }
+    bool IsRGBAFlt128() const { return depth_ == DepthRGBAFlt32; }
+    double XScale() const { return xScale_; }
+    double YScale() const { return yScale_; }
+    void SetScale(double x, double y) {
+        xScale_ = x;
+        yScale_ = y;
+    }
+    ImgRectI Frame() const { return ImgRectI(0, 0, width_, height_); }
+
+    // ---- windows ----
+    const ImgRectI &DataWindow() const { return dataWindow_; }
+    const ImgRectI &ValidWindow() const { return validWindow_; }
+    /// Sets the data window; only before rows exist.
+    void SetDataWindow(const ImgRectI &r);
+    void SetValidWindow(const ImgRectI &r) { validWindow_ = r & dataWindow_; }
+
+    // ---- canvas ----
+    FltPixel GetCanvasColor() const { return canvas_; }
+    void GetCanvasColor(Pixel &p) const;
+    void SetCanvasColor(const FltPixel &c) { canvas_ = c; }
+    void SetCanvasColor(const Pixel &p);
+    void CopyCanvasColor(const Image *from) { canvas_ = from->canvas_; }
+    bool IsCanvasColorClear() const { return canvas_ == FltPixel{}; }
+
+    // ---- rows ----
+    /// Makes the rows exist (zeroed). False when memory ran out.
+    bool AllocScanLineData();
+    bool HasScanLineData() const { return !rows_.empty(); }
+    bool IsNoData() const { return noData_; }
+    void SetNoData(bool v) { noData_ = v; }
+    /// Start of row y (x = data window x0), or null outside the window / without rows.
+    uint8_t *ScanLine(int y) const {
+        const int i = y - dataWindow_.y0;
+        return (i < 0 || i >= static_cast<int>(rows_.size())) ? nullptr : rows_[i];
+    }
+    template <class T> T *Row(int y) const { return reinterpret_cast<T *>(ScanLine(y)); }
+    /// Address of pixel (x, y) inside the data window, null elsewhere.
+    uint8_t *PixelAddress(int x, int y) const;
+    size_t RowBytes() const { return static_cast<size_t>(dataWindow_.Width()) * BytesPerPixel(); }
+    /// Bytes of pixel memory held.
+    size_t DataBytes() const;
+
+    // ---- attributes and state ----
+    void SetReadOnly(bool v = true) { readOnly_ = v; }
+    bool IsReadOnly() const { return readOnly_; }
+    void SetIsOpaque(bool v) { opaque_ = v; }
+    bool IsOpaque() const { return opaque_; }
+    /// True when the image may be stored as one constant colour.
+    bool IsSimple() const { return simple_; }
+    void SetSimple(bool v) { simple_ = v; }
+    /// The render this image belongs to was abandoned.
+    bool CheckAbort() const { return abort_ && abort_->load(std::memory_order_relaxed); }
+    void SetAbortFlag(const std::atomic<bool> *flag) { abort_ = flag; }
+    const std::atomic<bool> *AbortFlag() const { return abort_; }
+
+    // ---- auxiliary channels ----
+    /// Adds a float plane for `kind` over the data window (zeroed).
+    bool AddAuxChannel(AuxChannelKind kind);
+    bool HasAuxChannel(AuxChannelKind kind) const;
+    float *AuxRow(AuxChannelKind kind, int y) const;
+
+    // ---- pixel access (slow path: per call dispatch on depth) ----
+    /// Pixel (x, y), or the canvas colour outside the data window.
+    FltPixel GetFlt(int x, int y) const;
+    void PutFlt(int x, int y, const FltPixel &p);
+
+    // ---- whole-image services ----
+    /// Fills the data window (or `within` clipped to it) with one colour.
+    void Fill(const FltPixel &color);
+    void FillWithin(const FltPixel &color, const ImgRectI &within);
+    /// Sets every pixel and the canvas to zero.
+    void Clear();
+    /// Copies `src` into this image over this image's data window: pixels of
+    /// src where it has them, its canvas colour elsewhere; converts depth.
+    void ImageCopy(const Image *src);
+
+    // Parameter
+    OvID DataType() const override;
+    ScriptVal ToScript() const override { return ScriptVal(); }
+    bool Equals(const Parameter &other) const override { return &other == this; }
+    uint64_t Hash() const override;
+    Ref<Parameter> Copy() const override;
+    size_t SizeOf() const override { return sizeof(*this) + DataBytes(); }
+
+private:
+    friend ORVANE_API Ref<Image> CopyOfImage(const Image *src);
+    int width_, height_, depth_;
+    PixelFormat format_;
+    double xScale_ = 1.0, yScale_ = 1.0;
+    ImgRectI dataWindow_, validWindow_;
+    FltPixel canvas_;
+    std::vector<uint8_t *> rows_;
+    struct FreeDeleter {
+        void operator()(uint8_t *p) const;
+    };
+    std::unique_ptr<uint8_t, FreeDeleter> pixels_; // calloc'ed: large frames get lazily zeroed pages
+    struct AuxPlane {
+        AuxChannelKind kind;
+        std::unique_ptr<float[]> data;
+    };
+    std::vector<AuxPlane> aux_;
+    const std::atomic<bool> *abort_ = nullptr;
+    bool noData_ = false, readOnly_ = false, opaque_ = false, simple_ = true;
+};
+
+/// A new image with the same format, windows, canvas, attributes and pixels.
+ORVANE_API Ref<Image> CopyOfImage(const Image *src);
+
+} // namespace Orvane

@@ -1,0 +1,21 @@
+#!/usr/bin/env bash
+# Installs the Debian packages Orvane builds and tests with. Safe to run again.
+set -euo pipefail
+packages=(
+  build-essential cmake ninja-build pkg-config ccache
+  libtbb-dev libfmt-dev libgtest-dev libgmock-dev libbenchmark-dev
+  clang-format
+)
+missing=()
+for p in "${packages[@]}"; do
+  dpkg-query -W -f='${Status}' "$p" 2>/dev/null | grep -q "install ok installed" || missing+=("$p")
+done
+if [ ${#missing[@]} -eq 0 ]; then
+  echo "setup-deps: all packages present"
+  exit 0
+fi
+SUDO=""
+[ "$(id -u)" -eq 0 ] || SUDO="sudo"
+export DEBIAN_FRONTEND=noninteractive
+$SUDO apt-get update
+$SUDO apt-get install -y --no-install-recommends "${missing[@]}"

@@ -1,0 +1,520 @@
+// Checks the table of planned class identities against what the registry and
+// the tool lists need of it: a complete and consistent set of rows, kinds that
+// add up, identities on everything offered as a tool, and attribute lists that
+// agree with the rules they come from.
+#include <gtest/gtest.h>
+
+#include <algorithm>
+#include <cstring>
+#include <map>
+#include <set>
+#include <string>
+#include <vector>
+
+#include "host/core/Tags.h"
+#include "operators/frame/ClassTable.h"
+
+namespace Orvane {
+namespace {
+
+using Names = std::set<std::string>;
+
+const ClassDesc *FindRow(const std::string &id) {
+    for (const ClassDesc &row : PlannedClasses())
+        if (id == row.id) return &row;
+    return nullptr;
+}
+
+std::vector<std::string> Split(const char *list) {
+    std::vector<std::string> parts;
+    if (!list) return parts;
+    std::string current;
+    for (const char *p = list; *p; ++p) {
+        if (*p == '|') {
+            parts.push_back(current);
+            current.clear();
+        } else {
+            current += *p;
+        }
+    }
+    parts.push_back(current);
+    return parts;
+}
+
+bool Empty(const char *text) { return text == nullptr || *text == '\0'; }
+
+/// IDs of the rows that carry `tag`.
+Names RowsWith(Tag tag) {
+    Names ids;
+    for (const ClassDesc &row : PlannedClasses())
+        if (row.attrs.Has(tag)) ids.insert(row.id);
+    return ids;
+}
+
+/// IDs of the rows whose kind satisfies `pred`.
+template <class Pred> Names RowsWhere(Pred pred) {
+    Names ids;
+    for (const ClassDesc &row : PlannedClasses())
+        if (pred(row)) ids.insert(row.id);
+    return ids;
+}
+
+bool IsShapeFamily(uint32_t kind) { return (kind & 0xffff0000u) == 0x00560000u; }
+bool OffersTool(uint32_t kind) { return (kind & 2u) != 0; }
+/// Tools that make or pass images: every tool but the vector shape tools,
+/// of which only the rasteriser returns an image.
+bool IsImageTool(const ClassDesc &row) {
+    return OffersTool(row.kind) && (!IsShapeFamily(row.kind) || std::strcmp(row.id, "sRender") == 0);
+}
+
+Names Without(Names all, const Names &removed) {
+    for (const std::string &id : removed) all.erase(id);
+    return all;
+}
+
+const Names kShapeRows = {"sBoolean", "sChangeStyle", "sDuplicate", "sExpand", "sGrid",    "sJitter",
+                          "sOutline", "sRender",      "sTransform", "sMerge",  "sEllipse", "sNGon",
+                          "sBSpline", "sPolygon",     "sRectangle", "sStar"};
+const Names kMaskRows = {"BitmapMask", "EllipseMask",   "MultiPolyMask", "BSplineMask",  "PolylineMask",
+                         "RangesMask", "RectangleMask", "TeapotMask",    "TriangleMask", "WandMask"};
+
+TEST(ClassTable, RowsAreCompleteAndUnique) {
+    const auto &rows = PlannedClasses();
+    // 201 classes less the two built beside their code.
+    EXPECT_EQ(rows.size(), 199u);
+    EXPECT_EQ(FindRow("BrightnessContrast"), nullptr);
+    EXPECT_EQ(FindRow("Background"), nullptr);
+
+    Names ids;
+    for (const ClassDesc &row : rows) {
+        ASSERT_FALSE(Empty(row.id));
+        EXPECT_TRUE(ids.insert(row.id).second) << "duplicate class ID " << row.id;
+    }
+    // Old IDs must not shadow a live class or each other.
+    Names oldIds;
+    for (const ClassDesc &row : rows)
+        for (const std::string &old : Split(row.oldIds)) {
+            EXPECT_FALSE(old.empty()) << row.id;
+            EXPECT_EQ(ids.count(old), 0u) << old << " is both an old and a current ID";
+            EXPECT_TRUE(oldIds.insert(old).second) << "old ID " << old << " maps to two classes";
+        }
+    // Host constants keep their texts; saved documents hold these spellings.
+    for (const char *id : {"EllipseMask", "BSplineMask", "PolylineMask", "MultiPolyMask", "BitmapMask", "RectangleMask",
+                           "TriangleMask", "WandMask", "UltraKeyer", "CleanPLate", "Primatte4"})
+        EXPECT_NE(FindRow(id), nullptr) << id;
+}
+
+TEST(ClassTable, KindCounts) {
+    std::map<uint32_t, int> counts;
+    for (const ClassDesc &row : PlannedClasses()) ++counts[row.kind];
+    const std::map<uint32_t, int> expected = {
+        {3, 92},                                                        // tools, less BrightnessContrast
+        {131, 4},     {259, 2},    {2307, 1},    {4655363, 1}, {11, 6}, // sources, less Background
+        {19, 5},      {35, 10},    {5, 32},      {1, 2},       {0, 3},       {5636099, 9}, {5636355, 1},
+        {5636107, 6}, {983040, 8}, {1507328, 7}, {1572864, 7}, {1769472, 1}, {1024, 2},
+    };
+    EXPECT_EQ(counts, expected);
+}
+
+TEST(ClassTable, ToolsCarryAFullIdentity) {
+    // The masks the design leaves without an abbreviation.
+    const Names noAbbreviation = {"TriangleMask", "TeapotMask"};
+    for (const ClassDesc &row : PlannedClasses()) {
+        switch (row.kind) {
+        case 3:
+        case 11:
+        case 19:
+        case 35:
+        case 131:
+        case 259: break;
+        default: continue;
+        }
+        SCOPED_TRACE(row.id);
+        EXPECT_FALSE(Empty(row.path));
+        EXPECT_EQ(std::string(row.path).rfind("Tools/", 0), 0u);
+        EXPECT_FALSE(Empty(row.name));
+        EXPECT_FALSE(Empty(row.category));
+        EXPECT_FALSE(Empty(row.help));
+        EXPECT_FALSE(Empty(row.classWord));
+        if (noAbbreviation.count(row.id))
+            EXPECT_TRUE(Empty(row.abbreviation));
+        else {
+            ASSERT_FALSE(Empty(row.abbreviation));
+            EXPECT_LE(std::strlen(row.abbreviation), 4u);
+        }
+    }
+    // Shape tools: category "Shape", path under Tools/Shape.
+    for (const std::string &id : kShapeRows) {
+        const ClassDesc *row = FindRow(id);
+        ASSERT_NE(row, nullptr) << id;
+        EXPECT_STREQ(row->category, "Shape");
+        EXPECT_EQ(std::string(row->path), "Tools/Shape/" + id);
+    }
+}
+
+TEST(ClassTable, FormatsAndTransitionsAreNotOfferedAsTools) {
+    int formats = 0, transitions = 0;
+    for (const ClassDesc &row : PlannedClasses()) {
+        if (row.kind != 1572864 && row.kind != 983040) continue;
+        (row.kind == 1572864 ? formats : transitions)++;
+        EXPECT_EQ(row.path, nullptr) << row.id;
+        EXPECT_EQ(row.category, nullptr) << row.id;
+        EXPECT_TRUE(row.creatable) << row.id;
+    }
+    EXPECT_EQ(formats, 7);
+    EXPECT_EQ(transitions, 8);
+
+    const ClassDesc *wipe = FindRow("ZQTWipe");
+    ASSERT_NE(wipe, nullptr);
+    EXPECT_STREQ(wipe->name, "SMPTE Wipe");
+    EXPECT_STREQ(wipe->base, "ZQImageTransition");
+    EXPECT_STREQ(wipe->help, "Soft-edged animated wipe based on SMPTE Code");
+}
+
+TEST(ClassTable, TellingRowsAndSpellings) {
+    const ClassDesc *merge = FindRow("Merge");
+    ASSERT_NE(merge, nullptr);
+    EXPECT_EQ(merge->kind, 131u);
+    EXPECT_STREQ(merge->path, "Tools/Composite/Merge");
+    EXPECT_STREQ(merge->abbreviation, "Mrg");
+    EXPECT_EQ(Split(merge->aliases), std::vector<std::string>{"ZMerge"});
+    EXPECT_EQ(merge->attrs.GetLong(RegSortOrder), 1);
+
+    const ClassDesc *saver = FindRow("Saver");
+    ASSERT_NE(saver, nullptr);
+    const auto saverAliases = Split(saver->aliases);
+    EXPECT_EQ(Names(saverAliases.begin(), saverAliases.end()), Names({"Write", "Export", "Media"}));
+
+    const ClassDesc *ellipse = FindRow("EllipseMask");
+    ASSERT_NE(ellipse, nullptr);
+    EXPECT_STREQ(ellipse->path, "Tools/Masks/Ellipse");
+    EXPECT_STREQ(ellipse->base, "MaskOperator");
+
+    const ClassDesc *xyPath = FindRow("XYPath");
+    ASSERT_NE(xyPath, nullptr);
+    EXPECT_EQ(xyPath->kind, 5u);
+    EXPECT_STREQ(xyPath->path, "Tools/Modifiers/XYPath");
+    EXPECT_STREQ(xyPath->name, "XY Path");
+    EXPECT_EQ(xyPath->category, nullptr);
+    EXPECT_EQ(xyPath->abbreviation, nullptr);
+    EXPECT_EQ(xyPath->help, nullptr);
+
+    EXPECT_STREQ(FindRow("ChangeDepth")->help, "Changed the processing color precision");
+    EXPECT_STREQ(FindRow("Switch")->help, "Switchs between multiple image inputs");
+    EXPECT_STREQ(FindRow("Switch")->base, "SwitchBase");
+    EXPECT_STREQ(FindRow("CleanPLate")->classWord, "CleanPlate");
+}
+
+TEST(ClassTable, OldIdsAndAliasesReachTheirClasses) {
+    std::map<std::string, std::string> byOldId, byAlias;
+    for (const ClassDesc &row : PlannedClasses()) {
+        for (const std::string &old : Split(row.oldIds)) byOldId[old] = row.id;
+        for (const std::string &alias : Split(row.aliases)) byAlias[alias] = row.id;
+    }
+    EXPECT_EQ(byOldId["SetBgColor"], "SetCanvasColor");
+    for (const char *kind : {"Gradient", "Mesh", "Number", "Point", "PolyLine"}) {
+        EXPECT_EQ(byOldId[std::string("Peturb") + kind], std::string("Perturb") + kind);
+        EXPECT_EQ(FindRow(std::string("Peturb") + kind), nullptr);
+    }
+    EXPECT_EQ(byOldId["Brazel.FastNoiseBrazel"], "FastNoise");
+    EXPECT_EQ(byOldId["Brazel.RealFastNoiseBrazel"], "FastNoise");
+    EXPECT_EQ(byAlias["dither"], "ChangeDepth");
+    EXPECT_EQ(byAlias["shuffle"], "ChannelBoolean");
+    EXPECT_EQ(byAlias["ZMerge"], "Merge");
+    EXPECT_EQ(byAlias["Read"], "Loader");
+    EXPECT_EQ(byAlias["Stabilize"], "Tracker");
+    // Every polygon mask is found as "Roto".
+    for (const char *id : {"PolylineMask", "BSplineMask", "MultiPolyMask"}) {
+        const auto aliases = Split(FindRow(id)->aliases);
+        EXPECT_NE(std::find(aliases.begin(), aliases.end(), "Roto"), aliases.end()) << id;
+    }
+}
+
+TEST(ClassTable, SharedClassWords) {
+    std::map<std::string, Names> byWord;
+    for (const ClassDesc &row : PlannedClasses())
+        if (row.classWord) byWord[row.classWord].insert(row.id);
+    EXPECT_EQ(byWord["Publish"], Names({"PublishOvID", "PublishGradient", "PublishNumber", "PublishPoint",
+                                        "PublishPolyLine", "PublishText"}));
+    EXPECT_EQ(byWord["Perturb"],
+              Names({"PerturbGradient", "PerturbMesh", "PerturbNumber", "PerturbPoint", "PerturbPolyLine"}));
+    EXPECT_EQ(byWord["ZQTDissolve"],
+              Names({"ZQTAddDissolve", "ZQTDissolve", "ZQTErode", "ZQTRandomNoise", "ZQTRandom"}));
+    EXPECT_EQ(byWord["MultiplyDivide"], Names({"AlphaDivide", "AlphaMultiply"}));
+    EXPECT_EQ(byWord["PolyMask"], Names({"BSplineMask", "PolylineMask"}));
+    EXPECT_EQ(byWord["PolyPath"], Names({"BSplinePath", "PolyPath", "Path"}));
+}
+
+TEST(ClassTable, BasesResolve) {
+    const Names hostBases = {"ThreadedOperator", "SourceOperator", "MaskOperator",   "ShapeOperator",    "Parameter",
+                             "ImageFormat",      "SubInputs",      "PreviewControl", "ZQImageTransition"};
+    std::map<std::string, int> counts;
+    for (const ClassDesc &row : PlannedClasses()) {
+        if (!row.base) continue;
+        ++counts[row.base];
+        if (!hostBases.count(row.base)) {
+            const ClassDesc *base = FindRow(row.base);
+            ASSERT_NE(base, nullptr) << row.id << " names unknown base " << row.base;
+            EXPECT_NE(base, &row);
+        }
+    }
+    // Whole-table counts less the two built rows (a ThreadedOperator and a
+    // SourceOperator).
+    const std::map<std::string, int> expected = {
+        {"ThreadedOperator", 138}, {"ShapeOperator", 14}, {"MaskOperator", 9}, {"ZQImageTransition", 8},
+        {"SourceOperator", 6},     {"Parameter", 7},      {"ImageFormat", 7},  {"SubInputs", 1},
+        {"PreviewControl", 1},     {"SwitchBase", 3},     {"sPolygon", 1},     {"PolylineMask", 1},
+        {"PolyMaskInputs", 1},     {"Saver", 1},
+    };
+    EXPECT_EQ(counts, expected);
+}
+
+TEST(ClassTable, OnlyAbstractRowsLackAConstructor) {
+    const Names abstract = {"_TimeSpeed", "SwitchBase", "_TimeStretcher", "VolumeFogLighting"};
+    EXPECT_EQ(RowsWhere([](const ClassDesc &row) { return !row.creatable; }), abstract);
+    EXPECT_EQ(RowsWhere([](const ClassDesc &row) { return row.kind == 0; }), Without(abstract, {"VolumeFogLighting"}));
+
+    const ClassDesc *lighting = FindRow("VolumeFogLighting");
+    ASSERT_NE(lighting, nullptr);
+    EXPECT_EQ(lighting->kind, 1u);
+    EXPECT_EQ(lighting->base, nullptr);
+    EXPECT_EQ(lighting->classWord, nullptr);
+    EXPECT_EQ(lighting->path, nullptr);
+    EXPECT_EQ(lighting->name, nullptr);
+    ASSERT_EQ(lighting->attrs.Size(), 1u);
+    EXPECT_TRUE(lighting->attrs.Has(RegHidden));
+}
+
+TEST(ClassTable, CommonControlSwitches) {
+    const Names noEffectMask = {
+        "AutoDomain", "BetterResize", "ChangeDepth", "Crop",    "Fields",          "LatLongPatcher", "Combiner",
+        "Splitter",   "LensDistort",  "Letterbox",   "PanoMap", "PreviewCleaner",  "Scale",          "SetCanvasColor",
+        "SetDomain",  "MtlSwitch3D",  "Switch3D",    "Switch",  "TrackerModifier", "MediaOut"};
+    EXPECT_EQ(RowsWith(RegNoEffectMask), noEffectMask);
+
+    Names noObject = noEffectMask;
+    noObject.insert({"KeyStretcher", "RunCommand"});
+    noObject.insert(kShapeRows.begin(), kShapeRows.end());
+    EXPECT_EQ(noObject.size(), 38u);
+    EXPECT_EQ(RowsWith(RegNoObjectMaterialControls), noObject);
+
+    Names noBlend = {"AutoDomain",      "BetterResize",   "ChangeDepth", "Crop",     "Fields",
+                     "KeyStretcher",    "LatLongPatcher", "Combiner",    "Splitter", "Letterbox",
+                     "PreviewCleaner",  "PreviewSaver",   "RunCommand",  "Saver",    "Scale",
+                     "SetCanvasColor",  "SetDomain",      "MtlSwitch3D", "Switch3D", "Switch",
+                     "TrackerModifier", "MediaOut"};
+    noBlend.insert(kShapeRows.begin(), kShapeRows.end());
+    noBlend.erase("sRender");
+    EXPECT_EQ(RowsWith(RegNoBlendControls), noBlend);
+
+    // Motion blur is offered only where a tool places or creates something in
+    // time; every other tool row (and the tracker modifier, which carries the
+    // other switches) turns it off.
+    Names offersMotionBlur = {
+        "DVE",       "CameraShake", "CornerPositioner", "DaySky",     "Dent",       "Displace",
+        "Dissolve",  "Drip",        "FastNoise",        "Filter",     "Grain",      "GridWarp",
+        "Highlight", "HotSpot",     "Mandel",           "Merge",      "MultiMerge", "PerspectivePositioner",
+        "Plasma",    "Shader",      "Shadow",           "SSAO",       "Texture",    "Tracker",
+        "Transform", "TV",          "VolumeFog",        "VolumeMask", "Vortex",     "ZtoWorldPos"};
+    offersMotionBlur.insert(kMaskRows.begin(), kMaskRows.end());
+    Names noMotionBlur =
+        Without(RowsWhere([](const ClassDesc &row) { return OffersTool(row.kind); }), offersMotionBlur);
+    noMotionBlur.insert("TrackerModifier");
+    EXPECT_EQ(RowsWith(RegNoMotionBlurControls), noMotionBlur);
+    // 99 in the whole table: BrightnessContrast carries it, Background not.
+    EXPECT_EQ(noMotionBlur.size() + 1, 99u);
+}
+
+TEST(ClassTable, ImageCapabilities) {
+    const Names imageTools = RowsWhere(IsImageTool);
+    // 124 image tools in the whole table, both built rows among them.
+    EXPECT_EQ(imageTools.size() + 2, 124u);
+
+    const Names noRoI = {"DepthBlur",
+                         "AcesTransform",
+                         "ChromaticAberrationRemoval",
+                         "ChromaticAdaptation",
+                         "ColorSpaceTransform",
+                         "CoordSpace",
+                         "DepthMap",
+                         "Displace",
+                         "Dissolve",
+                         "Fields",
+                         "Fog",
+                         "GamutLimiter",
+                         "GamutMapping",
+                         "Highlight",
+                         "ObjectRemoval",
+                         "MagicMask",
+                         "Relight",
+                         "Shader",
+                         "SurfaceTracker",
+                         "Texture",
+                         "Trails",
+                         "TV",
+                         "VectorMotionBlur",
+                         "WandMask",
+                         "MediaOut",
+                         "Primatte4"};
+    EXPECT_EQ(RowsWith(RegSupportsRoI), Without(imageTools, noRoI));
+    EXPECT_EQ(RowsWith(RegSupportsRoI).size() + 2, 98u);
+
+    // Domain of definition and device images: only image tools, and the
+    // whole-table totals with both built rows carrying them.
+    const Names dod = RowsWith(RegSupportsDoD), gpu = RowsWith(RegSupportsGPUImages);
+    EXPECT_EQ(dod.size() + 2, 101u);
+    EXPECT_EQ(gpu.size() + 2, 83u);
+    for (const std::string &id : dod) EXPECT_TRUE(imageTools.count(id)) << id;
+    for (const std::string &id : gpu) EXPECT_TRUE(imageTools.count(id)) << id;
+    // Tools that read anywhere in their input, and the generators, do not
+    // take a partial domain.
+    for (const char *id : {"Dent", "Displace", "Distort", "Drip", "Vortex", "DaySky", "FastNoise", "Mandel", "Plasma"})
+        EXPECT_FALSE(dod.count(id)) << id;
+    // 3D switches carry no images to the device.
+    EXPECT_FALSE(gpu.count("Switch3D"));
+    EXPECT_FALSE(gpu.count("MtlSwitch3D"));
+
+    EXPECT_EQ(
+        RowsWith(RegProcessesCanvasColor),
+        Names({"ChannelBoolean", "CineonLog", "CleanPLate", "ColorCorrector", "ColorGain", "ColorSpace", "ColorCurves",
+               "DeltaKeyer", "FileLUT", "GamutConvert", "HueCurves", "LightTrim", "Shadow", "WhiteBalance"}));
+    EXPECT_EQ(RowsWith(RegStereoAware), Names({"Anaglyph", "Combiner", "Splitter", "Saver", "OpenEXRFormat"}));
+}
+
+TEST(ClassTable, ListedAttributes) {
+    EXPECT_EQ(RowsWith(RegHidden), Names({"MtlSwitch3D", "Switch3D", "VolumeFogLighting", "TeapotMask"}));
+    EXPECT_EQ(RowsWith(RegOptionalClass), Names({"MediaIn", "Primatte4", "Primatte4Control", "Primatte4Data"}));
+    EXPECT_EQ(RowsWith(RegGroupPrimatte), Names({"Primatte4", "Primatte4Control", "Primatte4Data"}));
+    EXPECT_EQ(RowsWith(RegGroupMedia), Names({"MediaIn", "MediaOut"}));
+    EXPECT_EQ(RowsWith(RegHasOperatorControl),
+              Names({"DVE", "ChromaKeyer", "CleanPLate", "Crop", "DeltaKeyer", "GridWarp", "Mandel", "MIDI",
+                     "MagicMask", "SurfaceTracker", "TextTimer", "TrackerModifier", "UltraKeyer", "XYPath"}));
+    EXPECT_EQ(RowsWith(RegNoAutoProxy), Names({"Crop", "Fields", "Letterbox", "MagicMask", "PreviewCleaner", "Tracker",
+                                               "TrackerModifier", "CustomFilter"}));
+    EXPECT_EQ(RowsWith(RegNoCache), Names({"HotSpot", "MIDI", "PreviewCleaner", "PreviewSaver", "TessaneParameter",
+                                           "RunCommand", "Saver", "TextTimer", "Trails", "sChangeStyle"}));
+    EXPECT_EQ(RowsWith(RegUnpredictable),
+              Names({"LUTLookup", "CameraShake", "Fields", "GradientColorModifier", "Grain", "MagicMask", "Shake",
+                     "TextScramble", "TimeCode", "Tracker", "TrackerModifier"}));
+
+    // Source frame controls: the generators with a source frame; a value of
+    // 0 switches one control off on exactly one row.
+    const Names sources = {"DaySky", "FastNoise", "Mandel", "Plasma", "MediaIn", "sRender"};
+    int switchedOff = 0;
+    for (Tag tag : {RegSourceRangeControls, RegSourceSizeControls, RegSourceAspectControls, RegSourceDepthControls}) {
+        EXPECT_EQ(RowsWith(tag), sources);
+        for (const std::string &id : sources)
+            if (FindRow(id)->attrs.GetLong(tag) == 0) ++switchedOff;
+    }
+    EXPECT_EQ(switchedOff, 1);
+
+    // Switches: which data they switch; the key stretcher is a switch class
+    // without a data kind. The plain Switch stays visible by default.
+    EXPECT_EQ(RowsWith(RegSwitchClass), Names({"Switch", "Switch3D", "MtlSwitch3D", "KeyStretcher"}));
+    EXPECT_EQ(RowsWith(RegSwitchDataKind), Names({"Switch", "Switch3D", "MtlSwitch3D"}));
+    EXPECT_EQ(FindRow("Switch")->attrs.GetLong(RegSwitchDataKind, -1), 0);
+    EXPECT_EQ(FindRow("Switch3D")->attrs.GetLong(RegSwitchDataKind, -1), 1);
+    EXPECT_EQ(FindRow("MtlSwitch3D")->attrs.GetLong(RegSwitchDataKind, -1), 2);
+
+    // Transitions in their offered order; the sort order never appears on a
+    // row of another kind except Merge and RawFormat.
+    const std::map<std::string, long long> order = {{"ZQTRandomNoise", 6}, {"ZQTRandom", 7},    {"ZQTErode", 8},
+                                                    {"ZQTAddDissolve", 9}, {"ZQTDissolve", 10}, {"Merge", 1},
+                                                    {"RawFormat", 1000000}};
+    Names sorted;
+    for (const auto &[id, value] : order) {
+        sorted.insert(id);
+        EXPECT_EQ(FindRow(id)->attrs.GetLong(RegSortOrder), value) << id;
+    }
+    EXPECT_EQ(RowsWith(RegSortOrder), sorted);
+
+    EXPECT_EQ(RowsWith(RegKeepsTimeState), Names({"Calculation", "ColorCorrector", "KeyStretcher", "Offset",
+                                                  "TessaneParameter", "Tracker", "Trails", "VolumeFog"}));
+    EXPECT_EQ(RowsWith(RegPreviewTerminal), Names({"PreviewCleaner", "PreviewSaver"}));
+    EXPECT_EQ(RowsWith(RegClipSourceTool), Names({"Loader", "MediaIn"}));
+    EXPECT_EQ(RowsWith(RegMaskMultiPart), Names({"MultiPolyMask"}));
+    EXPECT_EQ(RowsWith(RegOwnCacheValidity), Names({"ColorCorrector", "Tracker", "Trails"}));
+    EXPECT_EQ(RowsWith(RegMaskHasPolygon),
+              Names({"PolylineMask", "BSplineMask", "RectangleMask", "TeapotMask", "TriangleMask"}));
+    EXPECT_EQ(RowsWith(RegMaskHasSize), Names({"EllipseMask", "RectangleMask"}));
+    const Names shapeGenerators = {"sEllipse", "sNGon", "sBSpline", "sPolygon", "sRectangle", "sStar", "sChangeStyle"};
+    for (Tag tag : {RegShapeGenFilled, RegShapeGenOutline, RegShapeGenTransform, RegShapeGenStyle})
+        EXPECT_EQ(RowsWith(tag), shapeGenerators);
+}
+
+TEST(ClassTable, ImageFormats) {
+    struct Format {
+        const char *id, *name;
+        std::vector<std::string> extensions;
+        std::vector<Tag> caps;
+    };
+    const std::vector<Format> formats = {
+        {"JpegFormat", "JPEG Files", {".jpg", ".jpeg"}, {RegFormatLosslessOnly}},
+        {"IPLFormat", "IPL Files", {".ipl"}, {RegFormatOneChannel, RegFormatLosslessOnly}},
+        {"BMPFormat", "Windows Bitmap Files", {".BMP", ".DIB"}, {RegFormatKeepsAspect}},
+        {"RawFormat", "Orvane Raw Image Files", {".raw"}, {RegFormatKeepsAspect, RegFormatHasDomain}},
+        {"PNGFormat", "PNG Files", {".png"}, {}},
+        {"TargaFormat", "Targa Files", {".tga"}, {RegFormatLosslessOnly, RegFormatKeepsAspect}},
+        {"OpenEXRFormat",
+         "OpenEXR Files",
+         {".exr", ".sxr"},
+         {RegFormatHeaderOnly, RegFormatMultiPart, RegFormatKeepsAspect, RegFormatHasDomain}},
+    };
+    const std::vector<Tag> allCaps = {RegFormatHeaderOnly,  RegFormatMultiPart, RegFormatOneChannel,
+                                      RegFormatKeepsAspect, RegFormatHasDomain, RegFormatLosslessOnly};
+    Names seenExtensions;
+    for (const Format &f : formats) {
+        SCOPED_TRACE(f.id);
+        const ClassDesc *row = FindRow(f.id);
+        ASSERT_NE(row, nullptr);
+        EXPECT_EQ(row->kind, 1572864u);
+        EXPECT_STREQ(row->base, "ImageFormat");
+        EXPECT_STREQ(row->attrs.GetText(RegFormatName), f.name);
+        std::vector<std::string> extensions;
+        for (const TagItem *item : row->attrs.FindAll(RegFormatExtension)) {
+            extensions.push_back(item->AsText());
+            EXPECT_TRUE(seenExtensions.insert(item->AsText()).second) << "extension claimed twice";
+        }
+        EXPECT_EQ(extensions, f.extensions);
+        EXPECT_TRUE(row->attrs.GetBool(RegFormatCanLoad));
+        EXPECT_TRUE(row->attrs.GetBool(RegFormatCanSave));
+        const bool options = std::strcmp(f.id, "RawFormat") != 0;
+        EXPECT_EQ(row->attrs.Has(RegFormatHasOptions), options);
+        EXPECT_EQ(row->attrs.Has(RegFormatHasSaveOptions), options);
+        for (Tag cap : allCaps) {
+            const bool expected = std::find(f.caps.begin(), f.caps.end(), cap) != f.caps.end();
+            EXPECT_EQ(row->attrs.Has(cap), expected) << std::hex << cap;
+        }
+    }
+    EXPECT_EQ(RowsWith(RegFormatName).size(), formats.size());
+    EXPECT_EQ(seenExtensions.size(), 10u);
+}
+
+TEST(ClassTable, DataTypesOfModifiersAndMasks) {
+    // Every mask yields a mask; the Publish and Perturb families name the
+    // data type they take instead of the one they yield.
+    for (const std::string &id : kMaskRows) EXPECT_STREQ(FindRow(id)->attrs.GetText(RegOutputType), "Mask") << id;
+    const std::map<std::string, std::string> takes = {
+        {"PublishOvID", "ID"},           {"PublishGradient", "Gradient"}, {"PublishNumber", "Number"},
+        {"PublishPoint", "Point"},       {"PublishPolyLine", "Polyline"}, {"PublishText", "Text"},
+        {"PerturbGradient", "Gradient"}, {"PerturbMesh", "Mesh"},         {"PerturbNumber", "Number"},
+        {"PerturbPoint", "Point"},       {"PerturbPolyLine", "Polyline"}};
+    for (const auto &[id, type] : takes) {
+        const ClassDesc *row = FindRow(id);
+        ASSERT_NE(row, nullptr) << id;
+        EXPECT_STREQ(row->attrs.GetText(RegInputType), type.c_str()) << id;
+        EXPECT_FALSE(row->attrs.Has(RegOutputType)) << id;
+    }
+    const Names outputs = {"Mask", "Text", "Number", "Gradient", "Point"};
+    for (const ClassDesc &row : PlannedClasses()) {
+        if (row.kind != 5 || takes.count(row.id)) continue;
+        ASSERT_TRUE(row.attrs.Has(RegOutputType)) << row.id;
+        EXPECT_TRUE(outputs.count(row.attrs.GetText(RegOutputType))) << row.id;
+    }
+    EXPECT_STREQ(FindRow("XYPath")->attrs.GetText(RegOutputType), "Point");
+    EXPECT_STREQ(FindRow("Calculation")->attrs.GetText(RegOutputType), "Number");
+    EXPECT_EQ(RowsWith(RegOutputType2), Names({"sRender"}));
+}
+
+} // namespace
+} // namespace Orvane
