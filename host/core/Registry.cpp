@@ -88,8 +88,10 @@ const Registry *RegistryList::Find(const OvID &id, uint32_t type) const {
     std::lock_guard<std::mutex> guard(lock_);
     auto it = byId_.find(id);
     const Registry *row = nullptr;
-    if (it != byId_.end()) row = it->second;
-    else if (auto old = byOldId_.find(id); old != byOldId_.end()) row = old->second;
+    if (it != byId_.end())
+        row = it->second;
+    else if (auto old = byOldId_.find(id); old != byOldId_.end())
+        row = old->second;
     if (!row || !row->enabled_) return nullptr;
     if (type && !row->IsRegClassType(type)) return nullptr;
     return row;

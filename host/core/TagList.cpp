@@ -50,8 +50,10 @@ TagItem::TagItem(Tag t, double v) : tag(t) {
 
 TagItem::TagItem(Tag t, const char *text) : tag(t), value(reinterpret_cast<uint64_t>(text)) {
     const TagKind kind = KindOfTag(t);
-    if (kind == TagKind::ID) value = reinterpret_cast<uint64_t>(OvID(text).Text());
-    else if (kind != TagKind::Text && kind != TagKind::Unknown) TagKindMismatch(t, "text");
+    if (kind == TagKind::ID)
+        value = reinterpret_cast<uint64_t>(OvID(text).Text());
+    else if (kind != TagKind::Text && kind != TagKind::Unknown)
+        TagKindMismatch(t, "text");
 }
 
 TagItem::TagItem(Tag t, OvID id) : tag(t), value(reinterpret_cast<uint64_t>(id.IsNull() ? nullptr : id.Text())) {
@@ -70,8 +72,7 @@ long long TagItem::AsInt() const {
 }
 
 double TagItem::AsDouble() const {
-    return KindOfTag(tag) == TagKind::Double ? BitsDouble(value)
-                                             : static_cast<double>(static_cast<long long>(value));
+    return KindOfTag(tag) == TagKind::Double ? BitsDouble(value) : static_cast<double>(static_cast<long long>(value));
 }
 
 TagList::TagList(const uint64_t *pairs, bool copyText) {

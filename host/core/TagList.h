@@ -64,8 +64,7 @@ struct ORVANE_API TagItem {
     TagItem(Tag t, const void *ptr);
     TagItem(Tag t, std::nullptr_t) : TagItem(t, static_cast<const void *>(nullptr)) {}
     /// Functions (factories, start-up hooks) travel as pointers.
-    template <class R, class... A>
-    TagItem(Tag t, R (*fn)(A...)) : TagItem(t, reinterpret_cast<const void *>(fn)) {}
+    template <class R, class... A> TagItem(Tag t, R (*fn)(A...)) : TagItem(t, reinterpret_cast<const void *>(fn)) {}
 
     static TagItem Raw(Tag t, uint64_t bits) {
         TagItem item;

@@ -96,6 +96,9 @@ constexpr Tag RegShapeGenFilled = 0x10002716;
 constexpr Tag RegShapeGenOutline = 0x10002717;
 constexpr Tag RegShapeGenTransform = 0x10002719;
 constexpr Tag RegShapeGenStyle = 0x1000271a;
+/// The library names this class but does not build it yet: it constructs,
+/// and every request it gets fails with a line saying so.
+constexpr Tag RegPlanned = 0x10007fff;
 // Image format capabilities.
 constexpr Tag RegFormatCanLoad = 0x10000064;
 constexpr Tag RegFormatCanSave = 0x10000065;

@@ -22,7 +22,8 @@ bool KeyInterpFromName(const std::string &name, KeyInterp &out) {
 }
 
 void AnimCurve::SetKey(double time, Ref<Parameter> value, KeyInterp interp) {
-    auto it = std::lower_bound(keys_.begin(), keys_.end(), time, [](const Keyframe &k, double t) { return k.time < t; });
+    auto it =
+        std::lower_bound(keys_.begin(), keys_.end(), time, [](const Keyframe &k, double t) { return k.time < t; });
     if (it != keys_.end() && it->time == time) {
         it->value = std::move(value);
         it->interp = interp;
@@ -52,7 +53,8 @@ Ref<Parameter> AnimCurve::ValueAt(double time) const {
     if (keys_.empty()) return nullptr;
     if (time <= keys_.front().time) return keys_.front().value;
     if (time >= keys_.back().time) return keys_.back().value;
-    auto next = std::upper_bound(keys_.begin(), keys_.end(), time, [](double t, const Keyframe &k) { return t < k.time; });
+    auto next =
+        std::upper_bound(keys_.begin(), keys_.end(), time, [](double t, const Keyframe &k) { return t < k.time; });
     const size_t i1 = static_cast<size_t>(next - keys_.begin()), i0 = i1 - 1;
     const Keyframe &k0 = keys_[i0], &k1 = keys_[i1];
     const double span = k1.time - k0.time;

@@ -71,8 +71,8 @@ void Operator::FinishConstruction() {
     const bool blend = !RegAttrB(RegNoBlendControls);
     const bool mask = !RegAttrB(RegNoEffectMask);
     const Input *mainIn = FindMainInput(1);
-    const bool clipping = mainIn && mainIn->DataType() == CLSID_DataType_Image && RegAttrB(RegSupportsDoD) &&
-                          !FindInput("ClippingMode");
+    const bool clipping =
+        mainIn && mainIn->DataType() == CLSID_DataType_Image && RegAttrB(RegSupportsDoD) && !FindInput("ClippingMode");
     if (!blend && !mask && !clipping) return;
     const int page = AddControlPageTagList(CommonPageName, {});
     if (clipping)
@@ -128,14 +128,12 @@ void Operator::FinishConstruction() {
                                                {ListAddItem, "Green"},
                                                {ListAddItem, "Blue"},
                                                {ListAddItem, "Luminance"}});
-        common_.maskInvert = AddInputTagList("Invert Mask", "EffectMaskInvert",
-                                             {{LinkDataType, CLSID_DataType_Number},
-                                              {InputControl, CLSID_InputControl_Checkbox},
-                                              {ControlPage, page}});
-        common_.multiplyByMask = AddInputTagList("Multiply By Mask", "MultiplyByMask",
-                                                 {{LinkDataType, CLSID_DataType_Number},
-                                                  {InputControl, CLSID_InputControl_Checkbox},
-                                                  {ControlPage, page}});
+        common_.maskInvert = AddInputTagList(
+            "Invert Mask", "EffectMaskInvert",
+            {{LinkDataType, CLSID_DataType_Number}, {InputControl, CLSID_InputControl_Checkbox}, {ControlPage, page}});
+        common_.multiplyByMask = AddInputTagList(
+            "Multiply By Mask", "MultiplyByMask",
+            {{LinkDataType, CLSID_DataType_Number}, {InputControl, CLSID_InputControl_Checkbox}, {ControlPage, page}});
     }
 }
 
@@ -161,7 +159,8 @@ void Operator::PostProcess(Request *req) {
     mix.multiply = NumberOf(req, common_.multiplyByMask, 0.0) >= 0.5;
     mix.channel = static_cast<int>(NumberOf(req, common_.maskChannel, 0.0) + 0.5);
     mix.invert = NumberOf(req, common_.maskInvert, 0.0) >= 0.5;
-    const Image *mask = common_.effectMask ? dynamic_cast<const Image *>(req->GetInputData(common_.effectMask)) : nullptr;
+    const Image *mask =
+        common_.effectMask ? dynamic_cast<const Image *>(req->GetInputData(common_.effectMask)) : nullptr;
     if (mix.blend == 1.f && allChannels && !mask) return;
 
     const Input *mainIn = FindMainInput(1);

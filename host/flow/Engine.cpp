@@ -55,8 +55,8 @@ Ref<Parameter> CoverFrame(const Ref<Parameter> &value, bool precalc) {
     const ImgRectI frame = img->Frame();
     const ImgRectI dw = img->DataWindow() | frame;
     const FltPixel canvas = img->GetCanvasColor();
-    Ref<Image> full = NewImageTagList(
-        {{ImgLikeImage, img}, {ImgDataWindow, &dw}, {ImgNoData, precalc}, {ImgCanvasColor, &canvas}});
+    Ref<Image> full =
+        NewImageTagList({{ImgLikeImage, img}, {ImgDataWindow, &dw}, {ImgNoData, precalc}, {ImgCanvasColor, &canvas}});
     if (!full) return nullptr;
     if (!precalc) full->ImageCopy(img);
     return full;
@@ -146,8 +146,8 @@ Ref<Parameter> Evaluate(Output *out, double time, const EvalOptions &options) {
                 EvalOptions up = opt;
                 up.roi = slot.roi;
                 if (slot.flags & InputFlagPreCalc) up.flags |= ReqFlagPreCalc;
-                const bool reuse = (up.flags & ReqFlagPreCalc) && shapes[in->Index()] &&
-                                   shapeTimes[in->Index()] == slot.time;
+                const bool reuse =
+                    (up.flags & ReqFlagPreCalc) && shapes[in->Index()] && shapeTimes[in->Index()] == slot.time;
                 slot.data = reuse ? shapes[in->Index()] : Evaluate(in->Link(), slot.time, up);
                 if (!slot.data) {
                     if (aborted() || in->IsRequired()) return nullptr;

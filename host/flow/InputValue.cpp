@@ -51,7 +51,8 @@ std::string ApplyInputValue(OrvaneDoc &doc, Input *in, const ScriptVal &v, bool 
         return std::string("expects ") + ExpectedValueText(in);
     if (v.IsTable() && v.ClassName() == "Curve") {
         AnimCurve curve;
-        if (!AnimCurve::FromScript(v, [type](const ScriptVal &k) { return ParameterFromScript(type, k); }, curve))
+        if (!AnimCurve::FromScript(
+                v, [type](const ScriptVal &k) { return ParameterFromScript(type, k); }, curve))
             return std::string("malformed curve: keys must be { time, value } with ") + ExpectedValueText(in);
         if (!in->SetCurve(std::move(curve))) return "cannot be animated";
         in->SetUnresolvedLink({});

@@ -70,8 +70,8 @@ Input::Input(Operator *owner, std::string name, OvID id, const TagList &tags, in
     tags_.Persist();
     dataType_ = tags_.GetID(LinkDataType, CLSID_DataType_Number);
     defaultPriority_ = dataType_ == CLSID_DataType_Mask ? PriorityMask
-                       : IsImageType(dataType_)        ? PriorityImage
-                                                       : PriorityDefault;
+                       : IsImageType(dataType_)         ? PriorityImage
+                                                        : PriorityDefault;
     default_ = Conform(DefaultValueFor(dataType_, tags_));
     value_ = default_;
 }
@@ -136,8 +136,8 @@ bool Input::SetCurve(AnimCurve curve) {
 bool Input::ConnectTo(Output *output) {
     if (!output || !IsExternal()) return false;
     const OvID from = output->DataType();
-    const bool fits = from == dataType_ || (IsImageType(from) && IsImageType(dataType_)) ||
-                      from == tags_.GetID(LinkSecondDataType);
+    const bool fits =
+        from == dataType_ || (IsImageType(from) && IsImageType(dataType_)) || from == tags_.GetID(LinkSecondDataType);
     if (!fits || DependsOn(output->Owner(), owner_)) return false;
     Disconnect();
     curve_.reset();

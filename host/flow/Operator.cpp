@@ -31,14 +31,17 @@ int Operator::AddControlPageTagList(const char *name, const TagList &tags) {
 
 Input *Operator::AddInputTagList(const char *name, const char *id, const TagList &tags) {
     if (FindInput(OvID(id))) return nullptr;
-    const int page = static_cast<int>(tags.GetLong(ControlPage, pages_.empty() ? 0 : static_cast<long long>(pages_.size()) - 1));
-    inputs_.push_back(std::make_unique<Input>(this, name ? name : id, OvID(id), tags, static_cast<int>(inputs_.size()), page));
+    const int page =
+        static_cast<int>(tags.GetLong(ControlPage, pages_.empty() ? 0 : static_cast<long long>(pages_.size()) - 1));
+    inputs_.push_back(
+        std::make_unique<Input>(this, name ? name : id, OvID(id), tags, static_cast<int>(inputs_.size()), page));
     return inputs_.back().get();
 }
 
 Output *Operator::AddOutputTagList(const char *name, const char *id, const TagList &tags) {
     if (FindOutput(OvID(id))) return nullptr;
-    outputs_.push_back(std::make_unique<Output>(this, name ? name : id, OvID(id), tags, static_cast<int>(outputs_.size())));
+    outputs_.push_back(
+        std::make_unique<Output>(this, name ? name : id, OvID(id), tags, static_cast<int>(outputs_.size())));
     return outputs_.back().get();
 }
 

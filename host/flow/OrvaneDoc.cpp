@@ -16,9 +16,8 @@ struct PrefInfo {
 };
 
 constexpr PrefInfo Prefs[PREF_Count] = {
-    {"FrameWidth", 1920}, {"FrameHeight", 1080},    {"FrameAspectX", 1.0}, {"FrameAspectY", 1.0},
-    {"FrameDepth", 8},    {"FrameRate", 24.0},      {"FrameFields", 0},    {"CacheMemoryMB", 2048},
-    {"UseGPU", 0},        {"ImageOverlay", 0},
+    {"FrameWidth", 1920}, {"FrameHeight", 1080}, {"FrameAspectX", 1.0},   {"FrameAspectY", 1.0}, {"FrameDepth", 8},
+    {"FrameRate", 24.0},  {"FrameFields", 0},    {"CacheMemoryMB", 2048}, {"UseGPU", 0},         {"ImageOverlay", 0},
 };
 
 } // namespace
@@ -41,9 +40,7 @@ OrvaneDoc::~OrvaneDoc() {
     tools_.clear();
 }
 
-long OrvaneDoc::GetPrefLong(PrefID id) const {
-    return id >= 0 && id < PREF_Count ? static_cast<long>(prefs_[id]) : 0;
-}
+long OrvaneDoc::GetPrefLong(PrefID id) const { return id >= 0 && id < PREF_Count ? static_cast<long>(prefs_[id]) : 0; }
 
 double OrvaneDoc::GetPrefDouble(PrefID id) const { return id >= 0 && id < PREF_Count ? prefs_[id] : 0.0; }
 

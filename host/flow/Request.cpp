@@ -47,8 +47,10 @@ void Request::ClearInputData(Input *in, int) {
 void Request::SetInputRoI(Input *in, const ImageDomain *roi, int) {
     if (!in || in->Owner() != op_) return;
     Slot &s = SlotOf(in);
-    if (roi) s.roi = *roi;
-    else s.roi.reset();
+    if (roi)
+        s.roi = *roi;
+    else
+        s.roi.reset();
 }
 
 const std::optional<ImageDomain> &Request::GetInputRoI(const Input *in, int) const { return SlotOf(in).roi; }
@@ -70,9 +72,7 @@ void Request::ClearInputFlags(Input *in, uint32_t flags, int) {
     if (in && in->Owner() == op_) SlotOf(in).flags &= ~flags;
 }
 
-uint32_t Request::GetInputFlags(const Input *in, int) const {
-    return in && in->Owner() == op_ ? SlotOf(in).flags : 0;
-}
+uint32_t Request::GetInputFlags(const Input *in, int) const { return in && in->Owner() == op_ ? SlotOf(in).flags : 0; }
 
 void Request::SetOutputData(Output *out, Parameter *value) {
     if (!out || out->Owner() != op_) return;

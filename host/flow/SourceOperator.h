@@ -13,7 +13,7 @@ namespace Orvane {
 
 /// The frame a generator renders for one request.
 struct SourceFrame {
-    int width = 0, height = 0;          ///< full-resolution size from the controls
+    int width = 0, height = 0;           ///< full-resolution size from the controls
     double aspectX = 1.0, aspectY = 1.0; ///< pixel aspect
     int depth = 0;                       ///< 0: the image-creation default
     int proxyScale = 1;                  ///< divisor of width and height

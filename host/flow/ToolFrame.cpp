@@ -13,9 +13,12 @@ ImgRectI OutputDataWindow(const Request *req, const Input *in, const Image *img,
     const AutoImageDoD dod(req, in);
     const ImgRectI domain = dod ? dod->rect : img->DataWindow();
     ImgRectI dw;
-    if (clippingMode == ClippingMode_Frame) dw = img->Frame();
-    else if (clippingMode == ClippingMode_Domain) dw = domain;
-    else dw = domain & img->DataWindow();
+    if (clippingMode == ClippingMode_Frame)
+        dw = img->Frame();
+    else if (clippingMode == ClippingMode_Domain)
+        dw = domain;
+    else
+        dw = domain & img->DataWindow();
     if (roi) dw &= roi->rect;
     return dw;
 }

@@ -192,8 +192,10 @@ bool ApplyMatrixTagList(const Image *src, Image *dst, const TagList &tags) {
             StoreFlt(dst->Depth(), span.data(), dw.Width(), dst->ScanLine(y));
         }
     };
-    if (tags.GetBool(WorkThreaded, true)) ParallelRange(dw.y0, dw.y1, rows, 4);
-    else rows(dw.y0, dw.y1);
+    if (tags.GetBool(WorkThreaded, true))
+        ParallelRange(dw.y0, dw.y1, rows, 4);
+    else
+        rows(dw.y0, dw.y1);
     dst->SetCanvasColor(canvas);
     return true;
 }

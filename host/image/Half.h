@@ -42,7 +42,7 @@ inline uint16_t FloatToHalf(float f) {
         return sign | 0x7c00u | (absBits > 0x7f800000u ? 0x200u | ((absBits >> 13) & 0x3ffu) : 0u);
     if (absBits >= 0x477ff000u) return sign | 0x7c00u; // rounds to beyond the largest half
     if (absBits < 0x38800000u) {                       // result is subnormal or zero
-        if (absBits < 0x33000000u) return sign;         // below half of the smallest subnormal
+        if (absBits < 0x33000000u) return sign;        // below half of the smallest subnormal
         const uint32_t exp = absBits >> 23;
         const uint32_t mant = (absBits & 0x7fffffu) | 0x800000u;
         const uint32_t shift = 126 - exp; // 14 + (113 - exp) - 1 ... aligns to 2^-24 units

@@ -66,8 +66,7 @@ bool Image::AddAuxChannel(AuxChannelKind kind) {
     if (HasAuxChannel(kind)) return true;
     AuxPlane plane{kind, nullptr};
     if (HasScanLineData() && !dataWindow_.IsNull()) {
-        plane.data.reset(new (std::nothrow)
-                             float[static_cast<size_t>(dataWindow_.Width()) * dataWindow_.Height()]());
+        plane.data.reset(new (std::nothrow) float[static_cast<size_t>(dataWindow_.Width()) * dataWindow_.Height()]());
         if (!plane.data) return false;
     }
     aux_.push_back(std::move(plane));

@@ -43,8 +43,10 @@ Ref<Image> NewImageTagList(const TagList &tags) {
     }
     img->SetNoData(tags.GetBool(ImgNoData));
     if (const auto *canvas = tags.GetPtrAs<const FltPixel>(ImgCanvasColor)) img->SetCanvasColor(*canvas);
-    if (const auto *abort = tags.GetPtrAs<const std::atomic<bool>>(ImgAbortFlag)) img->SetAbortFlag(abort);
-    else if (like) img->SetAbortFlag(like->AbortFlag());
+    if (const auto *abort = tags.GetPtrAs<const std::atomic<bool>>(ImgAbortFlag))
+        img->SetAbortFlag(abort);
+    else if (like)
+        img->SetAbortFlag(like->AbortFlag());
 
     TagList attrs;
     for (Tag t : {ImgFullWidth, ImgFullHeight, ImgField, ImgProxyScale, ImgQuickMode})

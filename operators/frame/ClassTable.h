@@ -13,20 +13,20 @@
 namespace Orvane {
 
 struct ClassDesc {
-    const char *id;                   ///< class ID text
-    const char *classWord;            ///< RegClassName
-    uint32_t kind;                    ///< RegTypeFlags
-    const char *base;                 ///< class ID text of the direct base, or nullptr
-    const char *path = nullptr;       ///< RegPath, "Tools/Color/ColorGain"
-    const char *name = nullptr;       ///< RegName
-    const char *category = nullptr;   ///< RegCategory
+    const char *id;                     ///< class ID text
+    const char *classWord;              ///< RegClassName
+    uint32_t kind;                      ///< RegTypeFlags
+    const char *base;                   ///< class ID text of the direct base, or nullptr
+    const char *path = nullptr;         ///< RegPath, "Tools/Color/ColorGain"
+    const char *name = nullptr;         ///< RegName
+    const char *category = nullptr;     ///< RegCategory
     const char *abbreviation = nullptr; ///< RegAbbreviation
-    const char *help = nullptr;       ///< RegHelp
-    const char *icon = nullptr;       ///< RegIcon
-    const char *aliases = nullptr;    ///< RegAlias entries, separated by '|'
-    const char *oldIds = nullptr;     ///< RegOldClassId entries, separated by '|'
-    TagList attrs = {};               ///< further attributes (RegNoBlendControls, RegSortOrder, ...)
-    bool creatable = true;            ///< false: no constructor (abstract bases, VolumeFogLighting)
+    const char *help = nullptr;         ///< RegHelp
+    const char *icon = nullptr;         ///< RegIcon
+    const char *aliases = nullptr;      ///< RegAlias entries, separated by '|'
+    const char *oldIds = nullptr;       ///< RegOldClassId entries, separated by '|'
+    TagList attrs = {};                 ///< further attributes (RegNoBlendControls, RegSortOrder, ...)
+    bool creatable = true;              ///< false: no constructor (abstract bases, VolumeFogLighting)
 };
 
 /// Rows of the classes this library names but does not build yet.

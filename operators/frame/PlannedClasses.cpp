@@ -71,8 +71,10 @@ void AddSplit(TagList &tags, Tag tag, const char *list) {
         const size_t bar = rest.find('|');
         const std::string_view word = rest.substr(0, bar);
         if (!word.empty()) {
-            if (KindOfTag(tag) == TagKind::ID) tags.Add({tag, OvID(word)});
-            else tags.Add(TagItem::Raw(tag, reinterpret_cast<uint64_t>(word.data()))); // points into the literal
+            if (KindOfTag(tag) == TagKind::ID)
+                tags.Add({tag, OvID(word)});
+            else
+                tags.Add(TagItem::Raw(tag, reinterpret_cast<uint64_t>(word.data()))); // points into the literal
         }
         if (bar == std::string_view::npos) break;
         rest.remove_prefix(bar + 1);
@@ -80,7 +82,7 @@ void AddSplit(TagList &tags, Tag tag, const char *list) {
 }
 
 struct PlannedRegistrations {
-    std::deque<OvID> ids;   // class IDs and library bases; deque keeps their addresses
+    std::deque<OvID> ids; // class IDs and library bases; deque keeps their addresses
     std::deque<RegistrationBase> rows;
 
     PlannedRegistrations() {
@@ -93,9 +95,14 @@ struct PlannedRegistrations {
             }
             TagList tags = d.attrs;
             tags.Set({RegTypeFlags, static_cast<long long>(d.kind)});
+            if (d.creatable) tags.Set({RegPlanned, 1});
             if (d.classWord) tags.Set({RegClassName, d.classWord});
-            for (auto [tag, text] : {std::pair{RegPath, d.path}, {RegName, d.name}, {RegCategory, d.category},
-                                     {RegAbbreviation, d.abbreviation}, {RegHelp, d.help}, {RegIcon, d.icon}})
+            for (auto [tag, text] : {std::pair{RegPath, d.path},
+                                     {RegName, d.name},
+                                     {RegCategory, d.category},
+                                     {RegAbbreviation, d.abbreviation},
+                                     {RegHelp, d.help},
+                                     {RegIcon, d.icon}})
                 if (text) tags.Set({tag, text});
             AddSplit(tags, RegAlias, d.aliases);
             AddSplit(tags, RegOldClassId, d.oldIds);

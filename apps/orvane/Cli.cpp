@@ -1,0 +1,65 @@
+#include "apps/orvane/Cli.h"
+
+#include <cmath>
+#include <cstdio>
+#include <cstdlib>
+
+#include "host/app/Application.h"
+
+namespace Orvane::Cli {
+
+void LoadLibrary() {
+    std::string error;
+    if (!GetApp()->LoadOperators(error)) throw CliError(ExitFailed, "cannot load the tool library: " + error);
+}
+
+std::string JsonString(const std::string &s) {
+    std::string out = "\"";
+    for (unsigned char c : s) {
+        switch (c) {
+        case '"': out += "\\\""; break;
+        case '\\': out += "\\\\"; break;
+        case '\n': out += "\\n"; break;
+        case '\r': out += "\\r"; break;
+        case '\t': out += "\\t"; break;
+        default:
+            if (c < 0x20) {
+                char buf[8];
+                std::snprintf(buf, sizeof buf, "\\u%04x", c);
+                out += buf;
+            } else {
+                out += static_cast<char>(c);
+            }
+        }
+    }
+    return out + "\"";
+}
+
+std::string JsonNumber(double v) {
+    if (!std::isfinite(v)) return "null";
+    char buf[32];
+    std::snprintf(buf, sizeof buf, "%.9g", v);
+    return buf;
+}
+
+std::vector<double> ParseNumberList(const std::string &text, size_t count, const char *what) {
+    std::vector<double> values;
+    size_t at = 0;
+    while (at <= text.size()) {
+        const size_t comma = text.find(',', at);
+        const std::string part = text.substr(at, comma == std::string::npos ? std::string::npos : comma - at);
+        char *end = nullptr;
+        const double v = std::strtod(part.c_str(), &end);
+        if (part.empty() || !end || *end != '\0' || !std::isfinite(v))
+            throw CliError(ExitUsage, std::string("bad ") + what + " '" + text + "'");
+        values.push_back(v);
+        if (comma == std::string::npos) break;
+        at = comma + 1;
+    }
+    if ((count && values.size() != count) || values.empty())
+        throw CliError(ExitUsage, std::string("bad ") + what + " '" + text + "' (expected " + std::to_string(count) +
+                                      " numbers separated by commas)");
+    return values;
+}
+
+} // namespace Orvane::Cli

@@ -1,0 +1,37 @@
+#pragma once
+// Shared pieces of the orvane command line: exit codes, errors, loading the
+// tool library and documents, JSON text.
+#include <stdexcept>
+#include <string>
+#include <vector>
+
+namespace Orvane::Cli {
+
+enum ExitCode : int {
+    ExitOk = 0,
+    ExitUsage = 2,  ///< a bad command line or document
+    ExitFailed = 3, ///< a tool failed: nothing (or not everything) was produced
+    ExitInterrupted = 130,
+};
+
+/// A failure the command reports in one line and exits with.
+struct CliError : std::runtime_error {
+    CliError(int code, const std::string &message) : std::runtime_error(message), exitCode(code) {}
+    int exitCode;
+};
+
+/// Loads the standard tool library or throws.
+void LoadLibrary();
+
+/// JSON text of a string (quoted, escaped) and of a number (null for NaN/inf).
+std::string JsonString(const std::string &s);
+std::string JsonNumber(double v);
+
+/// Parses "a,b,c,..." into exactly `count` numbers (count 0: any number >= 1).
+std::vector<double> ParseNumberList(const std::string &text, size_t count, const char *what);
+
+int RunTools(const std::vector<std::string> &args);
+int RunDescribe(const std::vector<std::string> &args);
+int RunEval(const std::vector<std::string> &args);
+
+} // namespace Orvane::Cli
