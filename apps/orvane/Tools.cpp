@@ -82,7 +82,22 @@ std::string ControlWord(OvID control) {
     return text;
 }
 
-std::string ValueText(const Ref<Parameter> &v) { return v ? v->ToScript().ToText() : "-"; }
+/// A value on one line (gradients and other tables print across lines).
+std::string ValueText(const Ref<Parameter> &v) {
+    if (!v) return "-";
+    std::string text = v->ToScript().ToText(), line;
+    bool space = false;
+    for (char c : text) {
+        if (c == '\n' || c == '\t') {
+            space = true;
+            continue;
+        }
+        if (space && !line.empty() && line.back() != ' ') line += ' ';
+        space = false;
+        line += c;
+    }
+    return line;
+}
 
 std::string TypeWord(OvID type) {
     if (type == CLSID_DataType_Number) return "number";
@@ -144,9 +159,12 @@ void PrintInput(const Input &in) {
 
 int RunTools(const std::vector<std::string> &args) {
     std::string search;
+    bool all = false;
     for (size_t i = 0; i < args.size(); ++i) {
         if (args[i] == "--search" && i + 1 < args.size())
             search = args[++i];
+        else if (args[i] == "--all")
+            all = true;
         else
             throw CliError(ExitUsage, "tools: unexpected argument '" + args[i] + "'");
     }
@@ -157,6 +175,8 @@ int RunTools(const std::vector<std::string> &args) {
     size_t shown = 0;
     for (const Registry *row : rows) {
         if (!search.empty() && !Matches(*row, search)) continue;
+        // Abstract bases and hidden classes are no one's tools; --all shows them too.
+        if (!all && (row->TypeFlags() == 0 || row->Tags().GetBool(RegHidden))) continue;
         const char *category = row->Tags().GetText(RegCategory, "-");
         std::printf("%-28s %-30s %-16s %-8u %-16s %s\n", row->ID().Text(), row->DisplayName(),
                     KindWord(row->TypeFlags()).c_str(), row->TypeFlags(), category, BuiltWord(*row));

@@ -11,7 +11,8 @@ namespace {
 const char *const Usage = R"(usage: orvane COMMAND [ARGS]
 
 commands:
-  tools [--search WORD]          list the tool classes (class ID, name, kind, category, built)
+  tools [--search WORD] [--all]  list the classes (class ID, name, kind, category, built);
+                                 --all adds abstract bases and hidden classes
   describe CLASS                 show a class's pages and inputs
   eval FLOW TOOL[.OUTPUT] [--time T] [--roi x0,y0,x1,y1] [--pixel X,Y ...]
        [--set TOOL.INPUT=VALUE ...] [--threads N] [--json]

@@ -63,12 +63,18 @@ bool Registry::IsRegClassType(uint32_t type) const {
 Object *NewObj(const Registry &reg, const ScriptVal &args, const TagList &tags) { return reg.New(args, tags); }
 
 Registry *RegistryList::Add(const OvID &id, TagList &tags) {
-    std::lock_guard<std::mutex> guard(lock_);
-    rows_.push_back(std::unique_ptr<Registry>(new Registry(id, tags, this)));
-    Registry *row = rows_.back().get();
-    byId_[id] = row;
-    for (const TagItem *old : row->tags_.FindAll(RegOldClassId)) byOldId_[old->AsID()] = row;
-    if (initDone_) {
+    Registry *row;
+    bool initNow;
+    {
+        std::lock_guard<std::mutex> guard(lock_);
+        rows_.push_back(std::unique_ptr<Registry>(new Registry(id, tags, this)));
+        row = rows_.back().get();
+        byId_[id] = row;
+        for (const TagItem *old : row->tags_.FindAll(RegOldClassId)) byOldId_[old->AsID()] = row;
+        initNow = initDone_;
+    }
+    // Outside the lock, as in InitAll: the hook may look the list up.
+    if (initNow) {
         auto init = reinterpret_cast<RegInitFunction>(row->tags_.GetPtr(RegInitFunc));
         if (init && !init(row)) row->enabled_ = false;
     }

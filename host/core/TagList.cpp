@@ -50,9 +50,10 @@ TagItem::TagItem(Tag t, double v) : tag(t) {
 
 TagItem::TagItem(Tag t, const char *text) : tag(t), value(reinterpret_cast<uint64_t>(text)) {
     const TagKind kind = KindOfTag(t);
-    if (kind == TagKind::ID)
-        value = reinterpret_cast<uint64_t>(OvID(text).Text());
-    else if (kind != TagKind::Text && kind != TagKind::Unknown)
+    if (kind == TagKind::ID) {
+        const OvID id(text); // empty or missing text is the null ID, stored as 0 like TagItem(t, OvID())
+        value = reinterpret_cast<uint64_t>(id.IsNull() ? nullptr : id.Text());
+    } else if (kind != TagKind::Text && kind != TagKind::Unknown)
         TagKindMismatch(t, "text");
 }
 

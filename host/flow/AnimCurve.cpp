@@ -41,6 +41,13 @@ bool AnimCurve::RemoveKey(double time) {
 
 namespace {
 
+/// k0's value blended toward k1's at u in [0, 1). Kinds that cannot blend
+/// hand back one of the two values: the curve then holds k0's.
+Ref<Parameter> Blend(const Keyframe &k0, const Keyframe &k1, double u) {
+    Ref<Parameter> v = k0.value->Interpolate(*k1.value, u);
+    return v.Get() == k1.value.Get() ? k0.value : v;
+}
+
 /// Hermite basis blend of four numbers at u in [0, 1] between p1 and p2.
 double Hermite(double p1, double p2, double m1, double m2, double u) {
     const double u2 = u * u, u3 = u2 * u;
@@ -61,7 +68,7 @@ Ref<Parameter> AnimCurve::ValueAt(double time) const {
     const double u = (time - k0.time) / span;
     switch (k0.interp) {
     case KeyInterp::Hold: return k0.value;
-    case KeyInterp::Linear: return k0.value->Interpolate(*k1.value, u);
+    case KeyInterp::Linear: return Blend(k0, k1, u);
     case KeyInterp::Smooth: break;
     }
     // Smooth: cubic Hermite per component, Catmull-Rom tangents scaled to this
@@ -89,7 +96,7 @@ Ref<Parameter> AnimCurve::ValueAt(double time) const {
         const double y = smooth1([](const Parameter &p) { return static_cast<const Point &>(p).y; });
         return MakeRef<Point>(x, y);
     }
-    return k0.value->Interpolate(*k1.value, u);
+    return Blend(k0, k1, u);
 }
 
 ScriptVal AnimCurve::ToScript() const {

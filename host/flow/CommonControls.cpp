@@ -174,7 +174,10 @@ void Operator::PostProcess(Request *req) {
 
     ImgRectI dw = result->DataWindow();
     if (src) dw |= src->DataWindow();
-    if (mask && !(srcCanvas == result->GetCanvasColor())) dw |= mask->DataWindow();
+    // Beyond both windows the mask still matters where canvas and mask meet:
+    // when the canvases differ, or when the mask multiplies a result canvas.
+    if (mask && (!(srcCanvas == result->GetCanvasColor()) || (mix.multiply && !result->IsCanvasColorClear())))
+        dw |= mask->DataWindow();
     if (const AutoImageRoI roi(req); roi) dw &= roi->rect;
 
     Ref<Image> mixed = NewImageTagList({{ImgLikeImage, result},

@@ -84,6 +84,7 @@ Ref<Parameter> Evaluate(Output *out, double time, const EvalOptions &options) {
 
     ResultCache *cache = op->GetDoc() && opt.useCache ? &op->GetDoc()->Cache() : nullptr;
     std::optional<uint64_t> state = cache ? StateHash(out, time) : std::nullopt;
+    if (state) state = HashMix(*state, op->GetDoc()->PrefsHash());
     const CacheKey key{out, time, Traits(opt.flags, task), state.value_or(0)};
     if (state)
         if (Ref<Parameter> hit = cache->Find(key, opt.roi)) return hit;
@@ -127,6 +128,7 @@ Ref<Parameter> Evaluate(Output *out, double time, const EvalOptions &options) {
             pre.flags |= ReqFlagPreCalc;
             pre.roi.reset();
             Ref<Parameter> shape = Evaluate(in->Link(), slot.time, pre);
+            if (!shape) return nullptr; // the upstream tool failed (its line is written) or the render was aborted
             if (auto *img = dynamic_cast<Image *>(shape.Get()))
                 slot.dod = ImageDomain(wholeFrames ? img->DataWindow() | img->Frame() : img->DataWindow());
             shapes[in->Index()] = std::move(shape);
@@ -150,16 +152,22 @@ Ref<Parameter> Evaluate(Output *out, double time, const EvalOptions &options) {
                     (up.flags & ReqFlagPreCalc) && shapes[in->Index()] && shapeTimes[in->Index()] == slot.time;
                 slot.data = reuse ? shapes[in->Index()] : Evaluate(in->Link(), slot.time, up);
                 if (!slot.data) {
-                    if (aborted() || in->IsRequired()) return nullptr;
+                    return nullptr; // a linked tool failed or the render was aborted: stop here, optional or not
                 } else if (wholeFrames && IsImageType(in->DataType())) {
                     slot.data = CoverFrame(slot.data, req.IsPreCalc() || (up.flags & ReqFlagPreCalc));
                 }
             } else {
                 slot.data = in->ValueAt(slot.time);
                 if (!slot.data && in->IsRequired()) {
-                    if (OrvaneDoc *doc = op->GetDoc())
-                        doc->PrintF(ConsoleError, "%s: input \"%s\" is not connected\n", op->Name().c_str(),
-                                    in->ID().Text());
+                    if (OrvaneDoc *doc = op->GetDoc()) {
+                        if (!in->UnresolvedLink().empty())
+                            doc->PrintF(ConsoleError,
+                                        "%s: input \"%s\" is linked to %s, a tool this program does not have\n",
+                                        op->Name().c_str(), in->ID().Text(), in->UnresolvedLink().c_str());
+                        else
+                            doc->PrintF(ConsoleError, "%s: input \"%s\" is not connected\n", op->Name().c_str(),
+                                        in->ID().Text());
+                    }
                     return nullptr;
                 }
             }

@@ -6,6 +6,7 @@
 #include "host/flow/DataTypes.h"
 #include "host/flow/Gradient.h"
 #include "host/flow/Operator.h"
+#include "host/flow/OrvaneDoc.h"
 
 namespace Orvane {
 namespace {
@@ -117,7 +118,15 @@ bool Input::SetValue(Ref<Parameter> value) {
     Disconnect();
     curve_.reset();
     value_ = std::move(v);
+    Changed();
     return true;
+}
+
+void Input::Changed() {
+    if (!Notifies() || !owner_) return;
+    const double time = owner_->GetDoc() ? owner_->GetDoc()->RenderStart() : 0.0;
+    Ref<Parameter> value = ValueAt(time);
+    owner_->NotifyChanged(this, value.Get(), time, nullptr);
 }
 
 bool Input::SetCurve(AnimCurve curve) {
@@ -130,6 +139,7 @@ bool Input::SetCurve(AnimCurve curve) {
     }
     Disconnect();
     curve_ = std::make_unique<AnimCurve>(std::move(limited));
+    Changed();
     return true;
 }
 
@@ -143,10 +153,12 @@ bool Input::ConnectTo(Output *output) {
     curve_.reset();
     link_ = output;
     output->consumers_.push_back(this);
+    Changed();
     return true;
 }
 
 void Input::Disconnect() {
+    unresolvedLink_.clear(); // a link to a tool this program lacks goes the same way
     if (!link_) return;
     auto &c = link_->consumers_;
     c.erase(std::remove(c.begin(), c.end(), this), c.end());
@@ -157,6 +169,7 @@ void Input::ResetValue() {
     Disconnect();
     curve_.reset();
     value_ = default_;
+    Changed();
 }
 
 bool Input::IsDefault() const {
@@ -172,6 +185,15 @@ Ref<Parameter> Input::ValueAt(double time) const {
 }
 
 uint64_t Input::ValueHash(double time) const {
+    // A curve counts whole: a tool below may fetch this input at other times
+    // than the one asked (SetInputTime), and its cached result must not
+    // outlive an edit there.
+    if (curve_ && !link_) {
+        uint64_t h = 0xc0c0ull;
+        for (const Keyframe &k : curve_->Keys())
+            h = HashMix(HashMix(HashMix(h, HashDouble(k.time)), k.value->Hash()), static_cast<uint64_t>(k.interp));
+        return h;
+    }
     Ref<Parameter> v = ValueAt(time);
     return v ? v->Hash() : 0x51ab1e5ull;
 }

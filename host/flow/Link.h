@@ -84,8 +84,14 @@ public:
     /// other values pass unchanged. Null when the type does not fit.
     Ref<Parameter> Conform(Ref<Parameter> value) const;
 
-    /// Content hash of the unlinked value at `time` (cache keys).
+    /// Content hash of the unlinked value at `time`, of the whole curve when
+    /// animated (cache keys).
     uint64_t ValueHash(double time) const;
+
+    /// Tells the owner about a new value (NotifyChanged) when the input asks
+    /// for it (InputNotify). Value setters call it; the host calls it once
+    /// after construction for inputs that want their first value too.
+    void Changed();
 
 private:
     Operator *owner_;

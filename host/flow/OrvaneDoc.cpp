@@ -5,6 +5,7 @@
 
 #include "host/core/Tags.h"
 #include "host/flow/Operator.h"
+#include "host/flow/Parameter.h"
 #include "host/flow/ResultCache.h"
 
 namespace Orvane {
@@ -48,6 +49,12 @@ void OrvaneDoc::SetPref(PrefID id, double value) {
     if (id < 0 || id >= PREF_Count) return;
     prefs_[id] = value;
     if (id == PREF_CacheMemoryMB) cache_->SetBudget(static_cast<size_t>(value > 0 ? value : 0) << 20);
+}
+
+uint64_t OrvaneDoc::PrefsHash() const {
+    uint64_t h = 0x9ef5;
+    for (double v : prefs_) h = HashMix(h, HashDouble(v));
+    return h;
 }
 
 bool OrvaneDoc::PrefIsSet(PrefID id) const { return id >= 0 && id < PREF_Count && prefs_[id] != Prefs[id].def; }
@@ -124,6 +131,9 @@ Operator *OrvaneDoc::AddTool(OvID classId, const std::string &name) {
     }
     Ref<Operator> held = Ref<Operator>::Adopt(op);
     op->FinishConstruction();
+    // Inputs that notify hear their first value, unless they ask not to.
+    for (const auto &in : op->Inputs())
+        if (in->Tags().GetLong(InputInitialNotify, 1) != 0) in->Changed();
     const char *abbreviation = row->Tags().GetText(RegAbbreviation, row->ClassName());
     const std::string chosen = name.empty() ? UniqueName(abbreviation) : name;
     if (!AddTool(op, chosen)) return nullptr;

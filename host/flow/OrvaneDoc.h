@@ -69,6 +69,8 @@ public:
     /// True when the preference differs from its default.
     bool PrefIsSet(PrefID id) const;
     FrameFormat GetFrameFormat() const;
+    /// Hash of every preference (results may depend on them: cache keys).
+    uint64_t PrefsHash() const;
 
     // ---- console ----
     void PrintF(int code, const char *fmt, ...) __attribute__((format(printf, 3, 4)));

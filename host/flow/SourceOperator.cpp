@@ -25,7 +25,9 @@ void SourceOperator::FinishConstruction() {
     const bool range = RegAttrB(RegSourceRangeControls), size = RegAttrB(RegSourceSizeControls);
     const bool aspect = RegAttrB(RegSourceAspectControls), depth = RegAttrB(RegSourceDepthControls);
     if (range || size || aspect || depth) {
-        const int page = AddControlPageTagList("Image", {{PageIcon, "Icons.Tools.Tabs.Image"}});
+        // PageIcon is a pointer-typed tag: the icon name travels as a plain pointer to static text.
+        const int page =
+            AddControlPageTagList("Image", {{PageIcon, static_cast<const void *>("Icons.Tools.Tabs.Image")}});
         if (range) {
             inGlobalIn_ = AddInputTagList("Global In", "GlobalIn",
                                           {{LinkDataType, CLSID_DataType_Number},

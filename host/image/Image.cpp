@@ -118,6 +118,9 @@ void Image::Clear() {
     canvas_ = FltPixel{};
     if (!AllocScanLineData() || !pixels_) return;
     std::memset(pixels_.get(), 0, RowBytes() * dataWindow_.Height());
+    const size_t planeFloats = static_cast<size_t>(dataWindow_.Width()) * dataWindow_.Height();
+    for (AuxPlane &plane : aux_)
+        if (plane.data) std::memset(plane.data.get(), 0, planeFloats * sizeof(float));
 }
 
 void Image::ImageCopy(const Image *src) {

@@ -147,7 +147,7 @@ public:
     /// Fills the data window (or `within` clipped to it) with one colour.
     void Fill(const FltPixel &color);
     void FillWithin(const FltPixel &color, const ImgRectI &within);
-    /// Sets every pixel and the canvas to zero.
+    /// Sets every pixel, every auxiliary channel and the canvas to zero.
     void Clear();
     /// Copies `src` into this image over this image's data window: pixels of
     /// src where it has them, its canvas colour elsewhere; converts depth.

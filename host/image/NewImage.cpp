@@ -21,13 +21,13 @@ Ref<Image> NewImageTagList(const TagList &tags) {
         width = ff.width, height = ff.height, depth = ff.depth;
         xScale = ff.aspectX, yScale = ff.aspectY;
     }
-    width = static_cast<int>(tags.GetLong(ImgWidth, width));
-    height = static_cast<int>(tags.GetLong(ImgHeight, height));
-    depth = static_cast<int>(tags.GetLong(ImgDepth, depth));
+    // Checked before narrowing to int, so that a 64-bit value cannot wrap into range.
+    const long long w = tags.GetLong(ImgWidth, width), h = tags.GetLong(ImgHeight, height);
+    const long long d = tags.GetLong(ImgDepth, depth);
     xScale = tags.GetDouble(ImgXScale, xScale);
     yScale = tags.GetDouble(ImgYScale, yScale);
-    if (width < 1 || height < 1 || width > MaxImageSide || height > MaxImageSide || !IsValidDepth(depth))
-        return nullptr;
+    if (w < 1 || h < 1 || w > MaxImageSide || h > MaxImageSide || d < DepthAInt8 || d > DepthRGBAFlt32) return nullptr;
+    width = static_cast<int>(w), height = static_cast<int>(h), depth = static_cast<int>(d);
     if (!(xScale > 0.0) || !(yScale > 0.0)) return nullptr;
 
     auto img = MakeRef<Image>(width, height, depth);

@@ -25,15 +25,17 @@ ORVANE_API FltPixel PixelToFlt(const Pixel &p);
 /// data window, its canvas colour outside (the left, middle and right spans).
 ORVANE_API void ReadSpanFlt(const Image &img, int y, int x0, int x1, FltPixel *dst);
 
+// The products are taken in double, where v * 65535 + 0.5 is exact: in float
+// the product rounds first and can carry a value just below a half-way point up a code.
 inline uint16_t FloatToU16(float v) {
     if (!(v > 0.f)) return 0; // also NaN
     if (v >= 1.f) return 65535;
-    return static_cast<uint16_t>(v * 65535.f + 0.5f);
+    return static_cast<uint16_t>(static_cast<double>(v) * 65535.0 + 0.5);
 }
 inline uint8_t FloatToU8(float v) {
     if (!(v > 0.f)) return 0;
     if (v >= 1.f) return 255;
-    return static_cast<uint8_t>(v * 255.f + 0.5f);
+    return static_cast<uint8_t>(static_cast<double>(v) * 255.0 + 0.5);
 }
 inline uint8_t U16ToU8(uint16_t v) { return static_cast<uint8_t>((v * 255u + 32767u) / 65535u); }
 

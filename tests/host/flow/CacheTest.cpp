@@ -1,0 +1,457 @@
+// The result cache: on its own (keys, regions, LRU eviction under a byte
+// budget, byte accounting) and through the engine (what is served again,
+// what renders anew, what is never kept, pass-through by reference).
+#include <optional>
+#include <string>
+#include <vector>
+
+#include <gtest/gtest.h>
+
+#include "host/core/Registry.h"
+#include "host/core/Tags.h"
+#include "host/flow/AnimCurve.h"
+#include "host/flow/DataTypes.h"
+#include "host/flow/Engine.h"
+#include "host/flow/Request.h"
+#include "host/flow/ResultCache.h"
+#include "host/image/NewImage.h"
+#include "tests/support/TestSupport.h"
+
+namespace Orvane::cachetest {
+namespace ts = ::Orvane::Test;
+namespace {
+
+std::optional<ImageDomain> Region(int x0, int y0, int x1, int y1) { return ImageDomain(ImgRectI(x0, y0, x1, y1)); }
+const std::optional<ImageDomain> Whole;
+
+Ref<Parameter> Img(int w, int h) { return ts::PatternImage(w, h); }
+
+/// Outputs standing for cache keys (owned by no tool).
+struct Outputs {
+    Output a{nullptr, "A", OvID("A"), {}, 0};
+    Output b{nullptr, "B", OvID("B"), {}, 1};
+};
+
+CacheKey Key(const Output &out, double time = 0.0, uint32_t traits = 0, uint64_t state = 7) {
+    return CacheKey{&out, time, traits, state};
+}
+
+TEST(ResultCache, FindsOnlyWhatWasStoredUnderTheSameKey) {
+    Outputs o;
+    ResultCache cache;
+    Ref<Parameter> v = MakeRef<Number>(1.0);
+    cache.Store(Key(o.a), Whole, v);
+    EXPECT_EQ(cache.Find(Key(o.a), Whole).Get(), v.Get());
+    const CacheKey others[] = {Key(o.b), Key(o.a, 1.0), Key(o.a, 0.0, ReqFlagPreCalc), Key(o.a, 0.0, 0, 8)};
+    for (const CacheKey &k : others) EXPECT_FALSE(cache.Find(k, Whole));
+    EXPECT_EQ(cache.Entries(), 1u);
+    const ResultCache::Stats s = cache.GetStats();
+    EXPECT_EQ(s.hits, 1u);
+    EXPECT_EQ(s.misses, 4u);
+}
+
+TEST(ResultCache, RegionResultsServeOnlyRegionsTheyCover) {
+    struct Case {
+        const char *name;
+        std::optional<ImageDomain> asked;
+        bool served;
+    };
+    const Case cases[] = {
+        {"the same region", Region(2, 2, 10, 8), true},
+        {"a region inside", Region(3, 4, 9, 5), true},
+        {"a region reaching out", Region(1, 2, 10, 8), false},
+        {"a disjoint region", Region(20, 20, 30, 30), false},
+        {"the whole frame", Whole, false},
+    };
+    Outputs o;
+    ResultCache cache;
+    Ref<Parameter> v = Img(4, 4);
+    cache.Store(Key(o.a), Region(2, 2, 10, 8), v);
+    for (const Case &c : cases) {
+        SCOPED_TRACE(c.name);
+        EXPECT_EQ(cache.Find(Key(o.a), c.asked).Get(), c.served ? v.Get() : nullptr);
+    }
+}
+
+TEST(ResultCache, AWholeFrameResultServesAllAndReplacesRegionResults) {
+    Outputs o;
+    ResultCache cache;
+    Ref<Parameter> left = Img(4, 4), right = Img(5, 5), whole = Img(8, 8);
+    cache.Store(Key(o.a), Region(0, 0, 4, 8), left);
+    cache.Store(Key(o.a), Region(4, 0, 8, 8), right);
+    cache.Store(Key(o.b), Region(0, 0, 4, 8), left); // another output keeps its own
+    EXPECT_EQ(cache.Entries(), 3u);
+    EXPECT_EQ(cache.Find(Key(o.a), Region(1, 1, 3, 3)).Get(), left.Get());
+    EXPECT_EQ(cache.Find(Key(o.a), Region(5, 1, 7, 3)).Get(), right.Get());
+    EXPECT_FALSE(cache.Find(Key(o.a), Region(3, 1, 5, 3))) << "no one region covers this";
+
+    cache.Store(Key(o.a), Whole, whole);
+    EXPECT_EQ(cache.Entries(), 2u);
+    EXPECT_EQ(cache.Bytes(), whole->SizeOf() + left->SizeOf());
+    for (const auto &asked : {Whole, Region(1, 1, 3, 3), Region(5, 1, 7, 3), Region(-50, -50, 50, 50)})
+        EXPECT_EQ(cache.Find(Key(o.a), asked).Get(), whole.Get());
+    EXPECT_EQ(cache.Find(Key(o.b), Region(0, 0, 4, 8)).Get(), left.Get());
+
+    // A larger region replaces the regions it holds, not the others.
+    ResultCache regions;
+    Ref<Parameter> big = Img(6, 6);
+    regions.Store(Key(o.a), Region(0, 0, 2, 2), left);
+    regions.Store(Key(o.a), Region(10, 10, 12, 12), right);
+    regions.Store(Key(o.a), Region(0, 0, 4, 4), big);
+    EXPECT_EQ(regions.Entries(), 2u);
+    EXPECT_EQ(regions.Find(Key(o.a), Region(0, 0, 2, 2)).Get(), big.Get());
+    EXPECT_EQ(regions.Find(Key(o.a), Region(10, 10, 12, 12)).Get(), right.Get());
+    EXPECT_EQ(regions.Bytes(), big->SizeOf() + right->SizeOf());
+}
+
+TEST(ResultCache, EvictsLeastRecentlyUsedBeyondTheBudget) {
+    Outputs o;
+    Ref<Parameter> v[4] = {Img(16, 16), Img(16, 16), Img(16, 16), Img(16, 16)};
+    const size_t one = v[0]->SizeOf();
+    ASSERT_GT(one, 16u * 16u * 16u) << "an image accounts for its pixels";
+    ResultCache cache(one * 2 + one / 2); // room for two
+    cache.Store(Key(o.a, 0), Whole, v[0]);
+    cache.Store(Key(o.a, 1), Whole, v[1]);
+    EXPECT_EQ(cache.Bytes(), 2 * one);
+    ASSERT_TRUE(cache.Find(Key(o.a, 0), Whole)); // 0 is now the most recent
+    cache.Store(Key(o.a, 2), Whole, v[2]);       // 1 goes
+    EXPECT_EQ(cache.Entries(), 2u);
+    EXPECT_EQ(cache.Bytes(), 2 * one);
+    EXPECT_TRUE(cache.Find(Key(o.a, 0), Whole));
+    EXPECT_FALSE(cache.Find(Key(o.a, 1), Whole));
+    EXPECT_TRUE(cache.Find(Key(o.a, 2), Whole));
+    EXPECT_EQ(cache.GetStats().evictions, 1u);
+
+    // A smaller budget evicts at once, oldest first.
+    cache.SetBudget(one + one / 2);
+    EXPECT_EQ(cache.Entries(), 1u);
+    EXPECT_TRUE(cache.Find(Key(o.a, 2), Whole));
+    EXPECT_EQ(cache.Bytes(), one);
+    // A value larger than the whole budget is not kept.
+    cache.Store(Key(o.a, 3), Whole, Img(64, 64));
+    EXPECT_FALSE(cache.Find(Key(o.a, 3), Whole));
+    EXPECT_LE(cache.Bytes(), cache.Budget());
+
+    cache.Clear();
+    EXPECT_EQ(cache.Entries(), 0u);
+    EXPECT_EQ(cache.Bytes(), 0u);
+}
+
+TEST(ResultCache, StoringTheSameKeyAgainReplacesAndCountsOnce) {
+    Outputs o;
+    ResultCache cache;
+    Ref<Parameter> first = Img(8, 8), second = Img(4, 4);
+    cache.Store(Key(o.a), Region(0, 0, 4, 4), first);
+    cache.Store(Key(o.a), Region(0, 0, 4, 4), second);
+    EXPECT_EQ(cache.Entries(), 1u);
+    EXPECT_EQ(cache.Bytes(), second->SizeOf());
+    EXPECT_EQ(cache.Find(Key(o.a), Region(0, 0, 4, 4)).Get(), second.Get());
+    cache.Store(Key(o.a), Whole, first);
+    cache.Store(Key(o.a), Whole, second);
+    EXPECT_EQ(cache.Entries(), 1u);
+    EXPECT_EQ(cache.Bytes(), second->SizeOf());
+    cache.Store(Key(o.a, 1), Whole, nullptr); // nothing to keep
+    EXPECT_EQ(cache.Entries(), 1u);
+}
+
+TEST(ResultCache, ForgetDropsOneOutputsEntries) {
+    Outputs o;
+    ResultCache cache;
+    Ref<Parameter> x = Img(4, 4), y = Img(6, 6);
+    cache.Store(Key(o.a, 0), Whole, x);
+    cache.Store(Key(o.a, 1), Region(0, 0, 2, 2), x);
+    cache.Store(Key(o.a, 1), Region(5, 5, 6, 6), x);
+    cache.Store(Key(o.b, 0), Whole, y);
+    cache.Forget(&o.a);
+    EXPECT_EQ(cache.Entries(), 1u);
+    EXPECT_EQ(cache.Bytes(), y->SizeOf());
+    EXPECT_FALSE(cache.Find(Key(o.a, 0), Whole));
+    EXPECT_FALSE(cache.Find(Key(o.a, 1), Region(0, 0, 1, 1)));
+    EXPECT_EQ(cache.Find(Key(o.b, 0), Whole).Get(), y.Get());
+    cache.Forget(&o.a); // nothing left of it
+    EXPECT_EQ(cache.Entries(), 1u);
+}
+
+// ---- through the engine ----------------------------------------------------
+
+/// out = in x Gain over the input's data window; View is passive.
+class GainTool : public ThreadedOperator {
+public:
+    GainTool(const Registry *reg, const ScriptVal &args, const TagList &tags) : ThreadedOperator(reg, args, tags) {
+        input = AddInputTagList("Input", "Input", {{LinkDataType, CLSID_DataType_Image}, {LinkMain, 1}});
+        gain = AddInputTagList("Gain", "Gain", {{LinkDataType, CLSID_DataType_Number}, {InputDefault, 1.0}});
+        view = AddInputTagList("View", "View", {{LinkDataType, CLSID_DataType_Number}, {InputPassive, 1}});
+        output = AddOutputTagList("Output", "Output", {{LinkDataType, CLSID_DataType_Image}, {LinkMain, 1}});
+    }
+    void Process(Request *req) override {
+        auto *src = dynamic_cast<Image *>(req->GetInputData(input));
+        const float k = static_cast<float>(dynamic_cast<Number *>(req->GetInputData(gain))->value);
+        ImgRectI dw = src->DataWindow();
+        if (const AutoImageRoI roi(req); roi) dw &= roi->rect;
+        Ref<Image> img = NewImageTagList({{ImgLikeImage, src}, {ImgDataWindow, &dw}, {ImgNoData, req->IsPreCalc()}});
+        if (!req->IsPreCalc()) {
+            ++processCount;
+            rois.push_back(req->RoI());
+            img->AllocScanLineData();
+            for (int y = dw.y0; y < dw.y1; ++y)
+                for (int x = dw.x0; x < dw.x1; ++x) {
+                    const FltPixel p = src->GetFlt(x, y);
+                    img->PutFlt(x, y, {p.R * k, p.G * k, p.B * k, p.A * k});
+                }
+        }
+        req->SetOutputData(output, img.Get());
+    }
+    Input *input, *gain, *view;
+    Output *output;
+    int processCount = 0;
+    std::vector<std::optional<ImageDomain>> rois;
+};
+
+/// Hands its input on by reference.
+class PassTool : public ThreadedOperator {
+public:
+    PassTool(const Registry *reg, const ScriptVal &args, const TagList &tags) : ThreadedOperator(reg, args, tags) {
+        input = AddInputTagList("Input", "Input", {{LinkDataType, CLSID_DataType_Image}, {LinkMain, 1}});
+        output = AddOutputTagList("Output", "Output", {{LinkDataType, CLSID_DataType_Image}, {LinkMain, 1}});
+    }
+    void Process(Request *req) override {
+        Parameter *in = req->GetInputData(input);
+        in->Use(); // the output takes a reference of its own
+        req->SetOutputData(output, in);
+        in->Recycle();
+    }
+    Input *input;
+    Output *output;
+};
+
+/// Hands on its input as it was `Offset` frames earlier.
+class ShiftTool : public ThreadedOperator {
+public:
+    ShiftTool(const Registry *reg, const ScriptVal &args, const TagList &tags) : ThreadedOperator(reg, args, tags) {
+        input = AddInputTagList("Input", "Input", {{LinkDataType, CLSID_DataType_Image}, {LinkMain, 1}});
+        // Read before the image's level, so CheckRequest knows it when it sets the time.
+        offset = AddInputTagList("Offset", "Offset",
+                                 {{LinkDataType, CLSID_DataType_Number}, {InputDefault, 5.0}, {InputPriority, -2}});
+        output = AddOutputTagList("Output", "Output", {{LinkDataType, CLSID_DataType_Image}, {LinkMain, 1}});
+    }
+    void CheckRequest(Request *req) override {
+        ThreadedOperator::CheckRequest(req);
+        if (req->GetPri() != input->Priority()) return;
+        auto *n = dynamic_cast<Number *>(req->GetInputData(offset));
+        req->SetInputTime(input, req->Time() - (n ? n->value : 5.0));
+    }
+    void Process(Request *req) override { req->SetOutputData(output, req->GetInputData(input)); }
+    Input *input, *offset;
+    Output *output;
+};
+
+template <class T> Object *Make(const Registry *reg, const ScriptVal &args, const TagList &tags) {
+    return new T(reg, args, tags);
+}
+
+OvID Register(const char *id, ClassFactory make, std::initializer_list<TagItem> attrs) {
+    TagList tags{{RegConstructor, make},
+                 {RegTypeFlags, static_cast<long long>(RegKindOperator | RegKindTool)},
+                 {RegNoBlendControls, 1},
+                 {RegNoEffectMask, 1},
+                 {RegSupportsRoI, 1},
+                 {RegSupportsDoD, 1}};
+    for (const TagItem &a : attrs) tags.Set(a);
+    Registry::_Init(&ClassRegistry, OvID(id), tags);
+    return OvID(id);
+}
+
+struct Classes {
+    OvID gain = Register("CacheTestGain", &Make<GainTool>, {});
+    OvID noCache = Register("CacheTestGainNoCache", &Make<GainTool>, {{RegNoCache, 1}});
+    OvID unpredictable = Register("CacheTestGainUnpredictable", &Make<GainTool>, {{RegUnpredictable, 1}});
+    OvID pass = Register("CacheTestPass", &Make<PassTool>, {});
+    OvID shift = Register("CacheTestShift", &Make<ShiftTool>, {});
+};
+const Classes &C() {
+    static const Classes classes;
+    return classes;
+}
+
+Ref<Image> Eval(Operator *op, double time = 0.0, const std::optional<ImageDomain> &roi = std::nullopt,
+                bool useCache = true) {
+    EvalOptions opt;
+    opt.roi = roi;
+    opt.useCache = useCache;
+    Ref<Parameter> p = Evaluate(op->FindMainOutput(), time, opt);
+    return Ref<Image>(dynamic_cast<Image *>(p.Get()));
+}
+
+struct Chain {
+    Ref<OrvaneDoc> doc = MakeRef<OrvaneDoc>();
+    Ref<Image> image = ts::PatternImage(10, 6);
+    ts::ImageSourceTool *src = ts::AddImageSource(*doc, "Src", image);
+    GainTool *tool = nullptr;
+    explicit Chain(OvID cls = OvID()) {
+        tool = dynamic_cast<GainTool *>(doc->AddTool(cls.IsNull() ? C().gain : cls, "Gain1"));
+        EXPECT_NE(tool, nullptr);
+        if (tool) {
+            EXPECT_TRUE(tool->input->ConnectTo(src->Out()));
+        }
+    }
+};
+
+TEST(EngineCache, ASecondIdenticalRenderIsServedFromTheCache) {
+    Chain c;
+    Ref<Image> first = Eval(c.tool);
+    ASSERT_TRUE(first);
+    Ref<Image> second = Eval(c.tool);
+    EXPECT_EQ(second.Get(), first.Get());
+    EXPECT_EQ(c.tool->processCount, 1);
+    EXPECT_EQ(c.src->processCount, 1);
+}
+
+TEST(EngineCache, RegionsAreServedWhenCoveredAndRenderedWhenNot) {
+    Chain c;
+    ASSERT_TRUE(Eval(c.tool, 0.0, Region(2, 1, 8, 5)));
+    ASSERT_TRUE(Eval(c.tool, 0.0, Region(3, 2, 6, 4))); // inside: served
+    EXPECT_EQ(c.tool->processCount, 1);
+    ASSERT_TRUE(Eval(c.tool, 0.0, Region(1, 1, 8, 5))); // reaches out: rendered
+    EXPECT_EQ(c.tool->processCount, 2);
+    Ref<Image> whole = Eval(c.tool); // the whole frame: rendered, then serves every region
+    ASSERT_TRUE(whole);
+    EXPECT_EQ(c.tool->processCount, 3);
+    EXPECT_EQ(Eval(c.tool, 0.0, Region(0, 0, 2, 2)).Get(), whole.Get());
+    EXPECT_EQ(c.tool->processCount, 3);
+}
+
+TEST(EngineCache, InputChangesRenderAgainUnlessPassive) {
+    struct Case {
+        const char *name;
+        const char *input;
+        double value;
+        bool renders;
+    };
+    const Case cases[] = {
+        {"a non-passive input", "Gain", 2.0, true},
+        {"a passive input", "View", 3.0, false},
+        {"the same value again", "Gain", 1.0, false},
+    };
+    for (const Case &c : cases) {
+        SCOPED_TRACE(c.name);
+        Chain ch;
+        Ref<Image> before = Eval(ch.tool);
+        ASSERT_TRUE(before);
+        ts::SetNumber(ch.tool, c.input, c.value);
+        Ref<Image> after = Eval(ch.tool);
+        ASSERT_TRUE(after);
+        EXPECT_EQ(ch.tool->processCount, c.renders ? 2 : 1);
+        EXPECT_EQ(after.Get() != before.Get(), c.renders);
+        EXPECT_EQ(ch.src->processCount, 1) << "the source did not change";
+    }
+}
+
+TEST(EngineCache, AnAnimatedInputRendersPerTimeAndCachesEachTime) {
+    Chain c;
+    AnimCurve curve;
+    curve.SetKey(0.0, MakeRef<Number>(1.0));
+    curve.SetKey(10.0, MakeRef<Number>(3.0));
+    ASSERT_TRUE(c.tool->gain->SetCurve(curve));
+    const double times[] = {0.0, 5.0, 10.0};
+    const float gains[] = {1.f, 2.f, 3.f};
+    std::vector<Ref<Image>> results;
+    for (int i = 0; i < 3; ++i) {
+        Ref<Image> out = Eval(c.tool, times[i]);
+        ASSERT_TRUE(out);
+        const FltPixel p = c.image->GetFlt(4, 2);
+        EXPECT_EQ(out->GetFlt(4, 2), (FltPixel{p.R * gains[i], p.G * gains[i], p.B * gains[i], p.A * gains[i]}))
+            << "time " << times[i];
+        results.push_back(out);
+    }
+    EXPECT_EQ(c.tool->processCount, 3);
+    for (int i = 2; i >= 0; --i) EXPECT_EQ(Eval(c.tool, times[i]).Get(), results[i].Get()) << "time " << times[i];
+    EXPECT_EQ(c.tool->processCount, 3);
+}
+
+TEST(EngineCache, EditsSeenAtAnotherTimeReachToolsBelowATimeShift) {
+    // Src -> Gain1 (animated) -> Shift (fetches 5 frames earlier) -> Below.
+    Chain c;
+    Operator *shift = c.doc->AddTool(C().shift, "Shift1");
+    auto *below = dynamic_cast<GainTool *>(c.doc->AddTool(C().gain, "Below"));
+    ASSERT_TRUE(shift && below);
+    ASSERT_TRUE(shift->FindInput("Input")->ConnectTo(c.tool->output));
+    ASSERT_TRUE(below->input->ConnectTo(shift->FindMainOutput()));
+    AnimCurve curve;
+    curve.SetKey(0.0, MakeRef<Number>(1.0));
+    curve.SetKey(10.0, MakeRef<Number>(3.0));
+    ASSERT_TRUE(c.tool->gain->SetCurve(curve));
+    const FltPixel p = c.image->GetFlt(4, 2);
+    auto expect = [&](double gain) {
+        Ref<Image> out = Eval(below, 10.0);
+        ASSERT_TRUE(out);
+        const float k = static_cast<float>(gain);
+        EXPECT_EQ(out->GetFlt(4, 2), (FltPixel{p.R * k, p.G * k, p.B * k, p.A * k})) << "gain " << gain;
+    };
+    expect(2.0); // the curve at frame 5
+    // An edit that leaves frame 10 alone but changes frame 5.
+    curve.SetKey(0.0, MakeRef<Number>(0.5));
+    ASSERT_TRUE(c.tool->gain->SetCurve(curve));
+    expect(1.75);
+    // Moving the shift changes what is seen too.
+    ts::SetNumber(shift, "Offset", 10.0);
+    expect(0.5);
+}
+
+TEST(EngineCache, VolatileToolsAndAllBelowThemAreNeverCached) {
+    for (const OvID cls : {C().noCache, C().unpredictable}) {
+        SCOPED_TRACE(cls.Text());
+        Ref<OrvaneDoc> doc = MakeRef<OrvaneDoc>();
+        ts::ImageSourceTool *src = ts::AddImageSource(*doc, "Src", ts::PatternImage(8, 4));
+        auto *vol = dynamic_cast<GainTool *>(doc->AddTool(cls, "Vol"));
+        auto *below = dynamic_cast<GainTool *>(doc->AddTool(C().gain, "Below"));
+        auto *aside = dynamic_cast<GainTool *>(doc->AddTool(C().gain, "Aside"));
+        ASSERT_TRUE(vol && below && aside);
+        ASSERT_TRUE(vol->input->ConnectTo(src->Out()));
+        ASSERT_TRUE(below->input->ConnectTo(vol->output));
+        ASSERT_TRUE(aside->input->ConnectTo(src->Out()));
+        for (int i = 0; i < 3; ++i) {
+            ASSERT_TRUE(Eval(below));
+            ASSERT_TRUE(Eval(aside));
+        }
+        EXPECT_EQ(vol->processCount, 3);
+        EXPECT_EQ(below->processCount, 3);
+        EXPECT_EQ(aside->processCount, 1) << "a tool beside the volatile one caches as ever";
+        EXPECT_EQ(src->processCount, 1) << "what is above the volatile tool caches as ever";
+        EXPECT_FALSE(StateHash(below->output, 0.0));
+        EXPECT_TRUE(StateHash(aside->output, 0.0));
+    }
+}
+
+TEST(EngineCache, UseCacheFalseBypassesTheCache) {
+    Chain c;
+    ASSERT_TRUE(Eval(c.tool));
+    for (int i = 0; i < 2; ++i) ASSERT_TRUE(Eval(c.tool, 0.0, Whole, false));
+    EXPECT_EQ(c.tool->processCount, 3);
+    EXPECT_EQ(c.src->processCount, 3);
+}
+
+TEST(EngineCache, PassThroughHandsOnTheSameObject) {
+    Ref<OrvaneDoc> doc = MakeRef<OrvaneDoc>();
+    Ref<Image> image = ts::PatternImage(8, 4);
+    ts::ImageSourceTool *src = ts::AddImageSource(*doc, "Src", image);
+    Operator *p1 = doc->AddTool(C().pass, "Pass1");
+    Operator *p2 = doc->AddTool(C().pass, "Pass2");
+    ASSERT_TRUE(p1 && p2);
+    ASSERT_TRUE(p1->FindInput("Input")->ConnectTo(src->Out()));
+    ASSERT_TRUE(p2->FindInput("Input")->ConnectTo(p1->FindMainOutput()));
+    const int refsBefore = image->RefCount();
+    {
+        Ref<Image> out = Eval(p2);
+        EXPECT_EQ(out.Get(), image.Get());
+        EXPECT_GT(image->RefCount(), refsBefore);
+    }
+    // Through the cache too.
+    EXPECT_EQ(Eval(p2).Get(), image.Get());
+    EXPECT_EQ(src->processCount, 1);
+    // Letting the results go leaves the image to its owners.
+    doc->Cache().Clear();
+    EXPECT_EQ(image->RefCount(), refsBefore);
+}
+
+} // namespace
+} // namespace Orvane::cachetest

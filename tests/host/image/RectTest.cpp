@@ -1,0 +1,275 @@
+#include "host/image/Rect.h"
+
+#include <gtest/gtest.h>
+
+#include <algorithm>
+#include <cmath>
+#include <cstdint>
+#include <set>
+#include <string>
+#include <utility>
+
+namespace Orvane::recttest {
+namespace {
+
+std::string Str(const ImgRectI &r) {
+    return "(" + std::to_string(r.x0) + ", " + std::to_string(r.y0) + ", " + std::to_string(r.x1) + ", " +
+           std::to_string(r.y1) + ")";
+}
+
+// The pixels of a rectangle, counted one by one.
+std::set<std::pair<int, int>> PixelsOf(const ImgRectI &r) {
+    std::set<std::pair<int, int>> s;
+    for (int y = r.y0; y < r.y1; ++y)
+        for (int x = r.x0; x < r.x1; ++x) s.insert({x, y});
+    return s;
+}
+
+// A small deterministic generator for rectangles in [-6, 6], null ones included.
+struct Lcg {
+    uint32_t state;
+    int Next(int lo, int hi) {
+        state = state * 1664525u + 1013904223u;
+        return lo + static_cast<int>((state >> 8) % static_cast<uint32_t>(hi - lo + 1));
+    }
+    ImgRectI Rect() { return ImgRectI(Next(-6, 6), Next(-6, 6), Next(-6, 6), Next(-6, 6)); }
+};
+
+constexpr int E = DomainEndless;
+
+TEST(RectBasics, SizeNullAndContains) {
+    struct Case {
+        ImgRectI r;
+        int w, h;
+        bool null;
+    };
+    const Case cases[] = {
+        {{0, 0, 4, 3}, 4, 3, false}, {{-2, -5, 1, -1}, 3, 4, false}, {{2, 2, 2, 5}, 0, 3, true},
+        {{2, 2, 5, 2}, 3, 0, true},  {{5, 0, 2, 3}, -3, 3, true},    {{}, 0, 0, true},
+    };
+    for (const Case &c : cases) {
+        SCOPED_TRACE(testing::Message() << Str(c.r));
+        EXPECT_EQ(c.r.Width(), c.w);
+        EXPECT_EQ(c.r.Height(), c.h);
+        EXPECT_EQ(c.r.IsNull(), c.null);
+        EXPECT_EQ(c.r.IsNull(), PixelsOf(c.r).empty());
+    }
+    ImgRectI r(1, 2, 3, 4);
+    r.SetNull();
+    EXPECT_TRUE(r.IsNull());
+    EXPECT_EQ(r, ImgRectI());
+
+    // Half open: the far sides are outside.
+    const ImgRectI box(-2, -1, 3, 2);
+    struct Point {
+        int x, y;
+        bool in;
+    };
+    for (const Point &p : {Point{-2, -1, true}, Point{2, 1, true}, Point{3, 1, false}, Point{2, 2, false},
+                           Point{-3, 0, false}, Point{0, -2, false}, Point{0, 0, true}}) {
+        SCOPED_TRACE(testing::Message() << p.x << ", " << p.y);
+        EXPECT_EQ(box.Contains(p.x, p.y), p.in);
+    }
+    EXPECT_TRUE(box.Contains(box));
+    EXPECT_TRUE(box.Contains(ImgRectI(-1, 0, 3, 2)));
+    EXPECT_FALSE(box.Contains(ImgRectI(-1, 0, 4, 2)));
+    EXPECT_FALSE(box.Contains(ImgRectI(-3, -1, 0, 0)));
+    EXPECT_TRUE(box.Contains(ImgRectI(50, 50, 40, 60))); // a null rectangle lies in everything
+    EXPECT_TRUE(ImgRectI().Contains(ImgRectI()));
+    EXPECT_FALSE(ImgRectI().Contains(ImgRectI(0, 0, 1, 1)));
+    EXPECT_FALSE(ImgRectI().Contains(0, 0));
+}
+
+TEST(RectBasics, NormaliseOrdersCorners) {
+    struct Case {
+        ImgRectI in, out;
+    };
+    const Case cases[] = {{{5, 7, 1, 2}, {1, 2, 5, 7}},
+                          {{1, 7, 5, 2}, {1, 2, 5, 7}},
+                          {{5, 2, 1, 7}, {1, 2, 5, 7}},
+                          {{1, 2, 5, 7}, {1, 2, 5, 7}},
+                          {{-3, 4, -3, -4}, {-3, -4, -3, 4}}};
+    for (const Case &c : cases) {
+        ImgRectI r = c.in;
+        r.Normalise();
+        EXPECT_EQ(r, c.out) << Str(c.in);
+    }
+}
+
+TEST(RectSetOps, IntersectionAndUnionMatchPixelSets) {
+    Lcg rng{7};
+    for (int i = 0; i < 4000; ++i) {
+        const ImgRectI a = rng.Rect(), b = rng.Rect();
+        SCOPED_TRACE(testing::Message() << Str(a) << " and " << Str(b));
+        const auto pa = PixelsOf(a), pb = PixelsOf(b);
+
+        // Intersection: exactly the shared pixels; a null result is the zero rectangle.
+        const ImgRectI i1 = a & b;
+        std::set<std::pair<int, int>> shared;
+        for (const auto &p : pa)
+            if (pb.count(p)) shared.insert(p);
+        ASSERT_EQ(PixelsOf(i1), shared);
+        if (shared.empty()) {
+            ASSERT_EQ(i1, ImgRectI());
+        }
+        ASSERT_EQ(b & a, i1);
+        ImgRectI i2 = a;
+        i2 &= b;
+        ASSERT_EQ(i2, i1);
+
+        // Union: the smallest rectangle holding both.
+        const ImgRectI u = a | b;
+        ImgRectI u2 = a;
+        u2 |= b;
+        ASSERT_EQ(u2, u);
+        if (pa.empty() && pb.empty()) {
+            ASSERT_TRUE(u.IsNull());
+            continue;
+        }
+        ASSERT_TRUE(u.Contains(a));
+        ASSERT_TRUE(u.Contains(b));
+        int minX = 1000, minY = 1000, maxX = -1000, maxY = -1000;
+        for (const auto *s : {&pa, &pb})
+            for (const auto &[x, y] : *s) {
+                minX = std::min(minX, x), minY = std::min(minY, y);
+                maxX = std::max(maxX, x), maxY = std::max(maxY, y);
+            }
+        ASSERT_EQ(u, ImgRectI(minX, minY, maxX + 1, maxY + 1));
+    }
+}
+
+TEST(RectSetOps, NamedCases) {
+    struct Case {
+        ImgRectI a, b, both, either;
+    };
+    const Case cases[] = {
+        {{0, 0, 10, 10}, {5, 5, 15, 15}, {5, 5, 10, 10}, {0, 0, 15, 15}},
+        {{0, 0, 10, 10}, {2, 3, 4, 5}, {2, 3, 4, 5}, {0, 0, 10, 10}},
+        {{0, 0, 10, 10}, {10, 0, 20, 10}, {}, {0, 0, 20, 10}},  // touching: no shared pixel
+        {{0, 0, 10, 10}, {20, 20, 30, 30}, {}, {0, 0, 30, 30}}, // disjoint
+        {{0, 0, 10, 10}, {50, 50, 40, 60}, {}, {0, 0, 10, 10}}, // the null one adds nothing
+        {{-E, -E, E, E}, {-3, 4, 8, 9}, {-3, 4, 8, 9}, {-E, -E, E, E}},
+    };
+    for (const Case &c : cases) {
+        SCOPED_TRACE(testing::Message() << Str(c.a) << " and " << Str(c.b));
+        EXPECT_EQ(c.a & c.b, c.both);
+        EXPECT_EQ(c.a | c.b, c.either);
+        EXPECT_EQ(c.b | c.a, c.either);
+    }
+}
+
+TEST(RectMove, ScaleRoundsOutward) {
+    struct Case {
+        ImgRectI in;
+        double sx, sy;
+        ImgRectI out;
+    };
+    const Case cases[] = {
+        {{1, 1, 3, 3}, 0.5, 0.5, {0, 0, 2, 2}},
+        {{-3, -3, 3, 3}, 0.5, 0.5, {-2, -2, 2, 2}},
+        {{2, 4, 6, 8}, 0.5, 0.25, {1, 1, 3, 2}},
+        {{1, 2, 4, 5}, 1.0 / 3.0, 1.0 / 3.0, {0, 0, 2, 2}},
+        {{3, -5, 7, 9}, 2.0, 3.0, {6, -15, 14, 27}},
+        {{-7, -7, -1, -1}, 0.5, 0.5, {-4, -4, 0, 0}},
+        {{0, 0, 1920, 1080}, 0.5, 0.5, {0, 0, 960, 540}},
+        {{0, 0, 1921, 1081}, 0.5, 0.5, {0, 0, 961, 541}},
+        // Endless sides stay where they are, the others scale.
+        {{-E, 3, E, 9}, 0.5, 0.5, {-E, 1, E, 5}},
+        {{5, -E, 11, E}, 2.0, 0.1, {10, -E, 22, E}},
+        {{-E, -E, E, E}, 0.25, 4.0, {-E, -E, E, E}},
+        {{-2 * E, 0, 3, 2 * E}, 0.5, 0.5, {-2 * E, 0, 2, 2 * E}},
+        {{1, 1, 999999, 999999}, 0.5, 0.5, {0, 0, 500000, 500000}},
+    };
+    for (const Case &c : cases) {
+        SCOPED_TRACE(testing::Message() << Str(c.in) << " x " << c.sx << ", " << c.sy);
+        ImgRectI r = c.in;
+        r.Scale(c.sx, c.sy);
+        EXPECT_EQ(r, c.out);
+        ImageDomain d(c.in);
+        d.Scale(c.sx, c.sy);
+        EXPECT_EQ(d.rect, c.out);
+    }
+
+    // Any finite rectangle: the scaled one holds the exact scaled edges, and no
+    // side lies a whole pixel beyond them.
+    Lcg rng{11};
+    for (int i = 0; i < 3000; ++i) {
+        ImgRectI in = rng.Rect();
+        in.Normalise();
+        const double sx = rng.Next(1, 40) / 8.0, sy = rng.Next(1, 40) / 7.0;
+        ImgRectI r = in;
+        r.Scale(sx, sy);
+        SCOPED_TRACE(testing::Message() << Str(in) << " x " << sx << ", " << sy << " gave " << Str(r));
+        ASSERT_LE(r.x0, in.x0 * sx);
+        ASSERT_GT(r.x0, in.x0 * sx - 1);
+        ASSERT_LE(r.y0, in.y0 * sy);
+        ASSERT_GT(r.y0, in.y0 * sy - 1);
+        ASSERT_GE(r.x1, in.x1 * sx);
+        ASSERT_LT(r.x1, in.x1 * sx + 1);
+        ASSERT_GE(r.y1, in.y1 * sy);
+        ASSERT_LT(r.y1, in.y1 * sy + 1);
+    }
+}
+
+TEST(RectMove, OffsetKeepsEndlessSides) {
+    struct Case {
+        ImgRectI in;
+        int dx, dy;
+        ImgRectI out;
+    };
+    const Case cases[] = {
+        {{0, 0, 4, 3}, 5, -2, {5, -2, 9, 1}},        {{-E, 2, 7, E}, 10, 10, {-E, 12, 17, E}},
+        {{-E, -E, E, E}, 123, -456, {-E, -E, E, E}}, {{1, -2 * E, 2 * E, 4}, -1, 1, {0, -2 * E, 2 * E, 5}},
+        {{3, 3, 3, 3}, 1, 1, {4, 4, 4, 4}},
+    };
+    for (const Case &c : cases) {
+        SCOPED_TRACE(testing::Message() << Str(c.in) << " by " << c.dx << ", " << c.dy);
+        ImgRectI r = c.in;
+        r.Offset(c.dx, c.dy);
+        EXPECT_EQ(r, c.out);
+        ImageDomain d(c.in);
+        d.Offset(c.dx, c.dy);
+        EXPECT_EQ(d.rect, c.out);
+    }
+    EXPECT_EQ(ImgRectI(0, 0, 4, 3).Grown(2, 1), ImgRectI(-2, -1, 6, 4));
+    EXPECT_EQ(ImgRectI(0, 0, 4, 3).Grown(-1, -1), ImgRectI(1, 1, 3, 2));
+    EXPECT_TRUE(ImgRectI(0, 0, 4, 3).Grown(-2, 0).IsNull());
+}
+
+TEST(RectDomain, Operations) {
+    const ImageDomain endless = ImageDomain::Endless();
+    EXPECT_EQ(endless.rect, ImgRectI(-E, -E, E, E));
+    EXPECT_TRUE(IsEndlessSide(E));
+    EXPECT_TRUE(IsEndlessSide(-E));
+    EXPECT_TRUE(IsEndlessSide(E + 5));
+    EXPECT_FALSE(IsEndlessSide(E - 1));
+    EXPECT_FALSE(IsEndlessSide(-E + 1));
+    EXPECT_FALSE(endless.IsNull());
+
+    const ImageDomain frame(ImgRectI(0, 0, 640, 480));
+    EXPECT_EQ((endless & frame), frame);
+    EXPECT_EQ((endless | frame), endless);
+    EXPECT_EQ((frame | ImageDomain()), frame);
+    EXPECT_TRUE((frame & ImageDomain(ImgRectI(700, 0, 800, 10))).IsNull());
+
+    ImageDomain d = endless;
+    d &= ImageDomain(ImgRectI(-10, -E, 10, E));
+    EXPECT_EQ(d.rect, ImgRectI(-10, -E, 10, E));
+    d.Scale(2.0, 2.0); // the endless sides stay, the finite ones scale
+    EXPECT_EQ(d.rect, ImgRectI(-20, -E, 20, E));
+    d.Offset(5, 5);
+    EXPECT_EQ(d.rect, ImgRectI(-15, -E, 25, E));
+    d.ClipTo(ImgRectI(0, 0, 100, 50));
+    EXPECT_EQ(d.rect, ImgRectI(0, 0, 25, 50));
+    d.ClipTo(ImgRectI(30, 0, 40, 10));
+    EXPECT_TRUE(d.IsNull());
+    EXPECT_EQ(d, ImageDomain());
+
+    ImageDomain n = frame;
+    n.SetNull();
+    EXPECT_TRUE(n.IsNull());
+    EXPECT_FALSE(frame == endless);
+}
+
+} // namespace
+} // namespace Orvane::recttest
