@@ -73,15 +73,17 @@ DocumentLoadResult LoadDocument(const std::string &text, OrvaneDoc &doc) {
     if (ReadRange(root.Find("RenderRange"), a, b)) doc.SetRenderRange(a, b);
     if (const ScriptVal *prefs = root.Find("Prefs"); prefs && prefs->IsTable()) {
         for (const auto &[key, value] : prefs->Entries()) {
-            bool known = false;
-            for (int id = 0; id < PREF_Count && key.IsText(); ++id)
-                if (key.AsText() == PrefName(static_cast<PrefID>(id)) && value.IsNumber()) {
-                    doc.SetPref(static_cast<PrefID>(id), value.AsNumber());
-                    known = true;
-                }
-            if (!known) {
-                result.error = "Prefs: unknown or malformed preference " + key.ToText();
+            int id = -1;
+            for (int i = 0; i < PREF_Count && key.IsText(); ++i)
+                if (key.AsText() == PrefName(static_cast<PrefID>(i))) id = i;
+            if (id < 0) {
+                warn("unknown preference " + key.ToText() + " is kept as it is");
+                doc.KeptPrefs().Set(key, value);
+            } else if (!value.IsNumber()) {
+                result.error = "Prefs." + key.AsText() + ": expects a number, got " + value.ToText();
                 return result;
+            } else {
+                doc.SetPref(static_cast<PrefID>(id), value.AsNumber());
             }
         }
     }
@@ -113,6 +115,11 @@ DocumentLoadResult LoadDocument(const std::string &text, OrvaneDoc &doc) {
                 return result;
             }
             const std::string &name = key.AsText();
+            if (!IsToolName(name)) {
+                result.error =
+                    "Tools: '" + name + "' is not a tool name (letters, digits and _, not starting with a digit)";
+                return result;
+            }
             const OvID cls(value.ClassName());
             const Registry *row = ClassRegistry ? ClassRegistry->Find(cls) : nullptr;
             Operator *op = row ? doc.AddTool(cls, name) : nullptr;
@@ -181,6 +188,7 @@ std::string SaveDocument(const OrvaneDoc &doc) {
     for (int id = 0; id < PREF_Count; ++id)
         if (doc.PrefIsSet(static_cast<PrefID>(id)))
             prefs.Set(PrefName(static_cast<PrefID>(id)), doc.GetPrefDouble(static_cast<PrefID>(id)));
+    for (const auto &[key, value] : doc.KeptPrefs().Entries()) prefs.Set(key, value);
     if (prefs.Size()) root.Set("Prefs", prefs);
 
     // Known and kept tools together, sorted by name.

@@ -1,5 +1,7 @@
 #include "host/flow/OrvaneDoc.h"
 
+#include <algorithm>
+#include <cctype>
 #include <cstdio>
 #include <vector>
 
@@ -140,8 +142,14 @@ Operator *OrvaneDoc::AddTool(OvID classId, const std::string &name) {
     return op;
 }
 
+bool IsToolName(const std::string &name) {
+    if (name.empty() || !(std::isalpha(static_cast<unsigned char>(name[0])) || name[0] == '_')) return false;
+    return std::all_of(name.begin(), name.end(),
+                       [](char c) { return std::isalnum(static_cast<unsigned char>(c)) || c == '_'; });
+}
+
 bool OrvaneDoc::AddTool(Operator *op, const std::string &name) {
-    if (!op || name.empty() || tools_.count(name)) return false;
+    if (!op || !IsToolName(name) || tools_.count(name) || keptTools_.Find(name)) return false;
     op->SetName(name);
     op->SetDoc(this);
     tools_.emplace(name, Ref<Operator>(op));
@@ -177,9 +185,13 @@ std::vector<Operator *> OrvaneDoc::Tools() const {
 }
 
 std::string OrvaneDoc::UniqueName(const std::string &base) const {
+    std::string stem;
+    for (char c : base)
+        if (std::isalnum(static_cast<unsigned char>(c)) || c == '_') stem += c;
+    if (stem.empty() || std::isdigit(static_cast<unsigned char>(stem[0]))) stem = "Tool" + stem;
     for (int n = 1;; ++n) {
-        std::string candidate = base + std::to_string(n);
-        if (!tools_.count(candidate)) return candidate;
+        std::string candidate = stem + std::to_string(n);
+        if (!tools_.count(candidate) && !keptTools_.Find(candidate)) return candidate;
     }
 }
 

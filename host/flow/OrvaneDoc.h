@@ -57,6 +57,9 @@ struct ConsoleLine {
     std::string text;
 };
 
+/// True for names a tool may have in a document.
+ORVANE_API bool IsToolName(const std::string &name);
+
 class ORVANE_API OrvaneDoc : public RefObject {
 public:
     OrvaneDoc();
@@ -99,13 +102,15 @@ public:
     /// it under `name` (a fresh name from its abbreviation when empty). Null
     /// for an unknown or abstract class or a name in use.
     Operator *AddTool(OvID classId, const std::string &name = {});
-    /// Adds a tool made elsewhere; the document takes a reference.
+    /// Adds a tool made elsewhere; the document takes a reference. Names are
+    /// identifiers (letters, digits, '_', not starting with a digit) so that
+    /// links can name them as Tool.Output.
     bool AddTool(Operator *op, const std::string &name);
     bool RemoveTool(const std::string &name);
     Operator *FindTool(const std::string &name) const;
     /// Tools sorted by name.
     std::vector<Operator *> Tools() const;
-    /// A name not in use, from `base` and a number ("Blur1").
+    /// A name not in use, from `base` (its letters and digits) and a number ("Blur1").
     std::string UniqueName(const std::string &base) const;
 
     /// Tools of classes this program does not know, and top-level entries it
@@ -114,6 +119,8 @@ public:
     ScriptVal &KeptFields() { return keptFields_; }
     const ScriptVal &KeptTools() const { return keptTools_; }
     const ScriptVal &KeptFields() const { return keptFields_; }
+    ScriptVal &KeptPrefs() { return keptPrefs_; }
+    const ScriptVal &KeptPrefs() const { return keptPrefs_; }
 
     /// The result cache shared by this document's renders.
     ResultCache &Cache() { return *cache_; }
@@ -126,7 +133,7 @@ private:
     double globalStart_ = 0, globalEnd_ = 100, renderStart_ = 0, renderEnd_ = 100;
     std::map<std::string, Ref<Operator>> tools_;
     std::unique_ptr<ResultCache> cache_;
-    ScriptVal keptTools_ = ScriptVal::Table(), keptFields_ = ScriptVal::Table();
+    ScriptVal keptTools_ = ScriptVal::Table(), keptFields_ = ScriptVal::Table(), keptPrefs_ = ScriptVal::Table();
 };
 
 } // namespace Orvane

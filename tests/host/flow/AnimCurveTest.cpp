@@ -32,9 +32,9 @@ TEST(AnimCurve, LinearMeetsItsKeysAndStraightLinesBetween) {
         double t, v;
     };
     const Case cases[] = {
-        {0, 1},   {10, 3},  {14, -5}, {20, -5},                 // keys
-        {5, 2},   {2.5, 1.5}, {12, -1}, {13, -3}, {17, -5},     // on the lines
-        {-100, 1}, {-0.001, 1}, {20.001, -5}, {1e9, -5},        // the ends hold
+        {0, 1},    {10, 3},     {14, -5},     {20, -5},            // keys
+        {5, 2},    {2.5, 1.5},  {12, -1},     {13, -3},  {17, -5}, // on the lines
+        {-100, 1}, {-0.001, 1}, {20.001, -5}, {1e9, -5},           // the ends hold
     };
     for (const Case &k : cases) EXPECT_DOUBLE_EQ(At(c, k.t), k.v) << "t = " << k.t;
 }
@@ -104,7 +104,8 @@ TEST(AnimCurve, PointsInterpolatePerComponent) {
         // Each component follows the curve of its own numbers.
         AnimCurve xs = Numbers({{0, 0}, {8, 4}, {10, 5}}, interp), ys = Numbers({{0, 10}, {8, 2}, {10, -2}}, interp);
         for (double t : {0.0, 1.0, 4.0, 7.5, 8.0, 9.0, 12.0}) {
-            auto *p = dynamic_cast<const Point *>(c.ValueAt(t).Get());
+            const Ref<Parameter> v = c.ValueAt(t);
+            auto *p = dynamic_cast<const Point *>(v.Get());
             ASSERT_NE(p, nullptr);
             EXPECT_DOUBLE_EQ(p->x, At(xs, t)) << "t = " << t;
             EXPECT_DOUBLE_EQ(p->y, At(ys, t)) << "t = " << t;
@@ -113,7 +114,8 @@ TEST(AnimCurve, PointsInterpolatePerComponent) {
     AnimCurve linear;
     linear.SetKey(0, MakeRef<Point>(0.0, 10.0));
     linear.SetKey(8, MakeRef<Point>(4.0, 2.0));
-    auto *mid = dynamic_cast<const Point *>(linear.ValueAt(2).Get());
+    const Ref<Parameter> v = linear.ValueAt(2);
+    auto *mid = dynamic_cast<const Point *>(v.Get());
     ASSERT_NE(mid, nullptr);
     EXPECT_DOUBLE_EQ(mid->x, 1.0);
     EXPECT_DOUBLE_EQ(mid->y, 8.0);
@@ -156,8 +158,8 @@ TEST(AnimCurve, TheDocumentFormRoundTrips) {
     // Through text and back, with the values read as numbers.
     const ScriptVal reread = ScriptVal::FromText(form.ToText());
     AnimCurve back;
-    ASSERT_TRUE(AnimCurve::FromScript(reread, [](const ScriptVal &v) { return ParameterFromScript(CLSID_DataType_Number, v); },
-                                      back));
+    ASSERT_TRUE(AnimCurve::FromScript(
+        reread, [](const ScriptVal &v) { return ParameterFromScript(CLSID_DataType_Number, v); }, back));
     ASSERT_EQ(back.Keys().size(), c.Keys().size());
     for (size_t i = 0; i < c.Keys().size(); ++i) {
         EXPECT_EQ(back.Keys()[i].time, c.Keys()[i].time);
@@ -171,20 +173,20 @@ TEST(AnimCurve, TheDocumentFormRoundTrips) {
     points.SetKey(1, MakeRef<Point>(0.25, -3.0), KeyInterp::Smooth);
     points.SetKey(2, MakeRef<Point>(1e6, 0.1));
     AnimCurve pointsBack;
-    ASSERT_TRUE(AnimCurve::FromScript(ScriptVal::FromText(points.ToScript().ToText()),
-                                      [](const ScriptVal &v) { return ParameterFromScript(CLSID_DataType_Point, v); },
-                                      pointsBack));
+    ASSERT_TRUE(AnimCurve::FromScript(
+        ScriptVal::FromText(points.ToScript().ToText()),
+        [](const ScriptVal &v) { return ParameterFromScript(CLSID_DataType_Point, v); }, pointsBack));
     EXPECT_EQ(pointsBack.ToScript(), points.ToScript());
     EXPECT_TRUE(pointsBack.Keys()[0].value->Equals(Point(0.25, -3.0)));
 }
 
 TEST(AnimCurve, MalformedDocumentFormsAreRefused) {
     const char *const texts[] = {
-        "Curve { }",                                // no key
-        "Curve { { 0 } }",                          // a key without value
-        "Curve { { \"a\", 1 } }",                   // a time that is no number
-        "Curve { { 0, \"x\" } }",                   // a value of the wrong type
-        "Curve { { 0, 1, Interp = \"Wobbly\" } }",  // an unknown interpolation
+        "Curve { }",                               // no key
+        "Curve { { 0 } }",                         // a key without value
+        "Curve { { \"a\", 1 } }",                  // a time that is no number
+        "Curve { { 0, \"x\" } }",                  // a value of the wrong type
+        "Curve { { 0, 1, Interp = \"Wobbly\" } }", // an unknown interpolation
         "Curve { { 0, 1, Interp = 3 } }",
         "NotACurve { { 0, 1 } }",
         "{ { 0, 1 } }",
@@ -194,9 +196,9 @@ TEST(AnimCurve, MalformedDocumentFormsAreRefused) {
         SCOPED_TRACE(text);
         AnimCurve out;
         out.SetKey(3, MakeRef<Number>(3.0));
-        EXPECT_FALSE(AnimCurve::FromScript(ScriptVal::FromText(text),
-                                           [](const ScriptVal &v) { return ParameterFromScript(CLSID_DataType_Number, v); },
-                                           out));
+        EXPECT_FALSE(AnimCurve::FromScript(
+            ScriptVal::FromText(text), [](const ScriptVal &v) { return ParameterFromScript(CLSID_DataType_Number, v); },
+            out));
         ASSERT_EQ(out.Keys().size(), 1u) << "a refused form leaves the curve alone";
         EXPECT_EQ(out.Keys()[0].time, 3.0);
     }

@@ -250,12 +250,9 @@ template <class T> Object *Make(const Registry *reg, const ScriptVal &args, cons
 }
 
 OvID Register(const char *id, ClassFactory make, std::initializer_list<TagItem> attrs) {
-    TagList tags{{RegConstructor, make},
-                 {RegTypeFlags, static_cast<long long>(RegKindOperator | RegKindTool)},
-                 {RegNoBlendControls, 1},
-                 {RegNoEffectMask, 1},
-                 {RegSupportsRoI, 1},
-                 {RegSupportsDoD, 1}};
+    TagList tags{{RegConstructor, make},  {RegTypeFlags, static_cast<long long>(RegKindOperator | RegKindTool)},
+                 {RegNoBlendControls, 1}, {RegNoEffectMask, 1},
+                 {RegSupportsRoI, 1},     {RegSupportsDoD, 1}};
     for (const TagItem &a : attrs) tags.Set(a);
     Registry::_Init(&ClassRegistry, OvID(id), tags);
     return OvID(id);

@@ -44,10 +44,10 @@ public:
         if (req->IsPreCalc()) {
             const ImgRectI dw = result->DataWindow();
             const FltPixel canvas = result->GetCanvasColor();
-            req->SetOutputData(output, NewImageTagList({{ImgLikeImage, result.Get()},
-                                                        {ImgDataWindow, &dw},
-                                                        {ImgNoData, 1},
-                                                        {ImgCanvasColor, &canvas}}));
+            req->SetOutputData(
+                output,
+                NewImageTagList(
+                    {{ImgLikeImage, result.Get()}, {ImgDataWindow, &dw}, {ImgNoData, 1}, {ImgCanvasColor, &canvas}}));
             return;
         }
         req->SetOutputData(output, result);
@@ -84,8 +84,8 @@ const Classes &C() {
     return classes;
 }
 
-const char *const CommonIDs[] = {"Blend",      "ProcessRed",        "ProcessGreen",     "ProcessBlue",
-                                 "ProcessAlpha", "EffectMask",      "EffectMaskChannel", "EffectMaskInvert",
+const char *const CommonIDs[] = {"Blend",          "ProcessRed",  "ProcessGreen",      "ProcessBlue",
+                                 "ProcessAlpha",   "EffectMask",  "EffectMaskChannel", "EffectMaskInvert",
                                  "MultiplyByMask", "ClippingMode"};
 enum { HasBlend = 1, HasMask = 2, HasClipping = 4 };
 
@@ -142,8 +142,8 @@ TEST(CommonControls, ExistAsTheClassAsksFor) {
 /// An RGBA float image of the pattern over `dw` with a canvas colour.
 Ref<Image> Windowed(const ImgRectI &dw, FltPixel canvas, unsigned seed, int depth = 8) {
     Ref<Image> pattern = ts::PatternImage(dw.Width(), dw.Height(), 8, seed);
-    Ref<Image> img =
-        NewImageTagList({{ImgWidth, 16}, {ImgHeight, 12}, {ImgDepth, depth}, {ImgDataWindow, &dw}, {ImgCanvasColor, &canvas}});
+    Ref<Image> img = NewImageTagList(
+        {{ImgWidth, 16}, {ImgHeight, 12}, {ImgDepth, depth}, {ImgDataWindow, &dw}, {ImgCanvasColor, &canvas}});
     img->AllocScanLineData();
     for (int y = dw.y0; y < dw.y1; ++y)
         for (int x = dw.x0; x < dw.x1; ++x) img->PutFlt(x, y, pattern->GetFlt(x - dw.x0, y - dw.y0));
@@ -196,9 +196,12 @@ FltPixel Mixed(const MixCase &c, const FltPixel &in, const FltPixel &res, const 
     const double i[4] = {in.R, in.G, in.B, in.A}, r[4] = {res.R, res.G, res.B, res.A};
     double o[4];
     for (int ch = 0; ch < 4; ++ch) {
-        if (!c.process[ch]) o[ch] = i[ch];
-        else if (c.multiply) o[ch] = i[ch] + (r[ch] * m - i[ch]) * c.blend;
-        else o[ch] = i[ch] + (r[ch] - i[ch]) * c.blend * m;
+        if (!c.process[ch])
+            o[ch] = i[ch];
+        else if (c.multiply)
+            o[ch] = i[ch] + (r[ch] * m - i[ch]) * c.blend;
+        else
+            o[ch] = i[ch] + (r[ch] - i[ch]) * c.blend * m;
     }
     return {static_cast<float>(o[0]), static_cast<float>(o[1]), static_cast<float>(o[2]), static_cast<float>(o[3])};
 }
@@ -377,7 +380,8 @@ TEST(CommonControls, APassedThroughInputIsLeftAlone) {
     auto *tool = dynamic_cast<FixedTool *>(doc->AddTool(C().plain, "Pass1"));
     ASSERT_NE(tool, nullptr);
     ASSERT_TRUE(tool->input->ConnectTo(ts::AddImageSource(*doc, "Src", src)->Out()));
-    ASSERT_TRUE(tool->Common().effectMask->ConnectTo(ts::AddImageSource(*doc, "MaskSrc", ts::PatternImage(16, 12))->Out()));
+    ASSERT_TRUE(
+        tool->Common().effectMask->ConnectTo(ts::AddImageSource(*doc, "MaskSrc", ts::PatternImage(16, 12))->Out()));
     ts::SetNumber(tool, "Blend", 0.25);
     ts::SetNumber(tool, "ProcessGreen", 0);
     Ref<Image> out = ts::EvalImage(tool);

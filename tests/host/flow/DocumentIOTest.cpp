@@ -39,7 +39,8 @@ public:
         AddInputTagList("Caption", "Caption", {{LinkDataType, CLSID_DataType_Text}});
         AddInputTagList("Mode", "Mode", {{LinkDataType, CLSID_DataType_OvID}, {InputDefaultId, OvID("ModeA")}});
         AddInputTagList("Colors", "Colors", {{LinkDataType, CLSID_DataType_Gradient}});
-        AddInputTagList("Width", "Width", {{LinkDataType, CLSID_DataType_Number}, {InputDefault, 100.0}, {LinkForceSave, 1}});
+        AddInputTagList("Width", "Width",
+                        {{LinkDataType, CLSID_DataType_Number}, {InputDefault, 100.0}, {LinkForceSave, 1}});
         AddInputTagList("Histo", "Histo", {{LinkDataType, CLSID_DataType_Number}, {LinkNotSaved, 1}});
         AddInputTagList("Input", "Input", {{LinkDataType, CLSID_DataType_Image}, {LinkMain, 1}, {InputRequired, 0}});
         output = AddOutputTagList("Output", "Output", {{LinkDataType, CLSID_DataType_Image}, {LinkMain, 1}});
@@ -143,7 +144,8 @@ TEST(DocumentIO, SaveLoadSaveGivesTheSameBytes) {
              Operator *t = AddDocTool(doc, "Const1");
              ts::SetNumber(t, "Size", 1.0 / 3.0);
              ts::SetPoint(t, "Center", 0.1 + 0.2, -1e-300);
-             ASSERT_TRUE(t->FindInput("Caption")->SetValue(MakeRef<Text>("tab\there \"quoted\"\nnext line \\ caf\xc3\xa9")));
+             ASSERT_TRUE(
+                 t->FindInput("Caption")->SetValue(MakeRef<Text>("tab\there \"quoted\"\nnext line \\ caf\xc3\xa9")));
              ts::SetID(t, "Mode", "ModeC");
              ts::SetNumber(t, "Width", -0.0);
              Operator *u = AddDocTool(doc, "Const2");
@@ -155,8 +157,11 @@ TEST(DocumentIO, SaveLoadSaveGivesTheSameBytes) {
              Operator *t = AddDocTool(doc, "Grad1");
              ASSERT_TRUE(t->FindInput("Colors")->SetValue(TwoStops()));
              Operator *u = AddDocTool(doc, "Grad2");
-             ASSERT_TRUE(u->FindInput("Colors")->SetValue(MakeRef<Gradient>(std::vector<GradientStop>{
-                 {0.0, 0.f, 0.f, 0.f, 1.f}, {0.5, 1.f, 0.f, 0.f, 1.f}, {0.5, 0.f, 0.f, 1.f, 0.25f}, {1.0, 1.f, 1.f, 1.f, 1.f}})));
+             ASSERT_TRUE(u->FindInput("Colors")->SetValue(
+                 MakeRef<Gradient>(std::vector<GradientStop>{{0.0, 0.f, 0.f, 0.f, 1.f},
+                                                             {0.5, 1.f, 0.f, 0.f, 1.f},
+                                                             {0.5, 0.f, 0.f, 1.f, 0.25f},
+                                                             {1.0, 1.f, 1.f, 1.f, 1.f}})));
          }},
         {"curves",
          [](OrvaneDoc &doc) {
@@ -272,7 +277,8 @@ return Orvane.Document{
     EXPECT_TRUE(r.warnings.empty()) << Joined(r.warnings);
     const std::string canonical = SaveDocument(*doc);
     const ScriptVal root = ScriptVal::FromText(canonical);
-    EXPECT_EQ(Keys(&root), (std::vector<std::string>{"Version", "Program", "GlobalRange", "RenderRange", "Prefs", "Tools"}));
+    EXPECT_EQ(Keys(&root),
+              (std::vector<std::string>{"Version", "Program", "GlobalRange", "RenderRange", "Prefs", "Tools"}));
     EXPECT_EQ(Keys(root.Find("Tools")), (std::vector<std::string>{"Alpha", "Mid", "Zed"}));
     EXPECT_EQ(InputKeys(canonical, "Zed"), (std::vector<std::string>{"Size", "Width", "Input"}));
     EXPECT_EQ(InputKeys(canonical, "Alpha"), (std::vector<std::string>{"Size", "Center", "Mode", "Width"}));
@@ -464,6 +470,40 @@ TEST(DocumentIO, AnUnknownDocumentEntryIsKept) {
     EXPECT_EQ(SaveDocument(*again), saved);
 }
 
+TEST(DocumentIO, AnUnknownPreferenceIsKeptAndAKnownOneIsApplied) {
+    const std::string text = R"(Orvane.Document {
+	Prefs = { FrameWidth = 1280, FuturePref = { Mode = "fast" } },
+	Tools = { T1 = DocIOTestTool { } },
+}
+)";
+    Ref<OrvaneDoc> doc = MakeRef<OrvaneDoc>();
+    const DocumentLoadResult r = Load(text, *doc);
+    ASSERT_TRUE(r.ok) << r.error;
+    ASSERT_EQ(r.warnings.size(), 1u) << Joined(r.warnings);
+    EXPECT_NE(r.warnings[0].find("FuturePref"), std::string::npos) << r.warnings[0];
+    EXPECT_EQ(doc->GetPrefLong(PREF_FFWidth), 1280);
+    const ScriptVal saved = ScriptVal::FromText(SaveDocument(*doc));
+    const ScriptVal prefs = Get(&saved, "Prefs");
+    ASSERT_NE(prefs.Find("FuturePref"), nullptr);
+    EXPECT_EQ(prefs.Find("FuturePref")->ToText(), "{ Mode = \"fast\" }");
+    EXPECT_EQ(prefs.Find("FrameWidth")->AsNumber(), 1280);
+}
+
+TEST(DocumentIO, ToolNamesMustBeIdentifiersSoLinksCanNameThem) {
+    Ref<OrvaneDoc> doc = MakeRef<OrvaneDoc>();
+    for (const char *bad : {"My Tool", "1Blur", "A.B", "", "x-y"}) {
+        SCOPED_TRACE(bad);
+        EXPECT_FALSE(IsToolName(bad));
+        const std::string text = std::string("Orvane.Document { Tools = { [\"") + bad + "\"] = DocIOTestTool {} } }";
+        const DocumentLoadResult r = Load(text, *doc);
+        EXPECT_FALSE(r.ok);
+    }
+    for (const char *good : {"Blur1", "_tmp", "A_b9"}) EXPECT_TRUE(IsToolName(good)) << good;
+    // Fresh names keep only letters and digits of what they are made from.
+    EXPECT_EQ(doc->UniqueName("Brightness / Contrast"), "BrightnessContrast1");
+    EXPECT_EQ(doc->UniqueName("3D"), "Tool3D1");
+}
+
 TEST(DocumentIO, APlannedToolKeepsItsSettingsWithOneWarning) {
     ts::LoadOperators();
     const std::string text = R"(Orvane.Document {
@@ -551,9 +591,11 @@ TEST(DocumentIO, SyntaxErrorsGiveLineAndColumn) {
         std::string marker; ///< where the error lies
     };
     const Case cases[] = {
-        {"a stray character", "Orvane.Document {\n\tTools = {\n\t\tA = DocIOTestTool { Inputs = { Size = @ } },\n\t},\n}\n", "@"},
+        {"a stray character",
+         "Orvane.Document {\n\tTools = {\n\t\tA = DocIOTestTool { Inputs = { Size = @ } },\n\t},\n}\n", "@"},
         {"a missing separator", "Orvane.Document {\n\tVersion = 1\n\tGlobalRange = { 0, 10 },\n}\n", "GlobalRange"},
-        {"a key without value", "Orvane.Document {\n\tTools = {\n\t\tA = DocIOTestTool { Inputs = { Size = } },\n\t},\n}\n", "} },"},
+        {"a key without value",
+         "Orvane.Document {\n\tTools = {\n\t\tA = DocIOTestTool { Inputs = { Size = } },\n\t},\n}\n", "} },"},
         {"a minus without number", "Orvane.Document { GlobalRange = { -x, 10 } }", "-x"},
     };
     for (const Case &c : cases) {
@@ -620,8 +662,7 @@ TEST(DocumentIO, BadContentFailsWithOneClearMessage) {
 struct TempDir {
     std::filesystem::path path;
     explicit TempDir(const std::string &name) {
-        path = std::filesystem::temp_directory_path() /
-               ("orvane-doctest-" + name + "-" + std::to_string(getpid()));
+        path = std::filesystem::temp_directory_path() / ("orvane-doctest-" + name + "-" + std::to_string(getpid()));
         std::filesystem::remove_all(path);
         std::filesystem::create_directories(path);
     }

@@ -51,14 +51,15 @@ struct Seen {
 class Probe : public ThreadedOperator {
 public:
     Probe(const Registry *reg, const ScriptVal &args, const TagList &tags) : ThreadedOperator(reg, args, tags) {
-        last = AddInputTagList("Last", "Last",
-                               {{LinkDataType, CLSID_DataType_Number}, {InputPriority, PriorityLast}, {InputDefault, 2.0}});
+        last = AddInputTagList(
+            "Last", "Last",
+            {{LinkDataType, CLSID_DataType_Number}, {InputPriority, PriorityLast}, {InputDefault, 2.0}});
         input = AddInputTagList("Input", "Input", {{LinkDataType, CLSID_DataType_Image}, {LinkMain, 1}});
         amount = AddInputTagList("Amount", "Amount", {{LinkDataType, CLSID_DataType_Number}, {InputDefault, 0.5}});
         late = AddInputTagList("Late", "Late",
                                {{LinkDataType, CLSID_DataType_Image}, {InputPriority, 5}, {InputRequired, 0}});
-        matte = AddInputTagList("Matte", "Matte",
-                                {{LinkDataType, CLSID_DataType_Mask}, {InputPriority, PriorityMask}, {InputRequired, 0}});
+        matte = AddInputTagList(
+            "Matte", "Matte", {{LinkDataType, CLSID_DataType_Mask}, {InputPriority, PriorityMask}, {InputRequired, 0}});
         output = AddOutputTagList("Output", "Output", {{LinkDataType, CLSID_DataType_Image}, {LinkMain, 1}});
         watched = {last, input, amount, late, matte};
     }
@@ -170,7 +171,8 @@ public:
     void Process(Request *req) override {
         if (req->IsPreCalc()) {
             const ImgRectI dw = image->DataWindow();
-            req->SetOutputData(output, NewImageTagList({{ImgLikeImage, image.Get()}, {ImgDataWindow, &dw}, {ImgNoData, 1}}));
+            req->SetOutputData(output,
+                               NewImageTagList({{ImgLikeImage, image.Get()}, {ImgDataWindow, &dw}, {ImgNoData, 1}}));
             return;
         }
         rois.push_back(req->RoI());
@@ -186,9 +188,8 @@ template <class T> Object *Make(const Registry *reg, const ScriptVal &args, cons
 }
 
 OvID Register(const char *id, ClassFactory make, std::initializer_list<TagItem> attrs) {
-    TagList tags{{RegConstructor, make},
-                 {RegTypeFlags, static_cast<long long>(RegKindOperator | RegKindTool)},
-                 {RegName, id}};
+    TagList tags{
+        {RegConstructor, make}, {RegTypeFlags, static_cast<long long>(RegKindOperator | RegKindTool)}, {RegName, id}};
     for (const TagItem &a : attrs) tags.Set(a);
     Registry::_Init(&ClassRegistry, OvID(id), tags);
     return OvID(id);
@@ -221,7 +222,8 @@ Probe *AddProbe(OrvaneDoc &doc, const std::string &name, OvID cls = OvID()) {
 /// An RGBA float image whose data window lies inside its frame, with a canvas.
 Ref<Image> Windowed(int w, int h, const ImgRectI &dw, FltPixel canvas, unsigned seed = 3) {
     Ref<Image> full = ts::PatternImage(dw.Width(), dw.Height(), 8, seed);
-    Ref<Image> img = NewImageTagList({{ImgWidth, w}, {ImgHeight, h}, {ImgDepth, 8}, {ImgDataWindow, &dw}, {ImgCanvasColor, &canvas}});
+    Ref<Image> img = NewImageTagList(
+        {{ImgWidth, w}, {ImgHeight, h}, {ImgDepth, 8}, {ImgDataWindow, &dw}, {ImgCanvasColor, &canvas}});
     img->AllocScanLineData();
     for (int y = dw.y0; y < dw.y1; ++y)
         for (int x = dw.x0; x < dw.x1; ++x) img->PutFlt(x, y, full->GetFlt(x - dw.x0, y - dw.y0));
@@ -307,8 +309,8 @@ TEST(Engine, ConstantsArriveWithTheirValuesBeforeHigherLevels) {
 TEST(Engine, SettingInputDataToNullStopsTheFetch) {
     struct Case {
         const char *name;
-        int level;          ///< the CheckRequest level that drops it
-        Watched dropped;    ///< the input dropped
+        int level;       ///< the CheckRequest level that drops it
+        Watched dropped; ///< the input dropped
     };
     const Case cases[] = {
         {"image at its own level", PriorityImage, WInput},
@@ -447,7 +449,8 @@ TEST(Engine, EveryPixelRequestFollowsAPreCalculation) {
             auto *src = dynamic_cast<Image *>(req->GetInputData(p.input));
             ImgRectI dw = own;
             if (const AutoImageRoI roi(req); roi) dw &= roi->rect;
-            Ref<Image> img = NewImageTagList({{ImgLikeImage, src}, {ImgDataWindow, &dw}, {ImgNoData, req->IsPreCalc()}});
+            Ref<Image> img =
+                NewImageTagList({{ImgLikeImage, src}, {ImgDataWindow, &dw}, {ImgNoData, req->IsPreCalc()}});
             if (!req->IsPreCalc()) img->Fill({1, 1, 1, 1});
             req->SetOutputData(p.output, img.Get());
         };
@@ -597,9 +600,11 @@ TEST(Engine, RunningOutOfMemoryGivesTheOutOfMemoryLine) {
         p->onProcess = [&](Probe &self, Request *req) {
             if (req->IsPreCalc()) return self.MakeOutput(req);
             if (!c.inChunk) throw std::bad_alloc();
-            self.DoMultiProcess([](int i) {
-                if (i == 3) throw std::bad_alloc();
-            }, 8);
+            self.DoMultiProcess(
+                [](int i) {
+                    if (i == 3) throw std::bad_alloc();
+                },
+                8);
             self.MakeOutput(req);
         };
         EXPECT_FALSE(Eval(c.downstream ? down : p, 3.0));

@@ -61,8 +61,7 @@ public:
                         {{LinkDataType, CLSID_DataType_Number}, {InputExternal, 0}, {InputDefault, 4.0}});
         AddInputTagList("Notified", "Notified",
                         {{LinkDataType, CLSID_DataType_Number}, {InputNotify, 1}, {InputDefault, 1.0}});
-        AddInputTagList("Input", "Input",
-                        {{LinkDataType, CLSID_DataType_Image}, {LinkMain, 1}, {InputRequired, 0}});
+        AddInputTagList("Input", "Input", {{LinkDataType, CLSID_DataType_Image}, {LinkMain, 1}, {InputRequired, 0}});
         AddOutputTagList("Output", "Output", {{LinkDataType, CLSID_DataType_Image}, {LinkMain, 1}});
         value = AddOutputTagList("Value", "Value", {{LinkDataType, CLSID_DataType_Number}});
     }
@@ -118,13 +117,13 @@ TEST(Input, HardLimitsClampValuesAndSliderLimitsDoNot) {
         double set, stored;
     };
     const Case cases[] = {
-        {"Hard", 4.5, 4.5},      {"Hard", 7.0, 7.0},   // beyond the slider, within the hard limits
-        {"Hard", 11.0, 10.0},    {"Hard", -1.5, -1.0}, // beyond the hard limits
-        {"Hard", -1.0, -1.0},    {"Hard", 10.0, 10.0}, // at them
-        {"Slider", 3.5, 3.5},    {"Slider", -2.0, -2.0},
-        {"Count", 2.4, 2.0},     {"Count", 2.6, 3.0},  // rounded
-        {"Count", -1.4, -1.0},   {"Count", -2.6, -3.0},
-        {"Count", 8.7, 8.0},     {"Count", -9.0, -3.0}, // rounded, then limited
+        {"Hard", 4.5, 4.5},    {"Hard", 7.0, 7.0},   // beyond the slider, within the hard limits
+        {"Hard", 11.0, 10.0},  {"Hard", -1.5, -1.0}, // beyond the hard limits
+        {"Hard", -1.0, -1.0},  {"Hard", 10.0, 10.0}, // at them
+        {"Slider", 3.5, 3.5},  {"Slider", -2.0, -2.0},
+        {"Count", 2.4, 2.0},   {"Count", 2.6, 3.0}, // rounded
+        {"Count", -1.4, -1.0}, {"Count", -2.6, -3.0},
+        {"Count", 8.7, 8.0},   {"Count", -9.0, -3.0}, // rounded, then limited
     };
     Knobs k;
     KnobsTool *t = k.Add("K1");
@@ -265,7 +264,8 @@ TEST(Input, ConnectToChecksTypesAndRefusesLoops) {
         EXPECT_EQ(t.in->Link(), t.ok ? t.out : before);
     }
     // Consumers follow the links.
-    EXPECT_EQ(a->FindOutput("Output")->Consumers(), (std::vector<Input *>{b->FindInput("Input"), c->FindInput("Input")}));
+    EXPECT_EQ(a->FindOutput("Output")->Consumers(),
+              (std::vector<Input *>{b->FindInput("Input"), c->FindInput("Input")}));
     EXPECT_TRUE(b->FindOutput("Output")->Consumers().empty()) << "C's Input moved on to A";
 }
 
