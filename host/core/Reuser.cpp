@@ -9,8 +9,14 @@ namespace Orvane {
 namespace {
 
 constexpr std::size_t Granule = 16;
+#if defined(__SANITIZE_ADDRESS__)
+// Under AddressSanitizer every block goes back to the heap at once, so a use
+// after release is reported instead of hidden by reuse.
+constexpr std::size_t MaxPooled = 0;
+#else
 constexpr std::size_t MaxPooled = 2048; // larger blocks go straight to the heap
-constexpr std::size_t ClassCount = MaxPooled / Granule;
+#endif
+constexpr std::size_t ClassCount = MaxPooled / Granule + 1;
 constexpr std::size_t MaxKeptPerClass = 4096;
 
 struct SizeClass {

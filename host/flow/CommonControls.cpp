@@ -28,12 +28,6 @@ constexpr const char *CommonPageName = "Common Controls";
 
 enum MaskChannel { MaskAlpha, MaskRed, MaskGreen, MaskBlue, MaskLuminance };
 
-double NumberOf(const Request *req, const Input *in, double def) {
-    if (!in) return def;
-    auto *n = dynamic_cast<const Number *>(req->GetInputData(in));
-    return n ? n->value : def;
-}
-
 float MaskValue(const FltPixel &p, int channel, bool invert) {
     float m;
     switch (channel) {
@@ -150,15 +144,15 @@ void Operator::PostProcess(Request *req) {
     if (!result) return;
 
     Mix mix;
-    mix.blend = static_cast<float>(NumberOf(req, common_.blend, 1.0));
+    mix.blend = static_cast<float>(req->GetInputNumber(common_.blend, 1.0));
     bool allChannels = true;
     for (int c = 0; c < 4; ++c) {
-        mix.process[c] = NumberOf(req, common_.process[c], 1.0) >= 0.5;
+        mix.process[c] = req->GetInputNumber(common_.process[c], 1.0) >= 0.5;
         allChannels = allChannels && mix.process[c];
     }
-    mix.multiply = NumberOf(req, common_.multiplyByMask, 0.0) >= 0.5;
-    mix.channel = static_cast<int>(NumberOf(req, common_.maskChannel, 0.0) + 0.5);
-    mix.invert = NumberOf(req, common_.maskInvert, 0.0) >= 0.5;
+    mix.multiply = req->GetInputNumber(common_.multiplyByMask, 0.0) >= 0.5;
+    mix.channel = static_cast<int>(req->GetInputNumber(common_.maskChannel, 0.0) + 0.5);
+    mix.invert = req->GetInputNumber(common_.maskInvert, 0.0) >= 0.5;
     const Image *mask =
         common_.effectMask ? dynamic_cast<const Image *>(req->GetInputData(common_.effectMask)) : nullptr;
     if (mix.blend == 1.f && allChannels && !mask) return;

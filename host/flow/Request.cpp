@@ -29,6 +29,20 @@ Parameter *Request::GetInputData(const Input *in, int) const {
     return SlotOf(in).data.Get();
 }
 
+double Request::GetInputNumber(const Input *in, double fallback) const {
+    if (!in) return fallback;
+    if (const auto *n = dynamic_cast<const Number *>(GetInputData(in))) return n->value;
+    const auto *def = dynamic_cast<const Number *>(in->Default().Get());
+    return def ? def->value : fallback;
+}
+
+OvID Request::GetInputID(const Input *in, OvID fallback) const {
+    if (!in) return fallback;
+    if (const auto *v = dynamic_cast<const IDValue *>(GetInputData(in))) return v->value;
+    const auto *def = dynamic_cast<const IDValue *>(in->Default().Get());
+    return def ? def->value : fallback;
+}
+
 void Request::SetInputData(Input *in, Parameter *value, int) {
     if (!in || in->Owner() != op_) return;
     Slot &s = SlotOf(in);

@@ -67,6 +67,11 @@ public:
     /// The value fetched for `in`; null when absent (optional input, skipped,
     /// or not fetched yet). The request keeps the reference.
     Parameter *GetInputData(const Input *in, int index = 0) const;
+    /// The number an input holds for this request: its fetched value, else
+    /// its default, else `fallback` (also for a null input).
+    double GetInputNumber(const Input *in, double fallback = 0.0) const;
+    /// The same for an ID-valued input.
+    OvID GetInputID(const Input *in, OvID fallback = OvID()) const;
     /// Gives an input a value instead of fetching it; null: do not fetch it.
     void SetInputData(Input *in, Parameter *value, int index = 0);
     /// Forgets a value set with SetInputData, so the input is fetched again.

@@ -7,16 +7,6 @@
 #include "host/flow/Request.h"
 
 namespace Orvane {
-namespace {
-
-double NumberIn(const Request *req, const Input *in, double def) {
-    if (!in) return def;
-    auto *n = dynamic_cast<const Number *>(req->GetInputData(in));
-    return n ? n->value : def;
-}
-
-} // namespace
-
 SourceOperator::SourceOperator(const Registry *reg, const ScriptVal &args, const TagList &tags)
     : ThreadedOperator(reg, args, tags) {}
 
@@ -94,8 +84,8 @@ void SourceOperator::FinishConstruction() {
 SourceFrame SourceOperator::GetSourceFrame(Request *req) const {
     const FrameFormat ff = GetDoc() ? GetDoc()->GetFrameFormat() : FrameFormat();
     SourceFrame f;
-    f.width = static_cast<int>(NumberIn(req, inWidth_, ff.width));
-    f.height = static_cast<int>(NumberIn(req, inHeight_, ff.height));
+    f.width = static_cast<int>(req->GetInputNumber(inWidth_, ff.width));
+    f.height = static_cast<int>(req->GetInputNumber(inHeight_, ff.height));
     if (const auto *p = inAspect_ ? dynamic_cast<const Point *>(req->GetInputData(inAspect_)) : nullptr) {
         f.aspectX = p->x;
         f.aspectY = p->y;
@@ -104,7 +94,7 @@ SourceFrame SourceOperator::GetSourceFrame(Request *req) const {
         f.aspectY = ff.aspectY;
     }
     // The Depth list is Default, int8, int16, float16, float32: RGBA depths 5..8.
-    const int choice = static_cast<int>(NumberIn(req, inDepth_, 0.0));
+    const int choice = static_cast<int>(req->GetInputNumber(inDepth_, 0.0));
     f.depth = choice > 0 ? 4 + choice : 0;
     f.proxyScale = req->ProxyScale();
     f.field = req->Field() >= 0;

@@ -282,12 +282,6 @@ FltPixel ChainOfColor(const Values &v, bool fastPower, const FltPixel &px) {
     return {p[0], p[1], p[2], p[3]};
 }
 
-double NumberOf(const Request *req, const Input *in) {
-    if (const auto *n = dynamic_cast<const Number *>(req->GetInputData(in))) return n->value;
-    const auto *def = dynamic_cast<const Number *>(in->Default().Get());
-    return def ? def->value : 0.0;
-}
-
 } // namespace
 
 BrightnessContrast::BrightnessContrast(const Registry *reg, const ScriptVal &args, const TagList &tags)
@@ -428,12 +422,14 @@ BrightnessContrast::~BrightnessContrast() = default;
 
 void BrightnessContrast::ReadValues(Request *req) {
     Values v;
-    v.reverse = NumberOf(req, direction_) >= 0.5;
+    v.reverse = req->GetInputNumber(direction_) >= 0.5;
     const Input *chanInputs[4] = {red_, green_, blue_, alpha_};
-    for (int c = 0; c < 4; ++c) v.chans[c] = NumberOf(req, chanInputs[c]) >= 0.5;
-    const double gain = NumberOf(req, gain_), lift = NumberOf(req, lift_), gamma = NumberOf(req, gamma_);
-    const double contrast = NumberOf(req, contrast_), bright = NumberOf(req, brightness_);
-    const double sat = NumberOf(req, saturation_), low = NumberOf(req, low_), high = NumberOf(req, high_);
+    for (int c = 0; c < 4; ++c) v.chans[c] = req->GetInputNumber(chanInputs[c]) >= 0.5;
+    const double gain = req->GetInputNumber(gain_), lift = req->GetInputNumber(lift_),
+                 gamma = req->GetInputNumber(gamma_);
+    const double contrast = req->GetInputNumber(contrast_), bright = req->GetInputNumber(brightness_);
+    const double sat = req->GetInputNumber(saturation_), low = req->GetInputNumber(low_),
+                 high = req->GetInputNumber(high_);
 
     v.doGain = !Near(gain, 1.0) || !Near(lift, 0.0);
     v.doGamma = !Near(gamma, 1.0);
@@ -460,9 +456,9 @@ void BrightnessContrast::ReadValues(Request *req) {
         v.finalContrast = v.contrast == 0.f ? 1.f : 1.f / v.contrast;
         v.finalScale = v.range;
     }
-    v.clipBlack = NumberOf(req, clipBlack_) >= 0.5;
-    v.clipWhite = NumberOf(req, clipWhite_) >= 0.5;
-    v.prePost = NumberOf(req, prePost_) >= 0.5;
+    v.clipBlack = req->GetInputNumber(clipBlack_) >= 0.5;
+    v.clipWhite = req->GetInputNumber(clipWhite_) >= 0.5;
+    v.prePost = req->GetInputNumber(prePost_) >= 0.5;
     v.lift = static_cast<float>(lift);
     v.bright = static_cast<float>(bright);
     v.low = static_cast<float>(low);

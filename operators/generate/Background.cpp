@@ -128,13 +128,7 @@ template <size_t N> int ChoiceIndex(OvID id, const Choice (&list)[N]) {
 }
 
 template <size_t N> int ChoiceAt(const Request *req, const Input *in, const Choice (&list)[N]) {
-    const auto *v = dynamic_cast<const IDValue *>(req->GetInputData(in));
-    return v ? ChoiceIndex(v->value, list) : 0;
-}
-
-double NumberAt(const Request *req, const Input *in, double def = 0.0) {
-    const auto *n = dynamic_cast<const Number *>(req->GetInputData(in));
-    return n ? n->value : def;
+    return ChoiceIndex(req->GetInputID(in), list);
 }
 
 uint16_t UnitToU16(float v) {
@@ -325,7 +319,7 @@ void Background::Process(Request *req) {
     mode_ = ChoiceAt(req, inType_, kTypes);
     auto readColor = [&](int corner) {
         for (int ch = 0; ch < 4; ++ch)
-            color_[corner][ch] = static_cast<float>(NumberAt(req, inColor_[corner][ch], kChannels[ch].def));
+            color_[corner][ch] = static_cast<float>(req->GetInputNumber(inColor_[corner][ch], kChannels[ch].def));
     };
     auto copyColor = [&](int to, int from) { std::copy_n(color_[from], 4, color_[to]); };
     readColor(TopLeft);
@@ -348,7 +342,7 @@ void Background::Process(Request *req) {
         colorSpace_ = static_cast<int>(kSpaceTypes[ChoiceAt(req, inInterpolation_, kSpaces)]);
         gradientType_ = ChoiceAt(req, inGradientType_, kGradientTypes);
         repeat_ = ChoiceAt(req, inRepeat_, kRepeats);
-        offset_ = static_cast<float>(NumberAt(req, inOffset_));
+        offset_ = static_cast<float>(req->GetInputNumber(inOffset_));
         const auto *start = dynamic_cast<const Point *>(req->GetInputData(inStart_));
         const auto *end = dynamic_cast<const Point *>(req->GetInputData(inEnd_));
         start_[0] = static_cast<float>(start ? start->x : 0.0);
