@@ -493,12 +493,15 @@ void Background::RampRow(int y, uint8_t *row) const {
     if (!image_->IsFloat() && !outOfRange_) {
         // Fixed point: each end scaled so that 1.0 is 65535 << 15, then one
         // truncated step per column; half a unit of the result rounds.
-        int32_t value[4], step[4];
+        // The running values are unsigned: the step after the last column may
+        // pass 2^31, which must wrap rather than overflow.
+        uint32_t value[4], step[4];
         for (int ch = 0; ch < 4; ++ch) {
             const auto a = static_cast<int32_t>(static_cast<double>(left[ch]) * kFixedOne + 0.5);
             const auto b = static_cast<int32_t>(static_cast<double>(right[ch]) * kFixedOne + 0.5);
-            step[ch] = width_ > 1 ? (b - a) / (width_ - 1) : 0;
-            value[ch] = static_cast<int32_t>(a + kFixedHalf + static_cast<int64_t>(x0) * step[ch]);
+            const int32_t signedStep = width_ > 1 ? (b - a) / (width_ - 1) : 0;
+            step[ch] = static_cast<uint32_t>(signedStep);
+            value[ch] = static_cast<uint32_t>(a + kFixedHalf + static_cast<int64_t>(x0) * signedStep);
         }
         StoreRow<Pixel>(*image_, row, count, [&](int) {
             const Pixel p{
