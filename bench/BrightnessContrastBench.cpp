@@ -37,5 +37,14 @@ void BM_BrightnessContrast_Rows(benchmark::State &state) {
 }
 BENCHMARK(BM_BrightnessContrast_Rows)->UseRealTime()->Unit(benchmark::kMillisecond);
 
+/// The same rows with gamma read from the table (a host without fast powers).
+void BM_BrightnessContrast_RowsGammaTable(benchmark::State &state) {
+    const bool fastPower = GetApp()->GetAttrB(AppFastPower);
+    GetApp()->SetAttrsTagList({{AppFastPower, 0}});
+    RunTool(state, {{"Gamma", 1.3}});
+    GetApp()->SetAttrsTagList({{AppFastPower, fastPower}});
+}
+BENCHMARK(BM_BrightnessContrast_RowsGammaTable)->UseRealTime()->Unit(benchmark::kMillisecond);
+
 } // namespace
 } // namespace Orvane::Bench

@@ -9,6 +9,7 @@
 #include "host/core/Parallel.h"
 #include "host/flow/DataTypes.h"
 #include "host/image/PixelConvert.h"
+#include "host/image/PixelMemory.h"
 
 namespace Orvane {
 
@@ -18,7 +19,7 @@ Image::Image(int width, int height, int depth)
 
 Image::~Image() = default;
 
-void Image::FreeDeleter::operator()(uint8_t *p) const { std::free(p); }
+void PixelBlockDeleter::operator()(uint8_t *block) const { FreePixels(block, bytes); }
 
 void Image::SetDataWindow(const ImgRectI &r) {
     if (HasScanLineData()) return;
@@ -36,7 +37,7 @@ bool Image::AllocScanLineData() {
     if (dataWindow_.IsNull()) return true;
     const size_t rowBytes = RowBytes();
     const size_t total = rowBytes * static_cast<size_t>(h);
-    pixels_.reset(static_cast<uint8_t *>(std::calloc(total, 1)));
+    pixels_ = std::unique_ptr<uint8_t, PixelBlockDeleter>(AllocPixels(total), PixelBlockDeleter{total});
     if (!pixels_) return false;
     try {
         rows_.resize(h);

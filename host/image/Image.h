@@ -56,6 +56,12 @@ enum class AuxChannelKind : uint8_t {
     Count
 };
 
+/// Gives an image's row block back to pixel memory.
+struct ORVANE_API PixelBlockDeleter {
+    size_t bytes = 0;
+    void operator()(uint8_t *block) const;
+};
+
 class ORVANE_API Image : public Parameter {
 public:
     /// Use NewImageTagList to make images for requests.
@@ -169,10 +175,7 @@ private:
     ImgRectI dataWindow_, validWindow_;
     FltPixel canvas_;
     std::vector<uint8_t *> rows_;
-    struct FreeDeleter {
-        void operator()(uint8_t *p) const;
-    };
-    std::unique_ptr<uint8_t, FreeDeleter> pixels_; // calloc'ed: large frames get lazily zeroed pages
+    std::unique_ptr<uint8_t, PixelBlockDeleter> pixels_; // from AllocPixels (pooled for frame sizes)
     struct AuxPlane {
         AuxChannelKind kind;
         std::unique_ptr<float[]> data;
