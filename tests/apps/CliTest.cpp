@@ -137,7 +137,8 @@ TEST(CliEval, DocumentErrorsAreOneLineWithExitTwo) {
     EXPECT_EQ(badType.exitCode, 2);
     EXPECT_TRUE(Contains(badType.err, "expects a number")) << badType.err;
 
-    const auto wrong = dir.File("wrong.flow", "Orvane.Document { Tools = { Blur1 = Blur { Inputs = { Blend = {} } } } }");
+    const auto wrong =
+        dir.File("wrong.flow", "Orvane.Document { Tools = { Blur1 = Blur { Inputs = { Blend = {} } } } }");
     const CliRun wrongType = Orvane("eval " + Quote(wrong.string()) + " Blur1");
     EXPECT_EQ(wrongType.exitCode, 2);
     EXPECT_TRUE(Contains(wrongType.err, "Blur1.Blend: expects a number")) << wrongType.err;
@@ -145,8 +146,8 @@ TEST(CliEval, DocumentErrorsAreOneLineWithExitTwo) {
 
 TEST(CliEval, UnknownClassIsKeptWithAWarningAndFailsOnlyWhenAsked) {
     TempDir dir;
-    const auto flow = dir.File("unknown.flow",
-                               "Orvane.Document { Tools = { X1 = FutureTool { Inputs = { Q = 3 } }, Blur1 = Blur {} } }");
+    const auto flow = dir.File(
+        "unknown.flow", "Orvane.Document { Tools = { X1 = FutureTool { Inputs = { Q = 3 } }, Blur1 = Blur {} } }");
     const CliRun r = Orvane("eval " + Quote(flow.string()) + " X1");
     EXPECT_EQ(r.exitCode, 2);
     EXPECT_TRUE(Contains(r.err, "WARNING: X1: unknown class 'FutureTool'")) << r.err;

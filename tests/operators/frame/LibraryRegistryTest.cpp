@@ -7,10 +7,10 @@
 
 #include "host/core/Registry.h"
 #include "host/core/Tags.h"
+#include "host/flow/Engine.h"
 #include "host/flow/Operator.h"
 #include "host/flow/OrvaneDoc.h"
 #include "host/flow/Request.h"
-#include "host/flow/Engine.h"
 #include "tests/support/TestSupport.h"
 
 namespace Orvane::librarytest {
@@ -33,9 +33,9 @@ TEST_F(LibraryRegistry, CountsByKindMatchTheTable) {
     std::map<uint32_t, int> byKind;
     for (const Registry *r : LibraryRows()) ++byKind[r->TypeFlags()];
     const std::map<uint32_t, int> expected = {
-        {3, 93},       {131, 4},      {259, 2},     {2307, 1},    {4655363, 1}, {11, 7},      {19, 5},
-        {35, 10},      {5, 32},       {1, 2},       {0, 3},       {5636099, 9}, {5636355, 1}, {5636107, 6},
-        {983040, 8},   {1507328, 7},  {1572864, 7}, {1769472, 1}, {1024, 2},
+        {3, 93},     {131, 4},     {259, 2},     {2307, 1},    {4655363, 1}, {11, 7},      {19, 5},
+        {35, 10},    {5, 32},      {1, 2},       {0, 3},       {5636099, 9}, {5636355, 1}, {5636107, 6},
+        {983040, 8}, {1507328, 7}, {1572864, 7}, {1769472, 1}, {1024, 2},
     };
     EXPECT_EQ(byKind, expected);
     EXPECT_EQ(LibraryRows().size(), 201u);
