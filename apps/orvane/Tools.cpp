@@ -118,7 +118,7 @@ void PrintInput(const Input &in) {
     line.resize(std::max<size_t>(line.size() + 1, 58), ' ');
     line += TypeWord(in.DataType());
     if (t.Has(InputControl)) line += ", " + ControlWord(t.GetID(InputControl));
-    if (in.DataType() == CLSID_DataType_Image || in.DataType() == CLSID_DataType_Mask) {
+    if (IsImageDataType(in.DataType())) {
         line += in.IsRequired() ? ", required" : ", optional";
         if (in.MainIndex()) line += ", connector " + std::to_string(in.MainIndex());
     } else {

@@ -99,4 +99,7 @@ namespace Orvane {
 ORVANE_CLASS_IDS(ORVANE_DECLARE_ID)
 #undef ORVANE_DECLARE_ID
 
+/// True for the data types that carry pixels (images and masks).
+inline bool IsImageDataType(OvID type) { return type == CLSID_DataType_Image || type == CLSID_DataType_Mask; }
+
 } // namespace Orvane

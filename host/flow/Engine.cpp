@@ -18,8 +18,6 @@
 namespace Orvane {
 namespace {
 
-bool IsImageType(OvID type) { return type == CLSID_DataType_Image || type == CLSID_DataType_Mask; }
-
 bool Volatile(const Operator *op) { return op->RegAttrB(RegNoCache) || op->RegAttrB(RegUnpredictable); }
 
 /// The request flags that change a result, with the proxy scale.
@@ -91,7 +89,7 @@ Ref<Parameter> Evaluate(Output *out, double time, const EvalOptions &options) {
 
     // The output's domain of definition comes from the pre-calculation pass.
     std::optional<ImageDomain> ownDoD;
-    if (!precalc && IsImageType(out->DataType())) {
+    if (!precalc && IsImageDataType(out->DataType())) {
         EvalOptions pre = opt;
         pre.flags |= ReqFlagPreCalc;
         pre.roi.reset();
@@ -122,7 +120,7 @@ Ref<Parameter> Evaluate(Output *out, double time, const EvalOptions &options) {
             Input *in = inPtr.get();
             if (in->Priority() != level) continue;
             Request::Slot &slot = req.SlotOf(in);
-            if (slot.given || !in->Link() || !IsImageType(in->DataType())) continue;
+            if (slot.given || !in->Link() || !IsImageDataType(in->DataType())) continue;
             slot.roi = opt.roi;
             EvalOptions pre = opt;
             pre.flags |= ReqFlagPreCalc;
@@ -153,7 +151,7 @@ Ref<Parameter> Evaluate(Output *out, double time, const EvalOptions &options) {
                 slot.data = reuse ? shapes[in->Index()] : Evaluate(in->Link(), slot.time, up);
                 if (!slot.data) {
                     return nullptr; // a linked tool failed or the render was aborted: stop here, optional or not
-                } else if (wholeFrames && IsImageType(in->DataType())) {
+                } else if (wholeFrames && IsImageDataType(in->DataType())) {
                     slot.data = CoverFrame(slot.data, req.IsPreCalc() || (up.flags & ReqFlagPreCalc));
                 }
             } else {

@@ -15,7 +15,7 @@ const char *ExpectedValueText(const Input *in) {
     if (t == CLSID_DataType_Text) return "a text";
     if (t == CLSID_DataType_OvID) return "an ID (text)";
     if (t == CLSID_DataType_Gradient) return "a gradient";
-    if (t == CLSID_DataType_Image || t == CLSID_DataType_Mask) return "a link to an image output (Tool.Output)";
+    if (IsImageDataType(t)) return "a link to an image output (Tool.Output)";
     return "a value of its own type";
 }
 
@@ -47,8 +47,7 @@ std::string ApplyInputValue(OrvaneDoc &doc, Input *in, const ScriptVal &v, bool 
         in->SetUnresolvedLink({});
         return "";
     }
-    if (type == CLSID_DataType_Image || type == CLSID_DataType_Mask)
-        return std::string("expects ") + ExpectedValueText(in);
+    if (IsImageDataType(type)) return std::string("expects ") + ExpectedValueText(in);
     if (v.IsTable() && v.ClassName() == "Curve") {
         AnimCurve curve;
         if (!AnimCurve::FromScript(

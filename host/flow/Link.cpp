@@ -11,8 +11,6 @@
 namespace Orvane {
 namespace {
 
-bool IsImageType(OvID type) { return type == CLSID_DataType_Image || type == CLSID_DataType_Mask; }
-
 /// True when `op` is `target` or takes anything from it, directly or not:
 /// linking target's input to op's output would close a loop.
 bool DependsOn(const Operator *op, const Operator *target) {
@@ -71,7 +69,7 @@ Input::Input(Operator *owner, std::string name, OvID id, const TagList &tags, in
     tags_.Persist();
     dataType_ = tags_.GetID(LinkDataType, CLSID_DataType_Number);
     defaultPriority_ = dataType_ == CLSID_DataType_Mask ? PriorityMask
-                       : IsImageType(dataType_)         ? PriorityImage
+                       : IsImageDataType(dataType_)     ? PriorityImage
                                                         : PriorityDefault;
     default_ = Conform(DefaultValueFor(dataType_, tags_));
     value_ = default_;
@@ -80,7 +78,7 @@ Input::Input(Operator *owner, std::string name, OvID id, const TagList &tags, in
 const char *Input::Label() const { return tags_.GetText(ControlLabel, name_.c_str()); }
 
 bool Input::IsRequired() const {
-    if (!IsImageType(dataType_)) return false;
+    if (!IsImageDataType(dataType_)) return false;
     if (dataType_ == CLSID_DataType_Mask && Priority() <= PriorityMask && !tags_.Has(InputRequired)) return false;
     return tags_.GetLong(InputRequired, 1) != 0;
 }
@@ -92,7 +90,7 @@ void Input::SetAttrsTagList(const TagList &tags) {
 
 Ref<Parameter> Input::Conform(Ref<Parameter> value) const {
     if (!value) return nullptr;
-    if (IsImageType(dataType_)) return nullptr;
+    if (IsImageDataType(dataType_)) return nullptr;
     if (value->DataType() != dataType_) return nullptr;
     const bool hasMin = tags_.Has(InputMinAllowed), hasMax = tags_.Has(InputMaxAllowed);
     const double lo = tags_.GetDouble(InputMinAllowed), hi = tags_.GetDouble(InputMaxAllowed);
@@ -130,7 +128,7 @@ void Input::Changed() {
 }
 
 bool Input::SetCurve(AnimCurve curve) {
-    if (curve.Empty() || IsImageType(dataType_) || !IsExternal()) return false;
+    if (curve.Empty() || IsImageDataType(dataType_) || !IsExternal()) return false;
     AnimCurve limited;
     for (const Keyframe &k : curve.Keys()) {
         Ref<Parameter> v = Conform(k.value);
@@ -146,8 +144,8 @@ bool Input::SetCurve(AnimCurve curve) {
 bool Input::ConnectTo(Output *output) {
     if (!output || !IsExternal()) return false;
     const OvID from = output->DataType();
-    const bool fits =
-        from == dataType_ || (IsImageType(from) && IsImageType(dataType_)) || from == tags_.GetID(LinkSecondDataType);
+    const bool fits = from == dataType_ || (IsImageDataType(from) && IsImageDataType(dataType_)) ||
+                      from == tags_.GetID(LinkSecondDataType);
     if (!fits || DependsOn(output->Owner(), owner_)) return false;
     Disconnect();
     curve_.reset();

@@ -16,7 +16,7 @@ namespace {
 constexpr size_t LargeBlock = size_t(1) << 20;
 constexpr size_t HugePage = size_t(2) << 20;
 
-struct Pool {
+struct PixelPool {
     std::mutex lock;
     std::list<std::pair<size_t, uint8_t *>> blocks; // front: most recently freed
     size_t bytes = 0;
@@ -27,14 +27,14 @@ struct Pool {
 #endif
 };
 
-Pool &ThePool() {
-    static Pool *pool = new Pool; // lives for the process: images may be freed during static teardown
+PixelPool &ThePixelPool() {
+    static PixelPool *pool = new PixelPool; // lives for the process: images may be freed during static teardown
     return *pool;
 }
 
 size_t RoundUp(size_t bytes, size_t to) { return (bytes + to - 1) / to * to; }
 
-void ReleaseLocked(Pool &p, size_t keep) {
+void ReleaseLocked(PixelPool &p, size_t keep) {
     while (p.bytes > keep && !p.blocks.empty()) {
         p.bytes -= p.blocks.back().first;
         std::free(p.blocks.back().second);
@@ -57,7 +57,7 @@ void ZeroLarge(uint8_t *block, size_t bytes) {
 uint8_t *AllocPixels(size_t bytes) {
     if (bytes == 0) bytes = 1;
     if (bytes < LargeBlock) return static_cast<uint8_t *>(std::calloc(bytes, 1));
-    Pool &p = ThePool();
+    PixelPool &p = ThePixelPool();
     uint8_t *block = nullptr;
     {
         std::lock_guard<std::mutex> guard(p.lock);
@@ -84,7 +84,7 @@ void FreePixels(uint8_t *block, size_t bytes) {
         std::free(block);
         return;
     }
-    Pool &p = ThePool();
+    PixelPool &p = ThePixelPool();
     std::lock_guard<std::mutex> guard(p.lock);
     if (bytes > p.limit) {
         std::free(block);
@@ -96,20 +96,20 @@ void FreePixels(uint8_t *block, size_t bytes) {
 }
 
 void SetPixelPoolLimit(size_t bytes) {
-    Pool &p = ThePool();
+    PixelPool &p = ThePixelPool();
     std::lock_guard<std::mutex> guard(p.lock);
     p.limit = bytes;
     ReleaseLocked(p, bytes);
 }
 
 size_t PixelPoolLimit() {
-    Pool &p = ThePool();
+    PixelPool &p = ThePixelPool();
     std::lock_guard<std::mutex> guard(p.lock);
     return p.limit;
 }
 
 size_t PixelPoolBytes() {
-    Pool &p = ThePool();
+    PixelPool &p = ThePixelPool();
     std::lock_guard<std::mutex> guard(p.lock);
     return p.bytes;
 }
