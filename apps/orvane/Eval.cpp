@@ -1,5 +1,6 @@
 // orvane eval: evaluates one output of a flow document and reports it.
 #include <algorithm>
+#include <charconv>
 #include <cmath>
 #include <cstdio>
 #include <limits>
@@ -135,6 +136,13 @@ std::string RectJson(const ImgRectI &r) {
            std::to_string(r.y1) + "]";
 }
 
+/// The shortest text that reads back as the same float.
+std::string ShortestFloat(float f) {
+    char buf[32];
+    const auto r = std::to_chars(buf, buf + sizeof buf, f);
+    return std::string(buf, r.ptr);
+}
+
 std::vector<float> PixelValues(const Image &img, int x, int y) {
     const FltPixel p = img.GetFlt(x, y);
     if (img.IsMask()) return {p.A};
@@ -234,7 +242,7 @@ int RunEval(const std::vector<std::string> &rawArgs) {
             for (const auto &[x, y] : a.pixels) {
                 const auto vals = PixelValues(*img, x, y);
                 std::string text;
-                for (float f : vals) text += " " + ScriptVal(static_cast<double>(f)).ToText();
+                for (float f : vals) text += " " + ShortestFloat(f);
                 std::printf("  pixel %d,%d  %s\n", x, y, text.c_str());
             }
         } else if (result) {
