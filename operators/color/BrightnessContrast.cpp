@@ -1,10 +1,12 @@
 #include "operators/color/BrightnessContrast.h"
 
 #include <algorithm>
+#include <bit>
 #include <cmath>
 #include <cstring>
 
 #include "host/app/Application.h"
+#include "host/color/FastPow.h"
 #include "host/core/Tags.h"
 #include "host/flow/DataTypes.h"
 #include "host/flow/Request.h"
@@ -39,7 +41,7 @@ using Values = BrightnessContrast::Values;
 
 /// Settings closer than this to their neutral value count as neutral.
 constexpr double kEps = 1.1920929e-07;
-/// Pixels converted at a time by the rows that go through FltPixel or Pixel.
+/// Pixels converted at a time by the integer rows.
 constexpr int kBlock = 256;
 
 bool Near(double a, double b) { return std::fabs(a - b) < kEps; }
@@ -47,121 +49,185 @@ bool Near(double a, double b) { return std::fabs(a - b) < kEps; }
 // ---- float pixels ----
 
 /// Gamma as a true power, the sign kept apart: negative values stay negative.
+/// Applied to one channel's values of a block, in place.
 struct TruePower {
     float exponent;
-    float operator()(float x) const { return std::copysign(std::pow(std::fabs(x), exponent), x); }
+    void operator()(float *x, int n) const { PowAbsSigned(x, exponent, x, n); }
 };
 
 /// Gamma read from the tool's table (negative values read as 0).
 struct TablePower {
     const GammaTable *table;
-    float operator()(float x) const { return table->LookupFlt(x); }
+    void operator()(float *x, int n) const {
+        for (int k = 0; k < n; ++k) x[k] = table->LookupFlt(x[k]);
+    }
 };
 
-/// The whole chain on one float pixel (red, green, blue, alpha), forward or
-/// reverse. Channels that are off keep their values. Written lane by lane, so
-/// that the cheap steps compile to four-wide operations.
-template <bool Reverse, class Pow> inline void ChainFlt(const Values &v, const Pow &pow, float p[4]) {
-    const bool *on = v.chans;
-    if (v.prePost) {
-        const float k = std::fabs(p[3]) < static_cast<float>(kEps) ? 0.f : 1.f / p[3];
-        for (int c = 0; c < 3; ++c) p[c] = on[c] ? p[c] * k : p[c];
+/// The channels that are on as bit masks (all ones or zero), so that the steps
+/// below choose between new and old values with bit operations: no branches
+/// per channel, and four-wide code.
+struct OnMask {
+    uint32_t bits[4];
+    explicit OnMask(const bool on[4]) {
+        for (int c = 0; c < 4; ++c) bits[c] = on[c] ? ~0u : 0u;
     }
-    float x[4];
-    if constexpr (!Reverse) {
-        for (int c = 0; c < 4; ++c) x[c] = v.gain * p[c] + v.lift;
-        if (v.doGamma)
-            for (int c = 0; c < 4; ++c)
-                if (on[c]) x[c] = pow(x[c]);
-        for (int c = 0; c < 4; ++c) p[c] = on[c] ? (x[c] - 0.5f) * v.finalContrast + 0.5f + v.bright : p[c];
-        if (v.doSat) {
-            const float y = 0.299f * p[0] + 0.587f * p[1] + 0.114f * p[2];
-            for (int c = 0; c < 3; ++c) p[c] = on[c] ? p[c] * v.sat + y * v._sat : p[c];
+    /// `changed` where channel c is on, `old` where it is off.
+    float Pick(int c, float changed, float old) const {
+        return std::bit_cast<float>((std::bit_cast<uint32_t>(changed) & bits[c]) |
+                                    (std::bit_cast<uint32_t>(old) & ~bits[c]));
+    }
+};
+
+/// Pixels the float rows take at a time.
+constexpr int kFltBlock = 256;
+
+/// The steps of the chain before the gamma, on n float pixels (red, green,
+/// blue, alpha): the pre-divide, then forward gain and lift, or reverse
+/// low/high, saturation, brightness and contrast. Leaves in x the values the
+/// gamma takes; channels that are off keep their values in p. Step by step
+/// over all n pixels, each step's switch tested once, and written lane by
+/// lane, so that the steps compile to four-wide operations without branches.
+template <bool Reverse> inline void ChainFltBefore(const Values &v, const OnMask &on, float (*__restrict p)[4],
+                                                   float (*__restrict x)[4], int n) {
+    if (v.prePost)
+        for (int k = 0; k < n; ++k) {
+            const float a = std::fabs(p[k][3]) < static_cast<float>(kEps) ? 0.f : 1.f / p[k][3];
+            for (int c = 0; c < 3; ++c) p[k][c] = on.Pick(c, p[k][c] * a, p[k][c]);
         }
-        if (v.useLowHigh)
-            for (int c = 0; c < 4; ++c) p[c] = on[c] ? (p[c] - v.low) * v.finalScale : p[c];
+    if constexpr (!Reverse) {
+        const float gain = v.gain, lift = v.lift;
+        for (int k = 0; k < n; ++k)
+            for (int c = 0; c < 4; ++c) x[k][c] = gain * p[k][c] + lift;
     } else {
-        if (v.useLowHigh)
-            for (int c = 0; c < 4; ++c) p[c] = on[c] ? v.finalScale * p[c] + v.low : p[c];
+        if (v.useLowHigh) {
+            const float scale = v.finalScale, low = v.low;
+            for (int k = 0; k < n; ++k)
+                for (int c = 0; c < 4; ++c) p[k][c] = on.Pick(c, scale * p[k][c] + low, p[k][c]);
+        }
         if (v.doSat) {
-            const float r = p[0], g = p[1], b = p[2];
-            for (int c = 0; c < 3; ++c) {
-                const float *m = v.satRows[c];
-                p[c] = on[c] ? m[0] * r + m[1] * g + m[2] * b : p[c];
+            float m[3][3];
+            std::memcpy(m, v.satRows, sizeof m);
+            for (int k = 0; k < n; ++k) {
+                const float r = p[k][0], g = p[k][1], b = p[k][2];
+                for (int c = 0; c < 3; ++c) p[k][c] = on.Pick(c, m[c][0] * r + m[c][1] * g + m[c][2] * b, p[k][c]);
             }
         }
-        for (int c = 0; c < 4; ++c) x[c] = (p[c] - v.bright - 0.5f) * v.finalContrast + 0.5f;
-        if (v.doGamma)
-            for (int c = 0; c < 4; ++c)
-                if (on[c]) x[c] = pow(x[c]);
-        for (int c = 0; c < 4; ++c) p[c] = on[c] ? (x[c] - v.lift) * v.gain : p[c];
+        const float bright = v.bright, contrast = v.finalContrast;
+        for (int k = 0; k < n; ++k)
+            for (int c = 0; c < 4; ++c) x[k][c] = (p[k][c] - bright - 0.5f) * contrast + 0.5f;
+    }
+}
+
+/// The steps after the gamma: x holds the gamma's results for the channels
+/// that are on (what ChainFltBefore left, where no gamma is applied).
+template <bool Reverse> inline void ChainFltAfter(const Values &v, const OnMask &on, float (*__restrict p)[4],
+                                                  const float (*__restrict x)[4], int n) {
+    if constexpr (!Reverse) {
+        const float contrast = v.finalContrast, bright = v.bright;
+        for (int k = 0; k < n; ++k)
+            for (int c = 0; c < 4; ++c) p[k][c] = on.Pick(c, (x[k][c] - 0.5f) * contrast + 0.5f + bright, p[k][c]);
+        if (v.doSat) {
+            const float sat = v.sat, _sat = v._sat;
+            for (int k = 0; k < n; ++k) {
+                const float y = 0.299f * p[k][0] + 0.587f * p[k][1] + 0.114f * p[k][2];
+                for (int c = 0; c < 3; ++c) p[k][c] = on.Pick(c, p[k][c] * sat + y * _sat, p[k][c]);
+            }
+        }
+        if (v.useLowHigh) {
+            const float low = v.low, scale = v.finalScale;
+            for (int k = 0; k < n; ++k)
+                for (int c = 0; c < 4; ++c) p[k][c] = on.Pick(c, (p[k][c] - low) * scale, p[k][c]);
+        }
+    } else {
+        const float lift = v.lift, gain = v.gain;
+        for (int k = 0; k < n; ++k)
+            for (int c = 0; c < 4; ++c) p[k][c] = on.Pick(c, (x[k][c] - lift) * gain, p[k][c]);
     }
     if (v.prePost)
-        for (int c = 0; c < 3; ++c) p[c] = on[c] ? p[c] * p[3] : p[c];
+        for (int k = 0; k < n; ++k)
+            for (int c = 0; c < 3; ++c) p[k][c] = on.Pick(c, p[k][c] * p[k][3], p[k][c]);
     if (v.clipBlack)
-        for (int c = 0; c < 4; ++c) p[c] = on[c] && p[c] < 0.f ? 0.f : p[c];
+        for (int k = 0; k < n; ++k)
+            for (int c = 0; c < 4; ++c) p[k][c] = on.Pick(c, p[k][c] < 0.f ? 0.f : p[k][c], p[k][c]);
     if (v.clipWhite)
-        for (int c = 0; c < 4; ++c) p[c] = on[c] && p[c] > 1.f ? 1.f : p[c];
+        for (int k = 0; k < n; ++k)
+            for (int c = 0; c < 4; ++c) p[k][c] = on.Pick(c, p[k][c] > 1.f ? 1.f : p[k][c], p[k][c]);
 }
 
-/// The per-pixel function of the scalar rows: gamma from the table.
-template <bool Reverse> inline FltPixel PixelFlt(const Values &v, const FltPixel &px) {
-    float p[4] = {px.R, px.G, px.B, px.A};
-    ChainFlt<Reverse>(v, TablePower{v.table}, p);
-    return {p[0], p[1], p[2], p[3]};
+/// The whole chain, forward or reverse, on up to kFltBlock float pixels in
+/// place: the steps before the gamma, the gamma (`pow`) once per channel that
+/// is on, over that channel's values regrouped into contiguous memory, then
+/// the steps after it. Every float row and the canvas colour go through here.
+template <bool Reverse, class Pow> void ChainFlt(const Values &v, const Pow &pow, float (*px)[4], int n) {
+    float x[kFltBlock][4]; // the gamma's inputs and results, pixel by pixel
+    const OnMask on(v.chans);
+    ChainFltBefore<Reverse>(v, on, px, x, n);
+    if (v.doGamma) {
+        float planes[4][kFltBlock];
+        for (int k = 0; k < n; ++k)
+            for (int c = 0; c < 4; ++c) planes[c][k] = x[k][c];
+        for (int c = 0; c < 4; ++c)
+            if (v.chans[c]) pow(planes[c], n);
+        for (int k = 0; k < n; ++k)
+            for (int c = 0; c < 4; ++c) x[k][c] = planes[c][k];
+    }
+    ChainFltAfter<Reverse>(v, on, px, x, n);
 }
 
-/// RGBA float32 or float16 rows with fast powers: the four channels of a
-/// pixel as one vector, read from and written to the stored row directly.
+/// RGBA float32 or float16 rows with fast powers, in blocks: float32 is
+/// worked on in the output row itself.
 template <bool Reverse, bool Half> void VectorSpan(const Values &v, const uint8_t *src, uint8_t *dst, int count) {
     const TruePower pow{v.gamma};
     if constexpr (Half) {
-        const auto *in = reinterpret_cast<const uint16_t *>(src);
-        auto *out = reinterpret_cast<uint16_t *>(dst);
-        for (int i = 0; i < count; ++i, in += 4, out += 4) {
-            float p[4] = {HalfToFloat(in[0]), HalfToFloat(in[1]), HalfToFloat(in[2]), HalfToFloat(in[3])};
-            ChainFlt<Reverse>(v, pow, p);
-            for (int c = 0; c < 4; ++c) out[c] = FloatToHalf(p[c]);
+        float px[kFltBlock][4];
+        for (int i = 0; i < count; i += kFltBlock) {
+            const int n = std::min(kFltBlock, count - i);
+            const auto *in = reinterpret_cast<const uint16_t *>(src) + static_cast<size_t>(i) * 4;
+            auto *out = reinterpret_cast<uint16_t *>(dst) + static_cast<size_t>(i) * 4;
+            for (int k = 0; k < n; ++k)
+                for (int c = 0; c < 4; ++c) px[k][c] = HalfToFloat(in[4 * k + c]);
+            ChainFlt<Reverse>(v, pow, px, n);
+            for (int k = 0; k < n; ++k)
+                for (int c = 0; c < 4; ++c) out[4 * k + c] = FloatToHalf(px[k][c]);
         }
     } else {
-        const auto *in = reinterpret_cast<const float *>(src);
-        auto *out = reinterpret_cast<float *>(dst);
-        for (int i = 0; i < count; ++i, in += 4, out += 4) {
-            float p[4] = {in[0], in[1], in[2], in[3]};
-            ChainFlt<Reverse>(v, pow, p);
-            for (int c = 0; c < 4; ++c) out[c] = p[c];
+        auto *px = reinterpret_cast<float(*)[4]>(dst);
+        for (int i = 0; i < count; i += kFltBlock) {
+            const int n = std::min(kFltBlock, count - i);
+            const uint8_t *in = src + static_cast<size_t>(i) * sizeof px[0];
+            if (in != dst + static_cast<size_t>(i) * sizeof px[0]) std::memcpy(px + i, in, n * sizeof px[0]);
+            ChainFlt<Reverse>(v, pow, px + i, n);
         }
     }
 }
 
-/// Any float depth with fast powers (float masks, or vector rows switched
-/// off): blocks of pixels converted to FltPixel, the same four-channel chain.
-template <bool Reverse> void GeneralSpan(const Values &v, const uint8_t *src, uint8_t *dst, int count) {
-    const TruePower pow{v.gamma};
+/// Any float depth, through FltPixel: with fast powers (float masks, or
+/// vector rows switched off) or the table.
+template <bool Reverse, class Pow>
+void GeneralSpan(const Values &v, const Pow &pow, const uint8_t *src, uint8_t *dst, int count) {
     const int bpp = FormatOfDepth(v.depth).BytesPerPixel();
-    FltPixel block[kBlock];
-    for (int i = 0; i < count; i += kBlock) {
-        const int n = std::min(kBlock, count - i);
+    FltPixel block[kFltBlock];
+    float px[kFltBlock][4];
+    for (int i = 0; i < count; i += kFltBlock) {
+        const int n = std::min(kFltBlock, count - i);
         LoadFlt(v.depth, src + static_cast<size_t>(i) * bpp, n, block);
         for (int k = 0; k < n; ++k) {
-            float p[4] = {block[k].R, block[k].G, block[k].B, block[k].A};
-            ChainFlt<Reverse>(v, pow, p);
-            block[k] = {p[0], p[1], p[2], p[3]};
+            px[k][0] = block[k].R, px[k][1] = block[k].G, px[k][2] = block[k].B, px[k][3] = block[k].A;
         }
+        ChainFlt<Reverse>(v, pow, px, n);
+        for (int k = 0; k < n; ++k) block[k] = {px[k][0], px[k][1], px[k][2], px[k][3]};
         StoreFlt(v.depth, block, n, dst + static_cast<size_t>(i) * bpp);
     }
 }
 
-/// Any float depth without fast powers: the per-pixel function, pixel by pixel.
-template <bool Reverse> void ScalarSpan(const Values &v, const uint8_t *src, uint8_t *dst, int count) {
-    const int bpp = FormatOfDepth(v.depth).BytesPerPixel();
-    FltPixel block[kBlock];
-    for (int i = 0; i < count; i += kBlock) {
-        const int n = std::min(kBlock, count - i);
-        LoadFlt(v.depth, src + static_cast<size_t>(i) * bpp, n, block);
-        for (int k = 0; k < n; ++k) block[k] = PixelFlt<Reverse>(v, block[k]);
-        StoreFlt(v.depth, block, n, dst + static_cast<size_t>(i) * bpp);
-    }
+/// Any float depth with fast powers, when the vector rows do not apply.
+template <bool Reverse> void FastPowerSpan(const Values &v, const uint8_t *src, uint8_t *dst, int count) {
+    GeneralSpan<Reverse>(v, TruePower{v.gamma}, src, dst, count);
+}
+
+/// Any float depth without fast powers: gamma from the table.
+template <bool Reverse> void TableSpan(const Values &v, const uint8_t *src, uint8_t *dst, int count) {
+    GeneralSpan<Reverse>(v, TablePower{v.table}, src, dst, count);
 }
 
 // ---- 16-bit integer pixels ----
@@ -261,25 +327,25 @@ BrightnessContrast::SpanFunction ChooseSpan(int depth, bool reverse, bool fastPo
         return reverse ? &VectorSpan<true, false> : &VectorSpan<false, false>;
     if (fastPower && vectorRows && depth == DepthRGBAFlt16)
         return reverse ? &VectorSpan<true, true> : &VectorSpan<false, true>;
-    if (fastPower) return reverse ? &GeneralSpan<true> : &GeneralSpan<false>;
-    return reverse ? &ScalarSpan<true> : &ScalarSpan<false>;
+    if (fastPower) return reverse ? &FastPowerSpan<true> : &FastPowerSpan<false>;
+    return reverse ? &TableSpan<true> : &TableSpan<false>;
 }
 
 /// A float colour through the chain the float rows use.
 FltPixel ChainOfColor(const Values &v, bool fastPower, const FltPixel &px) {
-    float p[4] = {px.R, px.G, px.B, px.A};
+    float p[1][4] = {{px.R, px.G, px.B, px.A}};
     if (fastPower) {
         if (v.reverse)
-            ChainFlt<true>(v, TruePower{v.gamma}, p);
+            ChainFlt<true>(v, TruePower{v.gamma}, p, 1);
         else
-            ChainFlt<false>(v, TruePower{v.gamma}, p);
+            ChainFlt<false>(v, TruePower{v.gamma}, p, 1);
     } else {
         if (v.reverse)
-            ChainFlt<true>(v, TablePower{v.table}, p);
+            ChainFlt<true>(v, TablePower{v.table}, p, 1);
         else
-            ChainFlt<false>(v, TablePower{v.table}, p);
+            ChainFlt<false>(v, TablePower{v.table}, p, 1);
     }
-    return {p[0], p[1], p[2], p[3]};
+    return {p[0][0], p[0][1], p[0][2], p[0][3]};
 }
 
 } // namespace
