@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <cstring>
+#include <type_traits>
 
 #include "host/image/Half.h"
 #include "host/image/Image.h"
@@ -31,7 +32,7 @@ template <class T> T LoadAs(const uint8_t *p) {
 }
 template <class T> void StoreAs(uint8_t *p, T v) { std::memcpy(p, &v, sizeof v); }
 
-float ComponentToFloat(ComponentType t, const uint8_t *p) {
+inline float ComponentToFloat(ComponentType t, const uint8_t *p) {
     switch (t) {
     case ComponentType::Int8: return *p * (1.f / 255.f);
     case ComponentType::Int16: return LoadAs<uint16_t>(p) * (1.f / 65535.f);
@@ -40,7 +41,7 @@ float ComponentToFloat(ComponentType t, const uint8_t *p) {
     }
 }
 
-void FloatToComponent(ComponentType t, float v, uint8_t *p) {
+inline void FloatToComponent(ComponentType t, float v, uint8_t *p) {
     switch (t) {
     case ComponentType::Int8: *p = FloatToU8(v); break;
     case ComponentType::Int16: StoreAs<uint16_t>(p, FloatToU16(v)); break;
@@ -49,7 +50,7 @@ void FloatToComponent(ComponentType t, float v, uint8_t *p) {
     }
 }
 
-uint16_t ComponentToU16(ComponentType t, const uint8_t *p) {
+inline uint16_t ComponentToU16(ComponentType t, const uint8_t *p) {
     switch (t) {
     case ComponentType::Int8: return static_cast<uint16_t>(*p * 257u);
     case ComponentType::Int16: return LoadAs<uint16_t>(p);
@@ -58,7 +59,7 @@ uint16_t ComponentToU16(ComponentType t, const uint8_t *p) {
     }
 }
 
-void U16ToComponent(ComponentType t, uint16_t v, uint8_t *p) {
+inline void U16ToComponent(ComponentType t, uint16_t v, uint8_t *p) {
     switch (t) {
     case ComponentType::Int8: *p = U16ToU8(v); break;
     case ComponentType::Int16: StoreAs<uint16_t>(p, v); break;
@@ -69,74 +70,87 @@ void U16ToComponent(ComponentType t, uint16_t v, uint8_t *p) {
 
 } // namespace
 
-void LoadFlt(int depth, const uint8_t *src, int count, FltPixel *dst) {
-    const PixelFormat f = FormatOfDepth(depth);
-    const int bpc = f.bytesPerComponent;
-    if (depth == DepthRGBAFlt32) {
-        std::memcpy(dst, src, sizeof(FltPixel) * count);
-        return;
+namespace {
+
+/// Calls fn with the component type as a compile-time constant, so the
+/// per-pixel loops below are instantiated once per type and the switch runs
+/// once per call.
+template <class Fn> void WithType(ComponentType t, Fn &&fn) {
+    switch (t) {
+    case ComponentType::Int8: fn(std::integral_constant<ComponentType, ComponentType::Int8>()); break;
+    case ComponentType::Int16: fn(std::integral_constant<ComponentType, ComponentType::Int16>()); break;
+    case ComponentType::Flt16: fn(std::integral_constant<ComponentType, ComponentType::Flt16>()); break;
+    default: fn(std::integral_constant<ComponentType, ComponentType::Flt32>()); break;
     }
-    for (int i = 0; i < count; ++i) {
-        if (f.channels == 4) {
-            const uint8_t *p = src + i * 4 * bpc;
-            dst[i] = {ComponentToFloat(f.type, p), ComponentToFloat(f.type, p + bpc),
-                      ComponentToFloat(f.type, p + 2 * bpc), ComponentToFloat(f.type, p + 3 * bpc)};
-        } else {
-            const float v = ComponentToFloat(f.type, src + i * bpc);
+}
+
+/// Reads `count` stored pixels into four-channel pixels through `get`
+/// (component address to channel value); single channels fill all four.
+template <class Px, class Get> void LoadRun(const PixelFormat &f, const uint8_t *src, int count, Px *dst, Get get) {
+    const int bpc = f.bytesPerComponent;
+    if (f.channels == 4) {
+        for (int i = 0; i < count; ++i, src += 4 * bpc)
+            dst[i] = {get(src), get(src + bpc), get(src + 2 * bpc), get(src + 3 * bpc)};
+    } else {
+        for (int i = 0; i < count; ++i, src += bpc) {
+            const auto v = get(src);
             dst[i] = {v, v, v, v};
         }
     }
 }
 
-void StoreFlt(int depth, const FltPixel *src, int count, uint8_t *dst) {
-    const PixelFormat f = FormatOfDepth(depth);
+/// Writes `count` four-channel pixels through `put` (value, component
+/// address); single channels store alpha.
+template <class Px, class Put> void StoreRun(const PixelFormat &f, const Px *src, int count, uint8_t *dst, Put put) {
     const int bpc = f.bytesPerComponent;
+    if (f.channels == 4) {
+        for (int i = 0; i < count; ++i, dst += 4 * bpc) {
+            put(src[i].R, dst);
+            put(src[i].G, dst + bpc);
+            put(src[i].B, dst + 2 * bpc);
+            put(src[i].A, dst + 3 * bpc);
+        }
+    } else {
+        for (int i = 0; i < count; ++i, dst += bpc) put(src[i].A, dst);
+    }
+}
+
+} // namespace
+
+void LoadFlt(int depth, const uint8_t *src, int count, FltPixel *dst) {
     if (depth == DepthRGBAFlt32) {
         std::memcpy(dst, src, sizeof(FltPixel) * count);
         return;
     }
-    for (int i = 0; i < count; ++i) {
-        if (f.channels == 4) {
-            uint8_t *p = dst + i * 4 * bpc;
-            FloatToComponent(f.type, src[i].R, p);
-            FloatToComponent(f.type, src[i].G, p + bpc);
-            FloatToComponent(f.type, src[i].B, p + 2 * bpc);
-            FloatToComponent(f.type, src[i].A, p + 3 * bpc);
-        } else {
-            FloatToComponent(f.type, src[i].A, dst + i * bpc);
-        }
+    const PixelFormat f = FormatOfDepth(depth);
+    WithType(f.type, [&](auto t) {
+        LoadRun(f, src, count, dst, [](const uint8_t *p) { return ComponentToFloat(decltype(t)::value, p); });
+    });
+}
+
+void StoreFlt(int depth, const FltPixel *src, int count, uint8_t *dst) {
+    if (depth == DepthRGBAFlt32) {
+        std::memcpy(dst, src, sizeof(FltPixel) * count);
+        return;
     }
+    const PixelFormat f = FormatOfDepth(depth);
+    WithType(f.type, [&](auto t) {
+        StoreRun(f, src, count, dst, [](float v, uint8_t *p) { FloatToComponent(decltype(t)::value, v, p); });
+    });
 }
 
 void LoadPixel(int depth, const uint8_t *src, int count, Pixel *dst) {
     const PixelFormat f = FormatOfDepth(depth);
-    const int bpc = f.bytesPerComponent;
-    for (int i = 0; i < count; ++i) {
-        if (f.channels == 4) {
-            const uint8_t *p = src + i * 4 * bpc;
-            dst[i] = {ComponentToU16(f.type, p), ComponentToU16(f.type, p + bpc), ComponentToU16(f.type, p + 2 * bpc),
-                      ComponentToU16(f.type, p + 3 * bpc)};
-        } else {
-            const uint16_t v = ComponentToU16(f.type, src + i * bpc);
-            dst[i] = {v, v, v, v};
-        }
-    }
+    WithType(f.type, [&](auto t) {
+        LoadRun(f, src, count, dst, [](const uint8_t *p) { return ComponentToU16(decltype(t)::value, p); });
+    });
 }
 
 void StorePixel(int depth, const Pixel *src, int count, uint8_t *dst) {
     const PixelFormat f = FormatOfDepth(depth);
-    const int bpc = f.bytesPerComponent;
-    for (int i = 0; i < count; ++i) {
-        if (f.channels == 4) {
-            uint8_t *p = dst + i * 4 * bpc;
-            U16ToComponent(f.type, src[i].R, p);
-            U16ToComponent(f.type, src[i].G, p + bpc);
-            U16ToComponent(f.type, src[i].B, p + 2 * bpc);
-            U16ToComponent(f.type, src[i].A, p + 3 * bpc);
-        } else {
-            U16ToComponent(f.type, src[i].A, dst + i * bpc);
-        }
-    }
+    WithType(f.type, [&](auto t) {
+        StoreRun(f, src, count, dst, [](uint16_t v, uint8_t *p) { U16ToComponent(decltype(t)::value, v, p); });
+    });
 }
 
 Pixel FltToPixel(const FltPixel &f) { return {FloatToU16(f.R), FloatToU16(f.G), FloatToU16(f.B), FloatToU16(f.A)}; }
