@@ -1,7 +1,7 @@
 // orvane tools, orvane describe: what the class registry holds.
 #include <algorithm>
 #include <cctype>
-#include <cstdio>
+#include <fmt/core.h>
 #include <string>
 #include <vector>
 
@@ -114,7 +114,7 @@ void PrintInput(const Input &in) {
     const TagList &t = in.Tags();
     std::string line = "  " + std::string(in.ID().Text());
     line.resize(std::max<size_t>(line.size() + 1, 30), ' ');
-    line += std::string("\"") + in.Label() + "\"";
+    line += "\"" + (*in.Label() ? std::string(in.Label()) : in.Name()) + "\"";
     line.resize(std::max<size_t>(line.size() + 1, 58), ' ');
     line += TypeWord(in.DataType());
     if (t.Has(InputControl)) line += ", " + ControlWord(t.GetID(InputControl));
@@ -138,7 +138,7 @@ void PrintInput(const Input &in) {
     if (!in.IsVisible()) line += ", hidden";
     if (!in.IsExternal()) line += ", not animatable";
     if (in.Priority() != 0 && in.Priority() != PriorityImage) line += ", priority " + std::to_string(in.Priority());
-    std::printf("%s\n", line.c_str());
+    fmt::print("{}\n", line);
     const auto items = t.FindAll(ListAddItem);
     const auto ids = t.FindAll(ListItemId);
     if (!items.empty()) {
@@ -151,7 +151,7 @@ void PrintInput(const Input &in) {
             else if (in.DataType() == CLSID_DataType_Number)
                 list += " (" + std::to_string(i) + ")";
         }
-        std::printf("%s\n", list.c_str());
+        fmt::print("{}\n", list);
     }
 }
 
@@ -171,18 +171,18 @@ int RunTools(const std::vector<std::string> &args) {
     LoadLibrary();
     std::vector<const Registry *> rows = ClassRegistry ? ClassRegistry->Rows() : std::vector<const Registry *>{};
     std::sort(rows.begin(), rows.end(), [](const Registry *a, const Registry *b) { return a->ID() < b->ID(); });
-    std::printf("%-28s %-30s %-16s %-8s %-16s %s\n", "CLASS", "NAME", "KIND", "FLAGS", "CATEGORY", "BUILT");
+    fmt::print("{:<28} {:<30} {:<16} {:<8} {:<16} {}\n", "CLASS", "NAME", "KIND", "FLAGS", "CATEGORY", "BUILT");
     size_t shown = 0;
     for (const Registry *row : rows) {
         if (!search.empty() && !Matches(*row, search)) continue;
         // Abstract bases and hidden classes are no one's tools; --all shows them too.
         if (!all && (row->TypeFlags() == 0 || row->Tags().GetBool(RegHidden))) continue;
         const char *category = row->Tags().GetText(RegCategory, "-");
-        std::printf("%-28s %-30s %-16s %-8u %-16s %s\n", row->ID().Text(), row->DisplayName(),
-                    KindWord(row->TypeFlags()).c_str(), row->TypeFlags(), category, BuiltWord(*row));
+        fmt::print("{:<28} {:<30} {:<16} {:<8} {:<16} {}\n", row->ID().Text(), row->DisplayName(),
+                   KindWord(row->TypeFlags()).c_str(), row->TypeFlags(), category, BuiltWord(*row));
         ++shown;
     }
-    std::printf("%zu classes\n", shown);
+    fmt::print("{} classes\n", shown);
     return ExitOk;
 }
 
@@ -191,10 +191,10 @@ int RunDescribe(const std::vector<std::string> &args) {
     LoadLibrary();
     const Registry &row = FindClass(args[0]);
     const TagList &t = row.Tags();
-    std::printf("%s: \"%s\" (%s, kind %u)\n", row.ID().Text(), row.DisplayName(), KindWord(row.TypeFlags()).c_str(),
-                row.TypeFlags());
+    fmt::print("{}: \"{}\" ({}, kind {})\n", row.ID().Text(), row.DisplayName(), KindWord(row.TypeFlags()),
+               row.TypeFlags());
     auto field = [&t](const char *label, Tag tag) {
-        if (const char *text = t.GetText(tag)) std::printf("  %-14s %s\n", label, text);
+        if (const char *text = t.GetText(tag)) fmt::print("  {:<14} {}\n", label, text);
     };
     field("class word:", RegClassName);
     field("path:", RegPath);
@@ -202,10 +202,10 @@ int RunDescribe(const std::vector<std::string> &args) {
     field("abbreviation:", RegAbbreviation);
     field("help:", RegHelp);
     field("icon:", RegIcon);
-    if (!row.BaseID().IsNull()) std::printf("  %-14s %s\n", "base:", row.BaseID().Text());
-    if (const std::string a = Joined(t, RegAlias); !a.empty()) std::printf("  %-14s %s\n", "aliases:", a.c_str());
-    if (const std::string o = Joined(t, RegOldClassId); !o.empty()) std::printf("  %-14s %s\n", "old IDs:", o.c_str());
-    std::printf("  %-14s %s\n", "built:", BuiltWord(row));
+    if (!row.BaseID().IsNull()) fmt::print("  {:<14} {}\n", "base:", row.BaseID().Text());
+    if (const std::string a = Joined(t, RegAlias); !a.empty()) fmt::print("  {:<14} {}\n", "aliases:", a);
+    if (const std::string o = Joined(t, RegOldClassId); !o.empty()) fmt::print("  {:<14} {}\n", "old IDs:", o);
+    fmt::print("  {:<14} {}\n", "built:", BuiltWord(row));
     if (!(row.TypeFlags() & RegKindOperator) || !row.CanCreate()) return ExitOk;
 
     OrvaneDoc doc;
@@ -216,14 +216,13 @@ int RunDescribe(const std::vector<std::string> &args) {
         if (in->Page() != page) {
             page = in->Page();
             const auto &pages = op->Pages();
-            std::printf("\npage \"%s\"\n",
-                        page >= 0 && page < static_cast<int>(pages.size()) ? pages[page].name.c_str() : "Controls");
+            fmt::print("\npage \"{}\"\n",
+                       page >= 0 && page < static_cast<int>(pages.size()) ? pages[page].name : std::string("Controls"));
         }
         PrintInput(*in);
     }
-    std::printf("\noutputs\n");
-    for (const auto &out : op->Outputs())
-        std::printf("  %-28s %s\n", out->ID().Text(), TypeWord(out->DataType()).c_str());
+    fmt::print("\noutputs\n");
+    for (const auto &out : op->Outputs()) fmt::print("  {:<28} {}\n", out->ID().Text(), TypeWord(out->DataType()));
     return ExitOk;
 }
 
