@@ -8,6 +8,7 @@
 #include <cstring>
 #include <limits>
 #include <string>
+#include <tuple>
 #include <vector>
 
 #include "host/core/Tags.h"
@@ -142,6 +143,19 @@ std::vector<FltPixel> PutPattern(Image &img, unsigned seed) {
     return put;
 }
 
+// Size, depth and scales as one comparable value.
+std::tuple<int, int, int, double, double> Shape(const Image &img) {
+    return {img.Width(), img.Height(), img.Depth(), img.XScale(), img.YScale()};
+}
+
+// The integer code of component `index` in a run stored with `bpc` bytes per component.
+long CodeAt(const std::vector<uint8_t> &raw, int bpc, size_t index) {
+    if (bpc == 1) return raw[index];
+    uint16_t u;
+    std::memcpy(&u, &raw[index * 2], 2);
+    return u;
+}
+
 const FltPixel &PutAt(const std::vector<FltPixel> &put, const ImgRectI &dw, int x, int y) {
     return put[static_cast<size_t>(y - dw.y0) * dw.Width() + (x - dw.x0)];
 }
@@ -197,15 +211,11 @@ TEST(ImageFormat, FormatOfEveryDepth) {
 
 TEST(ImageWindows, DataWindowOnlyBeforeRows) {
     auto img = MakeImage(10, 6, 7);
-    EXPECT_EQ(img->Width(), 10);
-    EXPECT_EQ(img->Height(), 6);
     EXPECT_EQ(img->Frame(), ImgRectI(0, 0, 10, 6));
     EXPECT_EQ(img->DataWindow(), img->Frame());
     EXPECT_EQ(img->ValidWindow(), img->Frame());
-    EXPECT_EQ(img->XScale(), 1.0);
     img->SetScale(2.0, 0.5);
-    EXPECT_EQ(img->XScale(), 2.0);
-    EXPECT_EQ(img->YScale(), 0.5);
+    EXPECT_EQ(Shape(*img), std::make_tuple(10, 6, 7, 2.0, 0.5));
 
     img->SetDataWindow(ImgRectI(-4, -2, 7, 5));
     EXPECT_EQ(img->DataWindow(), ImgRectI(-4, -2, 7, 5));
@@ -367,13 +377,7 @@ TEST(ImagePixels, IntegerDepthsRoundToTheNearestCode) {
         StoreFlt(depth, in.data(), static_cast<int>(in.size()), raw.data());
         int wrong = 0;
         for (size_t i = 0; i < in.size(); ++i) {
-            const uint8_t *p = raw.data() + i * bpc * ch + (ch - 1) * bpc; // the alpha component
-            long got = bpc == 1 ? *p : 0;
-            if (bpc == 2) {
-                uint16_t u;
-                std::memcpy(&u, p, 2);
-                got = u;
-            }
+            const long got = CodeAt(raw, bpc, i * ch + ch - 1); // the alpha component
             if (got != codes[i] && ++wrong <= 5)
                 ADD_FAILURE() << "value " << in[i].A << " stored as " << got << ", nearest code " << codes[i];
         }
@@ -400,15 +404,7 @@ TEST(ImagePixels, FloatsStoreAsTheExactlyNearestCode) {
         for (size_t i = 0; i < in.size(); ++i) {
             const float src[4] = {in[i].R, in[i].G, in[i].B, in[i].A};
             for (int c = 0; c < 4; ++c) {
-                long got;
-                if (bpc == 1)
-                    got = raw[i * 4 + c];
-                else {
-                    uint16_t u;
-                    std::memcpy(&u, &raw[(i * 4 + c) * 2], 2);
-                    got = u;
-                }
-                const long want = NearestCode(src[c], max);
+                const long got = CodeAt(raw, bpc, i * 4 + c), want = NearestCode(src[c], max);
                 if (got != want && ++wrong <= 5)
                     ADD_FAILURE() << "float " << src[c] << " (x max = " << static_cast<double>(src[c]) * max
                                   << ") stored as " << got << ", nearest code " << want;
@@ -774,11 +770,7 @@ TEST(ImageServices, CopyOfImageIsDeep) {
     ASSERT_TRUE(copy);
     EXPECT_NE(copy.Get(), src.Get());
     EXPECT_EQ(copy->RefCount(), 1);
-    EXPECT_EQ(copy->Width(), 9);
-    EXPECT_EQ(copy->Height(), 7);
-    EXPECT_EQ(copy->Depth(), 6);
-    EXPECT_EQ(copy->XScale(), 2.0);
-    EXPECT_EQ(copy->YScale(), 0.5);
+    EXPECT_EQ(Shape(*copy), std::make_tuple(9, 7, 6, 2.0, 0.5));
     EXPECT_EQ(copy->DataWindow(), dw);
     EXPECT_EQ(copy->ValidWindow(), ImgRectI(0, 0, 5, 5));
     EXPECT_EQ(copy->GetCanvasColor(), src->GetCanvasColor());
@@ -881,11 +873,7 @@ TEST(NewImage, SizeDepthAndAspect) {
     Ref<Image> img = NewImageTagList({{ImgWidth, 20}, {ImgHeight, 10}, {ImgDepth, 5}, {ImgXScale, 2.0}});
     ASSERT_TRUE(img);
     EXPECT_EQ(img->RefCount(), 1);
-    EXPECT_EQ(img->Width(), 20);
-    EXPECT_EQ(img->Height(), 10);
-    EXPECT_EQ(img->Depth(), 5);
-    EXPECT_EQ(img->XScale(), 2.0);
-    EXPECT_EQ(img->YScale(), 1.0);
+    EXPECT_EQ(Shape(*img), std::make_tuple(20, 10, 5, 2.0, 1.0));
     EXPECT_EQ(img->DataWindow(), ImgRectI(0, 0, 20, 10));
     EXPECT_EQ(img->ValidWindow(), ImgRectI(0, 0, 20, 10));
     EXPECT_FALSE(img->IsNoData());
@@ -938,11 +926,7 @@ TEST(NewImage, LikeImageAndExplicitTags) {
 
     Ref<Image> same = NewImageTagList({{ImgLikeImage, like.Get()}});
     ASSERT_TRUE(same);
-    EXPECT_EQ(same->Width(), 30);
-    EXPECT_EQ(same->Height(), 20);
-    EXPECT_EQ(same->Depth(), 6);
-    EXPECT_EQ(same->XScale(), 2.0);
-    EXPECT_EQ(same->YScale(), 0.5);
+    EXPECT_EQ(Shape(*same), std::make_tuple(30, 20, 6, 2.0, 0.5));
     EXPECT_EQ(same->GetAttrL(ImgFullWidth), 60);
     EXPECT_EQ(same->GetAttrL(ImgField), 1);
     EXPECT_EQ(same->GetAttrD(ImgFieldOffset), 0.5);
@@ -959,11 +943,7 @@ TEST(NewImage, LikeImageAndExplicitTags) {
                                           {ImgField, 2},
                                           {ImgFullHeight, 99}});
     ASSERT_TRUE(changed);
-    EXPECT_EQ(changed->Width(), 7);
-    EXPECT_EQ(changed->Height(), 20);
-    EXPECT_EQ(changed->Depth(), 1);
-    EXPECT_EQ(changed->XScale(), 3.0);
-    EXPECT_EQ(changed->YScale(), 0.5);
+    EXPECT_EQ(Shape(*changed), std::make_tuple(7, 20, 1, 3.0, 0.5));
     EXPECT_EQ(changed->GetAttrL(ImgField), 2);
     EXPECT_EQ(changed->GetAttrL(ImgFullHeight), 99);
     EXPECT_EQ(changed->GetAttrL(ImgFullWidth), 60);
@@ -981,22 +961,23 @@ TEST(NewImage, WindowsNoDataCanvasAndAbort) {
     const FltPixel canvas{0.25f, 0.5f, 0.75f, 1.0f};
     std::atomic<bool> abort{false};
 
-    Ref<Image> a = NewImageTagList({{ImgWidth, 10}, {ImgHeight, 6}, {ImgDataWindow, &dw}});
-    ASSERT_TRUE(a);
-    EXPECT_EQ(a->DataWindow(), dw);
-    EXPECT_EQ(a->ValidWindow(), dw);
-
-    Ref<Image> b = NewImageTagList({{ImgWidth, 10}, {ImgHeight, 6}, {ImgDataWindow, &dw}, {ImgValidWindow, &vw}});
-    ASSERT_TRUE(b);
-    EXPECT_EQ(b->ValidWindow(), ImgRectI(2, 2, 15, 8)); // clipped to the data window
-
-    Ref<Image> c = NewImageTagList({{ImgWidth, 10}, {ImgHeight, 6}, {ImgValidWindow, &vw}});
-    ASSERT_TRUE(c);
-    EXPECT_EQ(c->ValidWindow(), ImgRectI(2, 2, 10, 6));
-
-    Ref<Image> d = NewImageTagList({{ImgWidth, 10}, {ImgHeight, 6}, {ImgDataWindow, &dw}, {ImgValidWindow, nullptr}});
-    ASSERT_TRUE(d);
-    EXPECT_EQ(d->ValidWindow(), dw); // null: the data window
+    struct Case {
+        const ImgRectI *data, *valid;
+        bool validTag;
+        ImgRectI wantData, wantValid;
+    };
+    const ImgRectI frame(0, 0, 10, 6);
+    for (const Case &w : {Case{&dw, nullptr, false, dw, dw}, Case{&dw, &vw, true, dw, ImgRectI(2, 2, 15, 8)},
+                          Case{nullptr, &vw, true, frame, ImgRectI(2, 2, 10, 6)},
+                          Case{&dw, nullptr, true, dw, dw}}) { // a null valid window: the data window
+        TagList tags{{ImgWidth, 10}, {ImgHeight, 6}};
+        if (w.data) tags.Add({ImgDataWindow, w.data});
+        if (w.validTag) tags.Add({ImgValidWindow, w.valid});
+        Ref<Image> img = NewImageTagList(tags);
+        ASSERT_TRUE(img);
+        EXPECT_EQ(img->DataWindow(), w.wantData);
+        EXPECT_EQ(img->ValidWindow(), w.wantValid);
+    }
 
     Ref<Image> e = NewImageTagList(
         {{ImgWidth, 10}, {ImgHeight, 6}, {ImgNoData, true}, {ImgCanvasColor, &canvas}, {ImgAbortFlag, &abort}});
