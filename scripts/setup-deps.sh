@@ -4,7 +4,10 @@ set -euo pipefail
 packages=(
   build-essential cmake ninja-build pkg-config ccache
   libtbb-dev libfmt-dev libgtest-dev libgmock-dev libbenchmark-dev
+  libjpeg62-turbo-dev libpng-dev zlib1g-dev libopenexr-dev
   clang-format
+  # Tests compare our file formats with these programs.
+  netpbm imagemagick openexr libjpeg-turbo-progs
 )
 missing=()
 for p in "${packages[@]}"; do

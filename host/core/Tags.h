@@ -232,6 +232,22 @@ constexpr Tag ImgFieldOffset = 0x20000007; ///< Y offset of a field, in image he
 constexpr Tag ImgCanvasColor = 0x60020008;
 constexpr Tag ImgAbortFlag = 0x60020009;
 
+/// A channel the image holds (repeated; the value is the channel's slot).
+constexpr Tag ImgChannel = 0x18020000;
+
+// ---- Frame requests to clips and formats ----------------------------------
+constexpr Tag ClipFrameField = 0x100000cc;        ///< field number, -1 for a whole frame
+constexpr Tag ClipFrameProxyScale = 0x100000cd;   ///< divisor of width and height
+constexpr Tag ClipFrameQuickProxy = 0x10000065;   ///< a quick request at proxy scale
+constexpr Tag ClipFrameAbort = 0x60000064;        ///< const std::atomic<bool> *: the render's abort word
+constexpr Tag ClipFrameUseAlternate = 0x10000002; ///< read the clip's alternate (proxy) file
+constexpr Tag ClipFrameHeaderOnly = 0x10000069;   ///< pre-calculation: header data only
+constexpr Tag ClipFrameRegion = 0x600000c9;       ///< const ImageDomain *: the region to decode
+constexpr Tag ClipFrameCachePath = 0x30000000;    ///< local cache path
+constexpr Tag ClipFrameUseLocalCache = 0x10000003;
+/// A format attribute: the Raw format restores the image's saved tags.
+constexpr Tag FormatRestoreTags = 0x1000012c;
+
 // ---- Whole-image work ---------------------------------------------------
 constexpr Tag WorkOperator = 0x60010000;
 constexpr Tag WorkRequest = 0x60010001;

@@ -160,6 +160,7 @@ Ref<Image> CopyOfImage(const Image *src) {
     img->validWindow_ = src->validWindow_;
     img->canvas_ = src->canvas_;
     img->attrs_ = src->attrs_;
+    img->metadata_ = src->metadata_;
     img->abort_ = src->abort_;
     img->noData_ = src->noData_;
     img->opaque_ = src->opaque_;

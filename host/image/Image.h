@@ -138,6 +138,11 @@ public:
     void SetAbortFlag(const std::atomic<bool> *flag) { abort_ = flag; }
     const std::atomic<bool> *AbortFlag() const { return abort_; }
 
+    /// The image's script table of metadata (colour space, gamma, time code,
+    /// format attributes); an empty table when there is none.
+    ScriptVal &Metadata() { return metadata_; }
+    const ScriptVal &Metadata() const { return metadata_; }
+
     // ---- auxiliary channels ----
     /// Adds a float plane for `kind` over the data window (zeroed).
     bool AddAuxChannel(AuxChannelKind kind);
@@ -182,6 +187,7 @@ private:
     };
     std::vector<AuxPlane> aux_;
     const std::atomic<bool> *abort_ = nullptr;
+    ScriptVal metadata_ = ScriptVal::Table();
     bool noData_ = false, readOnly_ = false, opaque_ = false, simple_ = true;
 };
 

@@ -1,0 +1,81 @@
+#include "host/media/IOClass.h"
+
+#include <algorithm>
+#include <cerrno>
+#include <cstring>
+
+namespace Orvane {
+
+IOClass::~IOClass() = default;
+
+std::unique_ptr<FileIO> FileIO::Open(const std::string &path, Mode mode, std::string &error) {
+    std::FILE *f = std::fopen(path.c_str(), mode == Mode::Read ? "rb" : "wb");
+    if (!f) {
+        error = path + ": " + std::strerror(errno);
+        return nullptr;
+    }
+    return std::unique_ptr<FileIO>(new FileIO(f, path));
+}
+
+FileIO::~FileIO() { Close(); }
+
+int64_t FileIO::Read(void *buffer, int64_t bytes) {
+    if (!file_ || bytes <= 0) return 0;
+    return static_cast<int64_t>(std::fread(buffer, 1, static_cast<size_t>(bytes), file_));
+}
+
+int64_t FileIO::Write(const void *buffer, int64_t bytes) {
+    if (!file_ || bytes <= 0) return 0;
+    return static_cast<int64_t>(std::fwrite(buffer, 1, static_cast<size_t>(bytes), file_));
+}
+
+bool FileIO::Seek(int64_t offset, int origin) {
+    if (!file_) return false;
+    const int whence = origin == SeekRelative ? SEEK_CUR : SEEK_SET;
+    if (whence == SEEK_SET && offset < 0) return false;
+    return fseeko(file_, static_cast<off_t>(offset), whence) == 0;
+}
+
+int64_t FileIO::Tell() const { return file_ ? static_cast<int64_t>(ftello(file_)) : -1; }
+
+int64_t FileIO::Size() {
+    if (!file_) return -1;
+    const off_t here = ftello(file_);
+    if (fseeko(file_, 0, SEEK_END) != 0) return -1;
+    const off_t end = ftello(file_);
+    fseeko(file_, here, SEEK_SET);
+    return static_cast<int64_t>(end);
+}
+
+bool FileIO::Close() {
+    if (!file_) return true;
+    const bool ok = std::fflush(file_) == 0 && !std::ferror(file_);
+    const bool closed = std::fclose(file_) == 0;
+    file_ = nullptr;
+    return ok && closed;
+}
+
+int64_t MemoryIO::Read(void *buffer, int64_t bytes) {
+    if (bytes <= 0 || pos_ >= Size()) return 0;
+    const int64_t n = std::min(bytes, Size() - pos_);
+    std::memcpy(buffer, data_.data() + pos_, static_cast<size_t>(n));
+    pos_ += n;
+    return n;
+}
+
+int64_t MemoryIO::Write(const void *buffer, int64_t bytes) {
+    if (bytes <= 0) return 0;
+    if (pos_ + bytes > Size()) data_.resize(static_cast<size_t>(pos_ + bytes));
+    std::memcpy(data_.data() + pos_, buffer, static_cast<size_t>(bytes));
+    pos_ += bytes;
+    return bytes;
+}
+
+bool MemoryIO::Seek(int64_t offset, int origin) {
+    const int64_t to = origin == SeekRelative ? pos_ + offset : offset;
+    if (to < 0) return false;
+    pos_ = to;
+    return true;
+}
+
+} // namespace Orvane
