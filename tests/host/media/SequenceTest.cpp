@@ -1,0 +1,101 @@
+// Numbered file sequences: parsing names, writing frame names, matching and
+// scanning a folder with gaps.
+#include <gtest/gtest.h>
+
+#include <filesystem>
+#include <fstream>
+#include <unistd.h>
+
+#include "host/media/Sequence.h"
+
+namespace Orvane::sequencetest {
+namespace {
+
+TEST(SequenceName, ParsesTheLastNumberBeforeTheExtension) {
+    const struct {
+        const char *path, *folder, *prefix, *suffix;
+        int64_t number;
+        int padding;
+        bool hasNumber;
+    } cases[] = {
+        {"/a/b/shot_v2.0042.exr", "/a/b/", "shot_v2.", ".exr", 42, 4, true},
+        {"shot.1.png", "", "shot.", ".png", 1, 1, true},
+        {"plate.00000001.dpx", "", "plate.", ".dpx", 1, 8, true},
+        {"shot.-0005.exr", "", "shot.", ".exr", -5, 4, true},
+        {"shot_-12.tga", "", "shot_", ".tga", -12, 2, true},
+        {"-7.png", "", "", ".png", -7, 1, true},
+        {"shot-0005.exr", "", "shot-", ".exr", 5, 4, true}, // '-' after a letter is part of the name
+        {"name0012_final.tif", "", "name", "_final.tif", 12, 4, true},
+        {"still.exr", "", "still.exr", "", 0, 0, false},
+        {"dir.0001/still.exr", "dir.0001/", "still.exr", "", 0, 0, false},
+        {".hidden12", "", ".hidden", "", 12, 2, true}, // a leading dot is no extension
+    };
+    for (const auto &c : cases) {
+        SCOPED_TRACE(c.path);
+        const SequenceName s = ParseSequenceName(c.path);
+        EXPECT_EQ(s.folder, c.folder);
+        EXPECT_EQ(s.prefix, c.prefix);
+        EXPECT_EQ(s.suffix, c.suffix);
+        EXPECT_EQ(s.hasNumber, c.hasNumber);
+        if (!c.hasNumber) continue;
+        EXPECT_EQ(s.number, c.number);
+        EXPECT_EQ(s.padding, c.padding);
+        EXPECT_EQ(SequencePath(s, s.number), c.path) << "a parsed name writes back as it was";
+    }
+}
+
+TEST(SequenceName, FrameNamesKeepThePaddingAndGrowWhenNeeded) {
+    const SequenceName s = ParseSequenceName("out/render.0100.exr");
+    EXPECT_EQ(SequencePath(s, 7), "out/render.0007.exr");
+    EXPECT_EQ(SequencePath(s, 12345), "out/render.12345.exr");
+    EXPECT_EQ(SequencePath(s, -23), "out/render.-0023.exr");
+    EXPECT_EQ(SequenceDisplayName(s), "out/render.####.exr");
+    const SequenceName one = ParseSequenceName("f9.png");
+    EXPECT_EQ(SequencePath(one, 10), "f10.png");
+    EXPECT_EQ(SequenceDisplayName(one), "f#.png");
+    for (int padding = 1; padding <= 8; ++padding) {
+        SequenceName p = ParseSequenceName("x." + std::string(padding, '0') + ".raw");
+        ASSERT_EQ(p.padding, padding);
+        const std::string name = SequencePath(p, 1001);
+        int64_t number = 0;
+        EXPECT_TRUE(MatchesSequence(p, name, number)) << name;
+        EXPECT_EQ(number, 1001);
+    }
+}
+
+TEST(SequenceName, MatchingRespectsPaddingPrefixAndSuffix) {
+    const SequenceName four = ParseSequenceName("shot.0001.exr");
+    const SequenceName one = ParseSequenceName("shot.1.exr");
+    const struct {
+        const char *file;
+        bool inFour, inOne;
+    } cases[] = {
+        {"shot.0002.exr", true, false},   {"shot.12345.exr", true, true},  {"shot.012345.exr", false, false},
+        {"shot.002.exr", false, false},   {"shot.7.exr", false, true},     {"shot.0002.png", false, false},
+        {"shots.0002.exr", false, false}, {"shot.-0003.exr", true, false}, {"shot.exr", false, false},
+    };
+    for (const auto &c : cases) {
+        int64_t n;
+        EXPECT_EQ(MatchesSequence(four, c.file, n), c.inFour) << c.file;
+        EXPECT_EQ(MatchesSequence(one, c.file, n), c.inOne) << c.file;
+    }
+}
+
+TEST(SequenceScan, FindsTheFramesAndTheGapsInAFolder) {
+    const std::filesystem::path dir =
+        std::filesystem::temp_directory_path() / ("orvane-seq-" + std::to_string(getpid()));
+    std::filesystem::create_directories(dir);
+    for (const char *name : {"a.0003.exr", "a.0004.exr", "a.0007.exr", "a.0010.exr", "a.-0001.exr", "a.004.exr",
+                             "b.0005.exr", "a.0005.png"})
+        std::ofstream(dir / name) << "x";
+    std::filesystem::create_directories(dir / "a.0006.exr"); // a folder is no frame
+    const SequenceScan scan = ScanSequence(ParseSequenceName((dir / "a.0003.exr").string()));
+    EXPECT_EQ(scan.frames, (std::vector<int64_t>{-1, 3, 4, 7, 10}));
+    const std::vector<std::pair<int64_t, int64_t>> gaps{{0, 2}, {5, 6}, {8, 9}};
+    EXPECT_EQ(scan.gaps, gaps);
+    EXPECT_TRUE(ScanSequence(ParseSequenceName((dir / "nothing.0001.exr").string())).frames.empty());
+    std::filesystem::remove_all(dir);
+}
+
+} // namespace
+} // namespace Orvane::sequencetest
