@@ -33,5 +33,6 @@ std::vector<double> ParseNumberList(const std::string &text, size_t count, const
 int RunTools(const std::vector<std::string> &args);
 int RunDescribe(const std::vector<std::string> &args);
 int RunEval(const std::vector<std::string> &args);
+int RunInfo(const std::vector<std::string> &args);
 
 } // namespace Orvane::Cli

@@ -17,6 +17,8 @@ commands:
   eval FLOW TOOL[.OUTPUT] [--time T] [--roi x0,y0,x1,y1] [--pixel X,Y ...]
        [--set TOOL.INPUT=VALUE ...] [--threads N] [--json]
                                  evaluate one output of a flow document and print what it holds
+  info FILE...                   what the formats read from files or sequences
+                                 (format, size, depth, windows, frames and gaps)
   version                        print the program version
 
 exit codes: 0 done, 2 bad command line or document, 3 a tool failed
@@ -37,6 +39,7 @@ int main(int argc, char **argv) {
         if (command == "tools") return RunTools(args);
         if (command == "describe") return RunDescribe(args);
         if (command == "eval") return RunEval(args);
+        if (command == "info") return RunInfo(args);
         if (command == "version") {
             std::printf("orvane %s\n", ORVANE_VERSION);
             return ExitOk;

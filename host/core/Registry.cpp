@@ -67,6 +67,19 @@ Registry *RegistryList::Add(const OvID &id, TagList &tags) {
     bool initNow;
     {
         std::lock_guard<std::mutex> guard(lock_);
+        // A class that is built replaces the placeholder row of its ID, in
+        // whichever order the two arrive.
+        if (auto it = byId_.find(id); it != byId_.end()) {
+            const bool newPlanned = tags.GetBool(RegPlanned), oldPlanned = it->second->tags_.GetBool(RegPlanned);
+            if (newPlanned && !oldPlanned) return nullptr;
+            if (!newPlanned && oldPlanned) {
+                const Registry *old = it->second;
+                auto at = std::find_if(rows_.begin(), rows_.end(), [old](auto &r) { return r.get() == old; });
+                retired_.push_back(std::move(*at)); // kept, so no later row takes its address
+                rows_.erase(at);
+                Reindex();
+            }
+        }
         rows_.push_back(std::unique_ptr<Registry>(new Registry(id, tags, this)));
         row = rows_.back().get();
         byId_[id] = row;

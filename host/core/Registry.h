@@ -33,6 +33,9 @@ class ORVANE_API Registry {
 public:
     /// Enters a row into *list (made on first use), keeping a copy of the
     /// tags with their text, and returns it. The row stays until Remove().
+    /// A row that carries RegPlanned (a class not built yet) gives way to a
+    /// built row of the same ID: entered after it, it is not entered (null);
+    /// entered before it, the built row replaces it.
     static Registry *_Init(RegistryList **list, const OvID &id, TagList &tags);
 
     OvID ID() const { return id_; }
@@ -95,6 +98,7 @@ private:
 
     mutable std::mutex lock_;
     std::vector<std::unique_ptr<Registry>> rows_;
+    std::vector<std::unique_ptr<Registry>> retired_; ///< placeholders a built class replaced
     std::unordered_map<OvID, Registry *> byId_;
     std::unordered_map<OvID, Registry *> byOldId_;
     bool initDone_ = false;

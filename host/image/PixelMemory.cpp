@@ -6,6 +6,7 @@
 #include <list>
 #include <mutex>
 #include <sys/mman.h>
+#include <unistd.h>
 
 #include "host/core/Parallel.h"
 
@@ -54,8 +55,20 @@ void ZeroLarge(uint8_t *block, size_t bytes) {
 
 } // namespace
 
+/// The largest block one image may take: half the machine's memory. A file
+/// header that claims more is refused here instead of taking the machine down.
+static size_t LargestBlock() {
+    static const size_t largest = [] {
+        const long pages = sysconf(_SC_PHYS_PAGES), pageSize = sysconf(_SC_PAGESIZE);
+        if (pages <= 0 || pageSize <= 0) return size_t(16) << 30;
+        return static_cast<size_t>(pages) / 2 * static_cast<size_t>(pageSize);
+    }();
+    return largest;
+}
+
 uint8_t *AllocPixels(size_t bytes) {
     if (bytes == 0) bytes = 1;
+    if (bytes > LargestBlock()) return nullptr;
     if (bytes < LargeBlock) return static_cast<uint8_t *>(std::calloc(bytes, 1));
     PixelPool &p = ThePixelPool();
     uint8_t *block = nullptr;

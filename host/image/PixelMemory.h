@@ -19,7 +19,8 @@
 
 namespace Orvane {
 
-/// A zeroed block of `bytes`; null when memory ran out.
+/// A zeroed block of `bytes`; null when memory ran out or the block would
+/// take more than half the machine's memory.
 ORVANE_API uint8_t *AllocPixels(size_t bytes);
 /// Gives a block from AllocPixels back; `bytes` must be the size asked.
 ORVANE_API void FreePixels(uint8_t *block, size_t bytes);

@@ -20,6 +20,7 @@ RegistrationBase::RegistrationBase(const OvID &id, const OvID *baseId, ClassFact
 }
 
 RegistrationBase::~RegistrationBase() {
+    // A placeholder that gave way to a built class has no row of its own.
     if (ClassRegistry && row_) ClassRegistry->Remove(row_);
     ClearTypeInfo(*type_);
 }

@@ -82,3 +82,15 @@ TEST(PixelMemory, ThePoolKeepsNoMoreThanItsLimitOldestLeavingFirst) {
 
 } // namespace
 } // namespace Orvane::pixelmemorytest
+
+namespace Orvane::pixelmemorytest {
+namespace {
+
+TEST(PixelMemory, ABlockBeyondHalfTheMachinesMemoryIsRefusedNotAttempted) {
+    // A damaged header may claim any size; the allocation must fail cleanly.
+    EXPECT_EQ(AllocPixels(size_t(1) << 62), nullptr);
+    EXPECT_EQ(AllocPixels(static_cast<size_t>(-1)), nullptr);
+}
+
+} // namespace
+} // namespace Orvane::pixelmemorytest

@@ -119,3 +119,39 @@ TEST_F(LibraryRegistry, NonToolClassesAreNotAddedToFlows) {
 
 } // namespace
 } // namespace Orvane::librarytest
+
+#include "operators/frame/ClassTable.h"
+
+namespace Orvane::librarytest {
+namespace {
+
+/// Every class of the catalogue stands in the registry once, with the
+/// identity the catalogue gives it, whether it is built or still planned.
+TEST_F(LibraryRegistry, BuiltClassesCarryTheirCatalogueIdentity) {
+    for (const ClassDesc &d : PlannedClasses()) {
+        SCOPED_TRACE(d.id);
+        const Registry *row = ClassRegistry->Find(OvID(d.id));
+        if (!d.creatable && !d.classWord) continue; // a bare marker row
+        ASSERT_NE(row, nullptr);
+        EXPECT_EQ(row->TypeFlags(), d.kind);
+        for (auto [tag, text] : {std::pair{RegPath, d.path},
+                                 {RegName, d.name},
+                                 {RegCategory, d.category},
+                                 {RegAbbreviation, d.abbreviation},
+                                 {RegHelp, d.help},
+                                 {RegIcon, d.icon}}) {
+            const char *have = row->Tags().GetText(tag);
+            EXPECT_STREQ(have ? have : "", text ? text : "") << std::hex << tag;
+        }
+        for (const TagItem &item : d.attrs.Items()) {
+            if (KindOfTag(item.tag) == TagKind::Text) continue; // repeated names are checked by the table test
+            EXPECT_TRUE(row->Tags().Has(item.tag)) << std::hex << item.tag;
+            if (KindOfTag(item.tag) == TagKind::Integer) {
+                EXPECT_EQ(row->Tags().GetLong(item.tag), item.AsInt());
+            }
+        }
+    }
+}
+
+} // namespace
+} // namespace Orvane::librarytest
