@@ -166,3 +166,32 @@ TEST(CliEval, AToolThatIsNotBuiltFailsWithExitThree) {
 
 } // namespace
 } // namespace Orvane::clitest
+
+namespace Orvane::clitest {
+namespace {
+
+TEST(CliInfo, DescribesASequenceWithItsGapsAndRefusesABrokenFile) {
+    if (std::system("command -v convert >/dev/null 2>&1") != 0)
+        GTEST_SKIP() << "ImageMagick's convert is not installed";
+    TempDir dir;
+    for (const char *name : {"seq.0001.png", "seq.0002.png", "seq.0004.png"}) {
+        const std::string cmd = "convert -size 4x3 xc:red " + Quote((dir.Path() / name).string());
+        ASSERT_EQ(std::system(cmd.c_str()), 0);
+    }
+    const CliRun r = Orvane("info " + Quote((dir.Path() / "seq.0002.png").string()));
+    EXPECT_EQ(r.exitCode, 0) << r.err;
+    EXPECT_TRUE(Contains(r.out, "seq.####.png")) << r.out;
+    EXPECT_TRUE(Contains(r.out, "PNG Files")) << r.out;
+    EXPECT_TRUE(Contains(r.out, "4 x 3")) << r.out;
+    EXPECT_TRUE(Contains(r.out, "frames        1 - 4 (3 files)")) << r.out;
+    EXPECT_TRUE(Contains(r.out, "missing       3")) << r.out;
+
+    const auto broken = dir.File("broken.png", "\x89PNG\r\n\x1a\n but then nothing sensible");
+    const CliRun bad = Orvane("info " + Quote(broken.string()));
+    EXPECT_EQ(bad.exitCode, 3);
+    EXPECT_TRUE(Contains(bad.err, "ERROR: ")) << bad.err;
+    EXPECT_TRUE(Contains(bad.err, "broken.png")) << bad.err;
+}
+
+} // namespace
+} // namespace Orvane::clitest
