@@ -229,6 +229,7 @@ constexpr Tag ImgField = 0x1002000f; ///< field number; -1 for a whole frame
 constexpr Tag ImgFullXScale = 0x20000005;
 constexpr Tag ImgFullYScale = 0x20000006;
 constexpr Tag ImgFieldOffset = 0x20000007; ///< Y offset of a field, in image heights
+constexpr Tag ImgTimeCode = 0x10020012;    ///< time code of the frame
 constexpr Tag ImgCanvasColor = 0x60020008;
 constexpr Tag ImgAbortFlag = 0x60020009;
 

@@ -47,8 +47,6 @@ static ClassRegistration<RawFormat, ImageFormat> s_RawFormatReg(CLSID_RawFormat,
 
 namespace raw_format_detail {
 
-/// The time code attribute of an image read from a file.
-constexpr Tag RawTimeCodeTag = 0x10020012;
 constexpr uint32_t FlagOpaque = 1, FlagSimple = 2;
 constexpr uint32_t kMetadataLimit = 0x10000;
 constexpr int kAuxKinds = static_cast<int>(AuxChannelKind::Count);
@@ -389,7 +387,7 @@ bool RawFormat::LoadFrameTagList(unsigned frame, Ref<Image> &image, const TagLis
     TagList attrs;
     const uint8_t *h = hdr_;
     if (const int v = LE::GetS32(h + 108); v != 1 && v > 0) attrs.Set({ImgProxyScale, v});
-    if (const int v = LE::GetS32(h + 116); v != 0) attrs.Set({RawTimeCodeTag, v});
+    if (const int v = LE::GetS32(h + 116); v != 0) attrs.Set({ImgTimeCode, v});
     if (const int v = LE::GetS32(h + 120); v > 0) attrs.Set({ImgFullWidth, v});
     if (const int v = LE::GetS32(h + 124); v > 0) attrs.Set({ImgFullHeight, v});
     if (const double v = LE::GetDouble(h + 128); std::isfinite(v) && v > 0) attrs.Set({ImgFullXScale, v});
@@ -570,7 +568,7 @@ bool RawFormat::SaveHeader(IOClass *stream, Image *image) {
     LE::PutDouble(h + 96, image->GetAttrD(ImgFieldOffset, 0.0));
     LE::Put32(h + 104, (image->IsOpaque() ? FlagOpaque : 0) | (image->IsSimple() ? FlagSimple : 0));
     LE::Put32(h + 108, static_cast<uint32_t>(image->GetAttrL(ImgProxyScale, 1)));
-    LE::Put32(h + 116, static_cast<uint32_t>(image->GetAttrL(RawTimeCodeTag, 0)));
+    LE::Put32(h + 116, static_cast<uint32_t>(image->GetAttrL(ImgTimeCode, 0)));
     LE::Put32(h + 120, static_cast<uint32_t>(image->GetAttrL(ImgFullWidth, 0)));
     LE::Put32(h + 124, static_cast<uint32_t>(image->GetAttrL(ImgFullHeight, 0)));
     LE::PutDouble(h + 128, image->GetAttrD(ImgFullXScale, 0.0));
