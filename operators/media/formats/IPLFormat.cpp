@@ -33,7 +33,8 @@ constexpr double kDefaultQuality = 93.0;
 
 } // namespace iplformat_detail
 
-IPLFormat::IPLFormat(const Registry *reg, const ScriptVal &args, const TagList &tags) : ImageFormat(reg, args, tags) {}
+IPLFormat::IPLFormat(const Registry *reg, const ScriptVal &args, const TagList &tags)
+    : JpegFamily(reg, args, tags, true) {}
 
 bool IPLFormat::CheckMarkers(IOClass *stream) {
     uint8_t head[16];
@@ -66,47 +67,11 @@ void IPLFormat::SetupSave(Operator *tool, Request *req) {
     quality_ = std::clamp(static_cast<int>(std::lround(q)), 0, 100);
 }
 
-bool IPLFormat::LoadHeader(IOClass *stream) {
-    io = stream;
-    if (!io) return Fail("no stream");
-    start_ = io->Tell();
-    if (!CheckMarkers(io)) return Fail("not an IPL file");
-    JpegStream::HeaderInfo info;
-    std::string why;
-    if (!JpegStream::ReadHeader(io, proxyScale, true, info, why)) return Fail(why);
-    width = info.width;
-    height = info.height;
-    aspectX = info.aspectX;
-    aspectY = info.aspectY;
-    depth = DepthRGBAInt8;
-    fullWidth_ = info.fullWidth;
-    fullHeight_ = info.fullHeight;
-    metadata = info.metadata;
-    return true;
-}
-
-bool IPLFormat::LoadFrameTagList(unsigned frame, Ref<Image> &image, const TagList &tags) {
-    if (!ImageFormat::LoadFrameTagList(frame, image, tags)) return false;
-    if (proxyScale > 1) image->SetAttrsTagList({{ImgFullWidth, fullWidth_}, {ImgFullHeight, fullHeight_}});
-    if (tags.GetBool(ClipFrameHeaderOnly) || image->IsNoData()) return true;
-    if (!io->Seek(start_, IOClass::SeekAbsolute)) return Fail("seek error");
-    std::string why;
-    if (!JpegStream::DecodeInto(io, proxyScale, true, *image, abortFlag, why)) return Fail(why);
-    return true;
-}
-
-bool IPLFormat::SaveHeader(IOClass *stream, Image *) {
-    io = stream;
-    return io ? true : Fail("no stream");
-}
-
-bool IPLFormat::SaveFrame(unsigned, Image *image) {
-    if (!io || !image) return Fail("nothing to write");
+JpegStream::EncodeSettings IPLFormat::SaveSettings() const {
     JpegStream::EncodeSettings s;
     s.fourComponents = true;
     s.quality = quality_;
-    std::string why;
-    return JpegStream::Encode(io, *image, s, abortFlag, why) || Fail(why);
+    return s;
 }
 
 int64_t IPLFormat::PredictFileSize(Image *image) {

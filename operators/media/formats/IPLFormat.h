@@ -6,29 +6,27 @@
 // Save option: Quality (0..100, the libjpeg quality).
 //
 // Thread safety: one object serves one clip, which serialises its use.
-#include "host/media/ImageFormat.h"
+#include "operators/media/formats/JpegFamily.h"
 
 namespace Orvane {
 
-class IPLFormat : public ImageFormat {
+class IPLFormat : public JpegFamily {
 public:
     IPLFormat(const Registry *reg, const ScriptVal &args, const TagList &tags);
 
     bool CheckFormat(IOClass *io) override;
     void AddSaveInputs(Operator *tool) override;
     void SetupSave(Operator *tool, Request *req) override;
-    bool LoadHeader(IOClass *io) override;
-    bool LoadFrameTagList(unsigned frame, Ref<Image> &image, const TagList &tags) override;
-    bool SaveHeader(IOClass *io, Image *image) override;
-    bool SaveFrame(unsigned frame, Image *image) override;
     int64_t PredictFileSize(Image *image) override;
+
+protected:
+    bool AcceptsStream(IOClass *io) override { return CheckMarkers(io); }
+    JpegStream::EncodeSettings SaveSettings() const override;
 
 private:
     /// True when the 16 bytes at the stream's position start an IPL file;
     /// the position is kept.
     bool CheckMarkers(IOClass *io);
-    int64_t start_ = 0;
-    int fullWidth_ = 0, fullHeight_ = 0; ///< stored size, before the proxy scale
     int quality_ = 93;
 };
 

@@ -37,7 +37,7 @@ double InputValue(Operator *tool, Request *req, const char *id, double def) {
 } // namespace jpegformat_detail
 
 JpegFormat::JpegFormat(const Registry *reg, const ScriptVal &args, const TagList &tags)
-    : ImageFormat(reg, args, tags) {}
+    : JpegFamily(reg, args, tags, false) {}
 
 bool JpegFormat::CheckFormat(IOClass *io) {
     uint8_t head[3];
@@ -95,47 +95,12 @@ void JpegFormat::SetupSave(Operator *tool, Request *req) {
                : 0;
 }
 
-bool JpegFormat::LoadHeader(IOClass *stream) {
-    io = stream;
-    if (!io) return Fail("no stream");
-    start_ = io->Tell();
-    JpegStream::HeaderInfo info;
-    std::string why;
-    if (!JpegStream::ReadHeader(io, proxyScale, false, info, why)) return Fail(why);
-    width = info.width;
-    height = info.height;
-    aspectX = info.aspectX;
-    aspectY = info.aspectY;
-    depth = DepthRGBAInt8;
-    fullWidth_ = info.fullWidth;
-    fullHeight_ = info.fullHeight;
-    metadata = info.metadata;
-    return true;
-}
-
-bool JpegFormat::LoadFrameTagList(unsigned frame, Ref<Image> &image, const TagList &tags) {
-    if (!ImageFormat::LoadFrameTagList(frame, image, tags)) return false;
-    if (proxyScale > 1) image->SetAttrsTagList({{ImgFullWidth, fullWidth_}, {ImgFullHeight, fullHeight_}});
-    if (tags.GetBool(ClipFrameHeaderOnly) || image->IsNoData()) return true;
-    if (!io->Seek(start_, IOClass::SeekAbsolute)) return Fail("seek error");
-    std::string why;
-    if (!JpegStream::DecodeInto(io, proxyScale, false, *image, abortFlag, why)) return Fail(why);
-    return true;
-}
-
-bool JpegFormat::SaveHeader(IOClass *stream, Image *) {
-    io = stream;
-    return io ? true : Fail("no stream");
-}
-
-bool JpegFormat::SaveFrame(unsigned, Image *image) {
-    if (!io || !image) return Fail("nothing to write");
+JpegStream::EncodeSettings JpegFormat::SaveSettings() const {
     JpegStream::EncodeSettings s;
     s.quality = quality_;
     s.chromaSubsampling = chromaSubsampling_;
     s.dpi = dpi_;
-    std::string why;
-    return JpegStream::Encode(io, *image, s, abortFlag, why) || Fail(why);
+    return s;
 }
 
 int64_t JpegFormat::PredictFileSize(Image *image) {

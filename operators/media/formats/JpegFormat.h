@@ -7,11 +7,11 @@
 // Save options: Quality, ChromaSubsampling, SetCustomResolution, ResolutionDPI.
 //
 // Thread safety: one object serves one clip, which serialises its use.
-#include "host/media/ImageFormat.h"
+#include "operators/media/formats/JpegFamily.h"
 
 namespace Orvane {
 
-class JpegFormat : public ImageFormat {
+class JpegFormat : public JpegFamily {
 public:
     JpegFormat(const Registry *reg, const ScriptVal &args, const TagList &tags);
 
@@ -19,15 +19,12 @@ public:
     void AddSaveInputs(Operator *tool) override;
     void NotifyChangedSave(Operator *tool, Input *in, Parameter *param, double time) override;
     void SetupSave(Operator *tool, Request *req) override;
-    bool LoadHeader(IOClass *io) override;
-    bool LoadFrameTagList(unsigned frame, Ref<Image> &image, const TagList &tags) override;
-    bool SaveHeader(IOClass *io, Image *image) override;
-    bool SaveFrame(unsigned frame, Image *image) override;
     int64_t PredictFileSize(Image *image) override;
 
+protected:
+    JpegStream::EncodeSettings SaveSettings() const override;
+
 private:
-    int64_t start_ = 0;                  ///< stream position of the file's first byte
-    int fullWidth_ = 0, fullHeight_ = 0; ///< stored size, before the proxy scale
     int quality_ = 97;
     bool chromaSubsampling_ = false;
     int dpi_ = 0; ///< 0: no custom resolution
