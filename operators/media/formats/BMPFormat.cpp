@@ -13,6 +13,7 @@
 #include "host/media/IOClass.h"
 #include "operators/frame/Registration.h"
 #include "operators/media/formats/ByteOrder.h"
+#include "operators/media/formats/FrameRows.h"
 
 namespace Orvane {
 
@@ -34,19 +35,6 @@ constexpr int kFileHeader = 14, kInfoHeader = 40, kOS2Header = 12;
 
 /// Row y of an image, columns 0..width-1, as 16-bit pixels: canvas colour
 /// outside the data window.
-void BmpRow16(const Image &img, int y, int width, std::vector<Pixel> &out, std::vector<FltPixel> &flt) {
-    out.resize(static_cast<size_t>(width));
-    const ImgRectI &dw = img.DataWindow();
-    const uint8_t *row = img.ScanLine(y);
-    if (row && dw.x0 <= 0 && dw.x1 >= width) {
-        LoadPixel(img.Depth(), row + static_cast<size_t>(-dw.x0) * img.BytesPerPixel(), width, out.data());
-        return;
-    }
-    flt.resize(static_cast<size_t>(width));
-    ReadSpanFlt(img, y, 0, width, flt.data());
-    for (int x = 0; x < width; ++x) out[x] = FltToPixel(flt[x]);
-}
-
 } // namespace bmp_format_detail
 
 using namespace bmp_format_detail;
@@ -204,7 +192,6 @@ bool BMPFormat::SaveHeader(IOClass *stream, Image *image) {
 bool BMPFormat::SaveFrame(unsigned, Image *image) {
     if (!io || !image) return Fail("nothing to write");
     const int w = image->Width(), h = image->Height();
-    const int bpp = saveAlpha_ ? 4 : 3;
     const int64_t stride = saveAlpha_ ? int64_t(w) * 4 : Stride(24, w);
     uint8_t *line = static_cast<uint8_t *>(std::calloc(static_cast<size_t>(stride), 1));
     if (!line) return Fail("out of memory");
@@ -216,13 +203,8 @@ bool BMPFormat::SaveFrame(unsigned, Image *image) {
             ok = Fail("aborted");
             break;
         }
-        BmpRow16(*image, y, w, px, flt);
-        for (int x = 0; x < w; ++x) {
-            uint8_t *d = line + static_cast<size_t>(x) * bpp;
-            d[0] = static_cast<uint8_t>(px[x].B >> 8), d[1] = static_cast<uint8_t>(px[x].G >> 8);
-            d[2] = static_cast<uint8_t>(px[x].R >> 8);
-            if (saveAlpha_) d[3] = static_cast<uint8_t>(px[x].A >> 8);
-        }
+        FrameRows::Row16(*image, y, w, px, flt);
+        FrameRows::PackBGRA8(px, w, saveAlpha_, line);
         if (!io->WriteExact(line, stride)) ok = Fail("write error");
     }
     std::free(line);

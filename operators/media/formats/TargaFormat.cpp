@@ -12,6 +12,7 @@
 #include "host/media/IOClass.h"
 #include "operators/frame/Registration.h"
 #include "operators/media/formats/ByteOrder.h"
+#include "operators/media/formats/FrameRows.h"
 
 namespace Orvane {
 
@@ -50,19 +51,6 @@ Pixel DecodeColour(const uint8_t *s, int bytes, bool alpha) {
     p.R = static_cast<uint16_t>(s[2] * 257);
     p.A = bytes == 4 && alpha ? static_cast<uint16_t>(s[3] * 257) : 65535;
     return p;
-}
-
-void TgaRow16(const Image &img, int y, int width, std::vector<Pixel> &out, std::vector<FltPixel> &flt) {
-    out.resize(static_cast<size_t>(width));
-    const ImgRectI &dw = img.DataWindow();
-    const uint8_t *row = img.ScanLine(y);
-    if (row && dw.x0 <= 0 && dw.x1 >= width) {
-        LoadPixel(img.Depth(), row + static_cast<size_t>(-dw.x0) * img.BytesPerPixel(), width, out.data());
-        return;
-    }
-    flt.resize(static_cast<size_t>(width));
-    ReadSpanFlt(img, y, 0, width, flt.data());
-    for (int x = 0; x < width; ++x) out[x] = FltToPixel(flt[x]);
 }
 
 /// Reads a stream in large pieces for the run-length decoder.
@@ -338,13 +326,8 @@ bool TargaFormat::SaveFrame(unsigned, Image *image) {
             ok = Fail("aborted");
             break;
         }
-        TgaRow16(*image, y, w, px, flt);
-        for (int x = 0; x < w; ++x) {
-            uint8_t *d = raw + static_cast<size_t>(x) * bpp;
-            d[0] = static_cast<uint8_t>(px[x].B >> 8), d[1] = static_cast<uint8_t>(px[x].G >> 8);
-            d[2] = static_cast<uint8_t>(px[x].R >> 8);
-            if (saveAlpha_) d[3] = static_cast<uint8_t>(px[x].A >> 8);
-        }
+        FrameRows::Row16(*image, y, w, px, flt);
+        FrameRows::PackBGRA8(px, w, saveAlpha_, raw);
         if (compress_) {
             used += EncodeLine(raw, w, bpp, buffer + used);
         } else {
