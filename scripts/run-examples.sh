@@ -1,7 +1,8 @@
 #!/usr/bin/env bash
 # The main job on the bundled examples, from a fresh Debian 12 machine:
-# installs the packages, builds the program, and evaluates every flow in
-# examples/ the way its "-- orvane-eval:" line says, printing what it produces.
+# installs the packages, builds the program, renders the flows of examples/
+# that have "-- orvane-render:" lines (image sequences in examples/out/) and
+# evaluates those with "-- orvane-eval:" lines, printing what they produce.
 set -euo pipefail
 cd "$(dirname "$0")/.."
 
@@ -11,6 +12,14 @@ cmake --build --preset release -j "${ORVANE_JOBS:-2}" --target orvane orvaneoper
 
 status=0
 for flow in examples/*.flow; do
+  # "-- orvane-render: ARGS" renders the flow's Savers to files under examples/out/.
+  while IFS= read -r line; do
+    args="${line#-- orvane-render:}"
+    echo "== orvane render $flow$args"
+    # shellcheck disable=SC2086
+    build/bin/orvane render "$flow" $args || status=$?
+    echo
+  done < <(grep '^-- orvane-render:' "$flow")
   while IFS= read -r line; do
     args="${line#-- orvane-eval:}"
     echo "== orvane eval $flow$args"

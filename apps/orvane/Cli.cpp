@@ -5,6 +5,10 @@
 #include <cstdlib>
 
 #include "host/app/Application.h"
+#include "host/core/ScriptVal.h"
+#include "host/flow/InputValue.h"
+#include "host/flow/Operator.h"
+#include "host/flow/OrvaneDoc.h"
 
 namespace Orvane::Cli {
 
@@ -60,6 +64,26 @@ std::vector<double> ParseNumberList(const std::string &text, size_t count, const
         throw CliError(ExitUsage, std::string("bad ") + what + " '" + text + "' (expected " + std::to_string(count) +
                                       " numbers separated by commas)");
     return values;
+}
+
+void ApplySet(OrvaneDoc &doc, const std::string &set) {
+    const size_t eq = set.find('=');
+    const size_t dot = set.find('.');
+    if (eq == std::string::npos || dot == std::string::npos || dot > eq)
+        throw CliError(ExitUsage, "--set expects TOOL.INPUT=VALUE, not '" + set + "'");
+    const std::string toolName = set.substr(0, dot), inputId = set.substr(dot + 1, eq - dot - 1);
+    Operator *op = doc.FindTool(toolName);
+    if (!op) throw CliError(ExitUsage, "--set: the flow has no tool '" + toolName + "'");
+    Input *in = op->FindInput(inputId.c_str());
+    if (!in) throw CliError(ExitUsage, "--set: " + toolName + " has no input '" + inputId + "'");
+    ScriptVal value;
+    try {
+        value = ScriptVal::FromText(set.substr(eq + 1));
+    } catch (const ScriptParseError &e) {
+        throw CliError(ExitUsage, "--set " + toolName + "." + inputId + ": " + e.what());
+    }
+    const std::string error = ApplyInputValue(doc, in, value, false);
+    if (!error.empty()) throw CliError(ExitUsage, "--set " + toolName + "." + inputId + ": " + error);
 }
 
 } // namespace Orvane::Cli

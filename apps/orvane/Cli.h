@@ -5,6 +5,10 @@
 #include <string>
 #include <vector>
 
+namespace Orvane {
+class OrvaneDoc;
+}
+
 namespace Orvane::Cli {
 
 enum ExitCode : int {
@@ -20,6 +24,9 @@ struct CliError : std::runtime_error {
     int exitCode;
 };
 
+/// Applies one "--set TOOL.INPUT=VALUE" to a document or throws.
+void ApplySet(OrvaneDoc &doc, const std::string &set);
+
 /// Loads the standard tool library or throws.
 void LoadLibrary();
 
@@ -34,5 +41,6 @@ int RunTools(const std::vector<std::string> &args);
 int RunDescribe(const std::vector<std::string> &args);
 int RunEval(const std::vector<std::string> &args);
 int RunInfo(const std::vector<std::string> &args);
+int RunRender(const std::vector<std::string> &args);
 
 } // namespace Orvane::Cli

@@ -16,6 +16,7 @@
 #include "host/flow/Operator.h"
 #include "host/flow/OrvaneDoc.h"
 #include "host/flow/RenderTask.h"
+#include "host/flow/Request.h"
 #include "host/image/Image.h"
 #include "host/image/PixelConvert.h"
 
@@ -76,26 +77,6 @@ EvalArgs ParseArgs(const std::vector<std::string> &args) {
     a.flow = positional[0];
     a.target = positional[1];
     return a;
-}
-
-void ApplySet(OrvaneDoc &doc, const std::string &set) {
-    const size_t eq = set.find('=');
-    const size_t dot = set.find('.');
-    if (eq == std::string::npos || dot == std::string::npos || dot > eq)
-        throw CliError(ExitUsage, "--set expects TOOL.INPUT=VALUE, not '" + set + "'");
-    const std::string toolName = set.substr(0, dot), inputId = set.substr(dot + 1, eq - dot - 1);
-    Operator *op = doc.FindTool(toolName);
-    if (!op) throw CliError(ExitUsage, "--set: the flow has no tool '" + toolName + "'");
-    Input *in = op->FindInput(inputId.c_str());
-    if (!in) throw CliError(ExitUsage, "--set: " + toolName + " has no input '" + inputId + "'");
-    ScriptVal value;
-    try {
-        value = ScriptVal::FromText(set.substr(eq + 1));
-    } catch (const ScriptParseError &e) {
-        throw CliError(ExitUsage, "--set " + toolName + "." + inputId + ": " + e.what());
-    }
-    const std::string error = ApplyInputValue(doc, in, value, false);
-    if (!error.empty()) throw CliError(ExitUsage, "--set " + toolName + "." + inputId + ": " + error);
 }
 
 struct ChannelStats {
@@ -175,9 +156,12 @@ int RunEval(const std::vector<std::string> &rawArgs) {
     Output *out = dot == std::string::npos ? op->FindMainOutput() : op->FindOutput(a.target.substr(dot + 1).c_str());
     if (!out) throw CliError(ExitUsage, "tool '" + toolName + "' has no output '" + a.target.substr(dot + 1) + "'");
 
+    // An interactive look: Savers on the way pass their image on without writing.
     RenderTask task;
+    task.interactive = true;
     EvalOptions options;
     options.task = &task;
+    options.flags = ReqFlagInteractive;
     if (a.roi) options.roi = ImageDomain(*a.roi);
     const double time = a.timeSet ? a.time : doc.RenderStart();
     Ref<Parameter> result = Evaluate(out, time, options);

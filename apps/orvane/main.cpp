@@ -17,11 +17,16 @@ commands:
   eval FLOW TOOL[.OUTPUT] [--time T] [--roi x0,y0,x1,y1] [--pixel X,Y ...]
        [--set TOOL.INPUT=VALUE ...] [--threads N] [--json]
                                  evaluate one output of a flow document and print what it holds
+  render FLOW [--frames SPEC] [--chunk I/N] [--saver NAME ...] [--set TOOL.INPUT=VALUE ...]
+         [--threads N] [--memory-limit SIZE] [--proxy N] [--skip-existing] [--log-format text|json]
+                                 render the flow's Savers frame by frame (default: the document's
+                                 render range); SPEC like 1-100, 1-100x2, 1,5,10-20, 10-1, -23--5;
+                                 SIZE like 512M or 8G; Ctrl-C stops after the current frame
   info FILE...                   what the formats read from files or sequences
                                  (format, size, depth, windows, frames and gaps)
   version                        print the program version
 
-exit codes: 0 done, 2 bad command line or document, 3 a tool failed
+exit codes: 0 done, 2 bad command line or document, 3 a tool or frame failed, 130 interrupted
 )";
 
 } // namespace
@@ -40,6 +45,7 @@ int main(int argc, char **argv) {
         if (command == "describe") return RunDescribe(args);
         if (command == "eval") return RunEval(args);
         if (command == "info") return RunInfo(args);
+        if (command == "render") return RunRender(args);
         if (command == "version") {
             std::printf("orvane %s\n", ORVANE_VERSION);
             return ExitOk;

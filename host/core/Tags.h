@@ -246,8 +246,39 @@ constexpr Tag ClipFrameHeaderOnly = 0x10000069;   ///< pre-calculation: header d
 constexpr Tag ClipFrameRegion = 0x600000c9;       ///< const ImageDomain *: the region to decode
 constexpr Tag ClipFrameCachePath = 0x30000000;    ///< local cache path
 constexpr Tag ClipFrameUseLocalCache = 0x10000003;
+constexpr Tag ClipFrameMakeFolders = 0x100000d0; ///< writing: make missing folders of the path
+// ---- Clip attributes (Clip::SetAttrsTagList, GetAttrL / GetAttrD) ---------
+constexpr Tag ClipStart = 0x20020000;   ///< first global frame of the clip
+constexpr Tag ClipEnd = 0x20020001;     ///< last global frame of the clip
+constexpr Tag ClipAspectX = 0x20020003; ///< pixel aspect the file reports
+constexpr Tag ClipAspectY = 0x20020004;
+constexpr Tag ClipInitialFrame = 0x20020005; ///< sequence number of the first file, -1 for none
+constexpr Tag ClipWidth = 0x10020000;        ///< frame size
+constexpr Tag ClipHeight = 0x10020001;
+constexpr Tag ClipLength = 0x10020002;       ///< number of frames
+constexpr Tag ClipIsMultiFrame = 0x10020003; ///< one file holds every frame
+constexpr Tag ClipSaving = 0x10020004;       ///< open for writing
+constexpr Tag ClipIsPreviewSaver = 0x10020005;
+constexpr Tag ClipTrimIn = 0x10020006;      ///< first file frame used, from 0
+constexpr Tag ClipTrimOut = 0x10020007;     ///< last file frame used
+constexpr Tag ClipExtendFirst = 0x10020008; ///< frames holding the first frame
+constexpr Tag ClipExtendLast = 0x10020009;  ///< frames holding the last frame
+constexpr Tag ClipNoLoop = 0x1002000a;      ///< set when the clip does NOT loop (saved data relies on it)
+constexpr Tag ClipReverse = 0x1002000b;
+constexpr Tag ClipImportMode = 0x1002000c; ///< 0 normal, 1 2:3 pull-up, 2 2:3 pull-down
+constexpr Tag ClipAspectMode = 0x1002000e; ///< 0 from file, 1 default, 2 custom
+constexpr Tag ClipPullOffset = 0x1002000f; ///< position in the 2:3 cadence, 0..4
+constexpr Tag ClipIsLinear = 0x10020010;   ///< the file needs no linear conversion
+constexpr Tag ClipNoAlpha = 0x10020011;    ///< the file has no alpha: make it solid
+constexpr Tag ClipTimeCode = 0x10020012;
+constexpr Tag ClipPullType = 0x10020013;   ///< cadence row: 0 standard, 1 advanced
+constexpr Tag ClipFormatAttr = 0x60020001; ///< ImageFormat *: the format in use
+constexpr Tag ClipOwner = 0x60020008;      ///< the tool a saved clip belongs to
+
 /// A format attribute: the Raw format restores the image's saved tags.
 constexpr Tag FormatRestoreTags = 0x1000012c;
+/// A format attribute: the eye a multi-view file is read for, 0 left, 1 right.
+constexpr Tag FormatStereoEye = 0x1000012d;
 
 // ---- Whole-image work ---------------------------------------------------
 constexpr Tag WorkOperator = 0x60010000;
@@ -256,11 +287,15 @@ constexpr Tag WorkThreaded = 0x10010000;
 constexpr Tag WorkUseGPU = 0x10010002;
 constexpr Tag MtxColorMatrix = 0x60030000;
 constexpr Tag MtxColorMatrixFull = 0x60030001;
+/// Image::ResizeTagList's filter: 0 nearest, 1 box, 2 bilinear, 3 bicubic (ResampleFilterKind).
+constexpr Tag ResizeFilter = 0x10000003;
 
 // ---- Application attributes (GetApp()->GetAttrB) -------------------------
 /// Rows use fast true powers rather than gamma tables.
 constexpr Tag AppFastPower = 0x10010002;
 /// Rows use the four-channel vector loops for RGBA float.
 constexpr Tag AppVectorRows = 0x10010005;
+/// Interactive requests at proxy scale may resize with the quick box filter.
+constexpr Tag AppFastScale = 0x10010006;
 
 } // namespace Orvane

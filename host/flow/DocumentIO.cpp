@@ -173,6 +173,9 @@ DocumentLoadResult LoadDocumentFile(const std::string &path, OrvaneDoc &doc) {
     }
     std::ostringstream text;
     text << file.rdbuf();
+    std::error_code ec;
+    const std::filesystem::path absolute = std::filesystem::absolute(path, ec);
+    doc.SetFilePath(ec ? path : absolute.string());
     DocumentLoadResult r = LoadDocument(text.str(), doc);
     if (!r.ok) r.error = path + ": " + r.error;
     return r;

@@ -7,6 +7,7 @@
 #include "host/flow/Gradient.h"
 #include "host/flow/Operator.h"
 #include "host/flow/OrvaneDoc.h"
+#include "host/media/Clip.h"
 
 namespace Orvane {
 namespace {
@@ -44,6 +45,7 @@ Ref<Parameter> DefaultValueFor(OvID dataType, const TagList &tags) {
         return MakeRef<IDValue>(def);
     }
     if (dataType == CLSID_DataType_Gradient) return MakeRef<Gradient>();
+    if (dataType == CLSID_DataType_Clip) return MakeRef<Clip>(tags.GetText(InputDefaultText, ""));
     return nullptr;
 }
 
@@ -61,6 +63,7 @@ Ref<Parameter> ParameterFromScript(OvID dataType, const ScriptVal &v) {
     if (dataType == CLSID_DataType_Text) return v.IsText() ? MakeRef<Text>(v.AsText()) : nullptr;
     if (dataType == CLSID_DataType_OvID) return v.IsText() ? MakeRef<IDValue>(OvID(v.AsText())) : nullptr;
     if (dataType == CLSID_DataType_Gradient) return Gradient::FromScript(v);
+    if (dataType == CLSID_DataType_Clip) return v.IsText() ? MakeRef<Clip>(v.AsText()) : nullptr;
     return nullptr;
 }
 

@@ -30,12 +30,19 @@ int Operator::AddControlPageTagList(const char *name, const TagList &tags) {
 }
 
 Input *Operator::AddInputTagList(const char *name, const char *id, const TagList &tags) {
-    if (FindInput(OvID(id))) return nullptr;
+    const std::string fullId = group_.empty() ? std::string(id) : group_ + "." + id;
+    if (FindInput(OvID(fullId))) return nullptr;
     const int page =
         static_cast<int>(tags.GetLong(ControlPage, pages_.empty() ? 0 : static_cast<long long>(pages_.size()) - 1));
     inputs_.push_back(
-        std::make_unique<Input>(this, name ? name : id, OvID(id), tags, static_cast<int>(inputs_.size()), page));
+        std::make_unique<Input>(this, name ? name : id, OvID(fullId), tags, static_cast<int>(inputs_.size()), page));
     return inputs_.back().get();
+}
+
+Input *Operator::FindGroupInput(const char *id) const {
+    if (!group_.empty())
+        if (Input *in = FindInput(OvID(group_ + "." + id))) return in;
+    return FindInput(OvID(id));
 }
 
 Output *Operator::AddOutputTagList(const char *name, const char *id, const TagList &tags) {
@@ -107,6 +114,8 @@ void Operator::Fail(Request *req, const char *fmt, ...) {
     va_end(args);
     (void)req;
 }
+
+std::string Operator::FrameFileName(double, const RenderTask *) const { return {}; }
 
 void ThreadedOperator::ProcessChunk(Request *, int) {}
 

@@ -28,6 +28,7 @@
 namespace Orvane {
 
 class OrvaneDoc;
+class RenderTask;
 class Request;
 
 /// A page of a tool's panel.
@@ -66,10 +67,16 @@ public:
     Output *AddOutputTagList(const char *name, const char *id, const TagList &tags);
     void BeginControlNestTagList(const char *name, const char *id, bool open, const TagList &tags);
     void EndControlNest();
+    /// While a group is current, added inputs get the ID "group.id", so that
+    /// the options two file formats add to one tool never collide.
+    void SetCurrentGroup(std::string group) { group_ = std::move(group); }
+    const std::string &CurrentGroup() const { return group_; }
 
     // ---- links ----
     Input *FindInput(OvID id) const;
     Input *FindInput(const char *id) const { return FindInput(OvID(id)); }
+    /// The input `id` of the current group, else the input `id` itself.
+    Input *FindGroupInput(const char *id) const;
     Output *FindOutput(OvID id) const;
     Output *FindOutput(const char *id) const { return FindOutput(OvID(id)); }
     Input *FindMainInput(int n = 1) const;
@@ -107,6 +114,9 @@ public:
     /// present yet, so this says no.
     virtual bool IsGPUEnabled(Request *req, bool forKernel);
     virtual std::string GetTitle() const { return name_; }
+    /// For a tool that writes files: the file the frame at `time` of
+    /// `task`'s render goes to; "" for other tools.
+    virtual std::string FrameFileName(double time, const RenderTask *task) const;
 
     /// True for a class whose processing is not built yet: documents keep
     /// its saved values as they are.
@@ -141,7 +151,7 @@ protected:
     void Fail(Request *req, const char *fmt, ...) __attribute__((format(printf, 3, 4)));
 
 private:
-    std::string name_;
+    std::string name_, group_;
     OrvaneDoc *doc_ = nullptr;
     std::vector<PanelPage> pages_;
     std::vector<ControlNest> nests_;

@@ -1,5 +1,7 @@
 #include "host/flow/OrvaneDoc.h"
 
+#include <filesystem>
+
 #include <algorithm>
 #include <cctype>
 #include <cstdio>
@@ -133,9 +135,12 @@ Operator *OrvaneDoc::AddTool(OvID classId, const std::string &name) {
     }
     Ref<Operator> held = Ref<Operator>::Adopt(op);
     op->FinishConstruction();
-    // Inputs that notify hear their first value, unless they ask not to.
-    for (const auto &in : op->Inputs())
+    // Inputs that notify hear their first value, unless they ask not to. A
+    // notification may add inputs (a file format's options): they are heard too.
+    for (size_t i = 0; i < op->Inputs().size(); ++i) {
+        Input *in = op->Inputs()[i].get();
         if (in->Tags().GetLong(InputInitialNotify, 1) != 0) in->Changed();
+    }
     const char *abbreviation = row->Tags().GetText(RegAbbreviation, row->ClassName());
     const std::string chosen = name.empty() ? UniqueName(abbreviation) : name;
     if (!AddTool(op, chosen)) return nullptr;
@@ -193,6 +198,13 @@ std::string OrvaneDoc::UniqueName(const std::string &base) const {
         std::string candidate = stem + std::to_string(n);
         if (!tools_.count(candidate) && !keptTools_.Find(candidate)) return candidate;
     }
+}
+
+std::string OrvaneDoc::MapPath(const std::string &name) const {
+    if (name.empty() || filePath_.empty()) return name;
+    const std::filesystem::path p(name);
+    if (p.is_absolute()) return name;
+    return (std::filesystem::path(filePath_).parent_path() / p).lexically_normal().string();
 }
 
 } // namespace Orvane

@@ -97,6 +97,14 @@ public:
         renderEnd_ = end;
     }
 
+    // ---- files ----
+    /// Where the document was read from or saved to ("" when never).
+    const std::string &FilePath() const { return filePath_; }
+    void SetFilePath(std::string path) { filePath_ = std::move(path); }
+    /// A file name as tools use it: relative names are taken from the
+    /// document's folder (when it has one), absolute names stay as they are.
+    std::string MapPath(const std::string &name) const;
+
     // ---- tools ----
     /// Makes a tool of the class (or of the class an old ID names) and adds
     /// it under `name` (a fresh name from its abbreviation when empty). Null
@@ -133,6 +141,7 @@ private:
     double globalStart_ = 0, globalEnd_ = 100, renderStart_ = 0, renderEnd_ = 100;
     std::map<std::string, Ref<Operator>> tools_;
     std::unique_ptr<ResultCache> cache_;
+    std::string filePath_;
     ScriptVal keptTools_ = ScriptVal::Table(), keptFields_ = ScriptVal::Table(), keptPrefs_ = ScriptVal::Table();
 };
 

@@ -21,6 +21,9 @@ public:
     bool interactive = false;
     bool boundsOnly = false;
     bool useGPU = false;
+    /// First frame of the render's range (-2e9: not a range render). Savers
+    /// number their files from it when asked to.
+    double startTime = -2e9;
 
 private:
     std::atomic<bool> abort_{false};

@@ -25,11 +25,13 @@ class Operator;
 class RenderTask;
 
 // Request flags.
-constexpr uint32_t ReqFlagQuick = 1u << 0;    ///< interactive: speed over quality
-constexpr uint32_t ReqFlagProxy = 1u << 1;    ///< render at the task's proxy scale
-constexpr uint32_t ReqFlagPreCalc = 1u << 3;  ///< windows and domains only, no pixels
-constexpr uint32_t ReqFlagNoGPU = 1u << 5;    ///< the device must not be used
-constexpr uint32_t ReqFlagSkipRoI = 1u << 31; ///< CheckRequest must leave regions alone
+constexpr uint32_t ReqFlagQuick = 1u << 0;        ///< interactive: speed over quality
+constexpr uint32_t ReqFlagProxy = 1u << 1;        ///< render at the task's proxy scale
+constexpr uint32_t ReqFlagPreCalc = 1u << 3;      ///< windows and domains only, no pixels
+constexpr uint32_t ReqFlagNoGPU = 1u << 5;        ///< the device must not be used
+constexpr uint32_t ReqFlagInteractive = 1u << 17; ///< an interactive view asks: Savers write only when armed
+constexpr uint32_t ReqFlagPreview = 1u << 18;     ///< a preview render: Savers never write
+constexpr uint32_t ReqFlagSkipRoI = 1u << 31;     ///< CheckRequest must leave regions alone
 /// Per-input flag: fetch this input for pre-calculation only.
 constexpr uint32_t InputFlagPreCalc = 8;
 

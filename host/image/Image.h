@@ -33,6 +33,7 @@
 namespace Orvane {
 
 class OrvaneDoc;
+class Request;
 
 enum class AuxChannelKind : uint8_t {
     Z,
@@ -163,6 +164,45 @@ public:
     /// Copies `src` into this image over this image's data window: pixels of
     /// src where it has them, its canvas colour elsewhere; converts depth.
     void ImageCopy(const Image *src);
+
+    // ---- field, scale and legal services (ImageFields.cpp, ImageResize.cpp, ImageLegal.cpp) ----
+    /// Field work. Field 0 is the field holding the frame's top line, field 1 the other
+    /// (counted from the top of the image rectangle, whatever the data window).
+    /// `destField`: -1 makes a half-height image of that field alone (tagged ImgField = field,
+    /// ImgFullHeight = this height, and ImgFieldOffset); 0 or 1 writes into that field of a
+    /// full-height frame; 2 writes into the same field position as `field`.
+    /// `mode`: 1 writes the destination field's lines only; 3 writes them and doubles each
+    /// into the neighbouring line of the other field (line doubling).
+    /// `into`: an existing full-height image to write into, or null to make a new one
+    /// (same size, depth, windows and canvas as this; lines not written are zero/canvas).
+    /// Returns the image written (into, or the new one); null when memory ran out, the
+    /// arguments are out of range, or (destField -1) the field has no line.
+    Ref<Image> CopyField(int field, Image *into, int destField, int mode) const;
+    /// Swaps the temporal order of the two fields in place: the picture moves down
+    /// by one line (the top line repeats). Only on an image this tool owns.
+    void ReverseFieldDominance();
+    /// A new image shrunk by whole factors (xFactor, yFactor >= 1, each a whole number)
+    /// by averaging each xFactor x yFactor block; windows scale with it (rounded outward),
+    /// the pixel aspect (XScale:YScale) follows unequal factors; rows in parallel. `req` may be null (used for abort).
+    /// Null on abort, out of memory, or a factor below 1.
+    Ref<Image> ScaleOfImage(Request *req, double xFactor, double yFactor) const;
+    /// Fills `dest` (its size and data window say the target) from this image scaled by
+    /// dest.Width()/Width() and dest.Height()/Height(), with the filter of the tag
+    /// ResizeFilter: 0 nearest, 1 box (area average), 2 bilinear, 3 bicubic (Catmull-Rom),
+    /// widened to average the covered area when shrinking (Resample.h).
+    /// Tags: ResizeFilter; WorkRequest (Request *) for abort. Returns false on abort.
+    bool ResizeTagList(Image *dest, const TagList &tags) const;
+    /// A copy cut to (or grown to) the data window given by ImgDataWindow (const ImgRectI *)
+    /// and valid window ImgValidWindow; outside this image's data window the canvas colour.
+    /// Other tags as NewImageTagList.
+    Ref<Image> CopyOfImageTagList(const TagList &tags) const;
+    /// Broadcast-legal pass: videoType 0 NTSC, 1 NHK, 2 PAL/SECAM; action 0 none,
+    /// 1 indicate illegal pixels as white, 2 as black, 3 adjust to legal; adjust 0 "100%
+    /// saturation 100% amplitude", 1 "100% saturation 75% amplitude"; softClip 0..1 is the
+    /// knee width as a fraction of the legal range (limits in ImageLegal.cpp).
+    /// LegalOfImage makes a new image, ImageLegal works in place.
+    Ref<Image> LegalOfImage(int videoType, int action, int adjust, double softClip) const;
+    void ImageLegal(int videoType, int action, int adjust, double softClip);
 
     // Parameter
     OvID DataType() const override;

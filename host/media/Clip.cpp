@@ -48,7 +48,8 @@ std::string Clip::FramePath(int64_t frame) const {
     return sequence_.hasNumber ? SequencePath(sequence_, SequenceNumber(frame)) : fileName_;
 }
 
-Ref<Image> Clip::GetFrameTagList(int64_t frame, const TagList &tags, std::string &error) {
+Ref<Image> Clip::GetFrameTagList(int64_t frame, const TagList &tags, std::string &error,
+                                 const std::function<void(ImageFormat &)> &prepare) {
     std::lock_guard<std::mutex> guard(lock_);
     const std::string path = FramePath(frame);
     std::unique_ptr<FileIO> io = FileIO::Open(path, FileIO::Mode::Read, error);
@@ -68,6 +69,7 @@ Ref<Image> Clip::GetFrameTagList(int64_t frame, const TagList &tags, std::string
     format->abortFlag = tags.GetPtrAs<const std::atomic<bool>>(ClipFrameAbort);
     format->proxyScale = static_cast<int>(std::max<long long>(1, tags.GetLong(ClipFrameProxyScale, 1)));
     format->metadata = ScriptVal::Table();
+    if (prepare) prepare(*format);
     Ref<Image> image;
     const bool ok = format->LoadHeader(io.get()) &&
                     format->LoadFrameTagList(static_cast<unsigned>(std::max<int64_t>(frame, 0)), image, tags);
@@ -79,10 +81,14 @@ Ref<Image> Clip::GetFrameTagList(int64_t frame, const TagList &tags, std::string
     }
     readFormat_ = format;
     readFormatPath_ = SequenceDisplayName(sequence_);
+    SetAttrsTagList({{ClipWidth, format->width},
+                     {ClipHeight, format->height},
+                     {ClipAspectX, format->aspectX},
+                     {ClipAspectY, format->aspectY}});
     return image;
 }
 
-bool Clip::PutFrameTagList(int64_t frame, Image *image, const TagList &, std::string &error,
+bool Clip::PutFrameTagList(int64_t frame, Image *image, const TagList &tags, std::string &error,
                            const std::function<void(ImageFormat &)> &configure) {
     if (!image) {
         error = "no image to write";
@@ -90,11 +96,19 @@ bool Clip::PutFrameTagList(int64_t frame, Image *image, const TagList &, std::st
     }
     std::lock_guard<std::mutex> guard(lock_);
     const std::filesystem::path target(FramePath(frame));
-    Ref<ImageFormat> format = FindFormatForWriting(target.string(), error);
+    Ref<ImageFormat> format;
+    if (!saveFormat_.IsNull()) {
+        const Registry *row = ClassRegistry ? ClassRegistry->Find(saveFormat_) : nullptr;
+        format = row ? NewImageFormat(row) : Ref<ImageFormat>();
+        if (!format) error = std::string(saveFormat_.Text()) + " is not a file format that can write";
+    } else {
+        format = FindFormatForWriting(target.string(), error);
+    }
     if (!format) return false;
     if (configure) configure(*format);
     std::error_code ec;
-    if (target.has_parent_path()) std::filesystem::create_directories(target.parent_path(), ec);
+    if (target.has_parent_path() && tags.GetBool(ClipFrameMakeFolders))
+        std::filesystem::create_directories(target.parent_path(), ec);
     // The temporary name keeps the extension, so tools that look at it see the format.
     const std::filesystem::path temp = target.parent_path() / ("." + target.stem().string() + ".part" +
                                                                std::to_string(getpid()) + target.extension().string());

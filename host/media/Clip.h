@@ -12,7 +12,11 @@
 // (ClipFrameRegion, ClipFrameHeaderOnly, ClipFrameProxyScale, ClipFrameAbort).
 // Writing (PutFrameTagList) writes the frame to a temporary name in the
 // destination folder and renames it when complete, so no truncated frame
-// ever stands under a final name; missing folders are made.
+// ever stands under a final name; missing folders are made when the tag
+// ClipFrameMakeFolders asks for it.
+//
+// Attributes (ClipStart, ClipTrimIn, ... in host/core/Tags.h) carry what a
+// tool decides about the clip: its place on the time line, trims, holds.
 //
 // Thread safety: a clip serialises its reads and writes with its own lock,
 // so several render threads may share one clip.
@@ -54,10 +58,19 @@ public:
     /// Makes frame 0 the file numbered `number` (writing a sequence).
     void SetStartFrame(int64_t number) { initialFrame_ = number; }
 
-    /// Loads clip frame `frame`; null with a reason when it cannot.
-    Ref<Image> GetFrameTagList(int64_t frame, const TagList &tags, std::string &error);
+    /// Loads clip frame `frame`; null with a reason when it cannot. `prepare`,
+    /// when given, is called with the format before the file is read (the
+    /// reading tool's options). A successful read records the frame's size
+    /// and aspect in the attributes ClipWidth, ClipHeight, ClipAspectX/Y.
+    Ref<Image> GetFrameTagList(int64_t frame, const TagList &tags, std::string &error,
+                               const std::function<void(ImageFormat &)> &prepare = {});
     /// The format that read the last frame (its header fields), if any.
     const Ref<ImageFormat> &ReadFormat() const { return readFormat_; }
+
+    /// The format class that writes this clip; null: the one the file
+    /// extension names.
+    void SetSaveFormat(OvID formatClass) { saveFormat_ = formatClass; }
+    OvID SaveFormat() const { return saveFormat_; }
 
     /// Writes `image` as clip frame `frame`. `configure`, when given, is
     /// called with the format before writing (the writing tool's options).
@@ -79,6 +92,7 @@ private:
     std::mutex lock_;
     Ref<ImageFormat> readFormat_;
     std::string readFormatPath_;
+    OvID saveFormat_;
 };
 
 } // namespace Orvane

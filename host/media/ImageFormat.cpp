@@ -1,6 +1,8 @@
 #include "host/media/ImageFormat.h"
 
 #include "host/core/Tags.h"
+#include "host/flow/Operator.h"
+#include "host/flow/Request.h"
 #include "host/image/NewImage.h"
 
 namespace Orvane {
@@ -20,6 +22,12 @@ void MediaFormat::SetupSave(Operator *, Request *) {}
 void MediaFormat::CleanupSave(Operator *) {}
 bool MediaFormat::RegInit(Registry *) { return true; }
 void MediaFormat::RegCleanup(Registry *) {}
+
+double MediaFormat::OptionValue(Operator *tool, Request *req, const char *id, double def) {
+    if (!tool || !req) return def;
+    Input *in = tool->FindGroupInput(id);
+    return in ? req->GetInputNumber(in, def) : def;
+}
 
 bool MediaFormat::Fail(std::string why) {
     error_ = std::move(why);

@@ -62,6 +62,10 @@ public:
     static bool RegInit(Registry *reg);
     static void RegCleanup(Registry *reg);
 
+    /// The number an option input of the tool's current group holds for
+    /// `req`; `def` without a tool, a request or such an input.
+    static double OptionValue(Operator *tool, Request *req, const char *id, double def);
+
 protected:
     bool Fail(std::string why);
     std::string error_;

@@ -58,6 +58,13 @@ std::vector<const Registry *> FormatsForExtension(const std::string &path) {
     return found;
 }
 
+std::vector<const Registry *> FormatsThatSave() {
+    std::vector<const Registry *> rows;
+    for (const Registry *r : AllFormats())
+        if (r->Tags().GetBool(RegFormatCanSave)) rows.push_back(r);
+    return rows;
+}
+
 Ref<ImageFormat> FindFormatForReading(const std::string &path, IOClass *io, std::string &error) {
     std::lock_guard<std::mutex> guard(FormatLock());
     const std::vector<const Registry *> named = FormatsForExtension(path);

@@ -20,6 +20,8 @@ class IOClass;
 
 /// Format rows registered for the extension of `path`, best first.
 ORVANE_API std::vector<const Registry *> FormatsForExtension(const std::string &path);
+/// Format rows that write files, best first.
+ORVANE_API std::vector<const Registry *> FormatsThatSave();
 /// The first format whose check accepts the stream; null, with a reason, if none.
 ORVANE_API Ref<ImageFormat> FindFormatForReading(const std::string &path, IOClass *io, std::string &error);
 /// The format that writes files with the extension of `path`.

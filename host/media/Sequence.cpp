@@ -39,6 +39,16 @@ SequenceName ParseSequenceName(const std::string &path) {
     const size_t slash = path.find_last_of('/');
     seq.folder = slash == std::string::npos ? "" : path.substr(0, slash + 1);
     const std::string name = slash == std::string::npos ? path : path.substr(slash + 1);
+    // The display form "shot.####.exr" names the sequence with its padding.
+    if (const size_t hashEnd = name.find_last_of('#'); hashEnd != std::string::npos) {
+        const size_t hashBegin = name.find_last_not_of('#', hashEnd);
+        const size_t first = hashBegin == std::string::npos ? 0 : hashBegin + 1;
+        seq.hasNumber = true;
+        seq.prefix = name.substr(0, first);
+        seq.suffix = name.substr(hashEnd + 1);
+        seq.padding = static_cast<int>(hashEnd + 1 - first);
+        return seq;
+    }
     size_t begin, end, sign;
     if (!FindNumber(name, begin, end, sign)) {
         seq.prefix = name;

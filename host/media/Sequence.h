@@ -10,6 +10,8 @@
 // needs them). A sequence padded to p digits holds names whose digit run is
 // p long, or longer without a leading zero (frame 10000 of "####"); a
 // sequence with padding 1 holds numbers of any width without leading zeros.
+// A run of '#' in a name ("shot.####.exr") stands for the number, padded
+// to as many digits as there are signs; its number is 0.
 //
 // Thread safety: pure functions; ScanSequence reads the file system.
 #include <cstdint>

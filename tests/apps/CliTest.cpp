@@ -2,6 +2,7 @@
 // render farms run it: output, JSON, and exit codes.
 #include <gtest/gtest.h>
 
+#include <csignal>
 #include <cstdio>
 #include <filesystem>
 #include <fstream>
@@ -191,6 +192,128 @@ TEST(CliInfo, DescribesASequenceWithItsGapsAndRefusesABrokenFile) {
     EXPECT_EQ(bad.exitCode, 3);
     EXPECT_TRUE(Contains(bad.err, "ERROR: ")) << bad.err;
     EXPECT_TRUE(Contains(bad.err, "broken.png")) << bad.err;
+}
+
+} // namespace
+} // namespace Orvane::clitest
+
+namespace Orvane::clitest {
+namespace {
+
+// ---- orvane render ----
+
+/// A flow whose Saver writes a 16 x 8 gradient as numbered PNG files under `dir`.
+std::string GradientFlow(const std::filesystem::path &dir, const std::string &extra = {}) {
+    return "Orvane.Document { Version = 1, RenderRange = { 1, 3 }, Tools = {\n"
+           "  Bg = Background { Inputs = { Type = \"Gradient\", Width = 16, Height = 8 } },\n"
+           "  Out = Saver { Inputs = { Clip = \"" +
+           (dir / "out/f.####.png").string() + "\", CreateDir = 1, Input = Bg.Output" + extra + " } },\n} }\n";
+}
+
+TEST(CliRender, WritesEveryFrameAndReportsIt) {
+    TempDir dir;
+    const auto flow = dir.File("a.flow", GradientFlow(dir.Path()));
+    const CliRun r = Orvane("render " + Quote(flow.string()) + " --frames 3,1-2");
+    EXPECT_EQ(r.exitCode, 0) << r.err;
+    EXPECT_TRUE(Contains(r.out, "FRAME 3 done 1/3 saver=Out file=" + (dir.Path() / "out/f.0003.png").string() + " "))
+        << r.out;
+    EXPECT_TRUE(Contains(r.out, "FRAME 2 done 3/3 saver=Out")) << r.out;
+    EXPECT_TRUE(Contains(r.out, "SUMMARY written=3 failed=0 skipped=0")) << r.out;
+    for (const char *f : {"f.0001.png", "f.0002.png", "f.0003.png"})
+        EXPECT_TRUE(std::filesystem::exists(dir.Path() / "out" / f)) << f;
+
+    // Existing files are left alone with --skip-existing; JSON lines say so.
+    const auto before = std::filesystem::last_write_time(dir.Path() / "out/f.0001.png");
+    const CliRun again = Orvane("render " + Quote(flow.string()) + " --skip-existing --log-format json");
+    EXPECT_EQ(again.exitCode, 0) << again.err;
+    EXPECT_TRUE(Contains(again.out, "{\"event\": \"frame\", \"frame\": 1, \"status\": \"skipped\"")) << again.out;
+    EXPECT_TRUE(Contains(again.out, "\"event\": \"summary\", \"written\": 0, \"failed\": 0, \"skipped\": 3"))
+        << again.out;
+    EXPECT_EQ(std::filesystem::last_write_time(dir.Path() / "out/f.0001.png"), before);
+}
+
+TEST(CliRender, ChunksOfARangeWriteTheSameBytesAsTheWholeRange) {
+    TempDir whole, parts;
+    const std::string relative = ", SetSequenceStart = 1, SequenceStartFrame = 1001";
+    const auto flowWhole = whole.File("a.flow", GradientFlow(whole.Path(), relative));
+    const auto flowParts = parts.File("a.flow", GradientFlow(parts.Path(), relative));
+    ASSERT_EQ(Orvane("render " + Quote(flowWhole.string()) + " --frames 10-14").exitCode, 0);
+    for (const char *chunk : {"1/2", "2/2"})
+        ASSERT_EQ(Orvane("render " + Quote(flowParts.string()) + " --frames 10-14 --chunk " + chunk).exitCode, 0);
+    for (int n = 1001; n <= 1005; ++n) {
+        const std::string name = "out/f." + std::to_string(n) + ".png";
+        const std::string a = ReadFile(whole.Path() / name), b = ReadFile(parts.Path() / name);
+        EXPECT_FALSE(a.empty()) << name;
+        EXPECT_EQ(a, b) << name;
+    }
+}
+
+TEST(CliRender, BadRequestsAndFailedFramesHaveTheirExitCodes) {
+    TempDir dir;
+    const auto flow = dir.File("a.flow", GradientFlow(dir.Path()));
+    EXPECT_EQ(Orvane("render " + Quote(flow.string()) + " --frames 1-x").exitCode, 2);
+    EXPECT_EQ(Orvane("render " + Quote(flow.string()) + " --saver Bg").exitCode, 2);
+    EXPECT_EQ(Orvane("render " + Quote(flow.string()) + " --memory-limit lots").exitCode, 2);
+    EXPECT_EQ(Orvane("render " + Quote(flow.string()) + " --chunk 3/2").exitCode, 2);
+    const auto none = dir.File("none.flow", "Orvane.Document { Version = 1, Tools = { Bg = Background {} } }\n");
+    const CliRun noSaver = Orvane("render " + Quote(none.string()));
+    EXPECT_EQ(noSaver.exitCode, 2);
+    EXPECT_TRUE(Contains(noSaver.err, "has no Saver")) << noSaver.err;
+
+    // A Loader whose frame 2 is missing: that frame fails, the others are written.
+    const std::string plate = (dir.Path() / "out/f.####.png").string();
+    ASSERT_EQ(Orvane("render " + Quote(flow.string()) + " --frames 1,3").exitCode, 0);
+    const auto chain = dir.File("b.flow", "Orvane.Document { Version = 1, RenderRange = { 1, 3 }, Tools = {\n"
+                                          "  In = Loader { Inputs = { Clip = \"" +
+                                              (dir.Path() / "out/f.0001.png").string() +
+                                              "\", GlobalIn = 1 } },\n"
+                                              "  Out = Saver { Inputs = { Clip = \"" +
+                                              (dir.Path() / "copy/c.####.tga").string() +
+                                              "\", CreateDir = 1, Input = In.Output } },\n} }\n");
+    const CliRun failed = Orvane("render " + Quote(chain.string()));
+    EXPECT_EQ(failed.exitCode, 3) << failed.out << failed.err;
+    EXPECT_TRUE(Contains(failed.err, "ERROR: frame 2 saver=Out: In failed to load file")) << failed.err;
+    EXPECT_TRUE(Contains(failed.out, "SUMMARY written=2 failed=1")) << failed.out;
+    EXPECT_TRUE(Contains(failed.out, "FAILED saver=Out frames=2")) << failed.out;
+    EXPECT_TRUE(std::filesystem::exists(dir.Path() / "copy/c.0003.tga"));
+    EXPECT_FALSE(std::filesystem::exists(dir.Path() / "copy/c.0002.tga"));
+}
+
+TEST(CliRender, InterruptionStopsAndSaysWhatWasWritten) {
+    TempDir dir;
+    const auto flow = dir.File("a.flow", GradientFlow(dir.Path()));
+    ASSERT_EQ(Orvane("render " + Quote(flow.string()) + " --frames 1").exitCode, 0);
+    // Frame 2 of the Loader's clip never arrives: "Wait" holds the render there.
+    const auto chain = dir.File(
+        "b.flow", "Orvane.Document { Version = 1, Tools = {\n"
+                  "  In = Loader { Inputs = { Clip = \"" +
+                      (dir.Path() / "out/f.0001.png").string() +
+                      "\", GlobalIn = 1, GlobalOut = 3, ClipTimeEnd = 2, MissingFrames = 3 } },\n"
+                      "  Out = Saver { Inputs = { Clip = \"" +
+                      (dir.Path() / "copy/c.####.tga").string() + "\", CreateDir = 1, Input = In.Output } },\n} }\n");
+    const auto outFile = dir.Path() / "render.out";
+    const pid_t pid = fork();
+    ASSERT_GE(pid, 0);
+    if (pid == 0) {
+        std::freopen(outFile.c_str(), "w", stdout);
+        std::freopen((dir.Path() / "render.err").c_str(), "w", stderr);
+        const std::string exe = std::string(ORVANE_BINARY_DIR) + "/orvane";
+        execl(exe.c_str(), exe.c_str(), "render", chain.c_str(), "--frames", "1-3", static_cast<char *>(nullptr));
+        _exit(127);
+    }
+    // Wait until frame 1 is reported, then interrupt twice: the second abandons the waiting frame.
+    for (int i = 0; i < 200 && !Contains(ReadFile(outFile), "FRAME 1 done"); ++i) usleep(50000);
+    kill(pid, SIGINT);
+    usleep(200000);
+    kill(pid, SIGINT);
+    int status = 0;
+    waitpid(pid, &status, 0);
+    ASSERT_TRUE(WIFEXITED(status));
+    EXPECT_EQ(WEXITSTATUS(status), 130);
+    const std::string out = ReadFile(outFile);
+    EXPECT_TRUE(Contains(out, "WRITTEN saver=Out frames=1")) << out;
+    EXPECT_TRUE(std::filesystem::exists(dir.Path() / "copy/c.0001.tga"));
+    EXPECT_FALSE(std::filesystem::exists(dir.Path() / "copy/c.0002.tga"));
 }
 
 } // namespace

@@ -64,8 +64,7 @@ void BMPFormat::AddSaveInputs(Operator *tool) {
 }
 
 void BMPFormat::SetupSave(Operator *tool, Request *req) {
-    Input *in = tool ? tool->FindInput("SaveAlpha") : nullptr;
-    saveAlpha_ = !(req && in) || req->GetInputNumber(in, 1.0) >= 0.5;
+    saveAlpha_ = OptionValue(tool, req, "SaveAlpha", 1.0) >= 0.5;
 }
 
 void BMPFormat::CleanupSave(Operator *) {}

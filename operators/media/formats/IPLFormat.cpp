@@ -61,9 +61,7 @@ void IPLFormat::AddSaveInputs(Operator *tool) {
 }
 
 void IPLFormat::SetupSave(Operator *tool, Request *req) {
-    double q = iplformat_detail::kDefaultQuality;
-    if (tool && req)
-        if (Input *in = tool->FindInput("Quality")) q = req->GetInputNumber(in, q);
+    const double q = OptionValue(tool, req, "Quality", iplformat_detail::kDefaultQuality);
     quality_ = std::clamp(static_cast<int>(std::lround(q)), 0, 100);
 }
 

@@ -28,12 +28,6 @@ ClassRegistration<JpegFormat, ImageFormat> s_Reg(CLSID_JpegFormat, &CLSID_ImageF
                                                   {RegFormatExtension, ".jpg"},
                                                   {RegFormatExtension, ".jpeg"}});
 
-double InputValue(Operator *tool, Request *req, const char *id, double def) {
-    if (!tool || !req) return def;
-    Input *in = tool->FindInput(id);
-    return in ? req->GetInputNumber(in, def) : def;
-}
-
 } // namespace jpegformat_detail
 
 JpegFormat::JpegFormat(const Registry *reg, const ScriptVal &args, const TagList &tags)
@@ -81,17 +75,18 @@ void JpegFormat::AddSaveInputs(Operator *tool) {
 }
 
 void JpegFormat::NotifyChangedSave(Operator *tool, Input *in, Parameter *param, double) {
-    if (!tool || !in || in != tool->FindInput("SetCustomResolution")) return;
+    if (!tool || !in || in != tool->FindGroupInput("SetCustomResolution")) return;
     const auto *n = dynamic_cast<const Number *>(param);
-    if (Input *dpi = tool->FindInput("ResolutionDPI")) dpi->SetAttrsTagList({{ControlVisible, n && n->value > 0.5}});
+    if (Input *dpi = tool->FindGroupInput("ResolutionDPI"))
+        dpi->SetAttrsTagList({{ControlVisible, n && n->value > 0.5}});
 }
 
 void JpegFormat::SetupSave(Operator *tool, Request *req) {
     using namespace jpegformat_detail;
-    quality_ = static_cast<int>(std::lround(InputValue(tool, req, "Quality", 97.0)));
-    chromaSubsampling_ = InputValue(tool, req, "ChromaSubsampling", 0.0) > 0.5;
-    dpi_ = InputValue(tool, req, "SetCustomResolution", 0.0) > 0.5
-               ? std::max(1, static_cast<int>(std::lround(InputValue(tool, req, "ResolutionDPI", 300.0))))
+    quality_ = static_cast<int>(std::lround(OptionValue(tool, req, "Quality", 97.0)));
+    chromaSubsampling_ = OptionValue(tool, req, "ChromaSubsampling", 0.0) > 0.5;
+    dpi_ = OptionValue(tool, req, "SetCustomResolution", 0.0) > 0.5
+               ? std::max(1, static_cast<int>(std::lround(OptionValue(tool, req, "ResolutionDPI", 300.0))))
                : 0;
 }
 

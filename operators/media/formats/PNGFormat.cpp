@@ -33,12 +33,6 @@ ClassRegistration<PNGFormat, ImageFormat> s_Reg(CLSID_PNGFormat, &CLSID_ImageFor
                                                  {RegFormatName, "PNG Files"},
                                                  {RegFormatExtension, ".png"}});
 
-double InputValue(Operator *tool, Request *req, const char *id, double def) {
-    if (!tool || !req) return def;
-    Input *in = tool->FindInput(id);
-    return in ? req->GetInputNumber(in, def) : def;
-}
-
 /// The stream and the reason a library call failed, reached through libpng's io pointer.
 struct Channel {
     IOClass *io = nullptr;
@@ -292,7 +286,7 @@ void PNGFormat::AddLoadInputs(Operator *tool) {
 }
 
 void PNGFormat::SetupLoad(Operator *tool, Request *req) {
-    postMultiply_ = pd::InputValue(tool, req, "PostMultiply", 1.0) > 0.5;
+    postMultiply_ = OptionValue(tool, req, "PostMultiply", 1.0) > 0.5;
 }
 
 void PNGFormat::AddSaveInputs(Operator *tool) {
@@ -346,20 +340,20 @@ void PNGFormat::AddSaveInputs(Operator *tool) {
 }
 
 void PNGFormat::NotifyChangedSave(Operator *tool, Input *in, Parameter *param, double) {
-    if (!tool || !in || in != tool->FindInput("GammaMode")) return;
+    if (!tool || !in || in != tool->FindGroupInput("GammaMode")) return;
     const auto *n = dynamic_cast<const Number *>(param);
     const bool shown = n && std::lround(n->value) == GammaValue;
-    if (Input *g = tool->FindInput("Gamma")) g->SetAttrsTagList({{ControlVisible, shown}});
+    if (Input *g = tool->FindGroupInput("Gamma")) g->SetAttrsTagList({{ControlVisible, shown}});
 }
 
 void PNGFormat::SetupSave(Operator *tool, Request *req) {
-    saveAlpha_ = pd::InputValue(tool, req, "SaveAlpha", 1.0) > 0.5;
-    preDivide_ = pd::InputValue(tool, req, "PreDivide", 1.0) > 0.5;
-    depthMode_ = std::clamp(static_cast<int>(std::lround(pd::InputValue(tool, req, "Depth", 0.0))), 0, 2);
+    saveAlpha_ = OptionValue(tool, req, "SaveAlpha", 1.0) > 0.5;
+    preDivide_ = OptionValue(tool, req, "PreDivide", 1.0) > 0.5;
+    depthMode_ = std::clamp(static_cast<int>(std::lround(OptionValue(tool, req, "Depth", 0.0))), 0, 2);
     compressionLevel_ =
-        std::clamp(static_cast<int>(std::lround(pd::InputValue(tool, req, "CompressionLevel", 6.0))), 0, 9);
-    gammaMode_ = std::clamp(static_cast<int>(std::lround(pd::InputValue(tool, req, "GammaMode", 0.0))), 0, 3);
-    gamma_ = pd::InputValue(tool, req, "Gamma", 1.0);
+        std::clamp(static_cast<int>(std::lround(OptionValue(tool, req, "CompressionLevel", 6.0))), 0, 9);
+    gammaMode_ = std::clamp(static_cast<int>(std::lround(OptionValue(tool, req, "GammaMode", 0.0))), 0, 3);
+    gamma_ = OptionValue(tool, req, "Gamma", 1.0);
 }
 
 bool PNGFormat::LoadHeader(IOClass *stream) {

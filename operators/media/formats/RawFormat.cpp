@@ -261,8 +261,7 @@ void RawFormat::AddSaveInputs(Operator *tool) {
 }
 
 void RawFormat::SetupSave(Operator *tool, Request *req) {
-    Input *in = tool ? tool->FindInput("Compression") : nullptr;
-    const double v = req && in ? req->GetInputNumber(in, 2.0) : 2.0;
+    const double v = OptionValue(tool, req, "Compression", 2.0);
     saveCompression_ = std::clamp(static_cast<int>(std::lround(v)), 0, 2);
 }
 

@@ -107,10 +107,8 @@ void TargaFormat::AddSaveInputs(Operator *tool) {
 }
 
 void TargaFormat::SetupSave(Operator *tool, Request *req) {
-    Input *alpha = tool ? tool->FindInput("SaveAlpha") : nullptr;
-    Input *compress = tool ? tool->FindInput("Compress") : nullptr;
-    saveAlpha_ = !(req && alpha) || req->GetInputNumber(alpha, 1.0) >= 0.5;
-    compress_ = !(req && compress) || req->GetInputNumber(compress, 1.0) >= 0.5;
+    saveAlpha_ = OptionValue(tool, req, "SaveAlpha", 1.0) >= 0.5;
+    compress_ = OptionValue(tool, req, "Compress", 1.0) >= 0.5;
 }
 
 void TargaFormat::CleanupSave(Operator *) {}

@@ -93,7 +93,11 @@ TEST(Clip, WritesASequenceAndReadsItBackWithItsFramesAndGaps) {
     out.SetStartFrame(1001);
     Ref<Image> img = Orvane::Test::PatternImage(5, 3);
     std::string error;
-    for (int64_t f : {0, 1, 3}) ASSERT_TRUE(out.PutFrameTagList(f, img.Get(), {}, error)) << error;
+    // Missing folders are made only when asked for.
+    EXPECT_FALSE(out.PutFrameTagList(0, img.Get(), {}, error));
+    EXPECT_FALSE(std::filesystem::exists(dir.path / "deep"));
+    for (int64_t f : {0, 1, 3})
+        ASSERT_TRUE(out.PutFrameTagList(f, img.Get(), {{ClipFrameMakeFolders, 1}}, error)) << error;
     EXPECT_TRUE(std::filesystem::exists(dir.path / "deep/folder/shot.1001.tfmt"));
     EXPECT_TRUE(std::filesystem::exists(dir.path / "deep/folder/shot.1004.tfmt"));
 

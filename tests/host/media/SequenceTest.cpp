@@ -53,6 +53,10 @@ TEST(SequenceName, FrameNamesKeepThePaddingAndGrowWhenNeeded) {
     const SequenceName one = ParseSequenceName("f9.png");
     EXPECT_EQ(SequencePath(one, 10), "f10.png");
     EXPECT_EQ(SequenceDisplayName(one), "f#.png");
+    // The display form reads back as the same sequence; the last run of signs counts.
+    const SequenceName hashes = ParseSequenceName("out/v#2/render_######.exr");
+    EXPECT_EQ(SequencePath(hashes, 1012), "out/v#2/render_001012.exr");
+    EXPECT_EQ(SequenceDisplayName(ParseSequenceName(SequenceDisplayName(s))), SequenceDisplayName(s));
     for (int padding = 1; padding <= 8; ++padding) {
         SequenceName p = ParseSequenceName("x." + std::string(padding, '0') + ".raw");
         ASSERT_EQ(p.padding, padding);

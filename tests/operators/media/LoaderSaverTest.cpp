@@ -1,0 +1,222 @@
+// Loader and Saver in a document: which file a time reads, the missing-frame
+// rules and their messages, the import options with values computed here,
+// and where the Saver writes (numbering, folders, failures).
+#include <gtest/gtest.h>
+
+#include <cmath>
+#include <filesystem>
+
+#include "host/flow/Engine.h"
+#include "host/flow/InputValue.h"
+#include "host/flow/RenderTask.h"
+#include "host/media/Clip.h"
+#include "tests/operators/media/FormatTestSupport.h"
+
+namespace Orvane::FmtTest {
+namespace {
+
+constexpr int W = 6, H = 4;
+
+/// Frame k of the test sequence: R = 1000 k + x + 10 y, G 500, B 65535, alpha one half.
+Ref<Image> Frame16(int k) {
+    Ref<Image> img = NewImageTagList({{ImgWidth, W}, {ImgHeight, H}, {ImgDepth, DepthRGBAInt16}});
+    img->AllocScanLineData();
+    for (int y = 0; y < H; ++y)
+        for (int x = 0; x < W; ++x) {
+            uint16_t *p = reinterpret_cast<uint16_t *>(img->PixelAddress(x, y));
+            p[0] = static_cast<uint16_t>(1000 * k + x + 10 * y);
+            p[1] = 500;
+            p[2] = 65535;
+            p[3] = 32768;
+        }
+    return img;
+}
+
+uint16_t R16(const Image &img, int x, int y) { return reinterpret_cast<const uint16_t *>(img.PixelAddress(x, y))[0]; }
+
+class LoaderSaver : public FormatSuite {
+protected:
+    void SetUp() override {
+        for (int k = 1; k <= 4; ++k) {
+            Clip c(dir / "plate.0000.raw");
+            c.SetStartFrame(1000 + k);
+            std::string error;
+            ASSERT_TRUE(c.PutFrameTagList(0, Frame16(k).Get(), {}, error)) << error;
+        }
+        loader = doc.AddTool(OvID("Loader"), "Plate");
+        ASSERT_NE(loader, nullptr);
+        Set(loader, "Clip", ScriptVal(dir / "plate.1001.raw"));
+    }
+    void Set(Operator *op, const char *id, const ScriptVal &v) {
+        Input *in = op->FindInput(id);
+        ASSERT_NE(in, nullptr) << id;
+        ASSERT_EQ(ApplyInputValue(doc, in, v, false), "") << id;
+    }
+    /// The file number a time shows (R of pixel 0,0 / 1000), -1 for no image.
+    int FileAt(double t) {
+        Ref<Image> img = Orvane::Test::EvalImage(loader, t);
+        return img ? R16(*img, 0, 0) / 1000 : -1;
+    }
+    std::string LastConsole() {
+        const auto lines = doc.ConsoleLines();
+        return lines.empty() ? std::string() : lines.back().text;
+    }
+
+    TempDir dir;
+    OrvaneDoc doc;
+    Operator *loader = nullptr;
+};
+
+TEST_F(LoaderSaver, LoaderPlacesTheSequenceOnTheTimeLine) {
+    // The clip's length fills the trims and the out point.
+    EXPECT_EQ(Orvane::Test::EvalImage(loader, 0)->Width(), W);
+    Set(loader, "GlobalIn", ScriptVal(10));
+    Set(loader, "HoldFirstFrame", ScriptVal(1));
+    EXPECT_EQ(loader->FindInput("GlobalOut")->Constant()->ToScript().AsNumber(), 14);
+    const int expected[] = {1, 1, 2, 3, 4};
+    for (int i = 0; i < 5; ++i) EXPECT_EQ(FileAt(10 + i), expected[i]) << i;
+    EXPECT_EQ(FileAt(9), -1);
+    EXPECT_EQ(FileAt(15), -1);
+    EXPECT_NE(LastConsole().find("Plate"), std::string::npos);
+    Set(loader, "Reverse", ScriptVal(1));
+    EXPECT_EQ(FileAt(10), 4);
+    EXPECT_EQ(FileAt(14), 1);
+    Set(loader, "Loop", ScriptVal(1));
+    Set(loader, "Reverse", ScriptVal(0));
+    EXPECT_EQ(FileAt(15), 1);
+    EXPECT_EQ(FileAt(17), 2);
+    // The trims choose the files used.
+    Set(loader, "ClipTimeStart", ScriptVal(2));
+    Set(loader, "HoldFirstFrame", ScriptVal(0));
+    EXPECT_EQ(FileAt(10), 3);
+    EXPECT_EQ(FileAt(11), 4);
+    EXPECT_EQ(FileAt(12), 3); // looping the two used frames
+}
+
+TEST_F(LoaderSaver, MissingFramesFailHoldOrFill) {
+    std::filesystem::remove(dir / "plate.1002.raw");
+    EXPECT_EQ(FileAt(0), 1); // records the clip's frame size
+    EXPECT_EQ(FileAt(1), -1);
+    EXPECT_EQ(LastConsole(), "Plate failed to load file \"" + (dir / "plate.1002.raw") + "\" (clip \"" +
+                                 (dir / "plate.1001.raw") + "\" at frame 1) : No such file or directory");
+    Set(loader, "MissingFrames", ScriptVal(1));
+    EXPECT_EQ(FileAt(1), 1);
+    EXPECT_EQ(FileAt(2), 3);
+    Set(loader, "MissingFrames", ScriptVal(2));
+    Set(loader, "Red", ScriptVal(0.25));
+    Set(loader, "Alpha", ScriptVal(1));
+    Ref<Image> filled = Orvane::Test::EvalImage(loader, 1);
+    ASSERT_TRUE(filled);
+    EXPECT_EQ(filled->Width(), W);
+    EXPECT_EQ(filled->Height(), H);
+    const FltPixel p = filled->GetFlt(2, 2);
+    EXPECT_EQ(p.R, 0.25f);
+    EXPECT_EQ(p.G, 0.0f);
+    EXPECT_EQ(p.A, 1.0f);
+}
+
+TEST_F(LoaderSaver, AlphaOptionsAndDepth) {
+    Set(loader, "PostMultiplyByAlpha", ScriptVal(1));
+    Ref<Image> post = Orvane::Test::EvalImage(loader, 0);
+    ASSERT_TRUE(post);
+    for (int y = 0; y < H; ++y)
+        for (int x = 0; x < W; ++x) {
+            const double r = 1000 + x + 10 * y;
+            EXPECT_EQ(R16(*post, x, y), std::lround(r * 32768 / 65535)) << x << "," << y;
+        }
+    Set(loader, "PostMultiplyByAlpha", ScriptVal(0));
+    Set(loader, "InvertAlpha", ScriptVal(1));
+    EXPECT_EQ(Orvane::Test::EvalImage(loader, 0)->GetFlt(0, 0).A * 65535.0f, 32767.0f);
+    Set(loader, "MakeAlphaSolid", ScriptVal(1));
+    EXPECT_EQ(Orvane::Test::EvalImage(loader, 0)->GetFlt(0, 0).A, 0.0f); // solid, inverted
+    Set(loader, "InvertAlpha", ScriptVal(0));
+    Set(loader, "Depth", ScriptVal(5)); // float32
+    Ref<Image> flt = Orvane::Test::EvalImage(loader, 0);
+    ASSERT_TRUE(flt && flt->IsRGBAFlt128());
+    EXPECT_FLOAT_EQ(flt->GetFlt(3, 1).R, 1013.0f / 65535.0f);
+    EXPECT_EQ(flt->GetFlt(3, 1).A, 1.0f);
+}
+
+TEST_F(LoaderSaver, ProxyRendersAreShrunkByWholeFactors) {
+    RenderTask task;
+    task.proxyScale = 2;
+    EvalOptions options;
+    options.task = &task;
+    options.flags = ReqFlagProxy;
+    Ref<Parameter> v = Evaluate(loader->FindMainOutput(), 0, options);
+    auto *img = dynamic_cast<Image *>(v.Get());
+    ASSERT_NE(img, nullptr);
+    EXPECT_EQ(img->Width(), W / 2);
+    EXPECT_EQ(img->Height(), H / 2);
+    // Each pixel averages a 2 x 2 block: R = 1000 + 2x + 20y + (0 + 1 + 10 + 11) / 4.
+    EXPECT_NEAR(img->GetFlt(1, 1).R * 65535.0f, 1000 + 2 + 20 + 5.5, 0.51);
+}
+
+TEST_F(LoaderSaver, SaverNumbersFilesAndWritesOnlyInRenders) {
+    Operator *saver = doc.AddTool(OvID("Saver"), "Out");
+    ASSERT_NE(saver, nullptr);
+    ASSERT_TRUE(saver->FindInput("Input")->ConnectTo(loader->FindMainOutput()));
+    Set(saver, "Clip", ScriptVal(dir / "out/shot.0000.raw"));
+    Set(saver, "SequenceStartFrame", ScriptVal(1000));
+    Set(loader, "GlobalIn", ScriptVal(3));
+    RenderTask task;
+    task.startTime = 3;
+    EvalOptions options;
+    options.task = &task;
+    auto render = [&](double t) { return Evaluate(saver->FindMainOutput(), t, options); };
+
+    // Without "Create Folder During Render" a missing folder fails the frame.
+    EXPECT_FALSE(render(5));
+    EXPECT_EQ(LastConsole(), "Out failed to write to \"" + (dir / "out/shot.0000.raw") + "\" (\"" +
+                                 (dir / "out/shot.1005.raw") + "\") frame 5: No such file or directory");
+    Set(saver, "CreateDir", ScriptVal(1));
+    ASSERT_TRUE(render(5));
+    EXPECT_EQ(saver->FrameFileName(5, &task), dir / "out/shot.1005.raw");
+    // The file holds the loaded frame exactly.
+    Clip back(dir / "out/shot.1005.raw");
+    std::string error;
+    Ref<Image> read = back.GetFrameTagList(0, {}, error);
+    ASSERT_TRUE(read) << error;
+    EXPECT_EQ(R16(*read, 4, 2), 3000 + 4 + 20);
+
+    // Saver-relative numbering counts from the render's first frame.
+    Set(saver, "SetSequenceStart", ScriptVal(1));
+    ASSERT_TRUE(render(5));
+    EXPECT_TRUE(std::filesystem::exists(dir / "out/shot.1002.raw"));
+    EXPECT_EQ(saver->FrameFileName(5, nullptr), dir / "out/shot.1005.raw"); // from the global start, 0
+
+    // An interactive look passes the image on and writes nothing.
+    task.interactive = true;
+    options.flags = ReqFlagInteractive;
+    EXPECT_TRUE(render(6));
+    EXPECT_FALSE(std::filesystem::exists(dir / "out/shot.1003.raw"));
+}
+
+TEST_F(LoaderSaver, SaverCutsToTheFrameAndCanSaveAlphaAsColor) {
+    ImgRectI window(-2, -1, 10, 7);
+    Ref<Image> src =
+        NewImageTagList({{ImgWidth, 8}, {ImgHeight, 6}, {ImgDepth, DepthRGBAFlt32}, {ImgDataWindow, &window}});
+    src->AllocScanLineData();
+    src->Fill(FltPixel{0.5f, 0.25f, 0.125f, 0.75f});
+    Orvane::Test::AddImageSource(doc, "Src", src);
+    Operator *saver = doc.AddTool(OvID("Saver"), "Out");
+    ASSERT_TRUE(saver->FindInput("Input")->ConnectTo(doc.FindTool("Src")->FindMainOutput()));
+    Set(saver, "Clip", ScriptVal(dir / "cut.raw"));
+    Set(saver, "SaveAlphaToColor", ScriptVal(1));
+    RenderTask task;
+    EvalOptions options;
+    options.task = &task;
+    ASSERT_TRUE(Evaluate(saver->FindMainOutput(), 0, options));
+    Clip back(dir / "cut.raw");
+    std::string error;
+    Ref<Image> read = back.GetFrameTagList(0, {}, error);
+    ASSERT_TRUE(read) << error;
+    EXPECT_EQ(read->DataWindow(), ImgRectI(0, 0, 8, 6));
+    const FltPixel p = read->GetFlt(3, 3);
+    EXPECT_EQ(p.R, 0.75f);
+    EXPECT_EQ(p.B, 0.75f);
+    EXPECT_EQ(p.A, 0.75f);
+}
+
+} // namespace
+} // namespace Orvane::FmtTest

@@ -1,0 +1,547 @@
+// OpenEXRFormat: round trips at both float depths with every compression and
+// with data windows around, inside and beside the frame; auxiliary channels
+// and Metadata; files built byte by byte here (and turned tiled, multi-part
+// and multi-view by the OpenEXR tools) read to known values; the sample
+// images against what exrheader reports; damaged files; regions; options.
+#include <gtest/gtest.h>
+
+#include <cmath>
+#include <cstring>
+#include <filesystem>
+#include <functional>
+#include <map>
+#include <regex>
+#include <string>
+#include <vector>
+
+#include "host/image/Half.h"
+#include "tests/operators/media/FormatTestSupport.h"
+
+namespace Orvane {
+namespace exrtest_detail {
+
+using namespace FmtTest;
+const char *const kId = "OpenEXRFormat";
+
+float Value(int x, int y, int c) { return static_cast<float>((x * 3 + y * 5 + c * 7) % 32) / 4.f - 2.f; }
+
+/// A w x h image of `depth` whose data window is `window`; each pixel is
+/// Value() (plus a third for float32, so half precision would not do).
+Ref<Image> Pattern(int w, int h, int depth, const ImgRectI &window, bool smooth = false) {
+    Ref<Image> img = NewImageTagList({{ImgWidth, w}, {ImgHeight, h}, {ImgDepth, depth}, {ImgDataWindow, &window}});
+    EXPECT_TRUE(img && img->AllocScanLineData());
+    const float extra = depth == DepthRGBAFlt32 ? 1.f / 3.f : 0.f;
+    for (int y = window.y0; y < window.y1; ++y)
+        for (int x = window.x0; x < window.x1; ++x) {
+            auto v = [&](int c) { return smooth ? 0.25f + 0.01f * (x + 2 * y + 5 * c) : Value(x, y, c) + extra; };
+            img->PutFlt(x, y, {v(0), v(1), v(2), v(3)});
+        }
+    return img;
+}
+
+void ExpectSame(const Image &want, const Image &got, float tolerance = 0.f) {
+    ASSERT_EQ(got.DataWindow(), want.DataWindow());
+    int bad = 0;
+    for (int y = want.DataWindow().y0; y < want.DataWindow().y1; ++y)
+        for (int x = want.DataWindow().x0; x < want.DataWindow().x1; ++x) {
+            const FltPixel a = want.GetFlt(x, y), b = got.GetFlt(x, y);
+            const float d =
+                std::max({std::fabs(a.R - b.R), std::fabs(a.G - b.G), std::fabs(a.B - b.B), std::fabs(a.A - b.A)});
+            if (!(d <= tolerance) && ++bad < 4) ADD_FAILURE() << "pixel " << x << "," << y << " off by " << d;
+        }
+}
+
+/// Loads through a reading tool whose inputs hold `options`.
+Ref<Image> LoadWith(const Bytes &data, const Options &options, std::string *error = nullptr) {
+    OrvaneDoc doc;
+    Operator *tool = Orvane::Test::AddImageSource(doc, "Loader", nullptr);
+    Ref<ImageFormat> f = MakeFormat(kId);
+    f->AddLoadInputs(tool);
+    Request req(tool, nullptr, 0.0, 0, nullptr);
+    for (const auto &[name, value] : options) req.SetInputData(tool->FindInput(name), MakeRef<Number>(value).Get());
+    f->SetupLoad(tool, &req);
+    MemoryIO io(data);
+    Ref<Image> img;
+    if (!f->LoadHeader(&io) || !f->LoadFrameTagList(0, img, {})) {
+        if (error) *error = f->Error();
+        return nullptr;
+    }
+    return img;
+}
+
+// ---- files made here, byte by byte, in the published layout ----
+
+struct Channel {
+    std::string name;
+    int type; // 1 HALF, 2 FLOAT
+};
+
+void Put32(Bytes &b, uint32_t v) {
+    for (int i = 0; i < 4; ++i) b.push_back(static_cast<uint8_t>(v >> (8 * i)));
+}
+void PutBox(Bytes &b, const ImgRectI &r) { // inclusive max, as files hold it
+    for (int v : {r.x0, r.y0, r.x1, r.y1}) Put32(b, static_cast<uint32_t>(v));
+}
+void Attr(Bytes &b, const std::string &name, const std::string &type, const Bytes &value) {
+    b.insert(b.end(), name.begin(), name.end());
+    b.push_back(0);
+    b.insert(b.end(), type.begin(), type.end());
+    b.push_back(0);
+    Put32(b, static_cast<uint32_t>(value.size()));
+    b.insert(b.end(), value.begin(), value.end());
+}
+
+/// An uncompressed scan-line file; channel c of file pixel (x, y) is value(x, y, c).
+Bytes HandMade(const ImgRectI &display, const ImgRectI &data, std::vector<Channel> channels,
+               const std::function<float(int, int, const std::string &)> &value) {
+    std::sort(channels.begin(), channels.end(), [](auto &a, auto &b) { return a.name < b.name; });
+    Bytes b = {0x76, 0x2f, 0x31, 0x01, 2, 0, 0, 0}, v;
+    for (const Channel &c : channels) {
+        v.insert(v.end(), c.name.begin(), c.name.end());
+        v.push_back(0);
+        Put32(v, c.type);
+        Put32(v, 0);
+        Put32(v, 1), Put32(v, 1);
+    }
+    v.push_back(0);
+    Attr(b, "channels", "chlist", v);
+    Attr(b, "compression", "compression", {0});
+    v.clear(), PutBox(v, data), Attr(b, "dataWindow", "box2i", v);
+    v.clear(), PutBox(v, display), Attr(b, "displayWindow", "box2i", v);
+    Attr(b, "lineOrder", "lineOrder", {0});
+    v.clear(), Put32(v, 0x3f800000u), Attr(b, "pixelAspectRatio", "float", v);
+    v.clear(), Put32(v, 0), Put32(v, 0), Attr(b, "screenWindowCenter", "v2f", v);
+    v.clear(), Put32(v, 0x3f800000u), Attr(b, "screenWindowWidth", "float", v);
+    b.push_back(0);
+    const int lines = data.y1 - data.y0 + 1, width = data.x1 - data.x0 + 1;
+    size_t bytesPerLine = 0;
+    for (const Channel &c : channels) bytesPerLine += size_t(width) * (c.type == 1 ? 2 : 4);
+    const size_t table = b.size();
+    b.resize(table + 8 * size_t(lines));
+    for (int i = 0; i < lines; ++i) {
+        const uint64_t at = b.size();
+        for (int k = 0; k < 8; ++k) b[table + 8 * i + k] = static_cast<uint8_t>(at >> (8 * k));
+        Put32(b, static_cast<uint32_t>(data.y0 + i));
+        Put32(b, static_cast<uint32_t>(bytesPerLine));
+        for (const Channel &c : channels)
+            for (int x = data.x0; x <= data.x1; ++x) {
+                const float f = value(x, data.y0 + i, c.name);
+                if (c.type == 1) {
+                    const uint16_t h = FloatToHalf(f);
+                    b.push_back(static_cast<uint8_t>(h)), b.push_back(static_cast<uint8_t>(h >> 8));
+                } else {
+                    uint32_t u;
+                    std::memcpy(&u, &f, 4);
+                    Put32(b, u);
+                }
+            }
+    }
+    return b;
+}
+
+const std::vector<Channel> kRGBA = {{"R", 1}, {"G", 1}, {"B", 1}, {"A", 1}};
+int ChannelIndex(const std::string &n) { return n == "R" ? 0 : n == "G" ? 1 : n == "B" ? 2 : 3; }
+
+/// Display (1,1)-(12,8), data (3,2)-(10,6): the image is 12 x 8 with data
+/// window x 2..10, y 2..7, image (x, y) being file (x + 1, 8 - y).
+const ImgRectI kDisplay(1, 1, 12, 8), kData(3, 2, 10, 6), kImageWindow(2, 2, 10, 7);
+Bytes OffsetFile(int seed) {
+    return HandMade(kDisplay, kData, kRGBA,
+                    [seed](int x, int y, const std::string &c) { return Value(x + seed, y, ChannelIndex(c)); });
+}
+void ExpectOffsetFile(const Image &img, int seed) {
+    EXPECT_EQ(img.Width(), 12);
+    EXPECT_EQ(img.Height(), 8);
+    ASSERT_EQ(img.DataWindow(), kImageWindow);
+    for (int y = kImageWindow.y0; y < kImageWindow.y1; ++y)
+        for (int x = kImageWindow.x0; x < kImageWindow.x1; ++x) {
+            const FltPixel p = img.GetFlt(x, y);
+            const FltPixel want{Value(x + 1 + seed, 8 - y, 0), Value(x + 1 + seed, 8 - y, 1),
+                                Value(x + 1 + seed, 8 - y, 2), Value(x + 1 + seed, 8 - y, 3)};
+            ASSERT_EQ(p, want) << x << "," << y;
+        }
+}
+
+/// exrheader's data and display windows, part by part.
+struct Windows {
+    std::vector<ImgRectI> data, display; // inclusive max, as reported
+};
+Windows Exrheader(const std::string &path) {
+    Windows w;
+    const Bytes out = Capture("exrheader '" + path + "'");
+    const std::string text(out.begin(), out.end());
+    const std::regex box(R"((dataWindow|displayWindow) \(type box2i\): \((-?\d+) (-?\d+)\) - \((-?\d+) (-?\d+)\))");
+    for (std::sregex_iterator it(text.begin(), text.end(), box), end; it != end; ++it) {
+        const ImgRectI r(std::stoi((*it)[2]), std::stoi((*it)[3]), std::stoi((*it)[4]), std::stoi((*it)[5]));
+        ((*it)[1] == "dataWindow" ? w.data : w.display).push_back(r);
+    }
+    return w;
+}
+ImgRectI Flipped(const ImgRectI &data, const ImgRectI &display) {
+    const int h = display.y1 - display.y0 + 1;
+    return ImgRectI(data.x0 - display.x0, h - (data.y1 - display.y0) - 1, data.x1 - display.x0 + 1,
+                    h - (data.y0 - display.y0));
+}
+
+std::string Samples() { return ORVANE_SOURCE_DIR "/../shared/testdata/openexr-images"; }
+
+class OpenEXRFormatTest : public FormatSuite {};
+
+// ---- round trips ----
+
+TEST_F(OpenEXRFormatTest, RoundTripsEveryCompressionAndWindow) {
+    const std::vector<ImgRectI> windows = {ImgRectI(0, 0, 37, 23), ImgRectI(-5, -3, 45, 30), ImgRectI(4, 6, 20, 17),
+                                           ImgRectI(30, 18, 50, 40)};
+    for (int depth : {DepthRGBAFlt16, DepthRGBAFlt32})
+        for (int c = 0; c <= 9; ++c)
+            for (const ImgRectI &window : windows) {
+                SCOPED_TRACE(testing::Message() << "depth " << depth << " compression " << c << " window " << window.x0
+                                                << "," << window.y0);
+                // Lossless: None, RLE, both Zips, Piz, and Pxr24 and B44(A) on float32 (they keep FLOAT).
+                const bool lossless = c <= 4 || (depth == DepthRGBAFlt32 && (c == 6 || c == 7));
+                Ref<Image> src = Pattern(37, 23, depth, window, !lossless);
+                const Bytes b = SaveWith(kId, src.Get(), {{"Compression", c}});
+                const LoadResult r = Load(kId, b);
+                ASSERT_TRUE(r.image) << r.error;
+                EXPECT_EQ(r.image->Depth(), depth);
+                ExpectSame(*src, *r.image, lossless ? 0.f : depth == DepthRGBAFlt32 && c == 5 ? 1e-4f : 0.02f);
+            }
+}
+
+TEST_F(OpenEXRFormatTest, FileWindowsAndDepthOptionAgreeWithExrheader) {
+    if (!HaveProgram("exrheader")) GTEST_SKIP() << "exrheader is not installed";
+    TempDir dir;
+    Ref<Image> src = Pattern(37, 23, DepthRGBAInt16, ImgRectI(4, 6, 20, 17));
+    src->SetScale(2.0, 1.0);
+    WriteFile(dir / "a.exr", SaveWith(kId, src.Get(), {{"Depth", 2}, {"Compression", 4}}));
+    const Windows w = Exrheader(dir / "a.exr");
+    ASSERT_EQ(w.data.size(), 1u);
+    // Image rows 6..16 (bottom up) of 23 are file lines 6..16 counted from the top.
+    EXPECT_EQ(w.data[0], ImgRectI(4, 23 - 17, 19, 23 - 1 - 6));
+    EXPECT_EQ(w.display[0], ImgRectI(0, 0, 36, 22));
+    const std::string header = [&] {
+        const Bytes out = Capture("exrheader '" + dir / "a.exr" + "'");
+        return std::string(out.begin(), out.end());
+    }();
+    EXPECT_NE(header.find("R, 32-bit floating-point"), std::string::npos);
+    EXPECT_NE(header.find("piz"), std::string::npos);
+    EXPECT_NE(header.find("pixelAspectRatio (type float): 2"), std::string::npos);
+    // Integer pixels come back as 0..1 floats; the aspect as written.
+    const LoadResult r = Load(kId, ReadFile(dir / "a.exr"));
+    ASSERT_TRUE(r.image) << r.error;
+    EXPECT_EQ(r.image->Depth(), DepthRGBAFlt32);
+    EXPECT_DOUBLE_EQ(r.image->XScale() / r.image->YScale(), 2.0);
+    ExpectSame(*src, *r.image, 1e-6f);
+}
+
+TEST_F(OpenEXRFormatTest, AuxiliaryChannelsAndChannelBoxes) {
+    const ImgRectI window(-2, 1, 15, 9);
+    Ref<Image> src = Pattern(13, 8, DepthRGBAFlt16, window);
+    const AuxChannelKind kinds[] = {AuxChannelKind::Z, AuxChannelKind::VectorX, AuxChannelKind::BackVectorY,
+                                    AuxChannelKind::Coverage};
+    for (AuxChannelKind k : kinds) ASSERT_TRUE(src->AddAuxChannel(k));
+    for (int y = window.y0; y < window.y1; ++y)
+        for (int i = 0; i < 4; ++i)
+            for (int x = 0; x < window.Width(); ++x) src->AuxRow(kinds[i], y)[x] = 1000.f * i + x * 0.1f + y / 3.f;
+    const Bytes b = SaveWith(kId, src.Get(), {{"SaveG", 0}, {"SaveYVel", 0}});
+    const std::string text(b.begin(), b.end());
+    for (const char *name : {"Z", "velX", "rvelY", "pixelCover"}) EXPECT_NE(text.find(name), std::string::npos);
+    const LoadResult r = Load(kId, b);
+    ASSERT_TRUE(r.image) << r.error;
+    ASSERT_EQ(r.image->DataWindow(), window);
+    for (int i = 0; i < 4; ++i) {
+        ASSERT_TRUE(r.image->HasAuxChannel(kinds[i]));
+        for (int y = window.y0; y < window.y1; ++y)
+            ASSERT_EQ(0, std::memcmp(r.image->AuxRow(kinds[i], y), src->AuxRow(kinds[i], y), 4 * window.Width()));
+    }
+    EXPECT_FALSE(r.image->HasAuxChannel(AuxChannelKind::VectorY));
+    const FltPixel p = r.image->GetFlt(3, 4), s = src->GetFlt(3, 4);
+    EXPECT_EQ(p, (FltPixel{s.R, 0.f, s.B, s.A})); // G was not written and reads as 0
+}
+
+TEST_F(OpenEXRFormatTest, MetadataRoundTripsWithTypes) {
+    Ref<Image> src = Pattern(8, 6, DepthRGBAFlt16, ImgRectI(0, 0, 8, 6));
+    ScriptVal &md = src->Metadata();
+    md.Set("owner", ScriptVal("Test Studio"));
+    md.Set("TimeCode", ScriptVal("01:02:03:04"));
+    md.Set("Focus", ScriptVal(2.5));
+    md.Set("aperture", ScriptVal(2.8));
+    md.Set("frameCount", ScriptVal(42));
+    md.Set("exactness", ScriptVal(0.1));
+    ScriptVal types = ScriptVal::Table();
+    types.Set("frameCount", ScriptVal("int"));
+    types.Set("exactness", ScriptVal("double"));
+    md.Set("OpenEXRTypes", types);
+    ScriptVal v2 = ScriptVal::Table("v2f"), box = ScriptVal::Table("box2i"), m = ScriptVal::Table("m44f");
+    for (double d : {1.5, -2.0}) v2.Append(ScriptVal(d));
+    for (double d : {-1.0, 2.0, 30.0, 40.0}) box.Append(ScriptVal(d));
+    for (int i = 0; i < 16; ++i) m.Append(ScriptVal(i % 5 == 0 ? 1.0 : 0.0));
+    md.Set("offset", v2);
+    md.Set("crop", box);
+    md.Set("worldToCamera", m);
+    ScriptVal names = ScriptVal::Table();
+    names.Append(ScriptVal("left")).Append(ScriptVal("beauty"));
+    md.Set("tags", names);
+    ScriptVal nested = ScriptVal::Table();
+    nested.Set("Gamma", ScriptVal(2.2));
+    md.Set("GammaSpace", nested); // no file form: left out
+    const Bytes b = SaveWith(kId, src.Get(), {});
+    if (HaveProgram("exrheader")) {
+        TempDir dir;
+        WriteFile(dir / "m.exr", b);
+        const Bytes out = Capture("exrheader '" + dir / "m.exr" + "'");
+        const std::string text(out.begin(), out.end());
+        for (const char *line : {"timeCode (type timecode)", "focus (type float): 2.5", "frameCount (type int): 42",
+                                 "exactness (type double)", "crop (type box2i): (-1 2) - (30 40)",
+                                 "worldToCamera (type m44f)", "tags (type stringvector)", "owner (type string)"})
+            EXPECT_NE(text.find(line), std::string::npos) << line;
+        EXPECT_EQ(text.find("GammaSpace"), std::string::npos);
+    }
+    const LoadResult r = Load(kId, b);
+    ASSERT_TRUE(r.image) << r.error;
+    const ScriptVal &got = r.image->Metadata();
+    for (const char *key : {"owner", "TimeCode", "Focus", "frameCount", "exactness", "offset", "crop", "worldToCamera"})
+        EXPECT_EQ(got.Find(key) ? *got.Find(key) : ScriptVal(), *md.Find(key)) << key;
+    EXPECT_NEAR(got.Find("aperture")->AsNumber(), 2.8, 1e-6); // a float in the file
+    ASSERT_TRUE(got.Find("tags"));
+    EXPECT_EQ(got.Find("tags")->ClassName(), "stringvector");
+    EXPECT_EQ(got.Find("tags")->At(2)->AsText(), "beauty");
+    const ScriptVal *t = got.Find("OpenEXRTypes");
+    ASSERT_TRUE(t);
+    EXPECT_EQ(t->Find("frameCount")->AsText(), "int");
+    EXPECT_EQ(t->Find("exactness")->AsText(), "double");
+    EXPECT_EQ(t->Find("Focus")->AsText(), "float");
+    EXPECT_EQ(t->Find("TimeCode")->AsText(), "timecode");
+}
+
+// ---- files made independently ----
+
+TEST_F(OpenEXRFormatTest, HandMadeFilesReadToKnownValues) {
+    const LoadResult r = Load(kId, OffsetFile(0));
+    ASSERT_TRUE(r.image) << r.error;
+    EXPECT_EQ(r.image->Depth(), DepthRGBAFlt16);
+    ExpectOffsetFile(*r.image, 0);
+
+    // Y alone: grey, opaque; FLOAT makes a float32 image.
+    const Bytes grey = HandMade(ImgRectI(0, 0, 5, 3), ImgRectI(0, 0, 5, 3), {{"Y", 2}},
+                                [](int x, int y, const std::string &) { return x * 0.25f - y / 3.f; });
+    const LoadResult g = Load(kId, grey);
+    ASSERT_TRUE(g.image) << g.error;
+    EXPECT_EQ(g.image->Depth(), DepthRGBAFlt32);
+    for (int y = 0; y < 4; ++y)
+        for (int x = 0; x < 6; ++x) {
+            const float v = x * 0.25f - (3 - y) / 3.f;
+            ASSERT_EQ(g.image->GetFlt(x, y), (FltPixel{v, v, v, 1.f}));
+        }
+
+    // Lower-case names in a layer, no alpha; an unknown channel is left alone.
+    const Bytes layered = HandMade(ImgRectI(0, 0, 3, 1), ImgRectI(0, 0, 3, 1),
+                                   {{"beauty.r", 1}, {"beauty.g", 1}, {"beauty.b", 1}, {"mask", 1}},
+                                   [](int x, int, const std::string &c) { return c == "mask" ? 9.f : x + 0.5f; });
+    const LoadResult l = Load(kId, layered);
+    ASSERT_TRUE(l.image) << l.error;
+    EXPECT_EQ(l.image->GetFlt(2, 1), (FltPixel{2.5f, 2.5f, 2.5f, 1.f}));
+}
+
+TEST_F(OpenEXRFormatTest, TiledMultiPartAndMultiViewFilesFromTheTools) {
+    if (!HaveProgram("exrmaketiled") || !HaveProgram("exrmultipart") || !HaveProgram("exrmultiview"))
+        GTEST_SKIP() << "the OpenEXR tools are not installed";
+    TempDir dir;
+    WriteFile(dir / "a.exr", OffsetFile(0));
+    WriteFile(dir / "b.exr", OffsetFile(5));
+    ASSERT_TRUE(RunShell("exrmaketiled -t 4 4 -z zip '" + dir / "a.exr" + "' '" + dir / "t.exr" + "'"));
+    const LoadResult t = Load(kId, ReadFile(dir / "t.exr"));
+    ASSERT_TRUE(t.image) << t.error;
+    ExpectOffsetFile(*t.image, 0);
+
+    ASSERT_TRUE(RunShell("exrmultipart -combine -i '" + dir / "a.exr" + "::first' '" + dir / "b.exr" +
+                         "::second' -o '" + dir / "p.exr" + "' >/dev/null"));
+    const Bytes parts = ReadFile(dir / "p.exr");
+    Ref<ImageFormat> f = MakeFormat(kId);
+    MemoryIO io(parts);
+    ASSERT_TRUE(f->LoadHeader(&io)) << f->Error();
+    Ref<Image> first;
+    ASSERT_TRUE(f->LoadFrameTagList(0, first, {}));
+    ExpectOffsetFile(*first, 0);
+    OrvaneDoc doc;
+    Operator *tool = Orvane::Test::AddImageSource(doc, "Loader", nullptr);
+    f->AddLoadInputs(tool); // the part list now offers the file's parts
+    Input *part = tool->FindInput("Part");
+    ASSERT_NE(part, nullptr);
+    std::vector<std::string> ids;
+    for (const TagItem *item : part->Tags().FindAll(ListItemId)) ids.push_back(item->AsID().Text());
+    EXPECT_EQ(ids, (std::vector<std::string>{"Default", "first", "second"}));
+    Request req(tool, nullptr, 0.0, 0, nullptr);
+    req.SetInputData(part, MakeRef<IDValue>(OvID("second")).Get());
+    f->SetupLoad(tool, &req);
+    Ref<Image> second;
+    io.Seek(0, IOClass::SeekStart);
+    ASSERT_TRUE(f->LoadHeader(&io) && f->LoadFrameTagList(0, second, {})) << f->Error();
+    ExpectOffsetFile(*second, 5);
+    req.SetInputData(part, MakeRef<IDValue>(OvID("third")).Get());
+    f->SetupLoad(tool, &req);
+    io.Seek(0, IOClass::SeekStart);
+    EXPECT_FALSE(f->LoadHeader(&io));
+
+    // The right view is the file's default; the left eye is still read first.
+    ASSERT_TRUE(RunShell("exrmultiview -z zip right '" + dir / "b.exr" + "' left '" + dir / "a.exr" + "' '" +
+                         dir / "v.exr" + "'"));
+    const Bytes views = ReadFile(dir / "v.exr");
+    const LoadResult left = Load(kId, views);
+    ASSERT_TRUE(left.image) << left.error;
+    ExpectOffsetFile(*left.image, 0);
+    // The right eye, through the format attribute.
+    const LoadResult right = Load(kId, views, {}, [](ImageFormat &fmt) {
+        fmt.SetAttrsTagList({{FormatStereoEye, 1}});
+    });
+    ASSERT_TRUE(right.image) << right.error;
+    ExpectOffsetFile(*right.image, 5);
+}
+
+// ---- the sample images ----
+
+TEST_F(OpenEXRFormatTest, SampleImagesMatchExrheader) {
+    if (!std::filesystem::is_directory(Samples())) GTEST_SKIP() << Samples() << " is absent";
+    if (!HaveProgram("exrheader")) GTEST_SKIP() << "exrheader is not installed";
+    int files = 0;
+    for (const char *folder : {"DisplayWindow", "TestImages", "Chromaticities", "Beachball"})
+        for (const auto &e : std::filesystem::directory_iterator(Samples() + "/" + folder)) {
+            if (e.path().extension() != ".exr") continue;
+            SCOPED_TRACE(e.path().string());
+            const Windows w = Exrheader(e.path());
+            ASSERT_FALSE(w.data.empty());
+            const LoadResult r = Load(kId, ReadFile(e.path()));
+            ASSERT_TRUE(r.image) << r.error;
+            // Multi-part Beachball: the left eye's colour part, "rgba_left", is part 4.
+            const size_t part = w.data.size() == 10 ? 4 : 0;
+            EXPECT_EQ(r.image->Width(), w.display[part].x1 - w.display[part].x0 + 1);
+            EXPECT_EQ(r.image->Height(), w.display[part].y1 - w.display[part].y0 + 1);
+            EXPECT_EQ(r.image->DataWindow(), Flipped(w.data[part], w.display[part]));
+            ++files;
+        }
+    EXPECT_GE(files, 30);
+
+    // The left eye of the single-part and the multi-part Beachball frame agree.
+    const LoadResult single = Load(kId, ReadFile(Samples() + "/Beachball/singlepart.0001.exr"));
+    const LoadResult multi = Load(kId, ReadFile(Samples() + "/Beachball/multipart.0001.exr"));
+    ASSERT_TRUE(single.image && multi.image);
+    const ImgRectI common = single.image->DataWindow() & multi.image->DataWindow();
+    ASSERT_FALSE(common.IsNull());
+    int differ = 0;
+    for (int y = common.y0; y < common.y1; y += 7)
+        for (int x = common.x0; x < common.x1; x += 7)
+            differ += !(single.image->GetFlt(x, y) == multi.image->GetFlt(x, y));
+    EXPECT_EQ(differ, 0);
+    EXPECT_TRUE(multi.image->Metadata().Find("name"));
+    EXPECT_EQ(multi.image->Metadata().Find("name")->AsText(), "rgba_left");
+
+    // Luminance / chroma reads close to the RGB original.
+    const LoadResult rgb = Load(kId, ReadFile(Samples() + "/Chromaticities/Rec709.exr"));
+    const LoadResult yc = Load(kId, ReadFile(Samples() + "/Chromaticities/Rec709_YC.exr"));
+    ASSERT_TRUE(rgb.image && yc.image) << yc.error;
+    ASSERT_EQ(rgb.image->DataWindow(), yc.image->DataWindow());
+    double sum = 0, n = 0;
+    for (int y = 0; y < rgb.image->Height(); y += 3)
+        for (int x = 0; x < rgb.image->Width(); x += 3) {
+            const FltPixel a = rgb.image->GetFlt(x, y), b = yc.image->GetFlt(x, y);
+            sum += std::fabs(a.R - b.R) + std::fabs(a.G - b.G) + std::fabs(a.B - b.B), n += 3;
+        }
+    EXPECT_LT(sum / n, 0.05);
+}
+
+TEST_F(OpenEXRFormatTest, DamagedFilesFailCleanly) {
+    const std::string dir = Samples() + "/Damaged";
+    if (!std::filesystem::is_directory(dir)) GTEST_SKIP() << dir << " is absent";
+    int files = 0;
+    for (const auto &e : std::filesystem::directory_iterator(dir)) {
+        if (!e.is_regular_file()) continue;
+        SCOPED_TRACE(e.path().filename().string());
+        const LoadResult r = Load(kId, ReadFile(e.path()));
+        EXPECT_FALSE(r.image);
+        EXPECT_NE(r.error.find("OpenEXR"), std::string::npos) << r.error;
+        ++files;
+    }
+    EXPECT_GT(files, 80);
+
+    // Truncated files and streams that fail: false with a reason, never a crash.
+    Ref<Image> src = Pattern(40, 30, DepthRGBAFlt16, ImgRectI(0, 0, 40, 30));
+    const Bytes whole = SaveWith(kId, src.Get(), {{"Compression", 3}});
+    for (size_t cut : {size_t(3), size_t(200), whole.size() / 2, whole.size() - 5}) {
+        const LoadResult r = Load(kId, Bytes(whole.begin(), whole.begin() + static_cast<long>(cut)));
+        EXPECT_FALSE(r.image) << cut;
+    }
+    Ref<ImageFormat> f = MakeFormat(kId);
+    f->SetupSave(nullptr, nullptr);
+    LimitedIO full(whole.size() / 2);
+    EXPECT_FALSE(f->SaveHeader(&full, src.Get()) && f->SaveFrame(0, src.Get()));
+    EXPECT_NE(f->Error().find("OpenEXR"), std::string::npos) << f->Error();
+}
+
+// ---- regions and options ----
+
+/// A memory stream that counts the bytes read.
+struct CountingIO : MemoryIO {
+    using MemoryIO::MemoryIO;
+    int64_t Read(void *buffer, int64_t bytes) override {
+        const int64_t n = MemoryIO::Read(buffer, bytes);
+        read += n;
+        return n;
+    }
+    int64_t read = 0;
+};
+
+TEST_F(OpenEXRFormatTest, RegionsDecodeOnlyTheirRows) {
+    const ImgRectI window(-3, 0, 64, 256);
+    Ref<Image> src = Pattern(64, 256, DepthRGBAFlt16, window);
+    const Bytes b = SaveWith(kId, src.Get(), {{"Compression", 1}});
+    for (const ImgRectI &rect : {ImgRectI(-10, 100, 70, 116), ImgRectI(5, 7, 30, 20), ImgRectI(100, 0, 120, 9)}) {
+        SCOPED_TRACE(testing::Message() << rect.x0 << "," << rect.y0 << " " << rect.x1 << "," << rect.y1);
+        Ref<ImageFormat> f = MakeFormat(kId);
+        f->SetupLoad(nullptr, nullptr);
+        CountingIO io(b);
+        ASSERT_TRUE(f->LoadHeader(&io));
+        const int64_t header = io.read;
+        const ImageDomain region(rect);
+        Ref<Image> img;
+        ASSERT_TRUE(f->LoadFrameTagList(0, img, {{ClipFrameRegion, &region}})) << f->Error();
+        const ImgRectI want = rect & window;
+        ASSERT_EQ(img->DataWindow(), want);
+        EXPECT_LT(io.read - header, static_cast<int64_t>(b.size()) / 8);
+        for (int y = want.y0; y < want.y1; ++y)
+            for (int x = want.x0; x < want.x1; ++x) ASSERT_EQ(img->GetFlt(x, y), src->GetFlt(x, y));
+    }
+    const LoadResult pre = Load(kId, b, {{ClipFrameHeaderOnly, 1}});
+    ASSERT_TRUE(pre.image) << pre.error;
+    EXPECT_TRUE(pre.image->IsNoData());
+    EXPECT_EQ(pre.image->DataWindow(), window);
+    std::atomic<bool> stop{true};
+    const LoadResult aborted = Load(kId, b, {}, [&](ImageFormat &fmt) { fmt.abortFlag = &stop; });
+    EXPECT_FALSE(aborted.image);
+}
+
+TEST_F(OpenEXRFormatTest, DisplayOptionsFollowTheirFormula) {
+    Ref<Image> src = Pattern(4, 2, DepthRGBAFlt32, ImgRectI(0, 0, 4, 2));
+    const float low = 0.05f, knee = static_cast<float>(32.0 / std::exp2(1 + 2.47393));
+    src->PutFlt(0, 0, {low, 0.f, -1.f, 0.5f});
+    src->PutFlt(1, 0, {knee, knee, knee, 1.f});
+    const Bytes b = SaveWith(kId, src.Get(), {});
+    // Defaults (and Bypass over any setting) leave every value as stored.
+    for (const Options &o : {Options{}, Options{{"Bypass", 1}, {"Exposure", 3}, {"Defog", 0.01}}}) {
+        Ref<Image> same = LoadWith(b, o);
+        ASSERT_TRUE(same);
+        ExpectSame(*src, *same);
+    }
+    Ref<Image> lit = LoadWith(b, {{"Exposure", 1}});
+    ASSERT_TRUE(lit);
+    const double gain = std::pow(2.0, 1 + 2.47393) * 0.184874;
+    EXPECT_NEAR(lit->GetFlt(0, 0).R, low * gain, 1e-6);
+    EXPECT_EQ(lit->GetFlt(0, 0).B, 0.f);                                   // negatives clip at 0
+    EXPECT_EQ(lit->GetFlt(0, 0).A, 0.5f);                                  // alpha untouched
+    EXPECT_NEAR(lit->GetFlt(1, 0).G, std::pow(2.0, 3.5) * 0.184874, 1e-4); // 2^kneeHigh lands on 2^3.5
+    Ref<Image> fog = LoadWith(b, {{"Defog", 0.01}});
+    ASSERT_TRUE(fog);
+    EXPECT_NEAR(fog->GetFlt(0, 0).R, (low - 0.01) * std::pow(2.0, 2.47393) * 0.184874, 1e-6);
+}
+
+} // namespace exrtest_detail
+} // namespace Orvane
