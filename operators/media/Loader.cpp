@@ -712,6 +712,11 @@ Ref<Image> Loader::FitFieldAndProxy(Request *req, Ref<Image> image, const Settin
 
 void Loader::Process(Request *req) {
     UpdateClipList(req);
+    if (req->GetInputID(inLocalCache_) == OvID("On") && !cacheWarned_.exchange(true))
+        GetDoc()->PrintF(req, ConsoleWarning,
+                         "%s: the local cache is not available yet in this version of Orvane; frames are read from "
+                         "their files",
+                         Name().c_str());
     const double t = req->Time();
     const std::optional<ClipEntry> entry = ClipAt(t);
     if (!entry) {

@@ -11,6 +11,7 @@
 //
 // Thread safety: as Operator. The clip list is rebuilt under its own lock;
 // requests read it under a shared lock.
+#include <atomic>
 #include <memory>
 #include <optional>
 #include <set>
@@ -73,9 +74,10 @@ private:
 
     mutable std::shared_mutex listLock_;
     std::vector<ClipEntry> clips_;
-    ScriptVal clipsSource_;              ///< the table the list was built from
-    std::set<std::string> formatGroups_; ///< format option groups added so far
-    bool filling_ = false;               ///< NotifyChanged is filling inputs itself
+    ScriptVal clipsSource_;                ///< the table the list was built from
+    std::set<std::string> formatGroups_;   ///< format option groups added so far
+    bool filling_ = false;                 ///< NotifyChanged is filling inputs itself
+    std::atomic<bool> cacheWarned_{false}; ///< the missing local cache was reported
 };
 
 } // namespace Orvane

@@ -6,6 +6,7 @@
 #include <gtest/gtest.h>
 
 #include <cmath>
+#include <cstdlib>
 #include <cstring>
 #include <filesystem>
 #include <functional>
@@ -183,7 +184,15 @@ ImgRectI Flipped(const ImgRectI &data, const ImgRectI &display) {
                     h - (data.y0 - display.y0));
 }
 
-std::string Samples() { return ORVANE_SOURCE_DIR "/../shared/testdata/openexr-images"; }
+/// The OpenEXR sample images: $ORVANE_TESTDATA, else the shared folder beside
+/// the source tree, else the workplace's shared folder (a clone may live elsewhere).
+std::string Samples() {
+    if (const char *env = std::getenv("ORVANE_TESTDATA")) return std::string(env) + "/openexr-images";
+    for (const char *root : {ORVANE_SOURCE_DIR "/../shared/testdata", "/work/shared/testdata"})
+        if (std::filesystem::is_directory(std::string(root) + "/openexr-images"))
+            return std::string(root) + "/openexr-images";
+    return ORVANE_SOURCE_DIR "/../shared/testdata/openexr-images";
+}
 
 class OpenEXRFormatTest : public FormatSuite {};
 
