@@ -720,7 +720,10 @@ void Loader::Process(Request *req) {
     const double t = req->Time();
     const std::optional<ClipEntry> entry = ClipAt(t);
     if (!entry) {
-        Fail(req, "%s: no clip at frame %g", Name().c_str(), t);
+        if (ClipList().empty())
+            Fail(req, "%s: no file to load (the Filename is empty)", Name().c_str());
+        else
+            Fail(req, "%s: no clip at frame %g (the first starts later)", Name().c_str(), t);
         req->SetOutputData(outImage_, nullptr);
         return;
     }

@@ -76,6 +76,7 @@ TEST_F(LoaderSaver, LoaderPlacesTheSequenceOnTheTimeLine) {
     const int expected[] = {1, 1, 2, 3, 4};
     for (int i = 0; i < 5; ++i) EXPECT_EQ(FileAt(10 + i), expected[i]) << i;
     EXPECT_EQ(FileAt(9), -1);
+    EXPECT_EQ(LastConsole(), "Plate: no clip at frame 9 (the first starts later)");
     EXPECT_EQ(FileAt(15), -1);
     EXPECT_NE(LastConsole().find("Plate"), std::string::npos);
     Set(loader, "Reverse", ScriptVal(1));
