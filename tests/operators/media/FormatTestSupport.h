@@ -130,6 +130,14 @@ inline LoadResult Load(const char *id, const Bytes &data, const TagList &tags = 
     return Load(id, data, tags, [](ImageFormat &) {});
 }
 
+/// Reads one frame at a proxy scale, of a region when given.
+inline LoadResult LoadAt(const char *id, const Bytes &data, int proxy, const ImgRectI *region = nullptr) {
+    ImageDomain domain(region ? *region : ImgRectI());
+    TagList tags;
+    if (region) tags.Add({ClipFrameRegion, static_cast<const void *>(&domain)});
+    return Load(id, data, tags, [proxy](ImageFormat &f) { f.proxyScale = proxy; });
+}
+
 /// 16-bit view of pixel (x, y) of the data window.
 inline Pixel At(const Image &img, int x, int y) {
     Pixel p;
@@ -214,6 +222,12 @@ inline Bytes Capture(const std::string &cmd) {
     while ((n = std::fread(buf, 1, sizeof buf, p)) > 0) out.insert(out.end(), buf, buf + n);
     pclose(p);
     return out;
+}
+
+/// Standard output of a command as text.
+inline std::string CaptureText(const std::string &cmd) {
+    const Bytes out = Capture(cmd);
+    return std::string(out.begin(), out.end());
 }
 
 inline Bytes ReadFile(const std::string &path) {

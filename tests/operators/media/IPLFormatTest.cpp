@@ -22,14 +22,11 @@
 #include "host/image/PixelConvert.h"
 #include "host/media/IOClass.h"
 #include "host/media/ImageFormat.h"
+#include "tests/operators/media/FormatTestSupport.h"
 #include "tests/support/TestSupport.h"
 
 namespace Orvane {
 namespace ipltest_detail {
-
-Ref<ImageFormat> NewFormat(const char *id) {
-    return NewImageFormat(ClassRegistry->Find(OvID(id), RegFamilyImageFormat));
-}
 
 Ref<Image> MakeImage(int w, int h, const std::function<Pixel(int, int)> &f) {
     Ref<Image> img = NewImageTagList({{ImgWidth, w}, {ImgHeight, h}, {ImgDepth, DepthRGBAInt8}});
@@ -42,12 +39,6 @@ Ref<Image> MakeImage(int w, int h, const std::function<Pixel(int, int)> &f) {
     return img;
 }
 
-Pixel At(const Image &img, int x, int y) {
-    Pixel p;
-    LoadPixel(img.Depth(), img.PixelAddress(x, y), 1, &p);
-    return p;
-}
-
 /// Smooth colour and a smooth alpha ramp, 8-bit values.
 Pixel SmoothRGBA(int x, int y) {
     const auto v = [](double t) { return uint16_t(std::lround(127.5 + 120 * std::sin(t)) * 257); };
@@ -55,79 +46,21 @@ Pixel SmoothRGBA(int x, int y) {
 }
 
 /// Saves with the given Quality (or the defaults, quality < 0).
+/// Saves at the default quality, or at `quality` through a writing tool.
 std::vector<uint8_t> Save(Image *img, double quality = -1) {
-    Ref<ImageFormat> fmt = NewFormat("IPLFormat");
-    EXPECT_TRUE(fmt);
-    if (!fmt) return {};
-    OrvaneDoc doc;
-    Ref<Parameter> value = MakeRef<Number>(quality);
-    if (quality < 0) {
-        fmt->SetupSave(nullptr, nullptr);
-    } else {
-        Operator *tool = Orvane::Test::AddImageSource(doc, "saver", nullptr);
-        fmt->AddSaveInputs(tool);
-        Request req(tool, nullptr, 0.0, 0, nullptr);
-        Input *in = tool->FindInput("Quality");
-        EXPECT_NE(in, nullptr);
-        req.SetInputData(in, value.Get());
-        fmt->SetupSave(tool, &req);
-    }
-    MemoryIO io;
-    EXPECT_TRUE(fmt->SaveHeader(&io, img)) << fmt->Error();
-    EXPECT_TRUE(fmt->SaveFrame(0, img)) << fmt->Error();
-    return io.Data();
+    return quality < 0 ? FmtTest::Save("IPLFormat", img) : FmtTest::SaveWith("IPLFormat", img, {{"Quality", quality}});
 }
 
-struct LoadResult {
-    Ref<Image> image;
-    std::string error;
-    bool headerOk = false;
-};
+using FmtTest::At;
+using FmtTest::LoadResult;
+using FmtTest::ReadFile;
+using FmtTest::TempDir;
+using FmtTest::WriteFile;
+
+std::string Shell(const std::string &command) { return FmtTest::CaptureText(command); }
 
 LoadResult Load(const char *id, const std::vector<uint8_t> &bytes, int proxy = 1, const ImgRectI *region = nullptr) {
-    LoadResult r;
-    Ref<ImageFormat> fmt = NewFormat(id);
-    if (!fmt) return r;
-    fmt->proxyScale = proxy;
-    MemoryIO io(bytes);
-    ImageDomain domain(region ? *region : ImgRectI());
-    TagList tags;
-    if (region) tags.Add({ClipFrameRegion, static_cast<const void *>(&domain)});
-    r.headerOk = fmt->LoadHeader(&io);
-    if (!r.headerOk || !fmt->LoadFrameTagList(0, r.image, tags)) {
-        r.error = fmt->Error();
-        r.image = nullptr;
-    }
-    return r;
-}
-
-struct TempDir {
-    std::string path;
-    TempDir() {
-        char tmpl[] = "/tmp/orvane-ipltest-XXXXXX";
-        path = mkdtemp(tmpl);
-    }
-    ~TempDir() { std::system(("rm -rf '" + path + "'").c_str()); }
-    std::string operator/(const std::string &name) const { return path + "/" + name; }
-};
-
-void WriteFile(const std::string &path, const std::vector<uint8_t> &bytes) {
-    std::ofstream(path, std::ios::binary).write(reinterpret_cast<const char *>(bytes.data()), bytes.size());
-}
-
-std::vector<uint8_t> ReadFile(const std::string &path) {
-    std::ifstream f(path, std::ios::binary);
-    return std::vector<uint8_t>(std::istreambuf_iterator<char>(f), {});
-}
-
-std::string Shell(const std::string &command) {
-    std::string out;
-    if (FILE *p = popen(command.c_str(), "r")) {
-        char buf[256];
-        while (fgets(buf, sizeof(buf), p)) out += buf;
-        pclose(p);
-    }
-    return out;
+    return FmtTest::LoadAt(id, bytes, proxy, region);
 }
 
 /// Largest difference in 8-bit codes over all four channels.
@@ -214,7 +147,7 @@ TEST_F(IPLFormatTest, RefusesOtherStreams) {
     const auto rgb = ReadFile(dir / "rgb.jpg");
     ASSERT_GT(rgb.size(), 16u);
     ASSERT_EQ(std::memcmp(&rgb[6], "JFIF", 4), 0);
-    Ref<ImageFormat> fmt = NewFormat("IPLFormat");
+    Ref<ImageFormat> fmt = FmtTest::MakeFormat("IPLFormat");
     MemoryIO a(rgb);
     EXPECT_TRUE(fmt->CheckFormat(&a)); // the markers pass; the component count does not
     LoadResult r = Load("IPLFormat", rgb);

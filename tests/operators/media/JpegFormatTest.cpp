@@ -24,16 +24,13 @@
 #include "host/image/PixelConvert.h"
 #include "host/media/IOClass.h"
 #include "host/media/ImageFormat.h"
+#include "tests/operators/media/FormatTestSupport.h"
 #include "tests/support/TestSupport.h"
 
 namespace Orvane {
 namespace jpegtest_detail {
 
-using Options = std::vector<std::pair<const char *, double>>;
-
-Ref<ImageFormat> NewFormat(const char *id) {
-    return NewImageFormat(ClassRegistry->Find(OvID(id), RegFamilyImageFormat));
-}
+using FmtTest::Options;
 
 Ref<Image> MakeImage(int w, int h, const std::function<Pixel(int, int)> &f) {
     Ref<Image> img = NewImageTagList({{ImgWidth, w}, {ImgHeight, h}, {ImgDepth, DepthRGBAInt8}});
@@ -46,12 +43,6 @@ Ref<Image> MakeImage(int w, int h, const std::function<Pixel(int, int)> &f) {
     return img;
 }
 
-Pixel At(const Image &img, int x, int y) {
-    Pixel p;
-    LoadPixel(img.Depth(), img.PixelAddress(x, y), 1, &p);
-    return p;
-}
-
 /// A smooth picture with some detail, 8-bit values.
 Pixel Smooth(int x, int y) {
     const auto v = [](double t) { return uint16_t(std::lround(127.5 + 120 * std::sin(t)) * 257); };
@@ -59,81 +50,19 @@ Pixel Smooth(int x, int y) {
 }
 
 std::vector<uint8_t> Save(const char *id, Image *img, const Options &opts = {}) {
-    Ref<ImageFormat> fmt = NewFormat(id);
-    EXPECT_TRUE(fmt);
-    if (!fmt) return {};
-    OrvaneDoc doc;
-    std::vector<Ref<Parameter>> values;
-    if (opts.empty()) {
-        fmt->SetupSave(nullptr, nullptr);
-    } else {
-        Operator *tool = Orvane::Test::AddImageSource(doc, "saver", nullptr);
-        fmt->AddSaveInputs(tool);
-        Request req(tool, nullptr, 0.0, 0, nullptr);
-        for (const auto &[name, v] : opts) {
-            Input *in = tool->FindInput(name);
-            EXPECT_NE(in, nullptr) << name;
-            values.push_back(MakeRef<Number>(v));
-            req.SetInputData(in, values.back().Get());
-        }
-        fmt->SetupSave(tool, &req);
-    }
-    MemoryIO io;
-    EXPECT_TRUE(fmt->SaveHeader(&io, img)) << fmt->Error();
-    EXPECT_TRUE(fmt->SaveFrame(0, img)) << fmt->Error();
-    return io.Data();
+    return opts.empty() ? FmtTest::Save(id, img) : FmtTest::SaveWith(id, img, opts);
 }
 
-struct LoadResult {
-    Ref<Image> image;
-    std::string error;
-    bool headerOk = false;
-};
+using FmtTest::At;
+using FmtTest::LoadResult;
+using FmtTest::ReadFile;
+using FmtTest::TempDir;
+using FmtTest::WriteFile;
+
+std::string Shell(const std::string &command) { return FmtTest::CaptureText(command); }
 
 LoadResult Load(const char *id, const std::vector<uint8_t> &bytes, int proxy = 1, const ImgRectI *region = nullptr) {
-    LoadResult r;
-    Ref<ImageFormat> fmt = NewFormat(id);
-    if (!fmt) return r;
-    fmt->proxyScale = proxy;
-    MemoryIO io(bytes);
-    ImageDomain domain(region ? *region : ImgRectI());
-    TagList tags;
-    if (region) tags.Add({ClipFrameRegion, static_cast<const void *>(&domain)});
-    r.headerOk = fmt->LoadHeader(&io);
-    if (!r.headerOk || !fmt->LoadFrameTagList(0, r.image, tags)) {
-        r.error = fmt->Error();
-        r.image = nullptr;
-    }
-    return r;
-}
-
-struct TempDir {
-    std::string path;
-    TempDir() {
-        char tmpl[] = "/tmp/orvane-jpegtest-XXXXXX";
-        path = mkdtemp(tmpl);
-    }
-    ~TempDir() { std::system(("rm -rf '" + path + "'").c_str()); }
-    std::string operator/(const std::string &name) const { return path + "/" + name; }
-};
-
-void WriteFile(const std::string &path, const std::vector<uint8_t> &bytes) {
-    std::ofstream(path, std::ios::binary).write(reinterpret_cast<const char *>(bytes.data()), bytes.size());
-}
-
-std::vector<uint8_t> ReadFile(const std::string &path) {
-    std::ifstream f(path, std::ios::binary);
-    return std::vector<uint8_t>(std::istreambuf_iterator<char>(f), {});
-}
-
-std::string Shell(const std::string &command) {
-    std::string out;
-    if (FILE *p = popen(command.c_str(), "r")) {
-        char buf[256];
-        while (fgets(buf, sizeof(buf), p)) out += buf;
-        pclose(p);
-    }
-    return out;
+    return FmtTest::LoadAt(id, bytes, proxy, region);
 }
 
 /// A binary PPM (P6) or PGM (P5) at 8 bits, grey expanded to RGB.
@@ -336,7 +265,7 @@ TEST_F(JpegFormatTest, ResolutionAndAspect) {
     std::memcpy(&wide[13], density, 5);
     WriteFile(dir / "wide.jpg", wide);
     EXPECT_EQ(Shell("identify -format '%x %y' " + dir / "wide.jpg"), "200 100");
-    Ref<ImageFormat> fmt = NewFormat("JpegFormat");
+    Ref<ImageFormat> fmt = FmtTest::MakeFormat("JpegFormat");
     MemoryIO io(ReadFile(dir / "wide.jpg"));
     ASSERT_TRUE(fmt->LoadHeader(&io)) << fmt->Error();
     // 200 pixels an inch across, 100 down: a pixel is half as wide as high.
@@ -439,7 +368,7 @@ TEST_F(JpegFormatTest, ICCProfileFillsMetadata) {
 TEST_F(JpegFormatTest, ResolutionSliderFollowsItsCheckbox) {
     OrvaneDoc doc;
     Operator *tool = Orvane::Test::AddImageSource(doc, "saver", nullptr);
-    Ref<ImageFormat> fmt = NewFormat("JpegFormat");
+    Ref<ImageFormat> fmt = FmtTest::MakeFormat("JpegFormat");
     fmt->AddSaveInputs(tool);
     Input *check = tool->FindInput("SetCustomResolution"), *dpi = tool->FindInput("ResolutionDPI");
     ASSERT_TRUE(check && dpi);
@@ -506,7 +435,7 @@ TEST_F(JpegFormatTest, DamagedFilesFailCleanly) {
         EXPECT_EQ(r.image->Width(), 64);
     }
     // Not a JPEG.
-    Ref<ImageFormat> fmt = NewFormat("JpegFormat");
+    Ref<ImageFormat> fmt = FmtTest::MakeFormat("JpegFormat");
     MemoryIO junk(std::vector<uint8_t>(64, 0x11));
     EXPECT_FALSE(fmt->CheckFormat(&junk));
     EXPECT_FALSE(fmt->LoadHeader(&junk));
@@ -514,7 +443,7 @@ TEST_F(JpegFormatTest, DamagedFilesFailCleanly) {
     EXPECT_TRUE(fmt->CheckFormat(&good));
 
     for (int64_t limit : {int64_t(0), int64_t(100), int64_t(bytes.size() - 10)}) {
-        Ref<ImageFormat> saver = NewFormat("JpegFormat");
+        Ref<ImageFormat> saver = FmtTest::MakeFormat("JpegFormat");
         saver->SetupSave(nullptr, nullptr);
         ShortDisk disk(limit);
         ASSERT_TRUE(saver->SaveHeader(&disk, src.Get()));
@@ -557,12 +486,12 @@ TEST_F(JpegFormatTest, AbortWordStopsReadAndWrite) {
     std::atomic<bool> abort{true};
     for (const char *id : {"JpegFormat", "IPLFormat"}) {
         SCOPED_TRACE(id);
-        Ref<ImageFormat> saver = NewFormat(id);
+        Ref<ImageFormat> saver = FmtTest::MakeFormat(id);
         saver->SetupSave(nullptr, nullptr);
         MemoryIO out;
         ASSERT_TRUE(saver->SaveHeader(&out, src.Get()));
         ASSERT_TRUE(saver->SaveFrame(0, src.Get())) << saver->Error();
-        Ref<ImageFormat> fmt = NewFormat(id);
+        Ref<ImageFormat> fmt = FmtTest::MakeFormat(id);
         MemoryIO in(out.Data());
         ASSERT_TRUE(fmt->LoadHeader(&in)) << fmt->Error();
         fmt->abortFlag = &abort;
@@ -584,7 +513,7 @@ TEST_F(JpegFormatTest, HeaderOnlyFrame) {
     size_t sos = 2;
     while (sos + 1 < bytes.size() && !(bytes[sos] == 0xFF && bytes[sos + 1] == 0xDA)) ++sos;
     bytes.resize(sos + 20); // the pixel data is not even there
-    Ref<ImageFormat> fmt = NewFormat("JpegFormat");
+    Ref<ImageFormat> fmt = FmtTest::MakeFormat("JpegFormat");
     MemoryIO io(bytes);
     ASSERT_TRUE(fmt->LoadHeader(&io)) << fmt->Error();
     Ref<Image> img;

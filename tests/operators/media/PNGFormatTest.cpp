@@ -21,6 +21,7 @@
 #include "host/image/PixelConvert.h"
 #include "host/media/IOClass.h"
 #include "host/media/ImageFormat.h"
+#include "tests/operators/media/FormatTestSupport.h"
 #include "tests/support/TestSupport.h"
 
 namespace Orvane {
@@ -41,11 +42,7 @@ Ref<Image> MakeImage(int w, int h, int depth, const std::function<Pixel(int, int
     return img;
 }
 
-Pixel At(const Image &img, int x, int y) {
-    Pixel p;
-    LoadPixel(img.Depth(), img.PixelAddress(x, y), 1, &p);
-    return p;
-}
+using FmtTest::At;
 
 /// Applies options to a format through a tool's inputs and a request, as a saver or loader would.
 struct OptionRig {
@@ -103,34 +100,11 @@ Ref<Image> Load(const std::vector<uint8_t> &bytes, const Options &opts = {}, con
     return img;
 }
 
-struct TempDir {
-    std::string path;
-    TempDir() {
-        char tmpl[] = "/tmp/orvane-pngtest-XXXXXX";
-        path = mkdtemp(tmpl);
-    }
-    ~TempDir() { std::system(("rm -rf '" + path + "'").c_str()); }
-    std::string operator/(const std::string &name) const { return path + "/" + name; }
-};
+using FmtTest::ReadFile;
+using FmtTest::TempDir;
+using FmtTest::WriteFile;
 
-void WriteFile(const std::string &path, const std::vector<uint8_t> &bytes) {
-    std::ofstream(path, std::ios::binary).write(reinterpret_cast<const char *>(bytes.data()), bytes.size());
-}
-
-std::vector<uint8_t> ReadFile(const std::string &path) {
-    std::ifstream f(path, std::ios::binary);
-    return std::vector<uint8_t>(std::istreambuf_iterator<char>(f), {});
-}
-
-std::string Shell(const std::string &command) {
-    std::string out;
-    if (FILE *p = popen(command.c_str(), "r")) {
-        char buf[256];
-        while (fgets(buf, sizeof(buf), p)) out += buf;
-        pclose(p);
-    }
-    return out;
-}
+std::string Shell(const std::string &command) { return FmtTest::CaptureText(command); }
 
 /// A premultiplied test picture: colour never above alpha, some alpha 0 and 1.
 Pixel Premultiplied(int x, int y, bool sixteen) {
