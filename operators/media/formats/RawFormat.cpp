@@ -1,5 +1,7 @@
 #include "operators/media/formats/RawFormat.h"
 
+#include "operators/media/formats/RunLength.h"
+
 #include <zlib.h>
 
 #include <algorithm>
@@ -101,28 +103,6 @@ private:
     std::vector<uint8_t> buf_;
     int64_t pos_ = 0, end_ = 0;
 };
-
-template <int N> size_t EncodeElements(const uint8_t *src, int count, uint8_t *out) {
-    auto same = [src](int a, int b) { return std::memcmp(src + a * N, src + b * N, N) == 0; };
-    uint8_t *o = out;
-    int i = 0;
-    while (i < count) {
-        int j = i + 1;
-        if (j < count && same(i, j)) {
-            while (j < count && j - i < 128 && same(i, j)) ++j;
-            *o++ = static_cast<uint8_t>(0x80 | (j - i - 1));
-            std::memcpy(o, src + i * N, N);
-            o += N;
-        } else {
-            while (j < count && j - i < 128 && !(j + 1 < count && same(j, j + 1))) ++j;
-            *o++ = static_cast<uint8_t>(j - i - 1);
-            std::memcpy(o, src + i * N, static_cast<size_t>(j - i) * N);
-            o += static_cast<size_t>(j - i) * N;
-        }
-        i = j;
-    }
-    return static_cast<size_t>(o - out);
-}
 
 /// Decodes one line of `count` elements; false when the data ended (the
 /// elements of whole packets done so far stay, the rest of the line is zero).
@@ -235,11 +215,11 @@ using namespace raw_format_detail;
 
 size_t RawFormat::EncodeRunLength(const uint8_t *src, int count, int elementBytes, uint8_t *out) {
     switch (elementBytes) {
-    case 1: return EncodeElements<1>(src, count, out);
-    case 2: return EncodeElements<2>(src, count, out);
-    case 4: return EncodeElements<4>(src, count, out);
-    case 8: return EncodeElements<8>(src, count, out);
-    case 16: return EncodeElements<16>(src, count, out);
+    case 1: return RunLengthEncode<1>(src, count, out);
+    case 2: return RunLengthEncode<2>(src, count, out);
+    case 4: return RunLengthEncode<4>(src, count, out);
+    case 8: return RunLengthEncode<8>(src, count, out);
+    case 16: return RunLengthEncode<16>(src, count, out);
     default: return 0;
     }
 }

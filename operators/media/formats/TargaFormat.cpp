@@ -1,5 +1,7 @@
 #include "operators/media/formats/TargaFormat.h"
 
+#include "operators/media/formats/RunLength.h"
+
 #include <algorithm>
 #include <cstdlib>
 #include <cstring>
@@ -278,25 +280,12 @@ bool TargaFormat::SaveHeader(IOClass *stream, Image *image) {
 }
 
 size_t TargaFormat::EncodeLine(const uint8_t *pixels, int count, int bpp, uint8_t *out) {
-    auto same = [&](int a, int b) { return std::memcmp(pixels + a * bpp, pixels + b * bpp, bpp) == 0; };
-    uint8_t *o = out;
-    int i = 0;
-    while (i < count) {
-        int j = i + 1;
-        if (j < count && same(i, j)) {
-            while (j < count && j - i < 128 && same(i, j)) ++j;
-            *o++ = static_cast<uint8_t>(0x80 + (j - i - 1));
-            std::memcpy(o, pixels + i * bpp, bpp);
-            o += bpp;
-        } else {
-            while (j < count && j - i < 128 && !(j + 1 < count && same(j, j + 1))) ++j;
-            *o++ = static_cast<uint8_t>(j - i - 1);
-            std::memcpy(o, pixels + i * bpp, static_cast<size_t>(j - i) * bpp);
-            o += (j - i) * bpp;
-        }
-        i = j;
+    switch (bpp) {
+    case 1: return RunLengthEncode<1>(pixels, count, out);
+    case 2: return RunLengthEncode<2>(pixels, count, out);
+    case 3: return RunLengthEncode<3>(pixels, count, out);
+    default: return RunLengthEncode<4>(pixels, count, out);
     }
-    return static_cast<size_t>(o - out);
 }
 
 bool TargaFormat::SaveFrame(unsigned, Image *image) {
