@@ -1,6 +1,7 @@
 #include "host/media/ImageFormat.h"
 
 #include "host/core/Tags.h"
+#include "host/flow/DataTypes.h"
 #include "host/flow/Operator.h"
 #include "host/flow/Request.h"
 #include "host/image/NewImage.h"
@@ -22,6 +23,14 @@ void MediaFormat::SetupSave(Operator *, Request *) {}
 void MediaFormat::CleanupSave(Operator *) {}
 bool MediaFormat::RegInit(Registry *) { return true; }
 void MediaFormat::RegCleanup(Registry *) {}
+
+Input *MediaFormat::AddOptionCheckbox(Operator *tool, const char *label, const char *id, double def) {
+    return tool->AddInputTagList(label, id,
+                                 {{LinkDataType, CLSID_DataType_Number},
+                                  {InputControl, CLSID_InputControl_Checkbox},
+                                  {InputDefault, def},
+                                  {InputExternal, 0}});
+}
 
 double MediaFormat::OptionValue(Operator *tool, Request *req, const char *id, double def) {
     if (!tool || !req) return def;

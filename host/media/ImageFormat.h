@@ -62,6 +62,8 @@ public:
     static bool RegInit(Registry *reg);
     static void RegCleanup(Registry *reg);
 
+    /// Adds a yes-or-no option to the reading or writing tool (no external connection).
+    static Input *AddOptionCheckbox(Operator *tool, const char *label, const char *id, double def);
     /// The number an option input of the tool's current group holds for
     /// `req`; `def` without a tool, a request or such an input.
     static double OptionValue(Operator *tool, Request *req, const char *id, double def);

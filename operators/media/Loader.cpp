@@ -424,16 +424,26 @@ Loader::Settings Loader::ReadSettings(Request *req) const {
     return s;
 }
 
-void Loader::UpdateClipList(Request *req) {
+void Loader::UpdateClipList(Request *req, const Settings &s) {
     OrvaneDoc *doc = GetDoc();
     auto mapped = [doc](const std::string &name) { return doc ? doc->MapPath(name) : name; };
+    const std::vector<ClipEntry> previous = ClipList();
     auto makeClip = [&](const std::string &name, const std::string &altName) {
         ClipEntry e;
         e.name = name;
-        e.clip = MakeRef<Clip>(mapped(name));
-        std::string ignored;
-        e.clip->Scan(ignored); // a clip without files still answers, with its missing-frame rule
-        if (!altName.empty()) e.alt = MakeRef<Clip>(mapped(altName));
+        const std::string path = mapped(name), altPath = altName.empty() ? std::string() : mapped(altName);
+        // A clip seen before keeps its folder scan and its read format.
+        for (const ClipEntry &old : previous)
+            if (old.name == name && old.clip->FileName() == path) {
+                e.clip = old.clip;
+                if (old.alt && old.alt->FileName() == altPath) e.alt = old.alt;
+            }
+        if (!e.clip) {
+            e.clip = MakeRef<Clip>(path);
+            std::string ignored;
+            e.clip->Scan(ignored); // a clip without files still answers, with its missing-frame rule
+        }
+        if (!altPath.empty() && !e.alt) e.alt = MakeRef<Clip>(altPath);
         return e;
     };
 
@@ -477,7 +487,6 @@ void Loader::UpdateClipList(Request *req) {
         p.reverse = req->GetInputNumber(inReverse_) >= 0.5;
         list.push_back(std::move(entry));
     }
-    const Settings s = ReadSettings(req);
     for (ClipEntry &e : list) {
         e.place.importMode = std::clamp(s.importMode, 0, 2);
         e.place.pullType = s.pullType;
@@ -500,15 +509,6 @@ void Loader::UpdateClipList(Request *req) {
     }
 
     std::unique_lock lock(listLock_);
-    // Keep the scanned clips of unchanged entries (their read formats too).
-    for (ClipEntry &e : list)
-        for (const ClipEntry &old : clips_)
-            if (old.name == e.name && old.clip->FileName() == e.clip->FileName()) {
-                old.clip->SetAttrsTagList(e.clip->Attrs());
-                old.clip->SetStartFrame(e.clip->InitialFrame());
-                e.clip = old.clip;
-                if (e.alt && old.alt && old.alt->FileName() == e.alt->FileName()) e.alt = old.alt;
-            }
     clips_ = std::move(list);
 }
 
@@ -711,7 +711,8 @@ Ref<Image> Loader::FitFieldAndProxy(Request *req, Ref<Image> image, const Settin
 }
 
 void Loader::Process(Request *req) {
-    UpdateClipList(req);
+    Settings s = ReadSettings(req);
+    UpdateClipList(req, s);
     if (req->GetInputID(inLocalCache_) == OvID("On") && !cacheWarned_.exchange(true))
         GetDoc()->PrintF(req, ConsoleWarning,
                          "%s: the local cache is not available yet in this version of Orvane; frames are read from "
@@ -727,7 +728,6 @@ void Loader::Process(Request *req) {
         req->SetOutputData(outImage_, nullptr);
         return;
     }
-    Settings s = ReadSettings(req);
     s.solid = s.solid || entry->clip->GetAttrB(ClipNoAlpha);
     const std::optional<int64_t> frame = FileFrameAt(entry->place, t);
     if (!frame) {

@@ -53,7 +53,7 @@ public:
 private:
     struct Settings;
     Settings ReadSettings(Request *req) const;
-    void UpdateClipList(Request *req);
+    void UpdateClipList(Request *req, const Settings &s);
     std::optional<ClipEntry> ClipAt(double t) const;
     Ref<Image> FetchFrame(Request *req, const ClipEntry &entry, int64_t frame, const Settings &s, bool headerOnly,
                           bool report);

@@ -56,11 +56,7 @@ bool BMPFormat::CheckFormat(IOClass *stream) {
 
 void BMPFormat::AddSaveInputs(Operator *tool) {
     if (!tool) return;
-    tool->AddInputTagList("Save Alpha", "SaveAlpha",
-                          {{LinkDataType, CLSID_DataType_Number},
-                           {InputControl, CLSID_InputControl_Checkbox},
-                           {InputDefault, 1.0},
-                           {InputExternal, 0}});
+    AddOptionCheckbox(tool, "Save Alpha", "SaveAlpha", 1.0);
 }
 
 void BMPFormat::SetupSave(Operator *tool, Request *req) {

@@ -51,11 +51,7 @@ void JpegFormat::AddSaveInputs(Operator *tool) {
                            {InputMaxAllowed, 100.0},
                            {InputDefault, 97.0},
                            {InputExternal, 0}});
-    tool->AddInputTagList("Chroma Subsampling", "ChromaSubsampling",
-                          {{LinkDataType, CLSID_DataType_Number},
-                           {InputControl, CLSID_InputControl_Checkbox},
-                           {InputDefault, 0.0},
-                           {InputExternal, 0}});
+    AddOptionCheckbox(tool, "Chroma Subsampling", "ChromaSubsampling", 0.0);
     tool->AddInputTagList("Set Custom Resolution", "SetCustomResolution",
                           {{LinkDataType, CLSID_DataType_Number},
                            {InputControl, CLSID_InputControl_Checkbox},

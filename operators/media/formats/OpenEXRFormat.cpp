@@ -167,13 +167,6 @@ TagList Slider(double lo, double hi, double def) {
             {InputExternal, 0}};
 }
 
-TagList Checkbox(double def) {
-    return {{LinkDataType, CLSID_DataType_Number},
-            {InputControl, CLSID_InputControl_Checkbox},
-            {InputDefault, def},
-            {InputExternal, 0}};
-}
-
 /// A choice list whose value is the ID of an entry: "<Default>" first.
 TagList Chooser(const std::vector<std::string> &entries) {
     TagList t{{LinkDataType, CLSID_DataType_OvID},
@@ -522,14 +515,14 @@ void OpenEXRFormat::Close() {
 
 void OpenEXRFormat::AddLoadInputs(Operator *tool) {
     if (!tool) return;
-    tool->AddInputTagList("Bypass", "Bypass", ef::Checkbox(0.0));
+    AddOptionCheckbox(tool, "Bypass", "Bypass", 0.0);
     TagList defog = ef::Slider(0.0, 0.01, 0.0);
     defog.Add({InputMinAllowed, 0.0});
     tool->AddInputTagList("Defog", "Defog", defog);
     tool->AddInputTagList("Exposure", "Exposure", ef::Slider(-10.0, 10.0, 0.0));
     tool->AddInputTagList("Knee Low", "KneeLow", ef::Slider(-3.0, 3.0, 0.0));
     tool->AddInputTagList("Knee High", "KneeHigh", ef::Slider(3.5, 7.5, 5.0));
-    tool->AddInputTagList("Load All Layers", "LoadLayers", ef::Checkbox(0.0));
+    AddOptionCheckbox(tool, "Load All Layers", "LoadLayers", 0.0);
     // The lists hold what the last header read offers; the value is the
     // entry's name, so a choice outlives a list made for another file.
     std::vector<std::string> partNames, channels;
@@ -582,7 +575,7 @@ void OpenEXRFormat::AddSaveInputs(Operator *tool) {
     tool->AddInputTagList("DWA Compression level", "DWACompressionLevel", dwa);
     ef::AddHeading(tool, "ChannelsHeading");
     for (int s = 0; s < SlotCount; ++s) {
-        tool->AddInputTagList(SlotLabel(s), (std::string("Save") + SlotID(s)).c_str(), ef::Checkbox(1.0));
+        AddOptionCheckbox(tool, SlotLabel(s), (std::string("Save") + SlotID(s)).c_str(), 1.0);
         TagList name{{LinkDataType, CLSID_DataType_Text},
                      {InputControl, CLSID_InputControl_TextEdit},
                      {InputDefaultText, DefaultChannelName(s)},

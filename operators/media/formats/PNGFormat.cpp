@@ -278,11 +278,7 @@ bool PNGFormat::CheckFormat(IOClass *stream) {
 
 void PNGFormat::AddLoadInputs(Operator *tool) {
     if (!tool) return;
-    tool->AddInputTagList("Multiply by Alpha", "PostMultiply",
-                          {{LinkDataType, CLSID_DataType_Number},
-                           {InputControl, CLSID_InputControl_Checkbox},
-                           {InputDefault, 1.0},
-                           {InputExternal, 0}});
+    AddOptionCheckbox(tool, "Multiply by Alpha", "PostMultiply", 1.0);
 }
 
 void PNGFormat::SetupLoad(Operator *tool, Request *req) {
@@ -291,16 +287,8 @@ void PNGFormat::SetupLoad(Operator *tool, Request *req) {
 
 void PNGFormat::AddSaveInputs(Operator *tool) {
     if (!tool) return;
-    tool->AddInputTagList("Save Alpha", "SaveAlpha",
-                          {{LinkDataType, CLSID_DataType_Number},
-                           {InputControl, CLSID_InputControl_Checkbox},
-                           {InputDefault, 1.0},
-                           {InputExternal, 0}});
-    tool->AddInputTagList("Divide by Alpha", "PreDivide",
-                          {{LinkDataType, CLSID_DataType_Number},
-                           {InputControl, CLSID_InputControl_Checkbox},
-                           {InputDefault, 1.0},
-                           {InputExternal, 0}});
+    AddOptionCheckbox(tool, "Save Alpha", "SaveAlpha", 1.0);
+    AddOptionCheckbox(tool, "Divide by Alpha", "PreDivide", 1.0);
     tool->AddInputTagList("Depth", "Depth",
                           {{LinkDataType, CLSID_DataType_Number},
                            {InputControl, CLSID_InputControl_Combo},

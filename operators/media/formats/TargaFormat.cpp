@@ -96,16 +96,8 @@ bool TargaFormat::CheckFormat(IOClass *stream) {
 
 void TargaFormat::AddSaveInputs(Operator *tool) {
     if (!tool) return;
-    tool->AddInputTagList("Save Alpha", "SaveAlpha",
-                          {{LinkDataType, CLSID_DataType_Number},
-                           {InputControl, CLSID_InputControl_Checkbox},
-                           {InputDefault, 1.0},
-                           {InputExternal, 0}});
-    tool->AddInputTagList("Compress", "Compress",
-                          {{LinkDataType, CLSID_DataType_Number},
-                           {InputControl, CLSID_InputControl_Checkbox},
-                           {InputDefault, 1.0},
-                           {InputExternal, 0}});
+    AddOptionCheckbox(tool, "Save Alpha", "SaveAlpha", 1.0);
+    AddOptionCheckbox(tool, "Compress", "Compress", 1.0);
 }
 
 void TargaFormat::SetupSave(Operator *tool, Request *req) {
