@@ -9,12 +9,41 @@
 #include "host/flow/InputValue.h"
 #include "host/flow/Operator.h"
 #include "host/flow/OrvaneDoc.h"
+#include "host/flow/RenderTask.h"
 
 namespace Orvane::Cli {
 
 void LoadLibrary() {
     std::string error;
     if (!GetApp()->LoadOperators(error)) throw CliError(ExitFailed, "cannot load the tool library: " + error);
+}
+
+IDeviceContext *ChooseDevice(const char *command, const std::string &choice, const OrvaneDoc &doc) {
+    DeviceChoice wanted = DeviceChoice::CPU;
+    const bool fromCommandLine = !choice.empty();
+    if (fromCommandLine) {
+        if (!ParseDeviceChoice(choice, wanted))
+            throw CliError(ExitUsage, std::string(command) + ": --device is cpu, auto, opencl or cuda");
+    } else {
+        static const DeviceChoice kByPreference[] = {DeviceChoice::CPU, DeviceChoice::Auto, DeviceChoice::OpenCL,
+                                                     DeviceChoice::CUDA};
+        const long pref = doc.GetPrefLong(PREF_UseGPU);
+        wanted = pref >= 0 && pref <= 3 ? kByPreference[pref] : DeviceChoice::CPU;
+    }
+    if (wanted == DeviceChoice::CPU) return nullptr;
+    std::string error;
+    IDeviceContext *device = GetApp()->Device(wanted, &error);
+    if (!device && wanted != DeviceChoice::Auto) {
+        if (fromCommandLine) throw CliError(ExitUsage, std::string(command) + ": --device " + choice + ": " + error);
+        std::fprintf(stderr, "WARNING: the document asks for %s: %s; rendering on the CPU\n", DeviceChoiceName(wanted),
+                     error.c_str());
+    }
+    return device;
+}
+
+void ReportDeviceLog(const RenderTask &task) {
+    for (const std::string &line : task.DeviceLog())
+        std::fprintf(stderr, "WARNING: device: %s (the CPU made those frames)\n", line.c_str());
 }
 
 std::string JsonString(const std::string &s) {

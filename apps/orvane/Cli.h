@@ -6,8 +6,10 @@
 #include <vector>
 
 namespace Orvane {
+class IDeviceContext;
 class OrvaneDoc;
-}
+class RenderTask;
+} // namespace Orvane
 
 namespace Orvane::Cli {
 
@@ -29,6 +31,16 @@ void ApplySet(OrvaneDoc &doc, const std::string &set);
 
 /// Loads the standard tool library or throws.
 void LoadLibrary();
+
+/// The device a command renders on: `choice` ("cpu", "auto", "opencl",
+/// "cuda"; empty: the document's UseGPU preference, 0 cpu, 1 auto, 2 opencl,
+/// 3 cuda). A back end named on the command line that has no device is a
+/// usage error; one chosen by the preference falls back to the CPU with a
+/// warning on stderr. Null: rows on the CPU.
+IDeviceContext *ChooseDevice(const char *command, const std::string &choice, const OrvaneDoc &doc);
+/// Prints the device runs that failed during a render (the rows made those
+/// frames) as "WARNING: device: ..." lines on stderr.
+void ReportDeviceLog(const RenderTask &task);
 
 /// JSON text of a string (quoted, escaped) and of a number (null for NaN/inf).
 std::string JsonString(const std::string &s);

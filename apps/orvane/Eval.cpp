@@ -31,6 +31,7 @@ struct EvalArgs {
     std::vector<std::pair<int, int>> pixels;
     std::vector<std::string> sets;
     int threads = 0;
+    std::string device;
 };
 
 EvalArgs ParseArgs(const std::vector<std::string> &args) {
@@ -65,6 +66,8 @@ EvalArgs ParseArgs(const std::vector<std::string> &args) {
             const double n = ParseNumberList(value(), 1, "thread count")[0];
             if (n < 1 || n != std::floor(n)) throw CliError(ExitUsage, "eval: --threads needs a whole number >= 1");
             a.threads = static_cast<int>(n);
+        } else if (arg == "--device") {
+            a.device = value();
         } else if (arg == "--json") {
             a.json = true;
         } else if (arg.rfind("--", 0) == 0) {
@@ -159,12 +162,14 @@ int RunEval(const std::vector<std::string> &rawArgs) {
     // An interactive look: Savers on the way pass their image on without writing.
     RenderTask task;
     task.interactive = true;
+    task.SetDevice(ChooseDevice("eval", a.device, doc));
     EvalOptions options;
     options.task = &task;
     options.flags = ReqFlagInteractive;
     if (a.roi) options.roi = ImageDomain(*a.roi);
     const double time = a.timeSet ? a.time : doc.RenderStart();
     Ref<Parameter> result = Evaluate(out, time, options);
+    ReportDeviceLog(task);
 
     const auto *img = dynamic_cast<const Image *>(result.Get());
     if (a.json) {

@@ -36,7 +36,7 @@ namespace Orvane::Cli {
 namespace {
 
 struct RenderArgs {
-    std::string flow, frames, chunk;
+    std::string flow, frames, chunk, device;
     std::vector<std::string> savers, sets;
     int threads = 0, proxy = 1;
     size_t memoryLimit = 0;
@@ -92,6 +92,8 @@ RenderArgs ParseArgs(const std::vector<std::string> &args) {
             a.proxy = whole("proxy scale", 1);
         } else if (arg == "--memory-limit") {
             a.memoryLimit = ParseSize(value());
+        } else if (arg == "--device") {
+            a.device = value();
         } else if (arg == "--skip-existing") {
             a.skipExisting = true;
         } else if (arg == "--log-format") {
@@ -249,6 +251,7 @@ int RunRender(const std::vector<std::string> &rawArgs) {
     }
 
     RenderTask task;
+    task.SetDevice(ChooseDevice("render", a.device, doc));
     task.proxyScale = a.proxy;
     task.startTime = static_cast<double>(rangeStart);
     EvalOptions options;
@@ -318,6 +321,8 @@ int RunRender(const std::vector<std::string> &rawArgs) {
         if (interrupted) break;
     }
     for (Operator *op : doc.Tools()) op->OnEndRender();
+    for (const std::string &line : task.DeviceLog())
+        log.Message("WARNING", "device: " + line + " (the CPU made those frames)");
     sigaction(SIGINT, &oldInt, nullptr);
     sigaction(SIGTERM, &oldTerm, nullptr);
     g_task = nullptr;

@@ -15,13 +15,16 @@ commands:
                                  --all adds abstract bases and hidden classes
   describe CLASS                 show a class's pages and inputs
   eval FLOW TOOL[.OUTPUT] [--time T] [--roi x0,y0,x1,y1] [--pixel X,Y ...]
-       [--set TOOL.INPUT=VALUE ...] [--threads N] [--json]
+       [--set TOOL.INPUT=VALUE ...] [--threads N] [--device D] [--json]
                                  evaluate one output of a flow document and print what it holds
   render FLOW [--frames SPEC] [--chunk I/N] [--saver NAME ...] [--set TOOL.INPUT=VALUE ...]
-         [--threads N] [--memory-limit SIZE] [--proxy N] [--skip-existing] [--log-format text|json]
+         [--threads N] [--device D] [--memory-limit SIZE] [--proxy N] [--skip-existing]
+         [--log-format text|json]
                                  render the flow's Savers frame by frame (default: the document's
                                  render range); SPEC like 1-100, 1-100x2, 1,5,10-20, 10-1, -23--5;
                                  SIZE like 512M or 8G; Ctrl-C stops after the current frame
+                                 D: cpu, auto, opencl or cuda (default: the document's UseGPU
+                                 preference, else cpu); a failed device run falls back to the CPU
   info FILE...                   what the formats read from files or sequences
                                  (format, size, depth, windows, frames and gaps)
   version                        print the program version

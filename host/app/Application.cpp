@@ -51,6 +51,33 @@ bool Application::LoadOperators(std::string &error) {
     return operatorsLoaded_;
 }
 
+IDeviceContext *Application::Device(DeviceChoice choice, std::string *error) {
+    std::lock_guard<std::mutex> lock(devicesLock_);
+    auto open = [this](DeviceBackend backend) -> OpenedDevice & {
+        OpenedDevice &d = devices_[static_cast<int>(backend)];
+        if (!d.tried) {
+            d.tried = true;
+            d.context = OpenDeviceContext(backend, &d.error);
+        }
+        return d;
+    };
+    auto give = [error](OpenedDevice &d) {
+        if (!d.context && error) *error = d.error;
+        return d.context.get();
+    };
+    switch (choice) {
+    case DeviceChoice::CPU: return nullptr;
+    case DeviceChoice::OpenCL: return give(open(DeviceBackend::OpenCL));
+    case DeviceChoice::CUDA: return give(open(DeviceBackend::CUDA));
+    case DeviceChoice::Auto: break;
+    }
+    if (OpenedDevice &cuda = open(DeviceBackend::CUDA); cuda.context) return cuda.context.get();
+    OpenedDevice &cl = open(DeviceBackend::OpenCL);
+    if (cl.context && !cl.context->IsCPUDevice()) return cl.context.get();
+    if (error) *error = "no GPU found; the rows run on the CPU";
+    return nullptr;
+}
+
 uint64_t Application::AttrHash() const {
     uint64_t h = 0x0a99;
     for (const TagItem &item : Attrs().Items()) h = HashMix(HashMix(h, item.tag), item.value);

@@ -160,6 +160,12 @@ void Operator::PostProcess(Request *req) {
     const Input *mainIn = FindMainInput(1);
     const Image *src = mainIn ? dynamic_cast<const Image *>(req->GetInputData(mainIn)) : nullptr;
     if (src == result) return; // passed through: nothing to mix
+    // The mix runs on rows: images made on the device come back first.
+    if (!result->DownloadGPUMem() || (src && !src->DownloadGPUMem()) || (mask && !mask->DownloadGPUMem())) {
+        Fail(req, "%s: an image could not be brought back from the device (time = %f)\n", Name().c_str(), req->Time());
+        req->SetOutputData(out, nullptr);
+        return;
+    }
 
     const FltPixel clear{};
     const FltPixel srcCanvas = src ? src->GetCanvasColor() : clear;

@@ -69,7 +69,21 @@ std::optional<uint64_t> StateHash(const Output *out, double time) {
     return h;
 }
 
-Ref<Parameter> Evaluate(Output *out, double time, const EvalOptions &options) {
+namespace {
+
+/// Brings an image value's pixels back from the device for a consumer that
+/// reads rows; false (with the tool's console line) when that fails.
+bool InMainMemory(const Parameter *value, const Operator *consumer, double time) {
+    const auto *img = dynamic_cast<const Image *>(value);
+    if (!img || img->DownloadGPUMem()) return true;
+    if (consumer && consumer->GetDoc())
+        consumer->GetDoc()->PrintF(ConsoleError,
+                                   "%s: an input image could not be brought back from the device (time = %f)\n",
+                                   consumer->Name().c_str(), time);
+    return false;
+}
+
+Ref<Parameter> EvaluateOnDevice(Output *out, double time, const EvalOptions &options) {
     if (!out || !out->Owner()) return nullptr;
     Operator *op = out->Owner();
     RenderTask *task = options.task;
@@ -93,7 +107,7 @@ Ref<Parameter> Evaluate(Output *out, double time, const EvalOptions &options) {
         EvalOptions pre = opt;
         pre.flags |= ReqFlagPreCalc;
         pre.roi.reset();
-        Ref<Parameter> shape = Evaluate(out, time, pre);
+        Ref<Parameter> shape = EvaluateOnDevice(out, time, pre);
         if (!shape) return nullptr;
         if (auto *img = dynamic_cast<Image *>(shape.Get())) ownDoD = ImageDomain(img->DataWindow());
     }
@@ -109,6 +123,8 @@ Ref<Parameter> Evaluate(Output *out, double time, const EvalOptions &options) {
     levels.erase(std::unique(levels.begin(), levels.end()), levels.end());
 
     const bool wholeFrames = !op->RegAttrB(RegSupportsDoD);
+    // Tools that read images on the device take them as they are; the others get rows.
+    const bool keepsDeviceImages = op->RegAttrB(RegSupportsGPUImages);
     bool timeShifted = false;
     // Pre-calculated shapes of linked image inputs, reused when the fetch
     // itself is a pre-calculation at the same time.
@@ -125,7 +141,7 @@ Ref<Parameter> Evaluate(Output *out, double time, const EvalOptions &options) {
             EvalOptions pre = opt;
             pre.flags |= ReqFlagPreCalc;
             pre.roi.reset();
-            Ref<Parameter> shape = Evaluate(in->Link(), slot.time, pre);
+            Ref<Parameter> shape = EvaluateOnDevice(in->Link(), slot.time, pre);
             if (!shape) return nullptr; // the upstream tool failed (its line is written) or the render was aborted
             if (auto *img = dynamic_cast<Image *>(shape.Get()))
                 slot.dod = ImageDomain(wholeFrames ? img->DataWindow() | img->Frame() : img->DataWindow());
@@ -148,9 +164,11 @@ Ref<Parameter> Evaluate(Output *out, double time, const EvalOptions &options) {
                 if (slot.flags & InputFlagPreCalc) up.flags |= ReqFlagPreCalc;
                 const bool reuse =
                     (up.flags & ReqFlagPreCalc) && shapes[in->Index()] && shapeTimes[in->Index()] == slot.time;
-                slot.data = reuse ? shapes[in->Index()] : Evaluate(in->Link(), slot.time, up);
+                slot.data = reuse ? shapes[in->Index()] : EvaluateOnDevice(in->Link(), slot.time, up);
                 if (!slot.data) {
                     return nullptr; // a linked tool failed or the render was aborted: stop here, optional or not
+                } else if (!keepsDeviceImages && !InMainMemory(slot.data.Get(), op, time)) {
+                    return nullptr;
                 } else if (wholeFrames && IsImageDataType(in->DataType())) {
                     slot.data = CoverFrame(slot.data, req.IsPreCalc() || (up.flags & ReqFlagPreCalc));
                 }
@@ -198,6 +216,15 @@ Ref<Parameter> Evaluate(Output *out, double time, const EvalOptions &options) {
         return nullptr;
     }
     if (state && !timeShifted) cache->Store(key, opt.roi, result);
+    return result;
+}
+
+} // namespace
+
+Ref<Parameter> Evaluate(Output *out, double time, const EvalOptions &options) {
+    Ref<Parameter> result = EvaluateOnDevice(out, time, options);
+    // Whoever asked from outside the flow reads rows.
+    if (result && !InMainMemory(result.Get(), out->Owner(), time)) return nullptr;
     return result;
 }
 

@@ -6,6 +6,7 @@
 #include "host/core/Tags.h"
 #include "host/flow/DataTypes.h"
 #include "host/flow/OrvaneDoc.h"
+#include "host/flow/RenderTask.h"
 #include "host/flow/Request.h"
 
 namespace Orvane {
@@ -98,7 +99,14 @@ void Operator::Process(Request *req) {
     if (Output *out = FindMainOutput()) req->SetOutputData(out, nullptr);
 }
 
-bool Operator::IsGPUEnabled(Request *, bool) { return false; }
+bool UseKROMKernel(const Request *req) {
+    const RenderTask *task = req ? req->GetTask() : nullptr;
+    return task && task->Device() && !(req->GetFlags() & ReqFlagNoGPU);
+}
+
+bool Operator::IsGPUEnabled(Request *req, bool) {
+    return UseKROMKernel(req) && !req->IsPreCalc() && RegAttrB(RegSupportsGPUImages);
+}
 
 bool Operator::RegInit(Registry *) { return true; }
 void Operator::RegCleanup(Registry *) {}

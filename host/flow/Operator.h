@@ -110,8 +110,11 @@ public:
     virtual void PreCalcPreProcess(Request *req) { PreProcess(req); }
     virtual void PreCalcProcess(Request *req) { Process(req); }
     virtual void PreCalcPostProcess(Request *req) { PostProcess(req); }
-    /// Whether a device path may run for this request. No device service is
-    /// present yet, so this says no.
+    /// Whether a device path may run for this request: the render has a
+    /// device, the request does not forbid it (ReqFlagNoGPU), it is no
+    /// pre-calculation, and the class reads device images
+    /// (RegSupportsGPUImages). `forKernel`: the tool asks for its own kernel
+    /// (rather than a host service's).
     virtual bool IsGPUEnabled(Request *req, bool forKernel);
     virtual std::string GetTitle() const { return name_; }
     /// For a tool that writes files: the file the frame at `time` of
@@ -162,6 +165,10 @@ private:
     std::recursive_mutex requestLock_;
     ScriptVal keptInputs_ = ScriptVal::Table(), keptFields_ = ScriptVal::Table();
 };
+
+/// Whether device kernels are wanted at all for this request: its render has
+/// a device and the request does not forbid it.
+ORVANE_API bool UseKROMKernel(const Request *req);
 
 class ORVANE_API ThreadedOperator : public Operator {
 public:

@@ -1,32 +1,75 @@
 #pragma once
 // RenderTask: one render (a command-line frame range, an interactive view):
-// its abort flag, its proxy scale, whether it is interactive, and whether it
-// only wants bounds. Requests carry their task.
+// its abort flag, its proxy scale, whether it is interactive, whether it only
+// wants bounds, and the compute device its tools may use. Requests carry
+// their task.
 //
-// Thread safety: Abort() may be called from any thread; the rest is set
-// before the render starts.
+// The device: a render that may use one holds its IDeviceContext (chosen by
+// the command line or the document's UseGPU preference). Execute runs a
+// function on the device's thread and waits for its result; QueueExecute
+// queues one. Device runs that fail are noted in the task's device log (one
+// line per distinct reason), which the command line prints as warnings: the
+// tool's rows have made the frame instead.
+//
+// Tasks are found by their ID (Find) while they exist.
+//
+// Thread safety: Abort, Execute, QueueExecute, NoteDeviceFailure and
+// DeviceLog may be called from any thread; the rest is set before the render
+// starts.
 #include <atomic>
+#include <cstdint>
+#include <functional>
+#include <mutex>
+#include <string>
+#include <vector>
 
 #include "host/core/Export.h"
 
 namespace Orvane {
 
+class IDeviceContext;
+
 class ORVANE_API RenderTask {
 public:
+    RenderTask();
+    ~RenderTask();
+    RenderTask(const RenderTask &) = delete;
+    RenderTask &operator=(const RenderTask &) = delete;
+
     void Abort() { abort_.store(true, std::memory_order_relaxed); }
     bool IsAborted() const { return abort_.load(std::memory_order_relaxed); }
     const std::atomic<bool> *AbortFlag() const { return &abort_; }
 
+    uint64_t ID() const { return id_; }
+    /// The live task with this ID, or null.
+    static RenderTask *Find(uint64_t id);
+
+    /// The device the task's tools may use (null: rows only).
+    IDeviceContext *Device() const { return device_; }
+    void SetDevice(IDeviceContext *device) { device_ = device; }
+    /// Runs `fn` on the device's thread and gives back its result; false at
+    /// once without a device. `name` names the caller in the device log.
+    bool Execute(const char *name, const std::function<bool(IDeviceContext *)> &fn);
+    /// Queues `fn` on the device's thread; false without a device.
+    bool QueueExecute(const char *name, std::function<void(IDeviceContext *)> fn);
+    /// Notes that a device run of `name` failed and why.
+    void NoteDeviceFailure(const std::string &name, const std::string &reason);
+    /// The distinct failures noted so far ("name: reason").
+    std::vector<std::string> DeviceLog() const;
+
     int proxyScale = 1;
     bool interactive = false;
     bool boundsOnly = false;
-    bool useGPU = false;
     /// First frame of the render's range (-2e9: not a range render). Savers
     /// number their files from it when asked to.
     double startTime = -2e9;
 
 private:
     std::atomic<bool> abort_{false};
+    uint64_t id_;
+    IDeviceContext *device_ = nullptr;
+    mutable std::mutex logLock_;
+    std::vector<std::string> log_;
 };
 
 } // namespace Orvane

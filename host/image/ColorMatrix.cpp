@@ -1,13 +1,17 @@
 #include "host/image/ColorMatrix.h"
 
 #include <cmath>
+#include <cstddef>
 #include <cstring>
+#include <memory>
 #include <vector>
 
 #include "host/core/Parallel.h"
 #include "host/core/Tags.h"
 #include "host/image/Image.h"
 #include "host/image/PixelConvert.h"
+#include "host/krom/KROMComputeNode.h"
+#include "host/krom/kernels/ColorKernelParams.h"
 
 namespace Orvane {
 
@@ -151,6 +155,28 @@ void MatrixRun(const RowMatrix &mx, const float *in, float *out, int count) {
     }
 }
 
+/// The matrix as the "ColorMatrix" kernel of the common library: the same
+/// float arithmetic as MatrixRun, so the device gives the rows' results.
+bool MatrixOnDevice(Request *req, const Image *src, Image *dst, const RowMatrix &mx) {
+    if (!req || dst->DataWindow().IsNull()) return false;
+    auto block = std::make_shared<ColorMatrixParams>();
+    ColorMatrixParams &p = *block;
+    std::memcpy(p.m, mx.k, sizeof p.m);
+    const FltPixel c = src->GetCanvasColor();
+    float canvas[4] = {c.R, c.G, c.B, c.A};
+    MatrixRun(mx, canvas, p.dp, 1);
+    const bool hasPixels = src->HasScanLineData() || src->IsGPUMemDirty();
+    const ImgRectI in = hasPixels ? src->DataWindow() : ImgRectI(), out = dst->DataWindow();
+    const int inWindow[4] = {in.x0, in.x1, in.y0, in.y1}, outWindow[4] = {out.x0, out.x1, out.y0, out.y1};
+    std::memcpy(p.inDataWindow, inWindow, sizeof inWindow);
+    std::memcpy(p.outDataWindow, outWindow, sizeof outWindow);
+    p.workSize[0] = out.Width();
+    p.workSize[1] = out.Height();
+    return KROMComputeNode::ExecKernelI(
+        req, "ColorMatrix", nullptr, ColorMatrixParamsText, sizeof p, offsetof(ColorMatrixParams, srcCompOrder),
+        offsetof(ColorMatrixParams, dstCompOrder), block, {{"input", const_cast<Image *>(src)}, {"output", dst}});
+}
+
 } // namespace
 
 bool ApplyMatrixTagList(const Image *src, Image *dst, const TagList &tags) {
@@ -170,9 +196,13 @@ bool ApplyMatrixTagList(const Image *src, Image *dst, const TagList &tags) {
         dst->SetCanvasColor(canvas);
         return true;
     }
-    if (!dst->AllocScanLineData()) return false;
-
     const RowMatrix mx = ToRowMatrix(full);
+    if (tags.GetBool(WorkUseGPU, false) && MatrixOnDevice(tags.GetPtrAs<Request>(WorkRequest), src, dst, mx)) {
+        dst->SetCanvasColor(canvas);
+        return true;
+    }
+    if (!src->DownloadGPUMem() || !dst->AllocScanLineData()) return false;
+
     const ImgRectI dw = dst->DataWindow();
     const ImgRectI sw = src->DataWindow();
     const bool direct = src->Depth() == DepthRGBAFlt32 && dst->Depth() == DepthRGBAFlt32 && src->HasScanLineData();

@@ -13,7 +13,10 @@
 //   MtxColorMatrix      const ColorMatrix *       (alpha untouched)
 //   MtxColorMatrixFull  const ColorMatrixFull *   (one of the two is required)
 //   WorkThreaded        1: rows on the worker pool (default 1)
-//   WorkOperator, WorkRequest, WorkUseGPU   accepted; the device path arrives later
+//   WorkUseGPU          1: try the request's device first ("ColorMatrix" of
+//                       the common kernel library); needs WorkRequest
+//   WorkRequest         Request *
+//   WorkOperator        accepted
 // src and dst may be the same image. Returns false when there was no matrix or
 // the rows could not be allocated.
 //

@@ -10,6 +10,7 @@
 #include "host/flow/DataTypes.h"
 #include "host/image/PixelConvert.h"
 #include "host/image/PixelMemory.h"
+#include "host/krom/GPUMemory.h"
 
 namespace Orvane {
 
@@ -125,7 +126,7 @@ void Image::Clear() {
 }
 
 void Image::ImageCopy(const Image *src) {
-    if (!src || src == this || !AllocScanLineData()) return;
+    if (!src || src == this || !src->DownloadGPUMem() || !AllocScanLineData()) return;
     const ImgRectI dw = dataWindow_;
     const bool sameDepth = src->depth_ == depth_;
     ParallelRange(
@@ -152,7 +153,7 @@ uint64_t Image::Hash() const { return HashBytes(this, sizeof(void *)); }
 Ref<Parameter> Image::Copy() const { return CopyOfImage(this); }
 
 Ref<Image> CopyOfImage(const Image *src) {
-    if (!src) return nullptr;
+    if (!src || !src->DownloadGPUMem()) return nullptr;
     auto img = MakeRef<Image>(src->width_, src->height_, src->depth_);
     img->xScale_ = src->xScale_;
     img->yScale_ = src->yScale_;

@@ -24,6 +24,7 @@
 // before it is handed over.
 #include <atomic>
 #include <memory>
+#include <mutex>
 #include <vector>
 
 #include "host/flow/Parameter.h"
@@ -32,6 +33,7 @@
 
 namespace Orvane {
 
+class GPUMemory;
 class OrvaneDoc;
 class Request;
 
@@ -126,6 +128,21 @@ public:
     /// Bytes of pixel memory held.
     size_t DataBytes() const;
 
+    // ---- device memory (GPUMemory.h) ----
+    /// The image's device image, if it has one.
+    Ref<GPUMemory> GetGPUMem() const;
+    /// Gives the image a device image (null: none). `dirty`: the device holds
+    /// pixels that main memory does not have yet.
+    void SetGPUMem(GPUMemory *mem, bool dirty);
+    /// Main memory lags behind the device image.
+    bool IsGPUMemDirty() const;
+    void SetGPUMemDirtyFlag(bool dirty);
+    /// Brings main memory up to date from the device (allocating the rows);
+    /// does nothing when it is not behind. False when the download failed.
+    bool DownloadGPUMem() const;
+    /// Bytes of device memory held.
+    size_t GPUBytes() const;
+
     // ---- attributes and state ----
     void SetReadOnly(bool v = true) { readOnly_ = v; }
     bool IsReadOnly() const { return readOnly_; }
@@ -210,7 +227,7 @@ public:
     bool Equals(const Parameter &other) const override { return &other == this; }
     uint64_t Hash() const override;
     Ref<Parameter> Copy() const override;
-    size_t SizeOf() const override { return sizeof(*this) + DataBytes(); }
+    size_t SizeOf() const override { return sizeof(*this) + DataBytes() + GPUBytes(); }
 
 private:
     friend ORVANE_API Ref<Image> CopyOfImage(const Image *src);
@@ -229,6 +246,9 @@ private:
     const std::atomic<bool> *abort_ = nullptr;
     ScriptVal metadata_ = ScriptVal::Table();
     bool noData_ = false, readOnly_ = false, opaque_ = false, simple_ = true;
+    mutable std::mutex gpuLock_;
+    Ref<GPUMemory> gpuMem_;
+    bool gpuDirty_ = false;
 };
 
 /// A new image with the same format, windows, canvas, attributes and pixels.

@@ -3,7 +3,9 @@
 #include <algorithm>
 #include <bit>
 #include <cmath>
+#include <cstddef>
 #include <cstring>
+#include <memory>
 
 #include "host/app/Application.h"
 #include "host/color/FastPow.h"
@@ -15,6 +17,8 @@
 #include "host/image/Image.h"
 #include "host/image/NewImage.h"
 #include "host/image/PixelConvert.h"
+#include "host/krom/KROMComputeNode.h"
+#include "host/krom/kernels/ColorKernelParams.h"
 #include "operators/frame/Registration.h"
 
 namespace Orvane {
@@ -585,8 +589,36 @@ ColorMatrixFull BrightnessContrast::ChainMatrix() const {
     return m;
 }
 
-bool BrightnessContrast::RunDevice(Request *, const Image *, Image *) {
-    return false; // no device route in this build: the rows do the work
+bool BrightnessContrast::RunDevice(Request *req, const Image *src, Image *dst) {
+    const Values &v = v_;
+    auto block = std::make_shared<BrightnessContrastParams>();
+    BrightnessContrastParams &p = *block;
+    const FltPixel canvas = dst->GetCanvasColor(); // already through the chain
+    const float dp[4] = {canvas.R, canvas.G, canvas.B, canvas.A};
+    std::memcpy(p.dp, dp, sizeof dp);
+    for (int c = 0; c < 4; ++c) p.chans[c] = v.chans[c];
+    p.prePost = v.prePost, p.doGamma = v.doGamma, p.doSat = v.doSat, p.useLowHigh = v.useLowHigh;
+    p.clipBlack = v.clipBlack, p.clipWhite = v.clipWhite;
+    p.gain = v.gain, p.gamma = v.gamma, p.lift = v.lift, p.finalContrast = v.finalContrast, p.bright = v.bright;
+    float *satRows[3] = {p.satMat_v1, p.satMat_v2, p.satMat_v3};
+    for (int r = 0; r < 3; ++r) {
+        for (int c = 0; c < 3; ++c) satRows[r][c] = v.satRows[r][c];
+        satRows[r][3] = 0.f;
+    }
+    p.sat = v.sat, p._sat = v._sat, p.finalScale = v.finalScale, p.low = v.low;
+    const bool hasPixels = src->HasScanLineData() || src->IsGPUMemDirty();
+    const ImgRectI in = hasPixels ? src->DataWindow() : ImgRectI(), out = dst->DataWindow();
+    const int inWindow[4] = {in.x0, in.x1, in.y0, in.y1}, outWindow[4] = {out.x0, out.x1, out.y0, out.y1};
+    std::memcpy(p.inDataWindow, inWindow, sizeof inWindow);
+    std::memcpy(p.outDataWindow, outWindow, sizeof outWindow);
+    p.x0 = std::min(in.x0, out.x1);
+    p.x1 = std::min(in.x1, out.x1);
+    p.workSize[0] = out.Width();
+    p.workSize[1] = out.Height();
+    return KROMComputeNode::ExecKernelI(
+        req, v.reverse ? "BrightnessContrastReverse" : "BrightnessContrast", nullptr, BrightnessContrastParamsText,
+        sizeof p, offsetof(BrightnessContrastParams, srcCompOrder), offsetof(BrightnessContrastParams, dstCompOrder),
+        block, {{"input", const_cast<Image *>(src)}, {"output", dst}});
 }
 
 void BrightnessContrast::Process(Request *req) {
@@ -676,7 +708,7 @@ void BrightnessContrast::Process(Request *req) {
         const bool rowsWanted = !precalc && !dst->ValidWindow().IsNull();
         const bool onDevice = rowsWanted && IsGPUEnabled(req, true) && RunDevice(req, src, dst.Get());
         if (rowsWanted && !onDevice) {
-            if (!dst->AllocScanLineData()) return outOfMemory();
+            if (!src->DownloadGPUMem() || !dst->AllocScanLineData()) return outOfMemory();
             src_ = src;
             dst_ = dst.Get();
             inWindow_ = src->HasScanLineData() ? src->DataWindow() : ImgRectI();

@@ -9,7 +9,9 @@
 //  * the chain is linear (no gamma, no pre-divide, and no clip on float): it is
 //    folded into one colour matrix and left to the host's ApplyMatrixTagList;
 //  * otherwise rows, one chunk per output row, with the canvas colour carried
-//    through the same pixel function.
+//    through the same pixel function; when the render has a device, the
+//    kernels "BrightnessContrast" / "BrightnessContrastReverse" of the common
+//    library do the same first, and the rows run only if they fail.
 //
 // Thread safety: Process writes the members below before any chunk starts;
 // chunks only read them and write rows of their own.

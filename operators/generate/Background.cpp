@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <cmath>
 #include <cstdint>
+#include <memory>
 #include <string>
 #include <type_traits>
 
@@ -16,6 +17,9 @@
 #include "host/image/Image.h"
 #include "host/image/NewImage.h"
 #include "host/image/PixelConvert.h"
+#include "host/krom/KROMBuffer.h"
+#include "host/krom/KROMComputeNode.h"
+#include "host/krom/kernels/GeneratorKernelParams.h"
 #include "operators/frame/Registration.h"
 
 namespace Orvane {
@@ -109,6 +113,8 @@ constexpr double kFixedOne = 65535.0 * 32768.0;
 constexpr int kFixedShift = 15;
 constexpr int32_t kFixedHalf = 16384;
 constexpr float kTwoPi = 6.2831855f;
+/// Entries of the gradient table the device reads.
+constexpr int kGradientTableSize = 256;
 
 /// The list tags of a button row, appended to `tags`.
 template <size_t N> TagList WithChoices(TagList tags, const Choice (&list)[N]) {
@@ -432,14 +438,17 @@ void Background::Process(Request *req) {
             }
         }
 
-        // The device path will be tried here once the tool has one.
-        if (!img->AllocScanLineData()) {
-            Fail(req, "%s: out of memory (time = %f)\n", Name().c_str(), req->Time());
-            req->SetOutputData(outImage_, nullptr);
-            return;
+        // The device first when the render has one; a field has no device form.
+        const bool onDevice = !field_ && IsGPUEnabled(req, true) && RunDevice(req, img.Get());
+        if (!onDevice) {
+            if (!img->AllocScanLineData()) {
+                Fail(req, "%s: out of memory (time = %f)\n", Name().c_str(), req->Time());
+                req->SetOutputData(outImage_, nullptr);
+                return;
+            }
+            image_ = img.Get();
+            DoMultiProcess(req, window_.Height());
         }
-        image_ = img.Get();
-        DoMultiProcess(req, window_.Height());
     }
 
     if (mode_ == ModeGradient)
@@ -455,6 +464,74 @@ void Background::Process(Request *req) {
         img->SetAttrsTagList(fieldTags);
     }
     req->SetOutputData(outImage_, img.Get());
+}
+
+bool Background::RunDevice(Request *req, Image *img) {
+    const int window[4] = {window_.x0, window_.x1, window_.y0, window_.y1};
+    const int size[2] = {width_ - 1, height_ - 1}, work[2] = {window_.Width(), window_.Height()};
+    const int dstOrder = img->IsMask() ? CompOrderAlpha : CompOrderRGBA;
+    if (mode_ != ModeGradient) {
+        auto block = std::make_shared<BackgroundParams>();
+        BackgroundParams &p = *block;
+        p.mode = mode_;
+        std::copy_n(color_[TopLeft], 4, p.tl);
+        std::copy_n(color_[TopRight], 4, p.tr);
+        std::copy_n(color_[BottomLeft], 4, p.bl);
+        std::copy_n(color_[BottomRight], 4, p.br);
+        std::copy_n(window, 4, p.imgDataWindow);
+        std::copy_n(size, 2, p.imgSize);
+        std::copy_n(work, 2, p.workSize);
+        p.dstCompOrder = dstOrder;
+        return KROMComputeNode::ExecKernelI(req, "Background", nullptr, BackgroundParamsText, sizeof p, -1, -1, block,
+                                            {{"output", img}});
+    }
+
+    auto block = std::make_shared<BackgroundGradParams>();
+    BackgroundGradParams &p = *block;
+    std::copy_n(start_, 2, p.start);
+    std::copy_n(end_, 2, p.end);
+    p.offset = offset_;
+    p.aspect = aspect_;
+    p.type = gradientType_;
+    p.repeat = repeat_;
+    p.subpixel = subpixel_;
+    std::copy_n(window, 4, p.imgDataWindow);
+    std::copy_n(size, 2, p.imgSize);
+    std::copy_n(work, 2, p.workSize);
+    p.dstCompOrder = dstOrder;
+    // The gradient baked into a 256-entry table, premultiplied like the pixels.
+    float table[kGradientTableSize][4];
+    for (int k = 0; k < kGradientTableSize; ++k) {
+        float *e = table[k];
+        gradient_->QuickEvaluate(k * 0.00392156862745098, e[0], e[1], e[2], e[3], colorSpace_);
+        for (int ch = 0; ch < 3; ++ch) e[ch] *= e[3];
+    }
+    RenderTask *task = req->GetTask();
+    if (!task) return false;
+    std::string failure;
+    const bool ok = task->Execute("Background::RunDevice", [&](IDeviceContext *ctx) {
+        std::unique_ptr<KROMComputeNode> node =
+            KROMComputeNode::Create(ctx, "BackgroundGrad", nullptr, BackgroundGradParamsText, false);
+        std::unique_ptr<KROMBuffer> grad = KROMBuffer::CreateImage(ctx, kGradientTableSize, 1, DepthRGBAFlt32, table);
+        std::unique_ptr<KROMBuffer> out = KROMBuffer::CreateImage(ctx, img, KROMBufferWrite);
+        if (!node->IsValid() || !grad->IsValid() || !out->IsValid()) {
+            failure = !node->IsValid() ? node->Error() : (!grad->IsValid() ? grad->Error() : out->Error());
+            return false;
+        }
+        node->SetParamStruct(block, sizeof p);
+        node->AddInput("p_Grad", grad.get());
+        node->AddOutput("output", out.get());
+        node->AddSampler("RowSampler", TextureFilterLinear, TextureAddressClamp, TextureCoordsNormalized);
+        node->AddKernelOption(KROMCommonKernelOption, ScriptVal(1.0));
+        if (!node->RunSession()) {
+            failure = node->Error();
+            return false;
+        }
+        img->SetGPUMem(out->GetGPUMemory(), true);
+        return true;
+    });
+    if (!ok) task->NoteDeviceFailure("BackgroundGrad", failure.empty() ? "failed" : failure);
+    return ok;
 }
 
 void Background::ProcessChunk(Request *, int chunk) {

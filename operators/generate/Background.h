@@ -14,6 +14,12 @@
 // on the left column of a horizontal one. Integer images take ramps by fixed
 // point increments along each row; gradients are sampled per pixel.
 //
+// With a device, the frame is made there first (not for field requests): the
+// ramps by the rows' own arithmetic; the gradient from a 256-entry table of
+// the gradient, with positions taken against width - 1 and height - 1 and the
+// sub-sample row step added before the aspect scaling (the device form,
+// which differs from the rows by up to one table step and one pixel).
+//
 // Working values live in the tool for the length of one request: Process is
 // their only writer, and the row workers read them.
 #include <vector>
@@ -51,6 +57,9 @@ private:
     /// aspect-scaled Y offset from Start.
     float GradientPosition(float a, float b, float px, float offY) const;
     void ReleaseRequestState();
+    /// The frame on the render's device ("Background" or "BackgroundGrad" of
+    /// the common library); false when it did not run there.
+    bool RunDevice(Request *req, Image *img);
 
     // Inputs, in panel order.
     Input *inType_;

@@ -1,0 +1,60 @@
+#include "host/flow/RenderTask.h"
+
+#include <algorithm>
+#include <map>
+
+#include "host/krom/DeviceContext.h"
+
+namespace Orvane {
+namespace {
+
+// The live tasks by ID.
+std::mutex s_tasksLock;
+std::map<uint64_t, RenderTask *> s_tasks;
+uint64_t s_nextId = 1;
+
+} // namespace
+
+RenderTask::RenderTask() {
+    std::lock_guard<std::mutex> lock(s_tasksLock);
+    id_ = s_nextId++;
+    s_tasks[id_] = this;
+}
+
+RenderTask::~RenderTask() {
+    if (device_) device_->Finish(); // queued runs may still use this task
+    std::lock_guard<std::mutex> lock(s_tasksLock);
+    s_tasks.erase(id_);
+}
+
+RenderTask *RenderTask::Find(uint64_t id) {
+    std::lock_guard<std::mutex> lock(s_tasksLock);
+    auto it = s_tasks.find(id);
+    return it == s_tasks.end() ? nullptr : it->second;
+}
+
+bool RenderTask::Execute(const char *, const std::function<bool(IDeviceContext *)> &fn) {
+    IDeviceContext *device = device_;
+    if (!device) return false;
+    return device->Execute([&] { return fn(device); });
+}
+
+bool RenderTask::QueueExecute(const char *, std::function<void(IDeviceContext *)> fn) {
+    IDeviceContext *device = device_;
+    if (!device) return false;
+    device->QueueExecute([device, fn = std::move(fn)] { fn(device); });
+    return true;
+}
+
+void RenderTask::NoteDeviceFailure(const std::string &name, const std::string &reason) {
+    const std::string line = name + ": " + reason;
+    std::lock_guard<std::mutex> lock(logLock_);
+    if (std::find(log_.begin(), log_.end(), line) == log_.end()) log_.push_back(line);
+}
+
+std::vector<std::string> RenderTask::DeviceLog() const {
+    std::lock_guard<std::mutex> lock(logLock_);
+    return log_;
+}
+
+} // namespace Orvane

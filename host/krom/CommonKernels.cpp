@@ -1,0 +1,26 @@
+#include "host/krom/CommonKernels.h"
+
+#include "host/krom/kernels/ColorKernelParams.h"
+#include "host/krom/kernels/GeneratorKernelParams.h"
+#include "host/krom/kernels/KernelTexts.h"
+
+namespace Orvane {
+
+const std::vector<CommonKernel> &CommonKernels() {
+    static const std::vector<CommonKernel> kernels = {
+        {"BrightnessContrast", BrightnessContrastParamsText, kBrightnessContrastKernels},
+        {"BrightnessContrastReverse", BrightnessContrastParamsText, kBrightnessContrastKernels},
+        {"ColorMatrix", ColorMatrixParamsText, kColorMatrixKernel},
+        {"Background", BackgroundParamsText, kBackgroundKernel},
+        {"BackgroundGrad", BackgroundGradParamsText, kBackgroundGradKernel},
+    };
+    return kernels;
+}
+
+const CommonKernel *FindCommonKernel(const std::string &name) {
+    for (const CommonKernel &k : CommonKernels())
+        if (name == k.name) return &k;
+    return nullptr;
+}
+
+} // namespace Orvane

@@ -1,0 +1,118 @@
+// Colour kernels of the common library. Each does what the tool's rows do,
+// step for step and in the same float order, so results agree bit for bit
+// where the arithmetic is the same (everything but the gamma power, which is
+// the device's powf).
+#include "host/krom/kernels/KernelTexts.h"
+
+namespace Orvane {
+
+const char kBrightnessContrastKernels[] = R"KROM(
+KROM_FN float bc_power(float x, float e) { return _copysignf(_powf(_fabs(x), e), x); }
+
+KROM_FN void bc_pre_divide(__CONSTANTREF__ BrightnessContrastParams *q, float *p) {
+    if (!q->prePost) return;
+    const float a = _fabs(p[3]) < 1.1920929e-07f ? 0.f : 1.f / p[3];
+    for (int c = 0; c < 3; ++c)
+        if (q->chans[c]) p[c] = p[c] * a;
+}
+
+KROM_FN void bc_finish(__CONSTANTREF__ BrightnessContrastParams *q, float *p) {
+    if (q->prePost)
+        for (int c = 0; c < 3; ++c)
+            if (q->chans[c]) p[c] = p[c] * p[3];
+    for (int c = 0; c < 4; ++c) {
+        if (!q->chans[c]) continue;
+        if (q->clipBlack && p[c] < 0.f) p[c] = 0.f;
+        if (q->clipWhite && p[c] > 1.f) p[c] = 1.f;
+    }
+}
+
+KROM_FN float4 bc_forward(__CONSTANTREF__ BrightnessContrastParams *q, float4 in) {
+    float p[4] = {in.x, in.y, in.z, in.w};
+    bc_pre_divide(q, p);
+    for (int c = 0; c < 4; ++c) {
+        if (!q->chans[c]) continue;
+        float x = q->gain * p[c] + q->lift;
+        if (q->doGamma) x = bc_power(x, q->gamma);
+        p[c] = (x - 0.5f) * q->finalContrast + 0.5f + q->bright;
+    }
+    if (q->doSat) {
+        const float y = 0.299f * p[0] + 0.587f * p[1] + 0.114f * p[2];
+        for (int c = 0; c < 3; ++c)
+            if (q->chans[c]) p[c] = p[c] * q->sat + y * q->_sat;
+    }
+    if (q->useLowHigh)
+        for (int c = 0; c < 4; ++c)
+            if (q->chans[c]) p[c] = (p[c] - q->low) * q->finalScale;
+    bc_finish(q, p);
+    return make_float4(p[0], p[1], p[2], p[3]);
+}
+
+KROM_FN float4 bc_reverse(__CONSTANTREF__ BrightnessContrastParams *q, float4 in) {
+    float p[4] = {in.x, in.y, in.z, in.w};
+    bc_pre_divide(q, p);
+    if (q->useLowHigh)
+        for (int c = 0; c < 4; ++c)
+            if (q->chans[c]) p[c] = q->finalScale * p[c] + q->low;
+    if (q->doSat) {
+        const float r = p[0], g = p[1], b = p[2];
+        if (q->chans[0]) p[0] = q->satMat_v1[0] * r + q->satMat_v1[1] * g + q->satMat_v1[2] * b;
+        if (q->chans[1]) p[1] = q->satMat_v2[0] * r + q->satMat_v2[1] * g + q->satMat_v2[2] * b;
+        if (q->chans[2]) p[2] = q->satMat_v3[0] * r + q->satMat_v3[1] * g + q->satMat_v3[2] * b;
+    }
+    for (int c = 0; c < 4; ++c) {
+        if (!q->chans[c]) continue;
+        float x = (p[c] - q->bright - 0.5f) * q->finalContrast + 0.5f;
+        if (q->doGamma) x = bc_power(x, q->gamma);
+        p[c] = (x - q->lift) * q->gain;
+    }
+    bc_finish(q, p);
+    return make_float4(p[0], p[1], p[2], p[3]);
+}
+
+__KERNEL__ void BrightnessContrast(__CONSTANTREF__ BrightnessContrastParams *p_pParams, __TEXTURE2D__ input,
+                                   __TEXTURE2D_WRITE__ output) {
+    DEFINE_KERNEL_ITERATORS_XY(x, y);
+    if (x >= p_pParams->workSize[0] || y >= p_pParams->workSize[1]) return;
+    const int2 pos = make_int2(x + p_pParams->outDataWindow[0], y + p_pParams->outDataWindow[2]);
+    float4 c = to_float4_v(p_pParams->dp);
+    if (IsInsideROI(pos, p_pParams->inDataWindow))
+        c = bc_forward(p_pParams, _tex2DVecN(input, pos.x - p_pParams->inDataWindow[0],
+                                             pos.y - p_pParams->inDataWindow[2], p_pParams->srcCompOrder));
+    _tex2DVec4Write(output, x, y, make_intensity(c, p_pParams->dstCompOrder));
+}
+
+__KERNEL__ void BrightnessContrastReverse(__CONSTANTREF__ BrightnessContrastParams *p_pParams, __TEXTURE2D__ input,
+                                          __TEXTURE2D_WRITE__ output) {
+    DEFINE_KERNEL_ITERATORS_XY(x, y);
+    if (x >= p_pParams->workSize[0] || y >= p_pParams->workSize[1]) return;
+    const int2 pos = make_int2(x + p_pParams->outDataWindow[0], y + p_pParams->outDataWindow[2]);
+    float4 c = to_float4_v(p_pParams->dp);
+    if (IsInsideROI(pos, p_pParams->inDataWindow))
+        c = bc_reverse(p_pParams, _tex2DVecN(input, pos.x - p_pParams->inDataWindow[0],
+                                             pos.y - p_pParams->inDataWindow[2], p_pParams->srcCompOrder));
+    _tex2DVec4Write(output, x, y, make_intensity(c, p_pParams->dstCompOrder));
+}
+)KROM";
+
+const char kColorMatrixKernel[] = R"KROM(
+__KERNEL__ void ColorMatrix(__CONSTANTREF__ ColorMatrixParams *p_pParams, __TEXTURE2D__ input,
+                            __TEXTURE2D_WRITE__ output) {
+    DEFINE_KERNEL_ITERATORS_XY(x, y);
+    if (x >= p_pParams->workSize[0] || y >= p_pParams->workSize[1]) return;
+    const int2 pos = make_int2(x + p_pParams->outDataWindow[0], y + p_pParams->outDataWindow[2]);
+    float4 c = to_float4_v(p_pParams->dp);
+    if (IsInsideROI(pos, p_pParams->inDataWindow)) {
+        const float4 s = _tex2DVecN(input, pos.x - p_pParams->inDataWindow[0], pos.y - p_pParams->inDataWindow[2],
+                                    p_pParams->srcCompOrder);
+        __CONSTANTREF__ float *k = p_pParams->m;
+        c = make_float4(k[0] * s.x + k[1] * s.y + k[2] * s.z + k[3] * s.w + k[4],
+                        k[5] * s.x + k[6] * s.y + k[7] * s.z + k[8] * s.w + k[9],
+                        k[10] * s.x + k[11] * s.y + k[12] * s.z + k[13] * s.w + k[14],
+                        k[15] * s.x + k[16] * s.y + k[17] * s.z + k[18] * s.w + k[19]);
+    }
+    _tex2DVec4Write(output, x, y, make_intensity(c, p_pParams->dstCompOrder));
+}
+)KROM";
+
+} // namespace Orvane

@@ -1,0 +1,12 @@
+#pragma once
+// Kernel texts of the common library (the *Params.h headers have their blocks).
+namespace Orvane {
+/// "BrightnessContrast" and "BrightnessContrastReverse".
+extern const char kBrightnessContrastKernels[];
+/// "ColorMatrix".
+extern const char kColorMatrixKernel[];
+/// "Background".
+extern const char kBackgroundKernel[];
+/// "BackgroundGrad".
+extern const char kBackgroundGradKernel[];
+} // namespace Orvane
