@@ -23,6 +23,8 @@ bool Volatile(const Operator *op) { return op->RegAttrB(RegNoCache) || op->RegAt
 /// The request flags that change a result, with the proxy scale.
 uint32_t Traits(uint32_t flags, const RenderTask *task) {
     uint32_t t = flags & (ReqFlagPreCalc | ReqFlagProxy | ReqFlagQuick | ReqFlagNoGPU);
+    // Device results may differ from the rows in the last bits: kept apart.
+    if (task && task->Device()) t |= 1u << 30;
     if ((flags & ReqFlagProxy) && task) t |= static_cast<uint32_t>(std::min(task->proxyScale, 255)) << 16;
     return t;
 }
@@ -82,6 +84,8 @@ bool InMainMemory(const Parameter *value, const Operator *consumer, double time)
                                    consumer->Name().c_str(), time);
     return false;
 }
+
+} // namespace
 
 Ref<Parameter> EvaluateOnDevice(Output *out, double time, const EvalOptions &options) {
     if (!out || !out->Owner()) return nullptr;
@@ -218,8 +222,6 @@ Ref<Parameter> EvaluateOnDevice(Output *out, double time, const EvalOptions &opt
     if (state && !timeShifted) cache->Store(key, opt.roi, result);
     return result;
 }
-
-} // namespace
 
 Ref<Parameter> Evaluate(Output *out, double time, const EvalOptions &options) {
     Ref<Parameter> result = EvaluateOnDevice(out, time, options);

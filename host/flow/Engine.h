@@ -38,8 +38,13 @@ struct EvalOptions {
     bool useCache = true;
 };
 
-/// The value of `out` at `time`, or null when a tool failed.
+/// The value of `out` at `time`, or null when a tool failed. An image made
+/// on the render's device is brought back into main memory.
 ORVANE_API Ref<Parameter> Evaluate(Output *out, double time, const EvalOptions &options = {});
+/// The same, but an image made on the device stays there (its main memory
+/// stale until Image::DownloadGPUMem): for callers that pass it on to the
+/// device, such as a viewer drawing from device memory.
+ORVANE_API Ref<Parameter> EvaluateOnDevice(Output *out, double time, const EvalOptions &options = {});
 
 /// Hash of everything the value of `out` at `time` depends on; absent when a
 /// tool upstream gives different results for the same inputs (no caching).

@@ -204,8 +204,8 @@ public:
         return r == CUDA_SUCCESS;
     }
 
-    bool Launch(const IDeviceKernel &kernel, const std::vector<KernelArgument> &args, int width, int height,
-                std::string *error) override {
+    bool DoLaunch(const IDeviceKernel &kernel, const std::vector<KernelArgument> &args, int width, int height,
+                  std::string *error) override {
         if (width <= 0 || height <= 0) return true;
         MakeCurrent();
         std::vector<CUdeviceptr> pointers(args.size());

@@ -1,5 +1,6 @@
 #include "host/krom/DeviceContext.h"
 
+#include <atomic>
 #include <cctype>
 #include <condition_variable>
 #include <deque>
@@ -135,6 +136,7 @@ bool ParseKernelSignature(const std::string &source, const std::string &name, st
 // ---- the context's shared state: kernels and the device thread ----
 
 struct IDeviceContext::State {
+    std::atomic<int> launches{0};
     std::mutex kernelsLock;
     std::map<std::pair<std::string, std::string>, std::shared_ptr<IDeviceKernel>> kernels;
     int compiles = 0;
@@ -179,6 +181,14 @@ int IDeviceContext::CompileCount() const {
     std::lock_guard<std::mutex> lock(state_->kernelsLock);
     return state_->compiles;
 }
+
+bool IDeviceContext::Launch(const IDeviceKernel &kernel, const std::vector<KernelArgument> &args, int width, int height,
+                            std::string *error) {
+    ++state_->launches;
+    return DoLaunch(kernel, args, width, height, error);
+}
+
+int IDeviceContext::LaunchCount() const { return state_->launches.load(); }
 
 void IDeviceContext::QueueExecute(std::function<void()> fn) {
     State &s = *state_;

@@ -119,8 +119,10 @@ public:
 
     /// Runs `kernel` over width x height work items with `args` in the
     /// kernel's parameter order, and waits for it to finish.
-    virtual bool Launch(const IDeviceKernel &kernel, const std::vector<KernelArgument> &args, int width, int height,
-                        std::string *error) = 0;
+    bool Launch(const IDeviceKernel &kernel, const std::vector<KernelArgument> &args, int width, int height,
+                std::string *error);
+    /// Number of launches so far, for tests.
+    int LaunchCount() const;
 
     /// Runs `fn` on the device thread and gives back its result; called on
     /// the device thread itself, runs `fn` at once.
@@ -135,6 +137,8 @@ protected:
     /// Compiles the full text (dialect header included) and finds `name` in it.
     virtual std::shared_ptr<IDeviceKernel> Build(const std::string &name, const std::string &fullSource,
                                                  std::vector<KernelParamDecl> params, std::string *log) = 0;
+    virtual bool DoLaunch(const IDeviceKernel &kernel, const std::vector<KernelArgument> &args, int width, int height,
+                          std::string *error) = 0;
 
 private:
     struct State;

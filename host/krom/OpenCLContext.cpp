@@ -106,8 +106,8 @@ public:
         return err == CL_SUCCESS;
     }
 
-    bool Launch(const IDeviceKernel &kernel, const std::vector<KernelArgument> &args, int width, int height,
-                std::string *error) override {
+    bool DoLaunch(const IDeviceKernel &kernel, const std::vector<KernelArgument> &args, int width, int height,
+                  std::string *error) override {
         const auto &k = static_cast<const CLKernel &>(kernel);
         std::lock_guard<std::mutex> lock(k.Lock());
         for (size_t i = 0; i < args.size(); ++i) {

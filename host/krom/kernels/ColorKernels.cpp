@@ -9,11 +9,23 @@ namespace Orvane {
 const char kBrightnessContrastKernels[] = R"KROM(
 KROM_FN float bc_power(float x, float e) { return _copysignf(_powf(_fabs(x), e), x); }
 
-KROM_FN void bc_pre_divide(__CONSTANTREF__ BrightnessContrastParams *q, float *p) {
-    if (!q->prePost) return;
+/// Integer images (8 and 16 bits) keep every step within 0..1, as their rows
+/// do in 16-bit arithmetic; float images let values leave it.
+KROM_FN int bc_integer(__CONSTANTREF__ BrightnessContrastParams *q) { return ((q->srcCompOrder >> 4) & 3) < 2; }
+KROM_FN float bc_bound(int integer, float v) { return integer ? _fminf(_fmaxf(v, 0.f), 1.f) : v; }
+
+/// The pre-divide; false when an integer pixel with zero alpha is done.
+KROM_FN int bc_pre_divide(__CONSTANTREF__ BrightnessContrastParams *q, float *p) {
+    if (!q->prePost) return 1;
+    if (bc_integer(q)) {
+        for (int c = 0; c < 3; ++c)
+            if (q->chans[c]) p[c] = p[3] <= 0.f ? 0.f : _fminf(p[c] / p[3], 1.f);
+        return p[3] > 0.f || q->chans[3];
+    }
     const float a = _fabs(p[3]) < 1.1920929e-07f ? 0.f : 1.f / p[3];
     for (int c = 0; c < 3; ++c)
         if (q->chans[c]) p[c] = p[c] * a;
+    return 1;
 }
 
 KROM_FN void bc_finish(__CONSTANTREF__ BrightnessContrastParams *q, float *p) {
@@ -29,42 +41,44 @@ KROM_FN void bc_finish(__CONSTANTREF__ BrightnessContrastParams *q, float *p) {
 
 KROM_FN float4 bc_forward(__CONSTANTREF__ BrightnessContrastParams *q, float4 in) {
     float p[4] = {in.x, in.y, in.z, in.w};
-    bc_pre_divide(q, p);
+    const int integer = bc_integer(q);
+    if (!bc_pre_divide(q, p)) return make_float4(p[0], p[1], p[2], p[3]);
     for (int c = 0; c < 4; ++c) {
         if (!q->chans[c]) continue;
-        float x = q->gain * p[c] + q->lift;
+        float x = bc_bound(integer, q->gain * p[c] + q->lift);
         if (q->doGamma) x = bc_power(x, q->gamma);
-        p[c] = (x - 0.5f) * q->finalContrast + 0.5f + q->bright;
+        p[c] = bc_bound(integer, (x - 0.5f) * q->finalContrast + 0.5f + q->bright);
     }
     if (q->doSat) {
         const float y = 0.299f * p[0] + 0.587f * p[1] + 0.114f * p[2];
         for (int c = 0; c < 3; ++c)
-            if (q->chans[c]) p[c] = p[c] * q->sat + y * q->_sat;
+            if (q->chans[c]) p[c] = bc_bound(integer, p[c] * q->sat + y * q->_sat);
     }
     if (q->useLowHigh)
         for (int c = 0; c < 4; ++c)
-            if (q->chans[c]) p[c] = (p[c] - q->low) * q->finalScale;
+            if (q->chans[c]) p[c] = bc_bound(integer, (p[c] - q->low) * q->finalScale);
     bc_finish(q, p);
     return make_float4(p[0], p[1], p[2], p[3]);
 }
 
 KROM_FN float4 bc_reverse(__CONSTANTREF__ BrightnessContrastParams *q, float4 in) {
     float p[4] = {in.x, in.y, in.z, in.w};
-    bc_pre_divide(q, p);
+    const int integer = bc_integer(q);
+    if (!bc_pre_divide(q, p)) return make_float4(p[0], p[1], p[2], p[3]);
     if (q->useLowHigh)
         for (int c = 0; c < 4; ++c)
-            if (q->chans[c]) p[c] = q->finalScale * p[c] + q->low;
+            if (q->chans[c]) p[c] = bc_bound(integer, q->finalScale * p[c] + q->low);
     if (q->doSat) {
         const float r = p[0], g = p[1], b = p[2];
-        if (q->chans[0]) p[0] = q->satMat_v1[0] * r + q->satMat_v1[1] * g + q->satMat_v1[2] * b;
-        if (q->chans[1]) p[1] = q->satMat_v2[0] * r + q->satMat_v2[1] * g + q->satMat_v2[2] * b;
-        if (q->chans[2]) p[2] = q->satMat_v3[0] * r + q->satMat_v3[1] * g + q->satMat_v3[2] * b;
+        if (q->chans[0]) p[0] = bc_bound(integer, q->satMat_v1[0] * r + q->satMat_v1[1] * g + q->satMat_v1[2] * b);
+        if (q->chans[1]) p[1] = bc_bound(integer, q->satMat_v2[0] * r + q->satMat_v2[1] * g + q->satMat_v2[2] * b);
+        if (q->chans[2]) p[2] = bc_bound(integer, q->satMat_v3[0] * r + q->satMat_v3[1] * g + q->satMat_v3[2] * b);
     }
     for (int c = 0; c < 4; ++c) {
         if (!q->chans[c]) continue;
-        float x = (p[c] - q->bright - 0.5f) * q->finalContrast + 0.5f;
+        float x = bc_bound(integer, (p[c] - q->bright - 0.5f) * q->finalContrast + 0.5f);
         if (q->doGamma) x = bc_power(x, q->gamma);
-        p[c] = (x - q->lift) * q->gain;
+        p[c] = bc_bound(integer, (x - q->lift) * q->gain);
     }
     bc_finish(q, p);
     return make_float4(p[0], p[1], p[2], p[3]);

@@ -12,6 +12,7 @@
 
 #include "host/color/ColorSpace.h"
 #include "host/core/Tags.h"
+#include "tests/host/krom/DeviceTestSupport.h"
 #include "tests/operators/generate/BackgroundTestSupport.h"
 
 namespace Orvane::BgTest {
@@ -79,16 +80,21 @@ Sample SampleAt(const GradientCase &c, double aspect, double px, double py) {
 /// the clamped positions of its n x n samples at (x + j/n, y + i/n) / (W, H),
 /// the sample row's step added after the aspect scaling. False when a sample
 /// lies on a jump, where float and double may fall on different sides.
-bool ExpectedGrey(const GradientCase &c, int W, int H, int x, int y, double &value) {
+/// With `device`, the device's form: positions against W - 1 and H - 1, the
+/// row step added before the aspect scaling, and the colour read from the
+/// 256-entry table (entry k at k/255) through a linear sampler over texel
+/// centres, which for this ramp gives (256 t - 0.5) / 255, clamped.
+bool ExpectedGrey(const GradientCase &c, int W, int H, int x, int y, double &value, bool device = false) {
     const int n = c.subpixel;
     const double aspect = double(H) / W;
     double sum = 0;
     for (int i = 0; i < n; ++i)
         for (int j = 0; j < n; ++j) {
-            const double px = (x + double(j) / n) / W, py = aspect * (double(y) / H) + double(i) / (n * H);
+            double px = (x + double(j) / n) / W, py = aspect * (double(y) / H) + double(i) / (n * H);
+            if (device) px = (x + double(j) / n) / (W - 1), py = aspect * ((y + double(i) / n) / (H - 1));
             const Sample s = SampleAt(c, aspect, px, py);
             if (s.nearJump) return false;
-            sum += std::clamp(s.position, 0.0, 1.0);
+            sum += device ? std::clamp((256.0 * s.position - 0.5) / 255.0, 0.0, 1.0) : std::clamp(s.position, 0.0, 1.0);
         }
     value = sum / (n * n);
     return true;
@@ -142,6 +148,37 @@ TEST_F(BackgroundGradient, EachShapeFoldAndSubPixelGridMatchesTheGeometry) {
                 ASSERT_NEAR(p.G, want, 2e-5) << x << "," << y;
                 ASSERT_NEAR(p.B, want, 2e-5) << x << "," << y;
                 ASSERT_EQ(p.A, 1.0f) << x << "," << y;
+            }
+        EXPECT_GT(checked, W * H * 9 / 10);
+    }
+}
+
+TEST_F(BackgroundGradient, OnTheDeviceEachCaseFollowsTheDeviceGeometry) {
+    ORVANE_NEED_OPENCL(ctx);
+    const int W = 40, H = 24;
+    Frame(W, H, "Gradient");
+    for (const GradientCase &c : kCases) {
+        SCOPED_TRACE(c.name);
+        SetUpGradient(bg, c);
+        RenderTask task;
+        task.SetDevice(ctx);
+        EvalOptions opt;
+        opt.task = &task;
+        opt.useCache = false;
+        const int launches = ctx->LaunchCount();
+        Ref<Image> img = Render(bg, opt);
+        ASSERT_TRUE(img);
+        EXPECT_EQ(ctx->LaunchCount(), launches + 1);
+        int checked = 0;
+        for (int y = 0; y < H; ++y)
+            for (int x = 0; x < W; ++x) {
+                double want;
+                if (!ExpectedGrey(c, W, H, x, y, want, true)) continue;
+                ++checked;
+                const FltPixel p = img->GetFlt(x, y);
+                ASSERT_NEAR(p.R, want, 5e-5) << x << "," << y;
+                ASSERT_NEAR(p.B, want, 5e-5) << x << "," << y;
+                ASSERT_NEAR(p.A, 1.0f, 1e-6) << x << "," << y;
             }
         EXPECT_GT(checked, W * H * 9 / 10);
     }
