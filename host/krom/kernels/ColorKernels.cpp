@@ -84,28 +84,30 @@ KROM_FN float4 bc_reverse(__CONSTANTREF__ BrightnessContrastParams *q, float4 in
     return make_float4(p[0], p[1], p[2], p[3]);
 }
 
+/// One pixel of either kernel: the chain inside the input's window, the
+/// processed canvas colour beyond it.
+KROM_FN void bc_pixel(__CONSTANTREF__ BrightnessContrastParams *q, __TEXTURE2D__ input, __TEXTURE2D_WRITE__ output,
+                      int x, int y, int reverse) {
+    if (x >= q->workSize[0] || y >= q->workSize[1]) return;
+    const int2 pos = make_int2(x + q->outDataWindow[0], y + q->outDataWindow[2]);
+    float4 c = to_float4_v(q->dp);
+    if (IsInsideROI(pos, q->inDataWindow)) {
+        c = _tex2DVecN(input, pos.x - q->inDataWindow[0], pos.y - q->inDataWindow[2], q->srcCompOrder);
+        c = reverse ? bc_reverse(q, c) : bc_forward(q, c);
+    }
+    _tex2DVec4Write(output, x, y, make_intensity(c, q->dstCompOrder));
+}
+
 __KERNEL__ void BrightnessContrast(__CONSTANTREF__ BrightnessContrastParams *p_pParams, __TEXTURE2D__ input,
                                    __TEXTURE2D_WRITE__ output) {
     DEFINE_KERNEL_ITERATORS_XY(x, y);
-    if (x >= p_pParams->workSize[0] || y >= p_pParams->workSize[1]) return;
-    const int2 pos = make_int2(x + p_pParams->outDataWindow[0], y + p_pParams->outDataWindow[2]);
-    float4 c = to_float4_v(p_pParams->dp);
-    if (IsInsideROI(pos, p_pParams->inDataWindow))
-        c = bc_forward(p_pParams, _tex2DVecN(input, pos.x - p_pParams->inDataWindow[0],
-                                             pos.y - p_pParams->inDataWindow[2], p_pParams->srcCompOrder));
-    _tex2DVec4Write(output, x, y, make_intensity(c, p_pParams->dstCompOrder));
+    bc_pixel(p_pParams, input, output, x, y, 0);
 }
 
 __KERNEL__ void BrightnessContrastReverse(__CONSTANTREF__ BrightnessContrastParams *p_pParams, __TEXTURE2D__ input,
                                           __TEXTURE2D_WRITE__ output) {
     DEFINE_KERNEL_ITERATORS_XY(x, y);
-    if (x >= p_pParams->workSize[0] || y >= p_pParams->workSize[1]) return;
-    const int2 pos = make_int2(x + p_pParams->outDataWindow[0], y + p_pParams->outDataWindow[2]);
-    float4 c = to_float4_v(p_pParams->dp);
-    if (IsInsideROI(pos, p_pParams->inDataWindow))
-        c = bc_reverse(p_pParams, _tex2DVecN(input, pos.x - p_pParams->inDataWindow[0],
-                                             pos.y - p_pParams->inDataWindow[2], p_pParams->srcCompOrder));
-    _tex2DVec4Write(output, x, y, make_intensity(c, p_pParams->dstCompOrder));
+    bc_pixel(p_pParams, input, output, x, y, 1);
 }
 )KROM";
 
