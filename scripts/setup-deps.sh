@@ -11,6 +11,8 @@ packages=(
   clang-format
   # Tests compare our file formats with these programs.
   netpbm imagemagick openexr libjpeg-turbo-progs
+  # Blur, resize and merge results and speeds are compared with these.
+  openimageio-tools libvips-tools
 )
 missing=()
 for p in "${packages[@]}"; do

@@ -201,6 +201,15 @@ constexpr Tag SliderHighLabel = 0x30050002;
 constexpr Tag OffsetXLabel = 0x30050000;
 constexpr Tag OffsetYLabel = 0x30050001;
 constexpr Tag PreviewInputFirst = 0x60058000;
+/// The n-th companion input of a preview is at PreviewInputFirst + n.
+constexpr int PreviewInputCount = 16;
+// What a tool changes on the previews and Offset controls of its inputs at run time.
+constexpr Tag PreviewShown = ControlFlag8001; ///< a preview of a group is drawn
+constexpr Tag PreviewOffsetX = 0x20048000;    ///< the preview's origin moves by this (normalised units)
+constexpr Tag PreviewOffsetY = 0x20048001;
+constexpr Tag OffsetDisplayScaleX = 0x20050002; ///< an Offset control shows its value times this
+constexpr Tag OffsetDisplayScaleY = 0x20050003;
+constexpr Tag RectanglePreviewAspect = 0x20058003; ///< height over width of a Rectangle preview
 
 // ---- Image creation (NewImageTagList) -----------------------------------
 constexpr Tag ImgLikeImage = 0x60020000;
@@ -287,15 +296,83 @@ constexpr Tag WorkThreaded = 0x10010000;
 constexpr Tag WorkUseGPU = 0x10010002;
 constexpr Tag MtxColorMatrix = 0x60030000;
 constexpr Tag MtxColorMatrixFull = 0x60030001;
-/// Image::ResizeTagList's filter: 0 nearest, 1 box, 2 bilinear, 3 bicubic (ResampleFilterKind).
-constexpr Tag ResizeFilter = 0x10000003;
+
+// ---- The blur request (Image::BlurTagList, BlurOfImageTagList) -------------
+constexpr Tag BlurFilterType = 0x10000000; ///< BlurTypes value
+constexpr Tag BlurDoRed = 0x10000001;
+constexpr Tag BlurDoGreen = 0x10000002;
+constexpr Tag BlurDoBlue = 0x10000003;
+constexpr Tag BlurDoAlpha = 0x10000004;
+constexpr Tag BlurPasses = 0x10000006;
+constexpr Tag BlurXSize = 0x20000000; ///< normalised: control value / 720
+constexpr Tag BlurYSize = 0x20000001;
+constexpr Tag BlurBlend = 0x20000002;
+constexpr Tag BlurScale = 0x20000003;
+constexpr Tag BlurRedScale = 0x20000004;
+constexpr Tag BlurGreenScale = 0x20000005;
+constexpr Tag BlurBlueScale = 0x20000006;
+constexpr Tag BlurAlphaScale = 0x20000007;
+constexpr Tag BlurSourceWindow = 0x60000002; ///< const ImgRectI *
+
+// ---- The resize request (Image::ResizePreCalcTagList, ResizeTagList) -------
+constexpr Tag ResizeFilter = 0x10000003; ///< RszTypes value
+constexpr Tag ResizeWindow = 0x10000004; ///< ResizeWindowType value (window method + 100)
+constexpr Tag ResizeXEdges = 0x10000005; ///< EdgeMode
+constexpr Tag ResizeYEdges = 0x10000006;
+constexpr Tag ResizeXScale = 0x20000000; ///< output pixels per source pixel
+constexpr Tag ResizeYScale = 0x20000001;
+constexpr Tag ResizeXOffset = 0x20000002; ///< output pixels
+constexpr Tag ResizeYOffset = 0x20000003;
+constexpr Tag ResizeSourceWindow = 0x60000000; ///< const ImgRectI *
+
+// ---- The transform request (TransformMatrix::ImageConcatenateTagList) ------
+constexpr Tag XfCenterX = 0x20030000;
+constexpr Tag XfCenterY = 0x20030001;
+constexpr Tag XfPivotX = 0x20030003;
+constexpr Tag XfPivotY = 0x20030004;
+constexpr Tag XfXSize = 0x20030006;
+constexpr Tag XfYSize = 0x20030007;
+constexpr Tag XfAngle = 0x2003000b; ///< degrees, anticlockwise
+constexpr Tag XfEdges = 0x10030000; ///< EdgeMode
+constexpr Tag XfFlipX = 0x10030001;
+constexpr Tag XfFlipY = 0x10030002;
+constexpr Tag XfInvert = 0x10030004;
+/// MergeConcatenateTagList: -1 blends the merged stack over the unmerged
+/// background with the asking tool's own Blend (and effect mask).
+constexpr Tag XfMergeToolBlend = 0x10030005;
+constexpr Tag XfGPUEnabled = 0x10030008;
+constexpr Tag XfFilter = 0x1003000b; ///< RszTypes value
+constexpr Tag XfWindow = 0x1003000c; ///< ResizeWindowType value
+constexpr Tag XfFlatten = 0x10030010;
+constexpr Tag XfRequest = 0x60030003; ///< Request *
+
+// ---- The merge request (MergeImagesTagList; formulas in docs/MERGE.md) ------
+constexpr Tag MrgApplyMode = 0x10090000; ///< MergeApplyMode value
+constexpr Tag MrgOperator = 0x10090001;  ///< MergeOperatorType value (Normal mode)
+constexpr Tag MrgDoRed = 0x10090002;     ///< channels taken from the merge (off: the background's)
+constexpr Tag MrgDoGreen = 0x10090003;
+constexpr Tag MrgDoBlue = 0x10090004;
+constexpr Tag MrgDoAlpha = 0x10090005;
+constexpr Tag MrgZMerge = 0x10090006; ///< the nearer of the two wins where both carry Z
+constexpr Tag MrgZLargerIsNearer = 0x10090007;
+constexpr Tag MrgFgOffsetX = 0x10090008; ///< foreground pixel (i, j) lies at (i + x, j + y)
+constexpr Tag MrgFgOffsetY = 0x10090009;
+constexpr Tag MrgBlend = 0x20090000;    ///< 0 the background, 1 the full merge
+constexpr Tag MrgAdditive = 0x20090001; ///< 0 subtractive (over), 1 additive
+constexpr Tag MrgAlphaGain = 0x20090002;
+constexpr Tag MrgBurnIn = 0x20090003;
+/// const Matrix3 *: foreground output pixels to background output pixels
+/// (TransformMatrix::MergeConcatenateTagList; the identity when absent).
+constexpr Tag MrgPlacement = 0x60090000;
 
 // ---- Application attributes (GetApp()->GetAttrB) -------------------------
 /// Rows use fast true powers rather than gamma tables.
 constexpr Tag AppFastPower = 0x10010002;
 /// Rows use the four-channel vector loops for RGBA float.
 constexpr Tag AppVectorRows = 0x10010005;
-/// Interactive requests at proxy scale may resize with the quick box filter.
+/// Quick requests may resize with cheaper filters: the Loader's proxy
+/// shrink takes the box filter, and the sizing tools with Only Use Filter in
+/// HiQ on take nearest neighbour.
 constexpr Tag AppFastScale = 0x10010006;
 
 } // namespace Orvane

@@ -10,16 +10,22 @@
 // `in` is the tool's main image input (transparent black for tools without
 // one). Outside every data window the same rule runs on the canvas colours,
 // so the output's canvas stays exact.
+//
+// Tools with an image output also get the motion blur controls; the engine
+// applies them around the whole request (MotionBlur.h).
 #include <algorithm>
+#include <iterator>
 #include <vector>
 
 #include "host/core/Parallel.h"
 #include "host/core/Tags.h"
 #include "host/flow/DataTypes.h"
 #include "host/flow/Operator.h"
+#include "host/flow/RenderTask.h"
 #include "host/flow/Request.h"
 #include "host/image/NewImage.h"
 #include "host/image/PixelConvert.h"
+#include "host/image/TransformMatrix.h"
 
 namespace Orvane {
 namespace {
@@ -67,7 +73,14 @@ void Operator::FinishConstruction() {
     const Input *mainIn = FindMainInput(1);
     const bool clipping =
         mainIn && mainIn->DataType() == CLSID_DataType_Image && RegAttrB(RegSupportsDoD) && !FindInput("ClippingMode");
-    if (!blend && !mask && !clipping) return;
+    // Motion blur for tools with an image output, unless one of its IDs is taken.
+    static const char *const motionIds[] = {"MotionBlur", "MotionBlurQuality", "MotionBlurShutterAngle",
+                                            "MotionBlurCenterBias", "MotionBlurSampleSpread"};
+    const Output *mainOut = FindMainOutput();
+    const bool motion = !RegAttrB(RegNoMotionBlurControls) && mainOut && IsImageDataType(mainOut->DataType()) &&
+                        std::none_of(std::begin(motionIds), std::end(motionIds),
+                                     [this](const char *id) { return FindInput(id) != nullptr; });
+    if (!blend && !mask && !clipping && !motion) return;
     const int page = AddControlPageTagList(CommonPageName, {});
     if (clipping)
         common_.clippingMode = AddInputTagList("Clipping Mode", "ClippingMode",
@@ -129,6 +142,46 @@ void Operator::FinishConstruction() {
             "Multiply By Mask", "MultiplyByMask",
             {{LinkDataType, CLSID_DataType_Number}, {InputControl, CLSID_InputControl_Checkbox}, {ControlPage, page}});
     }
+    if (motion) {
+        common_.motionBlur = AddInputTagList(
+            "Motion Blur", motionIds[0],
+            {{LinkDataType, CLSID_DataType_Number}, {InputControl, CLSID_InputControl_Checkbox}, {ControlPage, page}});
+        common_.motionQuality = AddInputTagList("Quality", motionIds[1],
+                                                {{LinkDataType, CLSID_DataType_Number},
+                                                 {InputControl, CLSID_InputControl_Slider},
+                                                 {ControlPage, page},
+                                                 {InputInteger, 1},
+                                                 {InputDefault, 2.0},
+                                                 {InputMinAllowed, 1.0},
+                                                 {InputMaxAllowed, 256.0},
+                                                 {InputSliderLow, 1.0},
+                                                 {InputSliderHigh, 10.0},
+                                                 {SliderSteps, 10}});
+        common_.shutterAngle = AddInputTagList("Shutter Angle", motionIds[2],
+                                               {{LinkDataType, CLSID_DataType_Number},
+                                                {InputControl, CLSID_InputControl_Slider},
+                                                {ControlPage, page},
+                                                {InputDefault, 180.0},
+                                                {InputMinAllowed, 0.0},
+                                                {InputMaxAllowed, 360.0},
+                                                {SliderSteps, 361}});
+        common_.centerBias = AddInputTagList("Center Bias", motionIds[3],
+                                             {{LinkDataType, CLSID_DataType_Number},
+                                              {InputControl, CLSID_InputControl_Slider},
+                                              {ControlPage, page},
+                                              {InputDefault, 0.0},
+                                              {InputMinAllowed, -1.0},
+                                              {InputMaxAllowed, 1.0},
+                                              {SliderSteps, 201}});
+        common_.sampleSpread = AddInputTagList("Sample Spread", motionIds[4],
+                                               {{LinkDataType, CLSID_DataType_Number},
+                                                {InputControl, CLSID_InputControl_Slider},
+                                                {ControlPage, page},
+                                                {InputDefault, 1.0},
+                                                {InputMinAllowed, 0.0},
+                                                {InputMaxAllowed, 1.0},
+                                                {SliderSteps, 101}});
+    }
 }
 
 OvID Operator::GetClippingMode(const Request *req) const {
@@ -140,8 +193,8 @@ OvID Operator::GetClippingMode(const Request *req) const {
 void Operator::PostProcess(Request *req) {
     Output *out = FindMainOutput();
     if (!out) return;
-    auto *result = dynamic_cast<Image *>(req->GetOutputData(out));
-    if (!result) return;
+    Parameter *value = req->GetOutputData(out);
+    if (!dynamic_cast<Image *>(value) && !dynamic_cast<TransformMatrix *>(value)) return;
 
     Mix mix;
     mix.blend = static_cast<float>(req->GetInputNumber(common_.blend, 1.0));
@@ -157,8 +210,25 @@ void Operator::PostProcess(Request *req) {
         common_.effectMask ? dynamic_cast<const Image *>(req->GetInputData(common_.effectMask)) : nullptr;
     if (mix.blend == 1.f && allChannels && !mask) return;
 
+    // The mix works on pixels: a pending transform (the tool's own output,
+    // or its main input where it takes transforms) is made into pixels
+    // first, over the request's region.
+    const AutoImageRoI region(req);
+    TagList pixelTags{{WorkRequest, static_cast<const void *>(req)}};
+    if (region) pixelTags.Set({ImgDataWindow, &region->rect});
     const Input *mainIn = FindMainInput(1);
-    const Image *src = mainIn ? dynamic_cast<const Image *>(req->GetInputData(mainIn)) : nullptr;
+    Parameter *srcValue = mainIn ? req->GetInputData(mainIn) : nullptr;
+    if (srcValue == value) return; // passed through: nothing to mix
+    const Ref<Image> resultPixels = ImageOfValue(value, pixelTags);
+    const Ref<Image> srcPixels = srcValue ? ImageOfValue(srcValue, pixelTags) : nullptr;
+    if (!resultPixels || (srcValue && !srcPixels && dynamic_cast<TransformMatrix *>(srcValue))) {
+        if (!(req->GetTask() && req->GetTask()->IsAborted()))
+            Fail(req, "%s: out of memory (time = %f)\n", Name().c_str(), req->Time());
+        req->SetOutputData(out, nullptr);
+        return;
+    }
+    Image *result = resultPixels.Get();
+    const Image *src = srcPixels.Get();
     if (src == result) return; // passed through: nothing to mix
     // The mix runs on rows: images made on the device come back first.
     if (!result->DownloadGPUMem() || (src && !src->DownloadGPUMem()) || (mask && !mask->DownloadGPUMem())) {

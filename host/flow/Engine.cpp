@@ -8,12 +8,14 @@
 #include "host/app/Application.h"
 #include "host/core/Tags.h"
 #include "host/flow/DataTypes.h"
+#include "host/flow/MotionBlur.h"
 #include "host/flow/Operator.h"
 #include "host/flow/OrvaneDoc.h"
 #include "host/flow/RenderTask.h"
 #include "host/flow/Request.h"
 #include "host/flow/ResultCache.h"
 #include "host/image/NewImage.h"
+#include "host/image/TransformMatrix.h"
 
 namespace Orvane {
 namespace {
@@ -22,9 +24,11 @@ bool Volatile(const Operator *op) { return op->RegAttrB(RegNoCache) || op->RegAt
 
 /// The request flags that change a result, with the proxy scale.
 uint32_t Traits(uint32_t flags, const RenderTask *task) {
-    uint32_t t = flags & (ReqFlagPreCalc | ReqFlagProxy | ReqFlagQuick | ReqFlagNoGPU);
+    uint32_t t = flags & (ReqFlagPreCalc | ReqFlagProxy | ReqFlagQuick | ReqFlagNoGPU | ReqFlagMotionSample);
     // Device results may differ from the rows in the last bits: kept apart.
     if (task && task->Device()) t |= 1u << 30;
+    // A pass-through look hands inputs on where tools allow it: kept apart too.
+    if (task && task->passThrough) t |= 1u << 29;
     if ((flags & ReqFlagProxy) && task) t |= static_cast<uint32_t>(std::min(task->proxyScale, 255)) << 16;
     return t;
 }
@@ -62,6 +66,41 @@ Ref<Parameter> CoverFrame(const Ref<Parameter> &value, bool precalc) {
     return full;
 }
 
+/// The domain of definition a pre-calculated value gives: an image's data
+/// window (with its frame for tools that need whole frames), or the output
+/// window of a pending transform, with the frame it renders into.
+std::optional<ImageDomain> DomainOfShape(const Parameter *shape, bool wholeFrames) {
+    if (const auto *img = dynamic_cast<const Image *>(shape))
+        return DomainOfImage(*img, wholeFrames ? img->DataWindow() | img->Frame() : img->DataWindow());
+    if (const auto *tm = dynamic_cast<const TransformMatrix *>(shape)) {
+        ImageDomain d(tm->OutputDataWindow());
+        d.frame = ImgRectI(0, 0, tm->Width(), tm->Height());
+        d.xScale = tm->XScale(), d.yScale = tm->YScale();
+        if (wholeFrames) d.rect |= d.frame;
+        return d;
+    }
+    return std::nullopt;
+}
+
+/// Whether an input takes a pending transform as it is (it declares
+/// LinkSecondDataType TransformMatrix); every other input receives pixels.
+bool TakesTransforms(const Input *in) {
+    for (const TagItem *item : in->Tags().FindAll(LinkSecondDataType))
+        if (item->AsID() == CLSID_DataType_TransformMatrix) return true;
+    return false;
+}
+
+/// The pixels of a pending transform, over `roi` when given (the whole
+/// output domain, endless sides cut to the frame, otherwise); other values
+/// unchanged. Null when the resampling was aborted or ran out of memory.
+Ref<Parameter> PixelsOf(Ref<Parameter> value, const std::optional<ImageDomain> &roi, const Request *req) {
+    auto *tm = dynamic_cast<TransformMatrix *>(value.Get());
+    if (!tm) return value;
+    TagList tags{{WorkRequest, static_cast<const void *>(req)}};
+    if (roi) tags.Set({ImgDataWindow, &roi->rect});
+    return tm->ApplyTransformTagList(tags);
+}
+
 } // namespace
 
 std::optional<uint64_t> StateHash(const Output *out, double time) {
@@ -87,7 +126,12 @@ bool InMainMemory(const Parameter *value, const Operator *consumer, double time)
 
 } // namespace
 
-Ref<Parameter> EvaluateOnDevice(Output *out, double time, const EvalOptions &options) {
+namespace {
+
+/// The walk of one request. A pending transform comes back as it is: inputs
+/// that do not take transforms get its pixels here, outside callers in
+/// EvaluateOnDevice.
+Ref<Parameter> EvaluateValue(Output *out, double time, const EvalOptions &options) {
     if (!out || !out->Owner()) return nullptr;
     Operator *op = out->Owner();
     RenderTask *task = options.task;
@@ -105,15 +149,21 @@ Ref<Parameter> EvaluateOnDevice(Output *out, double time, const EvalOptions &opt
     if (state)
         if (Ref<Parameter> hit = cache->Find(key, opt.roi)) return hit;
 
+    // Motion blur: the output averaged over the shutter's sample times.
+    if (std::optional<Ref<Parameter>> blurred = MotionBlurOf(out, time, opt)) {
+        if (*blurred && state) cache->Store(key, opt.roi, *blurred);
+        return *blurred;
+    }
+
     // The output's domain of definition comes from the pre-calculation pass.
     std::optional<ImageDomain> ownDoD;
     if (!precalc && IsImageDataType(out->DataType())) {
         EvalOptions pre = opt;
         pre.flags |= ReqFlagPreCalc;
         pre.roi.reset();
-        Ref<Parameter> shape = EvaluateOnDevice(out, time, pre);
+        Ref<Parameter> shape = EvaluateValue(out, time, pre);
         if (!shape) return nullptr;
-        if (auto *img = dynamic_cast<Image *>(shape.Get())) ownDoD = ImageDomain(img->DataWindow());
+        ownDoD = DomainOfShape(shape.Get(), false);
     }
 
     std::lock_guard<std::recursive_mutex> lock(op->RequestLock());
@@ -145,10 +195,9 @@ Ref<Parameter> EvaluateOnDevice(Output *out, double time, const EvalOptions &opt
             EvalOptions pre = opt;
             pre.flags |= ReqFlagPreCalc;
             pre.roi.reset();
-            Ref<Parameter> shape = EvaluateOnDevice(in->Link(), slot.time, pre);
+            Ref<Parameter> shape = EvaluateValue(in->Link(), slot.time, pre);
             if (!shape) return nullptr; // the upstream tool failed (its line is written) or the render was aborted
-            if (auto *img = dynamic_cast<Image *>(shape.Get()))
-                slot.dod = ImageDomain(wholeFrames ? img->DataWindow() | img->Frame() : img->DataWindow());
+            if (std::optional<ImageDomain> dod = DomainOfShape(shape.Get(), wholeFrames)) slot.dod = dod;
             shapes[in->Index()] = std::move(shape);
             shapeTimes[in->Index()] = slot.time;
         }
@@ -168,7 +217,16 @@ Ref<Parameter> EvaluateOnDevice(Output *out, double time, const EvalOptions &opt
                 if (slot.flags & InputFlagPreCalc) up.flags |= ReqFlagPreCalc;
                 const bool reuse =
                     (up.flags & ReqFlagPreCalc) && shapes[in->Index()] && shapeTimes[in->Index()] == slot.time;
-                slot.data = reuse ? shapes[in->Index()] : EvaluateOnDevice(in->Link(), slot.time, up);
+                slot.data = reuse ? shapes[in->Index()] : EvaluateValue(in->Link(), slot.time, up);
+                if (slot.data && !TakesTransforms(in)) {
+                    // A pending transform becomes pixels here, over the region asked of the input.
+                    slot.data = PixelsOf(std::move(slot.data), up.roi, &req);
+                    if (!slot.data && !aborted()) {
+                        if (OrvaneDoc *doc = op->GetDoc())
+                            doc->PrintF(ConsoleError, "%s: out of memory (time = %f)\n", op->Name().c_str(), time);
+                        return nullptr;
+                    }
+                }
                 if (!slot.data) {
                     return nullptr; // a linked tool failed or the render was aborted: stop here, optional or not
                 } else if (!keepsDeviceImages && !InMainMemory(slot.data.Get(), op, time)) {
@@ -220,6 +278,20 @@ Ref<Parameter> EvaluateOnDevice(Output *out, double time, const EvalOptions &opt
         return nullptr;
     }
     if (state && !timeShifted) cache->Store(key, opt.roi, result);
+    return result;
+}
+
+} // namespace
+
+Ref<Parameter> EvaluateOnDevice(Output *out, double time, const EvalOptions &options) {
+    Ref<Parameter> result = EvaluateValue(out, time, options);
+    // Whoever asked from outside the flow gets pixels.
+    if (!result || !dynamic_cast<TransformMatrix *>(result.Get())) return result;
+    const bool wholeFrame = (options.flags & ReqFlagPreCalc) || !out->Owner()->RegAttrB(RegSupportsRoI);
+    result = PixelsOf(std::move(result), wholeFrame ? std::nullopt : options.roi, nullptr);
+    if (!result && !(options.task && options.task->IsAborted()))
+        if (OrvaneDoc *doc = out->Owner()->GetDoc())
+            doc->PrintF(ConsoleError, "%s: out of memory (time = %f)\n", out->Owner()->Name().c_str(), time);
     return result;
 }
 

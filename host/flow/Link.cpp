@@ -46,6 +46,7 @@ Ref<Parameter> DefaultValueFor(OvID dataType, const TagList &tags) {
     }
     if (dataType == CLSID_DataType_Gradient) return MakeRef<Gradient>();
     if (dataType == CLSID_DataType_Clip) return MakeRef<Clip>(tags.GetText(InputDefaultText, ""));
+    if (dataType == CLSID_DataType_ScriptVal) return MakeRef<ScriptValue>();
     return nullptr;
 }
 
@@ -64,6 +65,7 @@ Ref<Parameter> ParameterFromScript(OvID dataType, const ScriptVal &v) {
     if (dataType == CLSID_DataType_OvID) return v.IsText() ? MakeRef<IDValue>(OvID(v.AsText())) : nullptr;
     if (dataType == CLSID_DataType_Gradient) return Gradient::FromScript(v);
     if (dataType == CLSID_DataType_Clip) return v.IsText() ? MakeRef<Clip>(v.AsText()) : nullptr;
+    if (dataType == CLSID_DataType_ScriptVal) return MakeRef<ScriptValue>(v);
     return nullptr;
 }
 

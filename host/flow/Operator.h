@@ -143,6 +143,9 @@ public:
         Input *blend = nullptr;
         Input *process[4] = {nullptr, nullptr, nullptr, nullptr};
         Input *effectMask = nullptr, *maskChannel = nullptr, *maskInvert = nullptr, *multiplyByMask = nullptr;
+        /// Motion blur (MotionBlur.h): tools with an image output.
+        Input *motionBlur = nullptr, *motionQuality = nullptr, *shutterAngle = nullptr, *centerBias = nullptr,
+              *sampleSpread = nullptr;
     };
     const CommonInputs &Common() const { return common_; }
     /// The clipping mode of this request: the tool's own ClippingMode input,

@@ -133,6 +133,12 @@ public:
     /// The result cache shared by this document's renders.
     ResultCache &Cache() { return *cache_; }
 
+    /// A write-protected document keeps its values as they are: tools that
+    /// would write their own controls while rendering (a height kept in
+    /// aspect, centred offsets) leave them alone.
+    bool IsWriteProtected() const { return writeProtected_; }
+    void SetWriteProtected(bool on) { writeProtected_ = on; }
+
 private:
     double prefs_[PREF_Count];
     mutable std::mutex consoleLock_;
@@ -141,6 +147,7 @@ private:
     double globalStart_ = 0, globalEnd_ = 100, renderStart_ = 0, renderEnd_ = 100;
     std::map<std::string, Ref<Operator>> tools_;
     std::unique_ptr<ResultCache> cache_;
+    bool writeProtected_ = false;
     std::string filePath_;
     ScriptVal keptTools_ = ScriptVal::Table(), keptFields_ = ScriptVal::Table(), keptPrefs_ = ScriptVal::Table();
 };

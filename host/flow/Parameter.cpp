@@ -72,4 +72,15 @@ bool IDValue::Equals(const Parameter &other) const {
 uint64_t IDValue::Hash() const { return HashBytes(value.Text(), std::strlen(value.Text())); }
 Ref<Parameter> IDValue::Copy() const { return MakeRef<IDValue>(value); }
 
+OvID ScriptValue::DataType() const { return CLSID_DataType_ScriptVal; }
+bool ScriptValue::Equals(const Parameter &other) const {
+    auto *o = dynamic_cast<const ScriptValue *>(&other);
+    return o && o->value == value;
+}
+uint64_t ScriptValue::Hash() const {
+    const std::string text = value.ToText();
+    return HashBytes(text.data(), text.size());
+}
+Ref<Parameter> ScriptValue::Copy() const { return MakeRef<ScriptValue>(value); }
+
 } // namespace Orvane

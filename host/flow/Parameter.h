@@ -88,6 +88,21 @@ public:
     size_t SizeOf() const override { return sizeof(*this); }
 };
 
+/// A value that is a script value, usually a table: list controls whose
+/// value is a table of entries (a layer order), saved as it stands.
+class ORVANE_API ScriptValue : public Parameter {
+public:
+    explicit ScriptValue(ScriptVal v = ScriptVal::Table()) : value(std::move(v)) {}
+    ScriptVal value;
+
+    OvID DataType() const override;
+    ScriptVal ToScript() const override { return value; }
+    bool Equals(const Parameter &other) const override;
+    uint64_t Hash() const override;
+    Ref<Parameter> Copy() const override;
+    size_t SizeOf() const override { return sizeof(*this); }
+};
+
 /// Mixes a value into a running 64-bit hash.
 inline uint64_t HashMix(uint64_t h, uint64_t v) {
     h ^= v + 0x9e3779b97f4a7c15ull + (h << 6) + (h >> 2);

@@ -60,6 +60,9 @@ public:
     int proxyScale = 1;
     bool interactive = false;
     bool boundsOnly = false;
+    /// A look at the unprocessed picture: tools that can hand their main
+    /// input on unchanged (Crop) do so.
+    bool passThrough = false;
     /// First frame of the render's range (-2e9: not a range render). Savers
     /// number their files from it when asked to.
     double startTime = -2e9;

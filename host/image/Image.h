@@ -203,12 +203,64 @@ public:
     /// the pixel aspect (XScale:YScale) follows unequal factors; rows in parallel. `req` may be null (used for abort).
     /// Null on abort, out of memory, or a factor below 1.
     Ref<Image> ScaleOfImage(Request *req, double xFactor, double yFactor) const;
-    /// Fills `dest` (its size and data window say the target) from this image scaled by
-    /// dest.Width()/Width() and dest.Height()/Height(), with the filter of the tag
-    /// ResizeFilter: 0 nearest, 1 box (area average), 2 bilinear, 3 bicubic (Catmull-Rom),
-    /// widened to average the covered area when shrinking (Resample.h).
-    /// Tags: ResizeFilter; WorkRequest (Request *) for abort. Returns false on abort.
-    bool ResizeTagList(Image *dest, const TagList &tags) const;
+    // ---- resampling (ImageResize.cpp, ImageCrop.cpp; docs/RESAMPLING.md) ----
+    /// The resize request (Tags.h): ResizeFilter (RszTypes; default linear),
+    /// ResizeWindow (sinc and Bessel), ResizeXScale/YScale (output pixels per
+    /// source pixel; default dest.Width()/Width(), dest.Height()/Height()),
+    /// ResizeXOffset/YOffset (output pixels; default 0), ResizeXEdges/YEdges
+    /// (EdgeMode beyond the source window; default Duplicate),
+    /// ResizeSourceWindow (const ImgRectI *: where the source may be read;
+    /// default the data window joined with the frame), and the work tags.
+    /// Output pixel o's centre o + 0.5 lies at source position
+    /// (o + 0.5 - offset) / scale on each axis.
+    /// Computes the per-axis coefficient tables for filling `dest`'s data
+    /// window; `xTable`/`yTable` receive them (free with ResizePostCalc).
+    /// False (and null tables) for an impossible request.
+    bool ResizePreCalcTagList(Image *dest, void *&xTable, void *&yTable, const TagList &tags) const;
+    /// Frees tables of ResizePreCalcTagList and nulls the pointers.
+    static void ResizePostCalc(void *&xTable, void *&yTable);
+    /// Fills `dest`'s data window from this image under the resize request
+    /// (dest's canvas becomes this image's). Tables from ResizePreCalcTagList
+    /// are used when they were made for the same request and cover dest's
+    /// data window; other (or null) tables are ignored and the call builds
+    /// its own. WorkUseGPU with a request whose render has a device runs it
+    /// there (rows on failure). False on abort, an impossible request, or
+    /// when memory ran out.
+    bool ResizeTagList(Image *dest, void *xTable, void *yTable, const TagList &tags) const;
+    bool ResizeTagList(Image *dest, const TagList &tags) const { return ResizeTagList(dest, nullptr, nullptr, tags); }
+    /// The radius of a resize filter in source pixels at scale 1.
+    static double GetResizeFilterSupport(int rszType);
+    /// Copies this image into `dest`: dest pixel (i, j) is this image's
+    /// (x + i * xStep, y + j * yStep), so with steps of 1 the picture moves by
+    /// (-x, -y); outside this image's data window the canvas colour, which
+    /// dest takes over. Converts depth. Tags: WorkRequest (abort),
+    /// WorkThreaded. False on abort, steps below 1 or out of memory.
+    bool ImageCrop(Image *dest, int x, int y, const TagList &tags, int xStep = 1, int yStep = 1) const;
+    /// The colour at a position in 1/65536 pixel: x = (i << 16) + 32768 is
+    /// the centre of pixel column i (so (i << 16) is its left edge), and the
+    /// same for y and rows (counted from the bottom). Bilinear between the
+    /// four pixels around the position, exact at centres; the canvas colour
+    /// outside the data window. Into 8-bit (B), 16-bit (W) or float (D) RGBA
+    /// (integers round to nearest and clamp). Slow path per call; tools use
+    /// it for a few samples.
+    void SamplePixelB(int32_t x, int32_t y, uint8_t out[4]) const;
+    void SamplePixelW(int32_t x, int32_t y, uint16_t out[4]) const;
+    void SamplePixelD(int32_t x, int32_t y, FltPixel &out) const;
+
+    // ---- blur (ImageBlur.cpp; sizes and kernels in docs/BLUR.md) ----
+    /// Blurs this image into `dest` (may be this image: in place) under the
+    /// blur request (Tags.h: BlurFilterType, BlurDo*, BlurXSize/YSize
+    /// normalised as control value / 720, BlurBlend, BlurScale, Blur*Scale,
+    /// BlurPasses, BlurSourceWindow, work tags). Fills dest's data window.
+    /// False on abort or when memory ran out.
+    bool BlurTagList(Image *dest, const TagList &tags);
+    /// The same into a new image like this one.
+    Ref<Image> BlurOfImageTagList(const TagList &tags);
+    /// Replaces normalised sizes x, y by the blur's reach in pixels for an
+    /// image of `domain`'s frame (static) or this image; false when the
+    /// filter's reach is unbounded (recursive Gaussians).
+    static bool GetBlurSupport(int blurType, const ImageDomain *domain, double &x, double &y, int passes);
+    bool GetBlurSupport(int blurType, double &x, double &y, int passes) const;
     /// A copy cut to (or grown to) the data window given by ImgDataWindow (const ImgRectI *)
     /// and valid window ImgValidWindow; outside this image's data window the canvas colour.
     /// Other tags as NewImageTagList.
@@ -250,6 +302,15 @@ private:
     Ref<GPUMemory> gpuMem_;
     bool gpuDirty_ = false;
 };
+
+/// A domain of `rect` carrying `img`'s frame and pixel aspect.
+inline ImageDomain DomainOfImage(const Image &img, const ImgRectI &rect) {
+    ImageDomain d(rect);
+    d.frame = img.Frame();
+    d.xScale = img.XScale();
+    d.yScale = img.YScale();
+    return d;
+}
 
 /// A new image with the same format, windows, canvas, attributes and pixels.
 ORVANE_API Ref<Image> CopyOfImage(const Image *src);

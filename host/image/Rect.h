@@ -63,6 +63,11 @@ constexpr bool IsEndlessSide(int v) { return v <= -DomainEndless || v >= DomainE
 
 struct ORVANE_API ImageDomain {
     ImgRectI rect;
+    /// The frame of the image the domain belongs to, and its pixel aspect,
+    /// when known (a null frame: unknown). Tools that turn relative sizes
+    /// into pixels before the image exists read them here.
+    ImgRectI frame;
+    double xScale = 1.0, yScale = 1.0;
 
     constexpr ImageDomain() = default;
     constexpr explicit ImageDomain(const ImgRectI &r) : rect(r) {}
@@ -72,12 +77,22 @@ struct ORVANE_API ImageDomain {
 
     constexpr bool IsNull() const { return rect.IsNull(); }
     constexpr void SetNull() { rect.SetNull(); }
-    constexpr ImageDomain operator&(const ImageDomain &o) const { return ImageDomain(rect & o.rect); }
+    /// Combining keeps this domain's frame and aspect.
+    constexpr ImageDomain operator&(const ImageDomain &o) const { return WithRect(rect & o.rect); }
     constexpr ImageDomain &operator&=(const ImageDomain &o) {
         rect &= o.rect;
         return *this;
     }
-    constexpr ImageDomain operator|(const ImageDomain &o) const { return ImageDomain(rect | o.rect); }
+    constexpr ImageDomain operator|(const ImageDomain &o) const { return WithRect(rect | o.rect); }
+    constexpr ImageDomain WithRect(const ImgRectI &r) const {
+        ImageDomain d = *this;
+        d.rect = r;
+        return d;
+    }
+    /// The frame's size, and whether it is known.
+    constexpr bool HasFrame() const { return !frame.IsNull(); }
+    constexpr int FrameWidth() const { return frame.Width(); }
+    constexpr int FrameHeight() const { return frame.Height(); }
     constexpr void ClipTo(const ImgRectI &r) { rect &= r; }
     void Scale(double sx, double sy) { rect.Scale(sx, sy); }
     void Offset(int dx, int dy) { rect.Offset(dx, dy); }

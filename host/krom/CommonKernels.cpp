@@ -1,8 +1,11 @@
 #include "host/krom/CommonKernels.h"
 
+#include "host/krom/kernels/BlurKernelParams.h"
 #include "host/krom/kernels/ColorKernelParams.h"
 #include "host/krom/kernels/GeneratorKernelParams.h"
 #include "host/krom/kernels/KernelTexts.h"
+#include "host/krom/kernels/MergeKernelParams.h"
+#include "host/krom/kernels/ResizeKernelParams.h"
 
 namespace Orvane {
 
@@ -13,6 +16,11 @@ const std::vector<CommonKernel> &CommonKernels() {
         {"ColorMatrix", ColorMatrixParamsText, kColorMatrixKernel},
         {"Background", BackgroundParamsText, kBackgroundKernel},
         {"BackgroundGrad", BackgroundGradParamsText, kBackgroundGradKernel},
+        {"BlurRows", BlurRowsParamsText, kBlurRowsKernel},
+        {"BlurColumns", BlurColumnsParamsText, kBlurColumnsKernel},
+        {"Merge", MergeParamsText, kMergeKernel},
+        {"ResizeAcross", ResizeParamsText, kResizeKernels},
+        {"ResizeDown", ResizeParamsText, kResizeKernels},
     };
     return kernels;
 }

@@ -18,6 +18,7 @@
 #include "host/image/Half.h"
 #include "host/image/Image.h"
 #include "host/image/NewImage.h"
+#include "host/image/ResizeFilters.h"
 #include "host/media/ImageFormatList.h"
 #include "operators/frame/IdChoices.h"
 #include "operators/frame/Registration.h"
@@ -702,7 +703,7 @@ Ref<Image> Loader::FitFieldAndProxy(Request *req, Ref<Image> image, const Settin
         if (out && !req->IsPreCalc()) {
             const bool fast = (req->GetFlags() & ReqFlagQuick) && GetApp()->GetAttrB(AppFastScale);
             if (!out->AllocScanLineData() ||
-                !image->ResizeTagList(out.Get(), {{ResizeFilter, fast ? 1 : 3}, {WorkRequest, req}}))
+                !image->ResizeTagList(out.Get(), {{ResizeFilter, fast ? RszBox : RszCatmullRom}, {WorkRequest, req}}))
                 out.Reset();
         }
     }

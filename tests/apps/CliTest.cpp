@@ -102,9 +102,9 @@ TEST(CliTools, BadArgumentsExitWithUsageCode) {
 }
 
 TEST(CliDescribe, ShowsIdentityInputsAndState) {
-    const CliRun blur = Orvane("describe Blur");
+    const CliRun blur = Orvane("describe Glow");
     EXPECT_EQ(blur.exitCode, 0) << blur.err;
-    EXPECT_TRUE(Contains(blur.out, "path:          Tools/Blur/Blur")) << blur.out;
+    EXPECT_TRUE(Contains(blur.out, "path:          Tools/Effect/Glow")) << blur.out;
     EXPECT_TRUE(Contains(blur.out, "built:         not yet")) << blur.out;
     EXPECT_TRUE(Contains(blur.out, "EffectMask")) << blur.out;
     // An old class ID names the class that replaced it.
@@ -157,12 +157,12 @@ TEST(CliEval, UnknownClassIsKeptWithAWarningAndFailsOnlyWhenAsked) {
 
 TEST(CliEval, AToolThatIsNotBuiltFailsWithExitThree) {
     TempDir dir;
-    const auto flow = dir.File("planned.flow", "Orvane.Document { Tools = { Blur1 = Blur {} } }");
-    const CliRun r = Orvane("eval " + Quote(flow.string()) + " Blur1 --json");
+    const auto flow = dir.File("planned.flow", "Orvane.Document { Tools = { Glow1 = Glow {} } }");
+    const CliRun r = Orvane("eval " + Quote(flow.string()) + " Glow1 --json");
     EXPECT_EQ(r.exitCode, 3);
     EXPECT_TRUE(Contains(r.out, "\"ok\": false")) << r.out;
-    EXPECT_TRUE(Contains(r.out, "Blur1: the Blur tool is not available yet")) << r.out;
-    EXPECT_TRUE(Contains(r.err, "ERROR: Blur1: the Blur tool is not available yet")) << r.err;
+    EXPECT_TRUE(Contains(r.out, "Glow1: the Glow tool is not available yet")) << r.out;
+    EXPECT_TRUE(Contains(r.err, "ERROR: Glow1: the Glow tool is not available yet")) << r.err;
 }
 
 } // namespace

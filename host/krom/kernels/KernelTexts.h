@@ -9,4 +9,12 @@ extern const char kColorMatrixKernel[];
 extern const char kBackgroundKernel[];
 /// "BackgroundGrad".
 extern const char kBackgroundGradKernel[];
+/// "BlurRows".
+extern const char kBlurRowsKernel[];
+/// "BlurColumns".
+extern const char kBlurColumnsKernel[];
+/// "Merge".
+extern const char kMergeKernel[];
+/// "ResizeAcross" and "ResizeDown".
+extern const char kResizeKernels[];
 } // namespace Orvane

@@ -508,7 +508,7 @@ TEST(DocumentIO, APlannedToolKeepsItsSettingsWithOneWarning) {
     ts::LoadOperators();
     const std::string text = R"(Orvane.Document {
 	Tools = {
-		Blur1 = Blur {
+		Glow1 = Glow {
 			Inputs = {
 				Input = Src1.Output,
 				XBlurSize = 4.5,
@@ -525,16 +525,16 @@ TEST(DocumentIO, APlannedToolKeepsItsSettingsWithOneWarning) {
     const DocumentLoadResult r = Load(text, *doc);
     ASSERT_TRUE(r.ok) << r.error;
     ASSERT_EQ(r.warnings.size(), 1u) << Joined(r.warnings);
-    EXPECT_NE(r.warnings[0].find("Blur1"), std::string::npos) << r.warnings[0];
+    EXPECT_NE(r.warnings[0].find("Glow1"), std::string::npos) << r.warnings[0];
     EXPECT_NE(r.warnings[0].find("not available"), std::string::npos) << r.warnings[0];
-    Operator *blur = doc->FindTool("Blur1");
+    Operator *blur = doc->FindTool("Glow1");
     ASSERT_NE(blur, nullptr);
     EXPECT_TRUE(blur->IsPlaceholder());
 
     const std::string saved = SaveDocument(*doc);
     const ScriptVal source = ScriptVal::FromText(text);
-    const ScriptVal *was = source.Find("Tools")->Find("Blur1")->Find("Inputs");
-    const ScriptVal blurNow = ToolIn(saved, "Blur1");
+    const ScriptVal *was = source.Find("Tools")->Find("Glow1")->Find("Inputs");
+    const ScriptVal blurNow = ToolIn(saved, "Glow1");
     const ScriptVal now = Get(&blurNow, "Inputs");
     ASSERT_TRUE(now.IsTable()) << saved;
     EXPECT_EQ(now.Size(), was->Size()) << saved;

@@ -80,8 +80,8 @@ const Names kMaskRows = {"BitmapMask", "EllipseMask",   "MultiPolyMask", "BSplin
 
 TEST(ClassTable, RowsAreCompleteAndUnique) {
     const auto &rows = PlannedClasses();
-    // 201 classes less the two built beside their code.
-    EXPECT_EQ(rows.size(), 199u);
+    // 201 classes less those built beside their code.
+    EXPECT_EQ(rows.size(), 187u);
     EXPECT_EQ(FindRow("BrightnessContrast"), nullptr);
     EXPECT_EQ(FindRow("Background"), nullptr);
 
@@ -108,9 +108,9 @@ TEST(ClassTable, KindCounts) {
     std::map<uint32_t, int> counts;
     for (const ClassDesc &row : PlannedClasses()) ++counts[row.kind];
     const std::map<uint32_t, int> expected = {
-        {3, 92},                                                        // tools, less BrightnessContrast
-        {131, 4},     {259, 2},    {2307, 1},    {4655363, 1}, {11, 6}, // sources, less Background
-        {19, 5},      {35, 10},    {5, 32},      {1, 2},       {0, 3},       {5636099, 9}, {5636355, 1},
+        {3, 86},               // tools, less those built
+        {131, 3},     {11, 6}, // sources, less Background
+        {19, 5},      {35, 10},    {5, 32},      {1, 2},       {0, 2},       {5636099, 9}, {5636355, 1},
         {5636107, 6}, {983040, 8}, {1507328, 7}, {1572864, 7}, {1769472, 1}, {1024, 2},
     };
     EXPECT_EQ(counts, expected);
@@ -172,13 +172,12 @@ TEST(ClassTable, FormatsAndTransitionsAreNotOfferedAsTools) {
 }
 
 TEST(ClassTable, TellingRowsAndSpellings) {
-    const ClassDesc *merge = FindRow("Merge");
-    ASSERT_NE(merge, nullptr);
-    EXPECT_EQ(merge->kind, 131u);
-    EXPECT_STREQ(merge->path, "Tools/Composite/Merge");
-    EXPECT_STREQ(merge->abbreviation, "Mrg");
-    EXPECT_EQ(Split(merge->aliases), std::vector<std::string>{"ZMerge"});
-    EXPECT_EQ(merge->attrs.GetLong(RegSortOrder), 1);
+    const ClassDesc *booleans = FindRow("ChannelBoolean");
+    ASSERT_NE(booleans, nullptr);
+    EXPECT_EQ(booleans->kind, 131u);
+    EXPECT_STREQ(booleans->path, "Tools/Composite/ChannelBoolean");
+    EXPECT_STREQ(booleans->abbreviation, "Bol");
+    EXPECT_EQ(Split(booleans->aliases), std::vector<std::string>{"shuffle"});
 
     const ClassDesc *saver = FindRow("Saver");
     ASSERT_NE(saver, nullptr);
@@ -200,8 +199,6 @@ TEST(ClassTable, TellingRowsAndSpellings) {
     EXPECT_EQ(xyPath->help, nullptr);
 
     EXPECT_STREQ(FindRow("ChangeDepth")->help, "Changed the processing color precision");
-    EXPECT_STREQ(FindRow("Switch")->help, "Switchs between multiple image inputs");
-    EXPECT_STREQ(FindRow("Switch")->base, "SwitchBase");
     EXPECT_STREQ(FindRow("CleanPLate")->classWord, "CleanPlate");
 }
 
@@ -220,7 +217,6 @@ TEST(ClassTable, OldIdsAndAliasesReachTheirClasses) {
     EXPECT_EQ(byOldId["Brazel.RealFastNoiseBrazel"], "FastNoise");
     EXPECT_EQ(byAlias["dither"], "ChangeDepth");
     EXPECT_EQ(byAlias["shuffle"], "ChannelBoolean");
-    EXPECT_EQ(byAlias["ZMerge"], "Merge");
     EXPECT_EQ(byAlias["Read"], "Loader");
     EXPECT_EQ(byAlias["Stabilize"], "Tracker");
     // Every polygon mask is found as "Roto".
@@ -255,19 +251,27 @@ TEST(ClassTable, BasesResolve) {
             EXPECT_NE(base, &row);
         }
     }
-    // Whole-table counts less the two built rows (a ThreadedOperator and a
-    // SourceOperator).
+    // Whole-table counts less the built rows.
     const std::map<std::string, int> expected = {
-        {"ThreadedOperator", 138}, {"ShapeOperator", 14}, {"MaskOperator", 9}, {"ZQImageTransition", 8},
-        {"SourceOperator", 6},     {"Parameter", 7},      {"ImageFormat", 7},  {"SubInputs", 1},
-        {"PreviewControl", 1},     {"SwitchBase", 3},     {"sPolygon", 1},     {"PolylineMask", 1},
-        {"PolyMaskInputs", 1},     {"Saver", 1},
+        {"ThreadedOperator", 129},
+        {"ShapeOperator", 14},
+        {"MaskOperator", 9},
+        {"ZQImageTransition", 8},
+        {"SourceOperator", 6},
+        {"Parameter", 7},
+        {"ImageFormat", 7},
+        {"SubInputs", 1},
+        {"PreviewControl", 1},
+        {"sPolygon", 1},
+        {"PolylineMask", 1},
+        {"PolyMaskInputs", 1},
+        {"Saver", 1},
     };
     EXPECT_EQ(counts, expected);
 }
 
 TEST(ClassTable, OnlyAbstractRowsLackAConstructor) {
-    const Names abstract = {"_TimeSpeed", "SwitchBase", "_TimeStretcher", "VolumeFogLighting"};
+    const Names abstract = {"_TimeSpeed", "_TimeStretcher", "VolumeFogLighting"};
     EXPECT_EQ(RowsWhere([](const ClassDesc &row) { return !row.creatable; }), abstract);
     EXPECT_EQ(RowsWhere([](const ClassDesc &row) { return row.kind == 0; }), Without(abstract, {"VolumeFogLighting"}));
 
@@ -285,11 +289,11 @@ TEST(ClassTable, OnlyAbstractRowsLackAConstructor) {
 TEST(ClassTable, CommonControlSwitches) {
     const Names noEffectMask = RowsWith(RegNoEffectMask), noObject = RowsWith(RegNoObjectMaterialControls),
                 noBlend = RowsWith(RegNoBlendControls), noMotionBlur = RowsWith(RegNoMotionBlurControls);
-    EXPECT_EQ(noEffectMask.size(), 20u);
-    EXPECT_EQ(noObject.size(), 38u);
-    EXPECT_EQ(noBlend.size(), 37u);
-    // 99 in the whole table: BrightnessContrast carries it, Background not.
-    EXPECT_EQ(noMotionBlur.size() + 1, 99u);
+    EXPECT_EQ(noEffectMask.size(), 13u);
+    EXPECT_EQ(noObject.size(), 31u);
+    EXPECT_EQ(noBlend.size(), 30u);
+    // 99 in the whole table, the built rows included (Background lacks it).
+    EXPECT_EQ(noMotionBlur.size() + 9, 99u);
 
     // No object controls: every no-effect-mask row, every shape tool, and two more.
     Names expectedNoObject = noEffectMask;
@@ -298,7 +302,7 @@ TEST(ClassTable, CommonControlSwitches) {
     EXPECT_EQ(noObject, expectedNoObject);
     // No blend: every shape tool but the rasteriser.
     for (const std::string &id : kShapeRows) EXPECT_EQ(noBlend.count(id), id != "sRender" ? 1u : 0u) << id;
-    for (const char *id : {"Switch", "Saver", "PreviewSaver", "MediaOut"}) EXPECT_TRUE(noBlend.count(id)) << id;
+    for (const char *id : {"Saver", "PreviewSaver", "MediaOut"}) EXPECT_TRUE(noBlend.count(id)) << id;
     EXPECT_TRUE(noEffectMask.count("LensDistort"));
     EXPECT_FALSE(noBlend.count("LensDistort"));
 
@@ -307,31 +311,29 @@ TEST(ClassTable, CommonControlSwitches) {
     const Names tools = RowsWhere([](const ClassDesc &row) { return OffersTool(row.kind); });
     for (const std::string &id : noMotionBlur) EXPECT_TRUE(tools.count(id) || id == "TrackerModifier") << id;
     for (const std::string &id : kMaskRows) EXPECT_FALSE(noMotionBlur.count(id)) << id;
-    for (const char *id : {"Merge", "Transform", "DVE", "Tracker", "FastNoise"})
+    for (const char *id : {"Dissolve", "Transform", "DVE", "Tracker", "FastNoise"})
         EXPECT_FALSE(noMotionBlur.count(id)) << id;
-    for (const char *id : {"Blur", "Saver", "Switch"}) EXPECT_TRUE(noMotionBlur.count(id)) << id;
+    for (const char *id : {"Glow", "Saver"}) EXPECT_TRUE(noMotionBlur.count(id)) << id;
     EXPECT_TRUE(noMotionBlur.count("TrackerModifier"));
 }
 
 TEST(ClassTable, ImageCapabilities) {
     const Names imageTools = RowsWhere(IsImageTool);
-    // Whole-table totals: both built rows are image tools carrying RoI, DoD and device images.
-    EXPECT_EQ(imageTools.size() + 2, 124u);
+    // Whole-table totals, the built rows included.
+    EXPECT_EQ(imageTools.size() + 13, 124u);
     const Names roi = RowsWith(RegSupportsRoI), dod = RowsWith(RegSupportsDoD), gpu = RowsWith(RegSupportsGPUImages);
-    EXPECT_EQ(roi.size() + 2, 98u);
-    EXPECT_EQ(dod.size() + 2, 101u);
-    EXPECT_EQ(gpu.size() + 2, 83u);
+    EXPECT_EQ(roi.size() + 13, 98u);
+    EXPECT_EQ(dod.size() + 12, 101u);
+    EXPECT_EQ(gpu.size() + 11, 83u);
     for (const Names *set : {&roi, &dod, &gpu})
         for (const std::string &id : *set) EXPECT_TRUE(imageTools.count(id)) << id;
     for (const char *id : {"DepthBlur", "Displace", "Shader", "WandMask", "MediaOut", "Primatte4"})
         EXPECT_FALSE(roi.count(id)) << id;
-    for (const char *id : {"Merge", "Transform"}) EXPECT_TRUE(roi.count(id)) << id;
+    EXPECT_TRUE(roi.count("DVE"));
     // Tools that read anywhere in their input, and the generators, do not
     // take a partial domain.
     for (const char *id : {"Dent", "Displace", "Distort", "Drip", "Vortex", "DaySky", "FastNoise", "Mandel", "Plasma"})
         EXPECT_FALSE(dod.count(id)) << id;
-    EXPECT_FALSE(gpu.count("Switch3D"));
-    EXPECT_FALSE(gpu.count("MtlSwitch3D"));
 }
 
 TEST(ClassTable, ListedAttributes) {
@@ -341,19 +343,19 @@ TEST(ClassTable, ListedAttributes) {
         std::vector<const char *> in, out;
     };
     const std::vector<Case> cases = {
-        {RegProcessesCanvasColor, 14, {"ChannelBoolean", "CleanPLate", "WhiteBalance"}, {"Merge"}},
+        {RegProcessesCanvasColor, 14, {"ChannelBoolean", "CleanPLate", "WhiteBalance"}, {"Dissolve"}},
         {RegStereoAware, 5, {"Anaglyph", "OpenEXRFormat"}, {"Loader"}},
-        {RegHidden, 4, {"MtlSwitch3D", "Switch3D", "VolumeFogLighting", "TeapotMask"}, {"Switch"}},
+        {RegHidden, 2, {"VolumeFogLighting", "TeapotMask"}, {}},
         {RegOptionalClass, 4, {"MediaIn", "Primatte4Data"}, {"MediaOut"}},
         {RegGroupPrimatte, 3, {"Primatte4", "Primatte4Control", "Primatte4Data"}, {}},
         {RegGroupMedia, 2, {"MediaIn", "MediaOut"}, {}},
-        {RegHasOperatorControl, 14, {"DVE", "MIDI", "XYPath"}, {"Merge"}},
-        {RegNoAutoProxy, 8, {"Crop", "CustomFilter"}, {"Merge"}},
-        {RegNoCache, 10, {"HotSpot", "Saver", "sChangeStyle"}, {"Merge"}},
-        {RegUnpredictable, 11, {"LUTLookup", "Grain", "TrackerModifier"}, {"Merge"}},
-        {RegSwitchClass, 4, {"Switch", "Switch3D", "MtlSwitch3D", "KeyStretcher"}, {}},
-        {RegSwitchDataKind, 3, {"Switch", "Switch3D", "MtlSwitch3D"}, {"KeyStretcher"}},
-        {RegKeepsTimeState, 8, {"Calculation", "TessaneParameter", "VolumeFog"}, {"Merge"}},
+        {RegHasOperatorControl, 13, {"DVE", "MIDI", "XYPath"}, {"Dissolve"}},
+        {RegNoAutoProxy, 6, {"CustomFilter"}, {"Dissolve"}},
+        {RegNoCache, 10, {"HotSpot", "Saver", "sChangeStyle"}, {"Dissolve"}},
+        {RegUnpredictable, 11, {"LUTLookup", "Grain", "TrackerModifier"}, {"Dissolve"}},
+        {RegSwitchClass, 1, {"KeyStretcher"}, {}},
+        {RegSwitchDataKind, 0, {}, {"KeyStretcher"}},
+        {RegKeepsTimeState, 8, {"Calculation", "TessaneParameter", "VolumeFog"}, {"Dissolve"}},
         {RegPreviewTerminal, 2, {"PreviewCleaner", "PreviewSaver"}, {}},
         {RegClipSourceTool, 2, {"Loader", "MediaIn"}, {}},
         {RegMaskMultiPart, 1, {"MultiPolyMask"}, {}},
@@ -380,15 +382,10 @@ TEST(ClassTable, ListedAttributes) {
     }
     EXPECT_EQ(switchedOff, 1);
 
-    EXPECT_EQ(FindRow("Switch")->attrs.GetLong(RegSwitchDataKind, -1), 0);
-    EXPECT_EQ(FindRow("Switch3D")->attrs.GetLong(RegSwitchDataKind, -1), 1);
-    EXPECT_EQ(FindRow("MtlSwitch3D")->attrs.GetLong(RegSwitchDataKind, -1), 2);
-
     // Transitions in their offered order; the sort order never appears on a
-    // row of another kind except Merge and RawFormat.
+    // row of another kind except RawFormat (and Merge, built beside its code).
     const std::map<std::string, long long> order = {{"ZQTRandomNoise", 6}, {"ZQTRandom", 7},    {"ZQTErode", 8},
-                                                    {"ZQTAddDissolve", 9}, {"ZQTDissolve", 10}, {"Merge", 1},
-                                                    {"RawFormat", 1000000}};
+                                                    {"ZQTAddDissolve", 9}, {"ZQTDissolve", 10}, {"RawFormat", 1000000}};
     Names sorted;
     for (const auto &[id, value] : order) {
         sorted.insert(id);

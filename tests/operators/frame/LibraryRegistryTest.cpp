@@ -99,14 +99,14 @@ TEST_F(LibraryRegistry, BasesResolveAndDerive) {
 
 TEST_F(LibraryRegistry, APlannedToolConstructsButEveryRequestFailsWithOneLine) {
     OrvaneDoc doc;
-    Operator *blur = doc.AddTool(OvID("Blur"));
+    Operator *blur = doc.AddTool(OvID("Glow"));
     ASSERT_NE(blur, nullptr);
     EXPECT_TRUE(blur->IsPlaceholder());
     EXPECT_EQ(Evaluate(blur->FindMainOutput(), 0.0), nullptr);
     const auto lines = doc.ConsoleLines();
     ASSERT_EQ(lines.size(), 1u);
     EXPECT_EQ(lines[0].code, ConsoleError);
-    EXPECT_EQ(lines[0].text, blur->Name() + ": the Blur tool is not available yet in this version of Orvane");
+    EXPECT_EQ(lines[0].text, blur->Name() + ": the Glow tool is not available yet in this version of Orvane");
 }
 
 TEST_F(LibraryRegistry, NonToolClassesAreNotAddedToFlows) {

@@ -1,0 +1,268 @@
+// Crop: hand-cut pixels, windows by clipping mode, proxies, kept aspect and
+// centring written back (or not, when the document is write-protected),
+// pass-through, regions of interest, and the auto crop's box on flat and
+// marked images of every kind.
+#include "tests/operators/warp/WarpTestSupport.h"
+
+namespace Orvane::WarpTest::CropT {
+namespace {
+
+class CropTool : public ::testing::Test {
+protected:
+    static void SetUpTestSuite() { LoadOperators(); }
+    Operator *Make(Ref<Image> src, int x, int y, int w, int h) {
+        probe = AddProbe(doc, std::move(src));
+        Operator *crp = AddTool(doc, "Crop", probe);
+        SetNumber(crp, "XOffset", x);
+        SetNumber(crp, "YOffset", y);
+        SetNumber(crp, "XSize", w);
+        SetNumber(crp, "YSize", h);
+        return crp;
+    }
+    double Control(Operator *op, const char *id) {
+        const auto *n = dynamic_cast<const Number *>(op->FindInput(id)->Constant().Get());
+        return n ? n->value : -1.0;
+    }
+    OrvaneDoc doc;
+    ProbeSource *probe = nullptr;
+};
+
+/// Every pixel of `out` over `r` is the source's at (x + ox, y + oy), its canvas outside its window.
+void ExpectCut(const Image &out, const Image &src, int ox, int oy, const ImgRectI &r) {
+    for (int y = r.y0; y < r.y1; ++y)
+        for (int x = r.x0; x < r.x1; ++x) ASSERT_EQ(out.GetFlt(x, y), src.GetFlt(x + ox, y + oy)) << x << "," << y;
+}
+
+TEST_F(CropTool, TheCutIsTheSourcesPixelsMoved) {
+    Ref<Image> src = PatternImage(40, 30, 8, 2);
+    Operator *crp = Make(src, 7, 5, 16, 10);
+    Ref<Image> out = Render(crp);
+    ASSERT_NE(out, nullptr);
+    EXPECT_EQ(out->Width(), 16);
+    EXPECT_EQ(out->Height(), 10);
+    EXPECT_EQ(out->DataWindow(), ImgRectI(0, 0, 16, 10)); // Frame clipping by default
+    ExpectCut(*out, *src, 7, 5, ImgRectI(0, 0, 16, 10));
+
+    // Without clipping the whole source moves along: (-7, -5) .. (33, 25).
+    SetID(crp, "ClippingMode", "ClippingMode_None");
+    out = Render(crp);
+    ASSERT_NE(out, nullptr);
+    EXPECT_EQ(out->DataWindow(), ImgRectI(-7, -5, 33, 25));
+    ExpectCut(*out, *src, 7, 5, out->DataWindow().Grown(2, 2));
+
+    // A cut reaching beyond the source: canvas there.
+    SetID(crp, "ClippingMode", "ClippingMode_Frame");
+    SetNumber(crp, "XOffset", -4);
+    SetNumber(crp, "YOffset", 26);
+    out = Render(crp);
+    ASSERT_NE(out, nullptr);
+    EXPECT_EQ(out->DataWindow(), ImgRectI(4, 0, 16, 4));
+    ExpectCut(*out, *src, -4, 26, ImgRectI(0, 0, 16, 10));
+}
+
+TEST_F(CropTool, EveryDepthCutsTheSame) {
+    for (int depth = 1; depth <= 8; ++depth) {
+        SCOPED_TRACE(depth);
+        OrvaneDoc d;
+        Ref<Image> src = PatternImage(21, 13, depth, 4);
+        Operator *crp = AddTool(d, "Crop", AddProbe(d, src));
+        SetNumber(crp, "XOffset", 3);
+        SetNumber(crp, "YOffset", 2);
+        SetNumber(crp, "XSize", 11);
+        SetNumber(crp, "YSize", 9);
+        Ref<Image> out = Render(crp);
+        ASSERT_NE(out, nullptr);
+        EXPECT_EQ(out->Depth(), depth);
+        ExpectCut(*out, *src, 3, 2, ImgRectI(0, 0, 11, 9));
+    }
+}
+
+TEST_F(CropTool, ControlsAreFullResolutionPixelsOfAProxy) {
+    // A half-size proxy of a 40 x 30 frame: offsets 7, 5 -> floor(3.5 + 0.5) = 4,
+    // floor(2.5 + 0.5) = 3; size 16 x 10 -> 8 x 5.
+    Ref<Image> src = PatternImage(20, 15, 8, 9);
+    src->SetAttrsTagList({{ImgFullWidth, 40}, {ImgFullHeight, 30}});
+    Operator *crp = Make(src, 7, 5, 16, 10);
+    Ref<Image> out = Render(crp, {.proxy = 2});
+    ASSERT_NE(out, nullptr);
+    EXPECT_EQ(out->Width(), 8);
+    EXPECT_EQ(out->Height(), 5);
+    EXPECT_EQ(out->GetAttrL(ImgFullWidth), 16);
+    EXPECT_EQ(out->GetAttrL(ImgFullHeight), 10);
+    ExpectCut(*out, *src, 4, 3, ImgRectI(0, 0, 8, 5));
+    // The input was asked for what the cut reads.
+    ASSERT_FALSE(probe->asked.empty());
+}
+
+TEST_F(CropTool, KeptAspectAndCentringWriteTheControls) {
+    Ref<Image> src = PatternImage(40, 30, 8, 3);
+    Operator *crp = Make(src, 1, 2, 16, 10);
+    SetNumber(crp, "KeepCentered", 1);
+    Ref<Image> out = Render(crp);
+    ASSERT_NE(out, nullptr);
+    // floor((40 - 16) / 2 + 0.5) = 12, floor((30 - 10) / 2 + 0.5) = 10.
+    EXPECT_EQ(Control(crp, "XOffset"), 12.0);
+    EXPECT_EQ(Control(crp, "YOffset"), 10.0);
+    ExpectCut(*out, *src, 12, 10, ImgRectI(0, 0, 16, 10));
+
+    // Keep Aspect: 16 / (40 / 30) + 0.5 = 12.5, cut to 12; centred again: y = 9.
+    SetNumber(crp, "KeepAspect", 1);
+    out = Render(crp);
+    ASSERT_NE(out, nullptr);
+    EXPECT_EQ(out->Height(), 12);
+    EXPECT_EQ(Control(crp, "YSize"), 12.0);
+    EXPECT_EQ(Control(crp, "YOffset"), 9.0);
+    ExpectCut(*out, *src, 12, 9, ImgRectI(0, 0, 16, 12));
+
+    // Write-protected: the same frame, the controls as they were.
+    OrvaneDoc d;
+    d.SetWriteProtected(true);
+    Operator *locked = AddTool(d, "Crop", AddProbe(d, src));
+    SetNumber(locked, "XSize", 16);
+    SetNumber(locked, "YSize", 10);
+    SetNumber(locked, "KeepCentered", 1);
+    SetNumber(locked, "KeepAspect", 1);
+    out = Render(locked);
+    ASSERT_NE(out, nullptr);
+    ExpectCut(*out, *src, 12, 9, ImgRectI(0, 0, 16, 12));
+    EXPECT_EQ(Control(locked, "XOffset"), 0.0);
+    EXPECT_EQ(Control(locked, "YSize"), 10.0);
+}
+
+TEST_F(CropTool, ResetButtonsAndPassThrough) {
+    Ref<Image> src = PatternImage(40, 30, 8, 3);
+    Operator *crp = Make(src, 7, 5, 16, 10);
+    Ref<Image> out = Render(crp, {.passThrough = true});
+    EXPECT_EQ(out.Get(), src.Get()); // the input itself
+    ASSERT_NE(Render(crp), nullptr);
+    SetNumber(crp, "ResetOffset", 1);
+    EXPECT_EQ(Control(crp, "XOffset"), 0.0);
+    EXPECT_EQ(Control(crp, "YOffset"), 0.0);
+    SetNumber(crp, "ResetSize", 1);
+    EXPECT_EQ(Control(crp, "XSize"), 40.0);
+    EXPECT_EQ(Control(crp, "YSize"), 30.0);
+}
+
+TEST_F(CropTool, ARegionOfInterestGivesTheWholeFramesPixels) {
+    Ref<Image> src = PatternImage(40, 30, 8, 6);
+    Operator *crp = Make(src, 9, 4, 25, 20);
+    Ref<Image> whole = Render(crp);
+    ASSERT_NE(whole, nullptr);
+    for (const ImgRectI roi : {ImgRectI(0, 0, 5, 5), ImgRectI(10, 3, 25, 20), ImgRectI(20, 15, 24, 19)}) {
+        probe->asked.clear();
+        Ref<Image> part = Render(crp, {.roi = roi});
+        ASSERT_NE(part, nullptr);
+        ExpectSamePixels(*part, *whole, roi);
+        ASSERT_EQ(probe->asked.size(), 1u);
+        ASSERT_TRUE(probe->asked[0].has_value());
+        ImgRectI moved = roi;
+        moved.Offset(9, 4);
+        EXPECT_EQ(probe->asked[0]->rect, moved);
+    }
+}
+
+/// Presses Auto Crop and renders (the press is passive: no cache).
+Ref<Image> AutoCrop(Operator *crp) {
+    SetNumber(crp, "AutoCrop", 1);
+    return Render(crp);
+}
+
+TEST_F(CropTool, AutoCropFindsTheBoxOfWhatDiffersFromTheBorder) {
+    const FltPixel bg{0.2f, 0.3f, 0.4f, 1.f}, mark{0.9f, 0.1f, 0.1f, 1.f};
+    Ref<Image> src = FlatImage(40, 30, DepthRGBAFlt32, bg);
+    src->FillWithin(mark, ImgRectI(10, 5, 20, 25));
+    src->PutFlt(33, 7, mark);
+    src->PutFlt(0, 0, mark); // one corner differs: the other samples outvote it
+    Operator *crp = Make(src, 0, 0, 40, 30);
+    Ref<Image> out = AutoCrop(crp);
+    ASSERT_NE(out, nullptr);
+    // Columns 0 .. 33 and rows 0 .. 24: the corner pixel counts as content.
+    EXPECT_EQ(Control(crp, "XOffset"), 0.0);
+    EXPECT_EQ(Control(crp, "YOffset"), 0.0);
+    EXPECT_EQ(Control(crp, "XSize"), 34.0);
+    EXPECT_EQ(Control(crp, "YSize"), 25.0);
+    EXPECT_EQ(out->Width(), 34);
+    EXPECT_EQ(out->Height(), 25);
+
+    src->PutFlt(0, 0, bg);
+    out = AutoCrop(crp);
+    ASSERT_NE(out, nullptr);
+    EXPECT_EQ(Control(crp, "XOffset"), 10.0);
+    EXPECT_EQ(Control(crp, "YOffset"), 5.0);
+    EXPECT_EQ(Control(crp, "XSize"), 24.0);
+    EXPECT_EQ(Control(crp, "YSize"), 20.0);
+    ExpectCut(*out, *src, 10, 5, ImgRectI(0, 0, 24, 20));
+
+    // Once done, a render without a press leaves the controls alone.
+    SetNumber(crp, "XSize", 30);
+    ASSERT_NE(Render(crp), nullptr);
+    EXPECT_EQ(Control(crp, "XSize"), 30.0);
+}
+
+TEST_F(CropTool, AutoCropOnAFlatImageChangesNothing) {
+    for (int depth : {5, 6, 7, 8, 1, 4}) {
+        SCOPED_TRACE(depth);
+        OrvaneDoc d;
+        Operator *crp = AddTool(d, "Crop", AddProbe(d, FlatImage(40, 30, depth, {0.5f, 0.25f, 0.75f, 1.f})));
+        SetNumber(crp, "XOffset", 3);
+        SetNumber(crp, "XSize", 17);
+        SetNumber(crp, "YSize", 12);
+        ASSERT_NE(AutoCrop(crp), nullptr);
+        EXPECT_EQ(Control(crp, "XOffset"), 3.0);
+        EXPECT_EQ(Control(crp, "YOffset"), 0.0);
+        EXPECT_EQ(Control(crp, "XSize"), 17.0);
+        EXPECT_EQ(Control(crp, "YSize"), 12.0);
+    }
+}
+
+TEST_F(CropTool, AutoCropComparesTheChosenChannelsExactlyOrWithinAMillionth) {
+    struct Case {
+        int depth;
+        FltPixel mark;
+        bool alphaOn, found;
+        FltPixel bg{0.5f, 0.5f, 0.5f, 0.5f};
+    };
+    // Background and marks on exact codes of the integer depths where they matter.
+    const float b8 = 128.f / 255.f, b16 = 32768.f / 65535.f;
+    const FltPixel bg8{b8, b8, b8, b8}, bg16{b16, b16, b16, b16};
+    const Case cases[] = {
+        {DepthRGBAInt8, {b8, b8, b8, 129.f / 255.f}, true, true, bg8},   // one code in alpha
+        {DepthRGBAInt8, {b8, b8, b8, 129.f / 255.f}, false, false, bg8}, // alpha not looked at
+        {DepthRGBAInt16, {32769.f / 65535.f, b16, b16, b16}, false, true, bg16},
+        {DepthRGBAFlt32, {0.5f, 0.5f + 2e-6f, 0.5f, 0.5f}, true, true},
+        {DepthRGBAFlt32, {0.5f, 0.5f + 5e-7f, 0.5f, 0.5f}, true, false}, // within a millionth
+        {DepthRGBAFlt16, {0.5f, 0.5f, 0.50048828f, 0.5f}, true, true},   // one half-float step
+        {DepthAFlt32, {0.7f, 0.7f, 0.7f, 0.7f}, true, true},
+        {DepthAInt16, {0.7f, 0.7f, 0.7f, 0.7f}, false, true}, // a mask's value shows in every channel
+    };
+    for (const Case &c : cases) {
+        SCOPED_TRACE(testing::Message() << "depth " << c.depth << " alpha " << c.alphaOn);
+        OrvaneDoc d;
+        Ref<Image> src = FlatImage(30, 20, c.depth, c.bg);
+        src->FillWithin(c.mark, ImgRectI(4, 6, 9, 8));
+        Operator *crp = AddTool(d, "Crop", AddProbe(d, src));
+        SetNumber(crp, "XSize", 30);
+        SetNumber(crp, "YSize", 20);
+        SetNumber(crp, "Alpha", c.alphaOn ? 1 : 0);
+        ASSERT_NE(AutoCrop(crp), nullptr);
+        const auto *w = dynamic_cast<const Number *>(crp->FindInput("XSize")->Constant().Get());
+        const auto *y = dynamic_cast<const Number *>(crp->FindInput("YOffset")->Constant().Get());
+        EXPECT_EQ(w->value, c.found ? 5.0 : 30.0);
+        EXPECT_EQ(y->value, c.found ? 6.0 : 0.0);
+    }
+}
+
+TEST_F(CropTool, AutoCropOfAProxyGivesFullResolutionControls) {
+    Ref<Image> src = FlatImage(20, 15, DepthRGBAFlt32, {});
+    src->FillWithin({1.f, 1.f, 1.f, 1.f}, ImgRectI(3, 4, 8, 6));
+    src->SetAttrsTagList({{ImgFullWidth, 40}, {ImgFullHeight, 30}});
+    Operator *crp = Make(src, 0, 0, 40, 30);
+    ASSERT_NE(AutoCrop(crp), nullptr);
+    EXPECT_EQ(Control(crp, "XOffset"), 6.0);
+    EXPECT_EQ(Control(crp, "YOffset"), 8.0);
+    EXPECT_EQ(Control(crp, "XSize"), 10.0);
+    EXPECT_EQ(Control(crp, "YSize"), 4.0);
+}
+
+} // namespace
+} // namespace Orvane::WarpTest::CropT

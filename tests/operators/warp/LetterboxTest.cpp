@@ -1,0 +1,221 @@
+// Letterbox: both modes with sizes, offsets and clamped pans worked out by
+// hand, pixels against the host's resizer called directly with the same
+// placement, the clipping modes and canvas, proxies, the frame format, and
+// regions of interest against whole frames.
+#include "tests/operators/warp/WarpTestSupport.h"
+
+namespace Orvane::WarpTest::LetterboxT {
+namespace {
+
+constexpr int E = DomainEndless;
+
+class LetterboxTool : public ::testing::Test {
+protected:
+    static void SetUpTestSuite() { LoadOperators(); }
+    Operator *Make(Ref<Image> src, int w, int h, int mode = 0) {
+        probe = AddProbe(doc, std::move(src));
+        Operator *lbx = AddTool(doc, "Letterbox", probe);
+        SetNumber(lbx, "Width", w);
+        SetNumber(lbx, "Height", h);
+        SetNumber(lbx, "Mode", mode);
+        return lbx;
+    }
+    OrvaneDoc doc;
+    ProbeSource *probe = nullptr;
+};
+
+struct Placement {
+    double xs, ys, ox, oy;
+    int xEdges, yEdges;
+};
+
+/// The host's resizer with a placement, Linear filter, reading `read`.
+Ref<Image> Reference(const Image &src, int w, int h, const ImgRectI &window, const Placement &p, const ImgRectI &read,
+                     int filter = RszLinear) {
+    return DirectResize(src, w, h, window,
+                        {{ResizeFilter, filter},
+                         {ResizeWindow, RszWindowHanning},
+                         {ResizeXScale, p.xs},
+                         {ResizeYScale, p.ys},
+                         {ResizeXOffset, p.ox},
+                         {ResizeYOffset, p.oy},
+                         {ResizeXEdges, p.xEdges},
+                         {ResizeYEdges, p.yEdges},
+                         {ResizeSourceWindow, &read}});
+}
+
+TEST_F(LetterboxTool, AWideFrameSitsBetweenBars) {
+    // 200 x 100 into 100 x 100: sh = 100 x (100 x 1 / 1) / (200 x 1) = 50, placed 25 up.
+    Ref<Image> src = PatternImage(200, 100, 8, 1);
+    Operator *lbx = Make(src, 100, 100);
+    Ref<Image> out = Render(lbx);
+    ASSERT_NE(out, nullptr);
+    EXPECT_EQ(out->Width(), 100);
+    EXPECT_EQ(out->Height(), 100);
+    EXPECT_EQ(out->DataWindow(), ImgRectI(0, 25, 100, 75));
+    EXPECT_TRUE(out->IsCanvasColorClear());
+    const Placement p{0.5, 0.5, 0.0, 25.0, EdgeDuplicate, EdgeCanvas};
+    Ref<Image> ref = Reference(*src, 100, 100, out->DataWindow(), p, src->Frame());
+    ExpectSamePixels(*out, *ref, ImgRectI(-2, -2, 102, 102));
+
+    // With no excess the centre changes nothing.
+    SetPoint(lbx, "Center", 0.2, 0.9);
+    Ref<Image> moved = Render(lbx);
+    ASSERT_NE(moved, nullptr);
+    EXPECT_EQ(moved->DataWindow(), out->DataWindow());
+    ExpectSamePixels(*moved, *out, ImgRectI(0, 0, 100, 100));
+}
+
+TEST_F(LetterboxTool, ATallFramePansWithinItsExcess) {
+    // 100 x 200 into 100 x 100: sh = 200, excess e = 50 on each side.
+    Ref<Image> src = PatternImage(100, 200, 8, 2);
+    Operator *lbx = Make(src, 100, 100);
+    struct Case {
+        double cy, oy;
+    };
+    // oy = clamp((0.5 - cy) x 200, -50, 50); the source's origin lands at (100 - 200) / 2 + oy.
+    for (const Case c : {Case{0.5, 0.0}, Case{0.6, -20.0}, Case{1.0, -50.0}, Case{-3.0, 50.0}}) {
+        SCOPED_TRACE(c.cy);
+        SetPoint(lbx, "Center", 0.5, c.cy);
+        Ref<Image> out = Render(lbx);
+        ASSERT_NE(out, nullptr);
+        const double origin = -50.0 + c.oy;
+        EXPECT_EQ(out->DataWindow(), ImgRectI(0, static_cast<int>(origin), 100, static_cast<int>(origin) + 200));
+        const Placement p{1.0, 1.0, 0.0, origin, EdgeDuplicate, EdgeCanvas};
+        Ref<Image> ref = Reference(*src, 100, 100, out->DataWindow(), p, src->Frame());
+        ExpectSamePixels(*out, *ref, ImgRectI(0, 0, 100, 100));
+    }
+}
+
+TEST_F(LetterboxTool, PanAndScanSpansTheHeight) {
+    // 200 x 100 into 100 x 100: sw = 200 x (100 x 1 / 1) / (100 x 1) = 200, e = 50.
+    Ref<Image> src = PatternImage(200, 100, 8, 3);
+    Operator *lbx = Make(src, 100, 100, 1);
+    Ref<Image> out = Render(lbx);
+    ASSERT_NE(out, nullptr);
+    EXPECT_EQ(out->DataWindow(), ImgRectI(-50, 0, 150, 100));
+    Placement p{1.0, 1.0, -50.0, 0.0, EdgeCanvas, EdgeDuplicate};
+    ExpectSamePixels(*out, *Reference(*src, 100, 100, out->DataWindow(), p, src->Frame()), ImgRectI(0, 0, 100, 100));
+
+    // Center X = 0.1: (0.5 - 0.1) x 200 = 80, clamped to 50: the left edge shows.
+    SetPoint(lbx, "Center", 0.1, 0.5);
+    out = Render(lbx);
+    ASSERT_NE(out, nullptr);
+    EXPECT_EQ(out->DataWindow(), ImgRectI(0, 0, 200, 100));
+    p.ox = 0.0;
+    ExpectSamePixels(*out, *Reference(*src, 100, 100, out->DataWindow(), p, src->Frame()), ImgRectI(0, 0, 100, 100));
+}
+
+TEST_F(LetterboxTool, TheOutputsPixelAspectShapesThePicture) {
+    // At 0.5 : 1 a 200 x 100 square-pixel frame needs sh = 100 x (100 x 0.5) / 200 = 25 lines.
+    Ref<Image> src = PatternImage(200, 100, 8, 4);
+    Operator *lbx = Make(src, 100, 100);
+    SetPoint(lbx, "PixelAspect", 0.5, 1.0);
+    Ref<Image> out = Render(lbx);
+    ASSERT_NE(out, nullptr);
+    EXPECT_DOUBLE_EQ(out->XScale(), 0.5);
+    EXPECT_DOUBLE_EQ(out->YScale(), 1.0);
+    EXPECT_EQ(out->DataWindow(), ImgRectI(0, 37, 100, 63)); // 37.5 .. 62.5 outward
+    const Placement p{0.5, 0.25, 0.0, 37.5, EdgeDuplicate, EdgeCanvas};
+    ExpectSamePixels(*out, *Reference(*src, 100, 100, out->DataWindow(), p, src->Frame()), ImgRectI(0, 0, 100, 100));
+    // The legacy pair is kept for documents but read by nothing.
+    SetNumber(lbx, "AspectX", 3.0);
+    EXPECT_EQ(Render(lbx)->DataWindow(), out->DataWindow());
+}
+
+TEST_F(LetterboxTool, FramingMakesACanvasRealAndClearsWhatLiesBeyond) {
+    Ref<Image> full = PatternImage(200, 100, 8, 5);
+    const ImgRectI dw(20, 10, 180, 90);
+    const FltPixel red{1.f, 0.f, 0.f, 1.f};
+    Ref<Image> src = full->CopyOfImageTagList({{ImgDataWindow, &dw}, {ImgCanvasColor, &red}});
+    Operator *lbx = Make(src, 100, 100);
+    Ref<Image> out = Render(lbx);
+    ASSERT_NE(out, nullptr);
+    EXPECT_TRUE(out->IsCanvasColorClear());
+    EXPECT_EQ(out->DataWindow(), ImgRectI(0, 25, 100, 75)); // the whole frame, red where the source had canvas
+    // Made by hand: the frame with red outside the window, clear beyond.
+    const ImgRectI frame = src->Frame();
+    const FltPixel clear{};
+    Ref<Image> real = NewImageTagList({{ImgLikeImage, src.Get()}, {ImgDataWindow, &frame}, {ImgCanvasColor, &clear}});
+    ASSERT_TRUE(real->AllocScanLineData());
+    for (int y = 0; y < 100; ++y)
+        for (int x = 0; x < 200; ++x) real->PutFlt(x, y, dw.Contains(x, y) ? full->GetFlt(x, y) : red);
+    const Placement p{0.5, 0.5, 0.0, 25.0, EdgeDuplicate, EdgeCanvas};
+    ExpectSamePixels(*out, *Reference(*real, 100, 100, out->DataWindow(), p, frame), ImgRectI(-2, -2, 102, 102));
+
+    // Without clipping the canvas stays the source's. The tool takes whole
+    // frames, so the host hands it the source made real over its frame.
+    SetID(lbx, "ClippingMode", "ClippingMode_None");
+    out = Render(lbx);
+    ASSERT_NE(out, nullptr);
+    EXPECT_EQ(out->GetCanvasColor(), red);
+    EXPECT_EQ(out->DataWindow(), ImgRectI(0, 25, 100, 75));
+    real->SetCanvasColor(red);
+    const ImgRectI all(-E, -E, E, E);
+    ExpectSamePixels(*out, *Reference(*real, 100, 100, out->DataWindow(), p, all), out->DataWindow());
+}
+
+TEST_F(LetterboxTool, ProxyFieldsAndTheFrameFormat) {
+    // A half-size proxy of 200 x 100 into 100 x 100 at proxy 2: 50 x 50, sh = 25.
+    Ref<Image> src = PatternImage(100, 50, 8, 6);
+    src->SetAttrsTagList({{ImgFullWidth, 200}, {ImgFullHeight, 100}});
+    Operator *lbx = Make(src, 100, 100);
+    Ref<Image> out = Render(lbx, {.proxy = 2});
+    ASSERT_NE(out, nullptr);
+    EXPECT_EQ(out->Width(), 50);
+    EXPECT_EQ(out->Height(), 50);
+    EXPECT_EQ(out->DataWindow(), ImgRectI(0, 12, 50, 38)); // 12.5 .. 37.5 outward
+    EXPECT_EQ(out->GetAttrL(ImgFullWidth), 100);
+    EXPECT_EQ(out->GetAttrL(ImgFullHeight), 100);
+
+    // A field of a 200 x 100 frame (50 lines of double height) into 100 x 100:
+    // 50 lines, pixel aspect Y doubled; sh = 50 x 2 x (100 x 1 / 2) / 200 = 25.
+    OrvaneDoc d;
+    Ref<Image> field = PatternImage(200, 50, 8, 7);
+    field->SetScale(1.0, 2.0);
+    field->SetAttrsTagList({{ImgField, 0}});
+    Operator *flbx = AddTool(d, "Letterbox", AddProbe(d, field));
+    SetNumber(flbx, "Width", 100);
+    SetNumber(flbx, "Height", 100);
+    out = Render(flbx);
+    ASSERT_NE(out, nullptr);
+    EXPECT_EQ(out->Height(), 50);
+    EXPECT_DOUBLE_EQ(out->YScale(), 2.0);
+    EXPECT_EQ(out->DataWindow(), ImgRectI(0, 12, 100, 38));
+
+    // The frame format takes over the size.
+    doc.SetPref(PREF_FFWidth, 160);
+    doc.SetPref(PREF_FFHeight, 90);
+    SetNumber(lbx, "UseFrameFormatSettings", 1);
+    const auto *w = dynamic_cast<const Number *>(lbx->FindInput("Width")->Constant().Get());
+    ASSERT_NE(w, nullptr);
+    EXPECT_EQ(w->value, 160.0);
+    out = Render(lbx);
+    ASSERT_NE(out, nullptr);
+    EXPECT_EQ(out->Width(), 160);
+    EXPECT_EQ(out->Height(), 90);
+}
+
+TEST_F(LetterboxTool, ARegionOfInterestGivesTheWholeFramesPixels) {
+    for (int mode : {0, 1}) {
+        SCOPED_TRACE(mode);
+        OrvaneDoc d;
+        ProbeSource *p = AddProbe(d, PatternImage(90, 40, 8, 8));
+        Operator *lbx = AddTool(d, "Letterbox", p);
+        SetNumber(lbx, "Width", 64);
+        SetNumber(lbx, "Height", 48);
+        SetNumber(lbx, "Mode", mode);
+        SetNumber(lbx, "FilterMethod", 8);
+        SetPoint(lbx, "Center", 0.3, 0.3);
+        Ref<Image> whole = Render(lbx);
+        ASSERT_NE(whole, nullptr);
+        for (const ImgRectI roi : {ImgRectI(0, 0, 9, 48), ImgRectI(30, 20, 40, 30), ImgRectI(60, 40, 64, 48)}) {
+            Ref<Image> part = Render(lbx, {.roi = roi});
+            ASSERT_NE(part, nullptr);
+            ExpectSamePixels(*part, *whole, roi);
+        }
+    }
+}
+
+} // namespace
+} // namespace Orvane::WarpTest::LetterboxT
