@@ -80,13 +80,7 @@ Crop::Crop(const Registry *reg, const ScriptVal &args, const TagList &tags) : Th
     keepAspect_ = AddCheckbox(this, "Keep Aspect", "KeepAspect", 0.0);
     keepCentered_ = AddCheckbox(this, "Keep Centered", "KeepCentered", 0.0);
     aspect_ = AddAspectInputs(this);
-    // Fetched after the controls, so that CheckRequest can read them.
-    input_ = AddInputTagList("Input", "Input",
-                             {{LinkDataType, CLSID_DataType_Image},
-                              {LinkMain, 1},
-                              {ImageFromRequestOK, 1},
-                              {InputNotify, 1},
-                              {InputPriority, PriorityDefault + 1}});
+    input_ = AddSourceImageInput(this, {{InputNotify, 1}});
     output_ = AddOutputTagList("Output", "Output", {{LinkDataType, CLSID_DataType_Image}, {LinkMain, 1}});
     clipping_ = AddInputTagList("Clipping Mode", "ClippingMode",
                                 WithIdChoices({{LinkDataType, CLSID_DataType_OvID},

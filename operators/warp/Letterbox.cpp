@@ -97,12 +97,7 @@ Letterbox::Letterbox(const Registry *reg, const ScriptVal &args, const TagList &
                                                {InputDefaultId, ClippingMode_Frame},
                                                {ButtonsFillRow, 1}},
                                               kClipping));
-    // Fetched after the controls, so that CheckRequest can read them.
-    input_ = AddInputTagList("Input", "Input",
-                             {{LinkDataType, CLSID_DataType_Image},
-                              {LinkMain, 1},
-                              {ImageFromRequestOK, 1},
-                              {InputPriority, PriorityDefault + 1}});
+    input_ = AddSourceImageInput(this);
     output_ = AddOutputTagList("Output", "Output", {{LinkDataType, CLSID_DataType_Image}, {LinkMain, 1}});
 }
 

@@ -70,12 +70,7 @@ Scale::Scale(const Registry *reg, const ScriptVal &args, const TagList &tags) : 
     hiQOnly_ = AddHiQOnlyInput(this);
     aspect_ = AddAspectInputs(this);
     filter_ = AddFilterInputs(this);
-    // Fetched after the controls, so that CheckRequest can read them.
-    input_ = AddInputTagList("Input", "Input",
-                             {{LinkDataType, CLSID_DataType_Image},
-                              {LinkMain, 1},
-                              {ImageFromRequestOK, 1},
-                              {InputPriority, PriorityDefault + 1}});
+    input_ = AddSourceImageInput(this);
     output_ = AddOutputTagList("Output", "Output", {{LinkDataType, CLSID_DataType_Image}, {LinkMain, 1}});
 }
 

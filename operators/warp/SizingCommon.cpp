@@ -120,6 +120,15 @@ Input *AddSizeInput(Operator *op, const char *name, const char *id, double def, 
 
 Input *AddHiQOnlyInput(Operator *op) { return AddCheckbox(op, "Only Use Filter in HiQ", "HiQOnly", 0.0); }
 
+Input *AddSourceImageInput(Operator *op, const TagList &extra) {
+    TagList tags{{LinkDataType, CLSID_DataType_Image},
+                 {LinkMain, 1},
+                 {ImageFromRequestOK, 1},
+                 {InputPriority, PriorityDefault + 1}};
+    for (const TagItem &item : extra.Items()) tags.Add(item);
+    return op->AddInputTagList("Input", "Input", tags);
+}
+
 AspectInputs AddAspectInputs(Operator *op) {
     const FrameFormat ff = DocFormat(op);
     AspectInputs in;

@@ -70,6 +70,9 @@ struct AspectInputs {
     Input *aspect = nullptr;
 };
 AspectInputs AddAspectInputs(Operator *op);
+/// The main image input, fetched after the controls so that CheckRequest can
+/// read them; `extra` adds tags.
+Input *AddSourceImageInput(Operator *op, const TagList &extra = {});
 /// A checkbox, default `def`.
 Input *AddCheckbox(Operator *op, const char *name, const char *id, double def, const TagList &extra = {});
 /// A button (a change of its value is the press): passive, not heard at construction.
