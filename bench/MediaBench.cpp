@@ -79,10 +79,10 @@ void BM_RenderLoaderGradeSaver(benchmark::State &state) {
     Operator *loader = doc.AddTool(OvID("Loader"), "Plate");
     Operator *grade = doc.AddTool(OvID("BrightnessContrast"), "Grade");
     Operator *saver = doc.AddTool(OvID("Saver"), "Out");
-    ApplyInputValue(doc, loader->FindInput("Clip"), ScriptVal((dir / "plate.0000.exr").string()), false);
-    ApplyInputValue(doc, grade->FindInput("Gain"), ScriptVal(1.2), false);
+    ApplyInputValue(doc, loader->FindInput("Clip"), ScriptVal((dir / "plate.0000.exr").string()));
+    ApplyInputValue(doc, grade->FindInput("Gain"), ScriptVal(1.2));
     grade->FindInput("Input")->ConnectTo(loader->FindMainOutput());
-    ApplyInputValue(doc, saver->FindInput("Clip"), ScriptVal((dir / "out.####.exr").string()), false);
+    ApplyInputValue(doc, saver->FindInput("Clip"), ScriptVal((dir / "out.####.exr").string()));
     saver->FindInput("Input")->ConnectTo(grade->FindMainOutput());
     RenderTask task;
     EvalOptions options;

@@ -6,6 +6,8 @@
 
 #include "host/app/Application.h"
 #include "host/core/ScriptVal.h"
+#include "host/core/Suggest.h"
+#include "host/flow/DocumentIO.h"
 #include "host/flow/InputValue.h"
 #include "host/flow/Operator.h"
 #include "host/flow/OrvaneDoc.h"
@@ -95,24 +97,57 @@ std::vector<double> ParseNumberList(const std::string &text, size_t count, const
     return values;
 }
 
-void ApplySet(OrvaneDoc &doc, const std::string &set) {
+void LoadFlow(const std::string &path, OrvaneDoc &doc, bool lenient, bool json) {
+    const DocumentLoadResult loaded = LoadDocumentFile(path, doc, {.lenient = lenient});
+    size_t errors = 0;
+    for (const DocumentProblem &p : loaded.problems) {
+        errors += p.error;
+        if (json) {
+            std::printf("{\"event\": \"problem\", \"severity\": \"%s\", \"file\": %s, \"line\": %d, \"column\": %d, "
+                        "\"message\": %s}\n",
+                        p.error ? "error" : "warning", JsonString(path).c_str(), p.line, p.column,
+                        JsonString(p.message).c_str());
+            continue;
+        }
+        const std::string place =
+            p.line > 0 ? path + ":" + std::to_string(p.line) + ":" + std::to_string(p.column) : path;
+        std::fprintf(stderr, "%s: %s: %s\n", p.error ? "ERROR" : "WARNING", place.c_str(), p.message.c_str());
+    }
+    std::fflush(stdout);
+    if (!loaded.ok)
+        throw CliError(ExitUsage, path + ": " + std::to_string(errors) + (errors == 1 ? " problem" : " problems") +
+                                      (lenient ? "" : " (--lenient goes on with them as warnings where it can)"));
+}
+
+void ApplySet(OrvaneDoc &doc, const std::string &set, const char *what) {
     const size_t eq = set.find('=');
     const size_t dot = set.find('.');
     if (eq == std::string::npos || dot == std::string::npos || dot > eq)
-        throw CliError(ExitUsage, "--set expects TOOL.INPUT=VALUE, not '" + set + "'");
+        throw CliError(ExitUsage, std::string(what) + " expects TOOL.INPUT=VALUE, not '" + set + "'");
     const std::string toolName = set.substr(0, dot), inputId = set.substr(dot + 1, eq - dot - 1);
     Operator *op = doc.FindTool(toolName);
-    if (!op) throw CliError(ExitUsage, "--set: the flow has no tool '" + toolName + "'");
+    if (!op) {
+        std::vector<std::string> names;
+        for (const Operator *t : doc.Tools()) names.push_back(t->Name());
+        throw CliError(ExitUsage,
+                       std::string(what) + ": the flow has no tool '" + toolName + "'" + DidYouMean(toolName, names));
+    }
     Input *in = op->FindInput(inputId.c_str());
-    if (!in) throw CliError(ExitUsage, "--set: " + toolName + " has no input '" + inputId + "'");
+    if (!in) {
+        std::vector<std::string> ids;
+        for (const auto &i : op->Inputs()) ids.push_back(i->ID().Text());
+        throw CliError(ExitUsage, std::string(what) + ": " + toolName + " has no input '" + inputId + "'" +
+                                      DidYouMean(inputId, ids));
+    }
+    const std::string place = std::string(what) + " " + toolName + "." + inputId + ": ";
     ScriptVal value;
     try {
-        value = ScriptVal::FromText(set.substr(eq + 1));
-    } catch (const ScriptParseError &e) {
-        throw CliError(ExitUsage, "--set " + toolName + "." + inputId + ": " + e.what());
+        value = InputValueFromText(doc, in, set.substr(eq + 1));
+    } catch (const std::invalid_argument &e) {
+        throw CliError(ExitUsage, place + e.what());
     }
-    const std::string error = ApplyInputValue(doc, in, value, false);
-    if (!error.empty()) throw CliError(ExitUsage, "--set " + toolName + "." + inputId + ": " + error);
+    const std::string error = ApplyInputValue(doc, in, value);
+    if (!error.empty()) throw CliError(ExitUsage, place + error);
 }
 
 } // namespace Orvane::Cli

@@ -26,8 +26,17 @@ struct CliError : std::runtime_error {
     int exitCode;
 };
 
-/// Applies one "--set TOOL.INPUT=VALUE" to a document or throws.
-void ApplySet(OrvaneDoc &doc, const std::string &set);
+/// Reads a flow document for a command. Prints every problem on stderr as
+/// "ERROR: FLOW:LINE:COLUMN: message" (or WARNING:; with `json`, one object
+/// per problem on stdout) and throws a usage error when the document has
+/// errors. `lenient` takes errors as warnings where the document can still
+/// be used.
+void LoadFlow(const std::string &path, OrvaneDoc &doc, bool lenient, bool json = false);
+
+/// Applies one "TOOL.INPUT=VALUE" (as --set and orvane set give it) to a
+/// document or throws a usage error saying what is wrong. `what` names the
+/// option in messages.
+void ApplySet(OrvaneDoc &doc, const std::string &set, const char *what = "--set");
 
 /// Loads the standard tool library or throws.
 void LoadLibrary();
@@ -49,6 +58,15 @@ std::string JsonNumber(double v);
 /// Parses "a,b,c,..." into exactly `count` numbers (count 0: any number >= 1).
 std::vector<double> ParseNumberList(const std::string &text, size_t count, const char *what);
 
+/// The usage text of a command ("" for an unknown one).
+const char *CommandUsage(const std::string &command);
+
+int RunCheck(const std::vector<std::string> &args);
+int RunNew(const std::vector<std::string> &args);
+int RunAdd(const std::vector<std::string> &args);
+int RunSetCommand(const std::vector<std::string> &args);
+int RunConnect(const std::vector<std::string> &args);
+int RunRemove(const std::vector<std::string> &args);
 int RunTools(const std::vector<std::string> &args);
 int RunDescribe(const std::vector<std::string> &args);
 int RunEval(const std::vector<std::string> &args);

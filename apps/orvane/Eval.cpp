@@ -10,6 +10,7 @@
 #include "apps/orvane/Cli.h"
 #include "host/core/Parallel.h"
 #include "host/core/ScriptVal.h"
+#include "host/core/Suggest.h"
 #include "host/flow/DocumentIO.h"
 #include "host/flow/Engine.h"
 #include "host/flow/InputValue.h"
@@ -18,6 +19,7 @@
 #include "host/flow/RenderTask.h"
 #include "host/flow/Request.h"
 #include "host/image/Image.h"
+#include "host/image/Pixel.h"
 #include "host/image/PixelConvert.h"
 
 namespace Orvane::Cli {
@@ -26,7 +28,7 @@ namespace {
 struct EvalArgs {
     std::string flow, target;
     double time = 0.0;
-    bool timeSet = false, json = false;
+    bool timeSet = false, json = false, lenient = false;
     std::optional<ImgRectI> roi;
     std::vector<std::pair<int, int>> pixels;
     std::vector<std::string> sets;
@@ -70,6 +72,8 @@ EvalArgs ParseArgs(const std::vector<std::string> &args) {
             a.device = value();
         } else if (arg == "--json") {
             a.json = true;
+        } else if (arg == "--lenient") {
+            a.lenient = true;
         } else if (arg.rfind("--", 0) == 0) {
             throw CliError(ExitUsage, "eval: unknown option " + arg);
         } else {
@@ -143,9 +147,7 @@ int RunEval(const std::vector<std::string> &rawArgs) {
     OrvaneDoc doc;
     std::vector<std::string> console;
     doc.SetConsoleListener([&console](const ConsoleLine &line) { console.push_back(line.text); });
-    const DocumentLoadResult loaded = LoadDocumentFile(a.flow, doc);
-    if (!loaded.ok) throw CliError(ExitUsage, loaded.error);
-    for (const std::string &w : loaded.warnings) std::fprintf(stderr, "WARNING: %s\n", w.c_str());
+    LoadFlow(a.flow, doc, a.lenient);
     for (const std::string &set : a.sets) ApplySet(doc, set);
 
     const size_t dot = a.target.rfind('.');
@@ -154,7 +156,9 @@ int RunEval(const std::vector<std::string> &rawArgs) {
     if (!op) {
         if (doc.KeptTools().Find(toolName))
             throw CliError(ExitUsage, "tool '" + toolName + "' is of a class this program does not know");
-        throw CliError(ExitUsage, "the flow has no tool '" + toolName + "'");
+        std::vector<std::string> names;
+        for (const Operator *t : doc.Tools()) names.push_back(t->Name());
+        throw CliError(ExitUsage, "the flow has no tool '" + toolName + "'" + DidYouMean(toolName, names));
     }
     Output *out = dot == std::string::npos ? op->FindMainOutput() : op->FindOutput(a.target.substr(dot + 1).c_str());
     if (!out) throw CliError(ExitUsage, "tool '" + toolName + "' has no output '" + a.target.substr(dot + 1) + "'");
@@ -179,7 +183,7 @@ int RunEval(const std::vector<std::string> &rawArgs) {
         if (img) {
             const FltPixel c = img->GetCanvasColor();
             j += ", \"width\": " + std::to_string(img->Width()) + ", \"height\": " + std::to_string(img->Height());
-            j += ", \"depth\": " + std::to_string(img->Depth());
+            j += ", \"depth\": " + JsonString(DepthName(img->Depth()));
             j += ", \"data_window\": " + RectJson(img->DataWindow());
             j += ", \"valid_window\": " + RectJson(img->ValidWindow());
             j += ", \"canvas\": [" + JsonNumber(c.R) + ", " + JsonNumber(c.G) + ", " + JsonNumber(c.B) + ", " +
@@ -216,8 +220,8 @@ int RunEval(const std::vector<std::string> &rawArgs) {
         if (img) {
             const ImgRectI d = img->DataWindow(), v = img->ValidWindow();
             const FltPixel c = img->GetCanvasColor();
-            std::printf("  size          %d x %d, depth %d%s, pixel aspect %g:%g\n", img->Width(), img->Height(),
-                        img->Depth(), img->IsMask() ? " (mask)" : "", img->XScale(), img->YScale());
+            std::printf("  size          %d x %d, %s, pixel aspect %g:%g\n", img->Width(), img->Height(),
+                        DepthName(img->Depth()).c_str(), img->XScale(), img->YScale());
             std::printf("  data window   %d,%d - %d,%d\n", d.x0, d.y0, d.x1, d.y1);
             std::printf("  valid window  %d,%d - %d,%d\n", v.x0, v.y0, v.x1, v.y1);
             std::printf("  canvas        %g %g %g %g\n", c.R, c.G, c.B, c.A);

@@ -40,7 +40,7 @@ struct RenderArgs {
     std::vector<std::string> savers, sets;
     int threads = 0, proxy = 1;
     size_t memoryLimit = 0;
-    bool skipExisting = false, json = false;
+    bool skipExisting = false, json = false, lenient = false;
 };
 
 size_t ParseSize(const std::string &text) {
@@ -96,6 +96,8 @@ RenderArgs ParseArgs(const std::vector<std::string> &args) {
             a.device = value();
         } else if (arg == "--skip-existing") {
             a.skipExisting = true;
+        } else if (arg == "--lenient") {
+            a.lenient = true;
         } else if (arg == "--log-format") {
             const std::string &f = value();
             if (f != "text" && f != "json") throw CliError(ExitUsage, "render: --log-format is text or json");
@@ -211,8 +213,7 @@ int RunRender(const std::vector<std::string> &rawArgs) {
         std::lock_guard<std::mutex> guard(consoleLock);
         console.push_back((line.code >= ConsoleError ? "E" : line.code >= ConsoleWarning ? "W" : "L") + line.text);
     });
-    const DocumentLoadResult loaded = LoadDocumentFile(a.flow, doc);
-    if (!loaded.ok) throw CliError(ExitUsage, loaded.error);
+    LoadFlow(a.flow, doc, a.lenient, a.json);
     for (const std::string &set : a.sets) ApplySet(doc, set);
 
     // The Savers to render: those named, else all of them.
@@ -244,7 +245,6 @@ int RunRender(const std::vector<std::string> &rawArgs) {
     const int64_t rangeStart = frames.empty() ? 0 : *std::min_element(frames.begin(), frames.end());
     if (!a.chunk.empty() && !TakeChunk(a.chunk, frames, error)) throw CliError(ExitUsage, "render: --chunk: " + error);
 
-    for (const std::string &w : loaded.warnings) std::fprintf(stderr, "WARNING: %s\n", w.c_str());
     if (a.memoryLimit) {
         doc.Cache().SetBudget(a.memoryLimit / 2);
         SetPixelPoolLimit(a.memoryLimit / 4);

@@ -7,8 +7,10 @@
 
 #include "apps/orvane/Cli.h"
 #include "host/core/Registry.h"
+#include "host/core/Suggest.h"
 #include "host/core/Tags.h"
 #include "host/flow/DataTypes.h"
+#include "host/flow/InputValue.h"
 #include "host/flow/Operator.h"
 #include "host/flow/OrvaneDoc.h"
 
@@ -40,6 +42,23 @@ std::string KindWord(uint32_t flags) {
     return "operator";
 }
 
+/// What a class can do beyond its kind, in words.
+std::string Attributes(const Registry &row) {
+    const uint32_t flags = row.TypeFlags();
+    const TagList &t = row.Tags();
+    std::vector<std::string> words;
+    if (flags & RegKindTwoImage) words.push_back("two-image");
+    if (flags & RegKindVariableInputs) words.push_back("variable-inputs");
+    if (flags & RegKind3D) words.push_back("3D");
+    if (t.GetBool(RegSupportsRoI)) words.push_back("regions");
+    if (t.GetBool(RegSupportsDoD)) words.push_back("domains");
+    if (t.GetBool(RegSupportsGPUImages)) words.push_back("device");
+    if (t.GetBool(RegNoCache) || t.GetBool(RegUnpredictable)) words.push_back("uncached");
+    std::string out;
+    for (const std::string &w : words) out += (out.empty() ? "" : ",") + w;
+    return out.empty() ? "-" : out;
+}
+
 const char *BuiltWord(const Registry &row) {
     if (!row.CanCreate()) return "-";
     return row.Tags().GetBool(RegPlanned) ? "not yet" : "yes";
@@ -65,14 +84,13 @@ bool Matches(const Registry &row, const std::string &word) {
 }
 
 const Registry &FindClass(const std::string &name) {
-    const Registry *row = ClassRegistry ? ClassRegistry->Find(OvID(name)) : nullptr;
-    if (!row && ClassRegistry) // a class word or display name names it too
-        for (const Registry *r : ClassRegistry->Rows())
-            if (Lower(r->ClassName()) == Lower(name) || Lower(r->DisplayName()) == Lower(name)) {
-                row = r;
-                break;
-            }
-    if (!row) throw CliError(ExitUsage, "unknown class '" + name + "' (see orvane tools)");
+    const Registry *row = ClassRegistry ? ClassRegistry->FindByName(name) : nullptr;
+    if (!row) {
+        std::vector<std::string> ids;
+        for (const Registry *r : ClassRegistry ? ClassRegistry->Rows() : std::vector<const Registry *>{})
+            ids.push_back(r->ID().Text());
+        throw CliError(ExitUsage, "unknown class '" + name + "'" + DidYouMean(name, ids) + " (see orvane tools)");
+    }
     return *row;
 }
 
@@ -110,49 +128,92 @@ std::string TypeWord(OvID type) {
     return Lower(type.Text());
 }
 
-void PrintInput(const Input &in) {
+/// One input as describe shows it: the type and control, then default, limits and notes.
+struct InputLine {
+    std::string id, label, type, details;
+    std::vector<std::string> choices; ///< "Label" (ID or number)
+};
+
+InputLine DescribeInput(const Input &in) {
     const TagList &t = in.Tags();
-    std::string line = "  " + std::string(in.ID().Text());
-    line.resize(std::max<size_t>(line.size() + 1, 30), ' ');
-    line += "\"" + (*in.Label() ? std::string(in.Label()) : in.Name()) + "\"";
-    line.resize(std::max<size_t>(line.size() + 1, 58), ' ');
-    line += TypeWord(in.DataType());
-    if (t.Has(InputControl)) line += ", " + ControlWord(t.GetID(InputControl));
+    InputLine line{in.ID().Text(), *in.Label() ? std::string(in.Label()) : in.Name(), TypeWord(in.DataType()), {}, {}};
+    std::vector<std::string> parts;
+    if (t.Has(InputControl)) line.type += ", " + ControlWord(t.GetID(InputControl));
     if (IsImageDataType(in.DataType())) {
-        line += in.IsRequired() ? ", required" : ", optional";
-        if (in.MainIndex()) line += ", connector " + std::to_string(in.MainIndex());
+        parts.push_back(in.IsRequired() ? "required" : "optional");
+        if (in.MainIndex()) parts.push_back("connector " + std::to_string(in.MainIndex()));
     } else {
-        line += ", default " + ValueText(in.Default());
+        parts.push_back("default " + ValueText(in.Default()));
     }
-    if (t.Has(InputMinAllowed) || t.Has(InputMaxAllowed)) {
-        line += ", limits ";
-        line += t.Has(InputMinAllowed) ? ScriptVal(t.GetDouble(InputMinAllowed)).ToText() : "-inf";
-        line += "..";
-        line += t.Has(InputMaxAllowed) ? ScriptVal(t.GetDouble(InputMaxAllowed)).ToText() : "inf";
-    }
+    if (t.Has(InputMinAllowed) || t.Has(InputMaxAllowed))
+        parts.push_back("limits " +
+                        (t.Has(InputMinAllowed) ? ScriptVal(t.GetDouble(InputMinAllowed)).ToText() : "-inf") + ".." +
+                        (t.Has(InputMaxAllowed) ? ScriptVal(t.GetDouble(InputMaxAllowed)).ToText() : "inf"));
     if (t.Has(InputSliderLow) || t.Has(InputSliderHigh))
-        line += ", slider " + ScriptVal(t.GetDouble(InputSliderLow, 0.0)).ToText() + ".." +
-                ScriptVal(t.GetDouble(InputSliderHigh, 1.0)).ToText();
-    if (in.IsInteger()) line += ", integer";
-    if (in.IsPassive()) line += ", passive";
-    if (!in.IsVisible()) line += ", hidden";
-    if (!in.IsExternal()) line += ", not animatable";
-    if (in.Priority() != 0 && in.Priority() != PriorityImage) line += ", priority " + std::to_string(in.Priority());
-    fmt::print("{}\n", line);
-    const auto items = t.FindAll(ListAddItem);
-    const auto ids = t.FindAll(ListItemId);
-    if (!items.empty()) {
-        std::string list = "      choices: ";
-        for (size_t i = 0; i < items.size(); ++i) {
-            if (i) list += ", ";
-            list += std::string("\"") + items[i]->AsText() + "\"";
-            if (i < ids.size())
-                list += std::string(" (") + ids[i]->AsID().Text() + ")";
-            else if (in.DataType() == CLSID_DataType_Number)
-                list += " (" + std::to_string(i) + ")";
+        parts.push_back("slider " + ScriptVal(t.GetDouble(InputSliderLow, 0.0)).ToText() + ".." +
+                        ScriptVal(t.GetDouble(InputSliderHigh, 1.0)).ToText());
+    if (in.IsInteger()) parts.push_back("integer");
+    if (in.IsPassive()) parts.push_back("passive");
+    if (!in.IsVisible()) parts.push_back("hidden");
+    if (!in.IsExternal()) parts.push_back("not animatable");
+    if (in.Priority() != 0 && in.Priority() != PriorityImage)
+        parts.push_back("priority " + std::to_string(in.Priority()));
+    for (const std::string &p : parts) line.details += (line.details.empty() ? "" : ", ") + p;
+    const auto choices = InputChoices(&in);
+    for (size_t i = 0; i < choices.size(); ++i)
+        line.choices.push_back("\"" + choices[i].label + "\" (" +
+                               (choices[i].id.empty() ? std::to_string(i) : choices[i].id) + ")");
+    return line;
+}
+
+void PrintInput(const InputLine &in) {
+    std::string line = "  " + in.id;
+    line.resize(std::max<size_t>(line.size() + 1, 30), ' ');
+    line += "\"" + in.label + "\"";
+    line.resize(std::max<size_t>(line.size() + 1, 58), ' ');
+    fmt::print("{}{}, {}\n", line, in.type, in.details);
+    if (in.choices.empty()) return;
+    std::string list = "      choices: ";
+    for (size_t i = 0; i < in.choices.size(); ++i) list += (i ? ", " : "") + in.choices[i];
+    fmt::print("{}\n", list);
+}
+
+/// Markdown table cells must not hold '|' or line breaks.
+std::string Cell(std::string text) {
+    std::string out;
+    for (char c : text) out += c == '|' ? std::string("\\|") : c == '\n' ? std::string(" ") : std::string(1, c);
+    return out;
+}
+
+void PrintMarkdown(const Registry &row, const Operator *op) {
+    const TagList &t = row.Tags();
+    fmt::print("# {} (`{}`)\n\n", row.DisplayName(), row.ID().Text());
+    if (const char *help = t.GetText(RegHelp)) fmt::print("{}\n\n", help);
+    fmt::print("| | |\n|---|---|\n");
+    fmt::print("| Kind | {} |\n", KindWord(row.TypeFlags()));
+    if (const char *category = t.GetText(RegCategory)) fmt::print("| Category | {} |\n", Cell(category));
+    if (const std::string a = Joined(t, RegAlias); !a.empty()) fmt::print("| Also named | {} |\n", Cell(a));
+    fmt::print("| Attributes | {} |\n", Attributes(row));
+    fmt::print("| Built | {} |\n", BuiltWord(row));
+    if (!op) return;
+    int page = -2;
+    for (const auto &in : op->Inputs()) {
+        if (in->Page() != page) {
+            page = in->Page();
+            const auto &pages = op->Pages();
+            fmt::print("\n## Page \"{}\"\n\n| ID | Label | Type | Details |\n|---|---|---|---|\n",
+                       page >= 0 && page < static_cast<int>(pages.size()) ? pages[page].name : std::string("Controls"));
         }
-        fmt::print("{}\n", list);
+        const InputLine line = DescribeInput(*in);
+        std::string details = line.details;
+        if (!line.choices.empty()) {
+            details += "; choices: ";
+            for (size_t i = 0; i < line.choices.size(); ++i) details += (i ? ", " : "") + line.choices[i];
+        }
+        fmt::print("| `{}` | {} | {} | {} |\n", line.id, Cell(line.label), Cell(line.type), Cell(details));
     }
+    fmt::print("\n## Outputs\n\n| ID | Type |\n|---|---|\n");
+    for (const auto &out : op->Outputs()) fmt::print("| `{}` | {} |\n", out->ID().Text(), TypeWord(out->DataType()));
 }
 
 } // namespace
@@ -171,15 +232,15 @@ int RunTools(const std::vector<std::string> &args) {
     LoadLibrary();
     std::vector<const Registry *> rows = ClassRegistry ? ClassRegistry->Rows() : std::vector<const Registry *>{};
     std::sort(rows.begin(), rows.end(), [](const Registry *a, const Registry *b) { return a->ID() < b->ID(); });
-    fmt::print("{:<28} {:<30} {:<16} {:<8} {:<16} {}\n", "CLASS", "NAME", "KIND", "FLAGS", "CATEGORY", "BUILT");
+    fmt::print("{:<28} {:<30} {:<16} {:<28} {:<16} {}\n", "CLASS", "NAME", "KIND", "ATTRIBUTES", "CATEGORY", "BUILT");
     size_t shown = 0;
     for (const Registry *row : rows) {
         if (!search.empty() && !Matches(*row, search)) continue;
         // Abstract bases and hidden classes are no one's tools; --all shows them too.
         if (!all && (row->TypeFlags() == 0 || row->Tags().GetBool(RegHidden))) continue;
         const char *category = row->Tags().GetText(RegCategory, "-");
-        fmt::print("{:<28} {:<30} {:<16} {:<8} {:<16} {}\n", row->ID().Text(), row->DisplayName(),
-                   KindWord(row->TypeFlags()).c_str(), row->TypeFlags(), category, BuiltWord(*row));
+        fmt::print("{:<28} {:<30} {:<16} {:<28} {:<16} {}\n", row->ID().Text(), row->DisplayName(),
+                   KindWord(row->TypeFlags()), Attributes(*row), category, BuiltWord(*row));
         ++shown;
     }
     fmt::print("{} classes\n", shown);
@@ -187,12 +248,32 @@ int RunTools(const std::vector<std::string> &args) {
 }
 
 int RunDescribe(const std::vector<std::string> &args) {
-    if (args.size() != 1) throw CliError(ExitUsage, "describe: expected one class name");
+    std::vector<std::string> names;
+    bool markdown = false;
+    for (const std::string &a : args) {
+        if (a == "--markdown")
+            markdown = true;
+        else if (a.rfind("--", 0) == 0)
+            throw CliError(ExitUsage, "describe: unknown option " + a);
+        else
+            names.push_back(a);
+    }
+    if (names.size() != 1) throw CliError(ExitUsage, "describe: expected one class name");
     LoadLibrary();
-    const Registry &row = FindClass(args[0]);
+    const Registry &row = FindClass(names[0]);
+    OrvaneDoc doc;
+    Operator *op = nullptr;
+    if ((row.TypeFlags() & RegKindOperator) && row.CanCreate()) {
+        op = doc.AddTool(row.ID(), "Describe1");
+        if (!op) throw CliError(ExitFailed, std::string("cannot make a ") + row.ID().Text());
+    }
+    if (markdown) {
+        PrintMarkdown(row, op);
+        return ExitOk;
+    }
     const TagList &t = row.Tags();
-    fmt::print("{}: \"{}\" ({}, kind {})\n", row.ID().Text(), row.DisplayName(), KindWord(row.TypeFlags()),
-               row.TypeFlags());
+    fmt::print("{}: \"{}\" ({}; attributes: {})\n", row.ID().Text(), row.DisplayName(), KindWord(row.TypeFlags()),
+               Attributes(row));
     auto field = [&t](const char *label, Tag tag) {
         if (const char *text = t.GetText(tag)) fmt::print("  {:<14} {}\n", label, text);
     };
@@ -206,12 +287,8 @@ int RunDescribe(const std::vector<std::string> &args) {
     if (const std::string a = Joined(t, RegAlias); !a.empty()) fmt::print("  {:<14} {}\n", "aliases:", a);
     if (const std::string o = Joined(t, RegOldClassId); !o.empty()) fmt::print("  {:<14} {}\n", "old IDs:", o);
     fmt::print("  {:<14} {}\n", "built:", BuiltWord(row));
-    if (!(row.TypeFlags() & RegKindOperator) || !row.CanCreate()) return ExitOk;
-
-    OrvaneDoc doc;
-    Operator *op = doc.AddTool(row.ID(), "Describe1");
-    if (!op) throw CliError(ExitFailed, std::string("cannot make a ") + row.ID().Text());
-    int page = -1;
+    if (!op) return ExitOk;
+    int page = -2;
     for (const auto &in : op->Inputs()) {
         if (in->Page() != page) {
             page = in->Page();
@@ -219,7 +296,7 @@ int RunDescribe(const std::vector<std::string> &args) {
             fmt::print("\npage \"{}\"\n",
                        page >= 0 && page < static_cast<int>(pages.size()) ? pages[page].name : std::string("Controls"));
         }
-        PrintInput(*in);
+        PrintInput(DescribeInput(*in));
     }
     fmt::print("\noutputs\n");
     for (const auto &out : op->Outputs()) fmt::print("  {:<28} {}\n", out->ID().Text(), TypeWord(out->DataType()));

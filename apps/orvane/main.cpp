@@ -1,59 +1,115 @@
 // orvane: the command line over the Orvane host.
+#include <algorithm>
 #include <cstdio>
 #include <cstring>
+#include <pthread.h>
 #include <string>
 #include <vector>
 
 #include "apps/orvane/Cli.h"
+#include "host/core/Suggest.h"
 
+namespace Orvane::Cli {
 namespace {
 
-const char *const Usage = R"(usage: orvane COMMAND [ARGS]
+struct Command {
+    const char *name;
+    int (*run)(const std::vector<std::string> &);
+    const char *usage; ///< first line: the synopsis; then what it does and its options
+};
 
-commands:
-  tools [--search WORD] [--all]  list the classes (class ID, name, kind, category, built);
-                                 --all adds abstract bases and hidden classes
-  describe CLASS                 show a class's pages and inputs
-  eval FLOW TOOL[.OUTPUT] [--time T] [--roi x0,y0,x1,y1] [--pixel X,Y ...]
-       [--set TOOL.INPUT=VALUE ...] [--threads N] [--device D] [--json]
-                                 evaluate one output of a flow document and print what it holds
-  render FLOW [--frames SPEC] [--chunk I/N] [--saver NAME ...] [--set TOOL.INPUT=VALUE ...]
-         [--threads N] [--device D] [--memory-limit SIZE] [--proxy N] [--skip-existing]
-         [--log-format text|json]
-                                 render the flow's Savers frame by frame (default: the document's
-                                 render range); SPEC like 1-100, 1-100x2, 1,5,10-20, 10-1, -23--5;
-                                 SIZE like 512M or 8G; Ctrl-C stops after the current frame
-                                 D: cpu, auto, opencl or cuda (default: the document's UseGPU
-                                 preference, else cpu); a failed device run falls back to the CPU
-  info FILE...                   what the formats read from files or sequences
-                                 (format, size, depth, windows, frames and gaps)
-  version                        print the program version
+int RunVersion(const std::vector<std::string> &) {
+    std::printf("orvane %s\n", ORVANE_VERSION);
+    return ExitOk;
+}
 
-exit codes: 0 done, 2 bad command line or document, 3 a tool or frame failed, 130 interrupted
-)";
+const Command kCommands[] = {
+    {"render", RunRender, R"(orvane render FLOW [options]
+  Renders the flow's Savers frame by frame and writes their files.
+  --frames SPEC         frames to render: 1-100, 1-100x2, 1,5,10-20, 10-1, -23--5
+                        (default: the document's render range)
+  --chunk I/N           the I-th of N equal pieces of the frame list (job arrays)
+  --saver NAME          render only this Saver (repeatable)
+  --set TOOL.INPUT=VALUE  change a value for this render (repeatable)
+  --threads N           worker threads
+  --device D            cpu, auto, opencl or cuda (default: the document's UseGPU
+                        preference, else cpu); a failed device run falls back to the CPU
+  --memory-limit SIZE   bound the process's image memory: 512M, 8G
+  --proxy N             render at 1/N size
+  --skip-existing       leave frames whose file exists
+  --lenient             render a document with problems, taking them as warnings
+  --log-format text|json  one line per event; json: one object per event
+  Ctrl-C stops after the frame in hand; a second Ctrl-C stops at once.
+  Exit: 0 all written, 2 bad command line or document, 3 a frame failed, 130 interrupted.
+)"},
+    {"eval", RunEval, R"(orvane eval FLOW TOOL[.OUTPUT] [options]
+  Evaluates one output of a flow and prints its size, windows, depth, channel
+  statistics, the pixels asked for and the console lines. Savers write nothing.
+  --time T              the time to evaluate (default: the render range's start)
+  --roi x0,y0,x1,y1     the region to evaluate
+  --pixel X,Y ...       print these pixels
+  --set TOOL.INPUT=VALUE  change a value (repeatable)
+  --threads N, --device D, --lenient as for render
+  --json                one JSON object
+  Exit: 0 done, 2 bad command line or document, 3 a tool failed.
+)"},
+    {"check", RunCheck, R"(orvane check FLOW... [--lenient]
+  Checks flow documents and lists every problem with its line and column.
+  Exit: 0 no errors, 2 errors found.
+)"},
+    {"new", RunNew, R"(orvane new FLOW [--force]
+  Writes an empty flow document (--force replaces an existing file).
+)"},
+    {"add", RunAdd, R"(orvane add FLOW CLASS NAME [INPUT=VALUE ...]
+  Adds a tool of CLASS (an ID, alias or name as orvane tools lists it) named
+  NAME, with the values given, and saves the flow.
+)"},
+    {"set", RunSetCommand, R"(orvane set FLOW TOOL.INPUT=VALUE ...
+  Sets inputs and saves the flow. VALUE is a number, a choice name, "text",
+  { x, y }, Curve { { time, value }, ... }, Tool.Output (a link), or for text,
+  file and ID inputs any text as it stands.
+)"},
+    {"connect", RunConnect, R"(orvane connect FLOW TOOL.INPUT=OTHER[.OUTPUT] ...
+  Links an input to another tool's output (its main output when none is named)
+  and saves the flow.
+)"},
+    {"remove", RunRemove, R"(orvane remove FLOW TOOL...
+  Removes tools (their links go with them) and saves the flow.
+)"},
+    {"tools", RunTools, R"(orvane tools [--search WORD] [--all]
+  Lists the classes: ID, name, kind, attributes, category, whether built.
+  --all adds abstract bases and hidden classes.
+)"},
+    {"describe", RunDescribe, R"(orvane describe CLASS [--markdown]
+  Shows a class's pages, inputs (type, control, default, limits, choices) and
+  outputs. --markdown prints its reference page.
+)"},
+    {"info", RunInfo, R"(orvane info FILE...
+  What the formats read from files: format, size, channels, depth, windows.
+)"},
+    {"version", RunVersion, R"(orvane version
+  Prints the program version (also orvane --version).
+)"},
+};
 
-} // namespace
+std::string Synopsis(const Command &c) {
+    const char *eol = std::strchr(c.usage, '\n');
+    return std::string(c.usage, eol ? static_cast<size_t>(eol - c.usage) : std::strlen(c.usage));
+}
 
-int main(int argc, char **argv) {
-    using namespace Orvane::Cli;
-    std::vector<std::string> args(argv + 1, argv + argc);
-    if (args.empty() || args[0] == "--help" || args[0] == "-h" || args[0] == "help") {
-        std::fputs(Usage, args.empty() ? stderr : stdout);
-        return args.empty() ? ExitUsage : ExitOk;
-    }
-    const std::string command = args[0];
-    args.erase(args.begin());
+void PrintUsage(std::FILE *to) {
+    std::fputs("usage: orvane COMMAND [ARGS]   (orvane COMMAND --help for details)\n\ncommands:\n", to);
+    for (const Command &c : kCommands) std::fprintf(to, "  %s\n", Synopsis(c).c_str());
+    std::fputs("\nexit codes: 0 done, 2 bad command line or document, 3 a tool or frame failed, 130 interrupted\n", to);
+}
+
+bool AsksForHelp(const std::vector<std::string> &args) {
+    return std::any_of(args.begin(), args.end(), [](const std::string &a) { return a == "--help" || a == "-h"; });
+}
+
+int RunCaught(const Command &c, const std::vector<std::string> &args) {
     try {
-        if (command == "tools") return RunTools(args);
-        if (command == "describe") return RunDescribe(args);
-        if (command == "eval") return RunEval(args);
-        if (command == "info") return RunInfo(args);
-        if (command == "render") return RunRender(args);
-        if (command == "version") {
-            std::printf("orvane %s\n", ORVANE_VERSION);
-            return ExitOk;
-        }
-        throw CliError(ExitUsage, "unknown command '" + command + "' (try orvane --help)");
+        return c.run(args);
     } catch (const CliError &e) {
         std::fprintf(stderr, "ERROR: %s\n", e.what());
         return e.exitCode;
@@ -61,4 +117,74 @@ int main(int argc, char **argv) {
         std::fprintf(stderr, "ERROR: %s\n", e.what());
         return ExitFailed;
     }
+}
+
+/// Runs a command on a thread with a deep stack: the engine walks a flow by recursion, about a kilobyte per tool
+/// of depth, and a flow may be a chain of many thousands of tools. The stack is reserved address space; only what
+/// a walk touches takes memory.
+int RunOnDeepStack(const Command &c, const std::vector<std::string> &args) {
+    constexpr size_t kStackBytes = size_t(256) << 20;
+    struct Job {
+        const Command &command;
+        const std::vector<std::string> &args;
+        int status = ExitFailed;
+    } job{c, args};
+    pthread_attr_t attr;
+    pthread_t thread;
+    const bool made = pthread_attr_init(&attr) == 0 && pthread_attr_setstacksize(&attr, kStackBytes) == 0 &&
+                      pthread_create(
+                          &thread, &attr,
+                          [](void *p) -> void * {
+                              auto *j = static_cast<Job *>(p);
+                              j->status = RunCaught(j->command, j->args);
+                              return nullptr;
+                          },
+                          &job) == 0;
+    pthread_attr_destroy(&attr);
+    if (!made) return RunCaught(c, args);
+    pthread_join(thread, nullptr);
+    return job.status;
+}
+
+} // namespace
+
+const char *CommandUsage(const std::string &command) {
+    for (const Command &c : kCommands)
+        if (command == c.name) return c.usage;
+    return "";
+}
+
+} // namespace Orvane::Cli
+
+int main(int argc, char **argv) {
+    using namespace Orvane::Cli;
+    std::vector<std::string> args(argv + 1, argv + argc);
+    if (args.empty()) {
+        PrintUsage(stdout);
+        return ExitUsage;
+    }
+    std::string command = args[0];
+    args.erase(args.begin());
+    if (command == "--help" || command == "-h" || command == "help") {
+        if (!args.empty() && *CommandUsage(args[0])) {
+            std::fputs(CommandUsage(args[0]), stdout);
+        } else {
+            PrintUsage(stdout);
+        }
+        return ExitOk;
+    }
+    if (command == "--version") command = "version";
+    for (const Command &c : kCommands) {
+        if (command != c.name) continue;
+        if (AsksForHelp(args)) {
+            std::fputs(c.usage, stdout);
+            return ExitOk;
+        }
+        return RunOnDeepStack(c, args);
+    }
+    std::vector<std::string> names;
+    for (const Command &c : kCommands) names.push_back(c.name);
+    std::fprintf(stderr, "ERROR: unknown command '%s'%s (see orvane --help)\n", command.c_str(),
+                 Orvane::DidYouMean(command, names).c_str());
+    return ExitUsage;
 }

@@ -3,11 +3,13 @@
 #include <cctype>
 #include <unordered_set>
 
+#include "host/flow/OrvaneDoc.h"
+
 namespace Orvane {
 namespace {
 
 /// Largest number of frames one list may name: guards against "1-1e18".
-constexpr int64_t MaxFrames = 10'000'000;
+constexpr int64_t MaxFrames = MaxFramesInRange;
 
 bool ReadNumber(const std::string &s, size_t &at, int64_t &value) {
     const size_t start = at;

@@ -1,5 +1,7 @@
 #include "host/core/Registry.h"
 
+#include <strings.h>
+
 #include <algorithm>
 
 #include "host/core/ScriptVal.h"
@@ -114,6 +116,17 @@ const Registry *RegistryList::Find(const OvID &id, uint32_t type) const {
     if (!row || !row->enabled_) return nullptr;
     if (type && !row->IsRegClassType(type)) return nullptr;
     return row;
+}
+
+const Registry *RegistryList::FindByName(const std::string &name) const {
+    if (const Registry *row = Find(OvID(name))) return row;
+    auto same = [&name](const char *text) { return text && strcasecmp(text, name.c_str()) == 0; };
+    for (const Registry *row : Rows()) {
+        for (const TagItem *alias : row->Tags().FindAll(RegAlias))
+            if (same(alias->AsText())) return row;
+        if (same(row->ClassName()) || same(row->DisplayName())) return row;
+    }
+    return nullptr;
 }
 
 Object *RegistryList::New(const OvID &id, uint32_t type, OrvaneDoc *doc) const {

@@ -77,6 +77,9 @@ public:
     /// Finds a row by class ID, then by old class ID. A non-zero `type`
     /// requires IsRegClassType(type). Disabled rows are not found.
     const Registry *Find(const OvID &id, uint32_t type = 0) const;
+    /// Finds a row by any name a user may give a class: its ID or an old ID,
+    /// then (ignoring case) an alias, its class word or its display name.
+    const Registry *FindByName(const std::string &name) const;
     /// Finds and makes; null when the class is unknown or cannot be made.
     Object *New(const OvID &id, uint32_t type, OrvaneDoc *doc) const;
 

@@ -6,8 +6,10 @@
 #include <cstdint>
 #include <cstdio>
 #include <cstring>
+#include <functional>
 #include <limits>
 #include <unordered_map>
+#include <unordered_set>
 
 namespace Orvane {
 namespace scriptval_impl {
@@ -126,6 +128,15 @@ void WriteKey(std::string &out, const ScriptVal &key) {
     out += " = ";
 }
 
+// A key as messages name it: 'Gain', [3], ["two words"].
+std::string KeyText(const ScriptVal &key) {
+    if (key.IsText() && IsName(key.AsText())) return "'" + key.AsText() + "'";
+    std::string out;
+    WriteKey(out, key);
+    out.resize(out.size() - 3); // the " = "
+    return out;
+}
+
 // Number of leading entries whose keys are 1, 2, ... in order; these are written without keys.
 size_t LeadingArray(const std::vector<ScriptVal::Entry> &entries) {
     size_t n = 0;
@@ -135,12 +146,21 @@ size_t LeadingArray(const std::vector<ScriptVal::Entry> &entries) {
 
 void WriteValue(std::string &out, const ScriptVal &v, int indent);
 
+// A value's comments, one line each at the indentation (the lines inside a long comment stay as written).
+void WriteComments(std::string &out, const ScriptVal &v, int indent) {
+    for (const std::string &comment : v.Comments()) {
+        out.append(static_cast<size_t>(indent), '\t');
+        out += comment;
+        out += '\n';
+    }
+}
+
 // Writes `{ a, b, k = v }` if the table holds only scalars and fits the one-line limit; returns false otherwise,
 // leaving out as it was.
 bool WriteOneLine(std::string &out, const ScriptVal &table) {
     const auto &entries = table.Entries();
     for (const auto &e : entries)
-        if (e.second.IsTable()) return false;
+        if (e.second.IsTable() || !e.second.Comments().empty() || !e.second.TrailingComment().empty()) return false;
     const size_t start = out.size();
     const size_t limit = start + kOneLineLimit;
     if (!table.ClassName().empty()) {
@@ -185,10 +205,16 @@ void WriteTable(std::string &out, const ScriptVal &table, int indent) {
     out += "{\n";
     const size_t array = LeadingArray(entries);
     for (size_t i = 0; i < entries.size(); ++i) {
+        WriteComments(out, entries[i].second, indent + 1);
         out.append(static_cast<size_t>(indent + 1), '\t');
         if (i >= array) WriteKey(out, entries[i].first);
         WriteValue(out, entries[i].second, indent + 1);
-        out += ",\n";
+        out += ',';
+        if (!entries[i].second.TrailingComment().empty()) {
+            out += ' ';
+            out += entries[i].second.TrailingComment();
+        }
+        out += '\n';
     }
     out.append(static_cast<size_t>(indent), '\t');
     out += '}';
@@ -213,11 +239,13 @@ void WriteValue(std::string &out, const ScriptVal &v, int indent) {
 struct Token {
     enum Kind { End, Name, Number, String, Symbol };
     Kind kind = End;
-    size_t pos = 0;        // byte offset of the first character
-    std::string_view name; // Name: the identifier
-    double number = 0.0;   // Number
-    std::string text;      // String: the decoded contents
-    char symbol = 0;       // Symbol: the character
+    size_t pos = 0;                    // byte offset of the first character
+    std::vector<std::string> comments; // the comments on the lines before the token
+    std::string trailing;              // a comment on the line of the token before
+    std::string_view name;             // Name: the identifier
+    double number = 0.0;               // Number
+    std::string text;                  // String: the decoded contents
+    char symbol = 0;                   // Symbol: the character
 };
 
 std::string Describe(const Token &t) {
@@ -261,6 +289,8 @@ std::string IndexKey(const ScriptVal &key) {
 class TableBuilder {
 public:
     std::vector<ScriptVal::Entry> entries;
+    // Called with the earlier key and the new one when a key is given again.
+    std::function<void(const ScriptVal &, const ScriptVal &)> onRepeat;
 
     void Positional(ScriptVal value) {
         ++positional_;
@@ -303,6 +333,7 @@ private:
             const auto it = index_.find(k);
             if (it != index_.end()) {
                 const size_t at = it->second;
+                if (onRepeat) onRepeat(entries[at].first, key);
                 if (value.IsNil()) {
                     removed_ = true;
                     index_.erase(it);
@@ -317,6 +348,7 @@ private:
         }
         for (auto &e : entries) {
             if (!e.second.IsNil() && e.first == key) {
+                if (onRepeat) onRepeat(e.first, key);
                 if (value.IsNil()) removed_ = true;
                 e.second = std::move(value);
                 return;
@@ -330,13 +362,15 @@ private:
 // may fill a table's storage directly.
 template <class Make> class Reader {
 public:
-    explicit Reader(std::string_view src) : src_(src) {}
+    Reader(std::string_view src, std::vector<ScriptParseError> *notes) : src_(src), notes_(notes) {}
 
     ScriptVal Document() {
         Next();
+        std::vector<std::string> leading = std::move(cur_.comments);
         const bool hasReturn = cur_.kind == Token::Name && cur_.name == "return";
         if (hasReturn) Next();
         ScriptVal v = Value();
+        v.SetComments(std::move(leading));
         if (hasReturn && IsSymbol(';')) Next();
         if (cur_.kind != Token::End) {
             if (cur_.kind == Token::Symbol) Fail(cur_.pos, "unexpected " + Describe(cur_));
@@ -347,18 +381,26 @@ public:
 
 private:
     std::string_view src_;
+    std::vector<ScriptParseError> *notes_;
     size_t p_ = 0; // lexer position
     Token cur_, ahead_;
     bool hasAhead_ = false;
     int depth_ = 0;
+    std::vector<std::string> pendingComments_; // skipped since the last token
+    std::string pendingTrailing_;              // a comment on the last token's line
+    bool lexedAny_ = false;
+    // The last position worked out; positions are mostly asked in increasing order.
+    size_t knownOffset_ = 0;
+    int knownLine_ = 1, knownColumn_ = 1;
 
     // ---- positions and errors ----
 
     // Line and column of a byte offset. Columns count characters: UTF-8 continuation bytes do not advance them.
-    std::pair<int, int> Position(size_t offset) const {
-        int line = 1, column = 1;
+    std::pair<int, int> Position(size_t offset) {
         offset = std::min(offset, src_.size());
-        for (size_t i = 0; i < offset; ++i) {
+        if (offset < knownOffset_) knownOffset_ = 0, knownLine_ = 1, knownColumn_ = 1;
+        int line = knownLine_, column = knownColumn_;
+        for (size_t i = knownOffset_; i < offset; ++i) {
             const unsigned char c = static_cast<unsigned char>(src_[i]);
             if (c == '\n' || (c == '\r' && (i + 1 >= src_.size() || src_[i + 1] != '\n'))) {
                 ++line;
@@ -367,10 +409,17 @@ private:
                 ++column;
             }
         }
+        knownOffset_ = offset, knownLine_ = line, knownColumn_ = column;
         return {line, column};
     }
 
-    [[noreturn]] void Fail(size_t offset, const std::string &message) const {
+    ScriptVal Placed(ScriptVal v, size_t offset) {
+        const auto [line, column] = Position(offset);
+        Make::Place(v, line, column);
+        return v;
+    }
+
+    [[noreturn]] void Fail(size_t offset, const std::string &message) {
         const auto [line, column] = Position(offset);
         throw ScriptParseError(line, column, message);
     }
@@ -421,10 +470,21 @@ private:
         }
     }
 
+    // A comment that starts on the line of the token before belongs to that token's entry.
+    void KeepComment(size_t start, bool afterLineBreak) {
+        std::string text(src_.substr(start, p_ - start));
+        if (!afterLineBreak && lexedAny_ && pendingTrailing_.empty() && pendingComments_.empty())
+            pendingTrailing_ = std::move(text);
+        else
+            pendingComments_.push_back(std::move(text));
+    }
+
     void SkipSpace() {
+        bool newLine = false;
         while (p_ < src_.size()) {
             const char c = src_[p_];
             if (c == ' ' || c == '\t' || c == '\n' || c == '\r' || c == '\v' || c == '\f') {
+                if (c == '\n' || c == '\r') newLine = true;
                 ++p_;
             } else if (c == '-' && At(p_ + 1) == '-') {
                 const size_t start = p_;
@@ -433,10 +493,12 @@ private:
                     const int level = LongBracketLevel(p_);
                     if (level >= 0) {
                         LongBracket(p_, level, "unfinished long comment", start);
+                        KeepComment(start, newLine);
                         continue;
                     }
                 }
                 while (p_ < src_.size() && src_[p_] != '\n' && src_[p_] != '\r') ++p_;
+                KeepComment(start, newLine);
             } else {
                 break;
             }
@@ -589,6 +651,11 @@ private:
 
     void Lex(Token &t) {
         SkipSpace();
+        t.comments = std::move(pendingComments_);
+        pendingComments_.clear();
+        t.trailing = std::move(pendingTrailing_);
+        pendingTrailing_.clear();
+        lexedAny_ = true;
         t.pos = p_;
         if (p_ >= src_.size()) {
             t.kind = Token::End;
@@ -639,6 +706,14 @@ private:
     // ---- grammar ----
 
     ScriptVal Value() {
+        // The place first: positions are worked out moving forward through the text.
+        const auto [line, column] = Position(cur_.pos);
+        ScriptVal v = UnplacedValue();
+        Make::Place(v, line, column);
+        return v;
+    }
+
+    ScriptVal UnplacedValue() {
         switch (cur_.kind) {
         case Token::Number: return NumberValue(cur_.number);
         case Token::String: {
@@ -717,7 +792,20 @@ private:
         if (++depth_ > kMaxDepth) Fail(open, "nesting too deep");
         Next();
         TableBuilder fields;
+        if (notes_)
+            fields.onRepeat = [this](const ScriptVal &first, const ScriptVal &again) {
+                notes_->emplace_back(again.Line(), again.Column(),
+                                     KeyText(again) + " is given twice (first at line " + std::to_string(first.Line()) +
+                                         ")");
+            };
         while (!IsSymbol('}')) {
+            // Comments before the entry; one after the '{' on its line counts as one before the first entry.
+            std::vector<std::string> comments;
+            if (!cur_.trailing.empty()) comments.push_back(std::move(cur_.trailing));
+            for (std::string &c : cur_.comments) comments.push_back(std::move(c));
+            cur_.comments.clear();
+            cur_.trailing.clear();
+            const size_t before = fields.entries.size();
             if (IsSymbol('[')) {
                 Next();
                 ScriptVal key = Key();
@@ -728,17 +816,21 @@ private:
                 fields.Keyed(std::move(key), Value());
             } else if (cur_.kind == Token::Name && !IsKeyword(cur_.name) && Peek().kind == Token::Symbol &&
                        Peek().symbol == '=') {
-                ScriptVal key{std::string(cur_.name)};
+                ScriptVal key = Placed(ScriptVal(std::string(cur_.name)), cur_.pos);
                 Next();
                 Next();
                 fields.Keyed(std::move(key), Value());
             } else {
                 fields.Positional(Value());
             }
-            if (IsSymbol(',') || IsSymbol(';')) {
-                Next();
-                continue;
-            }
+            ScriptVal *entry = fields.entries.size() > before ? &fields.entries.back().second : nullptr;
+            if (entry && !comments.empty()) entry->SetComments(std::move(comments));
+            const bool separated = IsSymbol(',') || IsSymbol(';');
+            if (separated) Next();
+            // A comment after the value (and its comma) on the same line.
+            if (entry && !cur_.trailing.empty()) entry->SetTrailingComment(std::move(cur_.trailing));
+            cur_.trailing.clear();
+            if (separated) continue;
             if (IsSymbol('}')) break;
             if (cur_.kind == Token::Symbol && cur_.symbol != '{' && cur_.symbol != '[')
                 Fail(cur_.pos, "unexpected " + Describe(cur_));
@@ -785,6 +877,28 @@ ScriptVal ScriptVal::Ref(std::string path) {
     v.type_ = Type::ObjectRef;
     v.text_ = std::move(path);
     return v;
+}
+
+const std::vector<std::string> &ScriptVal::Comments() const {
+    static const std::vector<std::string> none;
+    return notes_ ? notes_->before : none;
+}
+
+const std::string &ScriptVal::TrailingComment() const {
+    static const std::string none;
+    return notes_ ? notes_->after : none;
+}
+
+void ScriptVal::SetComments(std::vector<std::string> comments) {
+    Notes notes = notes_ ? *notes_ : Notes{};
+    notes.before = std::move(comments);
+    notes_ = notes.before.empty() && notes.after.empty() ? nullptr : std::make_shared<const Notes>(std::move(notes));
+}
+
+void ScriptVal::SetTrailingComment(std::string comment) {
+    Notes notes = notes_ ? *notes_ : Notes{};
+    notes.after = std::move(comment);
+    notes_ = notes.before.empty() && notes.after.empty() ? nullptr : std::make_shared<const Notes>(std::move(notes));
 }
 
 const std::vector<ScriptVal::Entry> &ScriptVal::Entries() const {
@@ -934,6 +1048,7 @@ bool operator==(const ScriptVal &a, const ScriptVal &b) {
 
 std::string ScriptVal::ToText(int indent) const {
     std::string out;
+    scriptval_impl::WriteComments(out, *this, std::max(indent, 0));
     scriptval_impl::WriteValue(out, *this, std::max(indent, 0));
     return out;
 }
@@ -956,12 +1071,32 @@ public:
         v.table_ = std::make_shared<std::vector<Entry>>(std::move(entries));
         return v;
     }
+    static void Place(ScriptVal &v, int line, int column) {
+        v.line_ = line;
+        v.column_ = column;
+    }
 };
 
-ScriptVal ScriptVal::FromText(std::string_view text) {
+ScriptVal ScriptVal::TableOf(std::string className, std::vector<Entry> entries) {
+    if (!className.empty()) scriptval_impl::CheckPath(className, "class name");
+    std::unordered_set<std::string> keys;
+    keys.reserve(entries.size());
+    for (const Entry &e : entries) {
+        if (!scriptval_impl::ValidKey(e.first) || e.second.IsNil())
+            throw std::invalid_argument("ScriptVal::TableOf: invalid key or nil value");
+        if (!keys.insert(scriptval_impl::IndexKey(e.first)).second)
+            throw std::invalid_argument("ScriptVal::TableOf: key " + e.first.ToText() + " given twice");
+    }
+    const size_t prefix = scriptval_impl::LeadingArray(entries);
+    return Builder::Table(std::move(className), std::move(entries), prefix);
+}
+
+ScriptVal ScriptVal::FromText(std::string_view text) { return FromText(text, nullptr); }
+
+ScriptVal ScriptVal::FromText(std::string_view text, std::vector<ScriptParseError> *notes) {
     // A UTF-8 byte order mark, as some editors write, is not part of the document.
     if (text.substr(0, 3) == "\xEF\xBB\xBF") text.remove_prefix(3);
-    return scriptval_impl::Reader<Builder>(text).Document();
+    return scriptval_impl::Reader<Builder>(text, notes).Document();
 }
 
 } // namespace Orvane

@@ -10,6 +10,11 @@
 // ever executed. FromText(ToText(v)) == v for every value, numbers included
 // (shortest round-trip form; inf and nan as 1/0, -1/0 and 0/0).
 //
+// Values read from text remember where they stood (line and column) and the
+// comments written just before their table entry (or before the whole text),
+// so documents can point at a problem and keep a writer's notes when saved.
+// Equality ignores both.
+//
 // Thread safety: a ScriptVal is a value; const access from several threads is safe.
 #include <memory>
 #include <stdexcept>
@@ -88,6 +93,23 @@ public:
     /// Appends at the next array index.
     ScriptVal &Append(ScriptVal value);
     bool Remove(const ScriptVal &key);
+    /// A table made from entries at once (linear, where Set one by one is
+    /// quadratic). Throws std::invalid_argument for an invalid or repeated key.
+    static ScriptVal TableOf(std::string className, std::vector<Entry> entries);
+
+    // ---- where a value came from ----
+    /// 1-based line and column of the value's first character in the text it
+    /// was read from; 0 for values made in code.
+    int Line() const { return line_; }
+    int Column() const { return column_; }
+    /// Comments written on the lines before this value's entry in its table,
+    /// or before the whole text for the value FromText returns: each as
+    /// written, from "--". ToText writes them back in the same places.
+    const std::vector<std::string> &Comments() const;
+    void SetComments(std::vector<std::string> comments);
+    /// A comment written after the entry on its own line ("" when none).
+    const std::string &TrailingComment() const;
+    void SetTrailingComment(std::string comment);
 
     friend bool operator==(const ScriptVal &a, const ScriptVal &b);
     friend bool operator!=(const ScriptVal &a, const ScriptVal &b) { return !(a == b); }
@@ -97,6 +119,9 @@ public:
     std::string ToText(int indent = 0) const;
     /// Parses one value (optionally preceded by `return`). Throws ScriptParseError.
     static ScriptVal FromText(std::string_view text);
+    /// The same, reporting what parses but is suspect (a key given twice in
+    /// one table: the later value wins) into `notes` instead of passing it by.
+    static ScriptVal FromText(std::string_view text, std::vector<ScriptParseError> *notes);
 
 private:
     Type type_ = Type::Nil;
@@ -107,6 +132,12 @@ private:
     // Leading entries known to hold the keys 1, 2, ... in order; never more than
     // the true run. Keeps Append and At O(1) on arrays.
     size_t arrayPrefix_ = 0;
+    int line_ = 0, column_ = 0;
+    struct Notes {
+        std::vector<std::string> before;
+        std::string after;
+    };
+    std::shared_ptr<const Notes> notes_; // null for the many values without comments
     void Detach();
     class Builder; // unchecked construction for the parser
 };

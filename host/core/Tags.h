@@ -179,6 +179,9 @@ constexpr Tag SliderRest = 0x20040006;
 constexpr Tag ControlWidth = 0x20040007;
 constexpr Tag ListAddItem = 0x38040000;
 constexpr Tag ListItemId = 0x88030000;
+/// An ID a list input takes besides its entries, without a button of its own:
+/// the setting of an older document, an ID scripts may set.
+constexpr Tag ListAcceptedId = 0x88030001;
 constexpr Tag PageIcon = 0x60000004;
 constexpr Tag ControlFlag0E = 0x1004000e;
 constexpr Tag ControlFlag0F = 0x1004000f;

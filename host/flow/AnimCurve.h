@@ -12,6 +12,7 @@
 //
 // Thread safety: a curve is edited on the main thread and read by renders
 // after; do not edit a curve while a render reads it.
+#include <cmath>
 #include <vector>
 
 #include "host/flow/Parameter.h"
@@ -55,7 +56,9 @@ template <class MakeValue> bool AnimCurve::FromScript(const ScriptVal &v, MakeVa
     AnimCurve curve;
     for (size_t i = 1; i <= v.ArrayLength(); ++i) {
         const ScriptVal *key = v.At(i);
-        if (!key || !key->IsTable() || key->ArrayLength() < 2 || !key->At(1)->IsNumber()) return false;
+        if (!key || !key->IsTable() || key->ArrayLength() < 2 || !key->At(1)->IsNumber() ||
+            !std::isfinite(key->At(1)->AsNumber()))
+            return false;
         Ref<Parameter> value = makeValue(*key->At(2));
         if (!value) return false;
         KeyInterp interp = KeyInterp::Linear;

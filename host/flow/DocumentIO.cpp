@@ -1,13 +1,20 @@
 #include "host/flow/DocumentIO.h"
 
-#include <cstdio>
+#include <algorithm>
+#include <cerrno>
+#include <cmath>
+#include <cstring>
+#include <fcntl.h>
 #include <filesystem>
 #include <fstream>
-#include <sstream>
+#include <limits>
+#include <sys/stat.h>
 #include <unistd.h>
+#include <unordered_map>
 
 #include "host/core/Registry.h"
 #include "host/core/ScriptVal.h"
+#include "host/core/Suggest.h"
 #include "host/core/Tags.h"
 #include "host/flow/DataTypes.h"
 #include "host/flow/InputValue.h"
@@ -22,6 +29,9 @@ namespace Orvane {
 namespace {
 
 constexpr const char *DocumentClass = "Orvane.Document";
+const std::vector<std::string> kTopEntries = {"Version", "Program", "GlobalRange", "RenderRange", "Prefs", "Tools"};
+/// Documents larger than this are refused before reading (a flow of 50,000 tools is a few MiB).
+constexpr size_t kMostDocumentBytes = size_t(512) << 20;
 
 ScriptVal Range(double a, double b) {
     ScriptVal r = ScriptVal::Table();
@@ -30,190 +40,392 @@ ScriptVal Range(double a, double b) {
     return r;
 }
 
-bool ReadRange(const ScriptVal *v, double &a, double &b) {
-    if (!v || !v->IsTable() || v->ArrayLength() != 2 || !v->At(1)->IsNumber() || !v->At(2)->IsNumber()) return false;
-    a = v->At(1)->AsNumber();
-    b = v->At(2)->AsNumber();
-    return true;
-}
-
 /// The document form of one input's value, or nil when it is not saved.
 ScriptVal SavedValue(const Input &in) {
     if (in.Tags().GetBool(LinkNotSaved)) return ScriptVal();
     if (in.Link()) return ScriptVal::Ref(in.Link()->Owner()->Name() + "." + in.Link()->ID().Text());
     if (!in.UnresolvedLink().empty()) return ScriptVal::Ref(in.UnresolvedLink());
     if (in.Curve()) return in.Curve()->ToScript();
-    if (!in.Constant()) return ScriptVal();
-    if (in.IsDefault() && !in.Tags().GetBool(LinkForceSave)) return ScriptVal();
+    if (!in.Constant() || in.IsDefault()) return ScriptVal();
     return in.Constant()->ToScript();
 }
 
-} // namespace
+/// Reads one document into a document, collecting every problem.
+class DocumentReader {
+public:
+    DocumentReader(OrvaneDoc &doc, const DocumentLoadOptions &options, DocumentLoadResult &result)
+        : doc_(doc), options_(options), result_(result) {}
 
-DocumentLoadResult LoadDocument(const std::string &text, OrvaneDoc &doc) {
-    DocumentLoadResult result;
-    ScriptVal root;
-    try {
-        root = ScriptVal::FromText(text);
-    } catch (const ScriptParseError &e) {
-        result.error = e.what();
-        return result;
+    void Read(const std::string &text) {
+        ScriptVal root;
+        std::vector<ScriptParseError> notes;
+        try {
+            root = ScriptVal::FromText(text, &notes);
+        } catch (const ScriptParseError &e) {
+            result_.problems.push_back({true, e.Line(), e.Column(), e.Message()});
+            return;
+        }
+        for (const ScriptParseError &n : notes)
+            result_.problems.push_back({!options_.lenient, n.Line(), n.Column(), n.Message()});
+        if (!root.IsTable() || root.ClassName() != DocumentClass) {
+            Fatal(&root, "not an Orvane document (it must start with Orvane.Document { ... })");
+            return;
+        }
+        KeepComments("", root);
+        ReadHeader(root);
+        const ScriptVal *tools = root.Find("Tools");
+        if (tools && !tools->IsTable()) {
+            Fatal(tools, "Tools must be a table");
+            return;
+        }
+        if (tools) ReadTools(*tools);
     }
-    if (!root.IsTable() || root.ClassName() != DocumentClass) {
-        result.error = "not an Orvane document (it must start with Orvane.Document { ... })";
-        return result;
-    }
-    auto warn = [&result](std::string line) { result.warnings.push_back(std::move(line)); };
 
-    if (const ScriptVal *v = root.Find("Version"); v && v->IsNumber() && v->AsNumber() > DocumentVersion)
-        warn("the document's format version " + ScriptVal(v->AsNumber()).ToText() +
-             " is newer than this program's; parts it does not know are kept as they are");
-    double a, b;
-    if (ReadRange(root.Find("GlobalRange"), a, b)) doc.SetGlobalRange(a, b);
-    if (ReadRange(root.Find("RenderRange"), a, b)) doc.SetRenderRange(a, b);
-    if (const ScriptVal *prefs = root.Find("Prefs"); prefs && prefs->IsTable()) {
-        for (const auto &[key, value] : prefs->Entries()) {
-            int id = -1;
-            for (int i = 0; i < PREF_Count && key.IsText(); ++i)
-                if (key.AsText() == PrefName(static_cast<PrefID>(i))) id = i;
-            if (id < 0) {
-                warn("unknown preference " + key.ToText() + " is kept as it is");
-                doc.KeptPrefs().Set(key, value);
-            } else if (!value.IsNumber()) {
-                result.error = "Prefs." + key.AsText() + ": expects a number, got " + value.ToText();
-                return result;
+private:
+    OrvaneDoc &doc_;
+    const DocumentLoadOptions &options_;
+    DocumentLoadResult &result_;
+
+    struct PendingValue {
+        Operator *op;
+        const ScriptVal *key, *value;
+    };
+    std::unordered_map<const Input *, const ScriptVal *> linkValues_; // for placing loop problems
+
+    void Add(bool error, const ScriptVal *at, std::string message) {
+        result_.problems.push_back({error, at ? at->Line() : 0, at ? at->Column() : 0, std::move(message)});
+    }
+    /// An error, or a warning when loading leniently.
+    void Problem(const ScriptVal *at, std::string message) { Add(!options_.lenient, at, std::move(message)); }
+    void Warn(const ScriptVal *at, std::string message) { Add(false, at, std::move(message)); }
+    void Fatal(const ScriptVal *at, std::string message) { Add(true, at, std::move(message)); }
+
+    void KeepComments(const std::string &place, const ScriptVal &v) {
+        if (!v.Comments().empty() || !v.TrailingComment().empty())
+            doc_.Comments()[place] = {v.Comments(), v.TrailingComment()};
+    }
+
+    // ---- document entries ----
+
+    void ReadHeader(const ScriptVal &root) {
+        for (const auto &[key, value] : root.Entries()) {
+            if (!key.IsText()) {
+                Warn(&key, "unknown document entry " + key.ToText() + " is kept as it is");
+                doc_.KeptFields().Set(key, value);
+                continue;
+            }
+            KeepComments(key.AsText(), value);
+            if (std::find(kTopEntries.begin(), kTopEntries.end(), key.AsText()) == kTopEntries.end()) {
+                Warn(&key, "unknown document entry '" + key.AsText() + "'" + DidYouMean(key.AsText(), kTopEntries) +
+                               " is kept as it is");
+                doc_.KeptFields().Set(key, value);
+            }
+        }
+        if (const ScriptVal *v = root.Find("Version"); v && v->IsNumber() && v->AsNumber() > DocumentVersion)
+            Warn(v, "the document's format version " + v->ToText() +
+                        " is newer than this program's; parts it does not know are kept as they are");
+        double a = 0, b = 0;
+        if (ReadRange(root, "GlobalRange", a, b)) doc_.SetGlobalRange(a, b);
+        if (ReadRange(root, "RenderRange", a, b)) doc_.SetRenderRange(a, b);
+        if (const ScriptVal *prefs = root.Find("Prefs")) ReadPrefs(*prefs);
+    }
+
+    bool ReadRange(const ScriptVal &root, const char *name, double &a, double &b) {
+        const ScriptVal *v = root.Find(name);
+        if (!v) return false;
+        const std::string what = name;
+        if (!v->IsTable() || v->Size() != 2 || v->ArrayLength() != 2 || !v->At(1)->IsNumber() ||
+            !v->At(2)->IsNumber()) {
+            Problem(v, what + " must be { first, last } frames, got " + v->ToText());
+            return false;
+        }
+        a = v->At(1)->AsNumber();
+        b = v->At(2)->AsNumber();
+        if (!std::isfinite(a) || !std::isfinite(b)) {
+            Problem(v, what + " must be finite frames, got " + v->ToText());
+            return false;
+        }
+        if (a > b) {
+            Problem(v, what + " is reversed: it starts at " + ScriptVal(a).ToText() + ", after its end " +
+                           ScriptVal(b).ToText());
+            return false;
+        }
+        if (std::floor(b) - std::floor(a) + 1 > static_cast<double>(MaxFramesInRange)) {
+            Problem(v, what + " covers " + ScriptVal(std::floor(b) - std::floor(a) + 1).ToText() + " frames; at most " +
+                           std::to_string(MaxFramesInRange) + " are allowed");
+            return false;
+        }
+        return true;
+    }
+
+    void ReadPrefs(const ScriptVal &prefs) {
+        if (!prefs.IsTable()) {
+            Problem(&prefs, "Prefs must be a table");
+            return;
+        }
+        std::vector<std::string> names;
+        for (int i = 0; i < PREF_Count; ++i) names.push_back(PrefName(static_cast<PrefID>(i)));
+        for (const auto &[key, value] : prefs.Entries()) {
+            const auto known = key.IsText() ? std::find(names.begin(), names.end(), key.AsText()) : names.end();
+            if (known == names.end()) {
+                Warn(&key, "unknown preference " + key.ToText() +
+                               (key.IsText() ? DidYouMean(key.AsText(), names) : std::string()) + " is kept as it is");
+                doc_.KeptPrefs().Set(key, value);
+            } else if (!value.IsNumber() || !std::isfinite(value.AsNumber())) {
+                Problem(&value, "Prefs." + key.AsText() + ": expects a finite number, got " + value.ToText());
             } else {
-                doc.SetPref(static_cast<PrefID>(id), value.AsNumber());
+                doc_.SetPref(static_cast<PrefID>(known - names.begin()), value.AsNumber());
             }
         }
     }
-    for (const auto &[key, value] : root.Entries()) {
-        static const char *const known[] = {"Version", "Program", "GlobalRange", "RenderRange", "Prefs", "Tools"};
-        bool isKnown = false;
-        for (const char *k : known) isKnown = isKnown || (key.IsText() && key.AsText() == k);
-        if (!isKnown) {
-            warn("unknown document entry " + key.ToText() + " is kept as it is");
-            doc.KeptFields().Set(key, value);
-        }
+
+    // ---- tools ----
+
+    std::vector<std::string> ClassNames() const {
+        std::vector<std::string> names;
+        for (const Registry *row : ClassRegistry ? ClassRegistry->Rows() : std::vector<const Registry *>{})
+            if (row->CanCreate() && (row->TypeFlags() & RegKindOperator)) names.push_back(row->ID().Text());
+        return names;
     }
 
-    const ScriptVal *tools = root.Find("Tools");
-    if (tools && !tools->IsTable()) {
-        result.error = "Tools must be a table";
-        return result;
-    }
-    struct Pending {
-        Operator *op;
-        const ScriptVal *inputs;
-    };
-    std::vector<Pending> pending;
-    if (tools) {
-        // First every tool, so that links can name any of them.
-        for (const auto &[key, value] : tools->Entries()) {
+    void ReadTools(const ScriptVal &tools) {
+        std::vector<PendingValue> pending;
+        std::vector<std::string> classNames; // made on the first unknown class
+        for (const auto &[key, value] : tools.Entries()) {
             if (!key.IsText() || !value.IsTable() || value.ClassName().empty()) {
-                result.error = "Tools." + key.ToText() + ": expected Name = Class { ... }";
-                return result;
+                Problem(&key, (key.IsText() ? key.AsText() : key.ToText()) + ": expected Name = Class { ... }");
+                continue;
             }
             const std::string &name = key.AsText();
             if (!IsToolName(name)) {
-                result.error =
-                    "Tools: '" + name + "' is not a tool name (letters, digits and _, not starting with a digit)";
-                return result;
+                Problem(&key, "'" + name + "' is not a tool name (letters, digits and _, not starting with a digit)");
+                continue;
             }
-            const OvID cls(value.ClassName());
-            const Registry *row = ClassRegistry ? ClassRegistry->Find(cls) : nullptr;
-            Operator *op = row ? doc.AddTool(cls, name) : nullptr;
+            KeepComments("Tools." + name, value);
+            const Registry *row = ClassRegistry ? ClassRegistry->FindByName(value.ClassName()) : nullptr;
+            Operator *op = row && (row->TypeFlags() & RegKindOperator) ? doc_.AddTool(row->ID(), name) : nullptr;
             if (!op) {
-                warn(name + ": unknown class '" + value.ClassName() + "'; the tool is kept as it is");
-                doc.KeptTools().Set(key, value);
+                if (classNames.empty()) classNames = ClassNames();
+                Problem(&value, name + ": unknown class '" + value.ClassName() + "'" +
+                                    DidYouMean(value.ClassName(), classNames) + "; the tool is kept as it is");
+                doc_.KeptTools().Set(key, value);
                 continue;
             }
             if (op->IsPlaceholder())
-                warn(name + ": the " + row->DisplayName() + " tool is not available yet; its settings are kept");
+                Warn(&value,
+                     name + ": the " + row->DisplayName() + " tool is not available yet; its settings are kept");
             for (const auto &[field, fieldValue] : value.Entries())
                 if (!(field.IsText() && field.AsText() == "Inputs")) op->KeptFields().Set(field, fieldValue);
             const ScriptVal *inputs = value.Find("Inputs");
             if (inputs && !inputs->IsTable()) {
-                result.error = name + ".Inputs must be a table";
-                return result;
+                Problem(inputs, name + ".Inputs must be a table");
+                continue;
             }
-            if (inputs) pending.push_back({op, inputs});
+            if (inputs)
+                for (const auto &[inputKey, inputValue] : inputs->Entries())
+                    pending.push_back({op, &inputKey, &inputValue});
         }
-        // Then the values and links.
-        for (const Pending &p : pending) {
-            for (const auto &[key, value] : p.inputs->Entries()) {
-                Input *in = key.IsText() ? p.op->FindInput(key.AsText().c_str()) : nullptr;
-                if (!in) {
-                    if (!p.op->IsPlaceholder())
-                        warn(p.op->Name() + ": unknown input " + key.ToText() + " is kept as it is");
-                    p.op->KeptInputs().Set(key, value);
+        // Values first in the order written; those that fail (an input made by another value, such as a
+        // layer's, or a choice among inputs linked later) are tried again once everything else is set.
+        std::vector<PendingValue> again;
+        for (const PendingValue &p : pending)
+            if (!Apply(p, false)) again.push_back(p);
+        for (const PendingValue &p : again) Apply(p, true);
+        CheckLoops();
+    }
+
+    /// Sets one input from the document; false when it did not take. `last`: report what is wrong.
+    bool Apply(const PendingValue &p, bool last) {
+        Operator &op = *p.op;
+        Input *in = p.key->IsText() ? op.FindInput(p.key->AsText().c_str()) : nullptr;
+        if (!in) {
+            if (!last) return false;
+            if (!op.IsPlaceholder()) {
+                std::vector<std::string> ids;
+                for (const auto &i : op.Inputs()) ids.push_back(i->ID().Text());
+                const std::string word = p.key->IsText() ? p.key->AsText() : p.key->ToText();
+                Problem(p.key,
+                        op.Name() + ": unknown input '" + word + "'" + DidYouMean(word, ids) + "; it is kept as it is");
+            }
+            op.KeptInputs().Set(*p.key, *p.value);
+            return true;
+        }
+        const std::string place = op.Name() + "." + in->ID().Text();
+        const std::string problem =
+            ApplyInputValue(doc_, in, *p.value,
+                            {.keepUnknownLinks = options_.lenient, .lenient = options_.lenient, .checkLoops = false});
+        if (!problem.empty() && !last) return false;
+        KeepComments("Tools." + op.Name() + ".Inputs." + in->ID().Text(), *p.value);
+        if (!problem.empty()) Problem(p.value, place + ": " + problem);
+        if (in->Link()) linkValues_[in] = p.value;
+        if (!in->UnresolvedLink().empty())
+            Warn(p.value, place + ": linked to " + in->UnresolvedLink() +
+                              ", which this program does not have; the link is kept");
+        return true;
+    }
+
+    /// Links are made without a loop check each (that would cost the length of the chain per link); one walk over
+    /// the whole flow finds any loop, reports it where the closing link is written and takes that link out.
+    void CheckLoops() {
+        enum Mark : uint8_t { Unseen, Open, Done };
+        std::unordered_map<const Operator *, Mark> marks;
+        struct Frame {
+            Operator *op;
+            size_t next; // index of the next input to follow
+        };
+        for (Operator *start : doc_.Tools()) {
+            if (marks[start] != Unseen) continue;
+            std::vector<Frame> stack{{start, 0}};
+            marks[start] = Open;
+            while (!stack.empty()) {
+                Frame &f = stack.back();
+                if (f.next == f.op->Inputs().size()) {
+                    marks[f.op] = Done;
+                    stack.pop_back();
                     continue;
                 }
-                std::string error = ApplyInputValue(doc, in, value, true);
-                if (!error.empty()) {
-                    result.error = p.op->Name() + "." + in->ID().Text() + ": " + error;
-                    return result;
+                Input *in = f.op->Inputs()[f.next++].get();
+                if (!in->Link()) continue;
+                Operator *up = in->Link()->Owner();
+                const Mark m = marks[up];
+                if (m == Open) {
+                    const auto at = linkValues_.find(in);
+                    Problem(at == linkValues_.end() ? nullptr : at->second,
+                            f.op->Name() + "." + in->ID().Text() + ": the link to " + up->Name() + "." +
+                                in->Link()->ID().Text() + " closes a loop; it is taken out");
+                    in->Disconnect();
+                } else if (m == Unseen) {
+                    marks[up] = Open;
+                    stack.push_back({up, 0});
                 }
-                if (!in->UnresolvedLink().empty())
-                    warn(p.op->Name() + "." + in->ID().Text() + ": linked to " + in->UnresolvedLink() +
-                         ", which this program does not have; the link is kept");
             }
         }
     }
-    result.ok = true;
+};
+
+ScriptVal Commented(ScriptVal v, const OrvaneDoc &doc, const std::string &place) {
+    const auto c = doc.Comments().find(place);
+    if (c != doc.Comments().end()) {
+        v.SetComments(c->second.before);
+        v.SetTrailingComment(c->second.after);
+    }
+    return v;
+}
+
+void Summarise(DocumentLoadResult &r) {
+    // In the order of the text, as a reader goes through it; problems without a place last.
+    std::stable_sort(r.problems.begin(), r.problems.end(), [](const DocumentProblem &a, const DocumentProblem &b) {
+        auto place = [](const DocumentProblem &p) {
+            return std::pair(p.line > 0 ? p.line : std::numeric_limits<int>::max(), p.column);
+        };
+        return place(a) < place(b);
+    });
+    r.ok = std::none_of(r.problems.begin(), r.problems.end(), [](const DocumentProblem &p) { return p.error; });
+    for (const DocumentProblem &p : r.problems) {
+        if (!p.error) {
+            r.warnings.push_back(ProblemText(p));
+            continue;
+        }
+        if (!r.error.empty()) r.error += '\n';
+        r.error += ProblemText(p);
+    }
+}
+
+/// The whole of a regular file, opened without blocking (a FIFO would wait for a writer for ever).
+bool ReadDocumentText(const std::string &path, std::string &text, std::string &error) {
+    const int fd = open(path.c_str(), O_RDONLY | O_NONBLOCK | O_CLOEXEC);
+    if (fd < 0) {
+        error = "cannot open " + path + ": " + std::strerror(errno);
+        return false;
+    }
+    struct stat st {};
+    const bool regular = fstat(fd, &st) == 0 && S_ISREG(st.st_mode);
+    if (!regular || static_cast<size_t>(st.st_size) > kMostDocumentBytes) {
+        close(fd);
+        error = path + (regular ? " is too large for a document" : " is not a regular file");
+        return false;
+    }
+    text.resize(static_cast<size_t>(st.st_size));
+    size_t got = 0;
+    while (got < text.size()) {
+        const ssize_t n = read(fd, text.data() + got, text.size() - got);
+        if (n < 0 && errno == EINTR) continue;
+        if (n <= 0) break;
+        got += static_cast<size_t>(n);
+    }
+    close(fd);
+    text.resize(got);
+    return true;
+}
+
+} // namespace
+
+std::string ProblemText(const DocumentProblem &p) {
+    if (p.line <= 0) return p.message;
+    return "line " + std::to_string(p.line) + ", column " + std::to_string(p.column) + ": " + p.message;
+}
+
+DocumentLoadResult LoadDocument(const std::string &text, OrvaneDoc &doc, const DocumentLoadOptions &options) {
+    DocumentLoadResult result;
+    DocumentReader(doc, options, result).Read(text);
+    Summarise(result);
     return result;
 }
 
-DocumentLoadResult LoadDocumentFile(const std::string &path, OrvaneDoc &doc) {
-    std::ifstream file(path, std::ios::binary);
-    if (!file) {
+DocumentLoadResult LoadDocumentFile(const std::string &path, OrvaneDoc &doc, const DocumentLoadOptions &options) {
+    std::string text, error;
+    if (!ReadDocumentText(path, text, error)) {
         DocumentLoadResult r;
-        r.error = "cannot open " + path;
+        r.problems.push_back({true, 0, 0, error});
+        Summarise(r);
         return r;
     }
-    std::ostringstream text;
-    text << file.rdbuf();
     std::error_code ec;
     const std::filesystem::path absolute = std::filesystem::absolute(path, ec);
     doc.SetFilePath(ec ? path : absolute.string());
-    DocumentLoadResult r = LoadDocument(text.str(), doc);
-    if (!r.ok) r.error = path + ": " + r.error;
-    return r;
+    return LoadDocument(text, doc, options);
 }
 
 std::string SaveDocument(const OrvaneDoc &doc) {
-    ScriptVal root = ScriptVal::Table(DocumentClass);
-    root.Set("Version", DocumentVersion);
-    root.Set("Program", ORVANE_VERSION);
-    root.Set("GlobalRange", Range(doc.GlobalStart(), doc.GlobalEnd()));
-    root.Set("RenderRange", Range(doc.RenderStart(), doc.RenderEnd()));
+    std::vector<ScriptVal::Entry> top;
+    auto add = [&](const char *key, ScriptVal value) {
+        top.emplace_back(ScriptVal(key), Commented(std::move(value), doc, key));
+    };
+    add("Version", DocumentVersion);
+    add("Program", ORVANE_VERSION);
+    add("GlobalRange", Range(doc.GlobalStart(), doc.GlobalEnd()));
+    add("RenderRange", Range(doc.RenderStart(), doc.RenderEnd()));
     ScriptVal prefs = ScriptVal::Table();
     for (int id = 0; id < PREF_Count; ++id)
         if (doc.PrefIsSet(static_cast<PrefID>(id)))
             prefs.Set(PrefName(static_cast<PrefID>(id)), doc.GetPrefDouble(static_cast<PrefID>(id)));
     for (const auto &[key, value] : doc.KeptPrefs().Entries()) prefs.Set(key, value);
-    if (prefs.Size()) root.Set("Prefs", prefs);
+    if (prefs.Size()) add("Prefs", std::move(prefs));
 
     // Known and kept tools together, sorted by name.
-    std::vector<std::pair<std::string, ScriptVal>> tools;
+    std::vector<ScriptVal::Entry> tools;
     for (Operator *op : doc.Tools()) {
-        ScriptVal tool = ScriptVal::Table(op->ClassID().Text());
-        ScriptVal inputs = ScriptVal::Table();
+        const std::string place = "Tools." + op->Name();
+        std::vector<ScriptVal::Entry> inputs;
         for (const auto &in : op->Inputs()) {
             ScriptVal v = SavedValue(*in);
-            if (!v.IsNil()) inputs.Set(in->ID().Text(), std::move(v));
+            if (!v.IsNil())
+                inputs.emplace_back(ScriptVal(in->ID().Text()),
+                                    Commented(std::move(v), doc, place + ".Inputs." + in->ID().Text()));
         }
-        for (const auto &[key, value] : const_cast<Operator *>(op)->KeptInputs().Entries()) inputs.Set(key, value);
-        if (inputs.Size()) tool.Set("Inputs", std::move(inputs));
-        for (const auto &[key, value] : const_cast<Operator *>(op)->KeptFields().Entries()) tool.Set(key, value);
-        tools.emplace_back(op->Name(), std::move(tool));
+        ScriptVal inputTable = ScriptVal::TableOf({}, std::move(inputs));
+        for (const auto &[key, value] : op->KeptInputs().Entries()) inputTable.Set(key, value);
+        ScriptVal tool = ScriptVal::Table(op->ClassID().Text());
+        if (inputTable.Size()) tool.Set("Inputs", std::move(inputTable));
+        for (const auto &[key, value] : op->KeptFields().Entries()) tool.Set(key, value);
+        tools.emplace_back(ScriptVal(op->Name()), Commented(std::move(tool), doc, place));
     }
-    for (const auto &[key, value] : doc.KeptTools().Entries()) tools.emplace_back(key.AsText(), value);
-    std::sort(tools.begin(), tools.end(), [](const auto &x, const auto &y) { return x.first < y.first; });
-    ScriptVal toolTable = ScriptVal::Table();
-    for (auto &[name, tool] : tools) toolTable.Set(name, std::move(tool));
-    root.Set("Tools", std::move(toolTable));
-    for (const auto &[key, value] : doc.KeptFields().Entries()) root.Set(key, value);
+    for (const auto &[key, value] : doc.KeptTools().Entries()) tools.emplace_back(key, value);
+    std::sort(tools.begin(), tools.end(),
+              [](const ScriptVal::Entry &x, const ScriptVal::Entry &y) { return x.first.AsText() < y.first.AsText(); });
+    add("Tools", ScriptVal::TableOf({}, std::move(tools)));
+    for (const auto &[key, value] : doc.KeptFields().Entries()) top.emplace_back(key, value);
+    ScriptVal root = Commented(ScriptVal::TableOf(DocumentClass, std::move(top)), doc, "");
     return root.ToText() + "\n";
 }
 

@@ -4,6 +4,7 @@
 // A document is one ScriptVal, written in Lua table syntax and read back as
 // data (never executed), made to live in version control:
 //
+//   -- comments before the document and before any entry are kept
 //   Orvane.Document {
 //       Version = 1,
 //       Program = "0.1.0",
@@ -19,10 +20,22 @@
 //       },
 //   }
 //
-// Saving what was loaded gives the same bytes. A class, input or entry this
-// program does not know is kept, reported in one warning line, and written
-// back unchanged. Saving writes a temporary file beside the target and
-// renames it, so a failed save never leaves a damaged document.
+// Loading checks the whole document and reports every problem at once, each
+// with its line and column: an unknown class or input, a choice that does
+// not exist, a value outside an input's limits, of the wrong type or not
+// finite, a key given twice, a bad range, a link to nothing or in a loop.
+// Names close to a known one come with "did you mean". Any error fails the
+// load; lenient loading takes errors as warnings and goes on (values are
+// brought inside their limits, what cannot be used is left at its default).
+// A class or input this program does not know is kept and written back
+// unchanged in lenient loading. A class is found by its ID, an old ID, an
+// alias or its name, and saved under its ID.
+//
+// Saving writes values that differ from their defaults, the kept parts, and
+// the comments the document was read with. Saving what was loaded gives the
+// same bytes for a document this program wrote. Saving writes a temporary
+// file beside the target and renames it, so a failed save never leaves a
+// damaged document. Loading and saving take time linear in the document.
 //
 // Thread safety: load and save on the main thread, not during a render.
 #include <string>
@@ -36,15 +49,34 @@ class OrvaneDoc;
 
 constexpr int DocumentVersion = 1;
 
+struct DocumentProblem {
+    bool error = true;
+    int line = 0, column = 0; ///< 0: not tied to a place in the text
+    std::string message;      ///< "BC1: unknown input 'Gian' (did you mean 'Gain'?)"
+};
+
+struct DocumentLoadOptions {
+    /// Errors that do not stop the document from loading become warnings.
+    bool lenient = false;
+};
+
 struct DocumentLoadResult {
     bool ok = false;
-    std::string error; ///< one line: what is wrong, with line and column for syntax errors
+    /// Every problem, errors and warnings, in the order found.
+    std::vector<DocumentProblem> problems;
+    /// The same, as "line L, column C: message" lines: every error, and every warning.
+    std::string error;
     std::vector<std::string> warnings;
 };
 
+/// "line 12, column 5: message", or the message alone without a place.
+ORVANE_API std::string ProblemText(const DocumentProblem &problem);
+
 /// Reads a document into an empty `doc`.
-ORVANE_API DocumentLoadResult LoadDocument(const std::string &text, OrvaneDoc &doc);
-ORVANE_API DocumentLoadResult LoadDocumentFile(const std::string &path, OrvaneDoc &doc);
+ORVANE_API DocumentLoadResult LoadDocument(const std::string &text, OrvaneDoc &doc,
+                                           const DocumentLoadOptions &options = {});
+ORVANE_API DocumentLoadResult LoadDocumentFile(const std::string &path, OrvaneDoc &doc,
+                                               const DocumentLoadOptions &options = {});
 
 ORVANE_API std::string SaveDocument(const OrvaneDoc &doc);
 /// Writes atomically; false with a reason when it could not.

@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <cstring>
 #include <new>
+#include <unordered_map>
 #include <vector>
 
 #include "host/app/Application.h"
@@ -33,21 +34,32 @@ uint32_t Traits(uint32_t flags, const RenderTask *task) {
     return t;
 }
 
-std::optional<uint64_t> StateHashOf(const Output *out, double time, int depth) {
+/// Hashes already worked out during one StateHash call, so that a tool feeding several others is hashed once.
+using HashMemo = std::unordered_map<const Output *, std::optional<uint64_t>>;
+
+std::optional<uint64_t> StateHashOf(const Output *out, double time, int depth, HashMemo &memo, RenderTask *task) {
+    if (const auto known = memo.find(out); known != memo.end()) return known->second;
+    if (task)
+        if (const auto kept = task->FindStateHash(out, time)) return *kept;
     const Operator *op = out->Owner();
-    if (!op || Volatile(op) || depth > 10000) return std::nullopt;
+    if (!op || Volatile(op) || depth > MaxFlowDepth) return std::nullopt;
     const char *cls = op->ClassID().Text();
-    uint64_t h = HashMix(HashBytes(cls, std::strlen(cls)), static_cast<uint64_t>(out->Index()));
+    std::optional<uint64_t> h = HashMix(HashBytes(cls, std::strlen(cls)), static_cast<uint64_t>(out->Index()));
     for (const auto &in : op->Inputs()) {
         if (in->IsPassive()) continue;
         if (in->Link()) {
-            std::optional<uint64_t> up = StateHashOf(in->Link(), time, depth + 1);
-            if (!up) return std::nullopt;
-            h = HashMix(h, *up);
+            std::optional<uint64_t> up = StateHashOf(in->Link(), time, depth + 1, memo, task);
+            if (!up) {
+                h.reset();
+                break;
+            }
+            h = HashMix(*h, *up);
         } else {
-            h = HashMix(h, in->ValueHash(time));
+            h = HashMix(*h, in->ValueHash(time));
         }
     }
+    memo[out] = h;
+    if (task) task->KeepStateHash(out, time, h);
     return h;
 }
 
@@ -103,9 +115,10 @@ Ref<Parameter> PixelsOf(Ref<Parameter> value, const std::optional<ImageDomain> &
 
 } // namespace
 
-std::optional<uint64_t> StateHash(const Output *out, double time) {
+std::optional<uint64_t> StateHash(const Output *out, double time, RenderTask *task) {
     if (!out) return std::nullopt;
-    std::optional<uint64_t> h = StateHashOf(out, time, 0);
+    HashMemo memo;
+    std::optional<uint64_t> h = StateHashOf(out, time, 0, memo, task);
     if (h) h = HashMix(*h, GetApp()->AttrHash());
     return h;
 }
@@ -139,11 +152,17 @@ Ref<Parameter> EvaluateValue(Output *out, double time, const EvalOptions &option
     if (aborted()) return nullptr;
 
     EvalOptions opt = options;
+    if (++opt.depth > MaxFlowDepth) {
+        if (op->GetDoc())
+            op->GetDoc()->PrintF(ConsoleError, "%s: the flow is more than %d tools deep here\n", op->Name().c_str(),
+                                 MaxFlowDepth);
+        return nullptr;
+    }
     const bool precalc = (opt.flags & ReqFlagPreCalc) != 0;
     if (precalc || !op->RegAttrB(RegSupportsRoI)) opt.roi.reset();
 
     ResultCache *cache = op->GetDoc() && opt.useCache ? &op->GetDoc()->Cache() : nullptr;
-    std::optional<uint64_t> state = cache ? StateHash(out, time) : std::nullopt;
+    std::optional<uint64_t> state = cache ? StateHash(out, time, task) : std::nullopt;
     if (state) state = HashMix(*state, op->GetDoc()->PrefsHash());
     const CacheKey key{out, time, Traits(opt.flags, task), state.value_or(0)};
     if (state)

@@ -36,7 +36,13 @@ struct EvalOptions {
     std::optional<ImageDomain> roi;
     RenderTask *task = nullptr;
     bool useCache = true;
+    /// Requests between this one and the caller's (the engine counts). A walk
+    /// deeper than MaxFlowDepth fails with a console line rather than run out
+    /// of stack: each level takes about a kilobyte of the calling thread's.
+    int depth = 0;
 };
+
+constexpr int MaxFlowDepth = 100000;
 
 /// The value of `out` at `time`, or null when a tool failed. An image made
 /// on the render's device is brought back into main memory.
@@ -48,6 +54,7 @@ ORVANE_API Ref<Parameter> EvaluateOnDevice(Output *out, double time, const EvalO
 
 /// Hash of everything the value of `out` at `time` depends on; absent when a
 /// tool upstream gives different results for the same inputs (no caching).
-ORVANE_API std::optional<uint64_t> StateHash(const Output *out, double time);
+/// With a task, hashes are kept in the task and worked out once.
+ORVANE_API std::optional<uint64_t> StateHash(const Output *out, double time, RenderTask *task = nullptr);
 
 } // namespace Orvane

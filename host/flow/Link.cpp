@@ -1,5 +1,7 @@
 #include "host/flow/Link.h"
 
+#include <unordered_set>
+
 #include <algorithm>
 #include <cmath>
 
@@ -16,12 +18,12 @@ namespace {
 /// linking target's input to op's output would close a loop.
 bool DependsOn(const Operator *op, const Operator *target) {
     if (op == target) return true;
-    std::vector<const Operator *> todo{op}, seen;
+    std::vector<const Operator *> todo{op};
+    std::unordered_set<const Operator *> seen;
     while (!todo.empty()) {
         const Operator *at = todo.back();
         todo.pop_back();
-        if (std::find(seen.begin(), seen.end(), at) != seen.end()) continue;
-        seen.push_back(at);
+        if (!seen.insert(at).second) continue;
         for (const auto &in : at->Inputs()) {
             if (!in->Link()) continue;
             const Operator *up = in->Link()->Owner();
@@ -93,6 +95,13 @@ void Input::SetAttrsTagList(const TagList &tags) {
     tags_.Persist();
 }
 
+void Input::SetChoices(const std::vector<std::string> &labels) {
+    tags_.Remove(ListAddItem);
+    tags_.Remove(ListItemId);
+    for (const std::string &label : labels) tags_.Add({ListAddItem, label.c_str()});
+    tags_.Persist();
+}
+
 Ref<Parameter> Input::Conform(Ref<Parameter> value) const {
     if (!value) return nullptr;
     if (IsImageDataType(dataType_)) return nullptr;
@@ -146,12 +155,12 @@ bool Input::SetCurve(AnimCurve curve) {
     return true;
 }
 
-bool Input::ConnectTo(Output *output) {
+bool Input::ConnectTo(Output *output, bool checkLoop) {
     if (!output || !IsExternal()) return false;
     const OvID from = output->DataType();
     const bool fits = from == dataType_ || (IsImageDataType(from) && IsImageDataType(dataType_)) ||
                       from == tags_.GetID(LinkSecondDataType);
-    if (!fits || DependsOn(output->Owner(), owner_)) return false;
+    if (!fits || (checkLoop && DependsOn(output->Owner(), owner_))) return false;
     Disconnect();
     curve_.reset();
     link_ = output;

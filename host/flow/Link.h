@@ -53,6 +53,9 @@ public:
 
     /// Changes tags at run time (visibility, limits, labels).
     void SetAttrsTagList(const TagList &tags);
+    /// Replaces the entries of a list control whose entries follow the flow
+    /// (a switch's inputs by name).
+    void SetChoices(const std::vector<std::string> &labels);
 
     // ---- value ----
     const Ref<Parameter> &Default() const { return default_; }
@@ -61,7 +64,10 @@ public:
     /// value has the wrong type for this input.
     bool SetValue(Ref<Parameter> value);
     bool SetCurve(AnimCurve curve);
-    bool ConnectTo(Output *output);
+    /// Links to `output`; false when the types do not fit or (with
+    /// `checkLoop`) the link would close a loop. A caller linking many tools
+    /// at once may check for loops once at the end instead.
+    bool ConnectTo(Output *output, bool checkLoop = true);
     void Disconnect();
     /// Resets to the default constant.
     void ResetValue();

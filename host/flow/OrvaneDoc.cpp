@@ -174,6 +174,9 @@ bool OrvaneDoc::RemoveTool(const std::string &name) {
     for (const auto &in : op->Inputs()) in->Disconnect();
     op->OnRemoveFromFlow();
     op->OnDelete();
+    const std::string place = "Tools." + name;
+    for (auto c = comments_.lower_bound(place); c != comments_.end() && c->first.rfind(place, 0) == 0;)
+        c = c->first.size() == place.size() || c->first[place.size()] == '.' ? comments_.erase(c) : std::next(c);
     tools_.erase(it);
     return true;
 }

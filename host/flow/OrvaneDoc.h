@@ -52,6 +52,15 @@ struct FrameFormat {
     bool fields = false;
 };
 
+/// Longest render or global range a document may have, in frames.
+constexpr int64_t MaxFramesInRange = 10'000'000;
+
+/// Comments a writer put in a document, kept to be written back.
+struct DocumentComments {
+    std::vector<std::string> before; ///< whole lines before the entry
+    std::string after;               ///< on the entry's own line, after it
+};
+
 struct ConsoleLine {
     int code;
     std::string text;
@@ -130,6 +139,13 @@ public:
     ScriptVal &KeptPrefs() { return keptPrefs_; }
     const ScriptVal &KeptPrefs() const { return keptPrefs_; }
 
+    /// Comments of a hand-written document by where they stand: "" before
+    /// the document, "Tools.BC1" before a tool, "Tools.BC1.Inputs.Gain"
+    /// before one of its inputs, "RenderRange" before a document entry.
+    /// Removing a tool drops its comments.
+    std::map<std::string, DocumentComments> &Comments() { return comments_; }
+    const std::map<std::string, DocumentComments> &Comments() const { return comments_; }
+
     /// The result cache shared by this document's renders.
     ResultCache &Cache() { return *cache_; }
 
@@ -150,6 +166,7 @@ private:
     bool writeProtected_ = false;
     std::string filePath_;
     ScriptVal keptTools_ = ScriptVal::Table(), keptFields_ = ScriptVal::Table(), keptPrefs_ = ScriptVal::Table();
+    std::map<std::string, DocumentComments> comments_;
 };
 
 } // namespace Orvane

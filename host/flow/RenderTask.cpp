@@ -57,4 +57,19 @@ std::vector<std::string> RenderTask::DeviceLog() const {
     return log_;
 }
 
+std::optional<std::optional<uint64_t>> RenderTask::FindStateHash(const Output *out, double time) const {
+    std::lock_guard<std::mutex> lock(hashLock_);
+    const auto it = stateHashes_.find({out, time});
+    if (it == stateHashes_.end()) return std::nullopt;
+    return it->second;
+}
+
+void RenderTask::KeepStateHash(const Output *out, double time, std::optional<uint64_t> hash) {
+    // A long render asks at many times; the memo is only a shortcut, so it starts afresh past a bound.
+    constexpr size_t kMostKept = 1 << 20;
+    std::lock_guard<std::mutex> lock(hashLock_);
+    if (stateHashes_.size() >= kMostKept) stateHashes_.clear();
+    stateHashes_[{out, time}] = hash;
+}
+
 } // namespace Orvane

@@ -13,14 +13,21 @@
 //
 // Tasks are found by their ID (Find) while they exist.
 //
-// Thread safety: Abort, Execute, QueueExecute, NoteDeviceFailure and
-// DeviceLog may be called from any thread; the rest is set before the render
-// starts.
+// State hashes: the flow does not change while a task renders, so the hash
+// of everything an output depends on at a time (the cache key) is worked out
+// once per task and kept, instead of once per request, which would cost a
+// chain its length at every tool.
+//
+// Thread safety: Abort, Execute, QueueExecute, NoteDeviceFailure, DeviceLog
+// and the state hashes may be used from any thread; the rest is set before
+// the render starts.
 #include <atomic>
 #include <cstdint>
 #include <functional>
 #include <mutex>
+#include <optional>
 #include <string>
+#include <unordered_map>
 #include <vector>
 
 #include "host/core/Export.h"
@@ -28,6 +35,7 @@
 namespace Orvane {
 
 class IDeviceContext;
+class Output;
 
 class ORVANE_API RenderTask {
 public:
@@ -57,6 +65,11 @@ public:
     /// The distinct failures noted so far ("name: reason").
     std::vector<std::string> DeviceLog() const;
 
+    /// The state hash kept for `out` at `time`: absent when none is kept yet;
+    /// a kept absent hash means "not cacheable".
+    std::optional<std::optional<uint64_t>> FindStateHash(const Output *out, double time) const;
+    void KeepStateHash(const Output *out, double time, std::optional<uint64_t> hash);
+
     int proxyScale = 1;
     bool interactive = false;
     bool boundsOnly = false;
@@ -73,6 +86,18 @@ private:
     IDeviceContext *device_ = nullptr;
     mutable std::mutex logLock_;
     std::vector<std::string> log_;
+    struct HashKey {
+        const Output *out;
+        double time;
+        bool operator==(const HashKey &) const = default;
+    };
+    struct HashOfKey {
+        size_t operator()(const HashKey &k) const {
+            return std::hash<const void *>()(k.out) ^ (std::hash<double>()(k.time) * 0x9e3779b97f4a7c15ull);
+        }
+    };
+    mutable std::mutex hashLock_;
+    std::unordered_map<HashKey, std::optional<uint64_t>, HashOfKey> stateHashes_;
 };
 
 } // namespace Orvane

@@ -12,6 +12,7 @@
 // A single-channel image holds its value in the alpha place: reading gives the
 // value in all four channels, writing stores alpha.
 #include <cstdint>
+#include <string>
 
 #include "host/core/Export.h"
 
@@ -52,6 +53,10 @@ struct PixelFormat {
 
 /// The format of a depth 1..8; depth 0 or out of range gives a zeroed record.
 ORVANE_API PixelFormat FormatOfDepth(int depth);
+/// The name users read for a component type: "int8", "int16", "float16", "float32".
+ORVANE_API const char *ComponentTypeName(ComponentType type);
+/// "RGBA float16", "mask int8"; "unknown" for a depth out of range.
+ORVANE_API std::string DepthName(int depth);
 inline bool IsValidDepth(int depth) { return depth >= 1 && depth <= 8; }
 
 } // namespace Orvane

@@ -23,6 +23,22 @@ PixelFormat FormatOfDepth(int depth) {
     return f;
 }
 
+const char *ComponentTypeName(ComponentType type) {
+    switch (type) {
+    case ComponentType::Int8: return "int8";
+    case ComponentType::Int16: return "int16";
+    case ComponentType::Flt16: return "float16";
+    case ComponentType::Flt32: break;
+    }
+    return "float32";
+}
+
+std::string DepthName(int depth) {
+    if (!IsValidDepth(depth)) return "unknown";
+    const PixelFormat f = FormatOfDepth(depth);
+    return std::string(f.channels == 1 ? "mask " : "RGBA ") + ComponentTypeName(f.type);
+}
+
 namespace {
 
 template <class T> T LoadAs(const uint8_t *p) {

@@ -131,7 +131,7 @@ void MultiMerge::TakeKeptInputs(const Layer &layer) {
         const ScriptVal *kept = KeptInputs().Find(key);
         if (!kept) continue;
         const ScriptVal value = *kept;
-        if (ApplyInputValue(*GetDoc(), in, value, true).empty()) KeptInputs().Remove(key);
+        if (ApplyInputValue(*GetDoc(), in, value, {.keepUnknownLinks = true}).empty()) KeptInputs().Remove(key);
     }
 }
 

@@ -107,8 +107,7 @@ SwitchBase::SwitchBase(const Registry *reg, const ScriptVal &args, const TagList
                               {{LinkDataType, CLSID_DataType_Number},
                                {InputControl, CLSID_InputControl_Combo},
                                {InputPriority, PriorityImage - 1},
-                               {InputDefault, 0.0},
-                               {ListAddItem, "frodo"}});
+                               {InputDefault, 0.0}});
     configPage_ = AddControlPageTagList("Config", {});
     numberOfInputs_ = AddInputTagList("Number of Inputs", "NumberOfInputs",
                                       {{LinkDataType, CLSID_DataType_Number},
@@ -139,26 +138,45 @@ void SwitchBase::SetCount(int count) {
             linkTags.Add({ImageFromRequestOK, 1});
         }
         Input *input = AddInputTagList(label.c_str(), id.c_str(), linkTags);
+        linkTags.Add({InputNotify, 1});
         Input *name = AddInputTagList(nameLabel.c_str(), nameId.c_str(),
                                       {{LinkDataType, CLSID_DataType_Text},
                                        {InputControl, CLSID_InputControl_TextEdit},
                                        {ControlPage, configPage_},
                                        {InputExternal, 0},
-                                       {InputPassive, 1}});
+                                       {InputPassive, 1},
+                                       {InputNotify, 1}});
         if (!input || !name) break; // the tool already has inputs of these IDs
         positions_.push_back({input, name});
     }
+    shown_ = count;
     for (int i = 0; i < Positions(); ++i) {
         const long long visible = i < count ? 1 : 0;
         if (positions_[i].input->Tags().GetLong(ControlVisible, 1) == visible) continue;
         positions_[i].input->SetAttrsTagList({{ControlVisible, visible}});
         positions_[i].name->SetAttrsTagList({{ControlVisible, visible}});
     }
+    NameSources();
+}
+
+void SwitchBase::NameSources() {
+    std::vector<std::string> labels;
+    for (int i = 0; i < std::min(shown_, Positions()); ++i) {
+        const auto *name = dynamic_cast<const Text *>(positions_[i].name->Constant().Get());
+        const Output *link = positions_[i].input->Link();
+        labels.push_back(name && !name->value.empty() ? name->value
+                         : link                       ? link->Owner()->Name()
+                                                      : "Input " + std::to_string(i));
+    }
+    source_->SetChoices(labels);
 }
 
 void SwitchBase::NotifyChanged(Input *in, Parameter *param, double time, TagList *tags) {
-    if (in == numberOfInputs_)
+    if (in == numberOfInputs_) {
         if (const auto *n = dynamic_cast<const Number *>(param)) SetCount(static_cast<int>(std::floor(n->value + 0.5)));
+    } else if (in != source_ && source_) {
+        NameSources(); // a position's name or link
+    }
     ThreadedOperator::NotifyChanged(in, param, time, tags);
 }
 

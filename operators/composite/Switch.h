@@ -46,6 +46,8 @@ private:
     };
     /// Makes positions up to `count` and shows exactly the first `count`.
     void SetCount(int count);
+    /// Source's entries: each shown position by its name, else the tool linked to it.
+    void NameSources();
 
     OvID dataType_;
     Input *source_;
@@ -53,6 +55,7 @@ private:
     Output *output_;
     int configPage_;
     std::vector<Position> positions_;
+    int shown_ = 0;
 };
 
 class Switch : public SwitchBase {

@@ -1,6 +1,9 @@
 #include "operators/filter/Blur.h"
 
+#include <algorithm>
 #include <cmath>
+#include <cstring>
+#include <iterator>
 
 #include "host/core/Tags.h"
 #include "host/flow/DataTypes.h"
@@ -84,14 +87,20 @@ int Blur::FilterType(OvID id) {
 Blur::Blur(const Registry *reg, const ScriptVal &args, const TagList &tags) : ThreadedOperator(reg, args, tags) {
     AddControlPageTagList("Controls", {{PageIcon, static_cast<const void *>("Icons.Tools.Tabs.Blur")}});
 
-    filter_ = AddInputTagList("Filter", "Filter",
-                              WithIdChoices({{LinkDataType, CLSID_DataType_OvID},
-                                             {InputControl, CLSID_InputControl_MultiButtonID},
-                                             {ButtonsFillRow, 1},
-                                             {InputDefaultId, OvID("Fast Gaussian")},
-                                             {LinkForceSave, 1},
-                                             {InputNotify, 1}},
-                                            kFilterButtons));
+    TagList filterTags = WithIdChoices({{LinkDataType, CLSID_DataType_OvID},
+                                        {InputControl, CLSID_InputControl_MultiButtonID},
+                                        {ButtonsFillRow, 1},
+                                        {InputDefaultId, OvID("Fast Gaussian")},
+                                        {LinkForceSave, 1},
+                                        {InputNotify, 1}},
+                                       kFilterButtons);
+    // Filters without a button that documents and scripts may still name, "Soften" of old documents among them.
+    filterTags.Add({ListAcceptedId, OvID("Soften")});
+    for (const FilterEntry *f = kFilters + 1; f->id; ++f)
+        if (std::none_of(std::begin(kFilterButtons), std::end(kFilterButtons),
+                         [f](const IdChoice &button) { return std::strcmp(button.id, f->id) == 0; }))
+            filterTags.Add({ListAcceptedId, OvID(f->id)});
+    filter_ = AddInputTagList("Filter", "Filter", filterTags);
 
     // The channel buttons: one row (control group 12) under a blank heading.
     const char *const names[4] = {"Red", "Green", "Blue", "Alpha"};

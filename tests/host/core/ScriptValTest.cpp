@@ -655,7 +655,11 @@ TEST(ScriptValWrite, LooseTextIsNormalised) {
     const std::string loose = "-- saved by hand\n"
                               "return Orvane.Document{ --[[ a\n long comment ]] Tools={ 'a' ; [==[b]==], x=1.50, } ;\n"
                               "  Link = Tool . Output ; [ [[key]] ] = 0x10 }; -- trailing comment";
-    const std::string canonical = "Orvane.Document {\n"
+    // Comments stay where they stood: before the value, before an entry (one after a '{' counts for the first
+    // entry); the one after the whole value has nothing to stand before and goes.
+    const std::string canonical = "-- saved by hand\n"
+                                  "Orvane.Document {\n"
+                                  "\t--[[ a\n long comment ]]\n"
                                   "\tTools = { \"a\", \"b\", x = 1.5 },\n"
                                   "\tLink = Tool.Output,\n"
                                   "\tkey = 16,\n"

@@ -50,7 +50,7 @@ protected:
     void Set(Operator *op, const char *id, const ScriptVal &v) {
         Input *in = op->FindInput(id);
         ASSERT_NE(in, nullptr) << id;
-        ASSERT_EQ(ApplyInputValue(doc, in, v, false), "") << id;
+        ASSERT_EQ(ApplyInputValue(doc, in, v), "") << id;
     }
     /// The file number a time shows (R of pixel 0,0 / 1000), -1 for no image.
     int FileAt(double t) {
