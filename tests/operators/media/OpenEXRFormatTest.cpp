@@ -13,6 +13,7 @@
 #include <map>
 #include <regex>
 #include <string>
+#include <tuple>
 #include <vector>
 
 #include "host/image/Half.h"
@@ -52,15 +53,20 @@ void ExpectSame(const Image &want, const Image &got, float tolerance = 0.f) {
         }
 }
 
-/// Loads through a reading tool whose inputs hold `options`.
-Ref<Image> LoadWith(const Bytes &data, const Options &options, std::string *error = nullptr) {
+using Choices = std::vector<std::pair<const char *, const char *>>;
+
+/// Loads through a reading tool whose inputs hold `options` and the choices (Part, View, Layer, Channel...).
+Ref<Image> LoadWith(const Bytes &data, const Options &options, const Choices &choices = {}, int eye = 0,
+                    std::string *error = nullptr) {
     OrvaneDoc doc;
     Operator *tool = Orvane::Test::AddImageSource(doc, "Loader", nullptr);
     Ref<ImageFormat> f = MakeFormat(kId);
     f->AddLoadInputs(tool);
     Request req(tool, nullptr, 0.0, 0, nullptr);
     for (const auto &[name, value] : options) req.SetInputData(tool->FindInput(name), MakeRef<Number>(value).Get());
+    for (const auto &[name, id] : choices) req.SetInputData(tool->FindInput(name), MakeRef<IDValue>(OvID(id)).Get());
     f->SetupLoad(tool, &req);
+    f->SetAttrsTagList({{FormatStereoEye, eye}});
     MemoryIO io(data);
     Ref<Image> img;
     if (!f->LoadHeader(&io) || !f->LoadFrameTagList(0, img, {})) {
@@ -217,30 +223,59 @@ TEST_F(OpenEXRFormatTest, RoundTripsEveryCompressionAndWindow) {
             }
 }
 
-TEST_F(OpenEXRFormatTest, FileWindowsAndDepthOptionAgreeWithExrheader) {
+TEST_F(OpenEXRFormatTest, SavesFromEveryDepthWithEveryDepthChoice) {
     if (!HaveProgram("exrheader")) GTEST_SKIP() << "exrheader is not installed";
+    // Image depth by Depth choice (Auto, float16, float32): the file's colour
+    // type (auxiliary channels are float but for float16), as exrheader reads it.
+    struct Row {
+        int depth;
+        const char *colour[3];
+    };
+    const Row rows[] = {
+        {DepthAInt8, {"16-bit", "16-bit", "32-bit"}},     {DepthAInt16, {"32-bit", "16-bit", "32-bit"}},
+        {DepthAFlt16, {"16-bit", "16-bit", "32-bit"}},    {DepthAFlt32, {"32-bit", "16-bit", "32-bit"}},
+        {DepthRGBAInt8, {"16-bit", "16-bit", "32-bit"}},  {DepthRGBAInt16, {"32-bit", "16-bit", "32-bit"}},
+        {DepthRGBAFlt16, {"16-bit", "16-bit", "32-bit"}}, {DepthRGBAFlt32, {"32-bit", "16-bit", "32-bit"}}};
     TempDir dir;
-    Ref<Image> src = Pattern(37, 23, DepthRGBAInt16, ImgRectI(4, 6, 20, 17));
-    src->SetScale(2.0, 1.0);
-    WriteFile(dir / "a.exr", SaveWith(kId, src.Get(), {{"Depth", 2}, {"Compression", 4}}));
-    const Windows w = Exrheader(dir / "a.exr");
-    ASSERT_EQ(w.data.size(), 1u);
-    // Image rows 6..16 (bottom up) of 23 are file lines 6..16 counted from the top.
-    EXPECT_EQ(w.data[0], ImgRectI(4, 23 - 17, 19, 23 - 1 - 6));
-    EXPECT_EQ(w.display[0], ImgRectI(0, 0, 36, 22));
-    const std::string header = [&] {
-        const Bytes out = Capture("exrheader '" + dir / "a.exr" + "'");
-        return std::string(out.begin(), out.end());
-    }();
-    EXPECT_NE(header.find("R, 32-bit floating-point"), std::string::npos);
-    EXPECT_NE(header.find("piz"), std::string::npos);
-    EXPECT_NE(header.find("pixelAspectRatio (type float): 2"), std::string::npos);
-    // Integer pixels come back as 0..1 floats; the aspect as written.
-    const LoadResult r = Load(kId, ReadFile(dir / "a.exr"));
-    ASSERT_TRUE(r.image) << r.error;
-    EXPECT_EQ(r.image->Depth(), DepthRGBAFlt32);
-    EXPECT_DOUBLE_EQ(r.image->XScale() / r.image->YScale(), 2.0);
-    ExpectSame(*src, *r.image, 1e-6f);
+    const ImgRectI window(2, 1, 9, 5); // 11 x 6 frame: file lines 1..4, columns 2..8
+    for (const Row &row : rows)
+        for (int mode = 0; mode < 3; ++mode) {
+            SCOPED_TRACE(testing::Message() << "depth " << row.depth << " mode " << mode);
+            Ref<Image> src =
+                NewImageTagList({{ImgWidth, 11}, {ImgHeight, 6}, {ImgDepth, row.depth}, {ImgDataWindow, &window}});
+            ASSERT_TRUE(src && src->AllocScanLineData() && src->AddAuxChannel(AuxChannelKind::Z));
+            src->SetScale(2.0, 1.0);
+            for (int y = window.y0; y < window.y1; ++y)
+                for (int x = window.x0; x < window.x1; ++x) {
+                    const float v = 0.013f * (x + 11 * y) + 0.001f;
+                    src->PutFlt(x, y, {v, v / 2, 1 - v, 0.75f});
+                    src->AuxRow(AuxChannelKind::Z, y)[x - window.x0] = 100.f + v;
+                }
+            const Bytes b = SaveWith(kId, src.Get(), {{"Depth", mode}});
+            ASSERT_FALSE(b.empty());
+            WriteFile(dir / "d.exr", b);
+            const std::string header = CaptureText("exrheader '" + dir / "d.exr" + "'");
+            const bool half = std::string(row.colour[mode]) == "16-bit";
+            EXPECT_NE(header.find(std::string("R, ") + row.colour[mode] + " floating-point"), std::string::npos)
+                << header;
+            EXPECT_NE(header.find(std::string("Z, ") + (mode == 1 ? "16-bit" : "32-bit")), std::string::npos) << header;
+            EXPECT_NE(header.find("dataWindow (type box2i): (2 1) - (8 4)"), std::string::npos) << header;
+            EXPECT_NE(header.find("pixelAspectRatio (type float): 2"), std::string::npos);
+            const LoadResult r = Load(kId, b);
+            ASSERT_TRUE(r.image) << r.error;
+            EXPECT_EQ(r.image->Depth(), half ? DepthRGBAFlt16 : DepthRGBAFlt32);
+            ASSERT_EQ(r.image->DataWindow(), window);
+            auto stored = [half](float v) { return half ? HalfToFloat(FloatToHalf(v)) : v; };
+            for (int y = window.y0; y < window.y1; ++y)
+                for (int x = window.x0; x < window.x1; ++x) {
+                    const FltPixel s = src->GetFlt(x, y); // a single channel reads into all four
+                    ASSERT_EQ(r.image->GetFlt(x, y), (FltPixel{stored(s.R), stored(s.G), stored(s.B), stored(s.A)}))
+                        << x << "," << y;
+                    const float z = src->AuxRow(AuxChannelKind::Z, y)[x - window.x0];
+                    ASSERT_EQ(r.image->AuxRow(AuxChannelKind::Z, y)[x - window.x0],
+                              mode == 1 ? HalfToFloat(FloatToHalf(z)) : z);
+                }
+        }
 }
 
 TEST_F(OpenEXRFormatTest, AuxiliaryChannelsAndChannelBoxes) {
@@ -352,59 +387,82 @@ TEST_F(OpenEXRFormatTest, HandMadeFilesReadToKnownValues) {
     EXPECT_EQ(l.image->GetFlt(2, 1), (FltPixel{2.5f, 2.5f, 2.5f, 1.f}));
 }
 
-TEST_F(OpenEXRFormatTest, TiledMultiPartAndMultiViewFilesFromTheTools) {
+TEST_F(OpenEXRFormatTest, TiledMultiPartMultiViewAndLayeredFilesReadWhatIsChosen) {
     if (!HaveProgram("exrmaketiled") || !HaveProgram("exrmultipart") || !HaveProgram("exrmultiview"))
         GTEST_SKIP() << "the OpenEXR tools are not installed";
     TempDir dir;
     WriteFile(dir / "a.exr", OffsetFile(0));
     WriteFile(dir / "b.exr", OffsetFile(5));
     ASSERT_TRUE(RunShell("exrmaketiled -t 4 4 -z zip '" + dir / "a.exr" + "' '" + dir / "t.exr" + "'"));
-    const LoadResult t = Load(kId, ReadFile(dir / "t.exr"));
-    ASSERT_TRUE(t.image) << t.error;
-    ExpectOffsetFile(*t.image, 0);
-
     ASSERT_TRUE(RunShell("exrmultipart -combine -i '" + dir / "a.exr" + "::first' '" + dir / "b.exr" +
                          "::second' -o '" + dir / "p.exr" + "' >/dev/null"));
-    const Bytes parts = ReadFile(dir / "p.exr");
-    Ref<ImageFormat> f = MakeFormat(kId);
-    MemoryIO io(parts);
-    ASSERT_TRUE(f->LoadHeader(&io)) << f->Error();
-    Ref<Image> first;
-    ASSERT_TRUE(f->LoadFrameTagList(0, first, {}));
-    ExpectOffsetFile(*first, 0);
-    OrvaneDoc doc;
-    Operator *tool = Orvane::Test::AddImageSource(doc, "Loader", nullptr);
-    f->AddLoadInputs(tool); // the part list now offers the file's parts
-    Input *part = tool->FindInput("Part");
-    ASSERT_NE(part, nullptr);
-    std::vector<std::string> ids;
-    for (const TagItem *item : part->Tags().FindAll(ListItemId)) ids.push_back(item->AsID().Text());
-    EXPECT_EQ(ids, (std::vector<std::string>{"Default", "first", "second"}));
-    Request req(tool, nullptr, 0.0, 0, nullptr);
-    req.SetInputData(part, MakeRef<IDValue>(OvID("second")).Get());
-    f->SetupLoad(tool, &req);
-    Ref<Image> second;
-    io.Seek(0, IOClass::SeekStart);
-    ASSERT_TRUE(f->LoadHeader(&io) && f->LoadFrameTagList(0, second, {})) << f->Error();
-    ExpectOffsetFile(*second, 5);
-    req.SetInputData(part, MakeRef<IDValue>(OvID("third")).Get());
-    f->SetupLoad(tool, &req);
-    io.Seek(0, IOClass::SeekStart);
-    EXPECT_FALSE(f->LoadHeader(&io));
-
     // The right view is the file's default; the left eye is still read first.
     ASSERT_TRUE(RunShell("exrmultiview -z zip right '" + dir / "b.exr" + "' left '" + dir / "a.exr" + "' '" +
                          dir / "v.exr" + "'"));
-    const Bytes views = ReadFile(dir / "v.exr");
-    const LoadResult left = Load(kId, views);
-    ASSERT_TRUE(left.image) << left.error;
-    ExpectOffsetFile(*left.image, 0);
-    // The right eye, through the format attribute.
-    const LoadResult right = Load(kId, views, {}, [](ImageFormat &fmt) {
-        fmt.SetAttrsTagList({{FormatStereoEye, 1}});
-    });
-    ASSERT_TRUE(right.image) << right.error;
-    ExpectOffsetFile(*right.image, 5);
+    // Two colour layers; pixel x of layer channel c holds x + the layer's and the channel's offsets.
+    const Bytes layered = HandMade(
+        ImgRectI(0, 0, 3, 1), ImgRectI(0, 0, 3, 1),
+        {{"beauty.R", 1}, {"beauty.G", 1}, {"beauty.B", 1}, {"diffuse.R", 1}, {"diffuse.G", 1}, {"diffuse.B", 1}},
+        [](int x, int, const std::string &c) {
+            return (c[0] == 'd' ? 10.f : 0.f) + x + ChannelIndex(c.substr(c.size() - 1)) / 4.f;
+        });
+    const std::map<std::string, Bytes> files = {{"tiled", ReadFile(dir / "t.exr")},
+                                                {"parts", ReadFile(dir / "p.exr")},
+                                                {"views", ReadFile(dir / "v.exr")},
+                                                {"layers", layered}};
+    struct Row {
+        const char *file;
+        Choices choices;
+        int eye, seed;     ///< the OffsetFile read (layers: the layer's offset)
+        const char *error; ///< the failure expected instead
+    };
+    const Row rows[] = {
+        {"tiled", {}, 0, 0, nullptr},
+        {"parts", {}, 0, 0, nullptr},
+        {"parts", {{"Part", "second"}}, 0, 5, nullptr},
+        {"parts", {{"Part", "third"}}, 0, 0, "the file has no part third"},
+        {"views", {}, 0, 0, nullptr},
+        {"views", {}, 1, 5, nullptr},
+        {"views", {{"View", "right"}}, 0, 5, nullptr},
+        {"views", {{"View", "left"}}, 1, 0, nullptr}, // the choice outranks the eye
+        {"views", {{"View", "centre"}}, 0, 0, "the file has no view centre"},
+        {"layers", {}, 0, 0, nullptr},
+        {"layers", {{"Layer", "diffuse"}}, 0, 10, nullptr},
+        {"layers", {{"Layer", "specular"}}, 0, 0, "has no layer specular"},
+    };
+    for (const Row &row : rows) {
+        SCOPED_TRACE(testing::Message() << row.file << " eye " << row.eye << " "
+                                        << (row.choices.empty() ? "" : row.choices[0].second));
+        std::string error;
+        Ref<Image> img = LoadWith(files.at(row.file), {}, row.choices, row.eye, &error);
+        if (row.error) {
+            EXPECT_FALSE(img);
+            EXPECT_NE(error.find(row.error), std::string::npos) << error;
+        } else if (std::string(row.file) == "layers") {
+            ASSERT_TRUE(img) << error;
+            const float at = row.seed + 2.f;
+            EXPECT_EQ(img->GetFlt(2, 0), (FltPixel{at, at + 0.25f, at + 0.5f, 1.f}));
+        } else {
+            ASSERT_TRUE(img) << error;
+            ExpectOffsetFile(*img, row.seed);
+        }
+    }
+
+    // After a header, the lists offer the file's parts and views.
+    for (const auto &[file, input, want] :
+         {std::tuple{"parts", "Part", std::vector<std::string>{"Default", "first", "second"}},
+          std::tuple{"views", "View", std::vector<std::string>{"Default", "right", "left"}}}) {
+        Ref<ImageFormat> f = MakeFormat(kId);
+        MemoryIO io(files.at(file));
+        ASSERT_TRUE(f->LoadHeader(&io)) << f->Error();
+        OrvaneDoc doc;
+        Operator *tool = Orvane::Test::AddImageSource(doc, "Loader", nullptr);
+        f->AddLoadInputs(tool);
+        std::vector<std::string> ids;
+        for (const TagItem *item : tool->FindInput(input)->Tags().FindAll(ListItemId))
+            ids.push_back(item->AsID().Text());
+        EXPECT_EQ(ids, want) << input;
+    }
 }
 
 // ---- the sample images ----
@@ -430,19 +488,30 @@ TEST_F(OpenEXRFormatTest, SampleImagesMatchExrheader) {
         }
     EXPECT_GE(files, 30);
 
-    // The left eye of the single-part and the multi-part Beachball frame agree.
-    const LoadResult single = Load(kId, ReadFile(Samples() + "/Beachball/singlepart.0001.exr"));
-    const LoadResult multi = Load(kId, ReadFile(Samples() + "/Beachball/multipart.0001.exr"));
-    ASSERT_TRUE(single.image && multi.image);
-    const ImgRectI common = single.image->DataWindow() & multi.image->DataWindow();
-    ASSERT_FALSE(common.IsNull());
-    int differ = 0;
-    for (int y = common.y0; y < common.y1; y += 7)
-        for (int x = common.x0; x < common.x1; x += 7)
-            differ += !(single.image->GetFlt(x, y) == multi.image->GetFlt(x, y));
-    EXPECT_EQ(differ, 0);
-    EXPECT_TRUE(multi.image->Metadata().Find("name"));
-    EXPECT_EQ(multi.image->Metadata().Find("name")->AsText(), "rgba_left");
+    // Each eye of the single-part multi-view and the multi-part Beachball
+    // frame agree, and the two eyes differ.
+    const Bytes singleFile = ReadFile(Samples() + "/Beachball/singlepart.0001.exr");
+    const Bytes multiFile = ReadFile(Samples() + "/Beachball/multipart.0001.exr");
+    auto differing = [](const Image &a, const Image &b) {
+        const ImgRectI common = a.DataWindow() & b.DataWindow();
+        EXPECT_FALSE(common.IsNull());
+        int n = 0;
+        for (int y = common.y0; y < common.y1; y += 7)
+            for (int x = common.x0; x < common.x1; x += 7) n += !(a.GetFlt(x, y) == b.GetFlt(x, y));
+        return n;
+    };
+    Ref<Image> eyes[2];
+    for (int eye = 0; eye < 2; ++eye) {
+        const char *view = eye ? "right" : "left";
+        Ref<Image> single = LoadWith(singleFile, {}, {{"View", view}});
+        Ref<Image> multi = LoadWith(multiFile, {}, {{"View", view}});
+        ASSERT_TRUE(single && multi) << view;
+        EXPECT_EQ(differing(*single, *multi), 0) << view;
+        ASSERT_TRUE(multi->Metadata().Find("name"));
+        EXPECT_EQ(multi->Metadata().Find("name")->AsText(), std::string("rgba_") + view);
+        eyes[eye] = single;
+    }
+    EXPECT_GT(differing(*eyes[0], *eyes[1]), 100);
 
     // Luminance / chroma reads close to the RGB original.
     const LoadResult rgb = Load(kId, ReadFile(Samples() + "/Chromaticities/Rec709.exr"));
