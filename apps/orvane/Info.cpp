@@ -244,7 +244,7 @@ void Json(const ScriptVal &v, std::string &out, int indent) {
         return;
     }
     const bool list = v.ArrayLength() == v.Size();
-    bool oneLine = list ? IsShortList(v) : v.Size() <= 4;
+    bool oneLine = list ? IsShortList(v) : v.Size() <= 6;
     for (const auto &[k, e] : v.Entries()) oneLine = oneLine && (!e.IsTable() || (!list && IsShortList(e)));
     const std::string pad = oneLine ? " " : "\n" + std::string(static_cast<size_t>(indent + 2), ' ');
     out += list ? "[" : "{";

@@ -9,6 +9,7 @@
 #include <vector>
 
 #include "tests/apps/CliRun.h"
+#include "tests/operators/media/FormatTestSupport.h"
 
 namespace Orvane::clitest {
 namespace {
@@ -20,16 +21,8 @@ std::string Samples() {
     return {};
 }
 
-bool HaveProgram(const char *name) {
-    return std::system(("command -v " + std::string(name) + " >/dev/null 2>&1").c_str()) == 0;
-}
-
-/// stdout of a shell command.
-std::string Capture(const std::string &cmd) {
-    TempDir dir;
-    std::system((cmd + " >" + Quote((dir.Path() / "out").string()) + " 2>/dev/null").c_str());
-    return ReadFile(dir.Path() / "out");
-}
+using FmtTest::HaveProgram;
+const auto Capture = FmtTest::CaptureText;
 
 TEST(CliInfo, AFileIsItselfAndASequenceIsAskedForOrNamed) {
     if (Samples().empty()) GTEST_SKIP() << "the OpenEXR sample images are absent";

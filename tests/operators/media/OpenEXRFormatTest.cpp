@@ -80,7 +80,7 @@ Ref<Image> LoadWith(const Bytes &data, const Options &options, const Choices &ch
 
 struct Channel {
     std::string name;
-    int type; // 1 HALF, 2 FLOAT
+    int type; // 0 UINT, 1 HALF, 2 FLOAT
 };
 
 void Put32(Bytes &b, uint32_t v) {
@@ -99,10 +99,12 @@ void Attr(Bytes &b, const std::string &name, const std::string &type, const Byte
 }
 
 /// An uncompressed scan-line file; channel c of file pixel (x, y) is value(x, y, c).
+/// A deep one holds one sample a pixel.
 Bytes HandMade(const ImgRectI &display, const ImgRectI &data, std::vector<Channel> channels,
-               const std::function<float(int, int, const std::string &)> &value) {
+               const std::function<float(int, int, const std::string &)> &value, bool deep = false) {
     std::sort(channels.begin(), channels.end(), [](auto &a, auto &b) { return a.name < b.name; });
-    Bytes b = {0x76, 0x2f, 0x31, 0x01, 2, 0, 0, 0}, v;
+    const int lines = data.y1 - data.y0 + 1, width = data.x1 - data.x0 + 1;
+    Bytes b = {0x76, 0x2f, 0x31, 0x01, 2, uint8_t(deep ? 8 : 0), 0, 0}, v; // 8: not an image of flat pixels
     for (const Channel &c : channels) {
         v.insert(v.end(), c.name.begin(), c.name.end());
         v.push_back(0);
@@ -119,8 +121,13 @@ Bytes HandMade(const ImgRectI &display, const ImgRectI &data, std::vector<Channe
     v.clear(), Put32(v, 0x3f800000u), Attr(b, "pixelAspectRatio", "float", v);
     v.clear(), Put32(v, 0), Put32(v, 0), Attr(b, "screenWindowCenter", "v2f", v);
     v.clear(), Put32(v, 0x3f800000u), Attr(b, "screenWindowWidth", "float", v);
+    if (deep) {
+        const std::string type = "deepscanline";
+        Attr(b, "type", "string", Bytes(type.begin(), type.end()));
+        v.clear(), Put32(v, 1), Attr(b, "version", "int", v);
+        v.clear(), Put32(v, static_cast<uint32_t>(lines)), Attr(b, "chunkCount", "int", v);
+    }
     b.push_back(0);
-    const int lines = data.y1 - data.y0 + 1, width = data.x1 - data.x0 + 1;
     size_t bytesPerLine = 0;
     for (const Channel &c : channels) bytesPerLine += size_t(width) * (c.type == 1 ? 2 : 4);
     const size_t table = b.size();
@@ -129,13 +136,21 @@ Bytes HandMade(const ImgRectI &display, const ImgRectI &data, std::vector<Channe
         const uint64_t at = b.size();
         for (int k = 0; k < 8; ++k) b[table + 8 * i + k] = static_cast<uint8_t>(at >> (8 * k));
         Put32(b, static_cast<uint32_t>(data.y0 + i));
-        Put32(b, static_cast<uint32_t>(bytesPerLine));
+        if (deep) { // the sample counts' table, its size and the samples' size twice (64 bits each)
+            for (uint32_t n : {uint32_t(width) * 4, 0u, uint32_t(bytesPerLine), 0u, uint32_t(bytesPerLine), 0u})
+                Put32(b, n);
+            for (int x = 1; x <= width; ++x) Put32(b, static_cast<uint32_t>(x));
+        } else {
+            Put32(b, static_cast<uint32_t>(bytesPerLine));
+        }
         for (const Channel &c : channels)
             for (int x = data.x0; x <= data.x1; ++x) {
                 const float f = value(x, data.y0 + i, c.name);
                 if (c.type == 1) {
                     const uint16_t h = FloatToHalf(f);
                     b.push_back(static_cast<uint8_t>(h)), b.push_back(static_cast<uint8_t>(h >> 8));
+                } else if (c.type == 0) {
+                    Put32(b, static_cast<uint32_t>(f));
                 } else {
                     uint32_t u;
                     std::memcpy(&u, &f, 4);
@@ -377,14 +392,46 @@ TEST_F(OpenEXRFormatTest, HandMadeFilesReadToKnownValues) {
             const float v = x * 0.25f - (3 - y) / 3.f;
             ASSERT_EQ(g.image->GetFlt(x, y), (FltPixel{v, v, v, 1.f}));
         }
+}
 
-    // Lower-case names in a layer, no alpha; an unknown channel is left alone.
-    const Bytes layered = HandMade(ImgRectI(0, 0, 3, 1), ImgRectI(0, 0, 3, 1),
-                                   {{"beauty.r", 1}, {"beauty.g", 1}, {"beauty.b", 1}, {"mask", 1}},
-                                   [](int x, int, const std::string &c) { return c == "mask" ? 9.f : x + 0.5f; });
-    const LoadResult l = Load(kId, layered);
-    ASSERT_TRUE(l.image) << l.error;
-    EXPECT_EQ(l.image->GetFlt(2, 1), (FltPixel{2.5f, 2.5f, 2.5f, 1.f}));
+TEST_F(OpenEXRFormatTest, DescriptionsTellWhatTheFileHoldsEvenWhereItIsNotRead) {
+    // Display 0..7 x 0..4, data 2..5 x 1..3 as the file holds them.
+    const auto value = [](int x, int, const std::string &c) { return c == "objectID" ? 7.f + x : 0.5f; };
+    const Bytes flat =
+        HandMade(ImgRectI(0, 0, 7, 4), ImgRectI(2, 1, 5, 3), {{"R", 1}, {"G", 2}, {"objectID", 0}}, value);
+    const Bytes deep = HandMade(ImgRectI(0, 0, 7, 4), ImgRectI(2, 1, 5, 3), {{"Z", 2}, {"A", 1}}, value, true);
+    struct Row {
+        const Bytes &file;
+        const char *readError, *type, *channels;
+    };
+    const Row rows[] = {{flat, nullptr, "scanlineimage", "G float, R half, objectID uint32"},
+                        {deep, "holds deep data", "deepscanline", "A half, Z float"}};
+    for (const Row &row : rows) {
+        SCOPED_TRACE(row.type);
+        Ref<ImageFormat> f = MakeFormat(kId);
+        MemoryIO io(row.file);
+        ScriptVal d;
+        ASSERT_TRUE(f->DescribeFile(&io, d)) << f->Error();
+        const ScriptVal *error = d.Find("readError");
+        ASSERT_EQ(error != nullptr, row.readError != nullptr) << (error ? error->AsText() : "");
+        if (error) {
+            EXPECT_NE(error->AsText().find(row.readError), std::string::npos) << error->AsText();
+        }
+        EXPECT_EQ(d.Find("width") != nullptr, row.readError == nullptr);
+        const ScriptVal &part = *d.Find("openexr")->Find("parts")->At(1);
+        EXPECT_EQ(part.Find("type")->AsText(), row.type);
+        EXPECT_EQ(part.Find("dataWindow")->ToText(), "{ 2, 1, 5, 3 }");
+        EXPECT_EQ(part.Find("displayWindow")->ToText(), "{ 0, 0, 7, 4 }");
+        std::string channels;
+        for (const auto &[k, c] : d.Find("channels")->Entries())
+            channels += (channels.empty() ? "" : ", ") + c.Find("name")->AsText() + " " + c.Find("type")->AsText();
+        EXPECT_EQ(channels, row.channels);
+    }
+    // The unsigned integers read as floats, in the image's flipped window.
+    const LoadResult r = Load(kId, flat);
+    ASSERT_TRUE(r.image) << r.error;
+    ASSERT_EQ(r.image->DataWindow(), ImgRectI(2, 1, 6, 4));
+    EXPECT_EQ(r.image->AuxRow(AuxChannelKind::ObjectID, 2)[3], 7.f + 5);
 }
 
 TEST_F(OpenEXRFormatTest, TiledMultiPartMultiViewAndLayeredFilesReadWhatIsChosen) {
@@ -399,13 +446,21 @@ TEST_F(OpenEXRFormatTest, TiledMultiPartMultiViewAndLayeredFilesReadWhatIsChosen
     // The right view is the file's default; the left eye is still read first.
     ASSERT_TRUE(RunShell("exrmultiview -z zip right '" + dir / "b.exr" + "' left '" + dir / "a.exr" + "' '" +
                          dir / "v.exr" + "'"));
-    // Two colour layers; pixel x of layer channel c holds x + the layer's and the channel's offsets.
-    const Bytes layered = HandMade(
-        ImgRectI(0, 0, 3, 1), ImgRectI(0, 0, 3, 1),
-        {{"beauty.R", 1}, {"beauty.G", 1}, {"beauty.B", 1}, {"diffuse.R", 1}, {"diffuse.G", 1}, {"diffuse.B", 1}},
-        [](int x, int, const std::string &c) {
-            return (c[0] == 'd' ? 10.f : 0.f) + x + ChannelIndex(c.substr(c.size() - 1)) / 4.f;
-        });
+    // Two colour layers, one with lower-case names, no alpha, and a channel no
+    // slot reads; pixel x of layer channel c holds x + the layer's and the channel's offsets.
+    const Bytes layered = HandMade(ImgRectI(0, 0, 3, 1), ImgRectI(0, 0, 3, 1),
+                                   {{"beauty.r", 1},
+                                    {"beauty.g", 1},
+                                    {"beauty.b", 1},
+                                    {"diffuse.R", 1},
+                                    {"diffuse.G", 1},
+                                    {"diffuse.B", 1},
+                                    {"mask", 1}},
+                                   [](int x, int, const std::string &c) {
+                                       const char last =
+                                           static_cast<char>(std::toupper(static_cast<unsigned char>(c.back())));
+                                       return (c[0] == 'd' ? 10.f : 0.f) + x + ChannelIndex(std::string(1, last)) / 4.f;
+                                   });
     const std::map<std::string, Bytes> files = {{"tiled", ReadFile(dir / "t.exr")},
                                                 {"parts", ReadFile(dir / "p.exr")},
                                                 {"views", ReadFile(dir / "v.exr")},
