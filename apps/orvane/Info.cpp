@@ -100,7 +100,7 @@ std::string Number(double v) {
 
 /// A value on one line: texts quoted, lists in brackets, tables in braces.
 std::string Compact(const ScriptVal &v) {
-    if (v.IsText()) return "\"" + v.AsText() + "\"";
+    if (v.IsText()) return JsonString(v.AsText()); // quoted, line breaks and controls escaped
     if (v.IsNumber()) return Number(v.AsNumber());
     if (v.IsBool()) return v.AsBool() ? "true" : "false";
     if (!v.IsTable()) return "nil";
