@@ -375,39 +375,44 @@ TEST_F(OpenEXRFormatTest, MetadataRoundTripsWithTypes) {
 
 // ---- files made independently ----
 
-TEST_F(OpenEXRFormatTest, HandMadeFilesReadToKnownValues) {
-    const LoadResult r = Load(kId, OffsetFile(0));
-    ASSERT_TRUE(r.image) << r.error;
-    EXPECT_EQ(r.image->Depth(), DepthRGBAFlt16);
-    ExpectOffsetFile(*r.image, 0);
-
+TEST_F(OpenEXRFormatTest, HandMadeFilesReadToKnownValuesAndAreDescribedAsBuilt) {
     // Y alone: grey, opaque; FLOAT makes a float32 image.
     const Bytes grey = HandMade(ImgRectI(0, 0, 5, 3), ImgRectI(0, 0, 5, 3), {{"Y", 2}},
                                 [](int x, int y, const std::string &) { return x * 0.25f - y / 3.f; });
-    const LoadResult g = Load(kId, grey);
-    ASSERT_TRUE(g.image) << g.error;
-    EXPECT_EQ(g.image->Depth(), DepthRGBAFlt32);
-    for (int y = 0; y < 4; ++y)
-        for (int x = 0; x < 6; ++x) {
-            const float v = x * 0.25f - (3 - y) / 3.f;
-            ASSERT_EQ(g.image->GetFlt(x, y), (FltPixel{v, v, v, 1.f}));
-        }
-}
-
-TEST_F(OpenEXRFormatTest, DescriptionsTellWhatTheFileHoldsEvenWhereItIsNotRead) {
-    // Display 0..7 x 0..4, data 2..5 x 1..3 as the file holds them.
     const auto value = [](int x, int, const std::string &c) { return c == "objectID" ? 7.f + x : 0.5f; };
-    const Bytes flat =
+    const Bytes uint =
         HandMade(ImgRectI(0, 0, 7, 4), ImgRectI(2, 1, 5, 3), {{"R", 1}, {"G", 2}, {"objectID", 0}}, value);
     const Bytes deep = HandMade(ImgRectI(0, 0, 7, 4), ImgRectI(2, 1, 5, 3), {{"Z", 2}, {"A", 1}}, value, true);
     struct Row {
-        const Bytes &file;
-        const char *readError, *type, *channels;
+        Bytes file;
+        const char *readError, *type, *channels, *dataWindow, *displayWindow; // windows as the file holds them
+        std::function<void(const Image &)> check;
     };
-    const Row rows[] = {{flat, nullptr, "scanlineimage", "G float, R half, objectID uint32"},
-                        {deep, "holds deep data", "deepscanline", "A half, Z float"}};
+    const Row rows[] = {
+        {OffsetFile(0), nullptr, "scanlineimage", "A half, B half, G half, R half", "{ 3, 2, 10, 6 }",
+         "{ 1, 1, 12, 8 }",
+         [](const Image &img) {
+             EXPECT_EQ(img.Depth(), DepthRGBAFlt16);
+             ExpectOffsetFile(img, 0);
+         }},
+        {grey, nullptr, "scanlineimage", "Y float", "{ 0, 0, 5, 3 }", "{ 0, 0, 5, 3 }",
+         [](const Image &img) {
+             EXPECT_EQ(img.Depth(), DepthRGBAFlt32);
+             for (int y = 0; y < 4; ++y)
+                 for (int x = 0; x < 6; ++x) {
+                     const float v = x * 0.25f - (3 - y) / 3.f;
+                     ASSERT_EQ(img.GetFlt(x, y), (FltPixel{v, v, v, 1.f}));
+                 }
+         }},
+        {uint, nullptr, "scanlineimage", "G float, R half, objectID uint32", "{ 2, 1, 5, 3 }", "{ 0, 0, 7, 4 }",
+         [](const Image &img) { // unsigned integers read as floats, in the image's flipped window
+             ASSERT_EQ(img.DataWindow(), ImgRectI(2, 1, 6, 4));
+             EXPECT_EQ(img.AuxRow(AuxChannelKind::ObjectID, 2)[3], 7.f + 5);
+         }},
+        {deep, "holds deep data", "deepscanline", "A half, Z float", "{ 2, 1, 5, 3 }", "{ 0, 0, 7, 4 }", nullptr},
+    };
     for (const Row &row : rows) {
-        SCOPED_TRACE(row.type);
+        SCOPED_TRACE(row.channels);
         Ref<ImageFormat> f = MakeFormat(kId);
         MemoryIO io(row.file);
         ScriptVal d;
@@ -420,18 +425,16 @@ TEST_F(OpenEXRFormatTest, DescriptionsTellWhatTheFileHoldsEvenWhereItIsNotRead) 
         EXPECT_EQ(d.Find("width") != nullptr, row.readError == nullptr);
         const ScriptVal &part = *d.Find("openexr")->Find("parts")->At(1);
         EXPECT_EQ(part.Find("type")->AsText(), row.type);
-        EXPECT_EQ(part.Find("dataWindow")->ToText(), "{ 2, 1, 5, 3 }");
-        EXPECT_EQ(part.Find("displayWindow")->ToText(), "{ 0, 0, 7, 4 }");
+        EXPECT_EQ(part.Find("dataWindow")->ToText(), row.dataWindow);
+        EXPECT_EQ(part.Find("displayWindow")->ToText(), row.displayWindow);
         std::string channels;
         for (const auto &[k, c] : d.Find("channels")->Entries())
             channels += (channels.empty() ? "" : ", ") + c.Find("name")->AsText() + " " + c.Find("type")->AsText();
         EXPECT_EQ(channels, row.channels);
+        const LoadResult r = Load(kId, row.file);
+        ASSERT_EQ(r.image != nullptr, row.check != nullptr) << r.error;
+        if (row.check) row.check(*r.image);
     }
-    // The unsigned integers read as floats, in the image's flipped window.
-    const LoadResult r = Load(kId, flat);
-    ASSERT_TRUE(r.image) << r.error;
-    ASSERT_EQ(r.image->DataWindow(), ImgRectI(2, 1, 6, 4));
-    EXPECT_EQ(r.image->AuxRow(AuxChannelKind::ObjectID, 2)[3], 7.f + 5);
 }
 
 TEST_F(OpenEXRFormatTest, TiledMultiPartMultiViewAndLayeredFilesReadWhatIsChosen) {
