@@ -13,6 +13,7 @@
 #include "host/flow/InputValue.h"
 #include "host/flow/Operator.h"
 #include "host/flow/OrvaneDoc.h"
+#include "host/media/Clip.h"
 
 namespace Orvane::Cli {
 namespace {
@@ -266,6 +267,17 @@ int RunDescribe(const std::vector<std::string> &args) {
     if ((row.TypeFlags() & RegKindOperator) && row.CanCreate()) {
         op = doc.AddTool(row.ID(), "Describe1");
         if (!op) throw CliError(ExitFailed, std::string("cannot make a ") + row.ID().Text());
+        // A tool that reads clips adds a format's options to its Format page when
+        // a file of that format is named; one name per format shows them all.
+        if (Input *clip = row.Tags().GetBool(RegClipSourceTool) ? op->FindInput("Clip") : nullptr) {
+            std::vector<const Registry *> formats = ClassRegistry->Rows();
+            std::sort(formats.begin(), formats.end(),
+                      [](const Registry *a, const Registry *b) { return a->ID() < b->ID(); });
+            for (const Registry *f : formats)
+                if (f->IsRegClassType(RegFamilyImageFormat) && f->Tags().GetBool(RegFormatCanLoad) &&
+                    f->Tags().GetBool(RegFormatHasOptions) && f->Tags().GetText(RegFormatExtension))
+                    clip->SetValue(MakeRef<Clip>(std::string("file") + f->Tags().GetText(RegFormatExtension)));
+        }
     }
     if (markdown) {
         PrintMarkdown(row, op);

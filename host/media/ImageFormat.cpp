@@ -6,6 +6,8 @@
 #include "host/flow/Request.h"
 #include "host/image/NewImage.h"
 
+#include <sstream>
+
 namespace Orvane {
 
 MediaFormat::MediaFormat(const Registry *reg, const ScriptVal &, const TagList &) { SetRegistry(reg); }
@@ -65,6 +67,44 @@ bool ImageFormat::LoadFrameTagList(unsigned, Ref<Image> &image, const TagList &t
 bool ImageFormat::SaveHeader(IOClass *, Image *) { return Fail("this format cannot write"); }
 bool ImageFormat::SaveFrame(unsigned, Image *) { return Fail("this format cannot write"); }
 int64_t ImageFormat::PredictFileSize(Image *) { return 0; }
+
+bool ImageFormat::DescribeFile(IOClass *stream, ScriptVal &d) {
+    Ref<Image> header;
+    fileChannels.clear();
+    fileSampleType.clear();
+    if (!LoadHeader(stream) || !LoadFrameTagList(0, header, {{ClipFrameHeaderOnly, 1}})) return false;
+    d = ScriptVal::Table();
+    d.Set("width", header->Width());
+    d.Set("height", header->Height());
+    d.Set("pixelAspect", header->YScale() > 0 ? header->XScale() / header->YScale() : 1.0);
+    d.Set("imageDepth", DepthName(header->Depth()));
+    const ImgRectI &w = header->DataWindow();
+    ScriptVal window = ScriptVal::Table();
+    for (int v : {w.x0, w.y0, w.x1, w.y1}) window.Append(v);
+    d.Set("dataWindow", window);
+    // The image depth's channels, unless the format said what the file holds.
+    static const char *const kSampleTypes[] = {"uint8", "uint16", "half", "float"};
+    const int step = (header->Depth() - 1) % 4;
+    std::string names = fileChannels.empty() ? (header->IsMask() ? "A" : "R G B A") : fileChannels;
+    const std::string type = fileChannels.empty() ? kSampleTypes[step < 0 ? 0 : step] : fileSampleType;
+    ScriptVal channels = ScriptVal::Table();
+    std::istringstream words(names);
+    for (std::string name; words >> name;) {
+        ScriptVal c = ScriptVal::Table();
+        c.Set("name", name);
+        c.Set("type", type);
+        channels.Append(c);
+    }
+    d.Set("channels", channels);
+    if (header->Metadata().IsTable() && header->Metadata().Size()) d.Set("metadata", header->Metadata());
+    return true;
+}
+
+const char *DepthName(int depth) {
+    static const char *const names[] = {"?",         "int8 mask",  "int16 mask",   "float16 mask", "float32 mask",
+                                        "RGBA int8", "RGBA int16", "RGBA float16", "RGBA float32"};
+    return depth >= 1 && depth <= 8 ? names[depth] : names[0];
+}
 
 Ref<ImageFormat> NewImageFormat(const Registry *row) {
     if (!row || !row->IsRegClassType(RegFamilyImageFormat)) return nullptr;

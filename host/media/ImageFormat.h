@@ -13,6 +13,8 @@
 //             ClipFrameHeaderOnly  1: the image gets no pixels (pre-calculation)
 //             ClipFrameProxyScale  set as proxyScale before LoadHeader
 // Writing:  SaveHeader(io, image), then SaveFrame(frame, image).
+// Describing: DescribeFile(io, description) tells what a file holds (the
+//           command line's info); formats add what their files carry.
 // Options:  AddLoadInputs / AddSaveInputs add the format's inputs to the
 //           reading or writing tool; SetupLoad / SetupSave read them for one
 //           request (a null tool means the defaults); Cleanup* release.
@@ -85,6 +87,16 @@ public:
     virtual bool SaveFrame(unsigned frame, Image *image);
     /// Bytes one frame will take (disk space checks).
     virtual int64_t PredictFileSize(Image *image);
+    /// Describes the file at the stream's position, in these keys and any the
+    /// format adds:
+    ///   width, height, pixelAspect   the frame as read
+    ///   imageDepth                   the image reading makes ("RGBA float16")
+    ///   dataWindow                   { x0, y0, x1, y1 }: image coordinates, y up, max exclusive
+    ///   channels                     { { name = "Y", type = "uint16" }, ... }: what the file stores
+    ///   metadata                     what reading attaches to the image (when anything)
+    /// The default reads the header and makes the header image. False, with
+    /// Error(), when the header cannot be read.
+    virtual bool DescribeFile(IOClass *io, ScriptVal &description);
 
     // The stream and the header fields, kept between the calls.
     IOClass *io = nullptr;
@@ -95,9 +107,16 @@ public:
     int depth = 0; ///< image depth the file maps to (1..8)
     /// Metadata read from the file, handed to the image it makes.
     ScriptVal metadata = ScriptVal::Table();
+    /// What the file stores where it differs from `depth` (descriptions
+    /// only): channel names separated by spaces ("Y A") and their sample
+    /// type ("uint16"). LoadHeader sets both or neither.
+    std::string fileChannels, fileSampleType;
 
     bool Aborted() const { return abortFlag && abortFlag->load(std::memory_order_relaxed); }
 };
+
+/// "RGBA float16", "int8 mask": the words for an image depth (1..8); "?" for others.
+ORVANE_API const char *DepthName(int depth);
 
 /// Makes a format object from its registry row; null if the row is no format.
 ORVANE_API Ref<ImageFormat> NewImageFormat(const Registry *row);

@@ -11,65 +11,10 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
-#include "tests/support/TestSupport.h"
+#include "tests/apps/CliRun.h"
 
 namespace Orvane::clitest {
 namespace {
-
-struct CliRun {
-    int exitCode = -1;
-    std::string out, err;
-};
-
-std::string Quote(const std::string &s) {
-    std::string q = "'";
-    for (char c : s) q += c == '\'' ? std::string("'\\''") : std::string(1, c);
-    return q + "'";
-}
-
-std::string ReadFile(const std::filesystem::path &p) {
-    std::ifstream f(p, std::ios::binary);
-    std::ostringstream s;
-    s << f.rdbuf();
-    return s.str();
-}
-
-class TempDir {
-public:
-    TempDir() {
-        path_ = std::filesystem::temp_directory_path() /
-                ("orvane-cli-" + std::to_string(getpid()) + "-" + std::to_string(counter_++));
-        std::filesystem::create_directories(path_);
-    }
-    ~TempDir() {
-        std::error_code ec;
-        std::filesystem::remove_all(path_, ec);
-    }
-    std::filesystem::path File(const std::string &name, const std::string &text) const {
-        std::ofstream(path_ / name, std::ios::binary) << text;
-        return path_ / name;
-    }
-    const std::filesystem::path &Path() const { return path_; }
-
-private:
-    std::filesystem::path path_;
-    static inline int counter_ = 0;
-};
-
-CliRun Orvane(const std::string &args) {
-    TempDir dir;
-    const auto outFile = dir.Path() / "out", errFile = dir.Path() / "err";
-    const std::string cmd = Quote(std::string(ORVANE_BINARY_DIR) + "/orvane") + " " + args + " >" +
-                            Quote(outFile.string()) + " 2>" + Quote(errFile.string()) + " </dev/null";
-    const int status = std::system(cmd.c_str());
-    CliRun r;
-    r.exitCode = WIFEXITED(status) ? WEXITSTATUS(status) : -1;
-    r.out = ReadFile(outFile);
-    r.err = ReadFile(errFile);
-    return r;
-}
-
-bool Contains(const std::string &text, const std::string &part) { return text.find(part) != std::string::npos; }
 
 TEST(CliTools, SearchFindsClassesByAliasAndMarksUnbuiltOnes) {
     const CliRun dither = Orvane("tools --search dither");
@@ -166,35 +111,6 @@ TEST(CliEval, AToolThatIsNotBuiltFailsWithExitThree) {
     EXPECT_TRUE(Contains(r.out, "\"ok\": false")) << r.out;
     EXPECT_TRUE(Contains(r.out, "Glow1: the Glow tool is not available yet")) << r.out;
     EXPECT_TRUE(Contains(r.err, "ERROR: Glow1: the Glow tool is not available yet")) << r.err;
-}
-
-} // namespace
-} // namespace Orvane::clitest
-
-namespace Orvane::clitest {
-namespace {
-
-TEST(CliInfo, DescribesASequenceWithItsGapsAndRefusesABrokenFile) {
-    if (std::system("command -v convert >/dev/null 2>&1") != 0)
-        GTEST_SKIP() << "ImageMagick's convert is not installed";
-    TempDir dir;
-    for (const char *name : {"seq.0001.png", "seq.0002.png", "seq.0004.png"}) {
-        const std::string cmd = "convert -size 4x3 xc:red " + Quote((dir.Path() / name).string());
-        ASSERT_EQ(std::system(cmd.c_str()), 0);
-    }
-    const CliRun r = Orvane("info " + Quote((dir.Path() / "seq.0002.png").string()));
-    EXPECT_EQ(r.exitCode, 0) << r.err;
-    EXPECT_TRUE(Contains(r.out, "seq.####.png")) << r.out;
-    EXPECT_TRUE(Contains(r.out, "PNG Files")) << r.out;
-    EXPECT_TRUE(Contains(r.out, "4 x 3")) << r.out;
-    EXPECT_TRUE(Contains(r.out, "frames        1 - 4 (3 files)")) << r.out;
-    EXPECT_TRUE(Contains(r.out, "missing       3")) << r.out;
-
-    const auto broken = dir.File("broken.png", "\x89PNG\r\n\x1a\n but then nothing sensible");
-    const CliRun bad = Orvane("info " + Quote(broken.string()));
-    EXPECT_EQ(bad.exitCode, 3);
-    EXPECT_TRUE(Contains(bad.err, "ERROR: ")) << bad.err;
-    EXPECT_TRUE(Contains(bad.err, "broken.png")) << bad.err;
 }
 
 } // namespace

@@ -123,6 +123,8 @@ bool BMPFormat::LoadHeader(IOClass *stream) {
     topDown_ = topDown;
     width = static_cast<int>(w), height = static_cast<int>(h);
     depth = DepthRGBAInt8;
+    fileChannels = bits == 32 ? "R G B A" : "R G B";
+    fileSampleType = "uint8";
     aspectX = aspectY = 1.0;
     return true;
 }

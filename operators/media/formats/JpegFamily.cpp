@@ -18,6 +18,8 @@ bool JpegFamily::LoadHeader(IOClass *stream) {
     aspectX = info.aspectX;
     aspectY = info.aspectY;
     depth = DepthRGBAInt8;
+    fileChannels = info.components == 1 ? "Y" : info.components == 4 ? "R G B A" : "R G B";
+    fileSampleType = "uint8";
     fullWidth_ = info.fullWidth;
     fullHeight_ = info.fullHeight;
     metadata = info.metadata;

@@ -2,19 +2,25 @@
 
 #include <Iex.h>
 #include <ImfChannelList.h>
+#include <ImfChannelListAttribute.h>
+#include <ImfCompressionAttribute.h>
 #include <ImfDoubleAttribute.h>
 #include <ImfFloatVectorAttribute.h>
 #include <ImfFrameBuffer.h>
 #include <ImfHeader.h>
 #include <ImfInputPart.h>
 #include <ImfIntAttribute.h>
+#include <ImfLineOrderAttribute.h>
 #include <ImfMultiPartInputFile.h>
 #include <ImfMultiView.h>
+#include <ImfOpaqueAttribute.h>
 #include <ImfOutputFile.h>
 #include <ImfPartType.h>
+#include <ImfPreviewImageAttribute.h>
 #include <ImfRgbaFile.h>
 #include <ImfStandardAttributes.h>
 #include <ImfThreading.h>
+#include <ImfTileDescriptionAttribute.h>
 #include <ImfVersion.h>
 
 #include <algorithm>
@@ -31,6 +37,7 @@
 #include "host/flow/Operator.h"
 #include "host/flow/Parameter.h"
 #include "host/flow/Request.h"
+#include "host/image/Half.h"
 #include "host/image/NewImage.h"
 #include "host/image/PixelConvert.h"
 #include "host/media/IOClass.h"
@@ -114,6 +121,14 @@ int LinesPerBlock(Imf::Compression c) {
     case Imf::DWAB_COMPRESSION: return 256;
     default: return 1;
     }
+}
+
+/// True when colour is written as HALF: Depth float16, or Auto for float16
+/// and 8-bit images (half keeps every 8-bit level, not every 16-bit one).
+bool HalfColour(int depthMode, int imageDepth) {
+    if (depthMode != 0) return depthMode == 1;
+    return imageDepth == DepthRGBAFlt16 || imageDepth == DepthAFlt16 || imageDepth == DepthRGBAInt8 ||
+           imageDepth == DepthAInt8;
 }
 
 /// Lines handed to the library at once: enough blocks to keep its threads
@@ -266,73 +281,81 @@ std::string TimeCodeText(const Imf::TimeCode &tc) {
     return buf;
 }
 
+/// An attribute's value as a script value: text and numbers, compound types
+/// as tables whose class name is the type ("v2f { 1, 2 }"), time codes as
+/// "hh:mm:ss:ff"; nil for types with no script form (channel lists,
+/// previews, opaque data). `hint` gets the type of numbers and time codes.
+ScriptVal AttributeValue(const Imf::Attribute &a, std::string &hint) {
+    const std::string type = a.typeName();
+    hint.clear();
+    auto as = [&a]<class T>(T *) -> const auto & { return static_cast<const T &>(a).value(); };
+    if (type == "string") return ScriptVal(as((Imf::StringAttribute *)nullptr));
+    if (type == "int" || type == "float" || type == "double" || type == "envmap" || type == "timecode") hint = type;
+    if (type == "int") return ScriptVal(as((Imf::IntAttribute *)nullptr));
+    if (type == "float") return ScriptVal(static_cast<double>(as((Imf::FloatAttribute *)nullptr)));
+    if (type == "double") return ScriptVal(as((Imf::DoubleAttribute *)nullptr));
+    if (type == "envmap") return ScriptVal(static_cast<int>(as((Imf::EnvmapAttribute *)nullptr)));
+    if (type == "timecode") return ScriptVal(TimeCodeText(as((Imf::TimeCodeAttribute *)nullptr)));
+    if (type == "v2i" || type == "v2f" || type == "v2d") {
+        Imath::V2d p = type == "v2i"   ? Imath::V2d(as((Imf::V2iAttribute *)nullptr))
+                       : type == "v2f" ? Imath::V2d(as((Imf::V2fAttribute *)nullptr))
+                                       : as((Imf::V2dAttribute *)nullptr);
+        return Tuple(type.c_str(), {p.x, p.y});
+    }
+    if (type == "v3i" || type == "v3f" || type == "v3d") {
+        Imath::V3d p = type == "v3i"   ? Imath::V3d(as((Imf::V3iAttribute *)nullptr))
+                       : type == "v3f" ? Imath::V3d(as((Imf::V3fAttribute *)nullptr))
+                                       : as((Imf::V3dAttribute *)nullptr);
+        return Tuple(type.c_str(), {p.x, p.y, p.z});
+    }
+    if (type == "box2i") {
+        const Imath::Box2i &b = as((Imf::Box2iAttribute *)nullptr);
+        return Tuple("box2i", {double(b.min.x), double(b.min.y), double(b.max.x), double(b.max.y)});
+    }
+    if (type == "box2f") {
+        const Imath::Box2f &b = as((Imf::Box2fAttribute *)nullptr);
+        return Tuple("box2f", {b.min.x, b.min.y, b.max.x, b.max.y});
+    }
+    if (type == "m33f") return MatrixTuple("m33f", as((Imf::M33fAttribute *)nullptr), 3);
+    if (type == "m33d") return MatrixTuple("m33d", as((Imf::M33dAttribute *)nullptr), 3);
+    if (type == "m44f") return MatrixTuple("m44f", as((Imf::M44fAttribute *)nullptr), 4);
+    if (type == "m44d") return MatrixTuple("m44d", as((Imf::M44dAttribute *)nullptr), 4);
+    if (type == "stringvector") {
+        ScriptVal v = ScriptVal::Table("stringvector");
+        for (const std::string &s : as((Imf::StringVectorAttribute *)nullptr)) v.Append(ScriptVal(s));
+        return v;
+    }
+    if (type == "floatvector") {
+        ScriptVal v = ScriptVal::Table("floatvector");
+        for (float f : as((Imf::FloatVectorAttribute *)nullptr)) v.Append(ScriptVal(static_cast<double>(f)));
+        return v;
+    }
+    if (type == "chromaticities") {
+        const Imf::Chromaticities &c = as((Imf::ChromaticitiesAttribute *)nullptr);
+        return Tuple("chromaticities",
+                     {c.red.x, c.red.y, c.green.x, c.green.y, c.blue.x, c.blue.y, c.white.x, c.white.y});
+    }
+    if (type == "rational") {
+        const Imf::Rational &r = as((Imf::RationalAttribute *)nullptr);
+        return Tuple("rational", {double(r.n), double(r.d)});
+    }
+    if (type == "keycode") {
+        const Imf::KeyCode &k = as((Imf::KeyCodeAttribute *)nullptr);
+        return Tuple("keycode", {double(k.filmMfcCode()), double(k.filmType()), double(k.prefix()), double(k.count()),
+                                 double(k.perfOffset()), double(k.perfsPerFrame()), double(k.perfsPerCount())});
+    }
+    return ScriptVal();
+}
+
 /// Every attribute of a known type, under its Metadata name; the types of
 /// numbers and time codes in Metadata "OpenEXRTypes".
 void ReadAttributes(const Imf::Header &h, ScriptVal &md) {
     ScriptVal types = ScriptVal::Table();
+    std::string hint;
     for (auto it = h.begin(); it != h.end(); ++it) {
-        const Imf::Attribute &a = it.attribute();
-        const std::string type = a.typeName();
+        ScriptVal v = AttributeValue(it.attribute(), hint);
+        if (v.IsNil()) continue;
         const std::string key = MetadataName(it.name());
-        ScriptVal v;
-        std::string hint;
-        auto as = [&a]<class T>(T *) -> const auto & { return static_cast<const T &>(a).value(); };
-        if (type == "string") {
-            v = ScriptVal(as((Imf::StringAttribute *)nullptr));
-        } else if (type == "int") {
-            v = ScriptVal(as((Imf::IntAttribute *)nullptr)), hint = type;
-        } else if (type == "float") {
-            v = ScriptVal(static_cast<double>(as((Imf::FloatAttribute *)nullptr))), hint = type;
-        } else if (type == "double") {
-            v = ScriptVal(as((Imf::DoubleAttribute *)nullptr)), hint = type;
-        } else if (type == "envmap") {
-            v = ScriptVal(static_cast<int>(as((Imf::EnvmapAttribute *)nullptr))), hint = type;
-        } else if (type == "timecode") {
-            v = ScriptVal(TimeCodeText(as((Imf::TimeCodeAttribute *)nullptr))), hint = type;
-        } else if (type == "v2i" || type == "v2f" || type == "v2d") {
-            Imath::V2d p = type == "v2i"   ? Imath::V2d(as((Imf::V2iAttribute *)nullptr))
-                           : type == "v2f" ? Imath::V2d(as((Imf::V2fAttribute *)nullptr))
-                                           : as((Imf::V2dAttribute *)nullptr);
-            v = Tuple(type.c_str(), {p.x, p.y});
-        } else if (type == "v3i" || type == "v3f" || type == "v3d") {
-            Imath::V3d p = type == "v3i"   ? Imath::V3d(as((Imf::V3iAttribute *)nullptr))
-                           : type == "v3f" ? Imath::V3d(as((Imf::V3fAttribute *)nullptr))
-                                           : as((Imf::V3dAttribute *)nullptr);
-            v = Tuple(type.c_str(), {p.x, p.y, p.z});
-        } else if (type == "box2i") {
-            const Imath::Box2i &b = as((Imf::Box2iAttribute *)nullptr);
-            v = Tuple("box2i", {double(b.min.x), double(b.min.y), double(b.max.x), double(b.max.y)});
-        } else if (type == "box2f") {
-            const Imath::Box2f &b = as((Imf::Box2fAttribute *)nullptr);
-            v = Tuple("box2f", {b.min.x, b.min.y, b.max.x, b.max.y});
-        } else if (type == "m33f") {
-            v = MatrixTuple("m33f", as((Imf::M33fAttribute *)nullptr), 3);
-        } else if (type == "m33d") {
-            v = MatrixTuple("m33d", as((Imf::M33dAttribute *)nullptr), 3);
-        } else if (type == "m44f") {
-            v = MatrixTuple("m44f", as((Imf::M44fAttribute *)nullptr), 4);
-        } else if (type == "m44d") {
-            v = MatrixTuple("m44d", as((Imf::M44dAttribute *)nullptr), 4);
-        } else if (type == "stringvector") {
-            v = ScriptVal::Table("stringvector");
-            for (const std::string &s : as((Imf::StringVectorAttribute *)nullptr)) v.Append(ScriptVal(s));
-        } else if (type == "floatvector") {
-            v = ScriptVal::Table("floatvector");
-            for (float f : as((Imf::FloatVectorAttribute *)nullptr)) v.Append(ScriptVal(static_cast<double>(f)));
-        } else if (type == "chromaticities") {
-            const Imf::Chromaticities &c = as((Imf::ChromaticitiesAttribute *)nullptr);
-            v = Tuple("chromaticities",
-                      {c.red.x, c.red.y, c.green.x, c.green.y, c.blue.x, c.blue.y, c.white.x, c.white.y});
-        } else if (type == "rational") {
-            const Imf::Rational &r = as((Imf::RationalAttribute *)nullptr);
-            v = Tuple("rational", {double(r.n), double(r.d)});
-        } else if (type == "keycode") {
-            const Imf::KeyCode &k = as((Imf::KeyCodeAttribute *)nullptr);
-            v = Tuple("keycode", {double(k.filmMfcCode()), double(k.filmType()), double(k.prefix()), double(k.count()),
-                                  double(k.perfOffset()), double(k.perfsPerFrame()), double(k.perfsPerCount())});
-        } else {
-            continue; // channel lists, previews, opaque data: nothing a script can use
-        }
         md.Set(key, v);
         if (!hint.empty()) types.Set(key, ScriptVal(hint));
     }
@@ -443,6 +466,103 @@ void WriteAttributes(const ScriptVal &md, Imf::Header &h) {
     }
 }
 
+// ---- descriptions ----
+
+const char *CompressionWord(Imf::Compression c) {
+    static const char *const words[] = {"none", "rle", "zips", "zip", "piz", "pxr24", "b44", "b44a", "dwaa", "dwab"};
+    return c >= 0 && c < static_cast<int>(std::size(words)) ? words[c] : "unknown";
+}
+
+const char *PixelTypeWord(Imf::PixelType t) { return t == Imf::HALF ? "half" : t == Imf::FLOAT ? "float" : "uint32"; }
+
+const char *LineOrderWord(Imf::LineOrder o) {
+    return o == Imf::INCREASING_Y ? "increasing y" : o == Imf::DECREASING_Y ? "decreasing y" : "random y";
+}
+
+/// A file box as the file holds it: { min.x, min.y, max.x, max.y }, y down, max inclusive.
+ScriptVal FileBox(const Imath::Box2i &b) {
+    ScriptVal t = ScriptVal::Table();
+    for (int v : {b.min.x, b.min.y, b.max.x, b.max.y}) t.Append(v);
+    return t;
+}
+
+ScriptVal Tiles(const Imf::TileDescription &t) {
+    static const char *const levels[] = {"one level", "mipmap", "ripmap"};
+    ScriptVal v = ScriptVal::Table();
+    v.Set("xSize", static_cast<double>(t.xSize));
+    v.Set("ySize", static_cast<double>(t.ySize));
+    v.Set("levelMode", t.mode >= 0 && t.mode < 3 ? levels[t.mode] : "unknown");
+    v.Set("roundingMode", t.roundingMode == Imf::ROUND_UP ? "up" : "down");
+    return v;
+}
+
+/// An attribute's value for a description: AttributeValue's, words and
+/// tables for the structural types, the size of data with no script form.
+ScriptVal DescribedValue(const Imf::Attribute &a) {
+    const std::string type = a.typeName();
+    auto as = [&a]<class T>(T *) -> const auto & { return static_cast<const T &>(a).value(); };
+    if (type == "compression") return ScriptVal(CompressionWord(as((Imf::CompressionAttribute *)nullptr)));
+    if (type == "lineOrder") return ScriptVal(LineOrderWord(as((Imf::LineOrderAttribute *)nullptr)));
+    if (type == "tiledesc") return Tiles(as((Imf::TileDescriptionAttribute *)nullptr));
+    if (type == "chlist") {
+        ScriptVal names = ScriptVal::Table();
+        for (auto c = as((Imf::ChannelListAttribute *)nullptr).begin();
+             c != as((Imf::ChannelListAttribute *)nullptr).end(); ++c)
+            names.Append(ScriptVal(c.name()));
+        return names;
+    }
+    if (type == "preview") {
+        const Imf::PreviewImage &p = as((Imf::PreviewImageAttribute *)nullptr);
+        ScriptVal v = ScriptVal::Table();
+        v.Set("width", static_cast<double>(p.width()));
+        v.Set("height", static_cast<double>(p.height()));
+        return v;
+    }
+    std::string hint;
+    ScriptVal v = AttributeValue(a, hint);
+    if (v.IsNil())
+        if (const auto *opaque = dynamic_cast<const Imf::OpaqueAttribute *>(&a)) {
+            v = ScriptVal::Table();
+            v.Set("bytes", static_cast<double>(opaque->dataSize()));
+        }
+    return v;
+}
+
+/// One part of a file: its identity, windows, storage, channels and every attribute.
+ScriptVal DescribePart(const Imf::Header &h, int index) {
+    ScriptVal p = ScriptVal::Table();
+    p.Set("index", index);
+    p.Set("name", h.hasName() ? h.name() : std::string());
+    p.Set("view", h.hasView() ? h.view() : std::string());
+    p.Set("type", h.hasType() ? h.type() : h.hasTileDescription() ? Imf::TILEDIMAGE : Imf::SCANLINEIMAGE);
+    p.Set("dataWindow", FileBox(h.dataWindow()));
+    p.Set("displayWindow", FileBox(h.displayWindow()));
+    p.Set("compression", CompressionWord(h.compression()));
+    p.Set("lineOrder", LineOrderWord(h.lineOrder()));
+    if (h.hasTileDescription()) p.Set("tiles", Tiles(h.tileDescription()));
+    ScriptVal channels = ScriptVal::Table();
+    for (auto c = h.channels().begin(); c != h.channels().end(); ++c) {
+        ScriptVal e = ScriptVal::Table();
+        e.Set("name", c.name());
+        e.Set("type", PixelTypeWord(c.channel().type));
+        e.Set("xSampling", c.channel().xSampling);
+        e.Set("ySampling", c.channel().ySampling);
+        e.Set("pLinear", c.channel().pLinear);
+        channels.Append(e);
+    }
+    p.Set("channels", channels);
+    ScriptVal attributes = ScriptVal::Table();
+    for (auto it = h.begin(); it != h.end(); ++it) {
+        ScriptVal e = ScriptVal::Table();
+        e.Set("name", it.name());
+        e.Set("type", it.attribute().typeName());
+        e.Set("value", DescribedValue(it.attribute()));
+        attributes.Append(e);
+    }
+    p.Set("attributes", attributes);
+    return p;
+}
+
 // ---- display conversion ----
 
 double Knee(double x, double f) { return f > 0.0 ? std::log1p(x * f) / f : x; }
@@ -479,7 +599,8 @@ struct OpenEXRFormat::Writer {
     std::unique_ptr<FileOStream> stream;
     std::unique_ptr<Imf::OutputFile> file;
     std::vector<Channel> channels;
-    ImgRectI window; ///< image coordinates of the file's data window
+    Imf::PixelType colour = Imf::HALF; ///< the type of every colour channel
+    ImgRectI window;                   ///< image coordinates of the file's data window
     bool empty = false;
     int band = 64;
 };
@@ -525,13 +646,20 @@ void OpenEXRFormat::AddLoadInputs(Operator *tool) {
     AddOptionCheckbox(tool, "Load All Layers", "LoadLayers", 0.0);
     // The lists hold what the last header read offers; the value is the
     // entry's name, so a choice outlives a list made for another file.
-    std::vector<std::string> partNames, channels;
+    std::vector<std::string> partNames, channels, layers;
+    auto addOnce = [](std::vector<std::string> &list, const std::string &e) {
+        if (std::find(list.begin(), list.end(), e) == list.end()) list.push_back(e);
+    };
     for (size_t p = 0; p < parts_.size(); ++p) {
         partNames.push_back(ef::PartID(parts_[p], p));
-        for (const std::string &c : parts_[p].channels)
-            if (std::find(channels.begin(), channels.end(), c) == channels.end()) channels.push_back(c);
+        for (const std::string &c : parts_[p].channels) {
+            addOnce(channels, c);
+            if (const size_t dot = c.rfind('.'); dot != std::string::npos && dot > 0) addOnce(layers, c.substr(0, dot));
+        }
     }
     tool->AddInputTagList("Part", "Part", ef::Chooser(partNames));
+    tool->AddInputTagList("View", "View", ef::Chooser(views_));
+    tool->AddInputTagList("Layer", "Layer", ef::Chooser(layers));
     ef::AddHeading(tool, "ChannelsHeading");
     for (int s = 0; s < SlotCount; ++s)
         tool->AddInputTagList(SlotLabel(s), (std::string("Channel") + SlotID(s)).c_str(), ef::Chooser(channels));
@@ -545,6 +673,8 @@ void OpenEXRFormat::SetupLoad(Operator *tool, Request *req) {
     kneeHigh_ = OptionValue(tool, req, "KneeHigh", 5.0);
     loadLayers_ = OptionValue(tool, req, "LoadLayers", 0.0) > 0.5;
     partChoice_ = ef::InputChoice(tool, req, "Part");
+    viewChoice_ = ef::InputChoice(tool, req, "View");
+    layerChoice_ = ef::InputChoice(tool, req, "Layer");
     for (int s = 0; s < SlotCount; ++s)
         channelChoice_[s] = ef::InputChoice(tool, req, std::string("Channel") + SlotID(s));
 }
@@ -650,7 +780,11 @@ bool OpenEXRFormat::LoadHeader(IOClass *stream) {
             return std::string();
         };
         const bool right = GetAttrL(FormatStereoEye, 0) == 1;
-        if (!views_.empty()) {
+        if (!viewChoice_.empty()) {
+            if (std::find(views_.begin(), views_.end(), viewChoice_) == views_.end())
+                return Fail("OpenEXR: the file has no view " + viewChoice_);
+            view_ = viewChoice_;
+        } else if (!views_.empty()) {
             view_ = right ? named("right", "Right") : named("left", "Left");
             if (view_.empty()) view_ = right && views_.size() > 1 ? views_[1] : views_[0];
         }
@@ -693,7 +827,13 @@ bool OpenEXRFormat::LoadHeader(IOClass *stream) {
             return found;
         };
         std::string layer;
-        for (int s = 0; s < 4; ++s) {
+        if (!layerChoice_.empty()) {
+            Imf::ChannelList::ConstIterator b, e;
+            cl.channelsInLayer(layerChoice_, b, e);
+            if (b == e) return Fail("OpenEXR: part " + std::to_string(part_) + " has no layer " + layerChoice_);
+            layer = layerChoice_ + ".";
+        }
+        for (int s = 0; s < 4 && layer.empty(); ++s) {
             const size_t dot = channelChoice_[s].rfind('.');
             if (dot != std::string::npos && layer.empty()) layer = channelChoice_[s].substr(0, dot + 1);
         }
@@ -976,9 +1116,9 @@ bool OpenEXRFormat::SaveHeader(IOClass *stream, Image *image) {
     W->empty = W->window.IsNull();
     if (W->empty) W->window = ImgRectI(0, h - 1, 1, h); // one zero pixel at the file's origin
     const ImgRectI &win = W->window;
-    const bool floatImage = image->Depth() == DepthRGBAFlt32 || image->Depth() == DepthAFlt32;
-    const Imf::PixelType colour = depthMode_ == 2 || (depthMode_ == 0 && floatImage) ? Imf::FLOAT : Imf::HALF;
+    const Imf::PixelType colour = ef::HalfColour(depthMode_, image->Depth()) ? Imf::HALF : Imf::FLOAT;
     const Imf::PixelType aux = depthMode_ == 1 ? Imf::HALF : Imf::FLOAT;
+    W->colour = colour;
     for (int s = 0; s < SlotCount; ++s) {
         if (!saveSlot_[s] || (s >= FirstAuxSlot && !image->HasAuxChannel(ef::KindOfSlot(s)))) continue;
         for (const Writer::Channel &c : W->channels)
@@ -1015,12 +1155,21 @@ bool OpenEXRFormat::SaveFrame(unsigned, Image *image) {
     const int h = image->Height(), cols = win.Width();
     const int first = h - win.y1, last = h - 1 - win.y0; // file lines
     const bool hasRows = image->HasScanLineData() && !W.empty;
-    const int d = image->Depth();
-    const bool direct = hasRows && (d == DepthRGBAFlt16 || d == DepthRGBAFlt32);
-    const int comp = d == DepthRGBAFlt16 ? 2 : 4;
-    std::vector<FltPixel> band;
-    if (hasRows && !direct) band.resize(size_t(cols) * W.band);
+    // Colour rows whose stored type is the file's go to the library as they
+    // are; others are converted into `band`, a band of lines of the file's type.
+    const int fileDepth = W.colour == Imf::HALF ? DepthRGBAFlt16 : DepthRGBAFlt32;
+    const int comp = W.colour == Imf::HALF ? 2 : 4, pixelBytes = 4 * comp;
+    const bool direct = hasRows && image->Depth() == fileDepth;
+    std::vector<uint8_t> band;
+    std::vector<FltPixel> row;
+    if (hasRows && !direct) band.resize(size_t(cols) * W.band * pixelBytes), row.resize(size_t(cols));
+    // Auxiliary planes are float; HALF channels take them through bands of halves.
+    std::vector<std::vector<uint16_t>> halfAux(W.channels.size());
     const std::vector<float> zeros(size_t(cols) * 4, 0.f); // read again for every line (y stride 0)
+    auto zeroSlice = [&](Imf::PixelType type) {
+        const int bytes = type == Imf::HALF ? 2 : 4;
+        return Imf::Slice(type, ef::Address(zeros.data(), -int64_t(win.x0) * bytes), bytes, 0);
+    };
     try {
         for (int a = first; a <= last;) {
             if (Aborted()) {
@@ -1029,37 +1178,53 @@ bool OpenEXRFormat::SaveFrame(unsigned, Image *image) {
             }
             const int b = std::min(last, a + W.band - 1);
             Imf::FrameBuffer fb;
-            for (const Writer::Channel &c : W.channels) {
+            for (size_t i = 0; i < W.channels.size(); ++i) {
+                const Writer::Channel &c = W.channels[i];
                 if (c.slot < FirstAuxSlot) {
-                    if (direct) {
-                        const int64_t stride = -int64_t(cols) * image->BytesPerPixel();
-                        char *base = ef::Address(image->ScanLine(win.y0), -int64_t(h - 1 - win.y0) * stride -
-                                                                              int64_t(win.x0) * image->BytesPerPixel());
-                        fb.insert(c.name, Imf::Slice(comp == 2 ? Imf::HALF : Imf::FLOAT, base + c.slot * comp,
-                                                     image->BytesPerPixel(), static_cast<size_t>(stride)));
-                    } else if (hasRows) {
-                        const int64_t stride = int64_t(cols) * sizeof(FltPixel);
-                        char *base =
-                            ef::Address(band.data(), -int64_t(a) * stride - int64_t(win.x0) * sizeof(FltPixel));
-                        fb.insert(c.name, Imf::Slice(Imf::FLOAT, base + c.slot * 4, sizeof(FltPixel), stride));
-                    } else {
-                        char *base = ef::Address(zeros.data(), -int64_t(win.x0) * 4);
-                        fb.insert(c.name, Imf::Slice(Imf::FLOAT, base, 4, 0));
+                    if (!hasRows) {
+                        fb.insert(c.name, zeroSlice(c.type));
+                        continue;
                     }
+                    char *base;
+                    int64_t stride;
+                    if (direct) {
+                        stride = -int64_t(cols) * pixelBytes;
+                        base = ef::Address(image->ScanLine(win.y0),
+                                           -int64_t(h - 1 - win.y0) * stride - int64_t(win.x0) * pixelBytes);
+                    } else {
+                        stride = int64_t(cols) * pixelBytes;
+                        base = ef::Address(band.data(), -int64_t(a) * stride - int64_t(win.x0) * pixelBytes);
+                    }
+                    fb.insert(c.name,
+                              Imf::Slice(c.type, base + c.slot * comp, pixelBytes, static_cast<size_t>(stride)));
                     continue;
                 }
-                const float *plane = hasRows ? image->AuxRow(ef::KindOfSlot(c.slot), win.y0) : nullptr;
-                if (plane) {
+                const AuxChannelKind kind = ef::KindOfSlot(c.slot);
+                const float *plane = hasRows ? image->AuxRow(kind, win.y0) : nullptr;
+                if (!plane) {
+                    fb.insert(c.name, zeroSlice(c.type));
+                } else if (c.type == Imf::FLOAT) {
                     const int64_t stride = -int64_t(cols) * 4;
                     char *base = ef::Address(plane, -int64_t(h - 1 - win.y0) * stride - int64_t(win.x0) * 4);
                     fb.insert(c.name, Imf::Slice(Imf::FLOAT, base, 4, static_cast<size_t>(stride)));
                 } else {
-                    fb.insert(c.name, Imf::Slice(Imf::FLOAT, ef::Address(zeros.data(), -int64_t(win.x0) * 4), 4, 0));
+                    std::vector<uint16_t> &halves = halfAux[i];
+                    halves.resize(size_t(cols) * W.band);
+                    for (int fy = a; fy <= b; ++fy) {
+                        const float *src = image->AuxRow(kind, h - 1 - fy);
+                        uint16_t *dst = halves.data() + size_t(fy - a) * cols;
+                        for (int x = 0; x < cols; ++x) dst[x] = FloatToHalf(src[x]);
+                    }
+                    const int64_t stride = int64_t(cols) * 2;
+                    char *base = ef::Address(halves.data(), -int64_t(a) * stride - int64_t(win.x0) * 2);
+                    fb.insert(c.name, Imf::Slice(Imf::HALF, base, 2, static_cast<size_t>(stride)));
                 }
             }
             if (hasRows && !direct)
-                for (int fy = a; fy <= b; ++fy)
-                    LoadFlt(d, image->ScanLine(h - 1 - fy), cols, band.data() + size_t(fy - a) * cols);
+                for (int fy = a; fy <= b; ++fy) {
+                    LoadFlt(image->Depth(), image->ScanLine(h - 1 - fy), cols, row.data());
+                    StoreFlt(fileDepth, row.data(), cols, band.data() + size_t(fy - a) * cols * pixelBytes);
+                }
             W.file->setFrameBuffer(fb);
             W.file->writePixels(b - a + 1);
             a = b + 1;
@@ -1078,8 +1243,7 @@ int64_t OpenEXRFormat::PredictFileSize(Image *image) {
     if (!image) return 0;
     const ImgRectI &w = image->DataWindow();
     const int64_t rows = w.IsNull() ? 1 : w.Height(), cols = w.IsNull() ? 1 : w.Width();
-    const bool floatImage = image->Depth() == DepthRGBAFlt32 || image->Depth() == DepthAFlt32;
-    const int64_t colour = depthMode_ == 2 || (depthMode_ == 0 && floatImage) ? 4 : 2;
+    const int64_t colour = ef::HalfColour(depthMode_, image->Depth()) ? 2 : 4;
     const int64_t aux = depthMode_ == 1 ? 2 : 4;
     int64_t pixel = 0;
     for (int s = 0; s < SlotCount; ++s)
@@ -1092,6 +1256,52 @@ int64_t OpenEXRFormat::PredictFileSize(Image *image) {
     if (image->Metadata().IsTable() && image->Metadata().Size())
         text = static_cast<int64_t>(image->Metadata().ToText().size());
     return rows * cols * pixel + blocks * 16 + 4096 + text;
+}
+
+bool OpenEXRFormat::DescribeFile(IOClass *stream, ScriptVal &d) {
+    if (!stream) return Fail("no stream");
+    const int64_t start = stream->Tell();
+    // What reading makes, when the reader takes the file; then every header.
+    const bool readable = ImageFormat::DescribeFile(stream, d);
+    const std::string readError = readable ? std::string() : Error();
+    if (!readable) d = ScriptVal::Table();
+    ScriptVal exr = ScriptVal::Table();
+    try {
+        std::unique_ptr<FileIStream> ownStream;
+        std::unique_ptr<Imf::MultiPartInputFile> ownFile;
+        const Imf::MultiPartInputFile *file = reader_ ? reader_->file.get() : nullptr;
+        if (!file) {
+            if (!stream->Seek(start, IOClass::SeekAbsolute)) return Fail(readError);
+            ownStream = std::make_unique<FileIStream>(stream);
+            ownFile = std::make_unique<Imf::MultiPartInputFile>(*ownStream, Imf::globalThreadCount());
+            file = ownFile.get();
+        }
+        exr.Set("version", Imf::getVersion(file->version()));
+        exr.Set("multiPart", Imf::isMultiPart(file->version()));
+        ScriptVal parts = ScriptVal::Table();
+        for (int p = 0; p < file->parts(); ++p) parts.Append(ef::DescribePart(file->header(p), p));
+        if (readable) {
+            ScriptVal views = ScriptVal::Table(), slots = ScriptVal::Table();
+            for (const std::string &v : views_) views.Append(ScriptVal(v));
+            exr.Set("views", views);
+            exr.Set("partRead", part_);
+            exr.Set("viewRead", view_);
+            for (int s = 0; s < SlotCount; ++s)
+                if (!slotChannel_[s].empty()) slots.Set(SlotID(s), ScriptVal(slotChannel_[s]));
+            if (lumaChroma_) slots.Set("RGB", ScriptVal("Y, RY, BY"));
+            exr.Set("slots", slots);
+        } else {
+            d.Set("readError", readError);
+        }
+        // The file's own channels: the part read's, or the first part's.
+        const ScriptVal *shown = parts.At(readable ? static_cast<size_t>(part_) + 1 : 1);
+        if (shown) d.Set("channels", *shown->Find("channels"));
+        exr.Set("parts", parts);
+    } catch (const std::exception &e) {
+        return Fail(readError.empty() ? std::string("OpenEXR: ") + e.what() : readError);
+    }
+    d.Set("openexr", exr);
+    return true;
 }
 
 } // namespace Orvane

@@ -14,20 +14,22 @@
 // Parts and views. LoadHeader reads every part's header (Parts()). The part
 // read is the one the Part option names; by default the first flat part of
 // the chosen view that holds colour channels. A multi-view file (a
-// "multiView" attribute, or parts with a "view" attribute) has its left eye in
-// the view named "left" (else the file's default view) and its right eye in
-// the view named "right" (else the second view). The format attribute
-// FormatStereoEye (0 left, 1 right; SetAttrsTagList before LoadHeader) picks
-// the eye, the left one by default. In a single-part multi-view file the
-// default view's channels have bare names, the others carry the view's name.
-// Auxiliary channels are read from the chosen part only.
+// "multiView" attribute, or parts with a "view" attribute) is read in the view
+// the View option names; by default in its left eye: the view named "left"
+// (else the file's default view), or its right eye, the view named "right"
+// (else the second view), when the format attribute FormatStereoEye is 1
+// (SetAttrsTagList before LoadHeader). A Part or View the file lacks fails.
+// In a single-part multi-view file the default view's channels have bare
+// names, the others carry the view's name. Auxiliary channels are read from
+// the chosen part only.
 //
 // Channels. 22 slots (Slot): R, G, B, A and the 18 auxiliary channels, in
 // the order of AuxChannelKind. Each slot reads the channel its chooser names,
 // or by default the channel of its default name (DefaultChannelName; for the
-// colour slots lower-case r, g, b, a too), in the view's prefix and, when the
-// part has no bare colour channels, in the first layer that has them (or the
-// layer of a channel the user chose for R, G, B or A). A file with Y but no
+// colour slots lower-case r, g, b, a too), in the view's prefix and in the
+// layer the Layer option names; without one, when the part has no bare
+// colour channels, in the first layer that has them (or the layer of a
+// channel the user chose for R, G, B or A). A file with Y but no
 // R, G, B loads as grey; one with RY / BY chroma too is converted to RGB by
 // the library's luminance / chroma reader (first part only). Missing colour
 // channels read as 0, a missing A as 1. Images are premultiplied, as EXR
@@ -67,9 +69,22 @@
 // window from the image's (flipped; an empty one is written as one zero
 // pixel at 0,0), the chosen compression and levels, the slots whose boxes are
 // ticked under their file names (auxiliary slots only where the image has the
-// plane). Depth Auto writes HALF colour for all but float32 images, and
-// FLOAT auxiliary channels; float16 / float32 force every channel. Integer
-// and mask images are converted (0..max to 0..1) a band of rows at a time.
+// plane). Depth Auto writes HALF colour for float16 and 8-bit images (half
+// keeps every 8-bit level) and FLOAT for float32 and 16-bit ones, with FLOAT
+// auxiliary channels; float16 / float32 force every channel. Pixels whose
+// stored type is the channel's go to the library as they are; the others
+// (integer and mask images, 0..max to 0..1; floats of the other width) are
+// converted a band of rows at a time. A single-channel image writes its
+// value in every colour slot.
+//
+// Describing (DescribeFile) adds, under "openexr": version, multiPart,
+// views, partRead, viewRead, slots (slot ID = file channel read) and parts,
+// each with index, name, view, type, dataWindow and displayWindow (as the
+// file holds them: y down, max inclusive), compression, lineOrder, tiles,
+// channels (name, type half / float / uint32, xSampling, ySampling, pLinear) and every
+// header attribute (name, type, value). "channels" is the part read's list.
+// A file the reader refuses (deep data only, say) is still described, with
+// "readError" in place of the image keys.
 //
 // Options: see AddLoadInputs / AddSaveInputs. An older input ID for the zip
 // level is not accepted: inputs here have one ID each.
@@ -143,6 +158,7 @@ public:
     bool SaveHeader(IOClass *io, Image *image) override;
     bool SaveFrame(unsigned frame, Image *image) override;
     int64_t PredictFileSize(Image *image) override;
+    bool DescribeFile(IOClass *io, ScriptVal &description) override;
 
     // What the last LoadHeader found.
     const std::vector<OpenEXRPart> &Parts() const { return parts_; }
@@ -172,7 +188,7 @@ private:
     // Load options.
     bool bypass_ = false, loadLayers_ = false;
     double defog_ = 0.0, exposure_ = 0.0, kneeLow_ = 0.0, kneeHigh_ = 5.0;
-    std::string partChoice_;
+    std::string partChoice_, viewChoice_, layerChoice_;
     std::string channelChoice_[SlotCount];
 
     // Save options.

@@ -359,6 +359,10 @@ bool PNGFormat::LoadHeader(IOClass *stream) {
     aspectX = hd.aspectX;
     aspectY = hd.aspectY;
     depth = hd.bitDepth == 16 ? DepthRGBAInt16 : DepthRGBAInt8;
+    const bool palette = hd.colorType == PNG_COLOR_TYPE_PALETTE, colour = hd.colorType & PNG_COLOR_MASK_COLOR;
+    fileChannels = std::string(colour ? "R G B" : "Y") +
+                   ((hd.colorType & PNG_COLOR_MASK_ALPHA) || (palette && hd.alpha) ? " A" : "");
+    fileSampleType = "uint" + std::to_string(palette ? 8 : hd.bitDepth); // a palette holds 8-bit colours
     metadata = ScriptVal::Table();
     pd::ColourMetadata(*h, metadata);
     return true;

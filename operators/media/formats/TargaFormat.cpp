@@ -169,6 +169,9 @@ bool TargaFormat::LoadHeader(IOClass *stream) {
     }
     width = std::max(1, w / scale_), height = std::max(1, hh / scale_);
     depth = DepthRGBAInt8;
+    const bool grey = type == 3 || type == 11, alphaBits = (h[17] & 15) != 0;
+    fileChannels = std::string(grey ? "Y" : "R G B") + (alphaBits || (grey && bits == 16) ? " A" : "");
+    fileSampleType = !mapped && (bits == 15 || (bits == 16 && !grey)) ? "uint5" : "uint8";
     aspectX = aspectY = 1.0;
     return true;
 }

@@ -13,6 +13,7 @@
 #include <map>
 #include <regex>
 #include <string>
+#include <tuple>
 #include <vector>
 
 #include "host/image/Half.h"
@@ -52,15 +53,20 @@ void ExpectSame(const Image &want, const Image &got, float tolerance = 0.f) {
         }
 }
 
-/// Loads through a reading tool whose inputs hold `options`.
-Ref<Image> LoadWith(const Bytes &data, const Options &options, std::string *error = nullptr) {
+using Choices = std::vector<std::pair<const char *, const char *>>;
+
+/// Loads through a reading tool whose inputs hold `options` and the choices (Part, View, Layer, Channel...).
+Ref<Image> LoadWith(const Bytes &data, const Options &options, const Choices &choices = {}, int eye = 0,
+                    std::string *error = nullptr) {
     OrvaneDoc doc;
     Operator *tool = Orvane::Test::AddImageSource(doc, "Loader", nullptr);
     Ref<ImageFormat> f = MakeFormat(kId);
     f->AddLoadInputs(tool);
     Request req(tool, nullptr, 0.0, 0, nullptr);
     for (const auto &[name, value] : options) req.SetInputData(tool->FindInput(name), MakeRef<Number>(value).Get());
+    for (const auto &[name, id] : choices) req.SetInputData(tool->FindInput(name), MakeRef<IDValue>(OvID(id)).Get());
     f->SetupLoad(tool, &req);
+    f->SetAttrsTagList({{FormatStereoEye, eye}});
     MemoryIO io(data);
     Ref<Image> img;
     if (!f->LoadHeader(&io) || !f->LoadFrameTagList(0, img, {})) {
@@ -74,7 +80,7 @@ Ref<Image> LoadWith(const Bytes &data, const Options &options, std::string *erro
 
 struct Channel {
     std::string name;
-    int type; // 1 HALF, 2 FLOAT
+    int type; // 0 UINT, 1 HALF, 2 FLOAT
 };
 
 void Put32(Bytes &b, uint32_t v) {
@@ -93,10 +99,12 @@ void Attr(Bytes &b, const std::string &name, const std::string &type, const Byte
 }
 
 /// An uncompressed scan-line file; channel c of file pixel (x, y) is value(x, y, c).
+/// A deep one holds one sample a pixel.
 Bytes HandMade(const ImgRectI &display, const ImgRectI &data, std::vector<Channel> channels,
-               const std::function<float(int, int, const std::string &)> &value) {
+               const std::function<float(int, int, const std::string &)> &value, bool deep = false) {
     std::sort(channels.begin(), channels.end(), [](auto &a, auto &b) { return a.name < b.name; });
-    Bytes b = {0x76, 0x2f, 0x31, 0x01, 2, 0, 0, 0}, v;
+    const int lines = data.y1 - data.y0 + 1, width = data.x1 - data.x0 + 1;
+    Bytes b = {0x76, 0x2f, 0x31, 0x01, 2, uint8_t(deep ? 8 : 0), 0, 0}, v; // 8: not an image of flat pixels
     for (const Channel &c : channels) {
         v.insert(v.end(), c.name.begin(), c.name.end());
         v.push_back(0);
@@ -113,8 +121,13 @@ Bytes HandMade(const ImgRectI &display, const ImgRectI &data, std::vector<Channe
     v.clear(), Put32(v, 0x3f800000u), Attr(b, "pixelAspectRatio", "float", v);
     v.clear(), Put32(v, 0), Put32(v, 0), Attr(b, "screenWindowCenter", "v2f", v);
     v.clear(), Put32(v, 0x3f800000u), Attr(b, "screenWindowWidth", "float", v);
+    if (deep) {
+        const std::string type = "deepscanline";
+        Attr(b, "type", "string", Bytes(type.begin(), type.end()));
+        v.clear(), Put32(v, 1), Attr(b, "version", "int", v);
+        v.clear(), Put32(v, static_cast<uint32_t>(lines)), Attr(b, "chunkCount", "int", v);
+    }
     b.push_back(0);
-    const int lines = data.y1 - data.y0 + 1, width = data.x1 - data.x0 + 1;
     size_t bytesPerLine = 0;
     for (const Channel &c : channels) bytesPerLine += size_t(width) * (c.type == 1 ? 2 : 4);
     const size_t table = b.size();
@@ -123,13 +136,21 @@ Bytes HandMade(const ImgRectI &display, const ImgRectI &data, std::vector<Channe
         const uint64_t at = b.size();
         for (int k = 0; k < 8; ++k) b[table + 8 * i + k] = static_cast<uint8_t>(at >> (8 * k));
         Put32(b, static_cast<uint32_t>(data.y0 + i));
-        Put32(b, static_cast<uint32_t>(bytesPerLine));
+        if (deep) { // the sample counts' table, its size and the samples' size twice (64 bits each)
+            for (uint32_t n : {uint32_t(width) * 4, 0u, uint32_t(bytesPerLine), 0u, uint32_t(bytesPerLine), 0u})
+                Put32(b, n);
+            for (int x = 1; x <= width; ++x) Put32(b, static_cast<uint32_t>(x));
+        } else {
+            Put32(b, static_cast<uint32_t>(bytesPerLine));
+        }
         for (const Channel &c : channels)
             for (int x = data.x0; x <= data.x1; ++x) {
                 const float f = value(x, data.y0 + i, c.name);
                 if (c.type == 1) {
                     const uint16_t h = FloatToHalf(f);
                     b.push_back(static_cast<uint8_t>(h)), b.push_back(static_cast<uint8_t>(h >> 8));
+                } else if (c.type == 0) {
+                    Put32(b, static_cast<uint32_t>(f));
                 } else {
                     uint32_t u;
                     std::memcpy(&u, &f, 4);
@@ -217,30 +238,59 @@ TEST_F(OpenEXRFormatTest, RoundTripsEveryCompressionAndWindow) {
             }
 }
 
-TEST_F(OpenEXRFormatTest, FileWindowsAndDepthOptionAgreeWithExrheader) {
+TEST_F(OpenEXRFormatTest, SavesFromEveryDepthWithEveryDepthChoice) {
     if (!HaveProgram("exrheader")) GTEST_SKIP() << "exrheader is not installed";
+    // Image depth by Depth choice (Auto, float16, float32): the file's colour
+    // type (auxiliary channels are float but for float16), as exrheader reads it.
+    struct Row {
+        int depth;
+        const char *colour[3];
+    };
+    const Row rows[] = {
+        {DepthAInt8, {"16-bit", "16-bit", "32-bit"}},     {DepthAInt16, {"32-bit", "16-bit", "32-bit"}},
+        {DepthAFlt16, {"16-bit", "16-bit", "32-bit"}},    {DepthAFlt32, {"32-bit", "16-bit", "32-bit"}},
+        {DepthRGBAInt8, {"16-bit", "16-bit", "32-bit"}},  {DepthRGBAInt16, {"32-bit", "16-bit", "32-bit"}},
+        {DepthRGBAFlt16, {"16-bit", "16-bit", "32-bit"}}, {DepthRGBAFlt32, {"32-bit", "16-bit", "32-bit"}}};
     TempDir dir;
-    Ref<Image> src = Pattern(37, 23, DepthRGBAInt16, ImgRectI(4, 6, 20, 17));
-    src->SetScale(2.0, 1.0);
-    WriteFile(dir / "a.exr", SaveWith(kId, src.Get(), {{"Depth", 2}, {"Compression", 4}}));
-    const Windows w = Exrheader(dir / "a.exr");
-    ASSERT_EQ(w.data.size(), 1u);
-    // Image rows 6..16 (bottom up) of 23 are file lines 6..16 counted from the top.
-    EXPECT_EQ(w.data[0], ImgRectI(4, 23 - 17, 19, 23 - 1 - 6));
-    EXPECT_EQ(w.display[0], ImgRectI(0, 0, 36, 22));
-    const std::string header = [&] {
-        const Bytes out = Capture("exrheader '" + dir / "a.exr" + "'");
-        return std::string(out.begin(), out.end());
-    }();
-    EXPECT_NE(header.find("R, 32-bit floating-point"), std::string::npos);
-    EXPECT_NE(header.find("piz"), std::string::npos);
-    EXPECT_NE(header.find("pixelAspectRatio (type float): 2"), std::string::npos);
-    // Integer pixels come back as 0..1 floats; the aspect as written.
-    const LoadResult r = Load(kId, ReadFile(dir / "a.exr"));
-    ASSERT_TRUE(r.image) << r.error;
-    EXPECT_EQ(r.image->Depth(), DepthRGBAFlt32);
-    EXPECT_DOUBLE_EQ(r.image->XScale() / r.image->YScale(), 2.0);
-    ExpectSame(*src, *r.image, 1e-6f);
+    const ImgRectI window(2, 1, 9, 5); // 11 x 6 frame: file lines 1..4, columns 2..8
+    for (const Row &row : rows)
+        for (int mode = 0; mode < 3; ++mode) {
+            SCOPED_TRACE(testing::Message() << "depth " << row.depth << " mode " << mode);
+            Ref<Image> src =
+                NewImageTagList({{ImgWidth, 11}, {ImgHeight, 6}, {ImgDepth, row.depth}, {ImgDataWindow, &window}});
+            ASSERT_TRUE(src && src->AllocScanLineData() && src->AddAuxChannel(AuxChannelKind::Z));
+            src->SetScale(2.0, 1.0);
+            for (int y = window.y0; y < window.y1; ++y)
+                for (int x = window.x0; x < window.x1; ++x) {
+                    const float v = 0.013f * (x + 11 * y) + 0.001f;
+                    src->PutFlt(x, y, {v, v / 2, 1 - v, 0.75f});
+                    src->AuxRow(AuxChannelKind::Z, y)[x - window.x0] = 100.f + v;
+                }
+            const Bytes b = SaveWith(kId, src.Get(), {{"Depth", mode}});
+            ASSERT_FALSE(b.empty());
+            WriteFile(dir / "d.exr", b);
+            const std::string header = CaptureText("exrheader '" + dir / "d.exr" + "'");
+            const bool half = std::string(row.colour[mode]) == "16-bit";
+            EXPECT_NE(header.find(std::string("R, ") + row.colour[mode] + " floating-point"), std::string::npos)
+                << header;
+            EXPECT_NE(header.find(std::string("Z, ") + (mode == 1 ? "16-bit" : "32-bit")), std::string::npos) << header;
+            EXPECT_NE(header.find("dataWindow (type box2i): (2 1) - (8 4)"), std::string::npos) << header;
+            EXPECT_NE(header.find("pixelAspectRatio (type float): 2"), std::string::npos);
+            const LoadResult r = Load(kId, b);
+            ASSERT_TRUE(r.image) << r.error;
+            EXPECT_EQ(r.image->Depth(), half ? DepthRGBAFlt16 : DepthRGBAFlt32);
+            ASSERT_EQ(r.image->DataWindow(), window);
+            auto stored = [half](float v) { return half ? HalfToFloat(FloatToHalf(v)) : v; };
+            for (int y = window.y0; y < window.y1; ++y)
+                for (int x = window.x0; x < window.x1; ++x) {
+                    const FltPixel s = src->GetFlt(x, y); // a single channel reads into all four
+                    ASSERT_EQ(r.image->GetFlt(x, y), (FltPixel{stored(s.R), stored(s.G), stored(s.B), stored(s.A)}))
+                        << x << "," << y;
+                    const float z = src->AuxRow(AuxChannelKind::Z, y)[x - window.x0];
+                    ASSERT_EQ(r.image->AuxRow(AuxChannelKind::Z, y)[x - window.x0],
+                              mode == 1 ? HalfToFloat(FloatToHalf(z)) : z);
+                }
+        }
 }
 
 TEST_F(OpenEXRFormatTest, AuxiliaryChannelsAndChannelBoxes) {
@@ -325,86 +375,152 @@ TEST_F(OpenEXRFormatTest, MetadataRoundTripsWithTypes) {
 
 // ---- files made independently ----
 
-TEST_F(OpenEXRFormatTest, HandMadeFilesReadToKnownValues) {
-    const LoadResult r = Load(kId, OffsetFile(0));
-    ASSERT_TRUE(r.image) << r.error;
-    EXPECT_EQ(r.image->Depth(), DepthRGBAFlt16);
-    ExpectOffsetFile(*r.image, 0);
-
+TEST_F(OpenEXRFormatTest, HandMadeFilesReadToKnownValuesAndAreDescribedAsBuilt) {
     // Y alone: grey, opaque; FLOAT makes a float32 image.
     const Bytes grey = HandMade(ImgRectI(0, 0, 5, 3), ImgRectI(0, 0, 5, 3), {{"Y", 2}},
                                 [](int x, int y, const std::string &) { return x * 0.25f - y / 3.f; });
-    const LoadResult g = Load(kId, grey);
-    ASSERT_TRUE(g.image) << g.error;
-    EXPECT_EQ(g.image->Depth(), DepthRGBAFlt32);
-    for (int y = 0; y < 4; ++y)
-        for (int x = 0; x < 6; ++x) {
-            const float v = x * 0.25f - (3 - y) / 3.f;
-            ASSERT_EQ(g.image->GetFlt(x, y), (FltPixel{v, v, v, 1.f}));
+    const auto value = [](int x, int, const std::string &c) { return c == "objectID" ? 7.f + x : 0.5f; };
+    const Bytes uint =
+        HandMade(ImgRectI(0, 0, 7, 4), ImgRectI(2, 1, 5, 3), {{"R", 1}, {"G", 2}, {"objectID", 0}}, value);
+    const Bytes deep = HandMade(ImgRectI(0, 0, 7, 4), ImgRectI(2, 1, 5, 3), {{"Z", 2}, {"A", 1}}, value, true);
+    struct Row {
+        Bytes file;
+        const char *readError, *type, *channels, *dataWindow, *displayWindow; // windows as the file holds them
+        std::function<void(const Image &)> check;
+    };
+    const Row rows[] = {
+        {OffsetFile(0), nullptr, "scanlineimage", "A half, B half, G half, R half", "{ 3, 2, 10, 6 }",
+         "{ 1, 1, 12, 8 }",
+         [](const Image &img) {
+             EXPECT_EQ(img.Depth(), DepthRGBAFlt16);
+             ExpectOffsetFile(img, 0);
+         }},
+        {grey, nullptr, "scanlineimage", "Y float", "{ 0, 0, 5, 3 }", "{ 0, 0, 5, 3 }",
+         [](const Image &img) {
+             EXPECT_EQ(img.Depth(), DepthRGBAFlt32);
+             for (int y = 0; y < 4; ++y)
+                 for (int x = 0; x < 6; ++x) {
+                     const float v = x * 0.25f - (3 - y) / 3.f;
+                     ASSERT_EQ(img.GetFlt(x, y), (FltPixel{v, v, v, 1.f}));
+                 }
+         }},
+        {uint, nullptr, "scanlineimage", "G float, R half, objectID uint32", "{ 2, 1, 5, 3 }", "{ 0, 0, 7, 4 }",
+         [](const Image &img) { // unsigned integers read as floats, in the image's flipped window
+             ASSERT_EQ(img.DataWindow(), ImgRectI(2, 1, 6, 4));
+             EXPECT_EQ(img.AuxRow(AuxChannelKind::ObjectID, 2)[3], 7.f + 5);
+         }},
+        {deep, "holds deep data", "deepscanline", "A half, Z float", "{ 2, 1, 5, 3 }", "{ 0, 0, 7, 4 }", nullptr},
+    };
+    for (const Row &row : rows) {
+        SCOPED_TRACE(row.channels);
+        Ref<ImageFormat> f = MakeFormat(kId);
+        MemoryIO io(row.file);
+        ScriptVal d;
+        ASSERT_TRUE(f->DescribeFile(&io, d)) << f->Error();
+        const ScriptVal *error = d.Find("readError");
+        ASSERT_EQ(error != nullptr, row.readError != nullptr) << (error ? error->AsText() : "");
+        if (error) {
+            EXPECT_NE(error->AsText().find(row.readError), std::string::npos) << error->AsText();
         }
-
-    // Lower-case names in a layer, no alpha; an unknown channel is left alone.
-    const Bytes layered = HandMade(ImgRectI(0, 0, 3, 1), ImgRectI(0, 0, 3, 1),
-                                   {{"beauty.r", 1}, {"beauty.g", 1}, {"beauty.b", 1}, {"mask", 1}},
-                                   [](int x, int, const std::string &c) { return c == "mask" ? 9.f : x + 0.5f; });
-    const LoadResult l = Load(kId, layered);
-    ASSERT_TRUE(l.image) << l.error;
-    EXPECT_EQ(l.image->GetFlt(2, 1), (FltPixel{2.5f, 2.5f, 2.5f, 1.f}));
+        EXPECT_EQ(d.Find("width") != nullptr, row.readError == nullptr);
+        const ScriptVal &part = *d.Find("openexr")->Find("parts")->At(1);
+        EXPECT_EQ(part.Find("type")->AsText(), row.type);
+        EXPECT_EQ(part.Find("dataWindow")->ToText(), row.dataWindow);
+        EXPECT_EQ(part.Find("displayWindow")->ToText(), row.displayWindow);
+        std::string channels;
+        for (const auto &[k, c] : d.Find("channels")->Entries())
+            channels += (channels.empty() ? "" : ", ") + c.Find("name")->AsText() + " " + c.Find("type")->AsText();
+        EXPECT_EQ(channels, row.channels);
+        const LoadResult r = Load(kId, row.file);
+        ASSERT_EQ(r.image != nullptr, row.check != nullptr) << r.error;
+        if (row.check) row.check(*r.image);
+    }
 }
 
-TEST_F(OpenEXRFormatTest, TiledMultiPartAndMultiViewFilesFromTheTools) {
+TEST_F(OpenEXRFormatTest, TiledMultiPartMultiViewAndLayeredFilesReadWhatIsChosen) {
     if (!HaveProgram("exrmaketiled") || !HaveProgram("exrmultipart") || !HaveProgram("exrmultiview"))
         GTEST_SKIP() << "the OpenEXR tools are not installed";
     TempDir dir;
     WriteFile(dir / "a.exr", OffsetFile(0));
     WriteFile(dir / "b.exr", OffsetFile(5));
     ASSERT_TRUE(RunShell("exrmaketiled -t 4 4 -z zip '" + dir / "a.exr" + "' '" + dir / "t.exr" + "'"));
-    const LoadResult t = Load(kId, ReadFile(dir / "t.exr"));
-    ASSERT_TRUE(t.image) << t.error;
-    ExpectOffsetFile(*t.image, 0);
-
     ASSERT_TRUE(RunShell("exrmultipart -combine -i '" + dir / "a.exr" + "::first' '" + dir / "b.exr" +
                          "::second' -o '" + dir / "p.exr" + "' >/dev/null"));
-    const Bytes parts = ReadFile(dir / "p.exr");
-    Ref<ImageFormat> f = MakeFormat(kId);
-    MemoryIO io(parts);
-    ASSERT_TRUE(f->LoadHeader(&io)) << f->Error();
-    Ref<Image> first;
-    ASSERT_TRUE(f->LoadFrameTagList(0, first, {}));
-    ExpectOffsetFile(*first, 0);
-    OrvaneDoc doc;
-    Operator *tool = Orvane::Test::AddImageSource(doc, "Loader", nullptr);
-    f->AddLoadInputs(tool); // the part list now offers the file's parts
-    Input *part = tool->FindInput("Part");
-    ASSERT_NE(part, nullptr);
-    std::vector<std::string> ids;
-    for (const TagItem *item : part->Tags().FindAll(ListItemId)) ids.push_back(item->AsID().Text());
-    EXPECT_EQ(ids, (std::vector<std::string>{"Default", "first", "second"}));
-    Request req(tool, nullptr, 0.0, 0, nullptr);
-    req.SetInputData(part, MakeRef<IDValue>(OvID("second")).Get());
-    f->SetupLoad(tool, &req);
-    Ref<Image> second;
-    io.Seek(0, IOClass::SeekStart);
-    ASSERT_TRUE(f->LoadHeader(&io) && f->LoadFrameTagList(0, second, {})) << f->Error();
-    ExpectOffsetFile(*second, 5);
-    req.SetInputData(part, MakeRef<IDValue>(OvID("third")).Get());
-    f->SetupLoad(tool, &req);
-    io.Seek(0, IOClass::SeekStart);
-    EXPECT_FALSE(f->LoadHeader(&io));
-
     // The right view is the file's default; the left eye is still read first.
     ASSERT_TRUE(RunShell("exrmultiview -z zip right '" + dir / "b.exr" + "' left '" + dir / "a.exr" + "' '" +
                          dir / "v.exr" + "'"));
-    const Bytes views = ReadFile(dir / "v.exr");
-    const LoadResult left = Load(kId, views);
-    ASSERT_TRUE(left.image) << left.error;
-    ExpectOffsetFile(*left.image, 0);
-    // The right eye, through the format attribute.
-    const LoadResult right = Load(kId, views, {}, [](ImageFormat &fmt) {
-        fmt.SetAttrsTagList({{FormatStereoEye, 1}});
-    });
-    ASSERT_TRUE(right.image) << right.error;
-    ExpectOffsetFile(*right.image, 5);
+    // Two colour layers, one with lower-case names, no alpha, and a channel no
+    // slot reads; pixel x of layer channel c holds x + the layer's and the channel's offsets.
+    const Bytes layered = HandMade(ImgRectI(0, 0, 3, 1), ImgRectI(0, 0, 3, 1),
+                                   {{"beauty.r", 1},
+                                    {"beauty.g", 1},
+                                    {"beauty.b", 1},
+                                    {"diffuse.R", 1},
+                                    {"diffuse.G", 1},
+                                    {"diffuse.B", 1},
+                                    {"mask", 1}},
+                                   [](int x, int, const std::string &c) {
+                                       const char last =
+                                           static_cast<char>(std::toupper(static_cast<unsigned char>(c.back())));
+                                       return (c[0] == 'd' ? 10.f : 0.f) + x + ChannelIndex(std::string(1, last)) / 4.f;
+                                   });
+    const std::map<std::string, Bytes> files = {{"tiled", ReadFile(dir / "t.exr")},
+                                                {"parts", ReadFile(dir / "p.exr")},
+                                                {"views", ReadFile(dir / "v.exr")},
+                                                {"layers", layered}};
+    struct Row {
+        const char *file;
+        Choices choices;
+        int eye, seed;     ///< the OffsetFile read (layers: the layer's offset)
+        const char *error; ///< the failure expected instead
+    };
+    const Row rows[] = {
+        {"tiled", {}, 0, 0, nullptr},
+        {"parts", {}, 0, 0, nullptr},
+        {"parts", {{"Part", "second"}}, 0, 5, nullptr},
+        {"parts", {{"Part", "third"}}, 0, 0, "the file has no part third"},
+        {"views", {}, 0, 0, nullptr},
+        {"views", {}, 1, 5, nullptr},
+        {"views", {{"View", "right"}}, 0, 5, nullptr},
+        {"views", {{"View", "left"}}, 1, 0, nullptr}, // the choice outranks the eye
+        {"views", {{"View", "centre"}}, 0, 0, "the file has no view centre"},
+        {"layers", {}, 0, 0, nullptr},
+        {"layers", {{"Layer", "diffuse"}}, 0, 10, nullptr},
+        {"layers", {{"Layer", "specular"}}, 0, 0, "has no layer specular"},
+    };
+    for (const Row &row : rows) {
+        SCOPED_TRACE(testing::Message() << row.file << " eye " << row.eye << " "
+                                        << (row.choices.empty() ? "" : row.choices[0].second));
+        std::string error;
+        Ref<Image> img = LoadWith(files.at(row.file), {}, row.choices, row.eye, &error);
+        if (row.error) {
+            EXPECT_FALSE(img);
+            EXPECT_NE(error.find(row.error), std::string::npos) << error;
+        } else if (std::string(row.file) == "layers") {
+            ASSERT_TRUE(img) << error;
+            const float at = row.seed + 2.f;
+            EXPECT_EQ(img->GetFlt(2, 0), (FltPixel{at, at + 0.25f, at + 0.5f, 1.f}));
+        } else {
+            ASSERT_TRUE(img) << error;
+            ExpectOffsetFile(*img, row.seed);
+        }
+    }
+
+    // After a header, the lists offer the file's parts and views.
+    for (const auto &[file, input, want] :
+         {std::tuple{"parts", "Part", std::vector<std::string>{"Default", "first", "second"}},
+          std::tuple{"views", "View", std::vector<std::string>{"Default", "right", "left"}}}) {
+        Ref<ImageFormat> f = MakeFormat(kId);
+        MemoryIO io(files.at(file));
+        ASSERT_TRUE(f->LoadHeader(&io)) << f->Error();
+        OrvaneDoc doc;
+        Operator *tool = Orvane::Test::AddImageSource(doc, "Loader", nullptr);
+        f->AddLoadInputs(tool);
+        std::vector<std::string> ids;
+        for (const TagItem *item : tool->FindInput(input)->Tags().FindAll(ListItemId))
+            ids.push_back(item->AsID().Text());
+        EXPECT_EQ(ids, want) << input;
+    }
 }
 
 // ---- the sample images ----
@@ -430,19 +546,30 @@ TEST_F(OpenEXRFormatTest, SampleImagesMatchExrheader) {
         }
     EXPECT_GE(files, 30);
 
-    // The left eye of the single-part and the multi-part Beachball frame agree.
-    const LoadResult single = Load(kId, ReadFile(Samples() + "/Beachball/singlepart.0001.exr"));
-    const LoadResult multi = Load(kId, ReadFile(Samples() + "/Beachball/multipart.0001.exr"));
-    ASSERT_TRUE(single.image && multi.image);
-    const ImgRectI common = single.image->DataWindow() & multi.image->DataWindow();
-    ASSERT_FALSE(common.IsNull());
-    int differ = 0;
-    for (int y = common.y0; y < common.y1; y += 7)
-        for (int x = common.x0; x < common.x1; x += 7)
-            differ += !(single.image->GetFlt(x, y) == multi.image->GetFlt(x, y));
-    EXPECT_EQ(differ, 0);
-    EXPECT_TRUE(multi.image->Metadata().Find("name"));
-    EXPECT_EQ(multi.image->Metadata().Find("name")->AsText(), "rgba_left");
+    // Each eye of the single-part multi-view and the multi-part Beachball
+    // frame agree, and the two eyes differ.
+    const Bytes singleFile = ReadFile(Samples() + "/Beachball/singlepart.0001.exr");
+    const Bytes multiFile = ReadFile(Samples() + "/Beachball/multipart.0001.exr");
+    auto differing = [](const Image &a, const Image &b) {
+        const ImgRectI common = a.DataWindow() & b.DataWindow();
+        EXPECT_FALSE(common.IsNull());
+        int n = 0;
+        for (int y = common.y0; y < common.y1; y += 7)
+            for (int x = common.x0; x < common.x1; x += 7) n += !(a.GetFlt(x, y) == b.GetFlt(x, y));
+        return n;
+    };
+    Ref<Image> eyes[2];
+    for (int eye = 0; eye < 2; ++eye) {
+        const char *view = eye ? "right" : "left";
+        Ref<Image> single = LoadWith(singleFile, {}, {{"View", view}});
+        Ref<Image> multi = LoadWith(multiFile, {}, {{"View", view}});
+        ASSERT_TRUE(single && multi) << view;
+        EXPECT_EQ(differing(*single, *multi), 0) << view;
+        ASSERT_TRUE(multi->Metadata().Find("name"));
+        EXPECT_EQ(multi->Metadata().Find("name")->AsText(), std::string("rgba_") + view);
+        eyes[eye] = single;
+    }
+    EXPECT_GT(differing(*eyes[0], *eyes[1]), 100);
 
     // Luminance / chroma reads close to the RGB original.
     const LoadResult rgb = Load(kId, ReadFile(Samples() + "/Chromaticities/Rec709.exr"));
