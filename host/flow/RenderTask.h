@@ -11,11 +11,14 @@
 // line per distinct reason), which the command line prints as warnings: the
 // tool's rows have made the frame instead.
 //
+// Tools that write files note each file they completed (NoteFileWritten),
+// so the command line can list them even for a frame it abandoned.
+//
 // Tasks are found by their ID (Find) while they exist.
 //
-// Thread safety: Abort, Execute, QueueExecute, NoteDeviceFailure and
-// DeviceLog may be called from any thread; the rest is set before the render
-// starts.
+// Thread safety: Abort, Execute, QueueExecute, NoteDeviceFailure, DeviceLog,
+// NoteFileWritten and FilesWritten may be called from any thread; the rest
+// is set before the render starts.
 #include <atomic>
 #include <cstdint>
 #include <functional>
@@ -57,6 +60,14 @@ public:
     /// The distinct failures noted so far ("name: reason").
     std::vector<std::string> DeviceLog() const;
 
+    struct WrittenFile {
+        std::string tool, path;
+    };
+    /// Notes that `tool` wrote `path` completely.
+    void NoteFileWritten(const std::string &tool, const std::string &path);
+    /// The files noted, in order, from the `from`-th on.
+    std::vector<WrittenFile> FilesWritten(size_t from = 0) const;
+
     int proxyScale = 1;
     bool interactive = false;
     bool boundsOnly = false;
@@ -66,6 +77,9 @@ public:
     /// First frame of the render's range (-2e9: not a range render). Savers
     /// number their files from it when asked to.
     double startTime = -2e9;
+    /// Last frame of the range (-2e9: not a range render). A render of one
+    /// frame (endTime == startTime) may write a file name without a number.
+    double endTime = -2e9;
 
 private:
     std::atomic<bool> abort_{false};
@@ -73,6 +87,7 @@ private:
     IDeviceContext *device_ = nullptr;
     mutable std::mutex logLock_;
     std::vector<std::string> log_;
+    std::vector<WrittenFile> written_;
 };
 
 } // namespace Orvane

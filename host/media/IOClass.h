@@ -39,7 +39,9 @@ public:
 
 class ORVANE_API FileIO : public IOClass {
 public:
-    enum class Mode { Read, Write };
+    /// Write truncates or creates the file; CreateNew makes a new file and
+    /// fails when anything (a link included) already has the name.
+    enum class Mode { Read, Write, CreateNew };
     /// Opens a file; null with a reason in `error` when it cannot.
     static std::unique_ptr<FileIO> Open(const std::string &path, Mode mode, std::string &error);
     ~FileIO() override;

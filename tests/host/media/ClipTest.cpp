@@ -5,6 +5,7 @@
 #include <cstring>
 #include <filesystem>
 #include <fstream>
+#include <sys/stat.h>
 #include <unistd.h>
 
 #include "host/core/Registry.h"
@@ -155,6 +156,42 @@ TEST(Clip, AFailedWriteLeavesNoFileAndKeepsAnOldOne) {
     Clip unknown((dir.path / "x.nosuchformat").string());
     EXPECT_FALSE(unknown.PutFrameTagList(0, Orvane::Test::PatternImage(2, 2).Get(), {}, error));
     EXPECT_NE(error.find("no format writes"), std::string::npos) << error;
+}
+
+TEST(Clip, WritesReplaceOnlyRegularFilesKeepingLinksAndPermissions) {
+    RegisterOnce();
+    TempDir dir;
+    const auto &d = dir.path;
+    std::ofstream(d / "real.tfmt") << "old";
+    std::filesystem::permissions(d / "real.tfmt", std::filesystem::perms(0640));
+    std::filesystem::create_symlink(d / "real.tfmt", d / "link.tfmt");
+    ASSERT_EQ(mkfifo((d / "pipe.tfmt").c_str(), 0600), 0);
+    auto starts = [](const std::filesystem::path &p) {
+        std::ifstream f(p);
+        std::string head(4, '\0');
+        f.read(head.data(), 4);
+        return head;
+    };
+    std::string error;
+    Ref<Image> img = Orvane::Test::PatternImage(3, 2);
+    // Through the link: the link stays, the file it names is replaced and keeps its permissions.
+    ASSERT_TRUE(Clip((d / "link.tfmt").string()).PutFrameTagList(0, img.Get(), {}, error)) << error;
+    EXPECT_TRUE(std::filesystem::is_symlink(d / "link.tfmt"));
+    EXPECT_EQ(starts(d / "real.tfmt"), "TFMT");
+    EXPECT_EQ(std::filesystem::status(d / "real.tfmt").permissions(), std::filesystem::perms(0640));
+    // A FIFO is refused before anything is written; errors name the file, never the temporary.
+    EXPECT_FALSE(Clip((d / "pipe.tfmt").string()).PutFrameTagList(0, img.Get(), {}, error));
+    EXPECT_EQ(error, (d / "pipe.tfmt").string() + ": a FIFO, not a regular file; refusing to write over it");
+    EXPECT_TRUE(std::filesystem::is_fifo(d / "pipe.tfmt"));
+    EXPECT_FALSE(Clip((d / "none/x.tfmt").string()).PutFrameTagList(0, img.Get(), {}, error));
+    EXPECT_EQ(error, (d / "none/x.tfmt").string() + ": the folder does not exist");
+    TestFormat::failWrites = true;
+    EXPECT_FALSE(Clip((d / "real.tfmt").string()).PutFrameTagList(0, img.Get(), {}, error));
+    TestFormat::failWrites = false;
+    EXPECT_EQ(error, (d / "real.tfmt").string() + ": told to fail");
+    size_t files = 0;
+    for ([[maybe_unused]] const auto &e : std::filesystem::directory_iterator(d)) ++files;
+    EXPECT_EQ(files, 3u) << "no temporary file is left behind";
 }
 
 TEST(Clip, AFileThatIsNotWhatItsNameSaysIsRefusedClearly) {
