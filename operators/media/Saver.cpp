@@ -179,11 +179,6 @@ std::string Saver::GetTitle() const {
     return c && !c->FileName().empty() ? Name() + ": " + c->FileName() : Name();
 }
 
-std::string Saver::LastWritten() const {
-    std::lock_guard<std::mutex> guard(lastLock_);
-    return lastWritten_;
-}
-
 void Saver::AddFormatInputs(OvID format) {
     const Registry *row = ClassRegistry ? ClassRegistry->Find(format) : nullptr;
     if (!row || !formatGroups_.insert(format).second) return;
@@ -362,10 +357,7 @@ bool Saver::SaveFrame(Request *req, Ref<Image> image) {
         GetDoc()->PrintF(req, ConsoleError, "%s failed to write %s", Name().c_str(), error.c_str());
         return false;
     }
-    const std::string written = clip.FramePath(0);
-    if (RenderTask *task = req->GetTask()) task->NoteFileWritten(Name(), written);
-    std::lock_guard<std::mutex> guard(lastLock_);
-    lastWritten_ = written;
+    if (RenderTask *task = req->GetTask()) task->NoteFileWritten(Name(), clip.FramePath(0));
     return true;
 }
 

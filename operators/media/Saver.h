@@ -44,8 +44,6 @@ public:
 
     std::string FrameFileName(double time, const RenderTask *task) const override;
     std::string FrameFilePattern(double time, const RenderTask *task) const override;
-    /// The file the last successful save wrote.
-    std::string LastWritten() const;
 
 private:
     int64_t FileNumber(double time, double renderStart) const;
@@ -70,8 +68,6 @@ private:
     /// The Output Format was set to one other than the file extension names.
     bool formatChosen_ = false;
     bool firstFrame_ = true, audioWarned_ = false;
-    mutable std::mutex lastLock_;
-    std::string lastWritten_;
 };
 
 } // namespace Orvane

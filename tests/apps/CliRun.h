@@ -1,0 +1,72 @@
+#pragma once
+// Running the orvane command line as a separate process, the way scripts
+// and render farms run it, for the command-line tests.
+#include <cstdlib>
+#include <filesystem>
+#include <fstream>
+#include <sstream>
+#include <string>
+#include <sys/wait.h>
+#include <unistd.h>
+
+namespace Orvane::clitest {
+
+struct CliRun {
+    int exitCode = -1;
+    std::string out, err;
+};
+
+/// `s` quoted for the shell.
+inline std::string Quote(const std::string &s) {
+    std::string q = "'";
+    for (char c : s) q += c == '\'' ? std::string("'\\''") : std::string(1, c);
+    return q + "'";
+}
+
+inline std::string ReadFile(const std::filesystem::path &p) {
+    std::ifstream f(p, std::ios::binary);
+    std::ostringstream s;
+    s << f.rdbuf();
+    return s.str();
+}
+
+/// A folder of its own, removed with everything in it.
+class TempDir {
+public:
+    TempDir() {
+        path_ = std::filesystem::temp_directory_path() /
+                ("orvane-cli-" + std::to_string(getpid()) + "-" + std::to_string(counter_++));
+        std::filesystem::create_directories(path_);
+    }
+    ~TempDir() {
+        std::error_code ec;
+        std::filesystem::remove_all(path_, ec);
+    }
+    std::filesystem::path File(const std::string &name, const std::string &text) const {
+        std::ofstream(path_ / name, std::ios::binary) << text;
+        return path_ / name;
+    }
+    const std::filesystem::path &Path() const { return path_; }
+
+private:
+    std::filesystem::path path_;
+    static inline int counter_ = 0;
+};
+
+/// Runs `orvane ARGS` (shell words) with no input; its exit code and output.
+inline CliRun Orvane(const std::string &args) {
+    TempDir dir;
+    const auto outFile = dir.Path() / "out", errFile = dir.Path() / "err";
+    const std::string cmd = Quote(std::string(ORVANE_BINARY_DIR) + "/orvane") + " " + args + " >" +
+                            Quote(outFile.string()) + " 2>" + Quote(errFile.string()) + " </dev/null";
+    const int status = std::system(cmd.c_str());
+    CliRun r;
+    r.exitCode = WIFEXITED(status) ? WEXITSTATUS(status) : -1;
+    r.out = ReadFile(outFile);
+    r.err = ReadFile(errFile);
+    return r;
+}
+
+inline bool Contains(const std::string &text, const std::string &part) { return text.find(part) != std::string::npos; }
+
+} // namespace Orvane::clitest
