@@ -208,7 +208,8 @@ public:
 private:
     static void Object(const std::string &event, const std::vector<Field> &fields) {
         std::string j = "{\"event\": " + JsonString(event);
-        for (const auto &[name, value] : fields) j += ", " + JsonString(name) + ": " + value;
+        for (const auto &[name, value] : fields)
+            if (value != "\"\"") j += ", " + JsonString(name) + ": " + value; // an unknown fact is left out
         std::printf("%s}\n", j.c_str());
     }
     void Bar(size_t index, int64_t frame) {

@@ -133,11 +133,11 @@ bool Clip::PutFrameTagList(int64_t frame, Image *image, const TagList &tags, std
     if (!folder.empty() && !std::filesystem::is_directory(folder, ec)) return fail("the folder does not exist");
 
     TemporaryFile temp(TemporaryFileFor(target));
-    std::unique_ptr<FileIO> io = FileIO::Open(temp.path, FileIO::Mode::CreateNew, error);
+    std::unique_ptr<FileIO> io = FileIO::Open(temp.path, FileIO::Mode::CreateNew, error, path);
     int err = io ? 0 : errno;
     if (err == EEXIST) { // left by an earlier process with this number
         unlink(temp.path.c_str());
-        io = FileIO::Open(temp.path, FileIO::Mode::CreateNew, error);
+        io = FileIO::Open(temp.path, FileIO::Mode::CreateNew, error, path);
         err = io ? 0 : errno;
     }
     if (!io) return fail(std::strerror(err));

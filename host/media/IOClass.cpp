@@ -10,7 +10,7 @@ namespace Orvane {
 
 IOClass::~IOClass() = default;
 
-std::unique_ptr<FileIO> FileIO::Open(const std::string &path, Mode mode, std::string &error) {
+std::unique_ptr<FileIO> FileIO::Open(const std::string &path, Mode mode, std::string &error, const std::string &name) {
     std::FILE *f = nullptr;
     if (mode == Mode::CreateNew) {
         const int fd = open(path.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, 0666);
@@ -27,7 +27,7 @@ std::unique_ptr<FileIO> FileIO::Open(const std::string &path, Mode mode, std::st
         error = path + ": " + std::strerror(errno);
         return nullptr;
     }
-    return std::unique_ptr<FileIO>(new FileIO(f, path));
+    return std::unique_ptr<FileIO>(new FileIO(f, name.empty() ? path : name));
 }
 
 FileIO::~FileIO() { Close(); }

@@ -162,7 +162,9 @@ TEST(CliRender, ReplacesOnlyRegularFiles) {
         const auto flow = dir.File("a.flow", SaverFlow({{"Out", target, ""}}));
         const CliRun r = Orvane("render " + Quote(flow.string()) + " --frames 1");
         EXPECT_EQ(r.exitCode, c.exitCode) << r.err;
-        if (c.exitCode) EXPECT_TRUE(Contains(r.err, "ERROR: Saver Out, frame 1: " + target + c.why)) << r.err;
+        if (c.exitCode) {
+            EXPECT_TRUE(Contains(r.err, "ERROR: Saver Out, frame 1: " + target + c.why)) << r.err;
+        }
     }
     EXPECT_TRUE(fs::is_fifo(d / "pipe.png"));
     EXPECT_TRUE(fs::is_directory(d / "folder.png"));
@@ -173,8 +175,8 @@ TEST(CliRender, ReplacesOnlyRegularFiles) {
 TEST(CliRender, EventsCarryTheirFactsInFields) {
     TempDir dir;
     // An Output Format that is not the extension's writes, with a warning naming both.
-    const auto flow = dir.File(
-        "a.flow", SaverFlow({{"Out", (dir.Path() / "f.####.png").string(), ", OutputFormat = \"TargaFormat\""}}));
+    const auto flow = dir.File("a.flow", SaverFlow({{"Out", (dir.Path() / "f.####.png").string(),
+                                                     ", OutputFormat = \"TargaFormat\", SoundFilename = \"a.wav\""}}));
     const CliRun text = Orvane("render " + Quote(flow.string()) + " --frames 1");
     EXPECT_EQ(text.exitCode, 0) << text.err;
     EXPECT_EQ(Count(text.err, "WARNING: saver=Out format=TargaFormat extension=.png: "), 1u) << text.err;
@@ -183,6 +185,11 @@ TEST(CliRender, EventsCarryTheirFactsInFields) {
     EXPECT_TRUE(Contains(json.out, "{\"event\": \"warning\", \"code\": \"format_mismatch\", \"saver\": \"Out\", "
                                    "\"format\": \"TargaFormat\", \"extension\": \"png\", \"extension_format\": "
                                    "\"PNGFormat\", \"warning\": "))
+        << json.out;
+    // A tool's console line says which tool it came from.
+    EXPECT_TRUE(Contains(json.out,
+                         "{\"event\": \"warning\", \"code\": \"tool\", \"frame\": 1, \"saver\": \"Out\", "
+                         "\"tool\": \"Out\", \"warning\": \"Warning: Out: No supported audio found in a.wav\"}"))
         << json.out;
     EXPECT_TRUE(json.err.empty()) << json.err;
 

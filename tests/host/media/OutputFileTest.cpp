@@ -68,10 +68,11 @@ TEST(OutputFile, OnlyRegularFilesAreReplacedAndLinksToThemWrittenThrough) {
         if (std::string(c.name) == "null" && !device) continue;
         std::string target, error;
         EXPECT_EQ(ResolveOutputFile((d / c.name).string(), target, error), c.ok);
-        if (c.ok)
+        if (c.ok) {
             EXPECT_EQ(target, (d / c.target).string());
-        else
+        } else {
             EXPECT_EQ(error.rfind((d / c.name).string() + ": " + c.why, 0), 0u) << error;
+        }
     }
     close(sock);
 }
