@@ -209,9 +209,17 @@ void Saver::NotifyChanged(Input *in, Parameter *param, double time, TagList *tag
                 AddFormatInputs(named);
             }
         } else if (in == inOutputFormat_) {
-            // The default's own object: the first notification, or a reset.
-            const OvID chosen = static_cast<IDValue *>(param)->value;
-            formatChosen_ = param != in->Default().Get() && chosen != ExtensionFormat(inClip_->Constant().Get());
+            // The default's own object: the first notification, or a reset,
+            // after which the format follows the extension again.
+            OvID chosen = static_cast<IDValue *>(param)->value;
+            const OvID named = ExtensionFormat(inClip_->Constant().Get());
+            formatChosen_ = param != in->Default().Get() && chosen != named;
+            if (!formatChosen_ && !named.IsNull() && named != chosen) {
+                filling_ = true;
+                inOutputFormat_->SetValue(MakeRef<IDValue>(named));
+                filling_ = false;
+                chosen = named;
+            }
             AddFormatInputs(chosen);
         } else if (in == inCreateDirNow_) {
             auto *clip = dynamic_cast<const Clip *>(inClip_->Constant().Get());

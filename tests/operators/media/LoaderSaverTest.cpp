@@ -238,6 +238,10 @@ TEST_F(LoaderSaver, TheOutputFormatFollowsTheExtensionUnlessAnotherWasChosen) {
         Operator *saver = doc.AddTool(OvID("Saver"), "Out" + std::to_string(++n));
         for (const auto &[id, value] : c.steps) Set(saver, id, ScriptVal(value));
         EXPECT_EQ(saver->FindInput("OutputFormat")->Constant()->ToScript().AsText(), c.format) << n;
+        // Resetting the choice hands the format back to the extension at once.
+        Set(saver, "Clip", ScriptVal("z.tga"));
+        saver->FindInput("OutputFormat")->ResetValue();
+        EXPECT_EQ(saver->FindInput("OutputFormat")->Constant()->ToScript().AsText(), "TargaFormat") << n;
     }
 }
 
