@@ -29,12 +29,6 @@ std::string GradientFlow(const fs::path &dir, const std::string &extra = {}) {
     return SaverFlow({{"Out", (dir / "out/f.####.png").string(), ", CreateDir = 1" + extra}});
 }
 
-size_t Count(const std::string &text, const std::string &part) {
-    size_t n = 0;
-    for (size_t at = text.find(part); at != std::string::npos; at = text.find(part, at + 1)) ++n;
-    return n;
-}
-
 /// Names in `dir` that are temporary files of a write.
 std::vector<std::string> Temporaries(const fs::path &dir) {
     std::vector<std::string> found;
@@ -76,26 +70,19 @@ TEST(CliRender, WritesEveryFrameAndReportsIt) {
 
 TEST(CliRender, NamesWithoutANumberAreNumberedForSeveralFrames) {
     TempDir dir;
-    const std::string still = (dir.Path() / "still.png").string();
-    const auto flow = dir.File("a.flow", SaverFlow({{"Out", still, ""}}));
+    const auto flow = dir.File("a.flow", SaverFlow({{"Out", (dir.Path() / "still.png").string(), ""}}));
     const struct {
-        const char *frames;
-        std::vector<const char *> files;
+        const char *frames, *files, *lastFile;
     } cases[] = {
-        {"5", {"still.png"}},
-        {"1-3", {"still.0001.png", "still.0002.png", "still.0003.png"}},
-        {"1-2 --chunk 2/2", {"still.0002.png"}}, // a chunk of a longer range numbers as the whole range
+        {"5", "still.png", "still.png"},
+        {"1-3", "still.####.png", "still.0003.png"},
+        {"1-2 --chunk 2/2", "still.####.png", "still.0002.png"}, // a chunk numbers as its whole range
     };
     for (const auto &c : cases) {
-        SCOPED_TRACE(c.frames);
-        for (const auto &e : fs::directory_iterator(dir.Path()))
-            if (e.path().extension() == ".png") fs::remove(e.path());
         const CliRun r = Orvane("render " + Quote(flow.string()) + " --frames " + c.frames);
         EXPECT_EQ(r.exitCode, 0) << r.err;
-        size_t pngs = 0;
-        for (const auto &e : fs::directory_iterator(dir.Path())) pngs += e.path().extension() == ".png";
-        EXPECT_EQ(pngs, c.files.size());
-        for (const char *f : c.files) EXPECT_TRUE(fs::exists(dir.Path() / f)) << f;
+        EXPECT_TRUE(Contains(r.out, "files=" + (dir.Path() / c.files).string() + " ")) << r.out;
+        EXPECT_TRUE(fs::exists(dir.Path() / c.lastFile)) << c.frames;
     }
 }
 
@@ -140,36 +127,15 @@ TEST(CliRender, RefusesBeforeTheFirstFrameToWriteOneFileTwice) {
 
 TEST(CliRender, ReplacesOnlyRegularFiles) {
     TempDir dir;
-    const fs::path d = dir.Path();
-    ASSERT_EQ(mkfifo((d / "pipe.png").c_str(), 0600), 0);
-    fs::create_directory(d / "folder.png");
-    fs::create_symlink(d / "pipe.png", d / "to-pipe.png");
-    std::ofstream(d / "real.png") << "old";
-    fs::create_symlink(d / "real.png", d / "to-real.png");
-    const struct {
-        const char *name;
-        int exitCode;
-        const char *why;
-    } cases[] = {
-        {"pipe.png", 2, ": a FIFO, not a regular file; refusing to write over it; nothing was written"},
-        {"folder.png", 2, ": a folder, not a regular file"},
-        {"to-pipe.png", 2, ": a symbolic link to a FIFO"},
-        {"to-real.png", 0, ""}, // written through: the link stays, the file it names is new
-    };
-    for (const auto &c : cases) {
-        SCOPED_TRACE(c.name);
-        const std::string target = (d / c.name).string();
-        const auto flow = dir.File("a.flow", SaverFlow({{"Out", target, ""}}));
-        const CliRun r = Orvane("render " + Quote(flow.string()) + " --frames 1");
-        EXPECT_EQ(r.exitCode, c.exitCode) << r.err;
-        if (c.exitCode) {
-            EXPECT_TRUE(Contains(r.err, "ERROR: Saver Out, frame 1: " + target + c.why)) << r.err;
-        }
-    }
-    EXPECT_TRUE(fs::is_fifo(d / "pipe.png"));
-    EXPECT_TRUE(fs::is_directory(d / "folder.png"));
-    EXPECT_TRUE(fs::is_symlink(d / "to-real.png"));
-    EXPECT_EQ(ReadFile(d / "real.png").substr(1, 3), "PNG");
+    const fs::path pipe = dir.Path() / "pipe.png";
+    ASSERT_EQ(mkfifo(pipe.c_str(), 0600), 0);
+    const auto flow = dir.File("a.flow", SaverFlow({{"Out", pipe.string(), ""}}));
+    const CliRun r = Orvane("render " + Quote(flow.string()) + " --frames 1");
+    EXPECT_EQ(r.exitCode, 2) << r.err;
+    EXPECT_TRUE(Contains(r.err, "ERROR: Saver Out, frame 1: " + pipe.string() +
+                                    ": a FIFO, not a regular file; refusing to write over it; nothing was written"))
+        << r.err;
+    EXPECT_TRUE(fs::is_fifo(pipe));
 }
 
 TEST(CliRender, EventsCarryTheirFactsInFields) {
@@ -179,7 +145,8 @@ TEST(CliRender, EventsCarryTheirFactsInFields) {
                                                      ", OutputFormat = \"TargaFormat\", SoundFilename = \"a.wav\""}}));
     const CliRun text = Orvane("render " + Quote(flow.string()) + " --frames 1");
     EXPECT_EQ(text.exitCode, 0) << text.err;
-    EXPECT_EQ(Count(text.err, "WARNING: saver=Out format=TargaFormat extension=.png: "), 1u) << text.err;
+    const std::string warning = "WARNING: saver=Out format=TargaFormat extension=.png: ";
+    EXPECT_TRUE(Contains(text.err, warning) && text.err.find(warning) == text.err.rfind(warning)) << text.err;
     EXPECT_NE(ReadFile(dir.Path() / "f.0001.png").substr(1, 3), "PNG");
     const CliRun json = Orvane("render " + Quote(flow.string()) + " --frames 1 --log-format json");
     EXPECT_TRUE(Contains(json.out, "{\"event\": \"warning\", \"code\": \"format_mismatch\", \"saver\": \"Out\", "
@@ -192,22 +159,6 @@ TEST(CliRender, EventsCarryTheirFactsInFields) {
                          "\"tool\": \"Out\", \"warning\": \"Warning: Out: No supported audio found in a.wav\"}"))
         << json.out;
     EXPECT_TRUE(json.err.empty()) << json.err;
-
-    // A failed frame names the tool that failed and the file it was for.
-    const auto chain =
-        dir.File("b.flow", "Orvane.Document { Version = 1, Tools = {\n"
-                           "  In = Loader { Inputs = { Clip = \"" +
-                               (dir.Path() / "f.0001.png").string() +
-                               "\", GlobalIn = 1 } },\n"
-                               "  Out = Saver { Inputs = { Clip = \"" +
-                               (dir.Path() / "c.####.tga").string() + "\", Input = In.Output } },\n} }\n");
-    const CliRun failed = Orvane("render " + Quote(chain.string()) + " --frames 2 --log-format json");
-    EXPECT_EQ(failed.exitCode, 3);
-    EXPECT_TRUE(Contains(failed.out, "{\"event\": \"error\", \"code\": \"frame_failed\", \"frame\": 2, \"saver\": "
-                                     "\"Out\", \"tool\": \"In\", \"file\": \"" +
-                                         (dir.Path() / "c.0002.tga").string() +
-                                         "\", \"error\": \"frame 2 saver=Out: In"))
-        << failed.out;
 }
 
 TEST(CliRender, ChunksOfARangeWriteTheSameBytesAsTheWholeRange) {
@@ -296,6 +247,13 @@ TEST(CliRender, BadRequestsAndFailedFramesHaveTheirExitCodes) {
     EXPECT_TRUE(Contains(failed.out, "FAILED saver=Out frames=2")) << failed.out;
     EXPECT_TRUE(fs::exists(dir.Path() / "copy/c.0003.tga"));
     EXPECT_FALSE(fs::exists(dir.Path() / "copy/c.0002.tga"));
+    // In JSON the failed frame names the tool that failed and the file it was for.
+    const CliRun json = Orvane("render " + Quote(chain.string()) + " --frames 2 --log-format json");
+    EXPECT_TRUE(Contains(json.out, "{\"event\": \"error\", \"code\": \"frame_failed\", \"frame\": 2, \"saver\": "
+                                   "\"Out\", \"tool\": \"In\", \"file\": \"" +
+                                       (dir.Path() / "copy/c.0002.tga").string() +
+                                       "\", \"error\": \"frame 2 saver=Out: In failed to load file"))
+        << json.out;
     // A folder that does not exist fails each frame, naming the file once.
     const auto noFolder = dir.File("c.flow", SaverFlow({{"Out", (dir.Path() / "none/x.####.png").string(), ""}}));
     const CliRun missing = Orvane("render " + Quote(noFolder.string()) + " --frames 4");

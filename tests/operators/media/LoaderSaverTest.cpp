@@ -198,27 +198,6 @@ TEST_F(LoaderSaver, SaverNumbersFilesAndWritesOnlyInRenders) {
     EXPECT_FALSE(std::filesystem::exists(dir / "out/shot.1003.raw"));
 }
 
-TEST_F(LoaderSaver, APlainNameIsNumberedWhenTheRenderHasSeveralFrames) {
-    Operator *saver = doc.AddTool(OvID("Saver"), "Out");
-    ASSERT_TRUE(saver->FindInput("Input")->ConnectTo(loader->FindMainOutput()));
-    Set(saver, "Clip", ScriptVal(dir / "still.raw"));
-    RenderTask task;
-    task.startTime = 0;
-    task.endTime = 2;
-    EvalOptions options;
-    options.task = &task;
-    for (double t : {0.0, 1.0}) ASSERT_TRUE(Evaluate(saver->FindMainOutput(), t, options));
-    EXPECT_EQ(saver->FrameFilePattern(0, &task), dir / "still.####.raw");
-    EXPECT_EQ(saver->FrameFileName(1, &task), dir / "still.0001.raw");
-    EXPECT_TRUE(std::filesystem::exists(dir / "still.0000.raw"));
-    EXPECT_TRUE(std::filesystem::exists(dir / "still.0001.raw"));
-    EXPECT_FALSE(std::filesystem::exists(dir / "still.raw"));
-    task.endTime = 0; // a render of one frame keeps the name
-    ASSERT_TRUE(Evaluate(saver->FindMainOutput(), 0, options));
-    EXPECT_TRUE(std::filesystem::exists(dir / "still.raw"));
-    EXPECT_EQ(saver->FrameFilePattern(0, &task), dir / "still.raw");
-}
-
 TEST_F(LoaderSaver, TheOutputFormatFollowsTheExtensionUnlessAnotherWasChosen) {
     // Documents set inputs in any order: the result must not depend on it.
     const struct {
