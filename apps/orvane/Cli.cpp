@@ -103,10 +103,10 @@ void LoadFlow(const std::string &path, OrvaneDoc &doc, bool lenient, bool json) 
     for (const DocumentProblem &p : loaded.problems) {
         errors += p.error;
         if (json) {
-            std::printf("{\"event\": \"problem\", \"severity\": \"%s\", \"file\": %s, \"line\": %d, \"column\": %d, "
-                        "\"message\": %s}\n",
-                        p.error ? "error" : "warning", JsonString(path).c_str(), p.line, p.column,
-                        JsonString(p.message).c_str());
+            const char *kind = p.error ? "error" : "warning";
+            std::printf("{\"event\": \"%s\", \"code\": \"document\", \"file\": %s, \"line\": %d, \"column\": %d, "
+                        "\"%s\": %s}\n",
+                        kind, JsonString(path).c_str(), p.line, p.column, kind, JsonString(p.message).c_str());
             continue;
         }
         const std::string place =

@@ -1,10 +1,18 @@
 // orvane render: renders the Savers of a flow frame by frame, for render
 // farms first. Its output and exit codes are a contract:
+//   RENDER saver=<name> files=<absolute name, "####" for the number> frames=<runs> format=<class>
 //   FRAME <n> done <i>/<count> saver=<name> file=<absolute path> <seconds>s
 //   FRAME <n> skipped <i>/<count> saver=<name> file=<path> (exists)
-//   ERROR: ... and WARNING: ... lines, then a summary.
-// With --log-format json every event is one JSON object per line instead.
+//   ERROR: ... and WARNING: ... lines on stderr, then a summary; an
+//   interrupted render lists each Saver's frames written and, indented
+//   below, its files.
+// With --log-format json every event is one JSON object per line instead,
+// its facts in fields ("event", "code", "frame", "saver", "tool", "file",
+// ...), the human text only under "error" or "warning".
 // On a terminal (and in text form) a progress bar replaces the FRAME lines.
+// Before the first frame the render checks what it will write (docs/OUTPUT.md):
+// two frames or two Savers writing one file, or a file that exists and is
+// not a regular one, stop it with exit 2 and nothing written.
 // Exit: 0 every requested frame written (or skipped as existing), 2 bad
 // command line or document, 3 a frame failed, 130 interrupted.
 #include <algorithm>
@@ -31,6 +39,8 @@
 #include "host/flow/Request.h"
 #include "host/flow/ResultCache.h"
 #include "host/image/PixelMemory.h"
+#include "host/media/ImageFormatList.h"
+#include "host/media/OutputFile.h"
 
 namespace Orvane::Cli {
 namespace {
@@ -139,6 +149,11 @@ std::string FrameRuns(std::vector<int64_t> frames) {
     return out;
 }
 
+/// A field of a JSON event: its name and its value as JSON text.
+using Field = std::pair<std::string, std::string>;
+Field Text(const std::string &name, const std::string &value) { return {name, JsonString(value)}; }
+Field Whole(const std::string &name, int64_t value) { return {name, std::to_string(value)}; }
+
 /// Event output: text lines, JSON lines, or a progress bar on a terminal.
 class Log {
 public:
@@ -160,12 +175,25 @@ public:
         }
         std::fflush(stdout);
     }
-    void Message(const char *kind, const std::string &text) {
+    /// A line on stdout: `text` in text form, an object of `event` and the fields in JSON.
+    void Line(const std::string &event, const std::string &text, const std::vector<Field> &fields) {
+        ClearBar();
+        if (json_)
+            Object(event, fields);
+        else
+            std::printf("%s\n", text.c_str());
+        std::fflush(stdout);
+    }
+    /// An ERROR or WARNING: "KIND: text" on stderr, or in JSON an object of
+    /// the event, its `code`, the fields, and the text under "error" or "warning".
+    void Message(const char *kind, const std::string &code, const std::string &text, std::vector<Field> fields = {}) {
         ClearBar();
         if (json_) {
             std::string lower(kind);
             for (char &c : lower) c = static_cast<char>(std::tolower(static_cast<unsigned char>(c)));
-            std::printf("{\"event\": \"%s\", \"message\": %s}\n", lower.c_str(), JsonString(text).c_str());
+            fields.insert(fields.begin(), Text("code", code));
+            fields.push_back(Text(lower, text));
+            Object(lower, fields);
             std::fflush(stdout);
         } else {
             std::fprintf(stderr, "%s: %s\n", kind, text.c_str());
@@ -178,9 +206,14 @@ public:
             drawn_ = false;
         }
     }
-    bool json() const { return json_; }
 
 private:
+    static void Object(const std::string &event, const std::vector<Field> &fields) {
+        std::string j = "{\"event\": " + JsonString(event);
+        for (const auto &[name, value] : fields)
+            if (value != "\"\"") j += ", " + JsonString(name) + ": " + value; // an unknown fact is left out
+        std::printf("%s}\n", j.c_str());
+    }
     void Bar(size_t index, int64_t frame) {
         constexpr int kWidth = 40;
         const int filled = total_ ? static_cast<int>(kWidth * index / total_) : kWidth;
@@ -192,6 +225,123 @@ private:
     bool json_, bar_, drawn_ = false;
     size_t total_;
 };
+
+/// The tool a console line comes from: its first word ("Warning: " aside)
+/// when that names a tool of the document; "" when unknown.
+std::string ToolOfLine(const OrvaneDoc &doc, std::string text) {
+    if (text.rfind("Warning: ", 0) == 0) text.erase(0, 9);
+    const std::string word = text.substr(0, text.find_first_of(" :"));
+    return !word.empty() && doc.FindTool(word) ? word : std::string();
+}
+
+/// Checks what the Savers will write over `frames` before anything is
+/// written: a file name and a format that writes for each, no file written
+/// twice, nothing but regular files replaced. Says which files each Saver
+/// writes (RENDER lines) when all is well; false after the errors otherwise.
+bool CheckOutputs(const std::vector<Operator *> &savers, const std::vector<int64_t> &frames, const RenderTask &task,
+                  Log &log) {
+    namespace fs = std::filesystem;
+    bool ok = true;
+    auto refuse = [&](const std::string &code, const std::string &text, std::vector<Field> fields) {
+        log.Message("ERROR", code, text + "; nothing was written", std::move(fields));
+        ok = false;
+    };
+    const double first = frames.empty() ? 0.0 : static_cast<double>(frames.front());
+    std::vector<std::pair<std::string, std::vector<Field>>> lines;
+    for (Operator *saver : savers) {
+        const std::string pattern = saver->FrameFilePattern(first, &task);
+        if (pattern.empty()) {
+            refuse("no_file_name", "Saver " + saver->Name() + " has no file name to write to",
+                   {Text("saver", saver->Name())});
+            continue;
+        }
+        const std::string files = fs::absolute(pattern).lexically_normal().string();
+        Input *formatInput = saver->FindInput("OutputFormat");
+        auto *format = formatInput ? dynamic_cast<const IDValue *>(formatInput->Constant().Get()) : nullptr;
+        const Registry *row = format && ClassRegistry ? ClassRegistry->Find(format->value) : nullptr;
+        if (!row || !row->Tags().GetBool(RegFormatCanSave)) {
+            const std::string name = format ? format->value.Text() : "";
+            refuse("format", "Saver " + saver->Name() + ": '" + name + "' is not a file format that can write",
+                   {Text("saver", saver->Name()), Text("format", name)});
+            continue;
+        }
+        const Registry *named = FormatRowForWriting(pattern);
+        if (named && named != row) {
+            const std::string ext = fs::path(pattern).extension().string();
+            log.Message("WARNING", "format_mismatch",
+                        "saver=" + saver->Name() + " format=" + row->ID().Text() + " extension=" + ext +
+                            ": the Output Format set in the document is not the extension's (" + named->ID().Text() +
+                            "); the files are written as " + row->ID().Text(),
+                        {Text("saver", saver->Name()), Text("format", row->ID().Text()),
+                         Text("extension", ext.empty() ? ext : ext.substr(1)),
+                         Text("extension_format", named->ID().Text())});
+        }
+        lines.push_back({"RENDER saver=" + saver->Name() + " files=" + files + " frames=" + FrameRuns(frames) +
+                             " format=" + row->ID().Text(),
+                         {Text("saver", saver->Name()), Text("files", files), Text("frames", FrameRuns(frames)),
+                          Text("format", row->ID().Text())}});
+    }
+    if (!ok) return false;
+
+    // Every file once, and only over regular files. A problem is reported
+    // once per Saver (or pair of Savers) with its first file and a count.
+    struct Writer {
+        const Operator *saver;
+        int64_t frame;
+    };
+    struct Problem {
+        std::string code, file, why;
+        Writer a, b;
+        size_t count = 0;
+    };
+    std::map<std::string, Writer> writers;
+    std::map<std::pair<const Operator *, const Operator *>, Problem> problems;
+    auto note = [&](Problem p) {
+        Problem &slot = problems[{p.a.saver, p.b.saver}];
+        if (!slot.count) slot = std::move(p);
+        ++slot.count;
+    };
+    for (Operator *saver : savers)
+        for (int64_t frame : frames) {
+            const std::string path = fs::absolute(saver->FrameFileName(static_cast<double>(frame), &task)).string();
+            std::string target, error;
+            if (!ResolveOutputFile(path, target, error)) {
+                note({"not_regular_file", path, error, {saver, frame}, {nullptr, 0}});
+                continue;
+            }
+            std::error_code ec;
+            const fs::path key = fs::weakly_canonical(target, ec);
+            const auto [it, added] = writers.insert({ec ? target : key.string(), {saver, frame}});
+            if (!added) note({"same_file", path, "", it->second, {saver, frame}});
+        }
+    for (const auto &entry : problems) {
+        const Problem &p = entry.second;
+        const std::string more = p.count > 1 ? " (and " + std::to_string(p.count - 1) + " more like it)" : "";
+        std::vector<Field> fields{Text("saver", p.a.saver->Name()), Whole("frame", p.a.frame), Text("file", p.file),
+                                  Whole("count", static_cast<int64_t>(p.count))};
+        if (p.code == "not_regular_file") {
+            refuse(p.code, "Saver " + p.a.saver->Name() + ", frame " + std::to_string(p.a.frame) + ": " + p.why + more,
+                   fields);
+        } else if (p.a.saver == p.b.saver) {
+            fields.push_back(Whole("other_frame", p.b.frame));
+            refuse(p.code,
+                   "Saver " + p.a.saver->Name() + " would write frames " + std::to_string(p.a.frame) + " and " +
+                       std::to_string(p.b.frame) + " to the same file " + p.file + more,
+                   fields);
+        } else {
+            fields.push_back(Text("other_saver", p.b.saver->Name()));
+            fields.push_back(Whole("other_frame", p.b.frame));
+            refuse(p.code,
+                   "Savers " + p.a.saver->Name() + " (frame " + std::to_string(p.a.frame) + ") and " +
+                       p.b.saver->Name() + " (frame " + std::to_string(p.b.frame) + ") would both write " + p.file +
+                       more,
+                   fields);
+        }
+    }
+    if (!ok) return false;
+    for (const auto &[text, fields] : lines) log.Line("render", text, fields);
+    return true;
+}
 
 double PeakMemoryMiB() {
     rusage usage{};
@@ -241,10 +391,13 @@ int RunRender(const std::vector<std::string> &rawArgs) {
         throw CliError(ExitUsage, "render: --frames: " + error);
     }
     // Saver-relative numbering counts from the whole range's first frame, so
-    // every chunk of a job array numbers its files alike.
+    // every chunk of a job array numbers its files alike; a name without a
+    // number gets one when the whole range has several frames.
     const int64_t rangeStart = frames.empty() ? 0 : *std::min_element(frames.begin(), frames.end());
+    const int64_t rangeEnd = frames.empty() ? 0 : *std::max_element(frames.begin(), frames.end());
     if (!a.chunk.empty() && !TakeChunk(a.chunk, frames, error)) throw CliError(ExitUsage, "render: --chunk: " + error);
 
+    Log log(a.json, frames.size());
     if (a.memoryLimit) {
         doc.Cache().SetBudget(a.memoryLimit / 2);
         SetPixelPoolLimit(a.memoryLimit / 4);
@@ -254,9 +407,11 @@ int RunRender(const std::vector<std::string> &rawArgs) {
     task.SetDevice(ChooseDevice("render", a.device, doc));
     task.proxyScale = a.proxy;
     task.startTime = static_cast<double>(rangeStart);
+    task.endTime = static_cast<double>(rangeEnd);
     EvalOptions options;
     options.task = &task;
     options.flags = a.proxy > 1 ? ReqFlagProxy : 0;
+    if (!CheckOutputs(savers, frames, task, log)) return ExitUsage;
 
     g_task = &task;
     g_signals = 0;
@@ -268,11 +423,11 @@ int RunRender(const std::vector<std::string> &rawArgs) {
     sigaction(SIGINT, &action, &oldInt);
     sigaction(SIGTERM, &action, &oldTerm);
 
-    Log log(a.json, frames.size());
     for (Operator *op : doc.Tools()) op->OnStartRender();
     const auto started = std::chrono::steady_clock::now();
     std::map<std::string, std::vector<int64_t>> written, failed, skipped;
-    size_t index = 0;
+    std::map<std::string, std::vector<std::string>> files; // each Saver's files written, in order
+    size_t index = 0, filesSeen = 0;
     bool interrupted = false;
     for (int64_t frame : frames) {
         if (g_signals.load()) {
@@ -282,8 +437,8 @@ int RunRender(const std::vector<std::string> &rawArgs) {
         ++index;
         for (Operator *saver : savers) {
             const double t = static_cast<double>(frame);
-            const std::string path = saver->FrameFileName(t, &task);
-            if (a.skipExisting && !path.empty() && std::filesystem::exists(path)) {
+            const std::string path = std::filesystem::absolute(saver->FrameFileName(t, &task)).string();
+            if (a.skipExisting && std::filesystem::exists(path)) {
                 skipped[saver->Name()].push_back(frame);
                 log.Frame(frame, "skipped", index, saver->Name(), path, 0.0);
                 continue;
@@ -300,29 +455,54 @@ int RunRender(const std::vector<std::string> &rawArgs) {
                 std::lock_guard<std::mutex> guard(consoleLock);
                 lines = console;
             }
+            const std::vector<Field> where{Whole("frame", frame), Text("saver", saver->Name())};
             for (const std::string &l : lines)
-                if (l[0] == 'W') log.Message("WARNING", l.substr(1));
+                if (l[0] == 'W') {
+                    std::vector<Field> fields = where;
+                    fields.push_back(Text("tool", ToolOfLine(doc, l.substr(1))));
+                    log.Message("WARNING", "tool", l.substr(1), fields);
+                }
+            // The files completed, this Saver's among them even when the frame was abandoned.
+            bool wrote = false;
+            for (const RenderTask::WrittenFile &f : task.FilesWritten(filesSeen)) {
+                ++filesSeen;
+                const std::string absolute = std::filesystem::absolute(f.path).string();
+                std::vector<std::string> &list = files[f.tool];
+                if (std::find(list.begin(), list.end(), absolute) == list.end()) list.push_back(absolute);
+                wrote = wrote || f.tool == saver->Name();
+            }
+            if (wrote) {
+                written[saver->Name()].push_back(frame);
+                log.Frame(frame, "done", index, saver->Name(), path, seconds);
+            }
             if (task.IsAborted()) {
                 interrupted = true;
                 break;
             }
-            if (!result) {
-                std::string why;
+            if (!wrote) {
+                std::string why, tool;
                 for (const std::string &l : lines)
-                    if (l[0] == 'E') why += (why.empty() ? "" : "; ") + l.substr(1);
-                if (why.empty()) why = "no image reached the Saver";
+                    if (l[0] == 'E') {
+                        why += (why.empty() ? "" : "; ") + l.substr(1);
+                        if (tool.empty()) tool = ToolOfLine(doc, l.substr(1));
+                    }
+                if (why.empty()) why = result ? "the Saver wrote no file" : "no image reached the Saver";
                 failed[saver->Name()].push_back(frame);
-                log.Message("ERROR", "frame " + std::to_string(frame) + " saver=" + saver->Name() + ": " + why);
-                continue;
+                std::vector<Field> fields = where;
+                fields.push_back(Text("tool", tool));
+                fields.push_back(Text("file", path));
+                log.Message("ERROR", "frame_failed",
+                            "frame " + std::to_string(frame) + " saver=" + saver->Name() + ": " + why, fields);
             }
-            written[saver->Name()].push_back(frame);
-            log.Frame(frame, "done", index, saver->Name(), std::filesystem::absolute(path).string(), seconds);
         }
         if (interrupted) break;
     }
     for (Operator *op : doc.Tools()) op->OnEndRender();
-    for (const std::string &line : task.DeviceLog())
-        log.Message("WARNING", "device: " + line + " (the CPU made those frames)");
+    for (const std::string &line : task.DeviceLog()) {
+        const std::string name = line.substr(0, line.find(": "));
+        log.Message("WARNING", "device", "device: " + line + " (the CPU made those frames)",
+                    {Text("tool", doc.FindTool(name) ? name : std::string())});
+    }
     sigaction(SIGINT, &oldInt, nullptr);
     sigaction(SIGTERM, &oldTerm, nullptr);
     g_task = nullptr;
@@ -335,33 +515,37 @@ int RunRender(const std::vector<std::string> &rawArgs) {
     for (auto &[k, v] : skipped) nSkipped += v.size();
     const double peak = PeakMemoryMiB();
     if (a.json) {
-        std::string j = "{\"event\": \"summary\", \"written\": " + std::to_string(nWritten) +
-                        ", \"failed\": " + std::to_string(nFailed) + ", \"skipped\": " + std::to_string(nSkipped) +
-                        ", \"interrupted\": " + (interrupted ? "true" : "false") + ", \"failed_frames\": {";
-        bool first = true;
-        for (auto &[k, v] : failed) {
-            j += (first ? "" : ", ") + JsonString(k) + ": " + JsonString(FrameRuns(v));
-            first = false;
-        }
-        j += "}, \"written_frames\": {";
-        first = true;
-        for (auto &[k, v] : written) {
-            j += (first ? "" : ", ") + JsonString(k) + ": " + JsonString(FrameRuns(v));
-            first = false;
-        }
-        j += "}, \"peak_memory_mib\": " + JsonNumber(std::round(peak)) +
-             ", \"seconds\": " + JsonNumber(std::round(total * 1000) / 1000) + "}";
-        std::printf("%s\n", j.c_str());
+        auto table = [](const auto &map, auto value) {
+            std::string j = "{";
+            for (const auto &[k, v] : map) j += (j.size() > 1 ? ", " : "") + JsonString(k) + ": " + value(v);
+            return j + "}";
+        };
+        auto runs = [](const std::vector<int64_t> &v) { return JsonString(FrameRuns(v)); };
+        auto list = [](const std::vector<std::string> &v) {
+            std::string j = "[";
+            for (const std::string &f : v) j += (j.size() > 1 ? ", " : "") + JsonString(f);
+            return j + "]";
+        };
+        std::printf(
+            "{\"event\": \"summary\", \"written\": %zu, \"failed\": %zu, \"skipped\": %zu, \"interrupted\": %s, "
+            "\"failed_frames\": %s, \"written_frames\": %s, \"written_files\": %s, \"peak_memory_mib\": %s, "
+            "\"seconds\": %s}\n",
+            nWritten, nFailed, nSkipped, interrupted ? "true" : "false", table(failed, runs).c_str(),
+            table(written, runs).c_str(), table(files, list).c_str(), JsonNumber(std::round(peak)).c_str(),
+            JsonNumber(std::round(total * 1000) / 1000).c_str());
     } else {
         std::printf("SUMMARY written=%zu failed=%zu skipped=%zu peak_memory=%.0fMiB time=%.2fs\n", nWritten, nFailed,
                     nSkipped, peak, total);
         for (auto &[k, v] : failed) std::printf("FAILED saver=%s frames=%s\n", k.c_str(), FrameRuns(v).c_str());
         if (interrupted)
-            for (auto &[k, v] : written) std::printf("WRITTEN saver=%s frames=%s\n", k.c_str(), FrameRuns(v).c_str());
+            for (auto &[k, v] : written) {
+                std::printf("WRITTEN saver=%s frames=%s\n", k.c_str(), FrameRuns(v).c_str());
+                for (const std::string &f : files[k]) std::printf("  %s\n", f.c_str());
+            }
     }
     std::fflush(stdout);
     if (interrupted) {
-        log.Message("ERROR", "interrupted; frames written before the stop are listed above");
+        log.Message("ERROR", "interrupted", "interrupted; frames written before the stop are listed above");
         return ExitInterrupted;
     }
     return nFailed ? ExitFailed : ExitOk;

@@ -125,6 +125,8 @@ void Operator::Fail(Request *req, const char *fmt, ...) {
 
 std::string Operator::FrameFileName(double, const RenderTask *) const { return {}; }
 
+std::string Operator::FrameFilePattern(double, const RenderTask *) const { return {}; }
+
 void ThreadedOperator::ProcessChunk(Request *, int) {}
 
 void ThreadedOperator::DoMultiProcess(Request *req, int count) {

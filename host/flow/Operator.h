@@ -120,6 +120,9 @@ public:
     /// For a tool that writes files: the file the frame at `time` of
     /// `task`'s render goes to; "" for other tools.
     virtual std::string FrameFileName(double time, const RenderTask *task) const;
+    /// The files FrameFileName chooses from at `time`, in display form
+    /// ("out.####.exr", or the one file's name); "" for other tools.
+    virtual std::string FrameFilePattern(double time, const RenderTask *task) const;
 
     /// True for a class whose processing is not built yet: documents keep
     /// its saved values as they are.

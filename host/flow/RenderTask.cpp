@@ -72,4 +72,14 @@ void RenderTask::KeepStateHash(const Output *out, double time, std::optional<uin
     stateHashes_[{out, time}] = hash;
 }
 
+void RenderTask::NoteFileWritten(const std::string &tool, const std::string &path) {
+    std::lock_guard<std::mutex> lock(logLock_);
+    written_.push_back({tool, path});
+}
+
+std::vector<RenderTask::WrittenFile> RenderTask::FilesWritten(size_t from) const {
+    std::lock_guard<std::mutex> lock(logLock_);
+    return {written_.begin() + static_cast<ptrdiff_t>(std::min(from, written_.size())), written_.end()};
+}
+
 } // namespace Orvane

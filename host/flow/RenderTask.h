@@ -11,6 +11,9 @@
 // line per distinct reason), which the command line prints as warnings: the
 // tool's rows have made the frame instead.
 //
+// Tools that write files note each file they completed (NoteFileWritten),
+// so the command line can list them even for a frame it abandoned.
+//
 // Tasks are found by their ID (Find) while they exist.
 //
 // State hashes: the flow does not change while a task renders, so the hash
@@ -18,9 +21,9 @@
 // once per task and kept, instead of once per request, which would cost a
 // chain its length at every tool.
 //
-// Thread safety: Abort, Execute, QueueExecute, NoteDeviceFailure, DeviceLog
-// and the state hashes may be used from any thread; the rest is set before
-// the render starts.
+// Thread safety: Abort, Execute, QueueExecute, NoteDeviceFailure, DeviceLog,
+// NoteFileWritten, FilesWritten and the state hashes may be used from any
+// thread; the rest is set before the render starts.
 #include <atomic>
 #include <cstdint>
 #include <functional>
@@ -69,6 +72,13 @@ public:
     /// a kept absent hash means "not cacheable".
     std::optional<std::optional<uint64_t>> FindStateHash(const Output *out, double time) const;
     void KeepStateHash(const Output *out, double time, std::optional<uint64_t> hash);
+    struct WrittenFile {
+        std::string tool, path;
+    };
+    /// Notes that `tool` wrote `path` completely.
+    void NoteFileWritten(const std::string &tool, const std::string &path);
+    /// The files noted, in order, from the `from`-th on.
+    std::vector<WrittenFile> FilesWritten(size_t from = 0) const;
 
     int proxyScale = 1;
     bool interactive = false;
@@ -79,6 +89,9 @@ public:
     /// First frame of the render's range (-2e9: not a range render). Savers
     /// number their files from it when asked to.
     double startTime = -2e9;
+    /// Last frame of the range (-2e9: not a range render). A render of one
+    /// frame (endTime == startTime) may write a file name without a number.
+    double endTime = -2e9;
 
 private:
     std::atomic<bool> abort_{false};
@@ -98,6 +111,7 @@ private:
     };
     mutable std::mutex hashLock_;
     std::unordered_map<HashKey, std::optional<uint64_t>, HashOfKey> stateHashes_;
+    std::vector<WrittenFile> written_;
 };
 
 } // namespace Orvane

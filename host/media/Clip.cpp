@@ -3,12 +3,14 @@
 #include <cerrno>
 #include <cstring>
 #include <filesystem>
+#include <sys/stat.h>
 #include <unistd.h>
 
 #include "host/core/Tags.h"
 #include "host/flow/DataTypes.h"
 #include "host/media/IOClass.h"
 #include "host/media/ImageFormatList.h"
+#include "host/media/OutputFile.h"
 
 namespace Orvane {
 
@@ -88,6 +90,19 @@ Ref<Image> Clip::GetFrameTagList(int64_t frame, const TagList &tags, std::string
     return image;
 }
 
+namespace {
+
+/// A temporary file that is removed unless it was renamed into place.
+struct TemporaryFile {
+    explicit TemporaryFile(std::string p) : path(std::move(p)) {}
+    ~TemporaryFile() {
+        if (!path.empty()) unlink(path.c_str());
+    }
+    std::string path;
+};
+
+} // namespace
+
 bool Clip::PutFrameTagList(int64_t frame, Image *image, const TagList &tags, std::string &error,
                            const std::function<void(ImageFormat &)> &configure) {
     if (!image) {
@@ -95,44 +110,53 @@ bool Clip::PutFrameTagList(int64_t frame, Image *image, const TagList &tags, std
         return false;
     }
     std::lock_guard<std::mutex> guard(lock_);
-    const std::filesystem::path target(FramePath(frame));
+    const std::string path = FramePath(frame);
+    auto fail = [&](const std::string &reason) {
+        error = path + ": " + reason;
+        return false;
+    };
+    std::string target;
+    if (!ResolveOutputFile(path, target, error)) return false;
     Ref<ImageFormat> format;
     if (!saveFormat_.IsNull()) {
         const Registry *row = ClassRegistry ? ClassRegistry->Find(saveFormat_) : nullptr;
         format = row ? NewImageFormat(row) : Ref<ImageFormat>();
-        if (!format) error = std::string(saveFormat_.Text()) + " is not a file format that can write";
+        if (!format) return fail(std::string(saveFormat_.Text()) + " is not a file format that can write");
     } else {
-        format = FindFormatForWriting(target.string(), error);
+        format = FindFormatForWriting(path, error);
     }
     if (!format) return false;
     if (configure) configure(*format);
+    const std::filesystem::path folder = std::filesystem::path(target).parent_path();
     std::error_code ec;
-    if (target.has_parent_path() && tags.GetBool(ClipFrameMakeFolders))
-        std::filesystem::create_directories(target.parent_path(), ec);
-    // The temporary name keeps the extension, so tools that look at it see the format.
-    const std::filesystem::path temp = target.parent_path() / ("." + target.stem().string() + ".part" +
-                                                               std::to_string(getpid()) + target.extension().string());
-    std::unique_ptr<FileIO> io = FileIO::Open(temp.string(), FileIO::Mode::Write, error);
-    if (!io) return false;
+    if (!folder.empty() && tags.GetBool(ClipFrameMakeFolders)) std::filesystem::create_directories(folder, ec);
+    if (!folder.empty() && !std::filesystem::is_directory(folder, ec)) return fail("the folder does not exist");
+
+    TemporaryFile temp(TemporaryFileFor(target));
+    std::unique_ptr<FileIO> io = FileIO::Open(temp.path, FileIO::Mode::CreateNew, error, path);
+    int err = io ? 0 : errno;
+    if (err == EEXIST) { // left by an earlier process with this number
+        unlink(temp.path.c_str());
+        io = FileIO::Open(temp.path, FileIO::Mode::CreateNew, error, path);
+        err = io ? 0 : errno;
+    }
+    if (!io) return fail(std::strerror(err));
     format->io = io.get();
-    bool ok = format->SaveHeader(io.get(), image) &&
-              format->SaveFrame(static_cast<unsigned>(std::max<int64_t>(frame, 0)), image);
+    const bool written = format->SaveHeader(io.get(), image) &&
+                         format->SaveFrame(static_cast<unsigned>(std::max<int64_t>(frame, 0)), image);
     format->Close();
     format->io = nullptr;
-    if (!ok) error = target.string() + ": " + (format->Error().empty() ? "cannot write the frame" : format->Error());
-    if (!io->Close() && ok) {
-        ok = false;
-        error = target.string() + ": " + std::strerror(errno ? errno : EIO);
-    }
-    if (ok) {
-        std::filesystem::rename(temp, target, ec);
-        if (ec) {
-            ok = false;
-            error = target.string() + ": " + ec.message();
-        }
-    }
-    if (!ok) std::filesystem::remove(temp, ec);
-    return ok;
+    if (!written) return fail(format->Error().empty() ? "cannot write the frame" : format->Error());
+    if (!io->Close()) return fail(std::strerror(errno ? errno : EIO));
+    // The target may have changed while the frame was written: check again.
+    std::string again;
+    if (!ResolveOutputFile(path, again, error)) return false;
+    if (again != target) return fail("the file was replaced by a link while the frame was written");
+    struct stat old {};
+    if (stat(target.c_str(), &old) == 0) chmod(temp.path.c_str(), old.st_mode & 07777); // keep its permissions
+    if (std::rename(temp.path.c_str(), target.c_str()) != 0) return fail(std::strerror(errno));
+    temp.path.clear();
+    return true;
 }
 
 OvID Clip::DataType() const { return CLSID_DataType_Clip; }

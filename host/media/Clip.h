@@ -10,10 +10,13 @@
 // Reading (GetFrameTagList) finds the format by extension and check (once
 // per file name) and loads the frame with the tags a format takes
 // (ClipFrameRegion, ClipFrameHeaderOnly, ClipFrameProxyScale, ClipFrameAbort).
-// Writing (PutFrameTagList) writes the frame to a temporary name in the
-// destination folder and renames it when complete, so no truncated frame
-// ever stands under a final name; missing folders are made when the tag
-// ClipFrameMakeFolders asks for it.
+// Writing (PutFrameTagList) replaces only a regular file (or writes through
+// a link to one; host/media/OutputFile.h). It writes the frame to a
+// temporary name beside the target and renames it when complete, so no
+// truncated frame ever stands under a final name; the temporary goes on any
+// failure, an exception included, and a replaced file's permissions are
+// kept. Missing folders are made when the tag ClipFrameMakeFolders asks for
+// it. Write errors name the frame's file once ("path: reason").
 //
 // Attributes (ClipStart, ClipTrimIn, ... in host/core/Tags.h) carry what a
 // tool decides about the clip: its place on the time line, trims, holds.

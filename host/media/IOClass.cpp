@@ -3,18 +3,31 @@
 #include <algorithm>
 #include <cerrno>
 #include <cstring>
+#include <fcntl.h>
+#include <unistd.h>
 
 namespace Orvane {
 
 IOClass::~IOClass() = default;
 
-std::unique_ptr<FileIO> FileIO::Open(const std::string &path, Mode mode, std::string &error) {
-    std::FILE *f = std::fopen(path.c_str(), mode == Mode::Read ? "rb" : "wb");
+std::unique_ptr<FileIO> FileIO::Open(const std::string &path, Mode mode, std::string &error, const std::string &name) {
+    std::FILE *f = nullptr;
+    if (mode == Mode::CreateNew) {
+        const int fd = open(path.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, 0666);
+        f = fd < 0 ? nullptr : fdopen(fd, "wb");
+        if (fd >= 0 && !f) {
+            const int err = errno;
+            close(fd);
+            errno = err;
+        }
+    } else {
+        f = std::fopen(path.c_str(), mode == Mode::Read ? "rb" : "wb");
+    }
     if (!f) {
         error = path + ": " + std::strerror(errno);
         return nullptr;
     }
-    return std::unique_ptr<FileIO>(new FileIO(f, path));
+    return std::unique_ptr<FileIO>(new FileIO(f, name.empty() ? path : name));
 }
 
 FileIO::~FileIO() { Close(); }

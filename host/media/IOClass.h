@@ -39,9 +39,14 @@ public:
 
 class ORVANE_API FileIO : public IOClass {
 public:
-    enum class Mode { Read, Write };
-    /// Opens a file; null with a reason in `error` when it cannot.
-    static std::unique_ptr<FileIO> Open(const std::string &path, Mode mode, std::string &error);
+    /// Write truncates or creates the file; CreateNew makes a new file and
+    /// fails when anything (a link included) already has the name.
+    enum class Mode { Read, Write, CreateNew };
+    /// Opens a file; null with a reason in `error` when it cannot. `name`,
+    /// when given, is the name the stream goes by (a temporary file is
+    /// known by the name it will become).
+    static std::unique_ptr<FileIO> Open(const std::string &path, Mode mode, std::string &error,
+                                        const std::string &name = {});
     ~FileIO() override;
 
     int64_t Read(void *buffer, int64_t bytes) override;
@@ -51,6 +56,7 @@ public:
     int64_t Size() override;
     /// Flushes and closes; false when data could not be written.
     bool Close();
+    /// The file's name as messages give it: the path opened, or the name given.
     const std::string &Path() const { return path_; }
 
 private:

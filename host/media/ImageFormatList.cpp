@@ -80,10 +80,15 @@ Ref<ImageFormat> FindFormatForReading(const std::string &path, IOClass *io, std:
     return nullptr;
 }
 
-Ref<ImageFormat> FindFormatForWriting(const std::string &path, std::string &error) {
+const Registry *FormatRowForWriting(const std::string &path) {
     for (const Registry *r : FormatsForExtension(path))
-        if (r->Tags().GetBool(RegFormatCanSave))
-            if (Ref<ImageFormat> f = NewImageFormat(r)) return f;
+        if (r->Tags().GetBool(RegFormatCanSave)) return r;
+    return nullptr;
+}
+
+Ref<ImageFormat> FindFormatForWriting(const std::string &path, std::string &error) {
+    if (const Registry *r = FormatRowForWriting(path))
+        if (Ref<ImageFormat> f = NewImageFormat(r)) return f;
     error = path + ": no format writes files with the extension '" + LowerExtension(path) + "'";
     return nullptr;
 }

@@ -24,6 +24,8 @@ ORVANE_API std::vector<const Registry *> FormatsForExtension(const std::string &
 ORVANE_API std::vector<const Registry *> FormatsThatSave();
 /// The first format whose check accepts the stream; null, with a reason, if none.
 ORVANE_API Ref<ImageFormat> FindFormatForReading(const std::string &path, IOClass *io, std::string &error);
+/// The row of the format that writes files with the extension of `path`; null for none.
+ORVANE_API const Registry *FormatRowForWriting(const std::string &path);
 /// The format that writes files with the extension of `path`.
 ORVANE_API Ref<ImageFormat> FindFormatForWriting(const std::string &path, std::string &error);
 /// The lock under which formats are prepared.

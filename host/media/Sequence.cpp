@@ -32,6 +32,33 @@ bool FindNumber(const std::string &name, size_t &digitsBegin, size_t &digitsEnd,
     return end - begin <= 18; // beyond that it is no frame number
 }
 
+/// The last frame-number marker in `name` ("####", "%04d", "%d", "$F4",
+/// "$F"): [begin, end) and its padding. False when there is none.
+bool FindMarker(const std::string &name, size_t &begin, size_t &end, int &padding) {
+    bool found = false;
+    auto take = [&](size_t b, size_t e, int p) {
+        begin = b, end = e, padding = p;
+        found = true;
+    };
+    for (size_t i = 0; i < name.size(); ++i) {
+        if (name[i] == '#') {
+            size_t j = i;
+            while (j < name.size() && name[j] == '#') ++j;
+            take(i, j, static_cast<int>(j - i));
+            i = j - 1;
+        } else if (name[i] == '%') {
+            size_t j = i + 1;
+            while (j < name.size() && IsDigit(name[j]) && j - i <= 2) ++j;
+            if (j < name.size() && name[j] == 'd')
+                take(i, j + 1, j > i + 1 ? std::max(1, std::stoi(name.substr(i + 1, j - i - 1))) : 1);
+        } else if (name.compare(i, 2, "$F") == 0) {
+            const bool digit = i + 2 < name.size() && IsDigit(name[i + 2]) && name[i + 2] != '0';
+            take(i, i + (digit ? 3 : 2), digit ? name[i + 2] - '0' : 1);
+        }
+    }
+    return found;
+}
+
 } // namespace
 
 SequenceName ParseSequenceName(const std::string &path) {
@@ -39,17 +66,15 @@ SequenceName ParseSequenceName(const std::string &path) {
     const size_t slash = path.find_last_of('/');
     seq.folder = slash == std::string::npos ? "" : path.substr(0, slash + 1);
     const std::string name = slash == std::string::npos ? path : path.substr(slash + 1);
-    // The display form "shot.####.exr" names the sequence with its padding.
-    if (const size_t hashEnd = name.find_last_of('#'); hashEnd != std::string::npos) {
-        const size_t hashBegin = name.find_last_not_of('#', hashEnd);
-        const size_t first = hashBegin == std::string::npos ? 0 : hashBegin + 1;
+    size_t begin, end, sign;
+    int padding;
+    if (FindMarker(name, begin, end, padding)) {
         seq.hasNumber = true;
-        seq.prefix = name.substr(0, first);
-        seq.suffix = name.substr(hashEnd + 1);
-        seq.padding = static_cast<int>(hashEnd + 1 - first);
+        seq.prefix = name.substr(0, begin);
+        seq.suffix = name.substr(end);
+        seq.padding = padding;
         return seq;
     }
-    size_t begin, end, sign;
     if (!FindNumber(name, begin, end, sign)) {
         seq.prefix = name;
         return seq;
@@ -60,6 +85,20 @@ SequenceName ParseSequenceName(const std::string &path) {
     seq.padding = static_cast<int>(end - begin);
     seq.number = std::stoll(name.substr(begin, end - begin));
     if (sign != std::string::npos) seq.number = -seq.number;
+    return seq;
+}
+
+SequenceName OutputSequenceName(const std::string &path, bool severalFrames) {
+    SequenceName seq = ParseSequenceName(path);
+    if (seq.hasNumber || !severalFrames) return seq;
+    const std::string name = seq.prefix;
+    const size_t ext = ExtensionStart(name);
+    const std::string stem = name.substr(0, ext);
+    const bool joined = !stem.empty() && (stem.back() == '.' || stem.back() == '_');
+    seq.prefix = stem + (joined ? "" : ".");
+    seq.suffix = name.substr(ext);
+    seq.padding = 4;
+    seq.hasNumber = true;
     return seq;
 }
 
@@ -76,15 +115,22 @@ std::string SequenceDisplayName(const SequenceName &seq) {
 }
 
 bool MatchesSequence(const SequenceName &seq, const std::string &fileName, int64_t &number) {
-    if (!seq.hasNumber) return false;
-    const SequenceName other = ParseSequenceName(fileName);
-    if (!other.hasNumber || other.prefix != seq.prefix || other.suffix != seq.suffix) return false;
-    const std::string digits = std::to_string(other.number < 0 ? -other.number : other.number);
-    const bool leadingZero = static_cast<int>(digits.size()) < other.padding;
+    const size_t fixed = seq.prefix.size() + seq.suffix.size();
+    if (!seq.hasNumber || fileName.size() <= fixed || fileName.compare(0, seq.prefix.size(), seq.prefix) != 0 ||
+        fileName.compare(fileName.size() - seq.suffix.size(), seq.suffix.size(), seq.suffix) != 0)
+        return false;
+    std::string digits = fileName.substr(seq.prefix.size(), fileName.size() - fixed);
+    // A minus sign follows '.', '_' or the start of the name (see ParseSequenceName).
+    const char before = seq.prefix.empty() ? '.' : seq.prefix.back();
+    const bool negative = digits[0] == '-' && (before == '.' || before == '_');
+    if (negative) digits.erase(0, 1);
+    if (digits.empty() || digits.size() > 18 || !std::all_of(digits.begin(), digits.end(), IsDigit)) return false;
+    const int padding = static_cast<int>(digits.size());
+    const bool leadingZero = digits.size() > 1 && digits[0] == '0';
     const bool fits =
-        seq.padding <= 1 ? !leadingZero : other.padding == seq.padding || (other.padding > seq.padding && !leadingZero);
+        seq.padding <= 1 ? !leadingZero : padding == seq.padding || (padding > seq.padding && !leadingZero);
     if (!fits) return false;
-    number = other.number;
+    number = negative ? -std::stoll(digits) : std::stoll(digits);
     return true;
 }
 

@@ -10,8 +10,16 @@
 // needs them). A sequence padded to p digits holds names whose digit run is
 // p long, or longer without a leading zero (frame 10000 of "####"); a
 // sequence with padding 1 holds numbers of any width without leading zeros.
-// A run of '#' in a name ("shot.####.exr") stands for the number, padded
-// to as many digits as there are signs; its number is 0.
+// A marker in the file name stands for the number instead: a run of '#'
+// ("shot.####.exr", padded to as many digits as there are signs), printf's
+// "%04d" ("%d" unpadded, "%4d" also zero-padded to 4) or "$F4" ("$F"
+// unpadded). The last marker of the name counts; markers in the folder are
+// plain text. A marked name's number is 0.
+//
+// Output names (OutputSequenceName): a name with neither marker nor number
+// written for several frames gets four digits before its extension
+// ("out.exr" -> out.0001.exr, "out_.exr" -> out_0001.exr); written for one
+// frame it stays as it is.
 //
 // Thread safety: pure functions; ScanSequence reads the file system.
 #include <cstdint>
@@ -33,6 +41,9 @@ struct SequenceName {
 
 /// Splits a path into folder, prefix, number, padding and suffix.
 ORVANE_API SequenceName ParseSequenceName(const std::string &path);
+/// The files a render writes for `path`: ParseSequenceName's, except that a
+/// name without number or marker becomes a sequence when `severalFrames`.
+ORVANE_API SequenceName OutputSequenceName(const std::string &path, bool severalFrames);
 /// The path of frame `number` of the sequence (its padding kept; wider
 /// numbers grow). For a name without a number, the name itself.
 ORVANE_API std::string SequencePath(const SequenceName &seq, int64_t number);

@@ -1,8 +1,6 @@
 #include "operators/media/Saver.h"
 
-#include <cerrno>
 #include <cmath>
-#include <cstring>
 #include <filesystem>
 
 #include "host/core/Tags.h"
@@ -15,6 +13,7 @@
 #include "host/image/Image.h"
 #include "host/image/NewImage.h"
 #include "host/media/ImageFormatList.h"
+#include "host/media/OutputFile.h"
 #include "operators/frame/IdChoices.h"
 #include "operators/frame/Registration.h"
 
@@ -180,11 +179,6 @@ std::string Saver::GetTitle() const {
     return c && !c->FileName().empty() ? Name() + ": " + c->FileName() : Name();
 }
 
-std::string Saver::LastWritten() const {
-    std::lock_guard<std::mutex> guard(lastLock_);
-    return lastWritten_;
-}
-
 void Saver::AddFormatInputs(OvID format) {
     const Registry *row = ClassRegistry ? ClassRegistry->Find(format) : nullptr;
     if (!row || !formatGroups_.insert(format).second) return;
@@ -195,22 +189,38 @@ void Saver::AddFormatInputs(OvID format) {
     SetCurrentGroup({});
 }
 
+OvID Saver::ExtensionFormat(const Parameter *clip) const {
+    auto *c = dynamic_cast<const Clip *>(clip);
+    const Registry *row = c ? FormatRowForWriting(c->FileName()) : nullptr;
+    return row ? row->ID() : OvID();
+}
+
 void Saver::NotifyChanged(Input *in, Parameter *param, double time, TagList *tags) {
     if (param && !filling_) {
         if (in == inClip_) {
-            // A known extension chooses the format that writes it.
-            auto *clip = dynamic_cast<Clip *>(param);
-            const auto rows = clip ? FormatsForExtension(clip->FileName()) : std::vector<const Registry *>{};
-            for (const Registry *row : rows)
-                if (row->Tags().GetBool(RegFormatCanSave)) {
-                    filling_ = true;
-                    inOutputFormat_->SetValue(MakeRef<IDValue>(row->ID()));
-                    filling_ = false;
-                    AddFormatInputs(row->ID());
-                    break;
-                }
+            // The format follows the extension unless one was chosen that differs from it.
+            const OvID named = ExtensionFormat(param);
+            auto *current = dynamic_cast<const IDValue *>(inOutputFormat_->Constant().Get());
+            if (formatChosen_ && current && named == current->value) formatChosen_ = false;
+            if (!formatChosen_ && !named.IsNull()) {
+                filling_ = true;
+                inOutputFormat_->SetValue(MakeRef<IDValue>(named));
+                filling_ = false;
+                AddFormatInputs(named);
+            }
         } else if (in == inOutputFormat_) {
-            AddFormatInputs(static_cast<IDValue *>(param)->value);
+            // The default's own object: the first notification, or a reset,
+            // after which the format follows the extension again.
+            OvID chosen = static_cast<IDValue *>(param)->value;
+            const OvID named = ExtensionFormat(inClip_->Constant().Get());
+            formatChosen_ = param != in->Default().Get() && chosen != named;
+            if (!formatChosen_ && !named.IsNull() && named != chosen) {
+                filling_ = true;
+                inOutputFormat_->SetValue(MakeRef<IDValue>(named));
+                filling_ = false;
+                chosen = named;
+            }
+            AddFormatInputs(chosen);
         } else if (in == inCreateDirNow_) {
             auto *clip = dynamic_cast<const Clip *>(inClip_->Constant().Get());
             if (clip && !clip->FileName().empty() && GetDoc()) {
@@ -232,6 +242,13 @@ void Saver::NotifyChanged(Input *in, Parameter *param, double time, TagList *tag
 void Saver::OnStartRender() {
     firstFrame_ = true;
     audioWarned_ = false;
+    // Temporary files of renders of this output that were killed.
+    auto *clip = dynamic_cast<const Clip *>(inClip_->Constant().Get());
+    if (clip && !clip->FileName().empty()) {
+        const std::string name = GetDoc() ? GetDoc()->MapPath(clip->FileName()) : clip->FileName();
+        RemoveStaleTemporaries(OutputSequenceName(name, false));
+        RemoveStaleTemporaries(OutputSequenceName(name, true));
+    }
     ThreadedOperator::OnStartRender();
 }
 
@@ -249,13 +266,22 @@ int64_t Saver::FileNumber(double time, double renderStart) const {
     return static_cast<int64_t>(time) + s;
 }
 
-std::string Saver::FrameFileName(double time, const RenderTask *task) const {
+SequenceName Saver::OutputName(double time, const RenderTask *task) const {
     Ref<Parameter> v = inClip_->ValueAt(time);
     auto *clip = dynamic_cast<const Clip *>(v.Get());
     if (!clip || clip->FileName().empty()) return {};
-    Clip mapped(GetDoc() ? GetDoc()->MapPath(clip->FileName()) : clip->FileName());
-    mapped.SetStartFrame(FileNumber(time, task ? task->startTime : -2e9));
-    return mapped.FramePath(0);
+    const bool severalFrames = task && task->endTime > task->startTime;
+    return OutputSequenceName(GetDoc() ? GetDoc()->MapPath(clip->FileName()) : clip->FileName(), severalFrames);
+}
+
+std::string Saver::FrameFileName(double time, const RenderTask *task) const {
+    const SequenceName name = OutputName(time, task);
+    return name.prefix.empty() && !name.hasNumber ? std::string()
+                                                  : SequencePath(name, FileNumber(time, task ? task->startTime : -2e9));
+}
+
+std::string Saver::FrameFilePattern(double time, const RenderTask *task) const {
+    return SequenceDisplayName(OutputName(time, task));
 }
 
 bool Saver::SavesThisRequest(Request *req, const Image &image) const {
@@ -292,7 +318,6 @@ bool Saver::SaveFrame(Request *req, Ref<Image> image) {
         return false;
     }
     const double t = req->Time();
-    const int frame = static_cast<int>(t);
     if (req->GetInputID(inExportMode_) != OvID("Normal")) {
         Fail(req, "%s: 2:3 pull-down export is not available yet in this version of Orvane", Name().c_str());
         return false;
@@ -321,13 +346,14 @@ bool Saver::SaveFrame(Request *req, Ref<Image> image) {
         audioWarned_ = true;
     }
 
-    // A clip of the one file this frame goes to.
-    Clip clip(FrameFileName(t, req->GetTask()));
+    // A clip of the file this frame goes to.
+    const SequenceName name = OutputName(t, req->GetTask());
+    Clip clip(SequenceDisplayName(name));
+    clip.SetStartFrame(FileNumber(t, req->GetTask() ? req->GetTask()->startTime : -2e9));
     const OvID format = req->GetInputID(inOutputFormat_);
     if (!format.IsNull()) clip.SetSaveFormat(format);
     const bool makeFolders = req->GetInputNumber(inCreateDir_) >= 0.5;
     std::string error;
-    errno = 0;
     const bool ok =
         clip.PutFrameTagList(0, image.Get(), {{ClipFrameMakeFolders, makeFolders}}, error, [&](ImageFormat &f) {
             SetCurrentGroup(format.Text());
@@ -336,17 +362,10 @@ bool Saver::SaveFrame(Request *req, Ref<Image> image) {
         });
     firstFrame_ = false;
     if (!ok) {
-        const int err = errno;
-        if (err)
-            GetDoc()->PrintF(req, ConsoleError, "%s failed to write to \"%s\" (\"%s\") frame %d: %s", Name().c_str(),
-                             clipValue->FileName().c_str(), clip.FramePath(0).c_str(), frame, std::strerror(err));
-        else
-            GetDoc()->PrintF(req, ConsoleError, "%s failed to write to \"%s\" (\"%s\") frame %d: %s", Name().c_str(),
-                             clipValue->FileName().c_str(), clip.FramePath(0).c_str(), frame, error.c_str());
+        GetDoc()->PrintF(req, ConsoleError, "%s failed to write %s", Name().c_str(), error.c_str());
         return false;
     }
-    std::lock_guard<std::mutex> guard(lastLock_);
-    lastWritten_ = clip.FramePath(0);
+    if (RenderTask *task = req->GetTask()) task->NoteFileWritten(Name(), clip.FramePath(0));
     return true;
 }
 

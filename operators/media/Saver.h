@@ -2,14 +2,21 @@
 // Saver: writes the image at its input to a file or numbered sequence while
 // a render runs, and passes the same image on at its output.
 //
-// File numbers: the frame at time t goes to the file numbered
+// File names (docs/OUTPUT.md): the frame at time t goes to the file numbered
 // trunc(t) + Frame Offset; with Saver-relative Numbering the render's first
-// frame (or the document's global start) counts as 0. The file name's own
-// number gives only the padding ("shot.0000.exr" writes shot.0012.exr).
+// frame (or the document's global start) counts as 0. A marker in the name
+// ("####", "%04d", "$F4") or the name's own number gives the place and the
+// padding ("shot.0000.exr" writes shot.0012.exr); a name with neither gets
+// a number when the render has several frames (host/media/Sequence.h).
 //
-// Writing goes through the host's Clip: to a temporary name, renamed when
-// complete, so a failed or interrupted frame never leaves a damaged file and
-// never replaces a good one.
+// Format: the Output Format follows the file's extension, unless it was set
+// to a format other than the extension's; then that format writes.
+//
+// Writing goes through the host's Clip: only over a regular file, to a
+// temporary name, renamed when complete, so a failed or interrupted frame
+// never leaves a damaged file and never replaces a good one. Each file
+// written is noted on the render task. A render's start removes the
+// temporaries killed renders of the same output left.
 //
 // Thread safety: as Operator; one request at a time per tool.
 #include <memory>
@@ -36,11 +43,14 @@ public:
     std::string GetTitle() const override;
 
     std::string FrameFileName(double time, const RenderTask *task) const override;
-    /// The file the last successful save wrote.
-    std::string LastWritten() const;
+    std::string FrameFilePattern(double time, const RenderTask *task) const override;
 
 private:
     int64_t FileNumber(double time, double renderStart) const;
+    /// The files the render of `task` writes at `time` (none without a file name).
+    SequenceName OutputName(double time, const RenderTask *task) const;
+    /// The format that writes files named like `clip`'s (null for none).
+    OvID ExtensionFormat(const Parameter *clip) const;
     bool SavesThisRequest(Request *req, const Image &image) const;
     bool SaveFrame(Request *req, Ref<Image> image);
     Ref<Image> GamutAndLegal(Request *req, Ref<Image> image);
@@ -55,9 +65,9 @@ private:
     std::unique_ptr<GamutInputs> gamut_;
     std::set<OvID> formatGroups_;
     bool filling_ = false;
+    /// The Output Format was set to one other than the file extension names.
+    bool formatChosen_ = false;
     bool firstFrame_ = true, audioWarned_ = false;
-    mutable std::mutex lastLock_;
-    std::string lastWritten_;
 };
 
 } // namespace Orvane

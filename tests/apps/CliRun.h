@@ -1,17 +1,13 @@
 #pragma once
-// Running the orvane program as a separate process, the way scripts and
-// render farms run it, for the command-line tests: its exit code and output,
-// quoting for the shell, and a temporary folder.
-#include <sys/wait.h>
-#include <unistd.h>
-
+// Running the orvane command line as a separate process, the way scripts
+// and render farms run it, for the command-line tests.
 #include <cstdlib>
 #include <filesystem>
 #include <fstream>
 #include <sstream>
 #include <string>
-
-#include "tests/support/TestSupport.h"
+#include <sys/wait.h>
+#include <unistd.h>
 
 namespace Orvane::clitest {
 
@@ -20,6 +16,7 @@ struct CliRun {
     std::string out, err;
 };
 
+/// `s` quoted for the shell.
 inline std::string Quote(const std::string &s) {
     std::string q = "'";
     for (char c : s) q += c == '\'' ? std::string("'\\''") : std::string(1, c);
@@ -33,6 +30,7 @@ inline std::string ReadFile(const std::filesystem::path &p) {
     return s.str();
 }
 
+/// A folder of its own, removed with everything in it.
 class TempDir {
 public:
     TempDir() {
@@ -55,7 +53,7 @@ private:
     static inline int counter_ = 0;
 };
 
-/// Runs `orvane ARGS` (ARGS as a shell would split them) with no input.
+/// Runs `orvane ARGS` (shell words) with no input; its exit code and output.
 inline CliRun Orvane(const std::string &args) {
     TempDir dir;
     const auto outFile = dir.Path() / "out", errFile = dir.Path() / "err";

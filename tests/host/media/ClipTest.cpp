@@ -134,27 +134,30 @@ TEST(Clip, HeaderOnlyAndRegionRequestsReachTheFormat) {
     EXPECT_EQ(part->DataWindow(), ImgRectI(2, 1, 5, 6));
 }
 
-TEST(Clip, AFailedWriteLeavesNoFileAndKeepsAnOldOne) {
+TEST(Clip, AFailedWriteKeepsTheOldFileAndASuccessfulOneItsPermissions) {
     RegisterOnce();
     TempDir dir;
     const auto target = dir.path / "keep.tfmt";
     std::ofstream(target) << "old contents";
+    std::filesystem::permissions(target, std::filesystem::perms(0640));
     Clip clip(target.string());
+    Ref<Image> img = Orvane::Test::PatternImage(4, 4);
     std::string error;
     TestFormat::failWrites = true;
-    EXPECT_FALSE(clip.PutFrameTagList(0, Orvane::Test::PatternImage(4, 4).Get(), {}, error));
+    EXPECT_FALSE(clip.PutFrameTagList(0, img.Get(), {}, error));
     TestFormat::failWrites = false;
-    EXPECT_NE(error.find("told to fail"), std::string::npos) << error;
+    EXPECT_EQ(error, target.string() + ": told to fail"); // the file once, never the temporary
     std::ifstream kept(target);
     std::string text((std::istreambuf_iterator<char>(kept)), std::istreambuf_iterator<char>());
     EXPECT_EQ(text, "old contents");
-    size_t files = 0;
-    for ([[maybe_unused]] const auto &e : std::filesystem::directory_iterator(dir.path)) ++files;
-    EXPECT_EQ(files, 1u) << "no temporary file is left behind";
-    // An unknown extension names no format.
-    Clip unknown((dir.path / "x.nosuchformat").string());
-    EXPECT_FALSE(unknown.PutFrameTagList(0, Orvane::Test::PatternImage(2, 2).Get(), {}, error));
+    EXPECT_EQ(std::distance(std::filesystem::directory_iterator(dir.path), {}), 1) << "no temporary file is left";
+    ASSERT_TRUE(clip.PutFrameTagList(0, img.Get(), {}, error)) << error;
+    EXPECT_EQ(std::filesystem::status(target).permissions(), std::filesystem::perms(0640));
+    // An unknown extension names no format; a missing folder is said plainly.
+    EXPECT_FALSE(Clip((dir.path / "x.nosuchformat").string()).PutFrameTagList(0, img.Get(), {}, error));
     EXPECT_NE(error.find("no format writes"), std::string::npos) << error;
+    EXPECT_FALSE(Clip((dir.path / "none/x.tfmt").string()).PutFrameTagList(0, img.Get(), {}, error));
+    EXPECT_EQ(error, (dir.path / "none/x.tfmt").string() + ": the folder does not exist");
 }
 
 TEST(Clip, AFileThatIsNotWhatItsNameSaysIsRefusedClearly) {

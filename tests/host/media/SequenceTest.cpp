@@ -67,6 +67,54 @@ TEST(SequenceName, FrameNamesKeepThePaddingAndGrowWhenNeeded) {
     }
 }
 
+TEST(SequenceName, MarkersGiveThePlaceAndPaddingOfTheNumber) {
+    const struct {
+        const char *path, *frame7, *frame1234;
+    } cases[] = {
+        {"o/shot.####.exr", "o/shot.0007.exr", "o/shot.1234.exr"},
+        {"shot.%04d.exr", "shot.0007.exr", "shot.1234.exr"},
+        {"shot.%d.exr", "shot.7.exr", "shot.1234.exr"},
+        {"shot.%4d.exr", "shot.0007.exr", "shot.1234.exr"}, // zeros, not spaces, in a file name
+        {"shot_$F4.exr", "shot_0007.exr", "shot_1234.exr"},
+        {"v2_%03d_final.tif", "v2_007_final.tif", "v2_1234_final.tif"},   // the marker wins over digits
+        {"take.%05d.$F2.png", "take.%05d.07.png", "take.%05d.1234.png"},  // the last marker counts
+        {"v#1/plate.%02d.dpx", "v#1/plate.07.dpx", "v#1/plate.1234.dpx"}, // markers in folders are text
+        {"odd.%123d.exr", "odd.%007d.exr", "odd.%1234d.exr"},             // no marker: the digits rule
+    };
+    for (const auto &c : cases) {
+        SCOPED_TRACE(c.path);
+        const SequenceName s = ParseSequenceName(c.path);
+        ASSERT_TRUE(s.hasNumber);
+        EXPECT_EQ(SequencePath(s, 7), c.frame7);
+        EXPECT_EQ(SequencePath(s, 1234), c.frame1234);
+        // The display form names the same files, and the files belong to it.
+        EXPECT_EQ(SequencePath(ParseSequenceName(SequenceDisplayName(s)), 7), c.frame7);
+        int64_t n = 0;
+        const std::string file = SequencePath(s, 1234);
+        EXPECT_TRUE(MatchesSequence(s, file.substr(file.rfind('/') + 1), n));
+        EXPECT_EQ(n, 1234);
+    }
+}
+
+TEST(SequenceName, OutputNamesNumberAPlainNameOnlyForSeveralFrames) {
+    const struct {
+        const char *path, *several, *one;
+    } cases[] = {
+        {"o/out.exr", "o/out.0012.exr", "o/out.exr"},
+        {"o/out_.exr", "o/out_0012.exr", "o/out_.exr"},
+        {"o/out.", "o/out.0012.", "o/out."},
+        {"o/out", "o/out.0012", "o/out"},
+        {"o/.hidden", "o/.hidden.0012", "o/.hidden"},
+        {"o/shot.0100.exr", "o/shot.0012.exr", "o/shot.0012.exr"}, // a number gives the padding
+        {"o/shot.$F.exr", "o/shot.12.exr", "o/shot.12.exr"},
+    };
+    for (const auto &c : cases) {
+        SCOPED_TRACE(c.path);
+        EXPECT_EQ(SequencePath(OutputSequenceName(c.path, true), 12), c.several);
+        EXPECT_EQ(SequencePath(OutputSequenceName(c.path, false), 12), c.one);
+    }
+}
+
 TEST(SequenceName, MatchingRespectsPaddingPrefixAndSuffix) {
     const SequenceName four = ParseSequenceName("shot.0001.exr");
     const SequenceName one = ParseSequenceName("shot.1.exr");

@@ -168,8 +168,7 @@ TEST_F(LoaderSaver, SaverNumbersFilesAndWritesOnlyInRenders) {
 
     // Without "Create Folder During Render" a missing folder fails the frame.
     EXPECT_FALSE(render(5));
-    EXPECT_EQ(LastConsole(), "Out failed to write to \"" + (dir / "out/shot.0000.raw") + "\" (\"" +
-                                 (dir / "out/shot.1005.raw") + "\") frame 5: No such file or directory");
+    EXPECT_EQ(LastConsole(), "Out failed to write " + (dir / "out/shot.1005.raw") + ": the folder does not exist");
     Set(saver, "CreateDir", ScriptVal(1));
     ASSERT_TRUE(render(5));
     EXPECT_EQ(saver->FrameFileName(5, &task), dir / "out/shot.1005.raw");
@@ -186,11 +185,43 @@ TEST_F(LoaderSaver, SaverNumbersFilesAndWritesOnlyInRenders) {
     EXPECT_TRUE(std::filesystem::exists(dir / "out/shot.1002.raw"));
     EXPECT_EQ(saver->FrameFileName(5, nullptr), dir / "out/shot.1005.raw"); // from the global start, 0
 
+    // Each file written is noted on the task, in order.
+    const auto noted = task.FilesWritten();
+    ASSERT_EQ(noted.size(), 2u);
+    EXPECT_EQ(noted[1].tool, "Out");
+    EXPECT_EQ(noted[1].path, dir / "out/shot.1002.raw");
+
     // An interactive look passes the image on and writes nothing.
     task.interactive = true;
     options.flags = ReqFlagInteractive;
     EXPECT_TRUE(render(6));
     EXPECT_FALSE(std::filesystem::exists(dir / "out/shot.1003.raw"));
+}
+
+TEST_F(LoaderSaver, TheOutputFormatFollowsTheExtensionUnlessAnotherWasChosen) {
+    // Documents set inputs in any order: the result must not depend on it.
+    const struct {
+        std::vector<std::pair<const char *, const char *>> steps;
+        const char *format;
+    } cases[] = {
+        {{{"Clip", "a.tga"}}, "TargaFormat"},
+        {{{"Clip", "a.tga"}, {"OutputFormat", "PNGFormat"}}, "PNGFormat"},
+        {{{"OutputFormat", "PNGFormat"}, {"Clip", "a.tga"}}, "PNGFormat"},
+        {{{"OutputFormat", "OpenEXRFormat"}, {"Clip", "a.png"}}, "OpenEXRFormat"}, // the default, set explicitly
+        {{{"OutputFormat", "TargaFormat"}, {"Clip", "a.tga"}, {"Clip", "b.png"}}, "PNGFormat"},
+        {{{"Clip", "a.tga"}, {"OutputFormat", "PNGFormat"}, {"Clip", "b.png"}, {"Clip", "c.tga"}}, "TargaFormat"},
+        {{{"Clip", "a.unknown"}}, "OpenEXRFormat"},
+    };
+    int n = 0;
+    for (const auto &c : cases) {
+        Operator *saver = doc.AddTool(OvID("Saver"), "Out" + std::to_string(++n));
+        for (const auto &[id, value] : c.steps) Set(saver, id, ScriptVal(value));
+        EXPECT_EQ(saver->FindInput("OutputFormat")->Constant()->ToScript().AsText(), c.format) << n;
+        // Resetting the choice hands the format back to the extension at once.
+        Set(saver, "Clip", ScriptVal("z.tga"));
+        saver->FindInput("OutputFormat")->ResetValue();
+        EXPECT_EQ(saver->FindInput("OutputFormat")->Constant()->ToScript().AsText(), "TargaFormat") << n;
+    }
 }
 
 TEST_F(LoaderSaver, SaverCutsToTheFrameAndCanSaveAlphaAsColor) {

@@ -1,0 +1,334 @@
+// orvane render as a separate process: the files it writes and refuses to
+// write, its report lines and JSON events, exit codes and signals.
+#include <gtest/gtest.h>
+
+#include <array>
+#include <csignal>
+#include <cstdio>
+#include <sys/stat.h>
+#include <vector>
+
+#include "tests/apps/CliRun.h"
+
+namespace Orvane::clitest {
+namespace {
+
+namespace fs = std::filesystem;
+
+/// A flow of a 16 x 8 gradient over frames 1-3 and Savers {name, file, more inputs}.
+std::string SaverFlow(const std::vector<std::array<std::string, 3>> &savers) {
+    std::string flow = "Orvane.Document { Version = 1, RenderRange = { 1, 3 }, Tools = {\n"
+                       "  Bg = Background { Inputs = { Type = \"Gradient\", Width = 16, Height = 8 } },\n";
+    for (const auto &[name, file, more] : savers)
+        flow += "  " + name + " = Saver { Inputs = { Clip = \"" + file + "\", Input = Bg.Output" + more + " } },\n";
+    return flow + "} }\n";
+}
+
+/// A flow whose Saver writes the gradient as numbered PNG files under `dir`/out.
+std::string GradientFlow(const fs::path &dir, const std::string &extra = {}) {
+    return SaverFlow({{"Out", (dir / "out/f.####.png").string(), ", CreateDir = 1" + extra}});
+}
+
+/// Names in `dir` that are temporary files of a write.
+std::vector<std::string> Temporaries(const fs::path &dir) {
+    std::vector<std::string> found;
+    std::error_code ec;
+    for (fs::directory_iterator it(dir, ec), end; !ec && it != end; it.increment(ec))
+        if (Contains(it->path().filename().string(), ".orvane-tmp-")) found.push_back(it->path().string());
+    return found;
+}
+
+TEST(CliRender, WritesEveryFrameAndReportsIt) {
+    TempDir dir;
+    const auto flow = dir.File("a.flow", GradientFlow(dir.Path()));
+    const CliRun r = Orvane("render " + Quote(flow.string()) + " --frames 3,1-2");
+    EXPECT_EQ(r.exitCode, 0) << r.err;
+    EXPECT_EQ(r.out.rfind("RENDER saver=Out files=" + (dir.Path() / "out/f.####.png").string() +
+                              " frames=1-3 format=PNGFormat\n",
+                          0),
+              0u)
+        << r.out;
+    EXPECT_TRUE(Contains(r.out, "FRAME 3 done 1/3 saver=Out file=" + (dir.Path() / "out/f.0003.png").string() + " "))
+        << r.out;
+    EXPECT_TRUE(Contains(r.out, "FRAME 2 done 3/3 saver=Out")) << r.out;
+    EXPECT_TRUE(Contains(r.out, "SUMMARY written=3 failed=0 skipped=0")) << r.out;
+    for (const char *f : {"f.0001.png", "f.0002.png", "f.0003.png"}) EXPECT_TRUE(fs::exists(dir.Path() / "out" / f));
+
+    // Existing files are left alone with --skip-existing; JSON lines say so.
+    const auto before = fs::last_write_time(dir.Path() / "out/f.0001.png");
+    const CliRun again = Orvane("render " + Quote(flow.string()) + " --skip-existing --log-format json");
+    EXPECT_EQ(again.exitCode, 0) << again.err;
+    EXPECT_TRUE(Contains(again.out, "{\"event\": \"render\", \"saver\": \"Out\", \"files\": \"" +
+                                        (dir.Path() / "out/f.####.png").string() +
+                                        "\", \"frames\": \"1-3\", \"format\": \"PNGFormat\"}\n"))
+        << again.out;
+    EXPECT_TRUE(Contains(again.out, "{\"event\": \"frame\", \"frame\": 1, \"status\": \"skipped\"")) << again.out;
+    EXPECT_TRUE(Contains(again.out, "\"event\": \"summary\", \"written\": 0, \"failed\": 0, \"skipped\": 3"))
+        << again.out;
+    EXPECT_EQ(fs::last_write_time(dir.Path() / "out/f.0001.png"), before);
+}
+
+TEST(CliRender, NamesWithoutANumberAreNumberedForSeveralFrames) {
+    TempDir dir;
+    const auto flow = dir.File("a.flow", SaverFlow({{"Out", (dir.Path() / "still.png").string(), ""}}));
+    const struct {
+        const char *frames, *files, *lastFile;
+    } cases[] = {
+        {"5", "still.png", "still.png"},
+        {"1-3", "still.####.png", "still.0003.png"},
+        {"1-2 --chunk 2/2", "still.####.png", "still.0002.png"}, // a chunk numbers as its whole range
+    };
+    for (const auto &c : cases) {
+        const CliRun r = Orvane("render " + Quote(flow.string()) + " --frames " + c.frames);
+        EXPECT_EQ(r.exitCode, 0) << r.err;
+        EXPECT_TRUE(Contains(r.out, "files=" + (dir.Path() / c.files).string() + " ")) << r.out;
+        EXPECT_TRUE(fs::exists(dir.Path() / c.lastFile)) << c.frames;
+    }
+}
+
+TEST(CliRender, RefusesBeforeTheFirstFrameToWriteOneFileTwice) {
+    TempDir dir;
+    const fs::path out = dir.Path() / "out";
+    fs::create_directories(out);
+    fs::create_directory_symlink(out, dir.Path() / "link");
+    const struct {
+        std::string a, b, args, message;
+    } cases[] = {
+        {(out / "f.####.png").string(), (out / "f.%04d.png").string(), "",
+         "ERROR: Savers A (frame 1) and B (frame 1) would both write " + (out / "f.0001.png").string() +
+             " (and 2 more like it); nothing was written\n"},
+        {(out / "one.png").string(), (out / "one.png").string(), " --frames 2",
+         "ERROR: Savers A (frame 2) and B (frame 2) would both write " + (out / "one.png").string() +
+             "; nothing was written\n"},
+        {(out / "f.####.png").string(), (dir.Path() / "link/f.$F4.png").string(), " --frames 7",
+         "ERROR: Savers A (frame 7) and B (frame 7) would both write " + (dir.Path() / "link/f.0007.png").string()},
+    };
+    for (const auto &c : cases) {
+        SCOPED_TRACE(c.b);
+        const auto flow = dir.File("a.flow", SaverFlow({{"A", c.a, ""}, {"B", c.b, ""}}));
+        const CliRun r = Orvane("render " + Quote(flow.string()) + c.args);
+        EXPECT_EQ(r.exitCode, 2);
+        EXPECT_TRUE(Contains(r.err, c.message)) << r.err;
+        EXPECT_FALSE(Contains(r.out, "FRAME")) << r.out;
+        EXPECT_TRUE(fs::is_empty(out)) << "nothing is written";
+    }
+    // In JSON the Savers, frames and the file are fields.
+    const auto flow = dir.File("a.flow", SaverFlow({{"A", cases[1].a, ""}, {"B", cases[1].b, ""}}));
+    const CliRun json = Orvane("render " + Quote(flow.string()) + " --frames 2 --log-format json");
+    EXPECT_EQ(json.exitCode, 2);
+    EXPECT_EQ(json.out.rfind("{\"event\": \"error\", \"code\": \"same_file\", \"saver\": \"A\", \"frame\": 2, "
+                             "\"file\": \"" +
+                                 cases[1].a +
+                                 "\", \"count\": 1, \"other_saver\": \"B\", \"other_frame\": 2, \"error\": ",
+                             0),
+              0u)
+        << json.out;
+}
+
+TEST(CliRender, ReplacesOnlyRegularFiles) {
+    TempDir dir;
+    const fs::path pipe = dir.Path() / "pipe.png";
+    ASSERT_EQ(mkfifo(pipe.c_str(), 0600), 0);
+    const auto flow = dir.File("a.flow", SaverFlow({{"Out", pipe.string(), ""}}));
+    const CliRun r = Orvane("render " + Quote(flow.string()) + " --frames 1");
+    EXPECT_EQ(r.exitCode, 2) << r.err;
+    EXPECT_TRUE(Contains(r.err, "ERROR: Saver Out, frame 1: " + pipe.string() +
+                                    ": a FIFO, not a regular file; refusing to write over it; nothing was written"))
+        << r.err;
+    EXPECT_TRUE(fs::is_fifo(pipe));
+}
+
+TEST(CliRender, EventsCarryTheirFactsInFields) {
+    TempDir dir;
+    // An Output Format that is not the extension's writes, with a warning naming both.
+    const auto flow = dir.File("a.flow", SaverFlow({{"Out", (dir.Path() / "f.####.png").string(),
+                                                     ", OutputFormat = \"TargaFormat\", SoundFilename = \"a.wav\""}}));
+    const CliRun text = Orvane("render " + Quote(flow.string()) + " --frames 1");
+    EXPECT_EQ(text.exitCode, 0) << text.err;
+    const std::string warning = "WARNING: saver=Out format=TargaFormat extension=.png: ";
+    EXPECT_TRUE(Contains(text.err, warning) && text.err.find(warning) == text.err.rfind(warning)) << text.err;
+    EXPECT_NE(ReadFile(dir.Path() / "f.0001.png").substr(1, 3), "PNG");
+    const CliRun json = Orvane("render " + Quote(flow.string()) + " --frames 1 --log-format json");
+    EXPECT_TRUE(Contains(json.out, "{\"event\": \"warning\", \"code\": \"format_mismatch\", \"saver\": \"Out\", "
+                                   "\"format\": \"TargaFormat\", \"extension\": \"png\", \"extension_format\": "
+                                   "\"PNGFormat\", \"warning\": "))
+        << json.out;
+    // A tool's console line says which tool it came from.
+    EXPECT_TRUE(Contains(json.out,
+                         "{\"event\": \"warning\", \"code\": \"tool\", \"frame\": 1, \"saver\": \"Out\", "
+                         "\"tool\": \"Out\", \"warning\": \"Warning: Out: No supported audio found in a.wav\"}"))
+        << json.out;
+    EXPECT_TRUE(json.err.empty()) << json.err;
+}
+
+TEST(CliRender, ChunksOfARangeWriteTheSameBytesAsTheWholeRange) {
+    TempDir whole, parts;
+    const std::string relative = ", SetSequenceStart = 1, SequenceStartFrame = 1001";
+    const auto flowWhole = whole.File("a.flow", GradientFlow(whole.Path(), relative));
+    const auto flowParts = parts.File("a.flow", GradientFlow(parts.Path(), relative));
+    ASSERT_EQ(Orvane("render " + Quote(flowWhole.string()) + " --frames 10-14").exitCode, 0);
+    for (const char *chunk : {"1/2", "2/2"})
+        ASSERT_EQ(Orvane("render " + Quote(flowParts.string()) + " --frames 10-14 --chunk " + chunk).exitCode, 0);
+    for (int n = 1001; n <= 1005; ++n) {
+        const std::string name = "out/f." + std::to_string(n) + ".png";
+        const std::string a = ReadFile(whole.Path() / name), b = ReadFile(parts.Path() / name);
+        EXPECT_FALSE(a.empty()) << name;
+        EXPECT_EQ(a, b) << name;
+    }
+}
+
+TEST(CliRender, TheOpenCLDeviceWritesTheSameFilesAsTheCPU) {
+    // Four-corner ramps graded by a gamma and a linear chain: kernels that do
+    // the rows' float arithmetic (the gamma rounds to 16 bits, hiding the
+    // powers' last bits) must give byte-identical files.
+    TempDir cpuDir, devDir;
+    auto flow = [](const fs::path &dir) {
+        return "Orvane.Document { Version = 1, RenderRange = { 1, 2 }, Tools = {\n"
+               "  Bg = Background { Inputs = { Type = \"FourCorner\", Width = 37, Height = 21, Depth = 4,\n"
+               "    TopRightRed = 1, BottomLeftGreen = 0.7, BottomRightBlue = 0.9, TopLeftAlpha = 0.8 } },\n"
+               "  BC = BrightnessContrast { Inputs = { Gain = 1.2, Saturation = 1.3, Input = Bg.Output } },\n"
+               "  BC2 = BrightnessContrast { Inputs = { Gamma = 0.8, Input = BC.Output } },\n"
+               "  Out = Saver { Inputs = { Clip = \"" +
+               (dir / "out/f.####.png").string() +
+               "\", CreateDir = 1, Input = BC2.Output,\n"
+               "    OutputFormat = \"PNGFormat\", [\"PNGFormat.Depth\"] = 2 } },\n} }\n";
+    };
+    const auto cpuFlow = cpuDir.File("a.flow", flow(cpuDir.Path())),
+               devFlow = devDir.File("a.flow", flow(devDir.Path()));
+    const CliRun cpu = Orvane("render " + Quote(cpuFlow.string()) + " --device cpu");
+    ASSERT_EQ(cpu.exitCode, 0) << cpu.err;
+    const CliRun dev = Orvane("render " + Quote(devFlow.string()) + " --device opencl");
+    if (dev.exitCode == 2 && Contains(dev.err, "--device opencl")) {
+        const char *required = std::getenv("ORVANE_REQUIRE_DEVICE");
+        if (required && std::string(required) == "opencl") FAIL() << dev.err;
+        GTEST_SKIP() << dev.err;
+    }
+    ASSERT_EQ(dev.exitCode, 0) << dev.err;
+    EXPECT_FALSE(Contains(dev.out + dev.err, "device:")) << "a device run failed: " << dev.out << dev.err;
+    for (const char *name : {"out/f.0001.png", "out/f.0002.png"}) {
+        const std::string a = ReadFile(cpuDir.Path() / name), b = ReadFile(devDir.Path() / name);
+        EXPECT_FALSE(a.empty()) << name;
+        EXPECT_EQ(a, b) << name;
+    }
+    const CliRun bad = Orvane("eval " + Quote(cpuFlow.string()) + " BC --device quantum");
+    EXPECT_EQ(bad.exitCode, 2);
+    EXPECT_TRUE(Contains(bad.err, "--device is cpu, auto, opencl or cuda")) << bad.err;
+}
+
+TEST(CliRender, BadRequestsAndFailedFramesHaveTheirExitCodes) {
+    TempDir dir;
+    const auto flow = dir.File("a.flow", GradientFlow(dir.Path()));
+    EXPECT_EQ(Orvane("render " + Quote(flow.string()) + " --frames 1-x").exitCode, 2);
+    EXPECT_EQ(Orvane("render " + Quote(flow.string()) + " --saver Bg").exitCode, 2);
+    EXPECT_EQ(Orvane("render " + Quote(flow.string()) + " --memory-limit lots").exitCode, 2);
+    EXPECT_EQ(Orvane("render " + Quote(flow.string()) + " --chunk 3/2").exitCode, 2);
+    const auto none = dir.File("none.flow", "Orvane.Document { Version = 1, Tools = { Bg = Background {} } }\n");
+    const CliRun noSaver = Orvane("render " + Quote(none.string()));
+    EXPECT_EQ(noSaver.exitCode, 2);
+    EXPECT_TRUE(Contains(noSaver.err, "has no Saver")) << noSaver.err;
+    const auto nameless = dir.File("nameless.flow", SaverFlow({{"Out", "", ""}}));
+    const CliRun noName = Orvane("render " + Quote(nameless.string()));
+    EXPECT_EQ(noName.exitCode, 2);
+    EXPECT_TRUE(Contains(noName.err, "ERROR: Saver Out has no file name to write to")) << noName.err;
+
+    // A Loader whose frame 2 is missing: that frame fails, the others are written.
+    ASSERT_EQ(Orvane("render " + Quote(flow.string()) + " --frames 1,3").exitCode, 0);
+    const auto chain = dir.File("b.flow", "Orvane.Document { Version = 1, RenderRange = { 1, 3 }, Tools = {\n"
+                                          "  In = Loader { Inputs = { Clip = \"" +
+                                              (dir.Path() / "out/f.0001.png").string() +
+                                              "\", GlobalIn = 1 } },\n"
+                                              "  Out = Saver { Inputs = { Clip = \"" +
+                                              (dir.Path() / "copy/c.####.tga").string() +
+                                              "\", CreateDir = 1, Input = In.Output } },\n} }\n");
+    const CliRun failed = Orvane("render " + Quote(chain.string()));
+    EXPECT_EQ(failed.exitCode, 3) << failed.out << failed.err;
+    EXPECT_TRUE(Contains(failed.err, "ERROR: frame 2 saver=Out: In failed to load file")) << failed.err;
+    EXPECT_TRUE(Contains(failed.out, "SUMMARY written=2 failed=1")) << failed.out;
+    EXPECT_TRUE(Contains(failed.out, "FAILED saver=Out frames=2")) << failed.out;
+    EXPECT_TRUE(fs::exists(dir.Path() / "copy/c.0003.tga"));
+    EXPECT_FALSE(fs::exists(dir.Path() / "copy/c.0002.tga"));
+    // In JSON the failed frame names the tool that failed and the file it was for.
+    const CliRun json = Orvane("render " + Quote(chain.string()) + " --frames 2 --log-format json");
+    EXPECT_TRUE(Contains(json.out, "{\"event\": \"error\", \"code\": \"frame_failed\", \"frame\": 2, \"saver\": "
+                                   "\"Out\", \"tool\": \"In\", \"file\": \"" +
+                                       (dir.Path() / "copy/c.0002.tga").string() +
+                                       "\", \"error\": \"frame 2 saver=Out: In failed to load file"))
+        << json.out;
+    // A folder that does not exist fails each frame, naming the file once.
+    const auto noFolder = dir.File("c.flow", SaverFlow({{"Out", (dir.Path() / "none/x.####.png").string(), ""}}));
+    const CliRun missing = Orvane("render " + Quote(noFolder.string()) + " --frames 4");
+    EXPECT_EQ(missing.exitCode, 3);
+    EXPECT_TRUE(Contains(missing.err, "ERROR: frame 4 saver=Out: Out failed to write " +
+                                          (dir.Path() / "none/x.0004.png").string() + ": the folder does not exist\n"))
+        << missing.err;
+}
+
+TEST(CliRender, TemporariesOfAKilledRenderGoAtTheNextRender) {
+    TempDir dir;
+    fs::create_directories(dir.Path() / "out");
+    // Left by a render on another machine, untouched for two hours, and one of another output.
+    const fs::path stale = dir.Path() / "out/.f.0002.png.orvane-tmp-farm7-4242";
+    const fs::path other = dir.Path() / "out/.g.0002.png.orvane-tmp-farm7-4242";
+    for (const fs::path &p : {stale, other}) {
+        std::ofstream(p) << "half a frame";
+        fs::last_write_time(p, fs::file_time_type::clock::now() - std::chrono::hours(2));
+    }
+    const auto flow = dir.File("a.flow", GradientFlow(dir.Path()));
+    ASSERT_EQ(Orvane("render " + Quote(flow.string()) + " --frames 1").exitCode, 0);
+    EXPECT_FALSE(fs::exists(stale));
+    EXPECT_TRUE(fs::exists(other));
+}
+
+TEST(CliRender, ASecondSignalStillListsTheFilesWritten) {
+    TempDir dir;
+    const auto flow = dir.File("a.flow", GradientFlow(dir.Path()));
+    ASSERT_EQ(Orvane("render " + Quote(flow.string()) + " --frames 1").exitCode, 0);
+    // Frame 2 of the Loader's clip never arrives: "Wait" holds the render there.
+    const auto chain = dir.File(
+        "b.flow", "Orvane.Document { Version = 1, Tools = {\n"
+                  "  In = Loader { Inputs = { Clip = \"" +
+                      (dir.Path() / "out/f.0001.png").string() +
+                      "\", GlobalIn = 1, GlobalOut = 3, ClipTimeEnd = 2, MissingFrames = 3 } },\n"
+                      "  Out = Saver { Inputs = { Clip = \"" +
+                      (dir.Path() / "copy/c.####.tga").string() + "\", CreateDir = 1, Input = In.Output } },\n} }\n");
+    const std::string file = (dir.Path() / "copy/c.0001.tga").string();
+    const struct {
+        int signal;
+        const char *format, *frameDone;
+        std::string listed;
+    } cases[] = {
+        {SIGINT, "text", "FRAME 1 done", "WRITTEN saver=Out frames=1\n  " + file + "\n"},
+        {SIGTERM, "json", "\"status\": \"done\"", "\"written_files\": {\"Out\": [\"" + file + "\"]}"},
+    };
+    for (const auto &c : cases) {
+        SCOPED_TRACE(c.format);
+        const auto outFile = dir.Path() / "render.out";
+        fs::remove(outFile);
+        const pid_t pid = fork();
+        ASSERT_GE(pid, 0);
+        if (pid == 0) {
+            std::freopen(outFile.c_str(), "w", stdout);
+            std::freopen((dir.Path() / "render.err").c_str(), "w", stderr);
+            const std::string exe = std::string(ORVANE_BINARY_DIR) + "/orvane";
+            execl(exe.c_str(), exe.c_str(), "render", chain.c_str(), "--frames", "1-3", "--log-format", c.format,
+                  static_cast<char *>(nullptr));
+            _exit(127);
+        }
+        // Wait until frame 1 is reported, then signal twice: the second abandons the waiting frame.
+        for (int i = 0; i < 200 && !Contains(ReadFile(outFile), c.frameDone); ++i) usleep(50000);
+        kill(pid, c.signal);
+        usleep(200000);
+        kill(pid, c.signal);
+        int status = 0;
+        waitpid(pid, &status, 0);
+        ASSERT_TRUE(WIFEXITED(status));
+        EXPECT_EQ(WEXITSTATUS(status), 130);
+        EXPECT_TRUE(Contains(ReadFile(outFile), c.listed)) << ReadFile(outFile);
+        EXPECT_TRUE(fs::exists(file));
+        EXPECT_FALSE(fs::exists(dir.Path() / "copy/c.0002.tga"));
+        EXPECT_TRUE(Temporaries(dir.Path() / "copy").empty());
+    }
+}
+
+} // namespace
+} // namespace Orvane::clitest

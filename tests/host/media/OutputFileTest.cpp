@@ -1,0 +1,107 @@
+// What a write may replace, and clearing the temporaries of writers that
+// are gone.
+#include <gtest/gtest.h>
+
+#include <filesystem>
+#include <fstream>
+#include <sys/stat.h>
+#include <sys/sysmacros.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include "host/media/OutputFile.h"
+
+namespace Orvane::outputfiletest {
+namespace {
+
+namespace fs = std::filesystem;
+
+struct TempDir {
+    fs::path path = fs::temp_directory_path() / ("orvane-out-" + std::to_string(getpid()) + "-" +
+                                                 ::testing::UnitTest::GetInstance()->current_test_info()->name());
+    TempDir() { fs::create_directories(path); }
+    ~TempDir() { fs::remove_all(path); }
+};
+
+/// A process number that no process has now: a child that has exited and been reaped.
+long DeadPid() {
+    const pid_t child = fork();
+    if (child == 0) _exit(0);
+    waitpid(child, nullptr, 0);
+    return child;
+}
+
+TEST(OutputFile, OnlyRegularFilesAreReplacedAndLinksToThemWrittenThrough) {
+    TempDir dir;
+    const fs::path d = dir.path;
+    std::ofstream(d / "plain.png") << "x";
+    fs::create_directory(d / "folder");
+    ASSERT_EQ(mkfifo((d / "fifo").c_str(), 0600), 0);
+    const bool device = mknod((d / "null").c_str(), S_IFCHR | 0600, makedev(1, 3)) == 0; // needs root
+    fs::create_symlink(d / "plain.png", d / "to-plain.png");
+    fs::create_symlink(d / "fifo", d / "to-fifo");
+    fs::create_symlink(d / "none", d / "dangling");
+    const struct {
+        const char *name;
+        bool ok;
+        const char *target, *why;
+    } cases[] = {
+        {"absent.png", true, "absent.png", ""},
+        {"plain.png", true, "plain.png", ""},
+        {"to-plain.png", true, "plain.png", ""},
+        {"folder", false, "", "a folder, not a regular file"},
+        {"fifo", false, "", "a FIFO, not a regular file"},
+        {"null", false, "", "a character device, not a regular file"},
+        {"to-fifo", false, "", "a symbolic link to a FIFO"},
+        {"dangling", false, "", "a symbolic link to nothing"},
+    };
+    for (const auto &c : cases) {
+        SCOPED_TRACE(c.name);
+        if (std::string(c.name) == "null" && !device) continue;
+        std::string target, error;
+        EXPECT_EQ(ResolveOutputFile((d / c.name).string(), target, error), c.ok);
+        if (c.ok) {
+            EXPECT_EQ(target, (d / c.target).string());
+        } else {
+            EXPECT_EQ(error.rfind((d / c.name).string() + ": " + c.why, 0), 0u) << error;
+        }
+    }
+}
+
+TEST(OutputFile, StaleTemporariesOfTheSameOutputAreRemoved) {
+    TempDir dir;
+    // This process's temporary for a file sits beside it and names the host and process.
+    const fs::path temp = TemporaryFileFor((dir.path / "f.0001.exr").string());
+    EXPECT_EQ(temp.parent_path(), dir.path);
+    TemporaryName mine;
+    ASSERT_TRUE(ParseTemporaryName(temp.filename().string(), mine));
+    EXPECT_EQ(mine.target, "f.0001.exr");
+    EXPECT_EQ(mine.pid, getpid());
+    const std::string dead = std::to_string(DeadPid()), alive = std::to_string(getpid());
+    const auto old = fs::file_time_type::clock::now() - std::chrono::hours(2);
+    const struct {
+        std::string name;
+        bool oldFile, removed;
+    } cases[] = {
+        {".f.0001.exr.orvane-tmp-" + mine.host + "-" + dead, false, true},   // its writer is gone
+        {".f.0002.exr.orvane-tmp-" + mine.host + "-" + alive, false, false}, // still writing
+        {".f.0003.exr.orvane-tmp-farm-7-" + dead, false, false},             // another host, fresh
+        {".f.0004.exr.orvane-tmp-farm-7-" + dead, true, true},               // another host, long untouched
+        {".g.0001.exr.orvane-tmp-" + mine.host + "-" + dead, false, false},  // another output
+        {".f.001.exr.orvane-tmp-" + mine.host + "-" + dead, false, false},   // not of the four-digit sequence
+        {"f.0001.exr", true, false},
+    };
+    for (const auto &c : cases) {
+        std::ofstream(dir.path / c.name) << "partial";
+        if (c.oldFile) fs::last_write_time(dir.path / c.name, old);
+    }
+    EXPECT_EQ(RemoveStaleTemporaries(ParseSequenceName((dir.path / "f.####.exr").string())), 2);
+    for (const auto &c : cases) EXPECT_EQ(fs::exists(dir.path / c.name), !c.removed) << c.name;
+
+    // A name without a number: the one file's temporaries.
+    std::ofstream(dir.path / (".still.png.orvane-tmp-" + mine.host + "-" + dead)) << "partial";
+    EXPECT_EQ(RemoveStaleTemporaries(ParseSequenceName((dir.path / "still.png").string())), 1);
+}
+
+} // namespace
+} // namespace Orvane::outputfiletest
