@@ -26,11 +26,8 @@ void Clip::SetFileName(std::string fileName) {
 
 bool Clip::Scan(std::string &error) {
     if (!sequence_.hasNumber) {
-        std::error_code ec;
-        if (!std::filesystem::is_regular_file(fileName_, ec)) {
-            error = fileName_ + ": no such file";
-            return false;
-        }
+        // The file must open for reading as a regular file; a FIFO or folder is said so.
+        if (!FileIO::Open(fileName_, FileIO::Mode::Read, error)) return false;
         length_ = 1;
         return true;
     }

@@ -3,18 +3,63 @@
 #include <algorithm>
 #include <cerrno>
 #include <cstring>
+#include <fcntl.h>
+#include <sys/stat.h>
+#include <unistd.h>
 
 namespace Orvane {
 
 IOClass::~IOClass() = default;
 
-std::unique_ptr<FileIO> FileIO::Open(const std::string &path, Mode mode, std::string &error) {
-    std::FILE *f = std::fopen(path.c_str(), mode == Mode::Read ? "rb" : "wb");
-    if (!f) {
+namespace {
+
+/// What a file that is not a regular file is, in words.
+const char *KindOfFile(mode_t mode) {
+    if (S_ISDIR(mode)) return "a directory";
+    if (S_ISFIFO(mode)) return "a FIFO";
+    if (S_ISCHR(mode)) return "a character device";
+    if (S_ISBLK(mode)) return "a block device";
+    if (S_ISSOCK(mode)) return "a socket";
+    return "not a plain file";
+}
+
+/// Opens `path` for reading without ever waiting: O_NONBLOCK keeps a FIFO
+/// without a writer from blocking the open, and anything but a regular file
+/// (FIFO, device, directory) is refused before a byte is read.
+std::FILE *OpenForReading(const std::string &path, std::string &error) {
+    const int fd = ::open(path.c_str(), O_RDONLY | O_NONBLOCK | O_CLOEXEC);
+    if (fd < 0) {
         error = path + ": " + std::strerror(errno);
         return nullptr;
     }
-    return std::unique_ptr<FileIO>(new FileIO(f, path));
+    struct stat st {};
+    const bool statted = fstat(fd, &st) == 0;
+    if (!statted || !S_ISREG(st.st_mode)) {
+        error = statted ? path + " is not a regular file (" + KindOfFile(st.st_mode) + ")"
+                        : path + ": " + std::strerror(errno);
+        ::close(fd);
+        return nullptr;
+    }
+    // Reads of a regular file block as usual.
+    const int flags = fcntl(fd, F_GETFL);
+    std::FILE *f = flags == -1 || fcntl(fd, F_SETFL, flags & ~O_NONBLOCK) == -1 ? nullptr : fdopen(fd, "rb");
+    if (!f) {
+        error = path + ": " + std::strerror(errno);
+        ::close(fd);
+    }
+    return f;
+}
+
+} // namespace
+
+std::unique_ptr<FileIO> FileIO::Open(const std::string &path, Mode mode, std::string &error) {
+    std::FILE *f = nullptr;
+    if (mode == Mode::Read) {
+        f = OpenForReading(path, error);
+    } else if (!(f = std::fopen(path.c_str(), "wb"))) {
+        error = path + ": " + std::strerror(errno);
+    }
+    return f ? std::unique_ptr<FileIO>(new FileIO(f, path)) : nullptr;
 }
 
 FileIO::~FileIO() { Close(); }

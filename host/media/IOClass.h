@@ -40,7 +40,10 @@ public:
 class ORVANE_API FileIO : public IOClass {
 public:
     enum class Mode { Read, Write };
-    /// Opens a file; null with a reason in `error` when it cannot.
+    /// Opens a file; null with a reason in `error` when it cannot. Reading
+    /// takes regular files only and never waits: a FIFO, device or folder is
+    /// refused at once ("x.exr is not a regular file (a FIFO)"). Every reader
+    /// of files (clips, `orvane info`) comes through here.
     static std::unique_ptr<FileIO> Open(const std::string &path, Mode mode, std::string &error);
     ~FileIO() override;
 
