@@ -246,6 +246,7 @@ int RunRender(const std::vector<std::string> &rawArgs) {
 
     for (const std::string &w : loaded.warnings) std::fprintf(stderr, "WARNING: %s\n", w.c_str());
     if (a.memoryLimit) {
+        SetPixelMemoryLimit(a.memoryLimit, "--memory-limit");
         doc.Cache().SetBudget(a.memoryLimit / 2);
         SetPixelPoolLimit(a.memoryLimit / 4);
     }

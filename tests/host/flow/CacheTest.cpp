@@ -1,6 +1,7 @@
 // The result cache: on its own (keys, regions, LRU eviction under a byte
-// budget, byte accounting) and through the engine (what is served again,
-// what renders anew, what is never kept, pass-through by reference).
+// budget, byte accounting, giving way to pixel memory) and through the engine
+// (what is served again, what renders anew, what is never kept, pass-through
+// by reference, a chain under a memory limit).
 #include <optional>
 #include <string>
 #include <vector>
@@ -15,6 +16,7 @@
 #include "host/flow/Request.h"
 #include "host/flow/ResultCache.h"
 #include "host/image/NewImage.h"
+#include "host/image/PixelMemory.h"
 #include "tests/support/TestSupport.h"
 
 namespace Orvane::cachetest {
@@ -169,6 +171,26 @@ TEST(ResultCache, ForgetDropsOneOutputsEntries) {
     EXPECT_FALSE(cache.Find(Key(o.a, 1), Region(0, 0, 1, 1)));
     EXPECT_EQ(cache.Find(Key(o.b, 0), Whole).Get(), y.Get());
     cache.Forget(&o.a); // nothing left of it
+    EXPECT_EQ(cache.Entries(), 1u);
+}
+
+TEST(ResultCache, ReclaimDropsOnlyResultsNobodyElseHoldsOldestFirst) {
+    Outputs o;
+    ResultCache cache;
+    Ref<Parameter> held = Img(16, 16);
+    cache.Store(Key(o.a, 0), Whole, held);
+    cache.Store(Key(o.a, 1), Whole, Img(16, 16));
+    cache.Store(Key(o.a, 2), Whole, Img(16, 16));
+    cache.Store(Key(o.a, 3), Whole, Img(16, 16));
+    const size_t one = held->SizeOf();
+    // Time 0 is the oldest but still held elsewhere: 1 and then 2 go.
+    EXPECT_EQ(cache.Reclaim(one + 1), 2 * one);
+    EXPECT_TRUE(cache.Find(Key(o.a, 0), Whole));
+    EXPECT_FALSE(cache.Find(Key(o.a, 1), Whole));
+    EXPECT_FALSE(cache.Find(Key(o.a, 2), Whole));
+    EXPECT_TRUE(cache.Find(Key(o.a, 3), Whole));
+    EXPECT_EQ(cache.Bytes(), 2 * one);
+    EXPECT_EQ(cache.Reclaim(10 * one), one); // all that is left to let go
     EXPECT_EQ(cache.Entries(), 1u);
 }
 
@@ -448,6 +470,44 @@ TEST(EngineCache, PassThroughHandsOnTheSameObject) {
     // Letting the results go leaves the image to its owners.
     doc->Cache().Clear();
     EXPECT_EQ(image->RefCount(), refsBefore);
+}
+
+TEST(EngineCache, AChainOfPerPixelToolsHoldsTwoFramesUnderTheMemoryLimit) {
+    constexpr int W = 512, H = 256; // 2 MiB a frame
+    const size_t frame = size_t(W) * H * sizeof(FltPixel);
+    Ref<OrvaneDoc> doc = MakeRef<OrvaneDoc>();
+    Ref<Image> image = ts::PatternImage(W, H);
+    ts::ImageSourceTool *src = ts::AddImageSource(*doc, "Src", image);
+    std::vector<GainTool *> gains;
+    Output *up = src->Out();
+    for (int i = 1; i <= 4; ++i) {
+        gains.push_back(dynamic_cast<GainTool *>(doc->AddTool(C().gain, "Gain" + std::to_string(i))));
+        ASSERT_TRUE(gains.back() && gains.back()->input->ConnectTo(up));
+        ts::SetNumber(gains.back(), "Gain", 0.5 * i);
+        up = gains.back()->output;
+    }
+    struct Restore {
+        ~Restore() { SetPixelMemoryLimit(0); }
+    } restore;
+    // Room for the source, two more frames and half of one: each tool's
+    // input and output. The cache lets the older results go.
+    const size_t limit = PixelMemoryInUse() + frame * 5 / 2;
+    SetPixelMemoryLimit(limit);
+    ResetPixelMemoryPeak();
+    Ref<Image> out = Eval(gains.back());
+    ASSERT_TRUE(out);
+    EXPECT_LE(PixelMemoryPeak(), limit);
+    EXPECT_FLOAT_EQ(out->GetFlt(7, 9).G, image->GetFlt(7, 9).G * 0.5f * 1.0f * 1.5f * 2.0f);
+    // Room for one more frame only: the second tool cannot have its output.
+    out.Reset();
+    doc->Cache().Clear();
+    SetPixelMemoryLimit(PixelMemoryInUse() - PixelPoolBytes() + frame * 3 / 2);
+    EXPECT_FALSE(Eval(gains.back()));
+    const auto lines = doc->ConsoleLines();
+    ASSERT_FALSE(lines.empty());
+    EXPECT_EQ(lines.back().text.rfind("Gain2: needs 2 MiB for a 512x256 RGBA float32 image; the memory limit is ", 0),
+              0u)
+        << lines.back().text;
 }
 
 } // namespace

@@ -1,19 +1,25 @@
-// Pixel memory: blocks come back zeroed, frame-sized blocks are reused, and
-// the pool keeps no more than its limit.
+// Pixel memory: blocks come back zeroed, frame-sized blocks are reused, the
+// pool keeps no more than its limit, and the process limit empties the pool,
+// asks the reclaimers and only then refuses, saying what was needed.
 #include <gtest/gtest.h>
 
 #include <cstring>
 #include <vector>
 
+#include "host/image/NewImage.h"
 #include "host/image/PixelMemory.h"
 
 namespace Orvane::pixelmemorytest {
 namespace {
 
-/// Restores the pool limit when a test ends.
+/// Restores the pool limit and the memory limit when a test ends.
 struct LimitGuard {
     size_t saved = PixelPoolLimit();
-    ~LimitGuard() { SetPixelPoolLimit(saved); }
+    ~LimitGuard() {
+        SetPixelPoolLimit(saved);
+        SetPixelMemoryLimit(0);
+        ClearPixelRefusal();
+    }
 };
 
 bool AllZero(const uint8_t *p, size_t n) {
@@ -86,10 +92,76 @@ TEST(PixelMemory, ThePoolKeepsNoMoreThanItsLimitOldestLeavingFirst) {
 namespace Orvane::pixelmemorytest {
 namespace {
 
-TEST(PixelMemory, ABlockBeyondHalfTheMachinesMemoryIsRefusedNotAttempted) {
+TEST(PixelMemory, ABlockBeyondTheLimitIsRefusedNotAttempted) {
     // A damaged header may claim any size; the allocation must fail cleanly.
+    LimitGuard guard;
     EXPECT_EQ(AllocPixels(size_t(1) << 62), nullptr);
+    EXPECT_EQ(TakePixelRefusal(), "needs 4294967296 GiB; the memory limit is " + FormatBytes(PixelMemoryLimit()));
     EXPECT_EQ(AllocPixels(static_cast<size_t>(-1)), nullptr);
+    EXPECT_TRUE(PixelMemoryRefused());
+}
+
+TEST(PixelMemory, TheLimitEmptiesThePoolThenAsksReclaimersThenRefuses) {
+    LimitGuard guard;
+    SetPixelPoolLimit(0);
+    SetPixelPoolLimit(size_t(64) << 20);
+    const size_t block = size_t(4) << 20, other = block - 4096;
+    const size_t base = PixelMemoryInUse(), limit = base + 3 * block;
+    SetPixelMemoryLimit(limit, "--memory-limit");
+    ResetPixelMemoryPeak();
+    uint8_t *a = AllocPixels(block), *b = AllocPixels(block), *c = AllocPixels(block);
+    ASSERT_TRUE(a && b && c);
+    FreePixels(c, block);
+    EXPECT_EQ(PixelPoolBytes(), block);
+    // The pooled block does not fit the new size: it leaves to make room.
+    uint8_t *d = AllocPixels(other);
+    ASSERT_NE(d, nullptr);
+    EXPECT_EQ(PixelPoolBytes(), 0u);
+    // Full: the reclaimer lets `b` go, which is then reused.
+    std::vector<size_t> asked;
+    const int id = AddPixelReclaimer([&](size_t wanted) -> size_t {
+        asked.push_back(wanted);
+        if (!b) return 0;
+        FreePixels(b, block);
+        b = nullptr;
+        return block;
+    });
+    uint8_t *e = AllocPixels(block);
+    ASSERT_NE(e, nullptr);
+    EXPECT_EQ(asked, std::vector<size_t>{other}); // what passes the limit
+    // Nothing more to let go: refused, saying what and the limit, once.
+    EXPECT_EQ(AllocPixels(block), nullptr);
+    EXPECT_EQ(asked.size(), 2u);
+    EXPECT_EQ(TakePixelRefusal(), "needs 4 MiB; --memory-limit is " + FormatBytes(limit) + ", " +
+                                      FormatBytes(PixelMemoryInUse()) + " of it in use");
+    EXPECT_EQ(TakePixelRefusal(), "");
+    EXPECT_LE(PixelMemoryPeak(), limit);
+    RemovePixelReclaimer(id);
+    for (auto [p, n] : {std::pair{a, block}, {d, other}, {e, block}}) FreePixels(p, n);
+    EXPECT_EQ(PixelMemoryInUse(), base + PixelPoolBytes());
+    EXPECT_EQ(AllocPixels(4 * block), nullptr); // more than the limit: no reclaimer is asked
+    EXPECT_EQ(asked.size(), 2u);
+}
+
+TEST(PixelMemory, ARefusedImageSaysItsSizeDepthAndTheLimit) {
+    LimitGuard guard;
+    SetPixelMemoryLimit(size_t(256) << 20, "--memory-limit");
+    const struct {
+        int w, h, depth;
+        const char *needs;
+    } cases[] = {{8192, 4320, DepthRGBAFlt32, "needs 540 MiB for a 8192x4320 RGBA float32 image"},
+                 {20000, 20000, DepthAInt8, "needs 382 MiB for a 20000x20000 mask int8 image"},
+                 {16384, 8192, DepthRGBAFlt16, "needs 1 GiB for a 16384x8192 RGBA float16 image"},
+                 {30000, 3000, DepthRGBAInt16, "needs 687 MiB for a 30000x3000 RGBA int16 image"}};
+    for (const auto &c : cases) {
+        Ref<Image> img = NewImageTagList({{ImgWidth, c.w}, {ImgHeight, c.h}, {ImgDepth, c.depth}});
+        ASSERT_TRUE(img);
+        EXPECT_FALSE(img->AllocScanLineData());
+        EXPECT_EQ(TakePixelRefusal(), std::string(c.needs) + "; --memory-limit is 256 MiB");
+    }
+    EXPECT_EQ(FormatBytes(1), "1 bytes");
+    EXPECT_EQ(FormatBytes(4097), "5 KiB");
+    EXPECT_EQ(FormatBytes((size_t(3) << 29) + 1), "1.6 GiB");
 }
 
 } // namespace
