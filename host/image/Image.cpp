@@ -32,10 +32,7 @@ void Image::GetCanvasColor(Pixel &p) const { p = FltToPixel(canvas_); }
 void Image::SetCanvasColor(const Pixel &p) { canvas_ = PixelToFlt(p); }
 
 void Image::NameRefusal() const {
-    const char *kind = IsMask() ? "mask" : "RGBA";
-    static const char *const types[] = {"int8", "int16", "float16", "float32"};
-    NamePixelRefusal("a " + std::to_string(dataWindow_.Width()) + "x" + std::to_string(dataWindow_.Height()) + " " +
-                     kind + " " + types[static_cast<int>(format_.type)] + " image");
+    NamePixelRefusal("a " + DescribeImage(dataWindow_.Width(), dataWindow_.Height(), depth_));
 }
 
 bool Image::AllocAuxPlane(AuxPlane &plane) {

@@ -12,6 +12,7 @@
 // A single-channel image holds its value in the alpha place: reading gives the
 // value in all four channels, writing stores alpha.
 #include <cstdint>
+#include <string>
 
 #include "host/core/Export.h"
 
@@ -53,5 +54,9 @@ struct PixelFormat {
 /// The format of a depth 1..8; depth 0 or out of range gives a zeroed record.
 ORVANE_API PixelFormat FormatOfDepth(int depth);
 inline bool IsValidDepth(int depth) { return depth >= 1 && depth <= 8; }
+/// A depth in words for messages: "RGBA float32", "mask int8"; "?" out of range.
+ORVANE_API const char *DepthName(int depth);
+/// An image size in words for messages: "8192x4320 RGBA float32 image".
+ORVANE_API std::string DescribeImage(int width, int height, int depth);
 
 } // namespace Orvane

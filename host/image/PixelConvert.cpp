@@ -23,6 +23,16 @@ PixelFormat FormatOfDepth(int depth) {
     return f;
 }
 
+const char *DepthName(int depth) {
+    static const char *const names[] = {"?",         "mask int8",  "mask int16",   "mask float16", "mask float32",
+                                        "RGBA int8", "RGBA int16", "RGBA float16", "RGBA float32"};
+    return names[IsValidDepth(depth) ? depth : 0];
+}
+
+std::string DescribeImage(int width, int height, int depth) {
+    return std::to_string(width) + "x" + std::to_string(height) + " " + DepthName(depth) + " image";
+}
+
 namespace {
 
 template <class T> T LoadAs(const uint8_t *p) {

@@ -12,6 +12,18 @@
 
 namespace Orvane {
 
+namespace {
+
+/// `why` without the path in it (a library may quote it): a message names
+/// the file once, in front.
+std::string WithoutPath(std::string why, const std::string &path) {
+    for (const std::string &form : {" \"" + path + "\"", "\"" + path + "\"", path})
+        for (size_t at; !form.empty() && (at = why.find(form)) != std::string::npos;) why.erase(at, form.size());
+    return why;
+}
+
+} // namespace
+
 Clip::Clip(std::string fileName) { SetFileName(std::move(fileName)); }
 
 void Clip::SetFileName(std::string fileName) {
@@ -66,6 +78,8 @@ Ref<Image> Clip::GetFrameTagList(int64_t frame, const TagList &tags, std::string
     format->abortFlag = tags.GetPtrAs<const std::atomic<bool>>(ClipFrameAbort);
     format->proxyScale = static_cast<int>(std::max<long long>(1, tags.GetLong(ClipFrameProxyScale, 1)));
     format->metadata = ScriptVal::Table();
+    format->dataWindow.reset();
+    format->auxChannels = 0;
     if (prepare) prepare(*format);
     Ref<Image> image;
     const bool ok = format->LoadHeader(io.get()) &&
@@ -73,7 +87,8 @@ Ref<Image> Clip::GetFrameTagList(int64_t frame, const TagList &tags, std::string
     format->Close();
     format->io = nullptr;
     if (!ok || !image) {
-        error = path + ": " + (format->Error().empty() ? std::string("cannot read the frame") : format->Error());
+        error = path + ": " +
+                (format->Error().empty() ? std::string("cannot read the frame") : WithoutPath(format->Error(), path));
         return nullptr;
     }
     readFormat_ = format;

@@ -1,10 +1,13 @@
 #include "host/media/ImageFormat.h"
 
+#include <algorithm>
+
 #include "host/core/Tags.h"
 #include "host/flow/DataTypes.h"
 #include "host/flow/Operator.h"
 #include "host/flow/Request.h"
 #include "host/image/NewImage.h"
+#include "host/image/PixelMemory.h"
 
 namespace Orvane {
 
@@ -48,7 +51,18 @@ bool ImageFormat::LoadHeader(IOClass *) { return Fail("this format cannot read")
 bool ImageFormat::LoadFrameTagList(unsigned, Ref<Image> &image, const TagList &tags) {
     if (width < 1 || height < 1 || !IsValidDepth(depth)) return Fail("no header");
     ImgRectI window(0, 0, width, height);
-    if (const auto *region = tags.GetPtrAs<const ImageDomain>(ClipFrameRegion)) window &= region->rect;
+    const auto *region = tags.GetPtrAs<const ImageDomain>(ClipFrameRegion);
+    if (region) window &= region->rect;
+    if (!tags.GetBool(ClipFrameHeaderOnly)) {
+        // What the pixels will take, checked before anything is allocated.
+        ImgRectI held = dataWindow.value_or(ImgRectI(0, 0, width, height));
+        if (region) held &= region->rect;
+        const uint64_t pixelBytes = FormatOfDepth(depth).BytesPerPixel() + sizeof(float) * std::max(auxChannels, 0);
+        const uint64_t bytes = held.IsNull() ? 0 : uint64_t(held.Width()) * uint64_t(held.Height()) * pixelBytes;
+        const std::string why = PixelLimitRefusal(bytes, "the " + DescribeImage(held.Width(), held.Height(), depth) +
+                                                             " its header describes");
+        if (!why.empty()) return Fail(why);
+    }
     image = NewImageTagList({{ImgWidth, width},
                              {ImgHeight, height},
                              {ImgDepth, depth},

@@ -1,14 +1,18 @@
 // Loader and Saver in a document: which file a time reads, the missing-frame
-// rules and their messages, the import options with values computed here,
-// and where the Saver writes (numbering, folders, failures).
+// rules and their messages, headers that ask for more memory than the limit,
+// the import options with values computed here, and where the Saver writes
+// (numbering, folders, failures).
 #include <gtest/gtest.h>
 
 #include <cmath>
+#include <cstring>
 #include <filesystem>
+#include <fstream>
 
 #include "host/flow/Engine.h"
 #include "host/flow/InputValue.h"
 #include "host/flow/RenderTask.h"
+#include "host/image/PixelMemory.h"
 #include "host/media/Clip.h"
 #include "tests/operators/media/FormatTestSupport.h"
 
@@ -98,8 +102,9 @@ TEST_F(LoaderSaver, MissingFramesFailHoldOrFill) {
     std::filesystem::remove(dir / "plate.1002.raw");
     EXPECT_EQ(FileAt(0), 1); // records the clip's frame size
     EXPECT_EQ(FileAt(1), -1);
-    EXPECT_EQ(LastConsole(), "Plate failed to load file \"" + (dir / "plate.1002.raw") + "\" (clip \"" +
-                                 (dir / "plate.1001.raw") + "\" at frame 1) : No such file or directory");
+    // The file once, and the frame by the file's own number.
+    EXPECT_EQ(LastConsole(), "Plate failed to load file \"" + (dir / "plate.1002.raw") +
+                                 "\" (frame 1002) : No such file or directory");
     Set(loader, "MissingFrames", ScriptVal(1));
     EXPECT_EQ(FileAt(1), 1);
     EXPECT_EQ(FileAt(2), 3);
@@ -114,6 +119,66 @@ TEST_F(LoaderSaver, MissingFramesFailHoldOrFill) {
     EXPECT_EQ(p.R, 0.25f);
     EXPECT_EQ(p.G, 0.0f);
     EXPECT_EQ(p.A, 1.0f);
+}
+
+TEST_F(LoaderSaver, AColourForAMissingFrameTakesTheSizeOfTheClipsFrames) {
+    // Nothing read yet: the size comes from the header of a frame that exists, not the document.
+    std::filesystem::remove(dir / "plate.1002.raw");
+    Set(loader, "MissingFrames", ScriptVal(2));
+    ASSERT_NE(doc.GetFrameFormat().width, W);
+    Ref<Image> filled = Orvane::Test::EvalImage(loader, 1);
+    ASSERT_TRUE(filled);
+    EXPECT_EQ(filled->Width(), W);
+    EXPECT_EQ(filled->Height(), H);
+}
+
+/// An OpenEXR file made by hand: four float channels, no compression, a data
+/// window of `w` x `h` pixels in a frame 100 wide, and no pixels at all.
+Bytes ExrHeaderOnly(int w, int h) {
+    Bytes b{0x76, 0x2f, 0x31, 0x01, 2, 0, 0, 0};
+    auto add = [&b](std::initializer_list<int32_t> words) {
+        for (int32_t v : words)
+            for (int i = 0; i < 4; ++i) b.push_back(static_cast<uint8_t>(uint32_t(v) >> (8 * i)));
+    };
+    auto attribute = [&](const char *name, const char *type, int32_t size) {
+        b.insert(b.end(), name, name + std::strlen(name) + 1);
+        b.insert(b.end(), type, type + std::strlen(type) + 1);
+        add({size});
+    };
+    attribute("channels", "chlist", 4 * 18 + 1);
+    for (char c : {'A', 'B', 'G', 'R'}) {
+        b.insert(b.end(), {uint8_t(c), 0});
+        add({2, 0, 1, 1}); // float; linear flag and reserved bytes; sampling 1, 1
+    }
+    b.push_back(0);
+    attribute("compression", "compression", 1), b.push_back(0);
+    attribute("dataWindow", "box2i", 16), add({0, 0, w - 1, h - 1});
+    attribute("displayWindow", "box2i", 16), add({0, 0, 99, h - 1});
+    attribute("lineOrder", "lineOrder", 1), b.push_back(0);
+    attribute("pixelAspectRatio", "float", 4), add({0x3f800000});
+    attribute("screenWindowCenter", "v2f", 8), add({0, 0});
+    attribute("screenWindowWidth", "float", 4), add({0x3f800000});
+    b.push_back(0);
+    b.resize(b.size() + 8 * size_t(h), 0); // the line offsets, pointing nowhere
+    return b;
+}
+
+TEST_F(LoaderSaver, AHeaderAskingForMoreThanTheMemoryLimitIsRefusedBeforeAllocating) {
+    const Bytes exr = ExrHeaderOnly(525341, 59);
+    ASSERT_LT(exr.size(), 1000u);
+    std::ofstream(dir / "huge.exr", std::ios::binary).write(reinterpret_cast<const char *>(exr.data()), exr.size());
+    Set(loader, "Clip", ScriptVal(dir / "huge.exr"));
+    struct Restore {
+        ~Restore() { SetPixelMemoryLimit(0); }
+    } restore;
+    SetPixelMemoryLimit(size_t(256) << 20, "--memory-limit");
+    ResetPixelMemoryPeak();
+    const size_t before = PixelMemoryInUse();
+    EXPECT_FALSE(Orvane::Test::EvalImage(loader, 0));
+    EXPECT_LT(PixelMemoryPeak() - before, size_t(1) << 20);
+    EXPECT_EQ(LastConsole(), "Plate failed to load file \"" + (dir / "huge.exr") +
+                                 "\" : needs 473 MiB for the 525341x59 RGBA float32 image its header describes; "
+                                 "--memory-limit is 256 MiB");
 }
 
 TEST_F(LoaderSaver, AlphaOptionsAndDepth) {
