@@ -51,6 +51,13 @@ PixelPool &ThePixelPool() {
     return *pool;
 }
 
+/// Runs `f` on the pool under its lock.
+template <class F> auto Locked(F f) {
+    PixelPool &p = ThePixelPool();
+    std::lock_guard<std::mutex> guard(p.lock);
+    return f(p);
+}
+
 /// The calling thread's last refusal.
 struct Refusal {
     bool pending = false;
@@ -177,54 +184,42 @@ void FreePixels(uint8_t *block, size_t bytes) {
 }
 
 void SetPixelPoolLimit(size_t bytes) {
-    PixelPool &p = ThePixelPool();
-    std::lock_guard<std::mutex> guard(p.lock);
-    p.poolLimit = bytes;
-    ReleaseLocked(p, bytes);
+    Locked([bytes](PixelPool &p) {
+        p.poolLimit = bytes;
+        ReleaseLocked(p, bytes);
+    });
 }
 
 size_t PixelPoolLimit() {
-    PixelPool &p = ThePixelPool();
-    std::lock_guard<std::mutex> guard(p.lock);
-    return p.poolLimit;
+    return Locked([](PixelPool &p) { return p.poolLimit; });
 }
 
 size_t PixelPoolBytes() {
-    PixelPool &p = ThePixelPool();
-    std::lock_guard<std::mutex> guard(p.lock);
-    return p.bytes;
+    return Locked([](PixelPool &p) { return p.bytes; });
 }
 
 void SetPixelMemoryLimit(size_t bytes, const char *source) {
-    PixelPool &p = ThePixelPool();
-    std::lock_guard<std::mutex> guard(p.lock);
-    p.limit = bytes ? bytes : DefaultLimit();
-    p.source = bytes && source ? source : "";
-    ReleaseLocked(p, p.limit - std::min(p.limit, p.live));
+    Locked([&](PixelPool &p) {
+        p.limit = bytes ? bytes : DefaultLimit();
+        p.source = bytes && source ? source : "";
+        ReleaseLocked(p, p.limit - std::min(p.limit, p.live));
+    });
 }
 
 size_t PixelMemoryLimit() {
-    PixelPool &p = ThePixelPool();
-    std::lock_guard<std::mutex> guard(p.lock);
-    return p.limit;
+    return Locked([](PixelPool &p) { return p.limit; });
 }
 
 size_t PixelMemoryInUse() {
-    PixelPool &p = ThePixelPool();
-    std::lock_guard<std::mutex> guard(p.lock);
-    return p.live + p.bytes;
+    return Locked([](PixelPool &p) { return p.live + p.bytes; });
 }
 
 size_t PixelMemoryPeak() {
-    PixelPool &p = ThePixelPool();
-    std::lock_guard<std::mutex> guard(p.lock);
-    return p.peak;
+    return Locked([](PixelPool &p) { return p.peak; });
 }
 
 void ResetPixelMemoryPeak() {
-    PixelPool &p = ThePixelPool();
-    std::lock_guard<std::mutex> guard(p.lock);
-    p.peak = p.live + p.bytes;
+    Locked([](PixelPool &p) { p.peak = p.live + p.bytes; });
 }
 
 int AddPixelReclaimer(PixelReclaimer reclaimer) {
@@ -258,10 +253,10 @@ bool PixelMemoryRefused() { return t_refusal.pending; }
 void ClearPixelRefusal() { t_refusal = {}; }
 
 std::string PixelLimitRefusal(uint64_t bytes, const std::string &what) {
-    PixelPool &p = ThePixelPool();
-    std::lock_guard<std::mutex> guard(p.lock);
-    if (bytes <= p.limit) return {};
-    return "needs " + FormatBytes(bytes) + " for " + what + "; " + LimitTextLocked(p);
+    return Locked([&](PixelPool &p) {
+        return bytes <= p.limit ? std::string()
+                                : "needs " + FormatBytes(bytes) + " for " + what + "; " + LimitTextLocked(p);
+    });
 }
 
 std::string FormatBytes(uint64_t bytes) {
