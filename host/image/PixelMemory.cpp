@@ -140,16 +140,16 @@ uint8_t *AllocPixels(size_t bytes) {
             } else if (bytes <= room) {
                 ReleaseLocked(p, room - bytes); // the pool gives way first
             }
-            if (reused || p.live + p.bytes + bytes <= p.limit) {
+            const size_t held = p.live + p.bytes;
+            if (reused || (held <= p.limit && bytes <= p.limit - held)) { // no sum that could wrap
                 CountLocked(p, bytes);
             } else if (reclaimed || bytes > p.limit) {
                 // What else is held matters only when the block alone would fit.
-                const size_t inUse = p.live + p.bytes;
                 t_refusal = {true, bytes, {}, LimitTextLocked(p)};
-                if (inUse && bytes <= p.limit) t_refusal.limit += ", " + FormatBytes(inUse) + " of it in use";
+                if (held && bytes <= p.limit) t_refusal.limit += ", " + FormatBytes(held) + " of it in use";
                 return nullptr;
             } else {
-                over = p.live + p.bytes + bytes - p.limit;
+                over = held + bytes - p.limit;
             }
         }
         if (over) {

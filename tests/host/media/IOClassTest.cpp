@@ -182,21 +182,17 @@ TEST(FileIO, ReadingRefusesWhatIsNotARegularFileWithoutWaiting) {
     const std::string fifo = tmp.path + ".fifo", folder = tmp.path + ".dir";
     ASSERT_EQ(mkfifo(fifo.c_str(), 0600), 0);
     ASSERT_EQ(mkdir(folder.c_str(), 0700), 0);
-    const struct {
-        std::string path;
-        const char *kind;
-    } cases[] = {{fifo, "a FIFO"}, {folder, "a directory"}, {"/dev/null", "a character device"}};
-    for (const auto &c : cases) {
-        SCOPED_TRACE(c.path);
-        auto opening = std::async(std::launch::async, [&c] {
+    for (auto [path, kind] :
+         {std::pair{fifo, "a FIFO"}, {folder, "a directory"}, {"/dev/null", "a character device"}}) {
+        auto opening = std::async(std::launch::async, [path = path] {
             std::string error;
-            return FileIO::Open(c.path, FileIO::Mode::Read, error) ? std::string("opened") : error;
+            return FileIO::Open(path, FileIO::Mode::Read, error) ? std::string("opened") : error;
         });
         if (opening.wait_for(std::chrono::seconds(5)) != std::future_status::ready) {
-            ADD_FAILURE() << "the open waits";
-            close(open(c.path.c_str(), O_WRONLY | O_NONBLOCK)); // a writer lets a blocked FIFO open end
+            ADD_FAILURE() << path << ": the open waits";
+            close(open(path.c_str(), O_WRONLY | O_NONBLOCK)); // a writer ends a FIFO's blocked open
         }
-        EXPECT_EQ(opening.get(), c.path + " is not a regular file (" + c.kind + ")");
+        EXPECT_EQ(opening.get(), path + " is not a regular file (" + kind + ")");
     }
     std::remove(fifo.c_str());
     rmdir(folder.c_str());
