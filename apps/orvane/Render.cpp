@@ -399,6 +399,7 @@ int RunRender(const std::vector<std::string> &rawArgs) {
 
     Log log(a.json, frames.size());
     if (a.memoryLimit) {
+        SetPixelMemoryLimit(a.memoryLimit, "--memory-limit");
         doc.Cache().SetBudget(a.memoryLimit / 2);
         SetPixelPoolLimit(a.memoryLimit / 4);
     }

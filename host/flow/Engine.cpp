@@ -16,6 +16,7 @@
 #include "host/flow/Request.h"
 #include "host/flow/ResultCache.h"
 #include "host/image/NewImage.h"
+#include "host/image/PixelMemory.h"
 #include "host/image/TransformMatrix.h"
 
 namespace Orvane {
@@ -111,6 +112,26 @@ Ref<Parameter> PixelsOf(Ref<Parameter> value, const std::optional<ImageDomain> &
     TagList tags{{WorkRequest, static_cast<const void *>(req)}};
     if (roi) tags.Set({ImgDataWindow, &roi->rect});
     return tm->ApplyTransformTagList(tags);
+}
+
+/// The console line of a tool that ran out of memory: what it needed and the
+/// limit when pixel memory refused it.
+void ReportOutOfMemory(const Operator *op, double time) {
+    OrvaneDoc *doc = op->GetDoc();
+    const std::string why = TakePixelRefusal();
+    if (!doc) return;
+    if (why.empty())
+        doc->PrintF(ConsoleError, "%s: out of memory (time = %f)\n", op->Name().c_str(), time);
+    else
+        doc->PrintF(ConsoleError, "%s: %s\n", op->Name().c_str(), why.c_str());
+}
+
+/// A value that should carry pixels has them: an image without rows after a
+/// refused allocation is a tool that did not notice its failure.
+bool HasPixels(const Parameter *value) {
+    const auto *img = dynamic_cast<const Image *>(value);
+    return value &&
+           (!img || img->IsNoData() || img->HasScanLineData() || img->DataWindow().IsNull() || img->GPUBytes());
 }
 
 } // namespace
@@ -241,8 +262,7 @@ Ref<Parameter> EvaluateValue(Output *out, double time, const EvalOptions &option
                     // A pending transform becomes pixels here, over the region asked of the input.
                     slot.data = PixelsOf(std::move(slot.data), up.roi, &req);
                     if (!slot.data && !aborted()) {
-                        if (OrvaneDoc *doc = op->GetDoc())
-                            doc->PrintF(ConsoleError, "%s: out of memory (time = %f)\n", op->Name().c_str(), time);
+                        ReportOutOfMemory(op, time);
                         return nullptr;
                     }
                 }
@@ -272,6 +292,7 @@ Ref<Parameter> EvaluateValue(Output *out, double time, const EvalOptions &option
         }
     }
 
+    ClearPixelRefusal();
     try {
         if (precalc) {
             op->PreCalcPreProcess(&req);
@@ -283,13 +304,17 @@ Ref<Parameter> EvaluateValue(Output *out, double time, const EvalOptions &option
             if (req.GetOutputData(out)) op->PostProcess(&req);
         }
     } catch (const std::bad_alloc &) {
-        if (OrvaneDoc *doc = op->GetDoc())
-            doc->PrintF(ConsoleError, "%s: out of memory (time = %f)\n", op->Name().c_str(), time);
+        ReportOutOfMemory(op, time);
         return nullptr;
     }
     if (aborted()) return nullptr;
 
     Ref<Parameter> result(req.GetOutputData(out));
+    if (!HasPixels(result.Get()) && PixelMemoryRefused()) {
+        ReportOutOfMemory(op, time);
+        return nullptr;
+    }
+    ClearPixelRefusal();
     if (!result) {
         if (!req.HasOutputData(out))
             if (OrvaneDoc *doc = op->GetDoc())
@@ -308,9 +333,7 @@ Ref<Parameter> EvaluateOnDevice(Output *out, double time, const EvalOptions &opt
     if (!result || !dynamic_cast<TransformMatrix *>(result.Get())) return result;
     const bool wholeFrame = (options.flags & ReqFlagPreCalc) || !out->Owner()->RegAttrB(RegSupportsRoI);
     result = PixelsOf(std::move(result), wholeFrame ? std::nullopt : options.roi, nullptr);
-    if (!result && !(options.task && options.task->IsAborted()))
-        if (OrvaneDoc *doc = out->Owner()->GetDoc())
-            doc->PrintF(ConsoleError, "%s: out of memory (time = %f)\n", out->Owner()->Name().c_str(), time);
+    if (!result && !(options.task && options.task->IsAborted())) ReportOutOfMemory(out->Owner(), time);
     return result;
 }
 

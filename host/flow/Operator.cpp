@@ -8,6 +8,7 @@
 #include "host/flow/OrvaneDoc.h"
 #include "host/flow/RenderTask.h"
 #include "host/flow/Request.h"
+#include "host/image/PixelMemory.h"
 
 namespace Orvane {
 
@@ -112,6 +113,14 @@ bool Operator::RegInit(Registry *) { return true; }
 void Operator::RegCleanup(Registry *) {}
 
 void Operator::Fail(Request *req, const char *fmt, ...) {
+    // A failure after refused pixel memory says what was needed and the limit.
+    if (const std::string why = TakePixelRefusal(); !why.empty()) {
+        if (doc_)
+            doc_->PrintF(ConsoleError, "%s: %s\n", name_.c_str(), why.c_str());
+        else
+            std::fprintf(stderr, "%s: %s\n", name_.c_str(), why.c_str());
+        return;
+    }
     va_list args;
     va_start(args, fmt);
     if (doc_) {

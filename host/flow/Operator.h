@@ -156,7 +156,9 @@ public:
     OvID GetClippingMode(const Request *req) const;
 
 protected:
-    /// Writes one console line under the error code, starting with the tool's name.
+    /// Writes one console line under the error code, starting with the tool's
+    /// name; after a refused pixel allocation the line says what was needed
+    /// and the memory limit instead (PixelMemory.h).
     void Fail(Request *req, const char *fmt, ...) __attribute__((format(printf, 3, 4)));
 
 private:

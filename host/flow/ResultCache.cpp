@@ -2,6 +2,8 @@
 
 #include <vector>
 
+#include "host/image/PixelMemory.h"
+
 namespace Orvane {
 
 size_t CacheKeyHash::operator()(const CacheKey &k) const {
@@ -10,7 +12,39 @@ size_t CacheKeyHash::operator()(const CacheKey &k) const {
     return static_cast<size_t>(HashMix(h, k.state));
 }
 
-ResultCache::ResultCache(size_t budgetBytes) : budget_(budgetBytes) {}
+ResultCache::ResultCache(size_t budgetBytes)
+    : budget_(budgetBytes), reclaimer_(AddPixelReclaimer([this](size_t wanted) { return Reclaim(wanted); })) {}
+
+ResultCache::~ResultCache() { RemovePixelReclaimer(reclaimer_); }
+
+void ResultCache::EraseLocked(EntryList::iterator it) {
+    auto [first, last] = index_.equal_range(it->key);
+    for (auto ix = first; ix != last; ++ix)
+        if (ix->second == it) {
+            index_.erase(ix);
+            break;
+        }
+    bytes_ -= it->bytes;
+    lru_.erase(it);
+}
+
+size_t ResultCache::Reclaim(size_t wanted) {
+    std::vector<Ref<Parameter>> released; // freed after the lock
+    size_t freed = 0;
+    {
+        std::lock_guard<std::mutex> guard(lock_);
+        for (auto it = lru_.end(); it != lru_.begin() && freed < wanted;) {
+            --it;
+            if (it->value->RefCount() != 1) continue; // someone still holds it: dropping frees nothing
+            freed += it->bytes;
+            released.push_back(std::move(it->value));
+            it = std::next(it);
+            EraseLocked(std::prev(it));
+            ++stats_.evictions;
+        }
+    }
+    return freed;
+}
 
 Ref<Parameter> ResultCache::Find(const CacheKey &key, const std::optional<ImageDomain> &roi) {
     std::lock_guard<std::mutex> guard(lock_);
@@ -49,15 +83,7 @@ void ResultCache::Store(const CacheKey &key, const std::optional<ImageDomain> &r
 
 void ResultCache::EvictLocked() {
     while (bytes_ > budget_ && !lru_.empty()) {
-        Entry &victim = lru_.back();
-        auto [first, last] = index_.equal_range(victim.key);
-        for (auto it = first; it != last; ++it)
-            if (it->second == std::prev(lru_.end())) {
-                index_.erase(it);
-                break;
-            }
-        bytes_ -= victim.bytes;
-        lru_.pop_back();
+        EraseLocked(std::prev(lru_.end()));
         ++stats_.evictions;
     }
 }
@@ -93,18 +119,9 @@ void ResultCache::Clear() {
 void ResultCache::Forget(const Output *output) {
     std::lock_guard<std::mutex> guard(lock_);
     for (auto it = lru_.begin(); it != lru_.end();) {
-        if (it->key.output != output) {
-            ++it;
-            continue;
-        }
-        auto [first, last] = index_.equal_range(it->key);
-        for (auto ix = first; ix != last; ++ix)
-            if (ix->second == it) {
-                index_.erase(ix);
-                break;
-            }
-        bytes_ -= it->bytes;
-        it = lru_.erase(it);
+        auto next = std::next(it);
+        if (it->key.output == output) EraseLocked(it);
+        it = next;
     }
 }
 

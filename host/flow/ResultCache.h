@@ -8,9 +8,13 @@
 //
 // A result made for a region of interest serves any request whose region it
 // covers; a whole-frame result serves every region. Entries beyond the
-// memory budget are evicted, least recently used first.
+// memory budget are evicted, least recently used first. The cache also gives
+// way to pixel memory (PixelMemory.h): when an allocation would pass the
+// process's limit, it drops the least recently used results that nobody but
+// the cache holds.
 //
-// Thread safety: all operations lock the cache.
+// Thread safety: all operations lock the cache; results it lets go are
+// released after the lock.
 #include <cstdint>
 #include <list>
 #include <mutex>
@@ -39,6 +43,9 @@ struct CacheKeyHash {
 class ORVANE_API ResultCache {
 public:
     explicit ResultCache(size_t budgetBytes = size_t(2) << 30);
+    ~ResultCache();
+    ResultCache(const ResultCache &) = delete;
+    ResultCache &operator=(const ResultCache &) = delete;
 
     /// A result whose region covers `roi` (absent: the whole frame).
     Ref<Parameter> Find(const CacheKey &key, const std::optional<ImageDomain> &roi);
@@ -51,6 +58,9 @@ public:
     void Clear();
     /// Drops the entries of one output (its tool is going away).
     void Forget(const Output *output);
+    /// Drops least recently used results held by the cache alone until
+    /// `wanted` bytes are let go; returns the bytes let go.
+    size_t Reclaim(size_t wanted);
 
     struct Stats {
         uint64_t hits = 0, misses = 0, evictions = 0;
@@ -66,12 +76,15 @@ private:
     };
     using EntryList = std::list<Entry>;
     void EvictLocked();
+    /// Takes one entry out of the list and the index.
+    void EraseLocked(EntryList::iterator it);
 
     mutable std::mutex lock_;
     size_t budget_, bytes_ = 0;
     EntryList lru_; // front: most recently used
     std::unordered_multimap<CacheKey, EntryList::iterator, CacheKeyHash> index_;
     Stats stats_;
+    int reclaimer_;
 };
 
 } // namespace Orvane

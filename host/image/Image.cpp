@@ -31,6 +31,17 @@ void Image::SetDataWindow(const ImgRectI &r) {
 void Image::GetCanvasColor(Pixel &p) const { p = FltToPixel(canvas_); }
 void Image::SetCanvasColor(const Pixel &p) { canvas_ = PixelToFlt(p); }
 
+void Image::NameRefusal() const {
+    NamePixelRefusal("a " + DescribeImage(dataWindow_.Width(), dataWindow_.Height(), depth_));
+}
+
+bool Image::AllocAuxPlane(AuxPlane &plane) {
+    const size_t bytes = sizeof(float) * static_cast<size_t>(dataWindow_.Width()) * dataWindow_.Height();
+    plane.data = std::unique_ptr<uint8_t, PixelBlockDeleter>(AllocPixels(bytes), PixelBlockDeleter{bytes});
+    if (!plane.data) NameRefusal();
+    return plane.data != nullptr;
+}
+
 bool Image::AllocScanLineData() {
     if (HasScanLineData()) return true;
     if (noData_) return false;
@@ -39,7 +50,15 @@ bool Image::AllocScanLineData() {
     const size_t rowBytes = RowBytes();
     const size_t total = rowBytes * static_cast<size_t>(h);
     pixels_ = std::unique_ptr<uint8_t, PixelBlockDeleter>(AllocPixels(total), PixelBlockDeleter{total});
-    if (!pixels_) return false;
+    if (!pixels_) {
+        NameRefusal();
+        return false;
+    }
+    for (AuxPlane &plane : aux_)
+        if (!plane.data && !AllocAuxPlane(plane)) {
+            pixels_.reset();
+            return false;
+        }
     try {
         rows_.resize(h);
     } catch (const std::bad_alloc &) {
@@ -47,8 +66,6 @@ bool Image::AllocScanLineData() {
         return false;
     }
     for (int i = 0; i < h; ++i) rows_[i] = pixels_.get() + rowBytes * i;
-    for (AuxPlane &plane : aux_)
-        if (!plane.data) plane.data.reset(new (std::nothrow) float[static_cast<size_t>(dataWindow_.Width()) * h]());
     return true;
 }
 
@@ -67,10 +84,7 @@ size_t Image::DataBytes() const {
 bool Image::AddAuxChannel(AuxChannelKind kind) {
     if (HasAuxChannel(kind)) return true;
     AuxPlane plane{kind, nullptr};
-    if (HasScanLineData() && !dataWindow_.IsNull()) {
-        plane.data.reset(new (std::nothrow) float[static_cast<size_t>(dataWindow_.Width()) * dataWindow_.Height()]());
-        if (!plane.data) return false;
-    }
+    if (HasScanLineData() && !dataWindow_.IsNull() && !AllocAuxPlane(plane)) return false;
     aux_.push_back(std::move(plane));
     return true;
 }
@@ -82,8 +96,7 @@ bool Image::HasAuxChannel(AuxChannelKind kind) const {
 float *Image::AuxRow(AuxChannelKind kind, int y) const {
     if (y < dataWindow_.y0 || y >= dataWindow_.y1) return nullptr;
     for (const AuxPlane &p : aux_)
-        if (p.kind == kind && p.data)
-            return p.data.get() + static_cast<size_t>(y - dataWindow_.y0) * dataWindow_.Width();
+        if (p.kind == kind && p.data) return p.Floats() + static_cast<size_t>(y - dataWindow_.y0) * dataWindow_.Width();
     return nullptr;
 }
 
@@ -122,7 +135,7 @@ void Image::Clear() {
     std::memset(pixels_.get(), 0, RowBytes() * dataWindow_.Height());
     const size_t planeFloats = static_cast<size_t>(dataWindow_.Width()) * dataWindow_.Height();
     for (AuxPlane &plane : aux_)
-        if (plane.data) std::memset(plane.data.get(), 0, planeFloats * sizeof(float));
+        if (plane.data) std::memset(plane.Floats(), 0, planeFloats * sizeof(float));
 }
 
 void Image::ImageCopy(const Image *src) {
@@ -172,7 +185,7 @@ Ref<Image> CopyOfImage(const Image *src) {
         const size_t planeFloats = static_cast<size_t>(src->dataWindow_.Width()) * src->dataWindow_.Height();
         for (size_t i = 0; i < src->aux_.size(); ++i)
             if (src->aux_[i].data && img->aux_[i].data)
-                std::memcpy(img->aux_[i].data.get(), src->aux_[i].data.get(), planeFloats * sizeof(float));
+                std::memcpy(img->aux_[i].Floats(), src->aux_[i].Floats(), planeFloats * sizeof(float));
     }
     return img;
 }

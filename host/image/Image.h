@@ -111,7 +111,9 @@ public:
     bool IsCanvasColorClear() const { return canvas_ == FltPixel{}; }
 
     // ---- rows ----
-    /// Makes the rows exist (zeroed). False when memory ran out.
+    /// Makes the rows exist (zeroed). False when memory ran out or the
+    /// memory limit refused them (PixelMemory.h: TakePixelRefusal says what
+    /// was needed).
     bool AllocScanLineData();
     bool HasScanLineData() const { return !rows_.empty(); }
     bool IsNoData() const { return noData_; }
@@ -292,8 +294,13 @@ private:
     std::unique_ptr<uint8_t, PixelBlockDeleter> pixels_; // from AllocPixels (pooled for frame sizes)
     struct AuxPlane {
         AuxChannelKind kind;
-        std::unique_ptr<float[]> data;
+        std::unique_ptr<uint8_t, PixelBlockDeleter> data; // from AllocPixels, like the rows
+        float *Floats() const { return reinterpret_cast<float *>(data.get()); }
     };
+    /// A zeroed auxiliary plane over the data window, from pixel memory.
+    bool AllocAuxPlane(AuxPlane &plane);
+    /// Names a refused allocation after this image (its size and depth).
+    void NameRefusal() const;
     std::vector<AuxPlane> aux_;
     const std::atomic<bool> *abort_ = nullptr;
     ScriptVal metadata_ = ScriptVal::Table();

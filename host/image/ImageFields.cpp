@@ -153,7 +153,7 @@ void Image::ReverseFieldDominance() {
         std::memcpy(ScanLine(y), inside ? ScanLine(from) : canvasRow.data(), RowBytes());
         for (const AuxPlane &plane : aux_) {
             if (!plane.data) continue;
-            float *row = plane.data.get() + static_cast<size_t>(y - dw.y0) * auxFloats;
+            float *row = plane.Floats() + static_cast<size_t>(y - dw.y0) * auxFloats;
             if (inside)
                 std::memcpy(row, row + auxFloats, auxFloats * sizeof(float));
             else

@@ -58,5 +58,7 @@ ORVANE_API const char *ComponentTypeName(ComponentType type);
 /// "RGBA float16", "mask int8"; "unknown" for a depth out of range.
 ORVANE_API std::string DepthName(int depth);
 inline bool IsValidDepth(int depth) { return depth >= 1 && depth <= 8; }
+/// An image size in words for messages: "8192x4320 RGBA float32 image".
+ORVANE_API std::string DescribeImage(int width, int height, int depth);
 
 } // namespace Orvane

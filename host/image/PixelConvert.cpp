@@ -39,6 +39,10 @@ std::string DepthName(int depth) {
     return std::string(f.channels == 1 ? "mask " : "RGBA ") + ComponentTypeName(f.type);
 }
 
+std::string DescribeImage(int width, int height, int depth) {
+    return std::to_string(width) + "x" + std::to_string(height) + " " + DepthName(depth) + " image";
+}
+
 namespace {
 
 template <class T> T LoadAs(const uint8_t *p) {

@@ -14,6 +14,18 @@
 
 namespace Orvane {
 
+namespace {
+
+/// `why` without the path in it (a library may quote it): a message names
+/// the file once, in front.
+std::string WithoutPath(std::string why, const std::string &path) {
+    for (const std::string &form : {" \"" + path + "\"", "\"" + path + "\"", path})
+        for (size_t at; !form.empty() && (at = why.find(form)) != std::string::npos;) why.erase(at, form.size());
+    return why;
+}
+
+} // namespace
+
 Clip::Clip(std::string fileName) { SetFileName(std::move(fileName)); }
 
 void Clip::SetFileName(std::string fileName) {
@@ -28,11 +40,8 @@ void Clip::SetFileName(std::string fileName) {
 
 bool Clip::Scan(std::string &error) {
     if (!sequence_.hasNumber) {
-        std::error_code ec;
-        if (!std::filesystem::is_regular_file(fileName_, ec)) {
-            error = fileName_ + ": no such file";
-            return false;
-        }
+        // The file must open for reading as a regular file; a FIFO or folder is said so.
+        if (!FileIO::Open(fileName_, FileIO::Mode::Read, error)) return false;
         length_ = 1;
         return true;
     }
@@ -71,6 +80,8 @@ Ref<Image> Clip::GetFrameTagList(int64_t frame, const TagList &tags, std::string
     format->abortFlag = tags.GetPtrAs<const std::atomic<bool>>(ClipFrameAbort);
     format->proxyScale = static_cast<int>(std::max<long long>(1, tags.GetLong(ClipFrameProxyScale, 1)));
     format->metadata = ScriptVal::Table();
+    format->dataWindow.reset();
+    format->auxChannels = 0;
     if (prepare) prepare(*format);
     Ref<Image> image;
     const bool ok = format->LoadHeader(io.get()) &&
@@ -78,7 +89,8 @@ Ref<Image> Clip::GetFrameTagList(int64_t frame, const TagList &tags, std::string
     format->Close();
     format->io = nullptr;
     if (!ok || !image) {
-        error = path + ": " + (format->Error().empty() ? std::string("cannot read the frame") : format->Error());
+        error = path + ": " +
+                (format->Error().empty() ? std::string("cannot read the frame") : WithoutPath(format->Error(), path));
         return nullptr;
     }
     readFormat_ = format;

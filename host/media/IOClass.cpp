@@ -4,30 +4,69 @@
 #include <cerrno>
 #include <cstring>
 #include <fcntl.h>
+#include <sys/stat.h>
 #include <unistd.h>
 
 namespace Orvane {
 
 IOClass::~IOClass() = default;
 
-std::unique_ptr<FileIO> FileIO::Open(const std::string &path, Mode mode, std::string &error, const std::string &name) {
-    std::FILE *f = nullptr;
-    if (mode == Mode::CreateNew) {
-        const int fd = open(path.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, 0666);
-        f = fd < 0 ? nullptr : fdopen(fd, "wb");
-        if (fd >= 0 && !f) {
-            const int err = errno;
-            close(fd);
-            errno = err;
-        }
-    } else {
-        f = std::fopen(path.c_str(), mode == Mode::Read ? "rb" : "wb");
-    }
-    if (!f) {
+namespace {
+
+/// What a file that is not a regular file is, in words.
+const char *KindOfFile(mode_t mode) {
+    if (S_ISDIR(mode)) return "a directory";
+    if (S_ISFIFO(mode)) return "a FIFO";
+    if (S_ISCHR(mode)) return "a character device";
+    if (S_ISBLK(mode)) return "a block device";
+    if (S_ISSOCK(mode)) return "a socket";
+    return "not a plain file";
+}
+
+/// Opens `path` for reading without ever waiting: O_NONBLOCK keeps a FIFO
+/// without a writer from blocking the open, and anything but a regular file
+/// (FIFO, device, directory) is refused before a byte is read.
+std::FILE *OpenForReading(const std::string &path, std::string &error) {
+    const int fd = ::open(path.c_str(), O_RDONLY | O_NONBLOCK | O_CLOEXEC);
+    if (fd < 0) {
         error = path + ": " + std::strerror(errno);
         return nullptr;
     }
-    return std::unique_ptr<FileIO>(new FileIO(f, name.empty() ? path : name));
+    struct stat st {};
+    const bool statted = fstat(fd, &st) == 0;
+    if (!statted || !S_ISREG(st.st_mode)) {
+        error = statted ? path + " is not a regular file (" + KindOfFile(st.st_mode) + ")"
+                        : path + ": " + std::strerror(errno);
+        ::close(fd);
+        return nullptr;
+    }
+    // Reads of a regular file block as usual.
+    const int flags = fcntl(fd, F_GETFL);
+    std::FILE *f = flags == -1 || fcntl(fd, F_SETFL, flags & ~O_NONBLOCK) == -1 ? nullptr : fdopen(fd, "rb");
+    if (!f) {
+        error = path + ": " + std::strerror(errno);
+        ::close(fd);
+    }
+    return f;
+}
+
+} // namespace
+
+std::unique_ptr<FileIO> FileIO::Open(const std::string &path, Mode mode, std::string &error, const std::string &name) {
+    std::FILE *f = nullptr;
+    if (mode == Mode::Read) {
+        f = OpenForReading(path, error);
+    } else if (mode == Mode::CreateNew) {
+        const int fd = ::open(path.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, 0666);
+        f = fd < 0 ? nullptr : fdopen(fd, "wb");
+        if (!f) {
+            error = path + ": " + std::strerror(errno);
+            if (fd >= 0) ::close(fd);
+        }
+    } else if (!(f = std::fopen(path.c_str(), "wb"))) {
+        error = path + ": " + std::strerror(errno);
+    }
+    return f ? std::unique_ptr<FileIO>(new FileIO(f, name.empty() ? path : name)) : nullptr;
 }
 
 FileIO::~FileIO() { Close(); }

@@ -42,9 +42,12 @@ public:
     /// Write truncates or creates the file; CreateNew makes a new file and
     /// fails when anything (a link included) already has the name.
     enum class Mode { Read, Write, CreateNew };
-    /// Opens a file; null with a reason in `error` when it cannot. `name`,
-    /// when given, is the name the stream goes by (a temporary file is
-    /// known by the name it will become).
+    /// Opens a file; null with a reason in `error` when it cannot. Reading
+    /// takes regular files only and never waits: a FIFO, device or folder is
+    /// refused at once ("x.exr is not a regular file (a FIFO)"). Every reader
+    /// of files (clips, `orvane info`) comes through here. `name`, when given,
+    /// is the name the stream goes by (a temporary file is known by the name
+    /// it will become).
     static std::unique_ptr<FileIO> Open(const std::string &path, Mode mode, std::string &error,
                                         const std::string &name = {});
     ~FileIO() override;

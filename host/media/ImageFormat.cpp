@@ -1,12 +1,15 @@
 #include "host/media/ImageFormat.h"
 
+#include <algorithm>
+#include <sstream>
+
 #include "host/core/Tags.h"
 #include "host/flow/DataTypes.h"
 #include "host/flow/Operator.h"
 #include "host/flow/Request.h"
 #include "host/image/NewImage.h"
-
-#include <sstream>
+#include "host/image/Pixel.h"
+#include "host/image/PixelMemory.h"
 
 namespace Orvane {
 
@@ -50,7 +53,18 @@ bool ImageFormat::LoadHeader(IOClass *) { return Fail("this format cannot read")
 bool ImageFormat::LoadFrameTagList(unsigned, Ref<Image> &image, const TagList &tags) {
     if (width < 1 || height < 1 || !IsValidDepth(depth)) return Fail("no header");
     ImgRectI window(0, 0, width, height);
-    if (const auto *region = tags.GetPtrAs<const ImageDomain>(ClipFrameRegion)) window &= region->rect;
+    const auto *region = tags.GetPtrAs<const ImageDomain>(ClipFrameRegion);
+    if (region) window &= region->rect;
+    if (!tags.GetBool(ClipFrameHeaderOnly)) {
+        // What the pixels will take, checked before anything is allocated.
+        ImgRectI held = dataWindow.value_or(ImgRectI(0, 0, width, height));
+        if (region) held &= region->rect;
+        const uint64_t pixelBytes = FormatOfDepth(depth).BytesPerPixel() + sizeof(float) * std::max(auxChannels, 0);
+        const uint64_t bytes = held.IsNull() ? 0 : uint64_t(held.Width()) * uint64_t(held.Height()) * pixelBytes;
+        const std::string why = PixelLimitRefusal(bytes, "the " + DescribeImage(held.Width(), held.Height(), depth) +
+                                                             " its header describes");
+        if (!why.empty()) return Fail(why);
+    }
     image = NewImageTagList({{ImgWidth, width},
                              {ImgHeight, height},
                              {ImgDepth, depth},
@@ -98,12 +112,6 @@ bool ImageFormat::DescribeFile(IOClass *stream, ScriptVal &d) {
     d.Set("channels", channels);
     if (header->Metadata().IsTable() && header->Metadata().Size()) d.Set("metadata", header->Metadata());
     return true;
-}
-
-const char *DepthName(int depth) {
-    static const char *const names[] = {"?",         "int8 mask",  "int16 mask",   "float16 mask", "float32 mask",
-                                        "RGBA int8", "RGBA int16", "RGBA float16", "RGBA float32"};
-    return depth >= 1 && depth <= 8 ? names[depth] : names[0];
 }
 
 Ref<ImageFormat> NewImageFormat(const Registry *row) {

@@ -5,9 +5,14 @@
 // host's clip picks it by extension (ImageFormatList) and confirms it with
 // CheckFormat.
 //
-// Reading:  LoadHeader(io) fills width, height, depth, aspect; then
+// Reading:  LoadHeader(io) fills width, height, depth, aspect (and the data
+//           window and auxiliary channels when the file has them); then
 //           LoadFrameTagList(frame, image, tags) makes the image (the base
-//           does that from the fields) and fills its pixels. Tags:
+//           does that from the fields) and fills its pixels. The base
+//           refuses, before anything is allocated, a frame whose header asks
+//           for more pixel memory than the process may hold
+//           (PixelMemory.h), so no format reads a damaged header's size.
+//           Tags:
 //             ClipFrameRegion      const ImageDomain *: decode only these rows
 //                                   and columns (the image's data window)
 //             ClipFrameHeaderOnly  1: the image gets no pixels (pre-calculation)
@@ -25,6 +30,7 @@
 // Thread safety: one format object serves one clip, which serialises its use.
 #include <atomic>
 #include <cstdint>
+#include <optional>
 #include <string>
 
 #include "host/core/Object.h"
@@ -105,6 +111,10 @@ public:
     int width = 0, height = 0;
     double aspectX = 1.0, aspectY = 1.0;
     int depth = 0; ///< image depth the file maps to (1..8)
+    /// Where the file's pixels lie in image coordinates, when not the frame;
+    /// the clip clears it (and auxChannels) before each LoadHeader.
+    std::optional<ImgRectI> dataWindow;
+    int auxChannels = 0; ///< auxiliary float planes the frame will carry
     /// Metadata read from the file, handed to the image it makes.
     ScriptVal metadata = ScriptVal::Table();
     /// What the file stores where it differs from `depth` (descriptions
@@ -114,9 +124,6 @@ public:
 
     bool Aborted() const { return abortFlag && abortFlag->load(std::memory_order_relaxed); }
 };
-
-/// "RGBA float16", "int8 mask": the words for an image depth (1..8); "?" for others.
-ORVANE_API const char *DepthName(int depth);
 
 /// Makes a format object from its registry row; null if the row is no format.
 ORVANE_API Ref<ImageFormat> NewImageFormat(const Registry *row);

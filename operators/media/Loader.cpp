@@ -1,11 +1,8 @@
 #include "operators/media/Loader.h"
 
 #include <algorithm>
-#include <cerrno>
 #include <chrono>
 #include <cmath>
-#include <cstring>
-#include <filesystem>
 #include <thread>
 
 #include "host/app/Application.h"
@@ -18,6 +15,7 @@
 #include "host/image/Half.h"
 #include "host/image/Image.h"
 #include "host/image/NewImage.h"
+#include "host/image/PixelMemory.h"
 #include "host/image/ResizeFilters.h"
 #include "host/media/ImageFormatList.h"
 #include "operators/frame/IdChoices.h"
@@ -552,24 +550,44 @@ Ref<Image> Loader::FetchFrame(Request *req, const ClipEntry &entry, int64_t fram
         format.SetupLoad(this, req);
         SetCurrentGroup({});
     });
-    if (!image) {
-        errno = 0;
-        std::error_code ec;
-        if (!std::filesystem::exists(clip.FramePath(frame), ec)) errno = ENOENT;
-        const int err = errno;
-        if (report && s.missing != MissingWait && !(req->GetTask() && req->GetTask()->IsAborted())) {
-            const std::string reason = err ? std::strerror(err) : error;
-            GetDoc()->PrintF(req, ConsoleError, "%s failed to load file \"%s\" (clip \"%s\" at frame %d) : %s",
-                             Name().c_str(), clip.FramePath(frame).c_str(), entry.name.c_str(), static_cast<int>(frame),
-                             reason.c_str());
-        }
+    // A refused allocation says more than the format's "out of memory".
+    const std::string refused = TakePixelRefusal();
+    if (!image && report && s.missing != MissingWait && !(req->GetTask() && req->GetTask()->IsAborted())) {
+        // The clip's reason starts with the path, which the line names once.
+        const std::string path = clip.FramePath(frame);
+        std::string reason = refused.empty() ? error : refused;
+        if (reason.rfind(path, 0) == 0) reason.erase(0, reason.find_first_not_of(": ", path.size()));
+        const std::string number =
+            clip.IsSequence() ? " (frame " + std::to_string(clip.SequenceNumber(frame)) + ")" : std::string();
+        GetDoc()->PrintF(req, ConsoleError, "%s failed to load file \"%s\"%s : %s", Name().c_str(), path.c_str(),
+                         number.c_str(), reason.c_str());
     }
     return image;
 }
 
-Ref<Image> Loader::MissingFrameColor(Request *req, const ClipEntry &entry, const Settings &s) {
-    long long w = entry.clip->GetAttrL(ClipWidth, 0), h = entry.clip->GetAttrL(ClipHeight, 0);
-    double ax = entry.clip->GetAttrD(ClipAspectX, 1.0), ay = entry.clip->GetAttrD(ClipAspectY, 1.0);
+Ref<Image> Loader::MissingFrameColor(Request *req, const ClipEntry &entry, int64_t frame, const Settings &s) {
+    // The size of the clip's frames: the header of the nearest frame that
+    // exists, else the last frame read, else the document's frame format.
+    long long w = 0, h = 0;
+    double ax = 1.0, ay = 1.0;
+    const std::vector<int64_t> &found = entry.clip->Found().frames;
+    const int64_t number = entry.clip->SequenceNumber(frame);
+    const auto after = std::lower_bound(found.begin(), found.end(), number);
+    Settings whole = s;
+    whole.proxyScale = 1;
+    ClipEntry main = entry;
+    main.alt.Reset();
+    for (auto it : {after, after == found.begin() ? found.end() : std::prev(after)}) {
+        if (it == found.end() || w > 0) continue;
+        if (Ref<Image> shape = FetchFrame(req, main, *it - entry.clip->InitialFrame(), whole, true, false)) {
+            w = shape->Width(), h = shape->Height();
+            ax = shape->XScale(), ay = shape->YScale();
+        }
+    }
+    if (w <= 0) {
+        w = entry.clip->GetAttrL(ClipWidth, 0), h = entry.clip->GetAttrL(ClipHeight, 0);
+        ax = entry.clip->GetAttrD(ClipAspectX, 1.0), ay = entry.clip->GetAttrD(ClipAspectY, 1.0);
+    }
     if (w <= 0 || h <= 0 || w > 10000000 || h > 10000000) {
         const FrameFormat ff = GetDoc()->GetFrameFormat();
         w = ff.width;
@@ -602,7 +620,7 @@ Ref<Image> Loader::FetchWithMissingRule(Request *req, const ClipEntry &entry, in
         for (int64_t f = std::min<int64_t>(frame, entry.clip->Length()) - 1; f >= 0 && !image && !aborted(); --f)
             image = FetchFrame(req, entry, f, s, headerOnly, false);
         break;
-    case MissingOutputColor: image = MissingFrameColor(req, entry, s); break;
+    case MissingOutputColor: image = MissingFrameColor(req, entry, frame, s); break;
     case MissingWait:
         if (req->GetFlags() & ReqFlagInteractive) break;
         while (!image && !aborted()) {

@@ -59,7 +59,7 @@ private:
                           bool report);
     Ref<Image> FetchWithMissingRule(Request *req, const ClipEntry &entry, int64_t frame, const Settings &s);
     Ref<Image> FetchPulled(Request *req, const ClipEntry &entry, int64_t frame, const Settings &s);
-    Ref<Image> MissingFrameColor(Request *req, const ClipEntry &entry, const Settings &s);
+    Ref<Image> MissingFrameColor(Request *req, const ClipEntry &entry, int64_t frame, const Settings &s);
     Ref<Image> ApplyAlphaOptions(Request *req, Ref<Image> image, const Settings &s);
     Ref<Image> FitFieldAndProxy(Request *req, Ref<Image> image, const Settings &s);
     void AddFormatInputs(const std::string &fileName);

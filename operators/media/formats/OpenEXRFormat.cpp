@@ -903,6 +903,11 @@ bool OpenEXRFormat::LoadHeader(IOClass *stream) {
             return Fail("OpenEXR: data window too large");
         width = static_cast<int>(w);
         height = static_cast<int>(hh);
+        dataWindow = ef::ImageWindow(P, height);
+        auxChannels = lumaChroma_
+                          ? 0
+                          : static_cast<int>(std::count_if(slotChannel_ + FirstAuxSlot, slotChannel_ + SlotCount,
+                                                           [](auto &n) { return !n.empty(); }));
         const float ratio = h.pixelAspectRatio();
         aspectX = std::isfinite(ratio) && ratio > 0.f ? ratio : 1.0;
         aspectY = 1.0;

@@ -52,8 +52,6 @@ namespace raw_format_detail {
 constexpr uint32_t FlagOpaque = 1, FlagSimple = 2;
 constexpr uint32_t kMetadataLimit = 0x10000;
 constexpr int kAuxKinds = static_cast<int>(AuxChannelKind::Count);
-/// Most pixel bytes (both planes) a file may ask for: 16 GiB.
-constexpr int64_t kMaxPixelBytes = int64_t(1) << 34;
 
 int64_t ZlibBuffer(int64_t line) {
     return std::max<int64_t>(
@@ -104,31 +102,22 @@ private:
     int64_t pos_ = 0, end_ = 0;
 };
 
-/// Decodes one line of `count` elements; false when the data ended (the
-/// elements of whole packets done so far stay, the rest of the line is zero).
+/// Decodes one line of `count` elements; false when the data ends first.
 bool DecodeElements(DataSource &src, int count, int n, uint8_t *dst) {
-    int x = 0;
-    auto ended = [&] {
-        std::memset(dst + static_cast<size_t>(x) * n, 0, static_cast<size_t>(count - x) * n);
-        return false;
-    };
-    while (x < count) {
+    for (int x = 0; x < count;) {
         uint8_t control;
-        if (!src.Get(&control, 1)) return ended();
+        if (!src.Get(&control, 1)) return false;
         const int len = (control & 0x7f) + 1;
         const int take = std::min(len, count - x); // a packet never crosses the line end
         if (control & 0x80) {
             uint8_t element[16];
-            if (!src.Get(element, n)) return ended();
+            if (!src.Get(element, n)) return false;
             for (int k = 0; k < take; ++k) std::memcpy(dst + static_cast<size_t>(x + k) * n, element, n);
         } else {
-            if (!src.Get(dst + static_cast<size_t>(x) * n, int64_t(take) * n)) return ended();
+            if (!src.Get(dst + static_cast<size_t>(x) * n, int64_t(take) * n)) return false;
             if (take < len) {
                 std::vector<uint8_t> skip(static_cast<size_t>(len - take) * n);
-                if (!src.Get(skip.data(), static_cast<int64_t>(skip.size()))) {
-                    x += take; // this packet's pixels are whole
-                    return ended();
-                }
+                if (!src.Get(skip.data(), static_cast<int64_t>(skip.size()))) return false;
             }
         }
         x += take;
@@ -309,16 +298,12 @@ bool RawFormat::LoadHeader(IOClass *stream) {
     const int64_t end = fileSize >= 0 ? fileSize - base : -1;
     if (dataOffset_ < 704 || (end >= 0 && dataOffset_ > end)) return Fail("bad pixel data offset");
     const int64_t both = L.mainLine + L.auxLine;
-    // A damaged window must not make us ask for terabytes.
-    if (rows * both > kMaxPixelBytes) return Fail("data window too large");
     if (compression_ == CompressNone) {
         const bool agrees = dataSize_ == both * h || dataSize_ == both * rows ||
                             (end >= 0 && (end == dataOffset_ + both * h || end == dataOffset_ + both * rows));
         if (!agrees) return Fail("pixel data size does not match the image");
     } else if (compression_ == CompressZlib && end >= 0 && rows * (L.auxLine ? 8 : 4) > end - dataOffset_) {
-        // Every zlib line has at least its size word. (Run-length data that
-        // ends early is read as far as it goes.)
-        return Fail("truncated pixel data");
+        return Fail("truncated pixel data"); // every zlib line has at least its size word
     }
 
     // Metadata: ignored when absent, empty or too large.
@@ -346,6 +331,8 @@ bool RawFormat::LoadHeader(IOClass *stream) {
     }
 
     width = w, height = h, depth = d;
+    dataWindow = L.window;
+    auxChannels = static_cast<int>(L.aux.size());
     const double ax = LE::GetDouble(hdr_ + 72), ay = LE::GetDouble(hdr_ + 80);
     aspectX = std::isfinite(ax) && ax > 0 ? ax : 1.0;
     aspectY = std::isfinite(ay) && ay > 0 ? ay : 1.0;
@@ -474,8 +461,7 @@ bool RawFormat::ReadPixels(Image &image, const ImgRectI &want) {
         if (compression_ == CompressZlib) {
             if (!zlibLine(y, L.mainLine)) return false;
         } else if (!DecodeElements(src, cols, L.mainPix, line.data())) {
-            if (wanted(y)) storeMain(y, line.data());
-            return true; // the data ends here: what was decoded stays
+            return Fail("truncated pixel data at line " + std::to_string(y));
         }
         if (wanted(y)) storeMain(y, line.data());
     }

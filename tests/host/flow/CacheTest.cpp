@@ -1,6 +1,7 @@
 // The result cache: on its own (keys, regions, LRU eviction under a byte
-// budget, byte accounting) and through the engine (what is served again,
-// what renders anew, what is never kept, pass-through by reference).
+// budget, byte accounting, giving way to pixel memory) and through the engine
+// (what is served again, what renders anew, what is never kept, pass-through
+// by reference, a chain under a memory limit).
 #include <optional>
 #include <string>
 #include <vector>
@@ -15,6 +16,7 @@
 #include "host/flow/Request.h"
 #include "host/flow/ResultCache.h"
 #include "host/image/NewImage.h"
+#include "host/image/PixelMemory.h"
 #include "tests/support/TestSupport.h"
 
 namespace Orvane::cachetest {
@@ -170,6 +172,19 @@ TEST(ResultCache, ForgetDropsOneOutputsEntries) {
     EXPECT_EQ(cache.Find(Key(o.b, 0), Whole).Get(), y.Get());
     cache.Forget(&o.a); // nothing left of it
     EXPECT_EQ(cache.Entries(), 1u);
+}
+
+TEST(ResultCache, ReclaimDropsOnlyResultsNobodyElseHoldsOldestFirst) {
+    Outputs o;
+    ResultCache cache;
+    Ref<Parameter> held = Img(16, 16);
+    const size_t one = held->SizeOf();
+    for (int t = 0; t < 4; ++t) cache.Store(Key(o.a, t), Whole, t ? Img(16, 16) : held);
+    // Time 0 is the oldest but still held elsewhere: 1 and then 2 go.
+    EXPECT_EQ(cache.Reclaim(one + 1), 2 * one);
+    for (int t = 0; t < 4; ++t) EXPECT_EQ(bool(cache.Find(Key(o.a, t), Whole)), t == 0 || t == 3) << t;
+    EXPECT_EQ(cache.Reclaim(10 * one), one); // all that is left to let go
+    EXPECT_EQ(cache.Bytes(), one);
 }
 
 // ---- through the engine ----------------------------------------------------
@@ -448,6 +463,41 @@ TEST(EngineCache, PassThroughHandsOnTheSameObject) {
     // Letting the results go leaves the image to its owners.
     doc->Cache().Clear();
     EXPECT_EQ(image->RefCount(), refsBefore);
+}
+
+TEST(EngineCache, AChainOfPerPixelToolsHoldsTwoFramesUnderTheMemoryLimit) {
+    constexpr int W = 512, H = 256; // 2 MiB a frame
+    const size_t frame = size_t(W) * H * sizeof(FltPixel);
+    Ref<OrvaneDoc> doc = MakeRef<OrvaneDoc>();
+    Ref<Image> image = ts::PatternImage(W, H);
+    ts::ImageSourceTool *src = ts::AddImageSource(*doc, "Src", image);
+    std::vector<GainTool *> gains;
+    Output *up = src->Out();
+    for (int i = 1; i <= 4; ++i) {
+        gains.push_back(dynamic_cast<GainTool *>(doc->AddTool(C().gain, "Gain" + std::to_string(i))));
+        ASSERT_TRUE(gains.back() && gains.back()->input->ConnectTo(up));
+        ts::SetNumber(gains.back(), "Gain", 0.5 * i);
+        up = gains.back()->output;
+    }
+    struct Restore {
+        ~Restore() { SetPixelMemoryLimit(0); }
+    } restore;
+    // Room for the source and two and a half frames: the cache lets older results go.
+    const size_t limit = PixelMemoryInUse() + frame * 5 / 2;
+    SetPixelMemoryLimit(limit);
+    ResetPixelMemoryPeak();
+    Ref<Image> out = Eval(gains.back());
+    ASSERT_TRUE(out);
+    EXPECT_LE(PixelMemoryPeak(), limit);
+    EXPECT_FLOAT_EQ(out->GetFlt(7, 9).G, image->GetFlt(7, 9).G * 0.5f * 1.0f * 1.5f * 2.0f);
+    // Room for one frame more only: the second tool, which does not check its
+    // allocation, fails with the line saying what it needed.
+    out.Reset();
+    doc->Cache().Clear();
+    SetPixelMemoryLimit(PixelMemoryInUse() - PixelPoolBytes() + frame * 3 / 2);
+    EXPECT_FALSE(Eval(gains.back()));
+    ASSERT_FALSE(doc->ConsoleLines().empty());
+    EXPECT_EQ(doc->ConsoleLines().back().text.rfind("Gain2: needs 2 MiB for a 512x256 RGBA float32 image;", 0), 0u);
 }
 
 } // namespace

@@ -1,5 +1,6 @@
-// Pixel memory: blocks come back zeroed, frame-sized blocks are reused, and
-// the pool keeps no more than its limit.
+// Pixel memory: blocks come back zeroed, frame-sized blocks are reused, the
+// pool keeps no more than its limit, and the process limit empties the pool,
+// asks the reclaimers and only then refuses, saying what was needed.
 #include <gtest/gtest.h>
 
 #include <cstring>
@@ -10,10 +11,14 @@
 namespace Orvane::pixelmemorytest {
 namespace {
 
-/// Restores the pool limit when a test ends.
+/// Restores the pool limit and the memory limit when a test ends.
 struct LimitGuard {
     size_t saved = PixelPoolLimit();
-    ~LimitGuard() { SetPixelPoolLimit(saved); }
+    ~LimitGuard() {
+        SetPixelPoolLimit(saved);
+        SetPixelMemoryLimit(0);
+        ClearPixelRefusal();
+    }
 };
 
 bool AllZero(const uint8_t *p, size_t n) {
@@ -80,16 +85,48 @@ TEST(PixelMemory, ThePoolKeepsNoMoreThanItsLimitOldestLeavingFirst) {
     EXPECT_EQ(PixelPoolBytes(), 0u);
 }
 
-} // namespace
-} // namespace Orvane::pixelmemorytest
-
-namespace Orvane::pixelmemorytest {
-namespace {
-
-TEST(PixelMemory, ABlockBeyondHalfTheMachinesMemoryIsRefusedNotAttempted) {
-    // A damaged header may claim any size; the allocation must fail cleanly.
-    EXPECT_EQ(AllocPixels(size_t(1) << 62), nullptr);
-    EXPECT_EQ(AllocPixels(static_cast<size_t>(-1)), nullptr);
+TEST(PixelMemory, TheLimitEmptiesThePoolThenAsksReclaimersThenRefuses) {
+    LimitGuard guard;
+    SetPixelPoolLimit(0);
+    SetPixelPoolLimit(size_t(64) << 20);
+    const size_t block = size_t(4) << 20, other = block - 4096;
+    const size_t base = PixelMemoryInUse(), limit = base + 3 * block;
+    SetPixelMemoryLimit(limit, "--memory-limit");
+    ResetPixelMemoryPeak();
+    uint8_t *a = AllocPixels(block), *b = AllocPixels(block), *c = AllocPixels(block);
+    ASSERT_TRUE(a && b && c);
+    FreePixels(c, block);
+    EXPECT_EQ(PixelPoolBytes(), block);
+    // The pooled block does not fit the new size: it leaves to make room.
+    uint8_t *d = AllocPixels(other);
+    ASSERT_NE(d, nullptr);
+    EXPECT_EQ(PixelPoolBytes(), 0u);
+    // Full: the reclaimer lets `b` go, which is then reused.
+    std::vector<size_t> asked;
+    const int id = AddPixelReclaimer([&](size_t wanted) -> size_t {
+        asked.push_back(wanted);
+        if (!b) return 0;
+        FreePixels(b, block);
+        b = nullptr;
+        return block;
+    });
+    uint8_t *e = AllocPixels(block);
+    ASSERT_NE(e, nullptr);
+    EXPECT_EQ(asked, std::vector<size_t>{other}); // what passes the limit
+    // Nothing more to let go: refused, saying what and the limit, once.
+    EXPECT_EQ(AllocPixels(block), nullptr);
+    EXPECT_EQ(asked.size(), 2u);
+    EXPECT_EQ(TakePixelRefusal(), "needs 4 MiB; --memory-limit is " + FormatBytes(limit) + ", " +
+                                      FormatBytes(PixelMemoryInUse()) + " of it in use");
+    EXPECT_EQ(TakePixelRefusal(), "");
+    EXPECT_LE(PixelMemoryPeak(), limit);
+    RemovePixelReclaimer(id);
+    for (auto [p, n] : {std::pair{a, block}, {d, other}, {e, block}}) FreePixels(p, n);
+    EXPECT_EQ(PixelMemoryInUse(), base + PixelPoolBytes());
+    // More than the whole limit (a damaged header's size): refused, no reclaimer asked.
+    for (size_t huge : {4 * block, size_t(1) << 62, ~size_t(0)}) EXPECT_EQ(AllocPixels(huge), nullptr);
+    EXPECT_EQ(TakePixelRefusal(), "needs 17179869184 GiB; --memory-limit is " + FormatBytes(limit));
+    EXPECT_EQ(asked.size(), 2u);
 }
 
 } // namespace

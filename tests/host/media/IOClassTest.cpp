@@ -1,12 +1,17 @@
 // FileIO and MemoryIO: reads, writes, the three seek origins, sizes and
-// short reads, checked against bytes the test knows.
+// short reads, checked against bytes the test knows; reading refuses what is
+// not a regular file without waiting.
 #include <gtest/gtest.h>
 
+#include <fcntl.h>
+#include <sys/stat.h>
 #include <unistd.h>
 
+#include <chrono>
 #include <cstdio>
 #include <cstdlib>
 #include <fstream>
+#include <future>
 #include <numeric>
 #include <string>
 #include <vector>
@@ -170,6 +175,27 @@ TEST(FileIO, OpenFailsWithAReason) {
     error.clear();
     EXPECT_EQ(FileIO::Open("/nonexistent-dir-orvane/x.bin", FileIO::Mode::Write, error), nullptr);
     EXPECT_FALSE(error.empty());
+}
+
+TEST(FileIO, ReadingRefusesWhatIsNotARegularFileWithoutWaiting) {
+    TempPath tmp;
+    const std::string fifo = tmp.path + ".fifo", folder = tmp.path + ".dir";
+    ASSERT_EQ(mkfifo(fifo.c_str(), 0600), 0);
+    ASSERT_EQ(mkdir(folder.c_str(), 0700), 0);
+    for (auto [path, kind] :
+         {std::pair{fifo, "a FIFO"}, {folder, "a directory"}, {"/dev/null", "a character device"}}) {
+        auto opening = std::async(std::launch::async, [path = path] {
+            std::string error;
+            return FileIO::Open(path, FileIO::Mode::Read, error) ? std::string("opened") : error;
+        });
+        if (opening.wait_for(std::chrono::seconds(5)) != std::future_status::ready) {
+            ADD_FAILURE() << path << ": the open waits";
+            close(open(path.c_str(), O_WRONLY | O_NONBLOCK)); // a writer ends a FIFO's blocked open
+        }
+        EXPECT_EQ(opening.get(), path + " is not a regular file (" + kind + ")");
+    }
+    std::remove(fifo.c_str());
+    rmdir(folder.c_str());
 }
 
 } // namespace io_class_test

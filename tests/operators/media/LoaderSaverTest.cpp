@@ -1,14 +1,18 @@
 // Loader and Saver in a document: which file a time reads, the missing-frame
-// rules and their messages, the import options with values computed here,
-// and where the Saver writes (numbering, folders, failures).
+// rules and their messages, headers that ask for more memory than the limit,
+// the import options with values computed here, and where the Saver writes
+// (numbering, folders, failures).
 #include <gtest/gtest.h>
 
+#include <algorithm>
 #include <cmath>
+#include <cstring>
 #include <filesystem>
 
 #include "host/flow/Engine.h"
 #include "host/flow/InputValue.h"
 #include "host/flow/RenderTask.h"
+#include "host/image/PixelMemory.h"
 #include "host/media/Clip.h"
 #include "tests/operators/media/FormatTestSupport.h"
 
@@ -98,8 +102,9 @@ TEST_F(LoaderSaver, MissingFramesFailHoldOrFill) {
     std::filesystem::remove(dir / "plate.1002.raw");
     EXPECT_EQ(FileAt(0), 1); // records the clip's frame size
     EXPECT_EQ(FileAt(1), -1);
-    EXPECT_EQ(LastConsole(), "Plate failed to load file \"" + (dir / "plate.1002.raw") + "\" (clip \"" +
-                                 (dir / "plate.1001.raw") + "\" at frame 1) : No such file or directory");
+    // The file once, and the frame by the file's own number.
+    EXPECT_EQ(LastConsole(), "Plate failed to load file \"" + (dir / "plate.1002.raw") +
+                                 "\" (frame 1002) : No such file or directory");
     Set(loader, "MissingFrames", ScriptVal(1));
     EXPECT_EQ(FileAt(1), 1);
     EXPECT_EQ(FileAt(2), 3);
@@ -108,12 +113,44 @@ TEST_F(LoaderSaver, MissingFramesFailHoldOrFill) {
     Set(loader, "Alpha", ScriptVal(1));
     Ref<Image> filled = Orvane::Test::EvalImage(loader, 1);
     ASSERT_TRUE(filled);
-    EXPECT_EQ(filled->Width(), W);
-    EXPECT_EQ(filled->Height(), H);
     const FltPixel p = filled->GetFlt(2, 2);
     EXPECT_EQ(p.R, 0.25f);
     EXPECT_EQ(p.G, 0.0f);
     EXPECT_EQ(p.A, 1.0f);
+}
+
+TEST_F(LoaderSaver, AColourForAMissingFrameTakesTheSizeOfTheClipsFrames) {
+    // Nothing read yet: the size comes from the header of a frame that exists, not the document.
+    std::filesystem::remove(dir / "plate.1002.raw");
+    Set(loader, "MissingFrames", ScriptVal(2));
+    ASSERT_NE(doc.GetFrameFormat().width, W);
+    Ref<Image> filled = Orvane::Test::EvalImage(loader, 1);
+    ASSERT_TRUE(filled);
+    EXPECT_EQ(filled->Width(), W);
+    EXPECT_EQ(filled->Height(), H);
+}
+
+TEST_F(LoaderSaver, AHeaderAskingForMoreThanTheMemoryLimitIsRefusedBeforeAllocating) {
+    // A 100 x 59 OpenEXR file whose header claims a data window 525341 wide.
+    Bytes exr = Save("OpenEXRFormat", Orvane::Test::PatternImage(100, 59).Get());
+    const std::string key("dataWindow\0box2i\0", 17);
+    const auto at = std::search(exr.begin(), exr.end(), key.begin(), key.end());
+    ASSERT_NE(at, exr.end());
+    const int32_t x1 = 525340;
+    std::memcpy(&*(at + 17 + 4 + 8), &x1, 4); // after the size, x0 and y0
+    WriteFile(dir / "huge.exr", exr);
+    Set(loader, "Clip", ScriptVal(dir / "huge.exr"));
+    struct Restore {
+        ~Restore() { SetPixelMemoryLimit(0); }
+    } restore;
+    SetPixelMemoryLimit(size_t(256) << 20, "--memory-limit");
+    ResetPixelMemoryPeak();
+    const size_t before = PixelMemoryInUse();
+    EXPECT_FALSE(Orvane::Test::EvalImage(loader, 0));
+    EXPECT_LT(PixelMemoryPeak() - before, size_t(1) << 20);
+    EXPECT_EQ(LastConsole(), "Plate failed to load file \"" + (dir / "huge.exr") +
+                                 "\" : needs 473 MiB for the 525341x59 RGBA float32 image its header describes; "
+                                 "--memory-limit is 256 MiB");
 }
 
 TEST_F(LoaderSaver, AlphaOptionsAndDepth) {
