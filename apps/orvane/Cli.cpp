@@ -20,7 +20,7 @@ void LoadLibrary() {
     if (!GetApp()->LoadOperators(error)) throw CliError(ExitFailed, "cannot load the tool library: " + error);
 }
 
-IDeviceContext *ChooseDevice(const char *command, const std::string &choice, const OrvaneDoc &doc) {
+IDeviceContext *ChooseDevice(const char *command, const std::string &choice, const OrvaneDoc &doc, bool json) {
     DeviceChoice wanted = DeviceChoice::CPU;
     const bool fromCommandLine = !choice.empty();
     if (fromCommandLine) {
@@ -37,8 +37,13 @@ IDeviceContext *ChooseDevice(const char *command, const std::string &choice, con
     IDeviceContext *device = GetApp()->Device(wanted, &error);
     if (!device && wanted != DeviceChoice::Auto) {
         if (fromCommandLine) throw CliError(ExitUsage, std::string(command) + ": --device " + choice + ": " + error);
-        std::fprintf(stderr, "WARNING: the document asks for %s: %s; rendering on the CPU\n", DeviceChoiceName(wanted),
-                     error.c_str());
+        const std::string why = std::string("the document asks for ") + DeviceChoiceName(wanted) + ": " + error +
+                                "; rendering on the CPU";
+        if (json)
+            std::printf("{\"event\": \"warning\", \"code\": \"device\", \"device\": %s, \"warning\": %s}\n",
+                        JsonString(DeviceChoiceName(wanted)).c_str(), JsonString(why).c_str());
+        else
+            std::fprintf(stderr, "WARNING: %s\n", why.c_str());
     }
     return device;
 }

@@ -46,7 +46,9 @@ void LoadLibrary();
 /// 3 cuda). A back end named on the command line that has no device is a
 /// usage error; one chosen by the preference falls back to the CPU with a
 /// warning on stderr. Null: rows on the CPU.
-IDeviceContext *ChooseDevice(const char *command, const std::string &choice, const OrvaneDoc &doc);
+/// With `json` that warning is an object on stdout ("code": "device").
+IDeviceContext *ChooseDevice(const char *command, const std::string &choice, const OrvaneDoc &doc,
+                             bool json = false);
 /// Prints the device runs that failed during a render (the rows made those
 /// frames) as "WARNING: device: ..." lines on stderr.
 void ReportDeviceLog(const RenderTask &task);

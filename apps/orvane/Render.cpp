@@ -405,7 +405,7 @@ int RunRender(const std::vector<std::string> &rawArgs) {
     }
 
     RenderTask task;
-    task.SetDevice(ChooseDevice("render", a.device, doc));
+    task.SetDevice(ChooseDevice("render", a.device, doc, a.json));
     task.proxyScale = a.proxy;
     task.startTime = static_cast<double>(rangeStart);
     task.endTime = static_cast<double>(rangeEnd);

@@ -159,6 +159,10 @@ InputLine DescribeInput(const Input &in) {
     if (!in.IsExternal()) parts.push_back("not animatable");
     if (in.Priority() != 0 && in.Priority() != PriorityImage)
         parts.push_back("priority " + std::to_string(in.Priority()));
+    std::string accepted;
+    for (const TagItem *id : t.FindAll(ListAcceptedId))
+        accepted += (accepted.empty() ? "" : ", ") + std::string(id->AsID().Text());
+    if (!accepted.empty()) parts.push_back("also takes " + accepted);
     for (const std::string &p : parts) line.details += (line.details.empty() ? "" : ", ") + p;
     const auto choices = InputChoices(&in);
     for (size_t i = 0; i < choices.size(); ++i)

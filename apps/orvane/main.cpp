@@ -84,8 +84,14 @@ const Command kCommands[] = {
   Shows a class's pages, inputs (type, control, default, limits, choices) and
   outputs. --markdown prints its reference page.
 )"},
-    {"info", RunInfo, R"(orvane info FILE...
-  What the formats read from files: format, size, channels, depth, windows.
+    {"info", RunInfo, R"(orvane info [--sequence] [--json] FILE...
+  What a file holds: format, size, the image reading makes, the file's channels
+  and sample types; OpenEXR: every part, view, window, channel and header
+  attribute. A name is that file, never a sequence it might belong to.
+  --sequence            the numbered sequence the name belongs to (frames, gaps);
+                        a name with #### or %04d is a sequence by itself
+  --json                one JSON array of files (docs/EXR.md)
+  Exit: 0 every file read, 2 bad command line, 3 a file could not be read.
 )"},
     {"version", RunVersion, R"(orvane version
   Prints the program version (also orvane --version).

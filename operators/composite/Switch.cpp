@@ -131,14 +131,13 @@ void SwitchBase::SetCount(int count) {
         const int i = Positions();
         const std::string id = "Input" + std::to_string(i), nameId = "Name" + std::to_string(i);
         const std::string label = "Input " + std::to_string(i), nameLabel = "Name " + std::to_string(i);
-        TagList linkTags{{LinkDataType, dataType_}, {LinkMain, i + 1}, {InputRequired, 0}};
+        TagList linkTags{{LinkDataType, dataType_}, {LinkMain, i + 1}, {InputRequired, 0}, {InputNotify, 1}};
         if (dataType_ == CLSID_DataType_Image) {
             // A pending transform passes through unflattened.
             linkTags.Add({LinkSecondDataType, CLSID_DataType_TransformMatrix});
             linkTags.Add({ImageFromRequestOK, 1});
         }
         Input *input = AddInputTagList(label.c_str(), id.c_str(), linkTags);
-        linkTags.Add({InputNotify, 1});
         Input *name = AddInputTagList(nameLabel.c_str(), nameId.c_str(),
                                       {{LinkDataType, CLSID_DataType_Text},
                                        {InputControl, CLSID_InputControl_TextEdit},
