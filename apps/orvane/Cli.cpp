@@ -37,8 +37,8 @@ IDeviceContext *ChooseDevice(const char *command, const std::string &choice, con
     IDeviceContext *device = GetApp()->Device(wanted, &error);
     if (!device && wanted != DeviceChoice::Auto) {
         if (fromCommandLine) throw CliError(ExitUsage, std::string(command) + ": --device " + choice + ": " + error);
-        const std::string why = std::string("the document asks for ") + DeviceChoiceName(wanted) + ": " + error +
-                                "; rendering on the CPU";
+        const std::string why =
+            std::string("the document asks for ") + DeviceChoiceName(wanted) + ": " + error + "; rendering on the CPU";
         if (json)
             std::printf("{\"event\": \"warning\", \"code\": \"device\", \"device\": %s, \"warning\": %s}\n",
                         JsonString(DeviceChoiceName(wanted)).c_str(), JsonString(why).c_str());

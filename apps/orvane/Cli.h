@@ -47,8 +47,7 @@ void LoadLibrary();
 /// usage error; one chosen by the preference falls back to the CPU with a
 /// warning on stderr. Null: rows on the CPU.
 /// With `json` that warning is an object on stdout ("code": "device").
-IDeviceContext *ChooseDevice(const char *command, const std::string &choice, const OrvaneDoc &doc,
-                             bool json = false);
+IDeviceContext *ChooseDevice(const char *command, const std::string &choice, const OrvaneDoc &doc, bool json = false);
 /// Prints the device runs that failed during a render (the rows made those
 /// frames) as "WARNING: device: ..." lines on stderr.
 void ReportDeviceLog(const RenderTask &task);
