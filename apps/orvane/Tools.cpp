@@ -183,6 +183,19 @@ void PrintInput(const InputLine &in) {
     fmt::print("{}\n", list);
 }
 
+/// Calls `onPage` with a page's name where a new page begins, then `onInput` for each input, in order.
+template <class OnPage, class OnInput> void ForEachInputByPage(const Operator &op, OnPage onPage, OnInput onInput) {
+    int page = -2;
+    for (const auto &in : op.Inputs()) {
+        if (in->Page() != page) {
+            page = in->Page();
+            const auto &pages = op.Pages();
+            onPage(page >= 0 && page < static_cast<int>(pages.size()) ? pages[page].name : std::string("Controls"));
+        }
+        onInput(*in);
+    }
+}
+
 /// Markdown table cells must not hold '|' or line breaks.
 std::string Cell(std::string text) {
     std::string out;
@@ -201,22 +214,20 @@ void PrintMarkdown(const Registry &row, const Operator *op) {
     fmt::print("| Attributes | {} |\n", Attributes(row));
     fmt::print("| Built | {} |\n", BuiltWord(row));
     if (!op) return;
-    int page = -2;
-    for (const auto &in : op->Inputs()) {
-        if (in->Page() != page) {
-            page = in->Page();
-            const auto &pages = op->Pages();
-            fmt::print("\n## Page \"{}\"\n\n| ID | Label | Type | Details |\n|---|---|---|---|\n",
-                       page >= 0 && page < static_cast<int>(pages.size()) ? pages[page].name : std::string("Controls"));
-        }
-        const InputLine line = DescribeInput(*in);
-        std::string details = line.details;
-        if (!line.choices.empty()) {
-            details += "; choices: ";
-            for (size_t i = 0; i < line.choices.size(); ++i) details += (i ? ", " : "") + line.choices[i];
-        }
-        fmt::print("| `{}` | {} | {} | {} |\n", line.id, Cell(line.label), Cell(line.type), Cell(details));
-    }
+    ForEachInputByPage(
+        *op,
+        [](const std::string &page) {
+            fmt::print("\n## Page \"{}\"\n\n| ID | Label | Type | Details |\n|---|---|---|---|\n", page);
+        },
+        [](const Input &in) {
+            const InputLine line = DescribeInput(in);
+            std::string details = line.details;
+            if (!line.choices.empty()) {
+                details += "; choices: ";
+                for (size_t i = 0; i < line.choices.size(); ++i) details += (i ? ", " : "") + line.choices[i];
+            }
+            fmt::print("| `{}` | {} | {} | {} |\n", line.id, Cell(line.label), Cell(line.type), Cell(details));
+        });
     fmt::print("\n## Outputs\n\n| ID | Type |\n|---|---|\n");
     for (const auto &out : op->Outputs()) fmt::print("| `{}` | {} |\n", out->ID().Text(), TypeWord(out->DataType()));
 }
@@ -304,16 +315,9 @@ int RunDescribe(const std::vector<std::string> &args) {
     if (const std::string o = Joined(t, RegOldClassId); !o.empty()) fmt::print("  {:<14} {}\n", "old IDs:", o);
     fmt::print("  {:<14} {}\n", "built:", BuiltWord(row));
     if (!op) return ExitOk;
-    int page = -2;
-    for (const auto &in : op->Inputs()) {
-        if (in->Page() != page) {
-            page = in->Page();
-            const auto &pages = op->Pages();
-            fmt::print("\npage \"{}\"\n",
-                       page >= 0 && page < static_cast<int>(pages.size()) ? pages[page].name : std::string("Controls"));
-        }
-        PrintInput(DescribeInput(*in));
-    }
+    ForEachInputByPage(
+        *op, [](const std::string &page) { fmt::print("\npage \"{}\"\n", page); },
+        [](const Input &in) { PrintInput(DescribeInput(in)); });
     fmt::print("\noutputs\n");
     for (const auto &out : op->Outputs()) fmt::print("  {:<28} {}\n", out->ID().Text(), TypeWord(out->DataType()));
     return ExitOk;

@@ -11,17 +11,16 @@ namespace Orvane {
 
 IOClass::~IOClass() = default;
 
-namespace {
-
-/// What a file that is not a regular file is, in words.
-const char *KindOfFile(mode_t mode) {
-    if (S_ISDIR(mode)) return "a directory";
+const char *FileKindName(unsigned mode) {
+    if (S_ISDIR(mode)) return "a folder";
     if (S_ISFIFO(mode)) return "a FIFO";
     if (S_ISCHR(mode)) return "a character device";
     if (S_ISBLK(mode)) return "a block device";
     if (S_ISSOCK(mode)) return "a socket";
-    return "not a plain file";
+    return "not a regular file";
 }
+
+namespace {
 
 /// Opens `path` for reading without ever waiting: O_NONBLOCK keeps a FIFO
 /// without a writer from blocking the open, and anything but a regular file
@@ -35,7 +34,7 @@ std::FILE *OpenForReading(const std::string &path, std::string &error) {
     struct stat st {};
     const bool statted = fstat(fd, &st) == 0;
     if (!statted || !S_ISREG(st.st_mode)) {
-        error = statted ? path + " is not a regular file (" + KindOfFile(st.st_mode) + ")"
+        error = statted ? path + " is not a regular file (" + FileKindName(st.st_mode) + ")"
                         : path + ": " + std::strerror(errno);
         ::close(fd);
         return nullptr;

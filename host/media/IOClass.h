@@ -85,4 +85,8 @@ private:
     int64_t pos_ = 0;
 };
 
+/// What a file that is not a regular file is, in words for messages: "a
+/// folder", "a FIFO", "a character device", ... (`mode` as stat gives it).
+ORVANE_API const char *FileKindName(unsigned mode);
+
 } // namespace Orvane

@@ -9,6 +9,8 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include "host/media/IOClass.h"
+
 namespace Orvane {
 namespace {
 
@@ -16,15 +18,6 @@ namespace fs = std::filesystem;
 
 constexpr const char *kTempMark = ".orvane-tmp-";
 constexpr auto kForeignTempAge = std::chrono::hours(1);
-
-const char *KindOf(mode_t mode) {
-    if (S_ISDIR(mode)) return "a folder";
-    if (S_ISCHR(mode)) return "a character device";
-    if (S_ISBLK(mode)) return "a block device";
-    if (S_ISFIFO(mode)) return "a FIFO";
-    if (S_ISSOCK(mode)) return "a socket";
-    return "not a regular file";
-}
 
 /// This host's name as it goes into temporary names (letters, digits, '.', '_', '-').
 const std::string &HostName() {
@@ -61,14 +54,14 @@ bool ResolveOutputFile(const std::string &path, std::string &target, std::string
             return false;
         }
         if (!S_ISREG(to.st_mode)) {
-            error = path + ": a symbolic link to " + KindOf(to.st_mode) + " (" + resolved.string() +
+            error = path + ": a symbolic link to " + FileKindName(to.st_mode) + " (" + resolved.string() +
                     "); refusing to write over it";
             return false;
         }
         target = resolved.string();
         return true;
     }
-    error = path + ": " + KindOf(st.st_mode) + ", not a regular file; refusing to write over it";
+    error = path + ": " + FileKindName(st.st_mode) + ", not a regular file; refusing to write over it";
     return false;
 }
 

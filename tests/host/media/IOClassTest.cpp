@@ -182,8 +182,7 @@ TEST(FileIO, ReadingRefusesWhatIsNotARegularFileWithoutWaiting) {
     const std::string fifo = tmp.path + ".fifo", folder = tmp.path + ".dir";
     ASSERT_EQ(mkfifo(fifo.c_str(), 0600), 0);
     ASSERT_EQ(mkdir(folder.c_str(), 0700), 0);
-    for (auto [path, kind] :
-         {std::pair{fifo, "a FIFO"}, {folder, "a directory"}, {"/dev/null", "a character device"}}) {
+    for (auto [path, kind] : {std::pair{fifo, "a FIFO"}, {folder, "a folder"}, {"/dev/null", "a character device"}}) {
         auto opening = std::async(std::launch::async, [path = path] {
             std::string error;
             return FileIO::Open(path, FileIO::Mode::Read, error) ? std::string("opened") : error;
