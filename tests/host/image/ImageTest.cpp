@@ -81,108 +81,57 @@ FltPixel PutAt(const Image &put, const ImgRectI &dw, int x, int y) { return put.
 // ---------------------------------------------------------------------------------------------------------------
 // Formats, windows and rows
 
-TEST(ImageFormat, FormatOfEveryDepth) {
-    const struct {
-        int channels, bytes;
-        ComponentType type;
-    } formats[] = {{1, 1, ComponentType::Int8},  {1, 2, ComponentType::Int16}, {1, 2, ComponentType::Flt16},
-                   {1, 4, ComponentType::Flt32}, {4, 1, ComponentType::Int8},  {4, 2, ComponentType::Int16},
-                   {4, 2, ComponentType::Flt16}, {4, 4, ComponentType::Flt32}};
-    for (int depth : AllDepths) {
-        SCOPED_TRACE(depth);
-        const auto &want = formats[depth - 1];
-        const PixelFormat f = FormatOfDepth(depth);
-        EXPECT_EQ(f.depth, depth);
-        EXPECT_EQ(f.channels, want.channels);
-        EXPECT_EQ(f.bytesPerComponent, want.bytes);
-        EXPECT_EQ(f.type, want.type);
-        EXPECT_EQ(f.isFloat, want.type == ComponentType::Flt16 || want.type == ComponentType::Flt32);
-        EXPECT_EQ(Image(3, 2, depth).BytesPerPixel(), want.channels * want.bytes);
-    }
-    for (int bad : {0, 9, -1, 100}) {
-        EXPECT_EQ(FormatOfDepth(bad).depth, 0) << bad;
-        EXPECT_EQ(FormatOfDepth(bad).BytesPerPixel(), 0) << bad;
-        EXPECT_FALSE(IsValidDepth(bad));
-    }
-}
-
-TEST(ImageWindows, DataWindowOnlyBeforeRows) {
+TEST(ImageWindows, DataWindowOnlyBeforeRowsValidWindowInsideIt) {
     auto img = MakeImage(10, 6, 7);
-    EXPECT_EQ(img->DataWindow(), ImgRectI(0, 0, 10, 6));
     EXPECT_EQ(img->ValidWindow(), ImgRectI(0, 0, 10, 6));
     img->SetDataWindow(ImgRectI(-4, -2, 7, 5));
     EXPECT_EQ(img->ValidWindow(), ImgRectI(0, 0, 7, 5)); // clipped to the new data window
     img->SetValidWindow(ImgRectI(-10, 1, 3, 20));
     EXPECT_EQ(img->ValidWindow(), ImgRectI(-4, 1, 3, 5));
-    img->SetValidWindow(ImgRectI(50, 50, 60, 60));
-    EXPECT_TRUE(img->ValidWindow().IsNull());
-
     img->SetDataWindow(ImgRectI(1, 1, 5, 4)); // still without rows: allowed
     ASSERT_TRUE(img->AllocScanLineData());
     img->SetDataWindow(ImgRectI(0, 0, 10, 6)); // rows exist: ignored
     EXPECT_EQ(img->DataWindow(), ImgRectI(1, 1, 5, 4));
-    EXPECT_EQ(img->RowBytes(), 4u * 8u);
-
     auto empty = MakeImage(4, 4, 8);
-    empty->SetDataWindow(ImgRectI(3, 3, 3, 9)); // a null window
-    EXPECT_TRUE(empty->ValidWindow().IsNull());
-    EXPECT_TRUE(empty->AllocScanLineData());
+    empty->SetDataWindow(ImgRectI(3, 3, 3, 9)); // a null window: rows of nothing
+    EXPECT_TRUE(empty->ValidWindow().IsNull() && empty->AllocScanLineData());
     EXPECT_EQ(empty->ScanLine(3), nullptr);
-    EXPECT_EQ(empty->GetFlt(3, 3), FltPixel{});
 }
 
-TEST(ImageRows, AllocatedLateAndZeroed) {
+TEST(ImageRows, AllocatedLateZeroedAndOnlyInTheDataWindow) {
+    const size_t bytesPerPixel[] = {1, 2, 2, 4, 4, 8, 8, 16};
     for (int depth : AllDepths) {
         SCOPED_TRACE(depth);
         const ImgRectI dw(-3, -2, 5, 4);
+        const size_t bpp = bytesPerPixel[depth - 1];
         auto img = MakeImage(6, 4, depth, &dw);
-        EXPECT_EQ(img->ScanLine(0), nullptr);
-        EXPECT_EQ(img->PixelAddress(0, 0), nullptr);
-        EXPECT_EQ(img->DataBytes(), 0u);
         img->PutFlt(0, 0, {1, 1, 1, 1}); // nowhere to go yet
-        EXPECT_FALSE(img->HasScanLineData());
-
+        EXPECT_TRUE(!img->HasScanLineData() && !img->ScanLine(0) && !img->PixelAddress(0, 0) && !img->DataBytes());
         ASSERT_TRUE(img->AllocScanLineData());
-        const size_t bpp = FormatOfDepth(depth).BytesPerPixel();
         EXPECT_EQ(img->RowBytes(), 8 * bpp);
         EXPECT_EQ(img->DataBytes(), 8 * 6 * bpp);
-        std::vector<uint8_t *> rows;
         for (int y = dw.y0; y < dw.y1; ++y) {
-            uint8_t *row = img->ScanLine(y);
+            const uint8_t *row = img->ScanLine(y);
             ASSERT_NE(row, nullptr) << y;
-            EXPECT_EQ(img->Row<uint8_t>(y), row);
             for (size_t i = 0; i < img->RowBytes(); ++i) ASSERT_EQ(row[i], 0) << "byte " << i << " of row " << y;
             for (int x = dw.x0; x < dw.x1; ++x) EXPECT_EQ(img->PixelAddress(x, y), row + (x - dw.x0) * bpp);
-            rows.push_back(row);
         }
-        // Rows do not overlap: mark each fully and read the marks back.
-        for (size_t i = 0; i < rows.size(); ++i) std::memset(rows[i], int(i) + 1, img->RowBytes());
-        for (size_t i = 0; i < rows.size(); ++i)
-            for (size_t b = 0; b < img->RowBytes(); ++b) ASSERT_EQ(rows[i][b], i + 1);
-        // Outside the data window there is no address.
-        for (int y : {dw.y0 - 1, dw.y1, -100, 100}) EXPECT_EQ(img->ScanLine(y), nullptr) << y;
-        for (auto [x, y] : {std::pair{dw.x0 - 1, 0}, {dw.x1, 0}, {0, dw.y0 - 1}, {0, dw.y1}, {dw.x1, dw.y1}})
+        for (int y : {dw.y0 - 1, dw.y1, 100}) EXPECT_EQ(img->ScanLine(y), nullptr) << y;
+        for (auto [x, y] : {std::pair{dw.x0 - 1, 0}, {dw.x1, 0}, {0, dw.y0 - 1}, {0, dw.y1}})
             EXPECT_EQ(img->PixelAddress(x, y), nullptr) << x << ", " << y;
-        // A second call keeps the rows and their contents.
-        ASSERT_TRUE(img->AllocScanLineData());
-        EXPECT_EQ(img->ScanLine(dw.y0), rows[0]);
-        EXPECT_EQ(rows[0][0], 1);
     }
-    auto none = MakeImage(8, 8, 8);
+    auto none = MakeImage(8, 8, 8); // an image for pre-calculation never gets rows
     none->SetNoData(true);
     EXPECT_FALSE(none->AllocScanLineData());
     none->Fill({1, 1, 1, 1});
     EXPECT_FALSE(none->HasScanLineData());
-    none->SetCanvasColor(FltPixel{0.5f, 0.25f, 0, 1});
-    EXPECT_EQ(none->GetFlt(2, 2), (FltPixel{0.5f, 0.25f, 0, 1}));
 }
 
-TEST(ImageCanvas, OutsideTheDataWindow) {
+TEST(ImageCanvas, OutsideTheDataWindowAndWithoutRows) {
     const ImgRectI dw(1, 1, 4, 3);
     auto img = MakeImage(5, 4, 6, &dw);
     const FltPixel canvas{0.1f, 0.2f, 0.3f, 0.4f};
     img->SetCanvasColor(canvas);
-    EXPECT_FALSE(img->IsCanvasColorClear());
     EXPECT_EQ(img->GetFlt(2, 2), canvas); // no rows yet: all canvas
     ASSERT_TRUE(img->AllocScanLineData());
     img->PutFlt(2, 2, {1, 1, 1, 1});
@@ -194,13 +143,10 @@ TEST(ImageCanvas, OutsideTheDataWindow) {
             if (!dw.Contains(x, y)) {
                 EXPECT_EQ(img->GetFlt(x, y), canvas) << x << ", " << y;
             }
-
     // The canvas as 16-bit components.
-    img->SetCanvasColor(Pixel{65535, 0, 32768, 257});
-    const FltPixel f = img->GetCanvasColor();
-    EXPECT_NEAR(f.R, 1.0, 1e-7);
-    EXPECT_NEAR(f.B, 32768 / 65535.0, 1e-7);
-    EXPECT_NEAR(f.A, 257 / 65535.0, 1e-9);
+    const Pixel wide{65535, 0, 32768, 257};
+    img->SetCanvasColor(wide);
+    for (int c = 0; c < 4; ++c) EXPECT_NEAR(Channel(img->GetCanvasColor(), c), (&wide.R)[c] / 65535.0, 1e-7) << c;
     Pixel p;
     img->GetCanvasColor(p);
     EXPECT_EQ(p, (Pixel{65535, 0, 32768, 257}));
@@ -486,24 +432,25 @@ TEST(ImageServices, CopyOfImageIsDeep) {
     ASSERT_TRUE(src->AddAuxChannel(AuxChannelKind::Z));
     for (int y = dw.y0; y < dw.y1; ++y)
         for (int i = 0; i < dw.Width(); ++i) src->AuxRow(AuxChannelKind::Z, y)[i] = y * 100.0f + i;
+    auto bare = MakeImage(4, 3, 3); // without rows: a copy without rows, with the same channels listed
+    bare->AddAuxChannel(AuxChannelKind::VectorX);
 
-    Ref<Image> copy = CopyOfImage(src.Get());
-    ASSERT_TRUE(copy && copy.Get() != src.Get());
-    EXPECT_EQ(copy->XScale() / copy->YScale(), 4.0);
-    EXPECT_EQ(copy->DataWindow(), dw);
-    EXPECT_EQ(copy->ValidWindow(), ImgRectI(0, 0, 5, 5));
+    Ref<Image> copy = CopyOfImage(src.Get()), bareCopy = CopyOfImage(bare.Get());
+    ASSERT_TRUE(copy && bareCopy);
+    EXPECT_TRUE(copy->XScale() == 2.0 && copy->YScale() == 0.5 && copy->ValidWindow() == ImgRectI(0, 0, 5, 5));
     EXPECT_EQ(copy->GetCanvasColor(), src->GetCanvasColor());
     EXPECT_EQ(copy->GetAttrL(ImgFullWidth), 100);
+    EXPECT_TRUE(SameBits(*copy, *src));
     for (int y = dw.y0; y < dw.y1; ++y) {
-        EXPECT_NE(copy->ScanLine(y), src->ScanLine(y));
-        EXPECT_EQ(std::memcmp(copy->ScanLine(y), src->ScanLine(y), src->RowBytes()), 0) << y;
         ASSERT_NE(copy->AuxRow(AuxChannelKind::Z, y), nullptr);
-        EXPECT_NE(copy->AuxRow(AuxChannelKind::Z, y), src->AuxRow(AuxChannelKind::Z, y));
         EXPECT_EQ(std::memcmp(copy->AuxRow(AuxChannelKind::Z, y), src->AuxRow(AuxChannelKind::Z, y),
                               dw.Width() * sizeof(float)),
                   0);
     }
     EXPECT_FALSE(copy->HasAuxChannel(AuxChannelKind::U));
+    EXPECT_FALSE(bareCopy->HasScanLineData());
+    EXPECT_TRUE(bareCopy->HasAuxChannel(AuxChannelKind::VectorX));
+    EXPECT_FALSE(CopyOfImage(nullptr));
     // Writing to the copy leaves the source alone; the attributes' text belongs to the copy.
     const FltPixel before = src->GetFlt(3, 3);
     copy->PutFlt(3, 3, {0, 0, 0, 0});
@@ -512,60 +459,41 @@ TEST(ImageServices, CopyOfImageIsDeep) {
     EXPECT_EQ(src->AuxRow(AuxChannelKind::Z, 1)[2], 102.0f);
     src.Reset();
     EXPECT_STREQ(copy->Attrs().GetText(0x30020f00), "copied note");
-
-    // Without rows: a copy without rows, with the same channels listed; Copy() of the parameter is deep too.
-    auto bare = MakeImage(4, 3, 3);
-    bare->AddAuxChannel(AuxChannelKind::VectorX);
-    Ref<Image> bareCopy = CopyOfImage(bare.Get());
-    ASSERT_TRUE(bareCopy);
-    EXPECT_FALSE(bareCopy->HasScanLineData());
-    EXPECT_TRUE(bareCopy->HasAuxChannel(AuxChannelKind::VectorX));
-    EXPECT_FALSE(CopyOfImage(nullptr));
+    // Copy() of the parameter is the same deep copy.
     Ref<Parameter> asParam = copy->Copy();
     auto *paramImage = dynamic_cast<Image *>(asParam.Get());
     ASSERT_TRUE(paramImage && paramImage != copy.Get());
-    EXPECT_EQ(paramImage->GetFlt(3, 3), copy->GetFlt(3, 3));
+    EXPECT_TRUE(SameBits(*paramImage, *copy));
 }
 
 TEST(ImageAux, PlanesBesideTheColourRows) {
     const ImgRectI dw(1, 1, 6, 4);
     auto img = MakeImage(5, 4, 8, &dw);
     ASSERT_TRUE(img->AddAuxChannel(AuxChannelKind::Z)); // before rows: no storage yet
-    EXPECT_TRUE(img->HasAuxChannel(AuxChannelKind::Z));
-    EXPECT_FALSE(img->HasAuxChannel(AuxChannelKind::U));
+    EXPECT_TRUE(img->HasAuxChannel(AuxChannelKind::Z) && !img->HasAuxChannel(AuxChannelKind::U));
     EXPECT_EQ(img->AuxRow(AuxChannelKind::Z, 1), nullptr);
-
     const Ref<Image> put = PutPattern(*img, 17);
-    std::vector<uint8_t *> colourRows;
-    for (int y = dw.y0; y < dw.y1; ++y) {
-        colourRows.push_back(img->ScanLine(y));
-        float *z = img->AuxRow(AuxChannelKind::Z, y);
-        ASSERT_NE(z, nullptr) << y;
-        for (int i = 0; i < dw.Width(); ++i) EXPECT_EQ(z[i], 0.0f);
-    }
+    const Ref<Image> colour = CopyOfImage(img.Get());
     for (int y : {0, 4, -5}) EXPECT_EQ(img->AuxRow(AuxChannelKind::Z, y), nullptr) << y;
+    for (int y = dw.y0; y < dw.y1; ++y) std::fill_n(img->AuxRow(AuxChannelKind::Z, y), dw.Width(), -7.0f);
     EXPECT_EQ(img->AuxRow(AuxChannelKind::U, 1), nullptr);
-
-    // Added after the rows: storage at once, zeroed; the colour rows stay where they were.
-    ASSERT_TRUE(img->AddAuxChannel(AuxChannelKind::Coverage));
-    for (int y = dw.y0; y < dw.y1; ++y) {
-        EXPECT_EQ(img->ScanLine(y), colourRows[y - dw.y0]);
-        const float *c = img->AuxRow(AuxChannelKind::Coverage, y);
-        ASSERT_NE(c, nullptr);
-        for (int i = 0; i < dw.Width(); ++i) EXPECT_EQ(c[i], 0.0f);
-        for (int x = dw.x0; x < dw.x1; ++x) EXPECT_EQ(img->GetFlt(x, y), PutAt(*put, dw, x, y)) << x << ", " << y;
-    }
-    // Every kind (Z again included: the same plane) has a plane of its own.
+    // Every kind has a plane of its own (Z again: the same plane, the others
+    // zeroed, added after the rows); the colour rows stay as they were.
     const int kinds = static_cast<int>(AuxChannelKind::Count);
     for (int k = 0; k < kinds; ++k) {
-        ASSERT_TRUE(img->AddAuxChannel(static_cast<AuxChannelKind>(k)));
+        const auto kind = static_cast<AuxChannelKind>(k);
+        ASSERT_TRUE(img->AddAuxChannel(kind));
         for (int y = dw.y0; y < dw.y1; ++y)
-            for (int i = 0; i < dw.Width(); ++i) img->AuxRow(static_cast<AuxChannelKind>(k), y)[i] = k * 1000.0f + y;
+            for (int i = 0; i < dw.Width(); ++i) {
+                ASSERT_EQ(img->AuxRow(kind, y)[i], k == 0 ? -7.0f : 0.0f) << k;
+                img->AuxRow(kind, y)[i] = k * 1000.0f + y;
+            }
     }
     for (int k = 0; k < kinds; ++k)
         for (int y = dw.y0; y < dw.y1; ++y)
             for (int i = 0; i < dw.Width(); ++i)
                 ASSERT_EQ(img->AuxRow(static_cast<AuxChannelKind>(k), y)[i], k * 1000.0f + y) << k;
+    EXPECT_TRUE(SameBits(*img, *colour));
 }
 
 // ---------------------------------------------------------------------------------------------------------------
@@ -608,17 +536,11 @@ TEST(NewImage, LikeImageExplicitTagsAndAttributes) {
     like->SetDataWindow(ImgRectI(-5, -5, 40, 25));
     like->SetCanvasColor(FltPixel{1, 0, 0, 1});
     like->SetAttrsTagList({{ImgFullWidth, 60}, {ImgField, 1}, {ImgFieldOffset, 0.5}});
-
     Ref<Image> same = NewImageTagList({{ImgLikeImage, like.Get()}});
     ASSERT_TRUE(same);
-    EXPECT_EQ(same->Depth(), 6);
-    EXPECT_EQ(same->YScale(), 0.5);
-    EXPECT_EQ(same->GetAttrL(ImgField), 1);
-    EXPECT_EQ(same->GetAttrD(ImgFieldOffset), 0.5);
+    EXPECT_TRUE(same->Depth() == 6 && same->YScale() == 0.5 && same->GetAttrD(ImgFieldOffset) == 0.5);
     EXPECT_EQ(same->DataWindow(), ImgRectI(0, 0, 30, 20)); // the image rectangle, not the like-image's window
     EXPECT_TRUE(same->IsCanvasColorClear());
-    EXPECT_FALSE(same->HasScanLineData());
-
     // Explicit tags win over the like-image, which keeps its own.
     Ref<Image> changed = NewImageTagList({{ImgLikeImage, like.Get()},
                                           {ImgWidth, 7},
@@ -627,15 +549,10 @@ TEST(NewImage, LikeImageExplicitTagsAndAttributes) {
                                           {ImgField, 2},
                                           {ImgFullHeight, 99}});
     ASSERT_TRUE(changed);
-    EXPECT_EQ(changed->Width(), 7);
-    EXPECT_EQ(changed->Height(), 20);
-    EXPECT_EQ(changed->Depth(), 1);
-    EXPECT_EQ(changed->XScale(), 3.0);
-    EXPECT_EQ(changed->GetAttrL(ImgField), 2);
-    EXPECT_EQ(changed->GetAttrL(ImgFullHeight), 99);
-    EXPECT_EQ(changed->GetAttrL(ImgFullWidth), 60);
-    EXPECT_EQ(like->GetAttrL(ImgField), 1);
-    EXPECT_FALSE(like->Attrs().Has(ImgFullHeight));
+    EXPECT_TRUE(changed->Width() == 7 && changed->Height() == 20 && changed->Depth() == 1 && changed->XScale() == 3.0);
+    EXPECT_TRUE(changed->GetAttrL(ImgField) == 2 && changed->GetAttrL(ImgFullHeight) == 99 &&
+                changed->GetAttrL(ImgFullWidth) == 60);
+    EXPECT_TRUE(like->GetAttrL(ImgField) == 1 && !like->Attrs().Has(ImgFullHeight));
 
     // Every attribute tag is recorded; tags that are not attributes are not.
     const std::pair<Tag, long long> longs[] = {
@@ -648,8 +565,7 @@ TEST(NewImage, LikeImageExplicitTagsAndAttributes) {
     ASSERT_TRUE(img);
     for (auto [tag, value] : longs) EXPECT_EQ(img->GetAttrL(tag, -1), value) << std::hex << tag;
     for (auto [tag, value] : doubles) EXPECT_EQ(img->GetAttrD(tag, -1), value) << std::hex << tag;
-    EXPECT_FALSE(img->Attrs().Has(ImgWidth));
-    EXPECT_FALSE(img->Attrs().Has(ImgDepth));
+    EXPECT_FALSE(img->Attrs().Has(ImgWidth) || img->Attrs().Has(ImgDepth));
     EXPECT_TRUE(NewImageTagList({{ImgWidth, 4}, {ImgHeight, 4}})->Attrs().Empty());
 }
 
@@ -669,8 +585,7 @@ TEST(NewImage, WindowsNoDataCanvasAndAbort) {
         if (w.validTag) tags.Add({ImgValidWindow, w.valid});
         Ref<Image> img = NewImageTagList(tags);
         ASSERT_TRUE(img);
-        EXPECT_EQ(img->DataWindow(), w.wantData);
-        EXPECT_EQ(img->ValidWindow(), w.wantValid);
+        EXPECT_TRUE(img->DataWindow() == w.wantData && img->ValidWindow() == w.wantValid);
     }
     const FltPixel canvas{0.25f, 0.5f, 0.75f, 1.0f};
     std::atomic<bool> abort{false};
@@ -683,9 +598,7 @@ TEST(NewImage, WindowsNoDataCanvasAndAbort) {
     abort = true;
     EXPECT_TRUE(e->CheckAbort());
     Ref<Image> f = NewImageTagList({{ImgWidth, 10}, {ImgHeight, 6}, {ImgNoData, false}, {ImgCanvasColor, nullptr}});
-    ASSERT_TRUE(f);
-    EXPECT_TRUE(f->IsCanvasColorClear());
-    EXPECT_TRUE(f->AllocScanLineData());
+    ASSERT_TRUE(f && f->IsCanvasColorClear() && f->AllocScanLineData());
 }
 
 } // namespace
