@@ -131,7 +131,7 @@ TEST(FastPow, SameBitsWhereverAValueLiesAndInPlace) {
     std::vector<float> pool;
     for (int i = 0; i < 97; ++i) pool.push_back(std::ldexp(1.0f + 0.37f * static_cast<float>(i % 7), i % 41 - 20));
     pool[5] = 0.0f, pool[11] = -kInf, pool[17] = kNaN, pool[23] = FromBits(3), pool[29] = -0.3f;
-    for (float e : {0.4545f, 2.2f, 100.0f}) {
+    for (float e : {0.4545f, 1.0f, 2.2f, 100.0f}) {
         std::vector<float> single(pool.size());
         for (size_t i = 0; i < pool.size(); ++i) PowAbsSigned(&pool[i], e, &single[i], 1);
         for (int count : {0, 1, 2, 3, 4, 5, 7, 8, 9, 15, 16, 17, 31, 33, 63, 64, 65, 97})
