@@ -1,9 +1,9 @@
 #include "host/color/GammaTable.h"
 
+#include <bit>
 #include <cfloat>
 #include <cmath>
 #include <cstdint>
-#include <cstring>
 #include <limits>
 #include <vector>
 
@@ -20,11 +20,7 @@ std::vector<float> GammaSweepInputs() {
     std::vector<float> xs;
     const int n = 1 << 18;
     for (int k = 0; k <= n; ++k) xs.push_back(static_cast<float>(k) / n);
-    for (uint32_t bits = 1; bits <= 0x3f800000u; bits += 4099) {
-        float x;
-        std::memcpy(&x, &bits, sizeof x);
-        xs.push_back(x);
-    }
+    for (uint32_t bits = 1; bits <= 0x3f800000u; bits += 4099) xs.push_back(std::bit_cast<float>(bits));
     xs.push_back(std::nextafter(1.0f, 0.0f));
     return xs;
 }
@@ -56,151 +52,111 @@ TEST(GammaTable, FloatCurveMatchesPowOverDenseSweep) {
 }
 
 TEST(GammaTable, FloatCurveIsMonotoneForIncreasingPowers) {
-    const std::vector<float> xs = [] {
-        std::vector<float> v;
-        for (int k = 0; k <= 1 << 18; ++k) v.push_back(static_cast<float>(k) / (1 << 18));
-        return v;
-    }();
     for (double e : {0.1, 1 / 2.2, 2.2, 100.0, 1e5}) {
         GammaTable t;
         t.InitTableFlt(nullptr, 1.0, e);
-        float prev = t.LookupFlt(xs[0]);
-        for (float x : xs) {
-            float y = t.LookupFlt(x);
-            ASSERT_GE(y, prev) << "exponent " << e << " at x = " << x;
-            prev = y;
+        for (int k = 1; k <= 1 << 18; ++k) {
+            const float x = static_cast<float>(k) / (1 << 18), before = static_cast<float>(k - 1) / (1 << 18);
+            ASSERT_GE(t.LookupFlt(x), t.LookupFlt(before)) << "exponent " << e << " at x = " << x;
         }
     }
 }
 
 TEST(GammaTable, FloatCurveOutsideZeroToOne) {
-    GammaTable t;
+    GammaTable t, neg;
     t.InitTableFlt(nullptr, 1.0, 2.2);
-    // Below 0 and NaN read as 0.
-    EXPECT_EQ(t.LookupFlt(-0.5f), 0.0f);
-    EXPECT_EQ(t.LookupFlt(-1e30f), 0.0f);
-    EXPECT_EQ(t.LookupFlt(-std::numeric_limits<float>::infinity()), 0.0f);
-    EXPECT_EQ(t.LookupFlt(std::numeric_limits<float>::quiet_NaN()), 0.0f);
-    // Above 1 the true power.
-    for (float x : {1.0000001f, 1.5f, 2.0f, 16.0f, 1000.0f}) {
-        double expected = std::pow(static_cast<double>(x), 2.2);
-        EXPECT_NEAR(t.LookupFlt(x), expected, expected * 2 * FLT_EPSILON) << x;
-    }
-    // Past the float range the result is held at the largest float.
+    neg.InitTableFlt(nullptr, -2.0, 2.0);
+    // Below 0 and NaN read as 0; past the float range the result is held at the largest float.
+    for (float x : {-0.5f, -1e30f, -std::numeric_limits<float>::infinity(), std::numeric_limits<float>::quiet_NaN()})
+        EXPECT_EQ(t.LookupFlt(x), 0.0f) << x;
     EXPECT_EQ(t.LookupFlt(1e30f), FLT_MAX);
     EXPECT_EQ(t.LookupFlt(std::numeric_limits<float>::infinity()), FLT_MAX);
-
-    GammaTable neg;
-    neg.InitTableFlt(nullptr, -2.0, 2.0);
+    EXPECT_EQ(neg.LookupFlt(1e30f), -FLT_MAX);
+    // Above 1 the true power, scale included.
+    for (float x : {1.0000001f, 1.5f, 2.0f, 16.0f, 1000.0f}) {
+        const double expected = std::pow(static_cast<double>(x), 2.2);
+        EXPECT_NEAR(t.LookupFlt(x), expected, expected * 2 * FLT_EPSILON) << x;
+    }
     EXPECT_NEAR(neg.LookupFlt(0.25f), -0.125, 1e-6);
     EXPECT_NEAR(neg.LookupFlt(3.0f), -18.0, 1e-5);
-    EXPECT_EQ(neg.LookupFlt(1e30f), -FLT_MAX);
 }
 
 TEST(GammaTable, ExponentOneIsExactIdentity) {
-    GammaTable t;
+    GammaTable t, t16;
     t.InitTableFlt(nullptr, 1.0, 1.0);
-    for (int k = 0; k <= 1 << 24; ++k) {
-        float x = static_cast<float>(k) / (1 << 24);
-        ASSERT_EQ(t.LookupFlt(x), x);
-    }
+    t16.InitTable(nullptr, 1.0);
+    for (int k = 0; k <= 1 << 24; ++k) ASSERT_EQ(t.LookupFlt(static_cast<float>(k) / (1 << 24)), k / 16777216.0f);
     for (uint32_t bits = 0; bits < 0x7f800000u; bits += 8191) { // every float magnitude, 0 to FLT_MAX
-        float x;
-        std::memcpy(&x, &bits, sizeof x);
+        const float x = std::bit_cast<float>(bits);
         ASSERT_EQ(t.LookupFlt(x), x) << bits;
     }
     EXPECT_EQ(t.LookupFlt(FLT_MAX), FLT_MAX);
-
-    GammaTable t16;
-    t16.InitTable(nullptr, 1.0);
     for (int v = 0; v < 65536; ++v) ASSERT_EQ(t16.Lookup(static_cast<uint16_t>(v)), v);
 }
 
-TEST(GammaTable, HugeExponents) {
-    for (double e : {1e5, std::numeric_limits<double>::infinity()}) {
-        SCOPED_TRACE(e);
+TEST(GammaTable, DegenerateExponentsAndTablesNotYetBuilt) {
+    const double inf = std::numeric_limits<double>::infinity(), nan = std::nan("");
+    // Exponent 0 is 1 everywhere (0^0 = 1, below 0 read as 0); a negative
+    // one is taken as 0, NaN as 1; a huge one is 0 below 1 and 1 at 1.
+    const struct {
+        double scale, exponent;
+        float x, want;
+    } floats[] = {{3, 0, 0, 3},   {3, 0, 1e-30f, 3}, {3, 0, 7, 3},         {3, 0, -1, 3},
+                  {1, -2, 0, 1},  {1, -2, 0.5f, 1},  {1, nan, 0.3f, 0.3f}, {1, nan, 5, 5},
+                  {1, 1e5, 1, 1}, {1, 1e5, 0, 0},    {1, inf, 1, 1},       {1, inf, 0.5f, 0}};
+    for (const auto &c : floats) {
         GammaTable t;
+        t.InitTableFlt(nullptr, c.scale, c.exponent);
+        EXPECT_EQ(t.LookupFlt(c.x), c.want) << "exponent " << c.exponent << " at " << c.x;
+    }
+    const struct {
+        double exponent;
+        uint16_t v, want;
+    } shorts[] = {{0, 0, 65535}, {0, 32768, 65535}, {-2, 0, 65535}, {nan, 12345, 12345}, {1e5, 65535, 65535}};
+    for (const auto &c : shorts) {
+        GammaTable t;
+        t.InitTable(nullptr, c.exponent);
+        EXPECT_EQ(t.Lookup(c.v), c.want) << "exponent " << c.exponent << " at " << c.v;
+    }
+    for (double e : {1e5, inf}) {
+        GammaTable t, t16;
         t.InitTableFlt(nullptr, 1.0, e);
-        EXPECT_EQ(t.LookupFlt(1.0f), 1.0f);
-        EXPECT_EQ(t.LookupFlt(0.0f), 0.0f);
-        for (int k = 0; k <= 1 << 20; ++k) {
-            float x = static_cast<float>(k) / (1 << 20);
-            float y = t.LookupFlt(x);
-            ASSERT_TRUE(y >= 0.0f && y <= 1.0f) << x;
-            // x^100000 is below the smallest float for x <= 0.998 (e^-200).
-            if (x <= 0.998f) {
-                ASSERT_EQ(y, 0.0f) << x;
-            }
-        }
-        GammaTable t16;
         t16.InitTable(nullptr, e);
-        EXPECT_EQ(t16.Lookup(65535), 65535);
-        // (65400 / 65535)^100000 is about e^-206: rounds to 0, as does all below.
+        // x^100000 is below the smallest float for x <= 0.998 (e^-200); (65400 / 65535)^100000 is about e^-206.
+        for (int k = 0; k <= 1 << 20; ++k) {
+            const float x = static_cast<float>(k) / (1 << 20), y = t.LookupFlt(x);
+            ASSERT_TRUE(y >= 0.0f && y <= 1.0f && (x > 0.998f || y == 0.0f)) << x;
+        }
         for (int v = 0; v <= 65400; ++v) ASSERT_EQ(t16.Lookup(static_cast<uint16_t>(v)), 0) << v;
     }
-    // Right under 1 the power is still the true one: (1 - 2^-24)^100000 is
-    // e^(-100000 * 2^-24) to well within float precision.
+    // Right under 1 the power is still the true one: (1 - 2^-24)^100000 is e^(-100000 * 2^-24).
     GammaTable t;
     t.InitTableFlt(nullptr, 1.0, 1e5);
     EXPECT_NEAR(t.LookupFlt(std::nextafter(1.0f, 0.0f)), std::exp(-1e5 / 16777216.0), 1e-6);
     EXPECT_EQ(t.LookupFlt(std::nextafter(1.0f, 2.0f)), static_cast<float>(std::pow(1.0 + 1.0 / (1 << 23), 1e5)));
-}
-
-TEST(GammaTable, ExponentZeroIsOneEverywhere) {
-    GammaTable t;
-    t.InitTableFlt(nullptr, 3.0, 0.0);
-    for (float x : {0.0f, 1e-30f, 0.25f, 1.0f, 7.0f}) EXPECT_EQ(t.LookupFlt(x), 3.0f) << x; // 0^0 = 1
-    EXPECT_EQ(t.LookupFlt(-1.0f), 3.0f);                                                    // reads as 0
-    GammaTable t16;
-    t16.InitTable(nullptr, 0.0);
-    for (int v : {0, 1, 32768, 65535}) EXPECT_EQ(t16.Lookup(static_cast<uint16_t>(v)), 65535) << v;
-}
-
-TEST(GammaTable, NegativeAndNaNExponents) {
-    // Negative: taken as 0.
-    GammaTable neg;
-    neg.InitTableFlt(nullptr, 1.0, -2.0);
-    EXPECT_EQ(neg.LookupFlt(0.0f), 1.0f);
-    EXPECT_EQ(neg.LookupFlt(0.5f), 1.0f);
-    GammaTable neg16;
-    neg16.InitTable(nullptr, -2.0);
-    EXPECT_EQ(neg16.Lookup(0), 65535);
-    // NaN: taken as 1.
-    GammaTable nan;
-    nan.InitTableFlt(nullptr, 1.0, std::nan(""));
-    EXPECT_EQ(nan.LookupFlt(0.3f), 0.3f);
-    EXPECT_EQ(nan.LookupFlt(5.0f), 5.0f);
-    GammaTable nan16;
-    nan16.InitTable(nullptr, std::nan(""));
-    EXPECT_EQ(nan16.Lookup(12345), 12345);
+    // Lookups before the matching Init are the identity (floats still read below 0 as 0).
+    GammaTable fresh;
+    EXPECT_EQ(fresh.LookupFlt(0.375f), 0.375f);
+    EXPECT_EQ(fresh.LookupFlt(4.0f), 4.0f);
+    EXPECT_EQ(fresh.LookupFlt(-1.0f), 0.0f);
+    EXPECT_EQ(fresh.Lookup(4321), 4321);
 }
 
 TEST(GammaTable, SixteenBitMatchesIntegerClosedForms) {
     // Exponent 2: round(v^2 / 65535), in integers (no ties: 65535 is odd).
-    GammaTable sq;
-    sq.InitTable(nullptr, 2.0);
-    for (uint64_t v = 0; v < 65536; ++v)
-        ASSERT_EQ(sq.Lookup(static_cast<uint16_t>(v)), (2 * v * v + 65535) / (2 * 65535)) << v;
     // Exponent 1/2: round(sqrt(v * 65535)): r = floor(sqrt(n)), plus one when
     // (r + 1/2)^2 <= n, i.e. 4r^2 + 4r + 1 <= 4n.
-    GammaTable rt;
+    GammaTable sq, rt;
+    sq.InitTable(nullptr, 2.0);
     rt.InitTable(nullptr, 0.5);
     for (uint64_t v = 0; v < 65536; ++v) {
-        uint64_t n = v * 65535;
+        ASSERT_EQ(sq.Lookup(static_cast<uint16_t>(v)), (2 * v * v + 65535) / (2 * 65535)) << v;
+        const uint64_t n = v * 65535;
         uint64_t r = static_cast<uint64_t>(std::sqrt(static_cast<double>(n)));
         while (r * r > n) --r;
         while ((r + 1) * (r + 1) <= n) ++r;
-        uint64_t expected = r + (4 * r * r + 4 * r + 1 <= 4 * n ? 1 : 0);
-        ASSERT_EQ(rt.Lookup(static_cast<uint16_t>(v)), expected) << v;
+        ASSERT_EQ(rt.Lookup(static_cast<uint16_t>(v)), r + (4 * r * r + 4 * r + 1 <= 4 * n ? 1 : 0)) << v;
     }
-}
-
-TEST(GammaTable, LookupsBeforeInitAreIdentity) {
-    GammaTable t;
-    EXPECT_EQ(t.LookupFlt(0.375f), 0.375f);
-    EXPECT_EQ(t.LookupFlt(4.0f), 4.0f);
-    EXPECT_EQ(t.LookupFlt(-1.0f), 0.0f);
-    EXPECT_EQ(t.Lookup(4321), 4321);
 }
 
 TEST(GammaTable, RebuildingReplacesTheCurve) {

@@ -18,19 +18,16 @@
 #include <string>
 #include <vector>
 
-#include "host/core/Tags.h"
-#include "host/image/Half.h"
-#include "host/image/NewImage.h"
+#include "tests/host/image/ImageTestSupport.h"
 
 namespace Orvane::mergetest {
 namespace {
+using namespace ::Orvane::Test;
 
 using D4 = std::array<double, 4>;
 
 D4 D(const FltPixel &p) { return {p.R, p.G, p.B, p.A}; }
-FltPixel F(const D4 &d) {
-    return {static_cast<float>(d[0]), static_cast<float>(d[1]), static_cast<float>(d[2]), static_cast<float>(d[3])};
-}
+FltPixel F(const D4 &d) { return {float(d[0]), float(d[1]), float(d[2]), float(d[3])}; }
 
 // ---- the reference ----
 
@@ -80,8 +77,7 @@ RGB SetLumD(RGB c, double l) {
     return ClipColorD(c);
 }
 double SatD(const RGB &c) { return std::max({c[0], c[1], c[2]}) - std::min({c[0], c[1], c[2]}); }
-/// By sorting the channels: the largest gets s, the smallest 0, the middle
-/// its share.
+/// By sorting the channels: the largest gets s, the smallest 0, the middle its share.
 RGB SetSatD(const RGB &c, double s) {
     int idx[3] = {0, 1, 2};
     std::sort(idx, idx + 3, [&c](int a, int b) { return c[a] < c[b]; });
@@ -111,22 +107,14 @@ struct Controls {
     bool on[4] = {true, true, true, true};
 };
 
-MergeSettings SettingsOf(const Controls &c) {
-    MergeSettings s;
-    s.mode = c.mode;
-    s.op = c.op;
-    s.blend = static_cast<float>(c.blend);
-    s.additive = static_cast<float>(c.additive);
-    s.alphaGain = static_cast<float>(c.alphaGain);
-    s.burnIn = static_cast<float>(c.burnIn);
-    for (int i = 0; i < 4; ++i) s.channels[i] = c.on[i];
-    return s;
-}
-
 TagList TagsOf(const Controls &c) {
     return TagList{{MrgApplyMode, c.mode},      {MrgOperator, c.op},   {MrgBlend, c.blend}, {MrgAdditive, c.additive},
                    {MrgAlphaGain, c.alphaGain}, {MrgBurnIn, c.burnIn}, {MrgDoRed, c.on[0]}, {MrgDoGreen, c.on[1]},
                    {MrgDoBlue, c.on[2]},        {MrgDoAlpha, c.on[3]}};
+}
+
+FltPixel Merged(const Controls &c, const D4 &f, const D4 &b) {
+    return MergePixel(MergeSettings::FromTags(TagsOf(c)), F(f), F(b), 0, 0);
 }
 
 /// The merge of one pixel (not Dissolve), straight from the definitions.
@@ -188,103 +176,48 @@ const std::vector<std::pair<D4, D4>> &Pairs() {
 }
 
 TEST(MergeModes, EveryModeAndOperatorMatchesItsDefinition) {
-    for (int mode = 0; mode < MrgModeCount; ++mode) {
-        if (mode == MrgDissolve) continue;
-        const int ops = mode == MrgNormal ? MrgOperatorCount : 1;
-        for (int op = 0; op < ops; ++op)
-            for (const auto &[f, b] : Pairs()) {
-                Controls c;
-                c.mode = mode;
-                c.op = op;
-                SCOPED_TRACE("mode " + std::to_string(mode) + " op " + std::to_string(op));
-                EXPECT_TRUE(Near4(MergePixel(SettingsOf(c), F(f), F(b), 0, 0), Reference(c, f, b)));
-            }
-    }
+    Controls blended,
+        mixed; // a part of the merge with channels kept; every control at once
+    blended.blend = 0.25, blended.on[1] = blended.on[3] = false;
+    mixed.additive = 0.3, mixed.alphaGain = 0.6, mixed.burnIn = 0.2, mixed.blend = 0.7;
+    for (Controls c : {Controls{}, blended, mixed})
+        for (c.mode = 0; c.mode < MrgModeCount; ++c.mode) {
+            if (c.mode == MrgDissolve) continue;
+            for (c.op = 0; c.op < (c.mode == MrgNormal ? MrgOperatorCount : 1); ++c.op)
+                for (const auto &[f, b] : Pairs())
+                    EXPECT_TRUE(Near4(Merged(c, f, b), Reference(c, f, b)))
+                        << "mode " << c.mode << " op " << c.op << " blend " << c.blend << " additive " << c.additive;
+        }
 }
 
 TEST(MergeModes, HandComputedPixels) {
-    const MergeSettings over;
-    // Half-transparent red over opaque blue: red 0.5, blue 1 x (1 - 0.5).
-    EXPECT_EQ(MergePixel(over, {0.5f, 0, 0, 0.5f}, {0, 0, 1, 1}, 0, 0), (FltPixel{0.5f, 0, 0.5f, 1}));
-    MergeSettings s;
-    s.mode = MrgScreen; // opaque: 0.5 + 0.5 - 0.25
-    EXPECT_EQ(MergePixel(s, {0.5f, 0.5f, 0.5f, 1}, {0.5f, 0.25f, 0, 1}, 0, 0), (FltPixel{0.75f, 0.625f, 0.5f, 1}));
-    s.mode = MrgMultiply;
-    EXPECT_EQ(MergePixel(s, {0.5f, 0.5f, 0.5f, 1}, {0.5f, 0.25f, 0, 1}, 0, 0), (FltPixel{0.25f, 0.125f, 0, 1}));
-    s.mode = MrgDifference;
-    EXPECT_EQ(MergePixel(s, {0.25f, 0.75f, 0, 1}, {1, 0.25f, 0.5f, 1}, 0, 0), (FltPixel{0.75f, 0.5f, 0.5f, 1}));
-    s.mode = MrgAdd; // no clipping on float
-    EXPECT_EQ(MergePixel(s, {0.75f, 0, 0, 1}, {0.5f, 0, 0, 1}, 0, 0), (FltPixel{1.25f, 0, 0, 1}));
-    s.mode = MrgSubtract;
-    EXPECT_EQ(MergePixel(s, {0.25f, 0, 0, 1}, {0.5f, 0, 0, 1}, 0, 0), (FltPixel{0.25f, 0, 0, 1}));
-    // In keeps the foreground where the background has alpha; Held Out
-    // where it has none.
-    s = MergeSettings();
-    s.op = MrgIn;
-    EXPECT_EQ(MergePixel(s, {0.5f, 0.5f, 0, 1}, {0, 0, 1, 0.5f}, 0, 0), (FltPixel{0.25f, 0.25f, 0, 0.5f}));
-    s.op = MrgHeldOut;
-    EXPECT_EQ(MergePixel(s, {0.5f, 0.5f, 0, 1}, {0, 0, 1, 0.5f}, 0, 0), (FltPixel{0.25f, 0.25f, 0, 0.5f}));
-}
-
-TEST(MergeModes, AdditiveAlphaGainAndBurnIn) {
-    const D4 f{0.4, 0.2, 0.1, 0.5}, b{0.3, 0.6, 0.2, 0.75};
-    Controls c;
-    c.additive = 1; // colour added, alpha as over
-    EXPECT_TRUE(Near4(MergePixel(SettingsOf(c), F(f), F(b), 0, 0), {0.7, 0.8, 0.3, 0.5 + 0.75 * 0.5}));
-    c.additive = 0.25; // the background held out by 0.75 x alpha
-    EXPECT_TRUE(Near4(MergePixel(SettingsOf(c), F(f), F(b), 0, 0),
-                      {0.4 + 0.3 * (1 - 0.375), 0.2 + 0.6 * 0.625, 0.1 + 0.2 * 0.625, 0.875}));
-    c = Controls();
-    c.alphaGain = 0; // no coverage added; the background's alpha still held out
-    EXPECT_TRUE(Near4(MergePixel(SettingsOf(c), F(f), F(b), 0, 0), {0.55, 0.5, 0.2, 0.375}));
-    c = Controls();
-    c.burnIn = 1; // light printed on: colours add, the alpha stays the background's
-    EXPECT_TRUE(Near4(MergePixel(SettingsOf(c), F(f), F(b), 0, 0), {0.7, 0.8, 0.3, 0.75}));
-    // Everything at once, through the reference.
-    c = Controls();
-    c.additive = 0.3, c.alphaGain = 0.6, c.burnIn = 0.2, c.blend = 0.7;
-    for (int mode : {MrgNormal, MrgScreen, MrgOverlay, MrgHue}) {
-        c.mode = mode;
-        EXPECT_TRUE(Near4(MergePixel(SettingsOf(c), F(f), F(b), 0, 0), Reference(c, f, b))) << mode;
-    }
-}
-
-TEST(MergeModes, BlendAndChannels) {
-    const FltPixel f{0.4f, 0.2f, 0.1f, 0.5f}, b{0.3f, 0.6f, 0.2f, 0.75f};
-    Controls c;
-    c.mode = MrgMultiply;
-    c.blend = 0; // exactly the background
-    EXPECT_EQ(MergePixel(SettingsOf(c), f, b, 0, 0), b);
-    c.blend = 0.25;
-    const D4 full = Reference(Controls{MrgMultiply}, D(f), D(b));
-    D4 quarter;
-    for (int i = 0; i < 4; ++i) quarter[i] = D(b)[i] * 0.75 + full[i] * 0.25;
-    EXPECT_TRUE(Near4(MergePixel(SettingsOf(c), f, b, 0, 0), quarter));
-    c.blend = 1;
-    c.on[1] = c.on[3] = false; // green and alpha stay the background's
-    const FltPixel got = MergePixel(SettingsOf(c), f, b, 0, 0);
-    EXPECT_EQ(got.G, b.G);
-    EXPECT_EQ(got.A, b.A);
-    EXPECT_TRUE(Near4(got, {full[0], b.G, full[2], b.A}));
-}
-
-TEST(MergeModes, NonSeparableModesKeepTheirParts) {
-    // Independent of the code's own helpers: Luminosity keeps the
-    // background's hue and saturation and takes the foreground's luminance.
-    const D4 f{0.2, 0.6, 0.4, 1}, b{0.9, 0.5, 0.3, 1}; // no channel leaves the gamut on the way
-    for (int mode : {MrgColor, MrgLuminosity, MrgHue, MrgSaturation}) {
-        MergeSettings s;
-        s.mode = mode;
-        const FltPixel o = MergePixel(s, F(f), F(b), 0, 0);
-        const RGB out{o.R, o.G, o.B};
-        const RGB fs{f[0], f[1], f[2]}, bs{b[0], b[1], b[2]};
-        SCOPED_TRACE(mode);
-        if (mode == MrgLuminosity || mode == MrgColor)
-            EXPECT_NEAR(Lum(out), Lum(mode == MrgLuminosity ? fs : bs), 1e-6);
-        if (mode == MrgColor || mode == MrgHue || mode == MrgSaturation) EXPECT_NEAR(Lum(out), Lum(bs), 1e-6);
-        if (mode == MrgSaturation) EXPECT_NEAR(SatD(out), SatD(fs), 1e-6);
-        if (mode == MrgHue || mode == MrgLuminosity) EXPECT_NEAR(SatD(out), SatD(bs), 1e-6);
-    }
+    const struct {
+        Controls c;
+        D4 f, b, want;
+    } cases[] = {
+        // Half-transparent red over opaque blue: red 0.5, blue 1 x (1 - 0.5).
+        {{}, {0.5, 0, 0, 0.5}, {0, 0, 1, 1}, {0.5, 0, 0.5, 1}},
+        {{.mode = MrgScreen}, {0.5, 0.5, 0.5, 1}, {0.5, 0.25, 0, 1}, {0.75, 0.625, 0.5, 1}}, // 0.5 + 0.5 - 0.25
+        {{.mode = MrgMultiply}, {0.5, 0.5, 0.5, 1}, {0.5, 0.25, 0, 1}, {0.25, 0.125, 0, 1}},
+        {{.mode = MrgDifference}, {0.25, 0.75, 0, 1}, {1, 0.25, 0.5, 1}, {0.75, 0.5, 0.5, 1}},
+        {{.mode = MrgAdd}, {0.75, 0, 0, 1}, {0.5, 0, 0, 1}, {1.25, 0, 0, 1}}, // no clipping on float
+        {{.mode = MrgSubtract}, {0.25, 0, 0, 1}, {0.5, 0, 0, 1}, {0.25, 0, 0, 1}},
+        // In keeps the foreground where the background has alpha; Held Out where
+        // it has none.
+        {{.op = MrgIn}, {0.5, 0.5, 0, 1}, {0, 0, 1, 0.5}, {0.25, 0.25, 0, 0.5}},
+        {{.op = MrgHeldOut}, {0.5, 0.5, 0, 1}, {0, 0, 1, 0.5}, {0.25, 0.25, 0, 0.5}},
+        // Additive 1: colour added, alpha as over; 0.25: the background held out
+        // by 0.75 x alpha.
+        {{.additive = 1}, {0.4, 0.2, 0.1, 0.5}, {0.3, 0.6, 0.2, 0.75}, {0.7, 0.8, 0.3, 0.875}},
+        {{.additive = 0.25}, {0.4, 0.2, 0.1, 0.5}, {0.3, 0.6, 0.2, 0.75}, {0.5875, 0.575, 0.225, 0.875}},
+        // Alpha gain 0: no coverage added, the background's alpha still held out.
+        {{.alphaGain = 0}, {0.4, 0.2, 0.1, 0.5}, {0.3, 0.6, 0.2, 0.75}, {0.55, 0.5, 0.2, 0.375}},
+        // Burn in: light printed on, colours add, the alpha stays the
+        // background's.
+        {{.burnIn = 1}, {0.4, 0.2, 0.1, 0.5}, {0.3, 0.6, 0.2, 0.75}, {0.7, 0.8, 0.3, 0.75}},
+        {{.mode = MrgMultiply, .blend = 0}, {0.4, 0.2, 0.1, 0.5}, {0.3, 0.6, 0.2, 0.75}, {0.3, 0.6, 0.2, 0.75}},
+    };
+    for (const auto &c : cases) EXPECT_TRUE(Near4(Merged(c.c, c.f, c.b), c.want)) << "mode " << c.c.mode;
 }
 
 // ---- Dissolve ----
@@ -329,7 +262,7 @@ TEST(MergeModes, DissolveKeepsWholePixelsByTheNoise) {
 
 Ref<Image> Filled(int depth, const ImgRectI &window, const std::function<FltPixel(int, int)> &px,
                   FltPixel canvas = {}) {
-    Ref<Image> img = NewImageTagList({{ImgWidth, 16}, {ImgHeight, 12}, {ImgDepth, depth}, {ImgDataWindow, &window}});
+    Ref<Image> img = Blank(16, 12, depth, &window);
     img->AllocScanLineData();
     img->SetCanvasColor(canvas);
     for (int y = window.y0; y < window.y1; ++y)
@@ -339,10 +272,6 @@ Ref<Image> Filled(int depth, const ImgRectI &window, const std::function<FltPixe
 
 FltPixel FgAt(int x, int y) { return {0.05f * (x % 7), 0.04f * (y % 9), 0.3f, 0.25f + 0.05f * ((x + y) % 10)}; }
 FltPixel BgAt(int x, int y) { return {0.9f - 0.03f * x, 0.1f + 0.02f * y, 0.5f, 0.2f + 0.06f * (x % 12)}; }
-
-Ref<Image> Output(int depth, const ImgRectI &window) {
-    return NewImageTagList({{ImgWidth, 16}, {ImgHeight, 12}, {ImgDepth, depth}, {ImgDataWindow, &window}});
-}
 
 /// Whether a stored component is the value computed here, stored at
 /// `depth`: an integer depth must hold the nearest code of the clamped value
@@ -360,38 +289,24 @@ Ref<Image> Output(int depth, const ImgRectI &window) {
     return ::testing::AssertionFailure() << "got " << got << ", want " << want << " (depth " << depth << ")";
 }
 
-TEST(MergeImages, EveryDepthRoundsTheFloatResult) {
-    const ImgRectI win(0, 0, 16, 12);
-    for (int depth = 1; depth <= 8; ++depth)
+TEST(MergeImages, EveryDepthRoundsTheFloatResultIntoTheBackgroundsDepth) {
+    const ImgRectI win(2, 1, 14, 11);
+    std::vector<std::pair<int, int>> depths = {{DepthRGBAFlt32, DepthRGBAInt16}}; // foreground, background
+    for (int d = 1; d <= 8; ++d) depths.push_back({d, d});
+    for (auto [fd, bd] : depths)
         for (int mode : {MrgNormal, MrgScreen, MrgOverlay, MrgColor}) {
-            SCOPED_TRACE("depth " + std::to_string(depth) + " mode " + std::to_string(mode));
-            // Inputs quantised at the depth first, so the reference sees what the rows read.
-            Ref<Image> fg = Filled(depth, win, FgAt), bg = Filled(depth, win, BgAt);
-            Ref<Image> out = Output(depth, win);
-            Controls c;
-            c.mode = mode;
-            ASSERT_TRUE(MergeImagesTagList(fg.Get(), bg.Get(), out.Get(), TagsOf(c)));
+            SCOPED_TRACE("depths " + std::to_string(fd) + ", " + std::to_string(bd) + " mode " + std::to_string(mode));
+            // Inputs quantised at their depths first, so the reference sees what the
+            // rows read.
+            Ref<Image> fg = Filled(fd, win, FgAt), bg = Filled(bd, win, BgAt), out = Blank(16, 12, bd, &win);
+            ASSERT_TRUE(MergeImagesTagList(fg.Get(), bg.Get(), out.Get(), TagsOf({.mode = mode})));
             for (int y = win.y0; y < win.y1; ++y)
                 for (int x = win.x0; x < win.x1; ++x) {
-                    const D4 want = Reference(c, D(fg->GetFlt(x, y)), D(bg->GetFlt(x, y)));
-                    const D4 got = D(out->GetFlt(x, y));
-                    for (int i = 0; i < 4; ++i) {
-                        const double w = depth <= 4 ? want[3] : want[i]; // masks hold alpha
-                        ASSERT_TRUE(StoredNear(depth, got[i], w)) << x << "," << y << " ch " << i;
-                    }
+                    const D4 want = Reference({.mode = mode}, D(fg->GetFlt(x, y)), D(bg->GetFlt(x, y)));
+                    for (int i = 0; i < 4; ++i) // masks hold alpha
+                        ASSERT_TRUE(StoredNear(bd, Channel(out->GetFlt(x, y), i), want[bd <= 4 ? 3 : i]))
+                            << x << "," << y << " ch " << i;
                 }
-        }
-}
-
-TEST(MergeImages, MixedDepthsWriteTheBackgroundsDepth) {
-    const ImgRectI win(2, 1, 14, 11);
-    Ref<Image> fg = Filled(DepthRGBAFlt32, win, FgAt), bg = Filled(DepthRGBAInt16, win, BgAt);
-    Ref<Image> out = Output(DepthRGBAInt16, win);
-    ASSERT_TRUE(MergeImagesTagList(fg.Get(), bg.Get(), out.Get(), TagsOf(Controls{})));
-    for (int y = win.y0; y < win.y1; ++y)
-        for (int x = win.x0; x < win.x1; ++x) {
-            const D4 want = Reference(Controls{}, D(fg->GetFlt(x, y)), D(bg->GetFlt(x, y)));
-            for (int i = 0; i < 4; ++i) ASSERT_TRUE(StoredNear(DepthRGBAInt16, D(out->GetFlt(x, y))[i], want[i]));
         }
 }
 
@@ -401,57 +316,60 @@ TEST(MergeImages, CanvasColoursMergeAndFillBeyondTheWindows) {
     const FltPixel fc{0.1f, 0.1f, 0.0f, 0.25f}, bc{0.0f, 0.2f, 0.4f, 0.5f};
     for (int mode : {MrgNormal, MrgMultiply, MrgSoftLight}) {
         Ref<Image> fg = Filled(DepthRGBAFlt32, fw, FgAt, fc), bg = Filled(DepthRGBAFlt32, bw, BgAt, bc);
-        Controls c;
-        c.mode = mode;
-        const MergeSettings s = SettingsOf(c);
-        const ImgRectI out = MergeDataWindow(s, fw, fc, bw, bc);
+        const ImgRectI out = MergeDataWindow(MergeSettings::FromTags(TagsOf({.mode = mode})), fw, fc, bw, bc);
         EXPECT_EQ(out, ImgRectI(0, 0, 16, 12));
-        Ref<Image> dst = Output(DepthRGBAFlt32, out);
-        ASSERT_TRUE(MergeImagesTagList(fg.Get(), bg.Get(), dst.Get(), TagsOf(c)));
-        EXPECT_TRUE(Near4(dst->GetCanvasColor(), Reference(c, D(fc), D(bc))));
+        Ref<Image> dst = Blank(16, 12, DepthRGBAFlt32, &out);
+        ASSERT_TRUE(MergeImagesTagList(fg.Get(), bg.Get(), dst.Get(), TagsOf({.mode = mode})));
+        EXPECT_TRUE(Near4(dst->GetCanvasColor(), Reference({.mode = mode}, D(fc), D(bc))));
         for (int y = 0; y < 12; ++y)
             for (int x = 0; x < 16; ++x) {
                 const FltPixel f = fw.Contains(x, y) ? FgAt(x, y) : fc, b = bw.Contains(x, y) ? BgAt(x, y) : bc;
-                ASSERT_TRUE(Near4(dst->GetFlt(x, y), Reference(c, D(f), D(b)))) << mode << " " << x << "," << y;
+                ASSERT_TRUE(Near4(dst->GetFlt(x, y), Reference({.mode = mode}, D(f), D(b)))) << x << "," << y;
             }
     }
 }
 
 TEST(MergeImages, DataWindowsFollowWhatCanDifferFromTheCanvas) {
-    const ImgRectI fw(0, 0, 6, 6), bw(4, 4, 10, 10);
+    const ImgRectI fw(0, 0, 6, 6), bw(4, 4, 10, 10), both(0, 0, 10, 10);
     const FltPixel clear{}, grey{0.5f, 0.5f, 0.5f, 1};
-    MergeSettings s;
-    EXPECT_EQ(MergeDataWindow(s, fw, clear, bw, clear), ImgRectI(0, 0, 10, 10)); // over: the union
-    s.op = MrgIn;
-    EXPECT_EQ(MergeDataWindow(s, fw, clear, bw, clear), ImgRectI(4, 4, 6, 6)); // both sides cut
-    EXPECT_EQ(MergeDataWindow(s, fw, clear, bw, grey), ImgRectI(0, 0, 6, 6));  // the background's canvas shows
-    s.op = MrgAtop;
-    EXPECT_EQ(MergeDataWindow(s, fw, clear, bw, clear), bw);
-    s.op = MrgHeldOut;
-    EXPECT_EQ(MergeDataWindow(s, fw, clear, bw, clear), fw);
-    s.blend = 0.5f; // half the background stays everywhere
-    EXPECT_EQ(MergeDataWindow(s, fw, clear, bw, clear), ImgRectI(0, 0, 10, 10));
-    // What the rule cuts away really is the canvas: In over windows that do
-    // not meet leaves nothing.
-    s = MergeSettings();
-    s.op = MrgIn;
-    EXPECT_TRUE(MergeDataWindow(s, ImgRectI(0, 0, 3, 3), clear, ImgRectI(5, 5, 8, 8), clear).IsNull());
+    const struct {
+        Controls c;
+        FltPixel bgCanvas;
+        ImgRectI want;
+    } cases[] = {
+        {{}, clear, both},                               // over: the union
+        {{.op = MrgIn}, clear, ImgRectI(4, 4, 6, 6)},    // both sides cut
+        {{.op = MrgIn}, grey, fw},                       // the background's canvas shows
+        {{.op = MrgAtop}, clear, bw},                    //
+        {{.op = MrgHeldOut}, clear, fw},                 //
+        {{.op = MrgHeldOut, .blend = 0.5}, clear, both}, // half the background stays everywhere
+    };
+    for (const auto &c : cases)
+        EXPECT_EQ(MergeDataWindow(MergeSettings::FromTags(TagsOf(c.c)), fw, clear, bw, c.bgCanvas), c.want) << c.c.op;
+    // What the rule cuts away really is the canvas: In over windows that do not
+    // meet leaves nothing.
+    EXPECT_TRUE(MergeDataWindow(MergeSettings::FromTags(TagsOf({.op = MrgIn})), ImgRectI(0, 0, 3, 3), clear,
+                                ImgRectI(5, 5, 8, 8), clear)
+                    .IsNull());
 }
 
 TEST(MergeImages, OffsetsPlaceTheForeground) {
     const ImgRectI fw(0, 0, 4, 3), bw(0, 0, 16, 12);
     Ref<Image> fg = Filled(DepthRGBAFlt32, fw, FgAt), bg = Filled(DepthRGBAFlt32, bw, BgAt);
-    Ref<Image> dst = Output(DepthRGBAFlt32, bw);
-    TagList tags = TagsOf(Controls{});
+    Ref<Image> dst = Blank(16, 12, DepthRGBAFlt32, &bw);
+    TagList tags = TagsOf({});
     tags.Set({MrgFgOffsetX, 5});
     tags.Set({MrgFgOffsetY, -1}); // the bottom row falls off
     ASSERT_TRUE(MergeImagesTagList(fg.Get(), bg.Get(), dst.Get(), tags));
     for (int y = 0; y < 12; ++y)
         for (int x = 0; x < 16; ++x) {
             const bool under = x >= 5 && x < 9 && y >= 0 && y < 2;
-            const FltPixel f = under ? FgAt(x - 5, y + 1) : FltPixel{};
-            ASSERT_TRUE(Near4(dst->GetFlt(x, y), Reference(Controls{}, D(f), D(BgAt(x, y))))) << x << "," << y;
-            if (!under) ASSERT_EQ(dst->GetFlt(x, y), BgAt(x, y)); // copied as it is
+            if (under) {
+                ASSERT_TRUE(Near4(dst->GetFlt(x, y), Reference({}, D(FgAt(x - 5, y + 1)), D(BgAt(x, y)))))
+                    << x << "," << y;
+            } else {
+                ASSERT_EQ(dst->GetFlt(x, y), BgAt(x, y)) << x << "," << y; // copied as it is
+            }
         }
 }
 
@@ -461,24 +379,23 @@ TEST(MergeImages, CopiedBackgroundEqualsTheComputedMerge) {
     // compute every pixel: both must give the same bits, integer and half
     // backgrounds included, and the copy must be the background.
     const ImgRectI fw(3, 2, 9, 7), bw(0, 0, 16, 12);
-    for (int depth : {DepthRGBAInt8, DepthRGBAFlt16, DepthAInt16, DepthRGBAFlt32}) {
+    for (int depth : {DepthRGBAInt8, DepthRGBAFlt16, DepthAInt16, DepthRGBAFlt32})
         for (int mode : {MrgNormal, MrgScreen, MrgColorBurn}) {
             SCOPED_TRACE("depth " + std::to_string(depth) + " mode " + std::to_string(mode));
             Ref<Image> fg = Filled(DepthRGBAFlt32, fw, FgAt), bg = Filled(depth, bw, BgAt);
             Ref<Image> padded =
                 Filled(DepthRGBAFlt32, bw, [&](int x, int y) { return fw.Contains(x, y) ? FgAt(x, y) : FltPixel{}; });
-            Controls c;
-            c.mode = mode;
-            Ref<Image> copied = Output(depth, bw), computed = Output(depth, bw);
-            ASSERT_TRUE(MergeImagesTagList(fg.Get(), bg.Get(), copied.Get(), TagsOf(c)));
-            ASSERT_TRUE(MergeImagesTagList(padded.Get(), bg.Get(), computed.Get(), TagsOf(c)));
+            Ref<Image> copied = Blank(16, 12, depth, &bw), computed = Blank(16, 12, depth, &bw);
+            ASSERT_TRUE(MergeImagesTagList(fg.Get(), bg.Get(), copied.Get(), TagsOf({.mode = mode})));
+            ASSERT_TRUE(MergeImagesTagList(padded.Get(), bg.Get(), computed.Get(), TagsOf({.mode = mode})));
+            EXPECT_TRUE(SameBits(*copied, *computed));
             for (int y = 0; y < 12; ++y)
                 for (int x = 0; x < 16; ++x) {
-                    ASSERT_EQ(copied->GetFlt(x, y), computed->GetFlt(x, y)) << x << "," << y;
-                    if (!fw.Contains(x, y)) ASSERT_EQ(copied->GetFlt(x, y), bg->GetFlt(x, y)) << x << "," << y;
+                    if (!fw.Contains(x, y)) {
+                        ASSERT_EQ(copied->GetFlt(x, y), bg->GetFlt(x, y)) << x << "," << y;
+                    }
                 }
         }
-    }
 }
 
 TEST(MergeImages, DepthMergeLetsTheNearerWin) {
@@ -492,54 +409,42 @@ TEST(MergeImages, DepthMergeLetsTheNearerWin) {
     const FltPixel fp{0.4f, 0.2f, 0.0f, 0.8f}, bp{0.0f, 0.3f, 0.6f, 0.6f};
     // x 0: the foreground nearer; 1: the background nearer; 2: a tie; 3: the
     // foreground nearer but empty.
-    Ref<Image> fg = zImage({fp, fp, fp, FltPixel{}}, {1, 5, 3, 0.5f});
-    Ref<Image> bg = zImage({bp, bp, bp, bp}, {2, 4, 3, 2});
-    for (bool larger : {false, true}) {
-        Ref<Image> dst = Output(DepthRGBAFlt32, win);
-        TagList tags = TagsOf(Controls{});
-        tags.Set({MrgZMerge, 1});
-        tags.Set({MrgZLargerIsNearer, larger});
+    Ref<Image> fg = zImage({fp, fp, fp, FltPixel{}}, {1, 5, 3, 0.5f}), bg = zImage({bp, bp, bp, bp}, {2, 4, 3, 2});
+    const D4 fgOver = Reference({}, D(fp), D(bp)), bgOver{0.0 + 0.4 * 0.4, 0.3 + 0.4 * 0.2, 0.6, 0.6 + 0.4 * 0.8};
+    for (int zMerge : {0, 1, 2}) { // off, smaller nearer, larger nearer
+        Ref<Image> dst = Blank(16, 12, DepthRGBAFlt32, &win);
+        TagList tags = TagsOf({});
+        tags.Set({MrgZMerge, zMerge > 0});
+        tags.Set({MrgZLargerIsNearer, zMerge == 2});
         ASSERT_TRUE(MergeImagesTagList(fg.Get(), bg.Get(), dst.Get(), tags));
-        ASSERT_TRUE(dst->HasAuxChannel(AuxChannelKind::Z));
-        const D4 fgOver = Reference(Controls{}, D(fp), D(bp));
-        const D4 bgOver{0.0 + 0.4 * 0.4, 0.3 + 0.4 * 0.2, 0.6, 0.6 + 0.4 * 0.8};
-        const bool fgNearAt0 = !larger, fgNearAt1 = larger;
-        EXPECT_TRUE(Near4(dst->GetFlt(0, 0), fgNearAt0 ? fgOver : bgOver));
-        EXPECT_TRUE(Near4(dst->GetFlt(1, 0), fgNearAt1 ? fgOver : bgOver));
-        EXPECT_TRUE(Near4(dst->GetFlt(2, 0), fgOver)); // tie: the foreground
-        EXPECT_EQ(dst->GetFlt(3, 0), bp);              // an empty foreground never wins
         const float *z = dst->AuxRow(AuxChannelKind::Z, 0);
-        EXPECT_EQ(z[0], fgNearAt0 ? 1.f : 2.f);
-        EXPECT_EQ(z[1], fgNearAt1 ? 5.f : 4.f);
-        EXPECT_EQ(z[2], 3.f);
+        ASSERT_NE(z, nullptr);
+        // Without the switch the foreground lies over everywhere and Z is the
+        // background's.
+        const bool fgWins[3] = {zMerge != 2, zMerge != 1, true};
+        for (int x = 0; x < 3; ++x) {
+            EXPECT_TRUE(Near4(dst->GetFlt(x, 0), fgWins[x] ? fgOver : bgOver)) << zMerge << " " << x;
+            EXPECT_EQ(z[x],
+                      fgWins[x] && zMerge ? fg->AuxRow(AuxChannelKind::Z, 0)[x] : bg->AuxRow(AuxChannelKind::Z, 0)[x]);
+        }
+        EXPECT_EQ(dst->GetFlt(3, 0), bp); // an empty foreground never wins
         EXPECT_EQ(z[3], 2.f);
     }
-    // Without the switch the foreground lies over everywhere and Z is the background's.
-    Ref<Image> dst = Output(DepthRGBAFlt32, win);
-    ASSERT_TRUE(MergeImagesTagList(fg.Get(), bg.Get(), dst.Get(), TagsOf(Controls{})));
-    EXPECT_TRUE(Near4(dst->GetFlt(1, 0), Reference(Controls{}, D(fp), D(bp))));
-    EXPECT_EQ(dst->AuxRow(AuxChannelKind::Z, 0)[1], 4.f);
 }
 
-TEST(MergeImages, PreCalculationGetsTheCanvasOnly) {
+TEST(MergeImages, PreCalculationGetsTheCanvasOnlyAndAnAbortStopsTheRows) {
     const ImgRectI win(0, 0, 8, 8);
     Ref<Image> fg = Filled(DepthRGBAFlt32, win, FgAt, {0, 0, 0, 0});
     Ref<Image> bg = Filled(DepthRGBAFlt32, win, BgAt, {0.2f, 0.2f, 0.2f, 1});
-    Ref<Image> dst =
-        NewImageTagList({{ImgWidth, 16}, {ImgHeight, 12}, {ImgDepth, 8}, {ImgDataWindow, &win}, {ImgNoData, 1}});
-    ASSERT_TRUE(MergeImagesTagList(fg.Get(), bg.Get(), dst.Get(), TagsOf(Controls{})));
-    EXPECT_FALSE(dst->HasScanLineData());
-    EXPECT_EQ(dst->GetCanvasColor(), (FltPixel{0.2f, 0.2f, 0.2f, 1}));
+    Ref<Image> shape = Blank(16, 12, DepthRGBAFlt32, &win), dst = Blank(16, 12, DepthRGBAFlt32, &win);
+    shape->SetNoData(true);
+    ASSERT_TRUE(MergeImagesTagList(fg.Get(), bg.Get(), shape.Get(), TagsOf({})));
+    EXPECT_FALSE(shape->HasScanLineData());
+    EXPECT_EQ(shape->GetCanvasColor(), (FltPixel{0.2f, 0.2f, 0.2f, 1}));
     EXPECT_FALSE(MergeImagesTagList(nullptr, bg.Get(), dst.Get(), {}));
-}
-
-TEST(MergeImages, AnAbortStopsTheRows) {
-    const ImgRectI win(0, 0, 16, 12);
-    Ref<Image> fg = Filled(DepthRGBAFlt32, win, FgAt), bg = Filled(DepthRGBAFlt32, win, BgAt);
-    Ref<Image> dst = Output(DepthRGBAFlt32, win);
     std::atomic<bool> abort{true};
     dst->SetAbortFlag(&abort);
-    EXPECT_FALSE(MergeImagesTagList(fg.Get(), bg.Get(), dst.Get(), TagsOf(Controls{})));
+    EXPECT_FALSE(MergeImagesTagList(fg.Get(), bg.Get(), dst.Get(), TagsOf({})));
 }
 
 } // namespace

@@ -8,6 +8,10 @@
 #include <gtest/gtest.h>
 
 #include "host/app/Application.h"
+#include "host/core/Tags.h"
+#include "host/flow/RenderTask.h"
+#include "host/flow/Request.h"
+#include "host/krom/DeviceContext.h"
 
 namespace Orvane::Test {
 
@@ -24,5 +28,20 @@ inline IDeviceContext *OpenCLDevice() {
 #define ORVANE_NEED_OPENCL(ctx)                                                                                        \
     IDeviceContext *ctx = Orvane::Test::OpenCLDevice();                                                                \
     if (!ctx) GTEST_SKIP() << "no OpenCL device"
+
+/// A render on `ctx` (none when null): the request a host service is handed,
+/// and the tags that ask it to use the device.
+struct DeviceRender {
+    RenderTask task;
+    Request req{nullptr, nullptr, 0.0, 0, &task};
+    explicit DeviceRender(IDeviceContext *ctx) {
+        if (ctx) task.SetDevice(ctx);
+    }
+    TagList On(TagList tags) {
+        tags.Set({WorkUseGPU, 1});
+        tags.Set({WorkRequest, &req});
+        return tags;
+    }
+};
 
 } // namespace Orvane::Test

@@ -10,22 +10,19 @@
 
 #include <gtest/gtest.h>
 
-#include "host/core/Tags.h"
-#include "host/flow/RenderTask.h"
-#include "host/flow/Request.h"
 #include "host/image/ColorMatrix.h"
-#include "host/image/NewImage.h"
 #include "host/image/PixelConvert.h"
 #include "host/krom/CommonKernels.h"
 #include "host/krom/GPUMemory.h"
 #include "host/krom/KROMBuffer.h"
 #include "host/krom/KROMComputeNode.h"
 #include "host/krom/KernelDiskCache.h"
+#include "tests/host/image/ImageTestSupport.h"
 #include "tests/host/krom/DeviceTestSupport.h"
-#include "tests/support/TestSupport.h"
 
 namespace Orvane {
 namespace {
+using namespace ::Orvane::Test;
 
 // A copy through the dialect: reads any image as float4, writes any image.
 const char kCopyParams[] = "typedef struct { int workSize[2]; } CopyParams;\n";
@@ -80,34 +77,25 @@ TEST(KernelSignature, ReadsKindsAndNamesInOrder) {
     EXPECT_NE(error.find("not found"), std::string::npos);
 }
 
-TEST(CommonKernels, EveryKernelCompilesOnEveryBackEnd) {
+TEST(CommonKernels, EveryKernelCompilesOnEveryBackEndAndABrokenOneIsReported) {
+    const char bad[] = "__KERNEL__ void Bad(int x) { undefined_thing(x); }";
     ASSERT_GE(CommonKernels().size(), 5u);
     for (const char *name :
          {"BrightnessContrast", "BrightnessContrastReverse", "ColorMatrix", "Background", "BackgroundGrad"})
         EXPECT_NE(FindCommonKernel(name), nullptr) << name;
-    if (BackendBuilt(DeviceBackend::CUDA)) {
-        // Compile only: this catches dialect errors without a GPU.
-        for (const CommonKernel &k : CommonKernels()) {
-            std::string log;
-            EXPECT_TRUE(CompileKernelForCUDA(k.name, std::string(k.paramStructText) + k.source, &log)) << k.name << "\n"
-                                                                                                       << log;
-        }
+    if (BackendBuilt(DeviceBackend::CUDA)) { // compile only: this catches dialect errors without a GPU
+        std::string log;
+        for (const CommonKernel &k : CommonKernels())
+            EXPECT_TRUE(CompileKernelForCUDA(k.name, std::string(k.paramStructText) + k.source, &log)) << k.name << log;
+        EXPECT_FALSE(CompileKernelForCUDA("Bad", bad, &log));
+        EXPECT_NE(log.find("Bad"), std::string::npos);
     }
     ORVANE_NEED_OPENCL(ctx);
     for (const CommonKernel &k : CommonKernels()) {
         auto node = KROMComputeNode::Create(ctx, k.name, nullptr, k.paramStructText, true);
         EXPECT_TRUE(node->IsValid()) << k.name << ": " << node->Error();
     }
-}
-
-TEST(CommonKernels, ABrokenKernelIsReportedNotRun) {
-    if (BackendBuilt(DeviceBackend::CUDA)) {
-        std::string log;
-        EXPECT_FALSE(CompileKernelForCUDA("Bad", "__KERNEL__ void Bad(int x) { undefined_thing(x); }", &log));
-        EXPECT_NE(log.find("Bad"), std::string::npos);
-    }
-    ORVANE_NEED_OPENCL(ctx);
-    auto node = KROMComputeNode::Create(ctx, "Bad", "__KERNEL__ void Bad(int x) { undefined_thing(x); }", "", true);
+    auto node = KROMComputeNode::Create(ctx, "Bad", bad, "", true);
     EXPECT_FALSE(node->IsValid());
     EXPECT_FALSE(node->RunSession());
     auto missing = KROMComputeNode::Create(ctx, "NoSuchCommonKernel", nullptr, "", false);
@@ -115,53 +103,41 @@ TEST(CommonKernels, ABrokenKernelIsReportedNotRun) {
     EXPECT_NE(missing->Error().find("NoSuchCommonKernel"), std::string::npos);
 }
 
-TEST(Dialect, WritesEveryDepthAsTheHostConvertsIt) {
+TEST(Dialect, ReadsAndWritesEveryDepthAsTheHostConvertsIt) {
     ORVANE_NEED_OPENCL(ctx);
-    Ref<Image> src = Orvane::Test::PatternImage(37, 11, DepthRGBAFlt32);
+    Ref<Image> src = PatternImage(37, 11, DepthRGBAFlt32);
     for (int depth = 1; depth <= 8; ++depth) {
-        Ref<Image> dev = CopyOnDevice(ctx, src.Get(), depth);
-        const int bpp = dev->BytesPerPixel();
+        // Read: any depth into float, as LoadFlt reads it.
+        Ref<Image> at = PatternImage(19, 7, depth, 3), read = CopyOnDevice(ctx, at.Get(), DepthRGBAFlt32);
+        for (int y = 0; y < 7; ++y)
+            for (int x = 0; x < 19; ++x) {
+                FltPixel expect;
+                LoadFlt(depth, at->PixelAddress(x, y), 1, &expect);
+                ASSERT_EQ(std::memcmp(read->PixelAddress(x, y), &expect, sizeof expect), 0) << depth << " " << x;
+            }
+        // Write: float into any depth, as StoreFlt stores it. Integers are
+        // rounded in float on the device, in double on the host: a value
+        // within a float step of a half code may land on its neighbour.
+        Ref<Image> written = CopyOnDevice(ctx, src.Get(), depth);
+        const PixelFormat f = FormatOfDepth(depth);
         int offByOne = 0, wrong = 0;
         for (int y = 0; y < 11; ++y)
             for (int x = 0; x < 37; ++x) {
-                FltPixel in;
-                LoadFlt(DepthRGBAFlt32, src->PixelAddress(x, y), 1, &in);
                 uint8_t expect[16];
-                StoreFlt(depth, &in, 1, expect);
-                const uint8_t *got = dev->PixelAddress(x, y);
-                if (std::memcmp(expect, got, bpp) == 0) continue;
-                // Integers are rounded in float on the device, in double on the host:
-                // a value within a float step of a half code may land on its neighbour.
-                bool near = !FormatOfDepth(depth).isFloat;
-                for (int c = 0; near && c < FormatOfDepth(depth).channels; ++c) {
-                    const int size = FormatOfDepth(depth).bytesPerComponent;
+                StoreFlt(depth, reinterpret_cast<const FltPixel *>(src->PixelAddress(x, y)), 1, expect);
+                const uint8_t *got = written->PixelAddress(x, y);
+                if (std::memcmp(expect, got, f.BytesPerPixel()) == 0) continue;
+                bool near = !f.isFloat;
+                for (int c = 0; near && c < f.channels; ++c) {
                     uint32_t a = 0, b = 0;
-                    std::memcpy(&a, expect + c * size, size);
-                    std::memcpy(&b, got + c * size, size);
+                    std::memcpy(&a, expect + c * f.bytesPerComponent, f.bytesPerComponent);
+                    std::memcpy(&b, got + c * f.bytesPerComponent, f.bytesPerComponent);
                     near = std::abs(static_cast<int>(a) - static_cast<int>(b)) <= 1;
                 }
                 ++(near ? offByOne : wrong);
             }
         EXPECT_EQ(wrong, 0) << "depth " << depth;
         EXPECT_LE(offByOne, 2) << "depth " << depth;
-    }
-}
-
-TEST(Dialect, ReadsEveryDepthAsTheHostReadsIt) {
-    ORVANE_NEED_OPENCL(ctx);
-    for (int depth = 1; depth <= 8; ++depth) {
-        Ref<Image> src = Orvane::Test::PatternImage(19, 7, depth, 3);
-        Ref<Image> dev = CopyOnDevice(ctx, src.Get(), DepthRGBAFlt32);
-        for (int y = 0; y < 7; ++y)
-            for (int x = 0; x < 19; ++x) {
-                FltPixel expect;
-                LoadFlt(depth, src->PixelAddress(x, y), 1, &expect);
-                const auto *got = reinterpret_cast<const float *>(dev->PixelAddress(x, y));
-                ASSERT_EQ(got[0], expect.R) << depth << " " << x << "," << y;
-                ASSERT_EQ(got[1], expect.G);
-                ASSERT_EQ(got[2], expect.B);
-                ASSERT_EQ(got[3], expect.A);
-            }
     }
 }
 
@@ -203,24 +179,20 @@ __KERNEL__ void SampleRow(__CONSTANTREF__ SampleParams *p_pParams, __TEXTURE2D__
 
 TEST(DeviceImages, UploadIsKeptAndDeviceResultsAreStaleUntilDownloaded) {
     ORVANE_NEED_OPENCL(ctx);
-    Ref<Image> src = Orvane::Test::PatternImage(16, 9, DepthRGBAFlt32);
+    Ref<Image> src = PatternImage(16, 9, DepthRGBAFlt32), dst = Blank(16, 9, DepthRGBAFlt32);
     EXPECT_FALSE(src->GetGPUMem());
-    const ImgRectI dw = src->DataWindow();
-    Ref<Image> dst = NewImageTagList({{ImgLikeImage, src.Get()}, {ImgDataWindow, &dw}});
     {
+        // The upload stays with the image, current with main memory; a second
+        // device image of the same image reuses it.
         auto in = KROMBuffer::CreateImage(ctx, src.Get(), KROMBufferRead);
-        ASSERT_TRUE(in->IsValid());
-        // The upload stays with the image, current with main memory.
-        ASSERT_TRUE(src->GetGPUMem());
+        auto again = KROMBuffer::CreateImage(ctx, src.Get(), KROMBufferRead);
+        ASSERT_TRUE(in->IsValid() && src->GetGPUMem());
         EXPECT_EQ(src->GetGPUMem().Get(), in->GetGPUMemory());
+        EXPECT_EQ(again->GetGPUMemory(), in->GetGPUMemory());
         EXPECT_FALSE(src->IsGPUMemDirty());
         EXPECT_EQ(in->GetCompOrder(), CompOrderRGBA | (3 << 4));
-        // A second device image of the same image reuses it.
-        auto again = KROMBuffer::CreateImage(ctx, src.Get(), KROMBufferRead);
-        EXPECT_EQ(again->GetGPUMemory(), in->GetGPUMemory());
     }
-    Ref<Image> copy = CopyOnDevice(ctx, src.Get(), DepthRGBAFlt32); // downloads
-    EXPECT_EQ(std::memcmp(copy->ScanLine(0), src->ScanLine(0), src->RowBytes() * 9), 0);
+    EXPECT_TRUE(SameBits(*CopyOnDevice(ctx, src.Get(), DepthRGBAFlt32), *src)); // downloads
 
     auto out = KROMBuffer::CreateImage(ctx, dst.Get(), KROMBufferWrite);
     dst->SetGPUMem(out->GetGPUMemory(), true);
@@ -235,7 +207,7 @@ TEST(DeviceImages, UploadIsKeptAndDeviceResultsAreStaleUntilDownloaded) {
 
 TEST(DeviceImages, ShareLocksKeepAWriterApart) {
     ORVANE_NEED_OPENCL(ctx);
-    Ref<Image> img = Orvane::Test::PatternImage(4, 4);
+    Ref<Image> img = PatternImage(4, 4);
     auto reader = KROMBuffer::CreateImage(ctx, img.Get(), KROMBufferRead);
     GPUMemory *mem = reader->GetGPUMemory();
     ASSERT_NE(mem, nullptr);
@@ -270,9 +242,8 @@ TEST(KernelCaches, CompileOncePerContextAndReuseBinariesFromDisk) {
         // A fresh context has no kernels: the first compiles and stores, the second loads.
         std::unique_ptr<IDeviceContext> fresh = OpenDeviceContext(DeviceBackend::OpenCL, &log);
         ASSERT_TRUE(fresh) << log;
-        Ref<Image> src = Orvane::Test::PatternImage(8, 3);
-        Ref<Image> copy = CopyOnDevice(fresh.get(), src.Get(), DepthRGBAFlt32);
-        EXPECT_EQ(std::memcmp(copy->ScanLine(0), src->ScanLine(0), src->RowBytes() * 3), 0) << "round " << round;
+        Ref<Image> src = PatternImage(8, 3);
+        EXPECT_TRUE(SameBits(*CopyOnDevice(fresh.get(), src.Get(), DepthRGBAFlt32), *src)) << "round " << round;
         EXPECT_EQ(files(), 1u) << "round " << round;
     }
     unsetenv("ORVANE_KERNEL_CACHE");
@@ -310,37 +281,25 @@ TEST(DeviceThread, ExecuteWaitsNestsAndQueuesInOrder) {
 
 TEST(DeviceMatrix, ApplyMatrixOnTheDeviceGivesTheRowsBits) {
     ORVANE_NEED_OPENCL(ctx);
-    Ref<Image> src = Orvane::Test::PatternImage(41, 23, DepthRGBAFlt32, 7);
+    Ref<Image> src = PatternImage(41, 23, DepthRGBAFlt32, 7);
     src->SetCanvasColor(FltPixel{0.1f, 0.2f, 0.3f, 0.5f});
     ColorMatrixFull m;
     m.Scale(0, 1.3).Offset(1, -0.07).Scale(2, 0.6).Offset(3, 0.02);
     m.m[0][1] = 0.25, m.m[2][0] = -0.125, m.m[3][2] = 0.3;
-    // The output reaches beyond the source on every side: canvas there.
-    const ImgRectI wider(-5, -3, 47, 30);
+    const ImgRectI wider(-5, -3, 47, 30); // beyond the source on every side: canvas there
     for (int depth : {DepthRGBAFlt32, DepthRGBAInt16, DepthAFlt32}) {
-        Ref<Image> cpu = NewImageTagList({{ImgLikeImage, src.Get()}, {ImgDepth, depth}, {ImgDataWindow, &wider}});
-        Ref<Image> dev = NewImageTagList({{ImgLikeImage, src.Get()}, {ImgDepth, depth}, {ImgDataWindow, &wider}});
+        Ref<Image> cpu = Blank(41, 23, depth, &wider), dev = Blank(41, 23, depth, &wider);
         ASSERT_TRUE(ApplyMatrixTagList(src.Get(), cpu.Get(), {{MtxColorMatrixFull, &m}}));
-        RenderTask task;
-        task.SetDevice(ctx);
-        Request req(nullptr, nullptr, 0.0, 0, &task);
+        DeviceRender render(ctx);
         const int launches = ctx->LaunchCount();
-        ASSERT_TRUE(
-            ApplyMatrixTagList(src.Get(), dev.Get(), {{MtxColorMatrixFull, &m}, {WorkUseGPU, 1}, {WorkRequest, &req}}));
+        ASSERT_TRUE(ApplyMatrixTagList(src.Get(), dev.Get(), render.On({{MtxColorMatrixFull, &m}})));
         EXPECT_EQ(ctx->LaunchCount(), launches + 1) << "the device ran it";
-        EXPECT_TRUE(dev->IsGPUMemDirty());
-        ASSERT_TRUE(dev->DownloadGPUMem());
+        ASSERT_TRUE(dev->IsGPUMemDirty() && dev->DownloadGPUMem());
         EXPECT_EQ(dev->GetCanvasColor(), cpu->GetCanvasColor());
-        const size_t bytes = cpu->RowBytes() * wider.Height();
         if (FormatOfDepth(depth).isFloat) {
-            EXPECT_EQ(std::memcmp(dev->ScanLine(wider.y0), cpu->ScanLine(wider.y0), bytes), 0) << "depth " << depth;
+            EXPECT_TRUE(SameBits(*dev, *cpu)) << "depth " << depth;
         }
-        for (int y = wider.y0; y < wider.y1; ++y)
-            for (int x = wider.x0; x < wider.x1; ++x) {
-                const FltPixel a = dev->GetFlt(x, y), b = cpu->GetFlt(x, y);
-                ASSERT_NEAR(a.R, b.R, 1.6e-5) << depth << " " << x << "," << y;
-                ASSERT_NEAR(a.A, b.A, 1.6e-5);
-            }
+        EXPECT_LE(MaxDiff(*dev, *cpu, wider), 1.6e-5) << "depth " << depth;
     }
 }
 
