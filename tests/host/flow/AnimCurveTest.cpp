@@ -26,28 +26,28 @@ AnimCurve Numbers(std::initializer_list<std::pair<double, double>> keys, KeyInte
     return c;
 }
 
-TEST(AnimCurve, LinearMeetsItsKeysAndStraightLinesBetween) {
-    const AnimCurve c = Numbers({{0, 1}, {10, 3}, {14, -5}, {20, -5}}, KeyInterp::Linear);
-    struct Case {
-        double t, v;
-    };
-    const Case cases[] = {
+bool ReadCurve(const ScriptVal &form, OvID type, AnimCurve &out) {
+    return AnimCurve::FromScript(
+        form, [type](const ScriptVal &v) { return ParameterFromScript(type, v); }, out);
+}
+
+TEST(AnimCurve, LinearAndHoldMeetTheirKeysAndHoldAtTheEnds) {
+    const AnimCurve linear = Numbers({{0, 1}, {10, 3}, {14, -5}, {20, -5}}, KeyInterp::Linear);
+    const std::pair<double, double> onLinear[] = {
         {0, 1},    {10, 3},     {14, -5},     {20, -5},            // keys
         {5, 2},    {2.5, 1.5},  {12, -1},     {13, -3},  {17, -5}, // on the lines
         {-100, 1}, {-0.001, 1}, {20.001, -5}, {1e9, -5},           // the ends hold
     };
-    for (const Case &k : cases) EXPECT_DOUBLE_EQ(At(c, k.t), k.v) << "t = " << k.t;
-}
+    for (const auto &[t, v] : onLinear) EXPECT_DOUBLE_EQ(At(linear, t), v) << "linear, t = " << t;
 
-TEST(AnimCurve, HoldKeepsAKeyUntilTheNext) {
-    AnimCurve c = Numbers({{0, 1}, {10, 3}, {20, 7}}, KeyInterp::Hold);
-    const double times[] = {0, 0.5, 9.999, 10, 15, 19.999, 20, 50, -3};
-    const double values[] = {1, 1, 1, 3, 3, 3, 7, 7, 1};
-    for (size_t i = 0; i < std::size(times); ++i) EXPECT_EQ(At(c, times[i]), values[i]) << "t = " << times[i];
+    AnimCurve hold = Numbers({{0, 1}, {10, 3}, {20, 7}}, KeyInterp::Hold);
+    const std::pair<double, double> onHold[] = {{0, 1},      {0.5, 1}, {9.999, 1}, {10, 3}, {15, 3},
+                                                {19.999, 3}, {20, 7},  {50, 7},    {-3, 1}};
+    for (const auto &[t, v] : onHold) EXPECT_EQ(At(hold, t), v) << "hold, t = " << t;
     // The interpolation belongs to the key that starts a span.
-    c.SetKey(10, MakeRef<Number>(3.0), KeyInterp::Linear);
-    EXPECT_EQ(At(c, 5), 1.0);
-    EXPECT_DOUBLE_EQ(At(c, 15), 5.0);
+    hold.SetKey(10, MakeRef<Number>(3.0), KeyInterp::Linear);
+    EXPECT_EQ(At(hold, 5), 1.0);
+    EXPECT_DOUBLE_EQ(At(hold, 15), 5.0);
 }
 
 TEST(AnimCurve, SmoothPassesThroughKeysWithMatchingSlopes) {
@@ -78,14 +78,11 @@ TEST(AnimCurve, SmoothPassesThroughKeysWithMatchingSlopes) {
 TEST(AnimCurve, SettingAKeyAtAnExistingTimeReplacesIt) {
     AnimCurve c = Numbers({{10, 1}, {0, 5}, {5, 2}}, KeyInterp::Linear);
     ASSERT_EQ(c.Keys().size(), 3u);
-    EXPECT_EQ(c.Keys()[0].time, 0);
-    EXPECT_EQ(c.Keys()[1].time, 5);
-    EXPECT_EQ(c.Keys()[2].time, 10);
+    for (size_t i = 0; i < 3; ++i) EXPECT_EQ(c.Keys()[i].time, 5.0 * i) << "keys in time order";
     c.SetKey(5, MakeRef<Number>(9.0), KeyInterp::Hold);
     ASSERT_EQ(c.Keys().size(), 3u);
     EXPECT_EQ(At(c, 5), 9.0);
-    EXPECT_EQ(c.Keys()[1].interp, KeyInterp::Hold);
-    EXPECT_EQ(At(c, 7), 9.0);
+    EXPECT_EQ(At(c, 7), 9.0) << "the replacing key's interpolation";
     EXPECT_TRUE(c.RemoveKey(5));
     EXPECT_FALSE(c.RemoveKey(5));
     EXPECT_DOUBLE_EQ(At(c, 5), 3.0);
@@ -111,33 +108,26 @@ TEST(AnimCurve, PointsInterpolatePerComponent) {
             EXPECT_DOUBLE_EQ(p->y, At(ys, t)) << "t = " << t;
         }
     }
-    AnimCurve linear;
-    linear.SetKey(0, MakeRef<Point>(0.0, 10.0));
-    linear.SetKey(8, MakeRef<Point>(4.0, 2.0));
-    const Ref<Parameter> v = linear.ValueAt(2);
-    auto *mid = dynamic_cast<const Point *>(v.Get());
-    ASSERT_NE(mid, nullptr);
-    EXPECT_DOUBLE_EQ(mid->x, 1.0);
-    EXPECT_DOUBLE_EQ(mid->y, 8.0);
 }
 
 TEST(AnimCurve, ValuesThatCannotBlendHold) {
     for (const KeyInterp interp : {KeyInterp::Linear, KeyInterp::Smooth, KeyInterp::Hold}) {
         SCOPED_TRACE(KeyInterpName(interp));
-        AnimCurve texts;
-        texts.SetKey(0, MakeRef<Text>("first"), interp);
-        texts.SetKey(10, MakeRef<Text>("second"), interp);
-        texts.SetKey(20, MakeRef<Text>("third"), interp);
-        AnimCurve ids;
-        ids.SetKey(0, MakeRef<IDValue>(OvID("ModeA")), interp);
-        ids.SetKey(10, MakeRef<IDValue>(OvID("ModeB")), interp);
-        const double times[] = {-1, 0, 4, 6, 9.9, 10, 16, 25};
-        const char *const wantText[] = {"first", "first", "first", "first", "first", "second", "second", "third"};
-        const char *const wantID[] = {"ModeA", "ModeA", "ModeA", "ModeA", "ModeA", "ModeB", "ModeB", "ModeB"};
-        for (size_t i = 0; i < std::size(times); ++i) {
-            EXPECT_EQ(dynamic_cast<const Text &>(*texts.ValueAt(times[i])).value, wantText[i]) << "t = " << times[i];
-            EXPECT_EQ(dynamic_cast<const IDValue &>(*ids.ValueAt(times[i])).value, OvID(wantID[i]))
-                << "t = " << times[i];
+        AnimCurve texts, ids;
+        for (const auto &[t, text] : {std::pair{0.0, "first"}, {10.0, "second"}, {20.0, "third"}}) {
+            texts.SetKey(t, MakeRef<Text>(text), interp);
+            if (t < 20) ids.SetKey(t, MakeRef<IDValue>(OvID(text)), interp);
+        }
+        for (const auto &[t, text] : {std::pair{-1.0, "first"},
+                                      {0.0, "first"},
+                                      {6.0, "first"},
+                                      {9.9, "first"},
+                                      {10.0, "second"},
+                                      {16.0, "second"},
+                                      {25.0, "third"}}) {
+            EXPECT_EQ(dynamic_cast<const Text &>(*texts.ValueAt(t)).value, text) << "t = " << t;
+            EXPECT_EQ(dynamic_cast<const IDValue &>(*ids.ValueAt(t)).value, OvID(t < 10 ? "first" : "second"))
+                << "t = " << t;
         }
     }
 }
@@ -156,10 +146,8 @@ TEST(AnimCurve, TheDocumentFormRoundTrips) {
     EXPECT_EQ(form.At(2)->Find("Interp")->AsText(), "Smooth");
 
     // Through text and back, with the values read as numbers.
-    const ScriptVal reread = ScriptVal::FromText(form.ToText());
     AnimCurve back;
-    ASSERT_TRUE(AnimCurve::FromScript(
-        reread, [](const ScriptVal &v) { return ParameterFromScript(CLSID_DataType_Number, v); }, back));
+    ASSERT_TRUE(ReadCurve(ScriptVal::FromText(form.ToText()), CLSID_DataType_Number, back));
     ASSERT_EQ(back.Keys().size(), c.Keys().size());
     for (size_t i = 0; i < c.Keys().size(); ++i) {
         EXPECT_EQ(back.Keys()[i].time, c.Keys()[i].time);
@@ -168,14 +156,11 @@ TEST(AnimCurve, TheDocumentFormRoundTrips) {
     }
     EXPECT_EQ(back.ToScript(), form);
 
-    // Points and texts too.
-    AnimCurve points;
+    // Points too.
+    AnimCurve points, pointsBack;
     points.SetKey(1, MakeRef<Point>(0.25, -3.0), KeyInterp::Smooth);
     points.SetKey(2, MakeRef<Point>(1e6, 0.1));
-    AnimCurve pointsBack;
-    ASSERT_TRUE(AnimCurve::FromScript(
-        ScriptVal::FromText(points.ToScript().ToText()),
-        [](const ScriptVal &v) { return ParameterFromScript(CLSID_DataType_Point, v); }, pointsBack));
+    ASSERT_TRUE(ReadCurve(ScriptVal::FromText(points.ToScript().ToText()), CLSID_DataType_Point, pointsBack));
     EXPECT_EQ(pointsBack.ToScript(), points.ToScript());
     EXPECT_TRUE(pointsBack.Keys()[0].value->Equals(Point(0.25, -3.0)));
 }
@@ -196,9 +181,7 @@ TEST(AnimCurve, MalformedDocumentFormsAreRefused) {
         SCOPED_TRACE(text);
         AnimCurve out;
         out.SetKey(3, MakeRef<Number>(3.0));
-        EXPECT_FALSE(AnimCurve::FromScript(
-            ScriptVal::FromText(text), [](const ScriptVal &v) { return ParameterFromScript(CLSID_DataType_Number, v); },
-            out));
+        EXPECT_FALSE(ReadCurve(ScriptVal::FromText(text), CLSID_DataType_Number, out));
         ASSERT_EQ(out.Keys().size(), 1u) << "a refused form leaves the curve alone";
         EXPECT_EQ(out.Keys()[0].time, 3.0);
     }
