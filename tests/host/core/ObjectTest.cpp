@@ -36,46 +36,33 @@ protected:
     ~Counted() override { --aliveCount; }
 };
 
-class DerivedCounted : public Counted {
-public:
+struct DerivedCounted : Counted {
     explicit DerivedCounted(int v) : Counted(v) {}
-    int extra = 5;
 };
 
-TEST(RefHandle, AdoptAndShare) {
+TEST(RefHandle, AdoptShareCopyMoveAndRelease) {
     aliveCount = 0;
     {
-        Ref<Counted> a = MakeRef<Counted>(3);
-        EXPECT_EQ(aliveCount, 1);
-        EXPECT_EQ(a->RefCount(), 1); // the maker's reference, adopted
-        EXPECT_EQ(a->value, 3);
-        EXPECT_EQ((*a).value, 3);
-
         Counted *raw = new Counted(4); // starts with one reference
         Ref<Counted> shared(raw);      // shares: adds one
         EXPECT_EQ(raw->RefCount(), 2);
         raw->Recycle(); // the maker lets go of its own
         EXPECT_EQ(raw->RefCount(), 1);
-        EXPECT_EQ(aliveCount, 2);
-
         Ref<Counted> adopted = Ref<Counted>::Adopt(new Counted(5));
         EXPECT_EQ(adopted->RefCount(), 1);
-        EXPECT_EQ(aliveCount, 3);
+        EXPECT_EQ(aliveCount, 2);
     }
     EXPECT_EQ(aliveCount, 0);
-}
 
-TEST(RefHandle, CopyMoveReleaseReset) {
-    aliveCount = 0;
     Ref<Counted> a = MakeRef<Counted>(1);
     Counted *p = a.Get();
+    EXPECT_EQ(p->RefCount(), 1); // the maker's reference, adopted
     {
         Ref<Counted> b = a; // copy
         EXPECT_EQ(p->RefCount(), 2);
         EXPECT_TRUE(b == a);
         Ref<Counted> c = std::move(b); // move: no change
         EXPECT_EQ(p->RefCount(), 2);
-        EXPECT_FALSE(b);
         EXPECT_EQ(b.Get(), nullptr);
         Ref<Counted> d;
         d = c; // copy assignment
@@ -87,27 +74,19 @@ TEST(RefHandle, CopyMoveReleaseReset) {
         EXPECT_FALSE(c);
     }
     EXPECT_EQ(p->RefCount(), 1);
-
     Counted *released = a.Release();
     EXPECT_EQ(released, p);
     EXPECT_FALSE(a);
     EXPECT_EQ(p->RefCount(), 1);
-    EXPECT_EQ(aliveCount, 1);
     a = Ref<Counted>::Adopt(released);
-
     // Assigning over the last reference deletes the old object.
     a = MakeRef<Counted>(2);
     EXPECT_EQ(aliveCount, 1);
     EXPECT_EQ(a->value, 2);
     a.Reset();
-    EXPECT_FALSE(a);
     EXPECT_EQ(aliveCount, 0);
-
     Ref<Counted> empty = nullptr;
-    EXPECT_FALSE(empty);
-    EXPECT_TRUE(empty == Ref<Counted>());
-    Ref<Counted> nullShare(static_cast<Counted *>(nullptr));
-    EXPECT_FALSE(nullShare);
+    EXPECT_TRUE(empty == Ref<Counted>(static_cast<Counted *>(nullptr)));
     empty.Reset(); // no-op on an empty handle
 }
 
@@ -116,7 +95,6 @@ TEST(RefHandle, DerivedConvertsToBase) {
     Ref<DerivedCounted> d = MakeRef<DerivedCounted>(9);
     {
         Ref<Counted> copy = d; // converting copy: shares
-        EXPECT_EQ(d->RefCount(), 2);
         EXPECT_EQ(copy.Get(), d.Get());
         Ref<RefObject> root = copy;
         EXPECT_EQ(d->RefCount(), 3);
@@ -125,8 +103,6 @@ TEST(RefHandle, DerivedConvertsToBase) {
     Ref<Counted> moved = std::move(d); // converting move: takes the reference over
     EXPECT_FALSE(d);
     EXPECT_EQ(moved->RefCount(), 1);
-    EXPECT_EQ(moved->value, 9);
-    EXPECT_EQ(aliveCount, 1);
     moved.Reset();
     EXPECT_EQ(aliveCount, 0);
 }
@@ -139,13 +115,11 @@ TEST(RefHandle, ConcurrentSharingCountsEveryReference) {
         threads.emplace_back([&obj] {
             for (int i = 0; i < 20000; ++i) {
                 Ref<Counted> a = obj;
-                Ref<Counted> b = a;
-                Ref<RefObject> c = b;
+                Ref<RefObject> b = a;
             }
         });
     for (auto &t : threads) t.join();
     EXPECT_EQ(obj->RefCount(), 1);
-    EXPECT_EQ(aliveCount, 1);
     obj.Reset();
     EXPECT_EQ(aliveCount, 0);
 }
@@ -185,32 +159,22 @@ TEST(ReuserBlocks, FreedBlockIsHandedOutAgain) {
     EXPECT_EQ(Reuser::CachedBlocks(), 0u);
     std::memset(b->bytes, 0xab, sizeof b->bytes); // the whole block is usable
 
-    // Another size class does not take it.
+    // Another size class does not take it; large blocks go back to the heap at once.
     delete b;
     auto *c = new Blob<200>;
     EXPECT_NE(static_cast<void *>(c), where);
-    EXPECT_EQ(Reuser::CachedBlocks(), 1u);
     delete c;
-    EXPECT_EQ(Reuser::CachedBlocks(), 2u);
-
-    // Large blocks go back to the heap at once.
     delete new Blob<4096>;
     EXPECT_EQ(Reuser::CachedBlocks(), 2u);
 
     // The blocks a class hands out next are the ones freed into it.
-    std::vector<Blob<64> *> batch;
-    for (int i = 0; i < 5; ++i) batch.push_back(new Blob<64>);
-    std::set<void *> distinct(batch.begin(), batch.end());
-    EXPECT_EQ(distinct.size(), batch.size());
-    for (auto *p : batch) delete p;
+    std::set<void *> freed, again;
+    for (int i = 0; i < 5; ++i) freed.insert(new Blob<64>);
+    ASSERT_EQ(freed.size(), 5u);
+    for (void *p : freed) delete static_cast<Blob<64> *>(p);
     EXPECT_EQ(Reuser::CachedBlocks(), 7u);
-    std::set<void *> again;
-    for (int i = 0; i < 5; ++i) {
-        auto *p = new Blob<64>;
-        EXPECT_TRUE(distinct.count(p)) << "block " << i << " is not one of the freed ones";
-        again.insert(p);
-    }
-    EXPECT_EQ(again, distinct);
+    for (int i = 0; i < 5; ++i) again.insert(new Blob<64>);
+    EXPECT_EQ(again, freed);
     for (void *p : again) delete static_cast<Blob<64> *>(p);
 
     Reuser::Trim();
@@ -218,8 +182,10 @@ TEST(ReuserBlocks, FreedBlockIsHandedOutAgain) {
 }
 
 TEST(ReuserBlocks, NoBlockHasTwoOwnersUnderConcurrency) {
-    struct Owned : Reuser {
-        uint32_t owner = 0, serial = 0;
+    // Two size classes; each block is stamped with its owner and round, and
+    // checked after the others have had the chance to take it.
+    struct Large : Reuser {
+        uint64_t stamp = 0;
         unsigned char pad[40];
     };
     struct Small : Reuser {
@@ -228,46 +194,36 @@ TEST(ReuserBlocks, NoBlockHasTwoOwnersUnderConcurrency) {
     std::mutex liveLock;
     std::unordered_set<const void *> live;
     std::atomic<int> doubleOwned{0}, clobbered{0};
-
     constexpr int Threads = 6, Rounds = 3000, Batch = 12;
     std::vector<std::thread> threads;
     for (int t = 0; t < Threads; ++t)
         threads.emplace_back([&, t] {
-            std::vector<Owned *> mine;
+            std::vector<Large *> large;
             std::vector<Small *> small;
             for (int round = 0; round < Rounds; ++round) {
+                const uint64_t stamp = (static_cast<uint64_t>(t) << 32) | static_cast<uint32_t>(round);
                 for (int i = 0; i < Batch; ++i) {
-                    auto *o = new Owned;
-                    o->owner = static_cast<uint32_t>(t);
-                    o->serial = static_cast<uint32_t>(round * Batch + i);
-                    std::memset(o->pad, t, sizeof o->pad);
-                    auto *s = new Small;
-                    s->stamp = (static_cast<uint64_t>(t) << 32) | static_cast<uint32_t>(round);
-                    {
-                        std::lock_guard<std::mutex> guard(liveLock);
-                        if (!live.insert(o).second) ++doubleOwned;
-                        if (!live.insert(s).second) ++doubleOwned;
-                    }
-                    mine.push_back(o);
-                    small.push_back(s);
+                    large.push_back(new Large);
+                    small.push_back(new Small);
+                    large.back()->stamp = small.back()->stamp = stamp + (uint64_t(i) << 48);
+                    std::memset(large.back()->pad, t, sizeof large.back()->pad);
+                    std::lock_guard<std::mutex> guard(liveLock);
+                    doubleOwned += !live.insert(large.back()).second + !live.insert(small.back()).second;
                 }
                 std::this_thread::yield();
-                for (size_t i = 0; i < mine.size(); ++i) {
-                    const Owned *o = mine[i];
-                    bool ok = o->owner == static_cast<uint32_t>(t) &&
-                              o->serial == static_cast<uint32_t>(round * Batch + static_cast<int>(i));
-                    for (unsigned char c : o->pad) ok = ok && c == static_cast<unsigned char>(t);
-                    ok = ok && small[i]->stamp == ((static_cast<uint64_t>(t) << 32) | static_cast<uint32_t>(round));
-                    if (!ok) ++clobbered;
-                }
-                {
+                for (int i = 0; i < Batch; ++i) {
+                    bool ok = large[i]->stamp == stamp + (uint64_t(i) << 48) && small[i]->stamp == large[i]->stamp;
+                    for (unsigned char c : large[i]->pad) ok = ok && c == static_cast<unsigned char>(t);
+                    clobbered += !ok;
                     std::lock_guard<std::mutex> guard(liveLock);
-                    for (Owned *o : mine) live.erase(o);
-                    for (Small *s : small) live.erase(s);
+                    live.erase(large[i]);
+                    live.erase(small[i]);
                 }
-                for (Owned *o : mine) delete o;
-                for (Small *s : small) delete s;
-                mine.clear();
+                for (int i = 0; i < Batch; ++i) {
+                    delete large[i];
+                    delete small[i];
+                }
+                large.clear();
                 small.clear();
             }
         });
@@ -292,21 +248,16 @@ TEST(OvIDIntern, EqualTextSharesOnePointer) {
     EXPECT_NE(a, OvID("ObjTestInterneD"));
     EXPECT_EQ(std::hash<OvID>()(a), std::hash<OvID>()(b));
     EXPECT_EQ(OvID::FromInterned(a.Text()), a);
-
-    EXPECT_TRUE(OvID().IsNull());
-    EXPECT_TRUE(OvID("").IsNull());
-    EXPECT_TRUE(OvID(static_cast<const char *>(nullptr)).IsNull());
-    EXPECT_EQ(OvID(""), OvID());
-    EXPECT_STREQ(OvID().Text(), "");
-    EXPECT_FALSE(OvID());
+    for (const OvID &null : {OvID(), OvID(""), OvID(static_cast<const char *>(nullptr))}) {
+        EXPECT_TRUE(null.IsNull());
+        EXPECT_FALSE(null);
+        EXPECT_STREQ(null.Text(), "");
+    }
     EXPECT_TRUE(a);
-
     // Ordering follows the text.
-    EXPECT_TRUE(OvID("ObjTestA") < OvID("ObjTestB"));
-    EXPECT_FALSE(OvID("ObjTestB") < OvID("ObjTestA"));
-    EXPECT_FALSE(OvID("ObjTestA") < OvID("ObjTestA"));
-    EXPECT_TRUE(OvID() < OvID("ObjTestA"));
-    EXPECT_TRUE(OvID("ObjTestAB") < OvID("ObjTestB"));
+    const char *const ordered[] = {"", "ObjTestA", "ObjTestAB", "ObjTestB"};
+    for (const char *x : ordered)
+        for (const char *y : ordered) EXPECT_EQ(OvID(x) < OvID(y), std::string(x) < y) << x << " < " << y;
 }
 
 TEST(OvIDIntern, ManyThreadsAgree) {
@@ -355,21 +306,18 @@ TEST(ScriptInfoTypes, RecordAndDerivation) {
 
     SetTypeInfo(typeid(TypeMid), typeid(TypeRoot));
     SetTypeInfo(typeid(TypeLeaf), typeid(TypeMid));
-    struct Case {
+    const struct {
         const std::type_info &type, &base;
         bool derives;
-    };
-    const Case cases[] = {
+    } cases[] = {
         {typeid(TypeLeaf), typeid(TypeMid), true},    {typeid(TypeLeaf), typeid(TypeRoot), true},
         {typeid(TypeMid), typeid(TypeRoot), true},    {typeid(TypeRoot), typeid(TypeLeaf), false},
         {typeid(TypeMid), typeid(TypeLeaf), false},   {typeid(TypeLoose), typeid(TypeRoot), false},
         {typeid(TypeLoose), typeid(TypeLoose), true}, // a type is its own base, recorded or not
         {typeid(TypeLeaf), typeid(TypeLeaf), true},   {typeid(TypeRoot), typeid(TypeLoose), false},
     };
-    for (const Case &c : cases) {
-        SCOPED_TRACE(testing::Message() << c.type.name() << " from " << c.base.name());
-        EXPECT_EQ(TypeDerivesFrom(c.type, c.base), c.derives);
-    }
+    for (const auto &c : cases)
+        EXPECT_EQ(TypeDerivesFrom(c.type, c.base), c.derives) << c.type.name() << " from " << c.base.name();
 
     // Re-recording a link replaces it; clearing one cuts the chain there.
     SetTypeInfo(typeid(TypeLeaf), typeid(TypeLoose));
@@ -400,52 +348,46 @@ struct WorkerCountGuard {
     ~WorkerCountGuard() { SetWorkerCount(saved); }
 };
 
+/// How many of `hits` differ from `times`.
+int Wrong(const std::vector<std::atomic<int>> &hits, int times = 1) {
+    int wrong = 0;
+    for (const auto &h : hits) wrong += h.load() != times;
+    return wrong;
+}
+
 TEST(ParallelJobs, RangeCoveredExactlyOnce) {
     WorkerCountGuard guard;
-    struct Range {
-        int first, last;
-    };
-    const Range ranges[] = {{0, 0}, {5, 5}, {9, 3}, {3, 4}, {-17, 250}, {0, 1000}, {100, 2101}};
+    const std::pair<int, int> ranges[] = {{0, 0}, {5, 5}, {9, 3}, {3, 4}, {-17, 250}, {0, 1000}, {100, 2101}};
     for (int workers : {1, 2, 3, 8}) {
         SetWorkerCount(workers);
         EXPECT_EQ(WorkerCount(), workers);
-        for (int grain : {-3, 0, 1, 3, 7, 64, 5000}) {
-            for (const Range &r : ranges) {
-                SCOPED_TRACE(testing::Message() << "workers " << workers << " grain " << grain << " range [" << r.first
-                                                << ", " << r.last << ")");
-                const int n = std::max(r.last - r.first, 0);
-                std::vector<std::atomic<int>> hits(n);
+        for (int grain : {-3, 0, 1, 3, 7, 64, 5000})
+            for (const auto &[first, last] : ranges) {
+                SCOPED_TRACE(testing::Message() << "workers " << workers << " grain " << grain << " range [" << first
+                                                << ", " << last << ")");
+                const int n = std::max(last - first, 0);
+                std::vector<std::atomic<int>> hits(n), each(n);
                 std::atomic<int> badPieces{0};
                 ParallelRange(
-                    r.first, r.last,
+                    first, last,
                     [&](int b, int e) {
-                        if (b >= e || b < r.first || e > r.last) {
-                            ++badPieces;
-                            return;
-                        }
-                        for (int i = b; i < e; ++i) ++hits[i - r.first];
+                        if (b >= e || b < first || e > last) return void(++badPieces);
+                        for (int i = b; i < e; ++i) ++hits[i - first];
                     },
                     grain);
-                EXPECT_EQ(badPieces.load(), 0);
-                int wrong = 0;
-                for (int i = 0; i < n; ++i) wrong += hits[i].load() != 1;
-                EXPECT_EQ(wrong, 0);
-
-                std::vector<std::atomic<int>> each(n);
                 ParallelFor(
                     n, [&](int i) { ++each[i]; }, grain);
-                wrong = 0;
-                for (int i = 0; i < n; ++i) wrong += each[i].load() != 1;
-                EXPECT_EQ(wrong, 0);
+                EXPECT_EQ(badPieces.load(), 0);
+                EXPECT_EQ(Wrong(hits), 0);
+                EXPECT_EQ(Wrong(each), 0);
             }
-        }
     }
     int calls = 0;
     ParallelFor(-4, [&](int) { ++calls; });
     EXPECT_EQ(calls, 0);
 }
 
-TEST(ParallelJobs, NestedJobsComplete) {
+TEST(ParallelJobs, NestedJobsAndJobsFromManyThreadsComplete) {
     WorkerCountGuard guard;
     for (int workers : {1, 4}) {
         SetWorkerCount(workers);
@@ -459,36 +401,9 @@ TEST(ParallelJobs, NestedJobsComplete) {
                 },
                 5);
         });
-        int wrong = 0;
-        for (auto &h : hits) wrong += h.load() != 1;
-        EXPECT_EQ(wrong, 0) << "workers " << workers;
+        EXPECT_EQ(Wrong(hits), 0) << "nested, workers " << workers;
     }
-}
 
-TEST(ParallelJobs, OneWorkerRunsInTheCallingThread) {
-    WorkerCountGuard guard;
-    SetWorkerCount(1);
-    EXPECT_EQ(WorkerCount(), 1);
-    const std::thread::id caller = std::this_thread::get_id();
-    std::atomic<int> elsewhere{0}, covered{0};
-    ParallelRange(
-        0, 100000,
-        [&](int b, int e) {
-            if (std::this_thread::get_id() != caller) ++elsewhere;
-            covered += e - b;
-        },
-        1);
-    EXPECT_EQ(elsewhere.load(), 0);
-    EXPECT_EQ(covered.load(), 100000);
-
-    SetWorkerCount(0); // one per core
-    EXPECT_EQ(WorkerCount(), tbb::info::default_concurrency());
-    SetWorkerCount(-5);
-    EXPECT_EQ(WorkerCount(), tbb::info::default_concurrency());
-}
-
-TEST(ParallelJobs, JobsFromManyThreadsAtOnce) {
-    WorkerCountGuard guard;
     SetWorkerCount(3);
     constexpr int Callers = 4, N = 5000;
     std::vector<std::vector<std::atomic<int>>> hits;
@@ -505,10 +420,27 @@ TEST(ParallelJobs, JobsFromManyThreadsAtOnce) {
                     16);
         });
     for (auto &t : callers) t.join();
-    int wrong = 0;
-    for (auto &row : hits)
-        for (auto &h : row) wrong += h.load() != 10;
-    EXPECT_EQ(wrong, 0);
+    for (const auto &row : hits) EXPECT_EQ(Wrong(row, 10), 0) << "from many threads";
+}
+
+TEST(ParallelJobs, OneWorkerRunsInTheCallingThread) {
+    WorkerCountGuard guard;
+    SetWorkerCount(1);
+    const std::thread::id caller = std::this_thread::get_id();
+    std::atomic<int> elsewhere{0}, covered{0};
+    ParallelRange(
+        0, 100000,
+        [&](int b, int e) {
+            if (std::this_thread::get_id() != caller) ++elsewhere;
+            covered += e - b;
+        },
+        1);
+    EXPECT_EQ(elsewhere.load(), 0);
+    EXPECT_EQ(covered.load(), 100000);
+    for (int zeroOrLess : {0, -5}) { // one per core
+        SetWorkerCount(zeroOrLess);
+        EXPECT_EQ(WorkerCount(), tbb::info::default_concurrency());
+    }
 }
 
 } // namespace
