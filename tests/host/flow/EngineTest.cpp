@@ -2,6 +2,7 @@
 // order of priority levels, what has arrived at each CheckRequest, regions of
 // interest and domains, pre-calculation, skipped inputs, failures, aborts and
 // determinism over thread counts.
+#include <algorithm>
 #include <cmath>
 #include <functional>
 #include <new>
@@ -30,9 +31,8 @@ std::string D(const std::optional<ImageDomain> &d) { return d ? R(d->rect) : "no
 struct Seen {
     int pri = 0;
     bool precalc = false;
-    std::vector<bool> hasData;                   ///< per watched input
-    std::vector<std::optional<ImageDomain>> roi; ///< per watched input
-    std::vector<std::optional<ImageDomain>> dod; ///< per watched input
+    std::vector<bool> hasData;                        ///< per watched input
+    std::vector<std::optional<ImageDomain>> roi, dod; ///< per watched input
     std::optional<ImageDomain> reqRoI, outDoD;
     bool inputNoData = false; ///< the main input image (when present) had no rows
     ImgRectI inputWindow;     ///< data window of the main input image
@@ -43,16 +43,14 @@ struct Seen {
 class Probe : public ThreadedOperator {
 public:
     Probe(const Registry *reg, const ScriptVal &args, const TagList &tags) : ThreadedOperator(reg, args, tags) {
-        last = AddInputTagList(
-            "Last", "Last",
-            {{LinkDataType, CLSID_DataType_Number}, {InputPriority, PriorityLast}, {InputDefault, 2.0}});
-        input = AddInputTagList("Input", "Input", {{LinkDataType, CLSID_DataType_Image}, {LinkMain, 1}});
-        amount = AddInputTagList("Amount", "Amount", {{LinkDataType, CLSID_DataType_Number}, {InputDefault, 0.5}});
-        late = AddInputTagList("Late", "Late",
-                               {{LinkDataType, CLSID_DataType_Image}, {InputPriority, 5}, {InputRequired, 0}});
-        matte = AddInputTagList(
-            "Matte", "Matte", {{LinkDataType, CLSID_DataType_Mask}, {InputPriority, PriorityMask}, {InputRequired, 0}});
-        output = AddOutputTagList("Output", "Output", {{LinkDataType, CLSID_DataType_Image}, {LinkMain, 1}});
+        const Tag type = LinkDataType;
+        last = AddInputTagList("Last", "Last", {{type, CLSID_DataType_Number}, {InputPriority, PriorityLast}});
+        input = AddInputTagList("Input", "Input", {{type, CLSID_DataType_Image}, {LinkMain, 1}});
+        amount = AddInputTagList("Amount", "Amount", {{type, CLSID_DataType_Number}, {InputDefault, 0.5}});
+        late = AddInputTagList("Late", "Late", {{type, CLSID_DataType_Image}, {InputPriority, 5}, {InputRequired, 0}});
+        matte = AddInputTagList("Matte", "Matte",
+                                {{type, CLSID_DataType_Mask}, {InputPriority, PriorityMask}, {InputRequired, 0}});
+        output = AddOutputTagList("Output", "Output", {{type, CLSID_DataType_Image}, {LinkMain, 1}});
         watched = {last, input, amount, late, matte};
     }
 
@@ -88,7 +86,7 @@ public:
     }
 
     /// The tool's own work: a fixed colour function of the main input (or of
-    /// Late when Input was dropped) over the input's data window.
+    /// Late when Input was dropped) over the input's data window and region.
     void MakeOutput(Request *req) {
         auto *src = dynamic_cast<Image *>(req->GetInputData(input));
         if (!src) src = dynamic_cast<Image *>(req->GetInputData(late));
@@ -96,8 +94,7 @@ public:
             Fail(req, "%s: nothing to work on\n", Name().c_str());
             return req->SetOutputData(output, nullptr);
         }
-        auto *k = dynamic_cast<const Number *>(req->GetInputData(amount));
-        const float gain = k ? static_cast<float>(k->value) : 0.f;
+        const float gain = static_cast<float>(dynamic_cast<const Number &>(*req->GetInputData(amount)).value);
         ImgRectI dw = src->DataWindow();
         if (const AutoImageRoI roi(req); roi) dw &= roi->rect;
         const FltPixel canvas = Color(src->GetCanvasColor(), gain);
@@ -105,12 +102,10 @@ public:
             {{ImgLikeImage, src}, {ImgDataWindow, &dw}, {ImgNoData, req->IsPreCalc()}, {ImgCanvasColor, &canvas}});
         if (!req->IsPreCalc() && !dw.IsNull()) {
             img->AllocScanLineData();
-            DoMultiProcess(
-                [&](int i) {
-                    const int y = dw.y0 + i;
-                    for (int x = dw.x0; x < dw.x1; ++x) img->PutFlt(x, y, Color(src->GetFlt(x, y), gain));
-                },
-                dw.Height());
+            auto row = [&](int i) {
+                for (int x = dw.x0; x < dw.x1; ++x) img->PutFlt(x, dw.y0 + i, Color(src->GetFlt(x, dw.y0 + i), gain));
+            };
+            DoMultiProcess(row, dw.Height());
         }
         req->SetOutputData(output, img.Get());
     }
@@ -121,14 +116,12 @@ public:
 
     std::vector<Seen> Checks(bool precalc) const {
         std::vector<Seen> out;
-        for (const Seen &s : checks)
-            if (s.precalc == precalc) out.push_back(s);
+        std::copy_if(checks.begin(), checks.end(), std::back_inserter(out),
+                     [&](auto &s) { return s.precalc == precalc; });
         return out;
     }
-    int PixelCalls() const {
-        int n = 0;
-        for (const Seen &s : calls) n += s.precalc ? 0 : 1;
-        return n;
+    long PixelCalls() const {
+        return std::count_if(calls.begin(), calls.end(), [](auto &s) { return !s.precalc; });
     }
 
     Input *last, *input, *amount, *late, *matte;
@@ -144,38 +137,16 @@ enum Watched { WLast, WInput, WAmount, WLate, WMatte, WCount };
 constexpr int WatchedPriority[WCount] = {PriorityLast, PriorityImage, PriorityDefault, 5, PriorityMask};
 constexpr bool WatchedIsImage[WCount] = {false, true, false, true, true};
 
-/// A source that records the region of each pixel request.
-class RoISource : public ThreadedOperator {
-public:
-    RoISource(const Registry *reg, const ScriptVal &args, const TagList &tags) : ThreadedOperator(reg, args, tags) {
-        output = AddOutputTagList("Output", "Output", {{LinkDataType, CLSID_DataType_Image}, {LinkMain, 1}});
-    }
-    void Process(Request *req) override {
-        if (req->IsPreCalc()) {
-            const ImgRectI dw = image->DataWindow();
-            return req->SetOutputData(
-                output, NewImageTagList({{ImgLikeImage, image.Get()}, {ImgDataWindow, &dw}, {ImgNoData, 1}}));
-        }
-        rois.push_back(req->RoI());
-        req->SetOutputData(output, image);
-    }
-    Ref<Image> image = ts::PatternImage(12, 8);
-    Output *output;
-    std::vector<std::optional<ImageDomain>> rois;
-};
-
 struct Classes {
+    ClassFactory make = &ts::MakeTool<Probe>;
     OvID probe =
-        ts::RegisterTool("EngineTestProbe", &ts::MakeTool<Probe>,
+        ts::RegisterTool("EngineTestProbe", make,
                          {{RegSupportsRoI, 1}, {RegSupportsDoD, 1}, {RegNoBlendControls, 1}, {RegNoEffectMask, 1}});
-    OvID probeNoRoI = ts::RegisterTool("EngineTestProbeNoRoI", &ts::MakeTool<Probe>,
-                                       {{RegSupportsDoD, 1}, {RegNoBlendControls, 1}, {RegNoEffectMask, 1}});
-    OvID probeNoDoD = ts::RegisterTool("EngineTestProbeNoDoD", &ts::MakeTool<Probe>,
-                                       {{RegSupportsRoI, 1}, {RegNoBlendControls, 1}, {RegNoEffectMask, 1}});
-    OvID probeCommon =
-        ts::RegisterTool("EngineTestProbeCommon", &ts::MakeTool<Probe>, {{RegSupportsRoI, 1}, {RegSupportsDoD, 1}});
-    OvID roiSource =
-        ts::RegisterTool("EngineTestRoISource", &ts::MakeTool<RoISource>, {{RegSupportsRoI, 1}, {RegSupportsDoD, 1}});
+    OvID noRoI = ts::RegisterTool("EngineTestProbeNoRoI", make,
+                                  {{RegSupportsDoD, 1}, {RegNoBlendControls, 1}, {RegNoEffectMask, 1}});
+    OvID noDoD = ts::RegisterTool("EngineTestProbeNoDoD", make,
+                                  {{RegSupportsRoI, 1}, {RegNoBlendControls, 1}, {RegNoEffectMask, 1}});
+    OvID common = ts::RegisterTool("EngineTestProbeCommon", make, {{RegSupportsRoI, 1}, {RegSupportsDoD, 1}});
 };
 const Classes &C() {
     static const Classes classes;
@@ -200,10 +171,7 @@ struct Fed : Doc {
     ts::ImageSourceTool *late = ts::AddImageSource(*doc, "LateSrc", ts::PatternImage(12, 8, 8, 2));
     ts::ImageSourceTool *matte = ts::AddImageSource(*doc, "MatteSrc", ts::PatternImage(12, 8, DepthAFlt32, 4));
     Probe *probe = Add("Probe1", src->Out());
-    Fed() {
-        EXPECT_TRUE(probe->late->ConnectTo(late->Out()));
-        EXPECT_TRUE(probe->matte->ConnectTo(matte->Out()));
-    }
+    Fed() { EXPECT_TRUE(probe->late->ConnectTo(late->Out()) && probe->matte->ConnectTo(matte->Out())); }
 };
 
 EvalOptions PreCalc() {
@@ -211,36 +179,40 @@ EvalOptions PreCalc() {
     opt.flags = ReqFlagPreCalc;
     return opt;
 }
-EvalOptions Region(const std::optional<ImgRectI> &r) {
+EvalOptions WithTask(RenderTask *task) {
     EvalOptions opt;
-    if (r) opt.roi = ImageDomain(*r);
+    opt.task = task;
+    return opt;
+}
+EvalOptions Uncached() {
+    EvalOptions opt;
+    opt.useCache = false;
     return opt;
 }
 
 // ---------------------------------------------------------------------------
+
 TEST(Engine, InputsArriveLevelByLevelLowestFirst) {
     Fed f;
     std::vector<double> amountAtLast;
     f.probe->onCheck = [&](Probe &p, Request *req) {
         if (req->GetPri() == PriorityLast)
-            if (auto *n = dynamic_cast<const Number *>(req->GetInputData(p.amount))) amountAtLast.push_back(n->value);
+            amountAtLast.push_back(dynamic_cast<const Number &>(*req->GetInputData(p.amount)).value);
     };
     ts::SetNumber(f.probe, "Amount", 0.75);
     ASSERT_TRUE(ts::EvalImage(f.probe));
     const std::vector<int> levels{PriorityMask, PriorityImage, PriorityDefault, 5, PriorityLast};
     for (const bool precalc : {true, false}) {
-        SCOPED_TRACE(precalc ? "pre-calculation walk" : "pixel walk");
         const std::vector<Seen> checks = f.probe->Checks(precalc);
         ASSERT_EQ(checks.size(), levels.size()) << "one CheckRequest per level";
         for (size_t k = 0; k < levels.size(); ++k) {
-            SCOPED_TRACE("level " + std::to_string(levels[k]));
+            SCOPED_TRACE(testing::Message() << (precalc ? "pre-calculation" : "pixels") << ", level " << levels[k]);
             EXPECT_EQ(checks[k].pri, levels[k]);
             for (int w = 0; w < WCount; ++w) {
                 // Lower levels have arrived; this level and the ones above have not.
                 EXPECT_EQ(checks[k].hasData[w], WatchedPriority[w] < levels[k]) << "input " << w;
                 // Image domains are known from this input's own level on.
-                EXPECT_EQ(checks[k].dod[w].has_value(), WatchedIsImage[w] && WatchedPriority[w] <= levels[k])
-                    << "input " << w;
+                EXPECT_EQ(checks[k].dod[w].has_value(), WatchedIsImage[w] && WatchedPriority[w] <= levels[k]) << w;
             }
         }
     }
@@ -248,48 +220,44 @@ TEST(Engine, InputsArriveLevelByLevelLowestFirst) {
     EXPECT_EQ(amountAtLast, (std::vector<double>{0.75, 0.75}));
     // Process sees everything; every source rendered once.
     ASSERT_EQ(f.probe->PixelCalls(), 1);
-    for (int w = 0; w < WCount; ++w) EXPECT_TRUE(f.probe->calls.back().hasData[w]) << "input " << w;
+    EXPECT_EQ(f.probe->calls.back().hasData, std::vector<bool>(WCount, true));
     for (const ts::ImageSourceTool *s : {f.src, f.late, f.matte}) EXPECT_EQ(s->processCount, 1) << s->Name();
 }
 
-TEST(Engine, SettingInputDataToNullStopsTheFetch) {
+TEST(Engine, SettingInputDataStopsTheFetch) {
+    const Ref<Image> given = ts::PatternImage(12, 8, 8, 9);
     const struct {
         const char *name;
-        int level;       ///< the CheckRequest level that drops it
-        Watched dropped; ///< the input dropped
+        int level;          ///< the CheckRequest level that sets it
+        Watched input;      ///< the input set
+        const Image *value; ///< what it is set to
     } cases[] = {
-        {"image at its own level", PriorityImage, WInput},
-        {"image from an earlier level", PriorityMask, WLate},
-        {"mask at its own level", PriorityMask, WMatte},
-        {"late image at its own level", 5, WLate},
+        {"null image at its own level", PriorityImage, WInput, nullptr},
+        {"null image from an earlier level", PriorityMask, WLate, nullptr},
+        {"null mask at its own level", PriorityMask, WMatte, nullptr},
+        {"null late image at its own level", 5, WLate, nullptr},
+        {"an image given in place of the input's", PriorityImage, WInput, given.Get()},
     };
     for (const auto &c : cases) {
         SCOPED_TRACE(c.name);
         Fed f;
         f.probe->onCheck = [&](Probe &p, Request *req) {
-            if (!req->IsPreCalc() && req->GetPri() == c.level) req->SetInputData(p.watched[c.dropped], nullptr);
+            if (!req->IsPreCalc() && req->GetPri() == c.level)
+                req->SetInputData(p.watched[c.input], const_cast<Image *>(c.value));
         };
-        ASSERT_TRUE(ts::EvalImage(f.probe));
+        Ref<Image> out = ts::EvalImage(f.probe);
+        ASSERT_TRUE(out);
         ASSERT_FALSE(f.probe->calls.back().precalc);
-        EXPECT_FALSE(f.probe->calls.back().hasData[c.dropped]);
-        EXPECT_EQ(f.src->processCount, c.dropped == WInput ? 0 : 1);
-        EXPECT_EQ(f.late->processCount, c.dropped == WLate ? 0 : 1);
-        EXPECT_EQ(f.matte->processCount, c.dropped == WMatte ? 0 : 1);
+        EXPECT_EQ(f.probe->calls.back().hasData[c.input], c.value != nullptr);
+        EXPECT_EQ(f.src->processCount, c.input == WInput ? 0 : 1);
+        EXPECT_EQ(f.late->processCount, c.input == WLate ? 0 : 1);
+        EXPECT_EQ(f.matte->processCount, c.input == WMatte ? 0 : 1);
         EXPECT_TRUE(f.Lines().empty());
+        if (c.value) {
+            EXPECT_EQ(f.probe->seenInput.Get(), c.value);
+            EXPECT_EQ(out->GetFlt(3, 4), Probe::Color(c.value->GetFlt(3, 4), 0.5f));
+        }
     }
-}
-
-TEST(Engine, SettingInputDataGivesTheValueWithoutFetching) {
-    Fed f;
-    Ref<Image> given = ts::PatternImage(12, 8, 8, 9);
-    f.probe->onCheck = [&](Probe &p, Request *req) {
-        if (req->GetPri() == PriorityImage) req->SetInputData(p.input, given.Get());
-    };
-    Ref<Image> out = ts::EvalImage(f.probe);
-    ASSERT_TRUE(out);
-    EXPECT_EQ(f.probe->seenInput.Get(), given.Get());
-    EXPECT_EQ(f.src->processCount, 0);
-    EXPECT_EQ(out->GetFlt(3, 4), Probe::Color(given->GetFlt(3, 4), 0.5f)) << "the tool's function of the given image";
 }
 
 TEST(Engine, RegionsOfInterestReachUpstream) {
@@ -298,7 +266,7 @@ TEST(Engine, RegionsOfInterestReachUpstream) {
         bool supportsRoI;
         std::optional<ImgRectI> requested; ///< the asker's region
         std::optional<ImgRectI> narrowed;  ///< what CheckRequest sets on Input
-        std::optional<ImgRectI> upstream;  ///< what the source must see
+        std::optional<ImgRectI> upstream;  ///< what the tool above must see
     } cases[] = {
         {"whole frame", true, std::nullopt, std::nullopt, std::nullopt},
         {"default is the request's", true, ImgRectI(1, 2, 9, 6), std::nullopt, ImgRectI(1, 2, 9, 6)},
@@ -306,34 +274,32 @@ TEST(Engine, RegionsOfInterestReachUpstream) {
         {"narrowed from a whole frame", true, std::nullopt, ImgRectI(0, 0, 4, 4), ImgRectI(0, 0, 4, 4)},
         {"a tool without region support", false, ImgRectI(2, 2, 5, 5), std::nullopt, std::nullopt},
     };
-    auto domain = [](const std::optional<ImgRectI> &r) {
-        return r ? std::optional<ImageDomain>(ImageDomain(*r)) : std::nullopt;
-    };
+    const ImgRectI frame(0, 0, 12, 8);
     for (const auto &c : cases) {
         SCOPED_TRACE(c.name);
         Doc d;
-        auto *src = dynamic_cast<RoISource *>(d.doc->AddTool(C().roiSource, "RoISrc"));
-        ASSERT_NE(src, nullptr);
-        Probe *p = d.Add("Probe1", src->output, c.supportsRoI ? C().probe : C().probeNoRoI);
-        std::vector<std::optional<ImageDomain>> roiAtCheck;
+        Probe *up = d.Add("Up", d.src->Out());
+        Probe *p = d.Add("Probe1", up->output, c.supportsRoI ? C().probe : C().noRoI);
         p->onCheck = [&](Probe &self, Request *req) {
-            if (req->IsPreCalc() || req->GetPri() != PriorityImage) return;
-            roiAtCheck.push_back(req->GetInputRoI(self.input));
-            if (c.narrowed) {
-                const ImageDomain narrowed(*c.narrowed);
-                req->SetInputRoI(self.input, &narrowed);
-            }
+            if (req->IsPreCalc() || req->GetPri() != PriorityImage || !c.narrowed) return;
+            const ImageDomain narrowed(*c.narrowed);
+            req->SetInputRoI(self.input, &narrowed);
         };
-        Ref<Image> out = ts::EvalImage(p, 0.0, Region(c.requested));
+        EvalOptions opt;
+        if (c.requested) opt.roi = ImageDomain(*c.requested);
+        Ref<Image> out = ts::EvalImage(p, 0.0, opt);
         ASSERT_TRUE(out);
-        const std::optional<ImageDomain> seen = domain(c.supportsRoI ? c.requested : std::nullopt);
-        ASSERT_EQ(roiAtCheck.size(), 1u);
-        EXPECT_EQ(D(roiAtCheck[0]), D(seen)) << "the default region of an input is the request's";
-        ASSERT_EQ(src->rois.size(), 1u);
-        EXPECT_EQ(D(src->rois[0]), D(domain(c.upstream)));
-        EXPECT_EQ(D(p->calls.back().reqRoI), D(seen));
-        EXPECT_EQ(D(p->calls.back().roi[WInput]), D(domain(c.upstream)));
-        EXPECT_EQ(R(out->DataWindow()), R(seen ? seen->rect : ImgRectI(0, 0, 12, 8)));
+        const bool regionSeen = c.supportsRoI && c.requested;
+        const std::string seen = regionSeen ? R(*c.requested) : "none", upstream = c.upstream ? R(*c.upstream) : "none";
+        const std::vector<Seen> checks = p->Checks(false);
+        ASSERT_EQ(checks.size(), 5u);
+        EXPECT_EQ(D(checks[1].roi[WInput]), seen) << "the default region of an input is the request's";
+        EXPECT_EQ(D(p->calls.back().reqRoI), seen);
+        EXPECT_EQ(D(p->calls.back().roi[WInput]), upstream);
+        EXPECT_EQ(D(up->calls.back().reqRoI), upstream);
+        // The tool above cuts its output to its region, the tool itself to its own.
+        EXPECT_EQ(R(out->DataWindow()),
+                  R(frame & (c.upstream ? *c.upstream : frame) & (regionSeen ? *c.requested : frame)));
     }
 }
 
@@ -360,26 +326,26 @@ TEST(Engine, EveryPixelRequestFollowsAPreCalculation) {
     // The tool chooses a data window of its own; the pixel pass must know it
     // as the output's domain before Process runs.
     const ImgRectI own(1, 2, 5, 7);
-    for (const bool withRoI : {false, true}) {
-        SCOPED_TRACE(withRoI ? "region request" : "whole frame");
+    for (const std::optional<ImgRectI> &roi : {std::optional<ImgRectI>(), std::optional(ImgRectI(0, 0, 3, 3))}) {
+        SCOPED_TRACE(roi ? "region request" : "whole frame");
         Fed f;
         f.probe->onProcess = [&](Probe &p, Request *req) {
             ImgRectI dw = own;
-            if (const AutoImageRoI roi(req); roi) dw &= roi->rect;
+            if (const AutoImageRoI r(req); r) dw &= r->rect;
             Ref<Image> img = NewImageTagList(
                 {{ImgLikeImage, req->GetInputData(p.input)}, {ImgDataWindow, &dw}, {ImgNoData, req->IsPreCalc()}});
             if (!req->IsPreCalc()) img->Fill({1, 1, 1, 1});
             req->SetOutputData(p.output, img.Get());
         };
-        Ref<Image> out =
-            ts::EvalImage(f.probe, 0.0, Region(withRoI ? std::optional(ImgRectI(0, 0, 3, 3)) : std::nullopt));
+        EvalOptions opt;
+        if (roi) opt.roi = ImageDomain(*roi);
+        Ref<Image> out = ts::EvalImage(f.probe, 0.0, opt);
         ASSERT_TRUE(out);
         ASSERT_EQ(f.probe->calls.size(), 2u);
         EXPECT_TRUE(f.probe->calls[0].precalc);
         EXPECT_EQ(D(f.probe->calls[0].reqRoI), "none") << "pre-calculation covers the whole domain";
-        EXPECT_FALSE(f.probe->calls[1].precalc);
         EXPECT_EQ(D(f.probe->calls[1].outDoD), R(own));
-        EXPECT_EQ(R(out->DataWindow()), R(withRoI ? own & ImgRectI(0, 0, 3, 3) : own));
+        EXPECT_EQ(R(out->DataWindow()), R(roi ? own & *roi : own));
     }
 }
 
@@ -391,9 +357,9 @@ TEST(Engine, AToolWithoutDoDSupportGetsWholeFrames) {
         ImgRectI sourceWindow, seenWindow;
     } cases[] = {
         {"domains: inside the frame", C().probe, ImgRectI(2, 3, 6, 7), ImgRectI(2, 3, 6, 7)},
-        {"whole frames: inside the frame", C().probeNoDoD, ImgRectI(2, 3, 6, 7), ImgRectI(0, 0, 10, 8)},
-        {"whole frames: across the frame", C().probeNoDoD, ImgRectI(-2, -1, 4, 5), ImgRectI(-2, -1, 10, 8)},
-        {"whole frames: already covering", C().probeNoDoD, ImgRectI(-1, -1, 11, 9), ImgRectI(-1, -1, 11, 9)},
+        {"whole frames: inside the frame", C().noDoD, ImgRectI(2, 3, 6, 7), ImgRectI(0, 0, 10, 8)},
+        {"whole frames: across the frame", C().noDoD, ImgRectI(-2, -1, 4, 5), ImgRectI(-2, -1, 10, 8)},
+        {"whole frames: already covering", C().noDoD, ImgRectI(-1, -1, 11, 9), ImgRectI(-1, -1, 11, 9)},
     };
     for (const auto &c : cases) {
         SCOPED_TRACE(c.name);
@@ -408,12 +374,10 @@ TEST(Engine, AToolWithoutDoDSupportGetsWholeFrames) {
             EXPECT_EQ(D(s.dod[WInput]), R(c.seenWindow));
             EXPECT_EQ(s.inputNoData, s.precalc);
         }
-        // The canvas made real: the source's pixels inside its window, its
-        // canvas colour elsewhere.
+        // The canvas made real: the source's pixels inside its window, its canvas colour elsewhere.
         ASSERT_TRUE(p->seenInput);
-        const ImgRectI seen = p->seenInput->DataWindow();
-        for (int y = seen.y0; y < seen.y1; ++y)
-            for (int x = seen.x0; x < seen.x1; ++x)
+        for (int y = c.seenWindow.y0; y < c.seenWindow.y1; ++y)
+            for (int x = c.seenWindow.x0; x < c.seenWindow.x1; ++x)
                 ASSERT_EQ(p->seenInput->GetFlt(x, y), c.sourceWindow.Contains(x, y) ? srcImg->GetFlt(x, y) : canvas)
                     << x << "," << y;
     }
@@ -450,20 +414,17 @@ TEST(Engine, AFailingToolStopsTheChainWithItsOneLine) {
     }
 }
 
-TEST(Engine, AToolThatGivesNothingFailsWithOneHostLine) {
+TEST(Engine, AToolThatGivesNothingOrLacksARequiredImageFailsWithOneHostLine) {
     Doc d;
     Probe *silent = d.Add("Silent", d.src->Out());
     silent->onProcess = [](Probe &p, Request *req) {
         if (req->IsPreCalc()) p.MakeOutput(req);
     };
     EXPECT_FALSE(ts::EvalImage(silent, 4.0));
-    const std::vector<ConsoleLine> lines = d.Lines();
-    ASSERT_EQ(lines.size(), 1u);
-    EXPECT_EQ(lines[0].text.rfind("Silent", 0), 0u) << lines[0].text;
-}
+    ASSERT_EQ(d.Lines().size(), 1u);
+    EXPECT_EQ(d.Lines()[0].text.rfind("Silent", 0), 0u) << d.Lines()[0].text;
 
-TEST(Engine, AnUnconnectedRequiredImageFailsNamingTheInput) {
-    Doc d;
+    d.doc->ClearConsole();
     Probe *p = d.Add("Lonely1", nullptr);
     ASSERT_TRUE(p->late->ConnectTo(d.src->Out())); // the tool could work from Late alone
     EXPECT_FALSE(ts::EvalImage(p));
@@ -473,7 +434,6 @@ TEST(Engine, AnUnconnectedRequiredImageFailsNamingTheInput) {
     EXPECT_NE(lines[0].text.find("Lonely1"), std::string::npos) << lines[0].text;
     EXPECT_NE(lines[0].text.find("\"Input\""), std::string::npos) << lines[0].text;
     EXPECT_TRUE(p->calls.empty());
-
     // Optional inputs may stay unconnected.
     d.doc->ClearConsole();
     ASSERT_TRUE(p->input->ConnectTo(d.src->Out()));
@@ -495,11 +455,8 @@ TEST(Engine, RunningOutOfMemoryGivesTheOutOfMemoryLine) {
         p->onProcess = [&](Probe &self, Request *req) {
             if (req->IsPreCalc()) return self.MakeOutput(req);
             if (!c.inChunk) throw std::bad_alloc();
-            self.DoMultiProcess(
-                [](int i) {
-                    if (i == 3) throw std::bad_alloc();
-                },
-                8);
+            auto chunk = [](int i) { i == 3 ? throw std::bad_alloc() : void(); };
+            self.DoMultiProcess(chunk, 8);
             self.MakeOutput(req);
         };
         EXPECT_FALSE(ts::EvalImage(c.downstream ? down : p, 3.0));
@@ -537,9 +494,7 @@ TEST(Engine, AnAbortedRenderReturnsNullSilently) {
             self.MakeOutput(req);
             abortIn(OwnProcess, req);
         };
-        EvalOptions opt;
-        opt.task = &task;
-        EXPECT_FALSE(ts::EvalImage(p, 0.0, opt));
+        EXPECT_FALSE(ts::EvalImage(p, 0.0, WithTask(&task)));
         EXPECT_TRUE(task.IsAborted());
         EXPECT_TRUE(d.Lines().empty());
         // Nothing half-made was kept: a render without the task works.
@@ -551,33 +506,26 @@ TEST(Engine, AnAbortedRenderReturnsNullSilently) {
 }
 
 TEST(Engine, ResultsAreBitIdenticalForAnyWorkerCount) {
-    Ref<OrvaneDoc> doc = MakeRef<OrvaneDoc>();
-    ts::ImageSourceTool *src = ts::AddImageSource(*doc, "Src", ts::PatternImage(97, 61, 8, 5));
-    ts::ImageSourceTool *mask = ts::AddImageSource(*doc, "MaskSrc", ts::PatternImage(97, 61, 8, 6));
-    auto *a = dynamic_cast<Probe *>(doc->AddTool(C().probeCommon, "A"));
-    auto *b = dynamic_cast<Probe *>(doc->AddTool(C().probeCommon, "B"));
-    ASSERT_TRUE(a && b);
-    ASSERT_TRUE(a->input->ConnectTo(src->Out()));
-    ASSERT_TRUE(b->input->ConnectTo(a->output));
-    ASSERT_TRUE(a->FindInput("EffectMask")->ConnectTo(mask->Out()));
+    Doc d;
+    d.src->SetImage(ts::PatternImage(97, 61, 8, 5));
+    Probe *a = d.Add("A", d.src->Out(), C().common);
+    Probe *b = d.Add("B", a->output, C().common);
+    ASSERT_TRUE(a->FindInput("EffectMask")
+                    ->ConnectTo(ts::AddImageSource(*d.doc, "Mask", ts::PatternImage(97, 61, 8, 6))->Out()));
     ts::SetNumber(a, "Blend", 0.6);
     ts::SetNumber(a, "EffectMaskChannel", 4);
     ts::SetNumber(b, "Amount", 1.7);
     ts::SetNumber(b, "ProcessGreen", 0);
     ts::SetNumber(b, "Blend", 0.35);
-
     const int before = WorkerCount();
-    EvalOptions opt;
-    opt.useCache = false;
     std::vector<std::vector<uint8_t>> runs;
     for (const int workers : {1, 4, 3, 1}) {
         SetWorkerCount(workers);
-        Ref<Image> out = ts::EvalImage(b, 0.0, opt);
+        Ref<Image> out = ts::EvalImage(b, 0.0, Uncached());
         ASSERT_TRUE(out);
-        std::vector<uint8_t> bytes; // every byte of every row of the data window
+        runs.emplace_back(); // every byte of every row of the data window
         for (int y = out->DataWindow().y0; y < out->DataWindow().y1; ++y)
-            bytes.insert(bytes.end(), out->ScanLine(y), out->ScanLine(y) + out->RowBytes());
-        runs.push_back(bytes);
+            runs.back().insert(runs.back().end(), out->ScanLine(y), out->ScanLine(y) + out->RowBytes());
     }
     SetWorkerCount(before);
     ASSERT_FALSE(runs[0].empty());
