@@ -132,11 +132,14 @@ TEST(GamutInputs, ConvertsFloatAndIntegerImages) {
     }
 }
 
-TEST(GamutInputs, InPlaceFrameClippingAndTheSaverDirection) {
+TEST(GamutInputs, ClippingModesInPlaceAndTheSaverDirection) {
     Fixture f(false);
     ts::SetID(f.tool, "GamutSpace", "CineonLog");
     ts::SetNumber(f.tool, "GamutLogWhite", 700);
-    const ImgRectI dw(-2, 0, 6, 4); // reaches left of a 4 x 4 frame
+    CineonLogParams log;
+    log.white = 700;
+    auto code = [&](double v) { return static_cast<float>(LinearToCineon(v, log)); };
+    const ImgRectI dw(-2, 0, 6, 4), frame(0, 0, 4, 4); // the data window reaches left of the frame
     const FltPixel canvas{0.25f, 0.25f, 0.25f, 1};
     auto image = [&] {
         Ref<Image> img = NewImageTagList({{ImgWidth, 4}, {ImgHeight, 4}, {ImgDataWindow, &dw}});
@@ -145,40 +148,26 @@ TEST(GamutInputs, InPlaceFrameClippingAndTheSaverDirection) {
         img->SetCanvasColor(canvas);
         return img;
     };
-    CineonLogParams log;
-    log.white = 700;
-    const float code18 = static_cast<float>(LinearToCineon(0.18, log));
-
-    // A new image for Frame: cut to the frame, canvas kept.
-    Ref<Image> img = image();
-    Ref<Image> framed = f.Process(img.Get(), nullptr, ClippingMode_Frame);
-    ASSERT_TRUE(framed);
-    EXPECT_EQ(framed->DataWindow(), ImgRectI(0, 0, 4, 4));
-    EXPECT_EQ(framed->GetCanvasColor(), canvas);
-    EXPECT_NEAR(framed->GetFlt(1, 1).R, 700.0 / 1023, 1e-6);
-    EXPECT_NEAR(framed->GetFlt(1, 1).G, code18, 1e-6);
-
+    // Into new images: Frame cuts the window to the frame; only None converts the canvas.
+    for (const auto &[mode, window] :
+         {std::pair{ClippingMode_Frame, frame}, {ClippingMode_Domain, dw}, {ClippingMode_None, dw}}) {
+        SCOPED_TRACE(mode.Text());
+        Ref<Image> out = f.Process(image().Get(), nullptr, mode);
+        ASSERT_TRUE(out);
+        EXPECT_EQ(out->DataWindow(), window);
+        ts::ExpectPixelNear(out->GetFlt(window.x0, 1), {code(1), code(0.18), code(0), 1}, 1e-6);
+        EXPECT_NEAR(out->GetCanvasColor().R, mode == ClippingMode_None ? code(0.25) : 0.25f, 1e-6);
+    }
     // In place for Frame: only the pixels inside the frame change.
+    Ref<Image> img = image();
     EXPECT_EQ(f.Process(img.Get(), img.Get(), ClippingMode_Frame).Get(), img.Get());
-    for (int x = -2; x < 6; ++x) EXPECT_NEAR(img->GetFlt(x, 2).G, x >= 0 && x < 4 ? code18 : 0.18f, 1e-6) << x;
-
-    // Domain keeps the window; None converts the canvas as well.
-    Ref<Image> fresh = image();
-    Ref<Image> domain = f.Process(fresh.Get(), nullptr, ClippingMode_Domain);
-    Ref<Image> none = f.Process(fresh.Get(), nullptr, ClippingMode_None);
-    ASSERT_TRUE(domain && none);
-    EXPECT_EQ(domain->DataWindow(), dw);
-    EXPECT_NEAR(domain->GetFlt(-2, 0).G, code18, 1e-6);
-    EXPECT_EQ(domain->GetCanvasColor(), canvas);
-    EXPECT_NEAR(none->GetCanvasColor().R, LinearToCineon(0.25, log), 1e-6);
-
+    for (int x = -2; x < 6; ++x) EXPECT_NEAR(img->GetFlt(x, 2).G, frame.Contains(x, 2) ? code(0.18) : 0.18f, 1e-6) << x;
     // A read-only image is never written: a new one comes back.
+    Ref<Image> fresh = image();
     fresh->SetReadOnly();
     Ref<Image> copy = f.Process(fresh.Get(), fresh.Get());
-    ASSERT_TRUE(copy);
-    EXPECT_NE(copy.Get(), fresh.Get());
+    EXPECT_TRUE(copy && copy.Get() != fresh.Get());
     EXPECT_EQ(fresh->GetFlt(1, 1).G, 0.18f);
-
     // Pre-divide: colour over alpha goes through the curve, then times alpha.
     ts::SetNumber(f.tool, "GamutPreDivide", 1);
     Ref<Image> half = NewImageTagList({{ImgWidth, 2}, {ImgHeight, 1}});
@@ -186,7 +175,7 @@ TEST(GamutInputs, InPlaceFrameClippingAndTheSaverDirection) {
     half->Fill({0.09f, 0.09f, 0.09f, 0.5f});
     Ref<Image> pre = f.Process(half.Get(), nullptr);
     ASSERT_TRUE(pre);
-    EXPECT_NEAR(pre->GetFlt(0, 0).R, 0.5 * LinearToCineon(0.18, log), 1e-6);
+    EXPECT_NEAR(pre->GetFlt(0, 0).R, 0.5 * code(0.18), 1e-6);
 }
 
 } // namespace
