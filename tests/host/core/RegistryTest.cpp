@@ -97,26 +97,26 @@ TEST(RegistryTypes, LowBitsAndFamily) {
     const Registry *data = l.Add("RegTestData", {{RegTypeFlags, RegKindOperator | RegKindTool | RegFamilyDataType}});
     const Registry *plain = l.Add("RegTestPlain", {{RegTypeFlags, RegKindOperator | RegKindSource}});
     const Registry *none = l.Add("RegTestNoFlags", {});
+    // Every low bit asked for must be there; a family must match whole (the
+    // bits of 0x00070000 and 0x00130000 lie inside the row's family).
     const struct {
         const Registry *row;
         uint32_t type;
         bool is;
-    } cases[] = {
-        {data, 0, true},
-        {data, RegKindOperator | RegKindTool, true},
-        {data, RegKindOperator | RegKindSource, false}, // every low bit asked for must be there
-        {data, RegFamilyDataType, true},
-        {data, RegFamilyDataType | RegKindTool, true},
-        {data, RegFamilyDataType | RegKindMask, false},
-        {data, RegFamilyImageFormat | RegKindOperator, false},
-        {data, 0x00070000, false}, // a family whose bits lie inside the row's family is another family
-        {data, 0x00130000, false},
-        {plain, RegKindOperator | RegKindSource, true},
-        {plain, RegFamilyDataType, false},
-        {none, 0, true},
-        {none, RegKindOperator, false},
-        {none, RegFamilyShape, false},
-    };
+    } cases[] = {{data, 0, true},
+                 {data, RegKindOperator | RegKindTool, true},
+                 {data, RegKindOperator | RegKindSource, false},
+                 {data, RegFamilyDataType, true},
+                 {data, RegFamilyDataType | RegKindTool, true},
+                 {data, RegFamilyDataType | RegKindMask, false},
+                 {data, RegFamilyImageFormat | RegKindOperator, false},
+                 {data, 0x00070000, false},
+                 {data, 0x00130000, false},
+                 {plain, RegKindOperator | RegKindSource, true},
+                 {plain, RegFamilyDataType, false},
+                 {none, 0, true},
+                 {none, RegKindOperator, false},
+                 {none, RegFamilyShape, false}};
     for (const auto &c : cases) {
         SCOPED_TRACE(testing::Message() << c.row->ID().Text() << std::hex << " type 0x" << c.type);
         EXPECT_EQ(c.row->IsRegClassType(c.type), c.is);

@@ -218,14 +218,10 @@ TEST(TagListPersist, TextSurvivesTheSourceAndCopiesOutliveTheOriginal) {
     char text[] = "first", icon[] = "icon", rep1[] = "rep-one", rep2[] = "rep-two";
     int target = 0;
     std::string idText = "TagTestPersistId";
-    auto original = std::make_unique<TagList>(TagList{{TextTag, text},
-                                                      {IconTag, icon},
-                                                      {RepTextTag, rep1},
-                                                      {RepTextTag, rep2},
-                                                      {IdTag, idText.c_str()},
-                                                      {PtrTag, &target},
-                                                      {IntTag, 8},
-                                                      {TextTag2, static_cast<const char *>(nullptr)}});
+    const TagList borrowed{
+        {TextTag, text},         {IconTag, icon},   {RepTextTag, rep1}, {RepTextTag, rep2},
+        {IdTag, idText.c_str()}, {PtrTag, &target}, {IntTag, 8},        {TextTag2, static_cast<const char *>(nullptr)}};
+    auto original = std::make_unique<TagList>(borrowed);
     original->Persist();
     const char *owned = original->GetText(TextTag);
     original->Persist(); // a second Persist keeps the storage it already owns

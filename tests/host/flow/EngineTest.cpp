@@ -174,22 +174,6 @@ struct Fed : Doc {
     Fed() { EXPECT_TRUE(probe->late->ConnectTo(late->Out()) && probe->matte->ConnectTo(matte->Out())); }
 };
 
-EvalOptions PreCalc() {
-    EvalOptions opt;
-    opt.flags = ReqFlagPreCalc;
-    return opt;
-}
-EvalOptions WithTask(RenderTask *task) {
-    EvalOptions opt;
-    opt.task = task;
-    return opt;
-}
-EvalOptions Uncached() {
-    EvalOptions opt;
-    opt.useCache = false;
-    return opt;
-}
-
 // ---------------------------------------------------------------------------
 
 TEST(Engine, InputsArriveLevelByLevelLowestFirst) {
@@ -308,7 +292,7 @@ TEST(Engine, PreCalculationMakesWindowsWithoutPixels) {
     const ImgRectI dw(2, 1, 9, 7); // a data window inside the frame
     const FltPixel canvas{0.25f, 0.5f, 0.f, 0.5f};
     f.src->SetImage(ts::WindowedImage(12, 8, dw, canvas, 3));
-    Ref<Image> shape = ts::EvalImage(f.probe, 0.0, PreCalc());
+    Ref<Image> shape = ts::EvalImage(f.probe, 0.0, EvalOptions{.flags = ReqFlagPreCalc, .roi = std::nullopt});
     ASSERT_TRUE(shape);
     EXPECT_TRUE(shape->IsNoData());
     EXPECT_FALSE(shape->HasScanLineData());
@@ -384,15 +368,21 @@ TEST(Engine, AToolWithoutDoDSupportGetsWholeFrames) {
 }
 
 TEST(Engine, AFailingToolStopsTheChainWithItsOneLine) {
+    enum How { Fails, FailsInPreCalcToo, RunsOutOfMemory, RunsOutOfMemoryInAChunk };
     const struct {
         const char *name;
-        bool failInPreCalc;
+        How how;
         Watched feeds; ///< which input of the downstream probe the failing tool feeds
+        bool evalDown; ///< evaluate the tool below, not the failing one
+        const char *line;
     } cases[] = {
-        {"pixels, main input", false, WInput},
-        {"pre-calculation too", true, WInput},
-        {"optional image input", false, WLate},
-        {"optional mask input", false, WMatte},
+        {"pixels, main input", Fails, WInput, true, "Bad: cannot go on at time 2"},
+        {"pre-calculation too", FailsInPreCalcToo, WInput, true, "Bad: cannot go on at time 2"},
+        {"optional image input", Fails, WLate, true, "Bad: cannot go on at time 2"},
+        {"optional mask input", Fails, WMatte, true, "Bad: cannot go on at time 2"},
+        {"out of memory in Process", RunsOutOfMemory, WInput, false, "Bad: out of memory (time = 2.000000)"},
+        {"out of memory in a chunk", RunsOutOfMemoryInAChunk, WInput, false, "Bad: out of memory (time = 2.000000)"},
+        {"out of memory seen from downstream", RunsOutOfMemory, WInput, true, "Bad: out of memory (time = 2.000000)"},
     };
     for (const auto &c : cases) {
         SCOPED_TRACE(c.name);
@@ -401,16 +391,23 @@ TEST(Engine, AFailingToolStopsTheChainWithItsOneLine) {
         Probe *down = d.Add("Down", d.src->Out());
         ASSERT_TRUE(down->watched[c.feeds]->ConnectTo(bad->output));
         bad->onProcess = [&](Probe &p, Request *req) {
-            if (req->IsPreCalc() && !c.failInPreCalc) return p.MakeOutput(req);
+            if (req->IsPreCalc() && c.how != FailsInPreCalcToo) return p.MakeOutput(req);
+            if (c.how == RunsOutOfMemory) throw std::bad_alloc();
+            if (c.how == RunsOutOfMemoryInAChunk) {
+                p.DoMultiProcess([](int i) { i == 3 ? throw std::bad_alloc() : void(); }, 8);
+                return p.MakeOutput(req);
+            }
             d.doc->PrintF(req, ConsoleError, "%s: cannot go on at time %g\n", p.Name().c_str(), req->Time());
             req->SetOutputData(p.output, nullptr);
         };
-        EXPECT_FALSE(ts::EvalImage(down, 2.0));
+        EXPECT_FALSE(ts::EvalImage(c.evalDown ? down : bad, 2.0));
         const std::vector<ConsoleLine> lines = d.Lines();
         ASSERT_EQ(lines.size(), 1u);
-        EXPECT_EQ(lines[0].text, "Bad: cannot go on at time 2");
+        EXPECT_EQ(lines[0].text, c.line);
         EXPECT_EQ(lines[0].code, ConsoleError);
-        EXPECT_EQ(down->PixelCalls(), 0);
+        if (c.evalDown) {
+            EXPECT_EQ(down->PixelCalls(), 0) << "the tool below does not run";
+        }
     }
 }
 
@@ -442,31 +439,6 @@ TEST(Engine, AToolThatGivesNothingOrLacksARequiredImageFailsWithOneHostLine) {
     EXPECT_TRUE(d.Lines().empty());
 }
 
-TEST(Engine, RunningOutOfMemoryGivesTheOutOfMemoryLine) {
-    const struct {
-        const char *name;
-        bool inChunk, downstream; ///< thrown in a chunk; evaluated from a tool below the failing one
-    } cases[] = {{"in Process", false, false}, {"in a chunk", true, false}, {"seen from downstream", false, true}};
-    for (const auto &c : cases) {
-        SCOPED_TRACE(c.name);
-        Doc d;
-        Probe *p = d.Add("Greedy1", d.src->Out());
-        Probe *down = d.Add("Down1", p->output);
-        p->onProcess = [&](Probe &self, Request *req) {
-            if (req->IsPreCalc()) return self.MakeOutput(req);
-            if (!c.inChunk) throw std::bad_alloc();
-            auto chunk = [](int i) { i == 3 ? throw std::bad_alloc() : void(); };
-            self.DoMultiProcess(chunk, 8);
-            self.MakeOutput(req);
-        };
-        EXPECT_FALSE(ts::EvalImage(c.downstream ? down : p, 3.0));
-        const std::vector<ConsoleLine> lines = d.Lines();
-        ASSERT_EQ(lines.size(), 1u);
-        EXPECT_EQ(lines[0].text, "Greedy1: out of memory (time = 3.000000)");
-        EXPECT_EQ(lines[0].code, ConsoleError);
-    }
-}
-
 TEST(Engine, AnAbortedRenderReturnsNullSilently) {
     enum Where { Before, UpstreamProcess, OwnCheck, OwnProcess };
     const std::pair<const char *, Where> cases[] = {
@@ -494,7 +466,7 @@ TEST(Engine, AnAbortedRenderReturnsNullSilently) {
             self.MakeOutput(req);
             abortIn(OwnProcess, req);
         };
-        EXPECT_FALSE(ts::EvalImage(p, 0.0, WithTask(&task)));
+        EXPECT_FALSE(ts::EvalImage(p, 0.0, EvalOptions{.roi = std::nullopt, .task = &task}));
         EXPECT_TRUE(task.IsAborted());
         EXPECT_TRUE(d.Lines().empty());
         // Nothing half-made was kept: a render without the task works.
@@ -521,7 +493,7 @@ TEST(Engine, ResultsAreBitIdenticalForAnyWorkerCount) {
     std::vector<std::vector<uint8_t>> runs;
     for (const int workers : {1, 4, 3, 1}) {
         SetWorkerCount(workers);
-        Ref<Image> out = ts::EvalImage(b, 0.0, Uncached());
+        Ref<Image> out = ts::EvalImage(b, 0.0, EvalOptions{.roi = std::nullopt, .useCache = false});
         ASSERT_TRUE(out);
         runs.emplace_back(); // every byte of every row of the data window
         for (int y = out->DataWindow().y0; y < out->DataWindow().y1; ++y)

@@ -33,50 +33,39 @@ TEST(Gradient, BlendsAsItsColourSpaceDoes) {
         const char *name;
         Stops stops;
         std::vector<int> spaces;
-        double pos;
+        std::vector<double> positions;
         FltPixel want;
         double tol;
     } cases[] = {
-        {"RGB: a quarter of the way",
-         {{0.2, 1, 0, 0, 1}, {0.6, 0, 0.5, 1, 0}},
-         {RGB},
-         0.3,
-         {0.75, 0.125, 0.25, 0.75},
-         1e-6},
-        {"RGB: three quarters", {{0.2, 1, 0, 0, 1}, {0.6, 0, 0.5, 1, 0}}, {RGB}, 0.5, {0.25, 0.375, 0.75, 0.25}, 1e-6},
-        {"RGB: a transparent stop's colour counts fully",
-         {{0, 1, 0, 0, 0}, {1, 0, 0, 1, 1}},
-         {RGB},
-         0.5,
-         {0.5, 0, 0.5, 0.5},
-         1e-7},
+        {"RGB", {{0.2, 1, 0, 0, 1}, {0.6, 0, 0.5, 1, 0}}, {RGB}, {0.3}, {0.75, 0.125, 0.25, 0.75}, 1e-6},
+        {"RGB", {{0.2, 1, 0, 0, 1}, {0.6, 0, 0.5, 1, 0}}, {RGB}, {0.5}, {0.25, 0.375, 0.75, 0.25}, 1e-6},
+        {"RGB, clear colour counts", {{0, 1, 0, 0, 0}, {1, 0, 0, 1, 1}}, {RGB}, {0.5}, {0.5, 0, 0.5, 0.5}, 1e-7},
         // Full colours at hue 0.95 and 0.05: the short way passes through red
         // at hue 0; the long way would pass through cyan.
-        {"hue: the short way", {{0, 1, 0, 0.3}, {1, 1, 0.3, 0}}, {HSV, HLS}, 0.5, {1, 0, 0, 1}, 1e-5},
-        {"hue: 0.975, the last sector", {{0, 1, 0, 0.3}, {1, 1, 0.3, 0}}, {HSV, HLS}, 0.25, {1, 0, 0.15, 1}, 1e-5},
-        {"hue: 0.025, the first sector", {{0, 1, 0, 0.3}, {1, 1, 0.3, 0}}, {HSV, HLS}, 0.75, {1, 0.15, 0, 1}, 1e-5},
-        {"hue: the short way back", {{0, 1, 0.3, 0}, {1, 1, 0, 0.3}}, {HSV}, 0.5, {1, 0, 0, 1}, 1e-5},
-        {"RGB: the same stops per channel", {{0, 1, 0, 0.3}, {1, 1, 0.3, 0}}, {RGB}, 0.5, {1, 0.15, 0.15, 1}, 1e-6},
+        {"hue: the short way", {{0, 1, 0, 0.3}, {1, 1, 0.3, 0}}, {HSV, HLS}, {0.5}, {1, 0, 0, 1}, 1e-5},
+        {"hue 0.975: last sector", {{0, 1, 0, 0.3}, {1, 1, 0.3, 0}}, {HSV, HLS}, {0.25}, {1, 0, 0.15, 1}, 1e-5},
+        {"hue 0.025: first sector", {{0, 1, 0, 0.3}, {1, 1, 0.3, 0}}, {HSV, HLS}, {0.75}, {1, 0.15, 0, 1}, 1e-5},
+        {"hue: the short way back", {{0, 1, 0.3, 0}, {1, 1, 0, 0.3}}, {HSV}, {0.5}, {1, 0, 0, 1}, 1e-5},
         // Half a turn apart, the blend goes towards increasing hue.
-        {"hue: half a turn up, through cyan", {{0, 0.5, 1, 0}, {1, 0.5, 0, 1}}, {HSV, HLS}, 0.5, {0, 1, 1, 1}, 1e-5},
-        {"hue: half a turn on, through red", {{0, 0.5, 0, 1}, {1, 0.5, 1, 0}}, {HSV, HLS}, 0.5, {1, 0, 0, 1}, 1e-5},
-        {"hue: red to green gives yellow", {{0, 1, 0, 0}, {1, 0, 1, 0}}, {HSV, HLS}, 0.5, {1, 1, 0, 1}, 1e-5},
-        {"RGB: red to green gives olive", {{0, 1, 0, 0}, {1, 0, 1, 0}}, {RGB, 3, -1}, 0.5, {0.5, 0.5, 0, 1}, 1e-6},
+        {"half a turn up: cyan", {{0, 0.5, 1, 0}, {1, 0.5, 0, 1}}, {HSV, HLS}, {0.5}, {0, 1, 1, 1}, 1e-5},
+        {"half a turn on: red", {{0, 0.5, 0, 1}, {1, 0.5, 1, 0}}, {HSV, HLS}, {0.5}, {1, 0, 0, 1}, 1e-5},
+        {"red to green: yellow", {{0, 1, 0, 0}, {1, 0, 1, 0}}, {HSV, HLS}, {0.5}, {1, 1, 0, 1}, 1e-5},
+        {"RGB: olive", {{0, 1, 0, 0}, {1, 0, 1, 0}}, {RGB, 3, -1}, {0.5}, {0.5, 0.5, 0, 1}, 1e-6},
         // A grey end has no hue: the blend keeps the other's. White to blue:
-        // HSV (2/3, 0.5, 1); HLS L 0.75, S 0.5, chroma 0.25.
-        {"HSV: white to blue", {{0, 1, 1, 1}, {1, 0, 0, 1}}, {HSV}, 0.5, {0.5, 0.5, 1, 1}, 1e-5},
-        {"HLS: white to blue", {{0, 1, 1, 1}, {1, 0, 0, 1}}, {HLS}, 0.5, {0.625, 0.625, 0.875, 1}, 1e-5},
-        {"HLS: black to red, L 0.25, S 0.5", {{0, 0, 0, 0}, {1, 1, 0, 0}}, {HLS}, 0.5, {0.375, 0.125, 0.125, 1}, 1e-5},
-        {"no stops: transparent black", {}, {RGB, LAB}, 0.5, {0, 0, 0, 0}, 0},
-        {"one stop everywhere", {{0.3, 0.2, 0.4, 0.6, 0.8}}, {RGB, LAB}, -1, {0.2, 0.4, 0.6, 0.8}, 0},
-        {"one stop everywhere", {{0.3, 0.2, 0.4, 0.6, 0.8}}, {RGB, LAB}, 0.31, {0.2, 0.4, 0.6, 0.8}, 0},
-        {"one stop everywhere", {{0.3, 0.2, 0.4, 0.6, 0.8}}, {RGB, LAB}, 5, {0.2, 0.4, 0.6, 0.8}, 0},
+        // HSV (2/3, 0.5, 1); HLS L 0.75, S 0.5, chroma 0.25. Black to red in
+        // HLS: L 0.25, S 0.5.
+        {"HSV: white to blue", {{0, 1, 1, 1}, {1, 0, 0, 1}}, {HSV}, {0.5}, {0.5, 0.5, 1, 1}, 1e-5},
+        {"HLS: white to blue", {{0, 1, 1, 1}, {1, 0, 0, 1}}, {HLS}, {0.5}, {0.625, 0.625, 0.875, 1}, 1e-5},
+        {"HLS: black to red", {{0, 0, 0, 0}, {1, 1, 0, 0}}, {HLS}, {0.5}, {0.375, 0.125, 0.125, 1}, 1e-5},
+        {"no stops: clear", {}, {RGB, LAB}, {0.5}, {0, 0, 0, 0}, 0},
+        {"one stop everywhere", {{0.3, 0.2, 0.4, 0.6, 0.8}}, {RGB, LAB}, {-1, 0.31, 5}, {0.2, 0.4, 0.6, 0.8}, 0},
     };
     for (const auto &c : cases)
-        for (int space : c.spaces) {
-            SCOPED_TRACE(testing::Message() << c.name << ", space " << space << ", at " << c.pos);
-            ts::ExpectPixelNear(Sample(Gradient(c.stops), c.pos, space), c.want, c.tol);
-        }
+        for (int space : c.spaces)
+            for (double pos : c.positions)
+                ts::ExpectPixelNear(Sample(Gradient(c.stops), pos, space), c.want, c.tol,
+                                    testing::PrintToString(c.name) + ", space " + std::to_string(space) + ", at " +
+                                        std::to_string(pos));
     // Black to white in L*a*b*: L* 50 at the middle, luminance ((50 + 16) / 116)^3.
     const float y = static_cast<float>(std::pow(66.0 / 116.0, 3.0));
     ts::ExpectPixelNear(Sample(Gradient(), 0.5, LAB), {y, y, y, 1}, 1e-5, "Lab");
