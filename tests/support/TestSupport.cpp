@@ -33,6 +33,28 @@ Ref<Image> PatternImage(int w, int h, int depth, unsigned seed) {
     return img;
 }
 
+Ref<Image> WindowedImage(int w, int h, const ImgRectI &dw, const FltPixel &canvas, unsigned seed, int depth) {
+    Ref<Image> pattern = PatternImage(dw.Width(), dw.Height(), 8, seed);
+    Ref<Image> img = NewImageTagList(
+        {{ImgWidth, w}, {ImgHeight, h}, {ImgDepth, depth}, {ImgDataWindow, &dw}, {ImgCanvasColor, &canvas}});
+    img->AllocScanLineData();
+    for (int y = dw.y0; y < dw.y1; ++y)
+        for (int x = dw.x0; x < dw.x1; ++x) img->PutFlt(x, y, pattern->GetFlt(x - dw.x0, y - dw.y0));
+    return img;
+}
+
+std::string RectText(const ImgRectI &r) {
+    return "(" + std::to_string(r.x0) + "," + std::to_string(r.y0) + "," + std::to_string(r.x1) + "," +
+           std::to_string(r.y1) + ")";
+}
+
+void ExpectPixelNear(const FltPixel &got, const FltPixel &want, double tol, const std::string &where) {
+    EXPECT_NEAR(got.R, want.R, tol) << where << " red";
+    EXPECT_NEAR(got.G, want.G, tol) << where << " green";
+    EXPECT_NEAR(got.B, want.B, tol) << where << " blue";
+    EXPECT_NEAR(got.A, want.A, tol) << where << " alpha";
+}
+
 } // namespace Orvane::Test
 
 #include "host/core/Registry.h"
@@ -99,8 +121,19 @@ ImageSourceTool *AddImageSource(OrvaneDoc &doc, const std::string &name, Ref<Ima
 Ref<Image> EvalImage(Operator *op, double time, const ImgRectI *roi) {
     EvalOptions opt;
     if (roi) opt.roi = ImageDomain(*roi);
-    Ref<Parameter> p = Evaluate(op->FindMainOutput(), time, opt);
+    return EvalImage(op, time, opt);
+}
+
+Ref<Image> EvalImage(Operator *op, double time, const EvalOptions &options) {
+    Ref<Parameter> p = Evaluate(op->FindMainOutput(), time, options);
     return Ref<Image>(dynamic_cast<Image *>(p.Get()));
+}
+
+OvID RegisterTool(const char *id, ClassFactory make, std::initializer_list<TagItem> attrs) {
+    TagList tags{{RegConstructor, make}, {RegTypeFlags, static_cast<long long>(RegKindOperator | RegKindTool)}};
+    for (const TagItem &a : attrs) tags.Set(a);
+    Registry::_Init(&ClassRegistry, OvID(id), tags);
+    return OvID(id);
 }
 
 void SetNumber(Operator *op, const char *id, double value) {

@@ -1,8 +1,11 @@
 #pragma once
 // Helpers shared by the tests: loading the tool library once, making
 // documents and tools, and small image utilities.
+#include <initializer_list>
 #include <string>
 
+#include "host/core/Registry.h"
+#include "host/flow/Engine.h"
 #include "host/flow/Operator.h"
 #include "host/flow/OrvaneDoc.h"
 #include "host/image/Image.h"
@@ -18,6 +21,16 @@ std::string SourcePath(const std::string &relative);
 /// An RGBA float image of w x h with a deterministic, non-constant pattern
 /// (values spread over -0.25..1.5 in every channel, alpha included).
 Ref<Image> PatternImage(int w, int h, int depth = 8, unsigned seed = 1);
+
+/// A w x h image whose data window `dw` holds PatternImage's pattern (its
+/// corner at dw's corner), with `canvas` outside.
+Ref<Image> WindowedImage(int w, int h, const ImgRectI &dw, const FltPixel &canvas, unsigned seed, int depth = 8);
+
+/// "(x0,y0,x1,y1)", for comparisons whose failure should read well.
+std::string RectText(const ImgRectI &r);
+
+/// Expects each channel of `got` within `tol` of `want`.
+void ExpectPixelNear(const FltPixel &got, const FltPixel &want, double tol, const std::string &where = "");
 
 } // namespace Orvane::Test
 
@@ -43,6 +56,16 @@ ImageSourceTool *AddImageSource(OrvaneDoc &doc, const std::string &name, Ref<Ima
 
 /// Evaluates a tool's main output as an image (null on failure).
 Ref<Image> EvalImage(Operator *op, double time = 0.0, const ImgRectI *roi = nullptr);
+Ref<Image> EvalImage(Operator *op, double time, const EvalOptions &options);
+
+/// Makes a T from the three arguments every tool constructor takes.
+template <class T> Object *MakeTool(const Registry *reg, const ScriptVal &args, const TagList &tags) {
+    return new T(reg, args, tags);
+}
+
+/// Enters a tool class in the class registry (an operator of kind tool made
+/// by `make`, with `attrs` on top) and gives its ID.
+OvID RegisterTool(const char *id, ClassFactory make, std::initializer_list<TagItem> attrs = {});
 
 /// Sets a number input by ID; fails the test when the input is missing.
 void SetNumber(Operator *op, const char *id, double value);

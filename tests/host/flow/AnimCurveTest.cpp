@@ -26,28 +26,27 @@ AnimCurve Numbers(std::initializer_list<std::pair<double, double>> keys, KeyInte
     return c;
 }
 
-TEST(AnimCurve, LinearMeetsItsKeysAndStraightLinesBetween) {
-    const AnimCurve c = Numbers({{0, 1}, {10, 3}, {14, -5}, {20, -5}}, KeyInterp::Linear);
-    struct Case {
-        double t, v;
-    };
-    const Case cases[] = {
+bool ReadCurve(const std::string &text, OvID type, AnimCurve &out) {
+    return AnimCurve::FromScript(
+        ScriptVal::FromText(text), [type](const ScriptVal &v) { return ParameterFromScript(type, v); }, out);
+}
+
+TEST(AnimCurve, LinearAndHoldMeetTheirKeysAndHoldAtTheEnds) {
+    const AnimCurve linear = Numbers({{0, 1}, {10, 3}, {14, -5}, {20, -5}}, KeyInterp::Linear);
+    const std::pair<double, double> onLinear[] = {
         {0, 1},    {10, 3},     {14, -5},     {20, -5},            // keys
         {5, 2},    {2.5, 1.5},  {12, -1},     {13, -3},  {17, -5}, // on the lines
         {-100, 1}, {-0.001, 1}, {20.001, -5}, {1e9, -5},           // the ends hold
     };
-    for (const Case &k : cases) EXPECT_DOUBLE_EQ(At(c, k.t), k.v) << "t = " << k.t;
-}
-
-TEST(AnimCurve, HoldKeepsAKeyUntilTheNext) {
-    AnimCurve c = Numbers({{0, 1}, {10, 3}, {20, 7}}, KeyInterp::Hold);
-    const double times[] = {0, 0.5, 9.999, 10, 15, 19.999, 20, 50, -3};
-    const double values[] = {1, 1, 1, 3, 3, 3, 7, 7, 1};
-    for (size_t i = 0; i < std::size(times); ++i) EXPECT_EQ(At(c, times[i]), values[i]) << "t = " << times[i];
+    for (const auto &[t, v] : onLinear) EXPECT_DOUBLE_EQ(At(linear, t), v) << "linear, t = " << t;
+    AnimCurve hold = Numbers({{0, 1}, {10, 3}, {20, 7}}, KeyInterp::Hold);
+    const std::pair<double, double> onHold[] = {{0, 1},      {0.5, 1}, {9.999, 1}, {10, 3}, {15, 3},
+                                                {19.999, 3}, {20, 7},  {50, 7},    {-3, 1}};
+    for (const auto &[t, v] : onHold) EXPECT_EQ(At(hold, t), v) << "hold, t = " << t;
     // The interpolation belongs to the key that starts a span.
-    c.SetKey(10, MakeRef<Number>(3.0), KeyInterp::Linear);
-    EXPECT_EQ(At(c, 5), 1.0);
-    EXPECT_DOUBLE_EQ(At(c, 15), 5.0);
+    hold.SetKey(10, MakeRef<Number>(3.0), KeyInterp::Linear);
+    EXPECT_EQ(At(hold, 5), 1.0);
+    EXPECT_DOUBLE_EQ(At(hold, 15), 5.0);
 }
 
 TEST(AnimCurve, SmoothPassesThroughKeysWithMatchingSlopes) {
@@ -55,21 +54,22 @@ TEST(AnimCurve, SmoothPassesThroughKeysWithMatchingSlopes) {
     const std::vector<std::pair<double, double>> keys{{0, 0}, {4, 2}, {5, -1}, {12, 3}, {20, 3.5}};
     AnimCurve c;
     for (const auto &[t, v] : keys) c.SetKey(t, MakeRef<Number>(v), KeyInterp::Smooth);
-    for (const auto &[t, v] : keys) EXPECT_NEAR(At(c, t), v, 1e-12) << "key at " << t;
-
     const double h = 1e-5;
-    auto slopeLeft = [&](double t) { return (At(c, t) - At(c, t - h)) / h; };
-    auto slopeRight = [&](double t) { return (At(c, t + h) - At(c, t)) / h; };
-    for (size_t i = 1; i + 1 < keys.size(); ++i) {
-        const double t = keys[i].first;
-        // Both sides agree, and follow the neighbours' chord.
-        const double chord = (keys[i + 1].second - keys[i - 1].second) / (keys[i + 1].first - keys[i - 1].first);
-        EXPECT_NEAR(slopeLeft(t), slopeRight(t), 1e-3) << "key at " << t;
-        EXPECT_NEAR(slopeRight(t), chord, 1e-3) << "key at " << t;
+    auto slope = [&](double t0, double t1) { return (At(c, t1) - At(c, t0)) / h; };
+    for (size_t i = 0; i < keys.size(); ++i) {
+        const auto [t, v] = keys[i];
+        EXPECT_NEAR(At(c, t), v, 1e-12) << "key at " << t;
+        // Both sides agree and follow the neighbours' chord; flat at both ends.
+        const auto &prev = keys[i ? i - 1 : i], &next = keys[i + 1 < keys.size() ? i + 1 : i];
+        const double chord =
+            i == 0 || i + 1 == keys.size() ? 0.0 : (next.second - prev.second) / (next.first - prev.first);
+        if (i > 0) {
+            EXPECT_NEAR(slope(t - h, t), chord, 1e-3) << "left of " << t;
+        }
+        if (i + 1 < keys.size()) {
+            EXPECT_NEAR(slope(t, t + h), chord, 1e-3) << "right of " << t;
+        }
     }
-    // Flat at both ends.
-    EXPECT_NEAR(slopeRight(keys.front().first), 0.0, 1e-3);
-    EXPECT_NEAR(slopeLeft(keys.back().first), 0.0, 1e-3);
     // A smooth span of two keys alone is the smoothstep between them.
     const AnimCurve two = Numbers({{0, 2}, {10, 6}}, KeyInterp::Smooth);
     for (double u : {0.1, 0.25, 0.5, 0.8}) EXPECT_NEAR(At(two, 10 * u), 2 + 4 * (3 * u * u - 2 * u * u * u), 1e-12);
@@ -78,71 +78,42 @@ TEST(AnimCurve, SmoothPassesThroughKeysWithMatchingSlopes) {
 TEST(AnimCurve, SettingAKeyAtAnExistingTimeReplacesIt) {
     AnimCurve c = Numbers({{10, 1}, {0, 5}, {5, 2}}, KeyInterp::Linear);
     ASSERT_EQ(c.Keys().size(), 3u);
-    EXPECT_EQ(c.Keys()[0].time, 0);
-    EXPECT_EQ(c.Keys()[1].time, 5);
-    EXPECT_EQ(c.Keys()[2].time, 10);
+    for (size_t i = 0; i < 3; ++i) EXPECT_EQ(c.Keys()[i].time, 5.0 * i) << "keys in time order";
     c.SetKey(5, MakeRef<Number>(9.0), KeyInterp::Hold);
     ASSERT_EQ(c.Keys().size(), 3u);
-    EXPECT_EQ(At(c, 5), 9.0);
-    EXPECT_EQ(c.Keys()[1].interp, KeyInterp::Hold);
-    EXPECT_EQ(At(c, 7), 9.0);
+    EXPECT_EQ(At(c, 7), 9.0) << "the replacing key's value and interpolation";
     EXPECT_TRUE(c.RemoveKey(5));
     EXPECT_FALSE(c.RemoveKey(5));
     EXPECT_DOUBLE_EQ(At(c, 5), 3.0);
-    AnimCurve empty;
-    EXPECT_FALSE(empty.ValueAt(0));
-    EXPECT_TRUE(empty.Empty());
+    EXPECT_FALSE(AnimCurve().ValueAt(0));
 }
 
-TEST(AnimCurve, PointsInterpolatePerComponent) {
-    for (const KeyInterp interp : {KeyInterp::Linear, KeyInterp::Smooth}) {
+TEST(AnimCurve, PointsInterpolatePerComponentAndOtherValuesHold) {
+    for (const KeyInterp interp : {KeyInterp::Linear, KeyInterp::Smooth, KeyInterp::Hold}) {
         SCOPED_TRACE(KeyInterpName(interp));
-        AnimCurve c;
-        c.SetKey(0, MakeRef<Point>(0.0, 10.0), interp);
-        c.SetKey(8, MakeRef<Point>(4.0, 2.0), interp);
-        c.SetKey(10, MakeRef<Point>(5.0, -2.0), interp);
         // Each component follows the curve of its own numbers.
-        AnimCurve xs = Numbers({{0, 0}, {8, 4}, {10, 5}}, interp), ys = Numbers({{0, 10}, {8, 2}, {10, -2}}, interp);
-        for (double t : {0.0, 1.0, 4.0, 7.5, 8.0, 9.0, 12.0}) {
-            const Ref<Parameter> v = c.ValueAt(t);
+        AnimCurve points, texts, ids;
+        const AnimCurve xs = Numbers({{0, 0}, {8, 4}, {10, 5}}, interp),
+                        ys = Numbers({{0, 10}, {8, 2}, {10, -2}}, interp);
+        for (const auto &[t, text] : {std::pair{0.0, "first"}, {8.0, "second"}, {10.0, "third"}}) {
+            points.SetKey(t, MakeRef<Point>(At(xs, t), At(ys, t)), interp);
+            texts.SetKey(t, MakeRef<Text>(text), interp);
+            if (t < 10) ids.SetKey(t, MakeRef<IDValue>(OvID(text)), interp);
+        }
+        for (double t : {-1.0, 0.0, 1.0, 4.0, 7.5, 8.0, 9.0, 12.0}) {
+            const Ref<Parameter> v = points.ValueAt(t);
             auto *p = dynamic_cast<const Point *>(v.Get());
             ASSERT_NE(p, nullptr);
             EXPECT_DOUBLE_EQ(p->x, At(xs, t)) << "t = " << t;
             EXPECT_DOUBLE_EQ(p->y, At(ys, t)) << "t = " << t;
-        }
-    }
-    AnimCurve linear;
-    linear.SetKey(0, MakeRef<Point>(0.0, 10.0));
-    linear.SetKey(8, MakeRef<Point>(4.0, 2.0));
-    const Ref<Parameter> v = linear.ValueAt(2);
-    auto *mid = dynamic_cast<const Point *>(v.Get());
-    ASSERT_NE(mid, nullptr);
-    EXPECT_DOUBLE_EQ(mid->x, 1.0);
-    EXPECT_DOUBLE_EQ(mid->y, 8.0);
-}
-
-TEST(AnimCurve, ValuesThatCannotBlendHold) {
-    for (const KeyInterp interp : {KeyInterp::Linear, KeyInterp::Smooth, KeyInterp::Hold}) {
-        SCOPED_TRACE(KeyInterpName(interp));
-        AnimCurve texts;
-        texts.SetKey(0, MakeRef<Text>("first"), interp);
-        texts.SetKey(10, MakeRef<Text>("second"), interp);
-        texts.SetKey(20, MakeRef<Text>("third"), interp);
-        AnimCurve ids;
-        ids.SetKey(0, MakeRef<IDValue>(OvID("ModeA")), interp);
-        ids.SetKey(10, MakeRef<IDValue>(OvID("ModeB")), interp);
-        const double times[] = {-1, 0, 4, 6, 9.9, 10, 16, 25};
-        const char *const wantText[] = {"first", "first", "first", "first", "first", "second", "second", "third"};
-        const char *const wantID[] = {"ModeA", "ModeA", "ModeA", "ModeA", "ModeA", "ModeB", "ModeB", "ModeB"};
-        for (size_t i = 0; i < std::size(times); ++i) {
-            EXPECT_EQ(dynamic_cast<const Text &>(*texts.ValueAt(times[i])).value, wantText[i]) << "t = " << times[i];
-            EXPECT_EQ(dynamic_cast<const IDValue &>(*ids.ValueAt(times[i])).value, OvID(wantID[i]))
-                << "t = " << times[i];
+            const char *held = t < 8 ? "first" : t < 10 ? "second" : "third";
+            EXPECT_EQ(dynamic_cast<const Text &>(*texts.ValueAt(t)).value, held) << "t = " << t;
+            EXPECT_EQ(dynamic_cast<const IDValue &>(*ids.ValueAt(t)).value, OvID(t < 8 ? "first" : "second")) << t;
         }
     }
 }
 
-TEST(AnimCurve, TheDocumentFormRoundTrips) {
+TEST(AnimCurve, TheDocumentFormRoundTripsAndMalformedFormsAreRefused) {
     AnimCurve c;
     c.SetKey(0, MakeRef<Number>(1.0));
     c.SetKey(12.5, MakeRef<Number>(-0.1), KeyInterp::Smooth);
@@ -154,53 +125,29 @@ TEST(AnimCurve, TheDocumentFormRoundTrips) {
     EXPECT_EQ(form.At(1)->Find("Interp"), nullptr) << "Linear is not written";
     ASSERT_NE(form.At(2)->Find("Interp"), nullptr);
     EXPECT_EQ(form.At(2)->Find("Interp")->AsText(), "Smooth");
-
-    // Through text and back, with the values read as numbers.
-    const ScriptVal reread = ScriptVal::FromText(form.ToText());
     AnimCurve back;
-    ASSERT_TRUE(AnimCurve::FromScript(
-        reread, [](const ScriptVal &v) { return ParameterFromScript(CLSID_DataType_Number, v); }, back));
+    ASSERT_TRUE(ReadCurve(form.ToText(), CLSID_DataType_Number, back));
     ASSERT_EQ(back.Keys().size(), c.Keys().size());
     for (size_t i = 0; i < c.Keys().size(); ++i) {
         EXPECT_EQ(back.Keys()[i].time, c.Keys()[i].time);
         EXPECT_EQ(back.Keys()[i].interp, c.Keys()[i].interp);
         EXPECT_TRUE(back.Keys()[i].value->Equals(*c.Keys()[i].value)) << "key " << i;
     }
-    EXPECT_EQ(back.ToScript(), form);
-
-    // Points and texts too.
-    AnimCurve points;
+    AnimCurve points, pointsBack;
     points.SetKey(1, MakeRef<Point>(0.25, -3.0), KeyInterp::Smooth);
     points.SetKey(2, MakeRef<Point>(1e6, 0.1));
-    AnimCurve pointsBack;
-    ASSERT_TRUE(AnimCurve::FromScript(
-        ScriptVal::FromText(points.ToScript().ToText()),
-        [](const ScriptVal &v) { return ParameterFromScript(CLSID_DataType_Point, v); }, pointsBack));
+    ASSERT_TRUE(ReadCurve(points.ToScript().ToText(), CLSID_DataType_Point, pointsBack));
     EXPECT_EQ(pointsBack.ToScript(), points.ToScript());
-    EXPECT_TRUE(pointsBack.Keys()[0].value->Equals(Point(0.25, -3.0)));
-}
 
-TEST(AnimCurve, MalformedDocumentFormsAreRefused) {
-    const char *const texts[] = {
-        "Curve { }",                               // no key
-        "Curve { { 0 } }",                         // a key without value
-        "Curve { { \"a\", 1 } }",                  // a time that is no number
-        "Curve { { 0, \"x\" } }",                  // a value of the wrong type
-        "Curve { { 0, 1, Interp = \"Wobbly\" } }", // an unknown interpolation
-        "Curve { { 0, 1, Interp = 3 } }",
-        "NotACurve { { 0, 1 } }",
-        "{ { 0, 1 } }",
-        "Curve { 5 }",
-    };
-    for (const char *text : texts) {
-        SCOPED_TRACE(text);
-        AnimCurve out;
-        out.SetKey(3, MakeRef<Number>(3.0));
-        EXPECT_FALSE(AnimCurve::FromScript(
-            ScriptVal::FromText(text), [](const ScriptVal &v) { return ParameterFromScript(CLSID_DataType_Number, v); },
-            out));
-        ASSERT_EQ(out.Keys().size(), 1u) << "a refused form leaves the curve alone";
-        EXPECT_EQ(out.Keys()[0].time, 3.0);
+    // No key, a key without value, a time that is no number, a value of the
+    // wrong type, unknown interpolations, another class, no class, no table.
+    for (const char *text : {"Curve { }", "Curve { { 0 } }", "Curve { { \"a\", 1 } }", "Curve { { 0, \"x\" } }",
+                             "Curve { { 0, 1, Interp = \"Wobbly\" } }", "Curve { { 0, 1, Interp = 3 } }",
+                             "NotACurve { { 0, 1 } }", "{ { 0, 1 } }", "Curve { 5 }"}) {
+        AnimCurve out = Numbers({{3, 3}}, KeyInterp::Linear);
+        EXPECT_FALSE(ReadCurve(text, CLSID_DataType_Number, out)) << text;
+        ASSERT_EQ(out.Keys().size(), 1u) << "a refused form leaves the curve alone: " << text;
+        EXPECT_EQ(out.Keys()[0].time, 3.0) << text;
     }
 }
 

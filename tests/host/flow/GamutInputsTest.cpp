@@ -7,8 +7,8 @@
 
 #include <cmath>
 #include <memory>
+#include <string>
 
-#include "host/core/Registry.h"
 #include "host/core/Tags.h"
 #include "host/flow/DataTypes.h"
 #include "host/flow/Link.h"
@@ -21,13 +21,12 @@ namespace {
 namespace ts = ::Orvane::Test;
 
 /// A tool that carries a GamutInputs group and forwards its notifications.
-class GamutTool : public Operator {
+template <GamutInputs::Direction Dir> class GamutTool : public Operator {
 public:
-    GamutTool(const Registry *reg, const ScriptVal &args, const TagList &tags, GamutInputs::Direction dir)
-        : Operator(reg, args, tags) {
+    GamutTool(const Registry *reg, const ScriptVal &args, const TagList &tags) : Operator(reg, args, tags) {
         AddControlPageTagList("Controls", {});
         AddInputTagList("Depth", "Depth", {{LinkDataType, CLSID_DataType_Number}});
-        gamut = std::make_unique<GamutInputs>(this, dir);
+        gamut = std::make_unique<GamutInputs>(this, Dir);
         AddOutputTagList("Output", "Output", {{LinkDataType, CLSID_DataType_Image}, {LinkMain, 1}});
     }
     void NotifyChanged(Input *in, Parameter *param, double time, TagList *tags) override {
@@ -37,75 +36,55 @@ public:
     std::unique_ptr<GamutInputs> gamut;
 };
 
-Object *MakeLoaderLike(const Registry *reg, const ScriptVal &args, const TagList &tags) {
-    return new GamutTool(reg, args, tags, GamutInputs::ToLinear);
-}
-Object *MakeSaverLike(const Registry *reg, const ScriptVal &args, const TagList &tags) {
-    return new GamutTool(reg, args, tags, GamutInputs::FromLinear);
-}
-
-OvID Register(const char *id, ClassFactory make) {
-    TagList tags{{RegConstructor, make},
-                 {RegTypeFlags, static_cast<long long>(RegKindOperator | RegKindTool)},
-                 {RegNoBlendControls, 1},
-                 {RegNoEffectMask, 1}};
-    Registry::_Init(&ClassRegistry, OvID(id), tags);
-    return OvID(id);
-}
-OvID LoaderClass() {
-    static const OvID id = Register("GamutTestLoader", &MakeLoaderLike);
-    return id;
-}
-OvID SaverClass() {
-    static const OvID id = Register("GamutTestSaver", &MakeSaverLike);
-    return id;
-}
-
 struct Fixture {
     Ref<OrvaneDoc> doc = MakeRef<OrvaneDoc>();
-    GamutTool *tool;
+    Operator *tool;
+    GamutInputs *gamut;
     explicit Fixture(bool toLinear) {
-        tool = dynamic_cast<GamutTool *>(
-            doc->AddTool(toLinear ? LoaderClass() : SaverClass(), toLinear ? "Loader1" : "Saver1"));
+        static const OvID loader = ts::RegisterTool("GamutTestLoader", &ts::MakeTool<GamutTool<GamutInputs::ToLinear>>,
+                                                    {{RegNoBlendControls, 1}, {RegNoEffectMask, 1}});
+        static const OvID saver = ts::RegisterTool("GamutTestSaver", &ts::MakeTool<GamutTool<GamutInputs::FromLinear>>,
+                                                   {{RegNoBlendControls, 1}, {RegNoEffectMask, 1}});
+        tool = doc->AddTool(toLinear ? loader : saver);
+        gamut = toLinear ? dynamic_cast<GamutTool<GamutInputs::ToLinear> &>(*tool).gamut.get()
+                         : dynamic_cast<GamutTool<GamutInputs::FromLinear> &>(*tool).gamut.get();
     }
-    /// A request carrying the tool's current input values.
-    std::unique_ptr<Request> Req() {
-        auto req = std::make_unique<Request>(tool, nullptr, 0.0, 0, nullptr);
-        for (const auto &in : tool->Inputs())
-            if (Ref<Parameter> v = in->ValueAt(0.0)) req->SetInputData(in.get(), v.Get());
-        return req;
+    /// ProcessOf for a request carrying the tool's current input values.
+    Ref<Image> Process(Image *in, Image *out, OvID clipping = ClippingMode_None, bool convert = true) {
+        Request req(tool, nullptr, 0.0, 0, nullptr);
+        for (const auto &input : tool->Inputs())
+            if (Ref<Parameter> v = input->ValueAt(0.0)) req.SetInputData(input.get(), v.Get());
+        return gamut->ProcessOf(&req, in, out, clipping, convert);
     }
 };
 
 TEST(GamutInputs, AddsItsInputsAndShowsWhatTheSpaceNeeds) {
     Fixture f(true);
-    ASSERT_NE(f.tool, nullptr);
     Input *space = f.tool->FindInput("GamutSpace");
     ASSERT_NE(space, nullptr);
     EXPECT_STREQ(space->Label(), "Source Space");
     EXPECT_EQ(space->Page(), 0); // the tool's current page
-    EXPECT_EQ(f.tool->gamut->CurveOf(nullptr).space, GamutSpace::NoChange);
-    for (const char *id : {"GamutGamma", "GamutLogBlack", "GamutLogWhite", "GamutLogFilmGamma", "GamutLogSoftClip",
-                           "GamutRemoveGamma", "GamutPreDivide"})
-        ASSERT_NE(f.tool->FindInput(id), nullptr) << id;
+    EXPECT_EQ(f.gamut->CurveOf(nullptr).space, GamutSpace::NoChange);
     EXPECT_EQ(f.tool->FindInput("GamutAddGamma"), nullptr);
-    auto visible = [&](const char *id) { return f.tool->FindInput(id)->IsVisible(); };
-    EXPECT_FALSE(visible("GamutGamma"));
-    EXPECT_FALSE(visible("GamutLogBlack"));
-    EXPECT_FALSE(visible("GamutRemoveGamma"));
-
-    ts::SetID(f.tool, "GamutSpace", "Gamma");
-    EXPECT_TRUE(visible("GamutGamma"));
-    EXPECT_FALSE(visible("GamutLogWhite"));
-    EXPECT_TRUE(visible("GamutRemoveGamma"));
-    ts::SetID(f.tool, "GamutSpace", "CineonLog");
-    EXPECT_FALSE(visible("GamutGamma"));
-    for (const char *id : {"GamutLogBlack", "GamutLogWhite", "GamutLogFilmGamma", "GamutLogSoftClip"})
-        EXPECT_TRUE(visible(id)) << id;
-    ts::SetID(f.tool, "GamutSpace", "Linear");
-    EXPECT_FALSE(visible("GamutLogBlack"));
-    EXPECT_FALSE(visible("GamutRemoveGamma"));
-
+    const struct {
+        const char *space, *shown;
+    } cases[] = {
+        {nullptr, ""}, // No Change, the default
+        {"Gamma", "GamutGamma GamutRemoveGamma GamutPreDivide"},
+        {"CineonLog", "GamutLogBlack GamutLogWhite GamutLogFilmGamma GamutLogSoftClip GamutRemoveGamma GamutPreDivide"},
+        {"sRGB", "GamutRemoveGamma GamutPreDivide"},
+        {"Linear", ""},
+    };
+    for (const auto &c : cases) {
+        SCOPED_TRACE(c.space ? c.space : "NoChange");
+        if (c.space) ts::SetID(f.tool, "GamutSpace", c.space);
+        for (const char *id : {"GamutGamma", "GamutLogBlack", "GamutLogWhite", "GamutLogFilmGamma", "GamutLogSoftClip",
+                               "GamutRemoveGamma", "GamutPreDivide"}) {
+            Input *in = f.tool->FindInput(id);
+            ASSERT_NE(in, nullptr) << id;
+            EXPECT_EQ(in->IsVisible(), std::string(c.shown).find(id) != std::string::npos) << id;
+        }
+    }
     Fixture saver(false);
     ASSERT_NE(saver.tool->FindInput("GamutAddGamma"), nullptr);
     EXPECT_STREQ(saver.tool->FindInput("GamutSpace")->Label(), "Output Space");
@@ -117,14 +96,11 @@ TEST(GamutInputs, NoChangeAndSwitchedOffPassTheImageThrough) {
     Fixture f(true);
     Ref<Image> img = ts::PatternImage(6, 4);
     const FltPixel before = img->GetFlt(2, 2);
-    auto req = f.Req();
-    EXPECT_EQ(f.tool->gamut->ProcessOf(req.get(), img.Get(), nullptr, ClippingMode_None, true).Get(), img.Get());
+    EXPECT_EQ(f.Process(img.Get(), nullptr).Get(), img.Get());
     ts::SetID(f.tool, "GamutSpace", "sRGB");
-    req = f.Req();
-    EXPECT_EQ(f.tool->gamut->ProcessOf(req.get(), img.Get(), nullptr, ClippingMode_None, false).Get(), img.Get());
+    EXPECT_EQ(f.Process(img.Get(), nullptr, ClippingMode_None, false).Get(), img.Get());
     ts::SetNumber(f.tool, "GamutRemoveGamma", 0);
-    req = f.Req();
-    EXPECT_EQ(f.tool->gamut->ProcessOf(req.get(), img.Get(), img.Get(), ClippingMode_None, true).Get(), img.Get());
+    EXPECT_EQ(f.Process(img.Get(), img.Get()).Get(), img.Get());
     EXPECT_EQ(img->GetFlt(2, 2), before);
 }
 
@@ -137,87 +113,69 @@ TEST(GamutInputs, ConvertsFloatAndIntegerImages) {
         src->AllocScanLineData();
         for (int y = 0; y < 3; ++y)
             for (int x = 0; x < 8; ++x) src->PutFlt(x, y, {x / 7.f, y / 2.f, 0.5f, 0.25f + x / 16.f});
-        const FltPixel canvas{0.5f, 0, 0, 0};
-        src->SetCanvasColor(canvas);
-        auto req = f.Req();
-        Ref<Image> out = f.tool->gamut->ProcessOf(req.get(), src.Get(), nullptr, ClippingMode_None, true);
+        src->SetCanvasColor(FltPixel{0.5f, 0, 0, 0});
+        Ref<Image> out = f.Process(src.Get(), nullptr);
         ASSERT_TRUE(out);
         ASSERT_NE(out.Get(), src.Get());
         EXPECT_EQ(out->Depth(), depth);
         const double tol = depth == DepthRGBAInt8 ? 0.5 / 255 + 1e-6 : depth == DepthRGBAInt16 ? 1e-5 : 2e-3;
-        auto decode = [](double v) { return v <= 0.04045 ? v / 12.92 : std::pow((v + 0.055) / 1.055, 2.4); };
+        auto decode = [](float v) {
+            return static_cast<float>(v <= 0.04045 ? v / 12.92 : std::pow((v + 0.055) / 1.055, 2.4));
+        };
         for (int y = 0; y < 3; ++y)
             for (int x = 0; x < 8; ++x) {
                 const FltPixel a = src->GetFlt(x, y), b = out->GetFlt(x, y);
-                EXPECT_NEAR(b.R, decode(a.R), tol);
-                EXPECT_NEAR(b.G, decode(a.G), tol);
-                EXPECT_NEAR(b.B, decode(a.B), tol);
+                ts::ExpectPixelNear(b, {decode(a.R), decode(a.G), decode(a.B), a.A}, tol);
                 EXPECT_EQ(b.A, a.A);
             }
-        EXPECT_NEAR(out->GetCanvasColor().R, decode(0.5), 1e-6);
+        EXPECT_NEAR(out->GetCanvasColor().R, decode(0.5f), 1e-6);
     }
 }
 
-TEST(GamutInputs, InPlaceFrameClippingAndTheSaverDirection) {
+TEST(GamutInputs, ClippingModesInPlaceAndTheSaverDirection) {
     Fixture f(false);
     ts::SetID(f.tool, "GamutSpace", "CineonLog");
     ts::SetNumber(f.tool, "GamutLogWhite", 700);
-    const ImgRectI dw(-2, 0, 6, 4); // reaches left of a 4 x 4 frame
-    Ref<Image> img = NewImageTagList({{ImgWidth, 4}, {ImgHeight, 4}, {ImgDataWindow, &dw}});
-    img->AllocScanLineData();
-    img->Fill({1, 0.18f, 0, 1});
-    const FltPixel canvas{0.25f, 0.25f, 0.25f, 1};
-    img->SetCanvasColor(canvas);
     CineonLogParams log;
     log.white = 700;
-    const float code18 = static_cast<float>(LinearToCineon(0.18, log));
-
-    // A new image for Frame: cut to the frame, canvas kept.
-    auto req = f.Req();
-    Ref<Image> framed = f.tool->gamut->ProcessOf(req.get(), img.Get(), nullptr, ClippingMode_Frame, true);
-    ASSERT_TRUE(framed);
-    EXPECT_EQ(framed->DataWindow(), ImgRectI(0, 0, 4, 4));
-    EXPECT_EQ(framed->GetCanvasColor(), canvas);
-    EXPECT_NEAR(framed->GetFlt(1, 1).R, 700.0 / 1023, 1e-6);
-    EXPECT_NEAR(framed->GetFlt(1, 1).G, code18, 1e-6);
-
+    auto code = [&](double v) { return static_cast<float>(LinearToCineon(v, log)); };
+    const ImgRectI dw(-2, 0, 6, 4), frame(0, 0, 4, 4); // the data window reaches left of the frame
+    const FltPixel canvas{0.25f, 0.25f, 0.25f, 1};
+    auto image = [&] {
+        Ref<Image> img = NewImageTagList({{ImgWidth, 4}, {ImgHeight, 4}, {ImgDataWindow, &dw}});
+        img->AllocScanLineData();
+        img->Fill({1, 0.18f, 0, 1});
+        img->SetCanvasColor(canvas);
+        return img;
+    };
+    // Into new images: Frame cuts the window to the frame; only None converts the canvas.
+    for (const auto &[mode, window] :
+         {std::pair{ClippingMode_Frame, frame}, {ClippingMode_Domain, dw}, {ClippingMode_None, dw}}) {
+        SCOPED_TRACE(mode.Text());
+        Ref<Image> out = f.Process(image().Get(), nullptr, mode);
+        ASSERT_TRUE(out);
+        EXPECT_EQ(out->DataWindow(), window);
+        ts::ExpectPixelNear(out->GetFlt(window.x0, 1), {code(1), code(0.18), code(0), 1}, 1e-6);
+        EXPECT_NEAR(out->GetCanvasColor().R, mode == ClippingMode_None ? code(0.25) : 0.25f, 1e-6);
+    }
     // In place for Frame: only the pixels inside the frame change.
-    Ref<Image> same = f.tool->gamut->ProcessOf(req.get(), img.Get(), img.Get(), ClippingMode_Frame, true);
-    EXPECT_EQ(same.Get(), img.Get());
-    EXPECT_EQ(img->GetFlt(-1, 2).G, 0.18f);
-    EXPECT_EQ(img->GetFlt(5, 2).G, 0.18f);
-    EXPECT_NEAR(img->GetFlt(0, 2).G, code18, 1e-6);
-    EXPECT_NEAR(img->GetFlt(3, 2).G, code18, 1e-6);
-
-    // Domain keeps the window; None converts the canvas as well.
-    Ref<Image> fresh = NewImageTagList({{ImgWidth, 4}, {ImgHeight, 4}, {ImgDataWindow, &dw}});
-    fresh->AllocScanLineData();
-    fresh->Fill({1, 0.18f, 0, 1});
-    fresh->SetCanvasColor(canvas);
-    Ref<Image> domain = f.tool->gamut->ProcessOf(req.get(), fresh.Get(), nullptr, ClippingMode_Domain, true);
-    Ref<Image> none = f.tool->gamut->ProcessOf(req.get(), fresh.Get(), nullptr, ClippingMode_None, true);
-    ASSERT_TRUE(domain && none);
-    EXPECT_EQ(domain->DataWindow(), dw);
-    EXPECT_NEAR(domain->GetFlt(-2, 0).G, code18, 1e-6);
-    EXPECT_EQ(domain->GetCanvasColor(), canvas);
-    EXPECT_NEAR(none->GetCanvasColor().R, LinearToCineon(0.25, log), 1e-6);
-
+    Ref<Image> img = image();
+    EXPECT_EQ(f.Process(img.Get(), img.Get(), ClippingMode_Frame).Get(), img.Get());
+    for (int x = -2; x < 6; ++x) EXPECT_NEAR(img->GetFlt(x, 2).G, frame.Contains(x, 2) ? code(0.18) : 0.18f, 1e-6) << x;
     // A read-only image is never written: a new one comes back.
+    Ref<Image> fresh = image();
     fresh->SetReadOnly();
-    Ref<Image> copy = f.tool->gamut->ProcessOf(req.get(), fresh.Get(), fresh.Get(), ClippingMode_None, true);
-    ASSERT_TRUE(copy);
-    EXPECT_NE(copy.Get(), fresh.Get());
+    Ref<Image> copy = f.Process(fresh.Get(), fresh.Get());
+    EXPECT_TRUE(copy && copy.Get() != fresh.Get());
     EXPECT_EQ(fresh->GetFlt(1, 1).G, 0.18f);
-
     // Pre-divide: colour over alpha goes through the curve, then times alpha.
     ts::SetNumber(f.tool, "GamutPreDivide", 1);
     Ref<Image> half = NewImageTagList({{ImgWidth, 2}, {ImgHeight, 1}});
     half->AllocScanLineData();
     half->Fill({0.09f, 0.09f, 0.09f, 0.5f});
-    req = f.Req();
-    Ref<Image> pre = f.tool->gamut->ProcessOf(req.get(), half.Get(), nullptr, ClippingMode_None, true);
+    Ref<Image> pre = f.Process(half.Get(), nullptr);
     ASSERT_TRUE(pre);
-    EXPECT_NEAR(pre->GetFlt(0, 0).R, 0.5 * LinearToCineon(0.18, log), 1e-6);
+    EXPECT_NEAR(pre->GetFlt(0, 0).R, 0.5 * code(0.18), 1e-6);
 }
 
 } // namespace

@@ -5,19 +5,14 @@
 #include <string>
 #include <vector>
 
-#include "host/core/Registry.h"
+#include <fmt/format.h>
+
 #include "host/core/Tags.h"
 #include "host/flow/DataTypes.h"
-#include "host/flow/Operator.h"
-#include "host/flow/OrvaneDoc.h"
+#include "tests/support/TestSupport.h"
 
 namespace Orvane::notifytest {
 namespace {
-
-struct Heard {
-    std::string input;
-    double value;
-};
 
 class NotifyTool : public ThreadedOperator {
 public:
@@ -30,44 +25,21 @@ public:
         AddOutputTagList("Output", "Output", {{LinkDataType, CLSID_DataType_Number}});
     }
     void NotifyChanged(Input *in, Parameter *param, double time, TagList *tags) override {
-        if (auto *n = dynamic_cast<Number *>(param)) heard.push_back({in->ID().Text(), n->value});
+        if (auto *n = dynamic_cast<Number *>(param)) heard.push_back(fmt::format("{} {}", in->ID().Text(), n->value));
         ThreadedOperator::NotifyChanged(in, param, time, tags);
     }
     Input *loud, *quietStart, *silent;
-    std::vector<Heard> heard;
+    std::vector<std::string> heard;
 };
 
-Object *MakeNotifyTool(const Registry *reg, const ScriptVal &args, const TagList &tags) {
-    return new NotifyTool(reg, args, tags);
-}
-
-const OvID NotifyClass("NotifyTestTool");
-
-void RegisterOnce() {
-    static const Registry *row = [] {
-        TagList tags{{RegConstructor, &MakeNotifyTool},
-                     {RegTypeFlags, static_cast<long long>(RegKindOperator | RegKindTool)},
-                     {RegNoBlendControls, 1},
-                     {RegNoEffectMask, 1}};
-        return Registry::_Init(&ClassRegistry, NotifyClass, tags);
-    }();
-    (void)row;
-}
-
-TEST(NotifyChanged, FirstValuesReachTheToolUnlessAnInputAsksNotTo) {
-    RegisterOnce();
+TEST(NotifyChanged, FirstValuesAndChangesOfNotifyingInputsAreHeard) {
+    static const OvID cls = Orvane::Test::RegisterTool("NotifyTestTool", &Orvane::Test::MakeTool<NotifyTool>,
+                                                       {{RegNoBlendControls, 1}, {RegNoEffectMask, 1}});
     OrvaneDoc doc;
-    auto *tool = dynamic_cast<NotifyTool *>(doc.AddTool(NotifyClass));
+    auto *tool = dynamic_cast<NotifyTool *>(doc.AddTool(cls));
     ASSERT_NE(tool, nullptr);
-    ASSERT_EQ(tool->heard.size(), 1u);
-    EXPECT_EQ(tool->heard[0].input, "Loud");
-}
+    EXPECT_EQ(tool->heard, std::vector<std::string>{"Loud 0"}) << "QuietStart asks not to hear its first value";
 
-TEST(NotifyChanged, ChangesOfNotifyingInputsAreHeardAndOthersAreNot) {
-    RegisterOnce();
-    OrvaneDoc doc;
-    auto *tool = dynamic_cast<NotifyTool *>(doc.AddTool(NotifyClass));
-    ASSERT_NE(tool, nullptr);
     tool->heard.clear();
     ASSERT_TRUE(tool->loud->SetValue(MakeRef<Number>(2.5)));
     ASSERT_TRUE(tool->quietStart->SetValue(MakeRef<Number>(-1)));
@@ -75,18 +47,11 @@ TEST(NotifyChanged, ChangesOfNotifyingInputsAreHeardAndOthersAreNot) {
     AnimCurve curve;
     curve.SetKey(0, MakeRef<Number>(4));
     curve.SetKey(10, MakeRef<Number>(8));
-    ASSERT_TRUE(tool->loud->SetCurve(curve));
-    tool->loud->ResetValue();
-    ASSERT_EQ(tool->heard.size(), 4u);
-    EXPECT_EQ(tool->heard[0].input, "Loud");
-    EXPECT_EQ(tool->heard[0].value, 2.5);
-    EXPECT_EQ(tool->heard[1].input, "QuietStart");
-    EXPECT_EQ(tool->heard[1].value, -1);
-    EXPECT_EQ(tool->heard[2].value, 4) << "a curve is heard with its value at the document's start";
-    EXPECT_EQ(tool->heard[3].value, 0) << "a reset is heard with the default";
+    ASSERT_TRUE(tool->loud->SetCurve(curve)); // heard with its value at the document's start
+    tool->loud->ResetValue();                 // heard with the default
     // A value the input refuses changes nothing and is not heard.
     EXPECT_FALSE(tool->loud->SetValue(MakeRef<Text>("x")));
-    EXPECT_EQ(tool->heard.size(), 4u);
+    EXPECT_EQ(tool->heard, (std::vector<std::string>{"Loud 2.5", "QuietStart -1", "Loud 4", "Loud 0"}));
 }
 
 } // namespace
