@@ -66,6 +66,16 @@ const Registry *ImageSourceRow() {
 
 } // namespace
 
+OvID RegisterTestTool(const char *id, ClassFactory make) {
+    if (!ClassRegistry->Find(OvID(id))) {
+        TagList tags{{RegConstructor, make},  {RegTypeFlags, static_cast<long long>(RegKindOperator | RegKindTool)},
+                     {RegNoBlendControls, 1}, {RegNoEffectMask, 1},
+                     {RegSupportsRoI, 1},     {RegSupportsDoD, 1}};
+        Registry::_Init(&ClassRegistry, OvID(id), tags);
+    }
+    return OvID(id);
+}
+
 ImageSourceTool::ImageSourceTool(const Registry *reg, const ScriptVal &args, const TagList &tags)
     : ThreadedOperator(reg, args, tags) {
     output_ = AddOutputTagList("Output", "Output", {{LinkDataType, CLSID_DataType_Image}, {LinkMain, 1}});
@@ -85,6 +95,12 @@ void ImageSourceTool::Process(Request *req) {
         return;
     }
     ++processCount;
+    asked.push_back(req->RoI());
+    if (cutToRegion && req->RoI() && !req->RoI()->rect.Contains(image_->DataWindow())) {
+        const ImgRectI cut = image_->DataWindow() & req->RoI()->rect;
+        req->SetOutputData(output_, image_->CopyOfImageTagList({{ImgDataWindow, &cut}}).Get());
+        return;
+    }
     req->SetOutputData(output_, image_.Get());
 }
 
@@ -107,6 +123,10 @@ void SetNumber(Operator *op, const char *id, double value) {
     Input *in = op->FindInput(id);
     ASSERT_NE(in, nullptr) << "no input " << id;
     ASSERT_TRUE(in->SetValue(MakeRef<Number>(value))) << id;
+}
+
+void SetNumbers(Operator *op, const std::vector<std::pair<const char *, double>> &values) {
+    for (const auto &[id, value] : values) SetNumber(op, id, value);
 }
 
 void SetPoint(Operator *op, const char *id, double x, double y) {

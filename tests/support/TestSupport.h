@@ -1,8 +1,12 @@
 #pragma once
 // Helpers shared by the tests: loading the tool library once, making
 // documents and tools, and small image utilities.
+#include <optional>
 #include <string>
+#include <utility>
+#include <vector>
 
+#include "host/core/Registry.h"
 #include "host/flow/Operator.h"
 #include "host/flow/OrvaneDoc.h"
 #include "host/image/Image.h"
@@ -32,11 +36,25 @@ public:
     void Process(Request *req) override;
     Output *Out() const { return output_; }
     int processCount = 0; ///< pixel requests served (pre-calculations not counted)
+    /// The regions of interest of the pixel requests so far (absent: the whole frame).
+    std::vector<std::optional<ImageDomain>> asked;
+    /// When set, a pixel request gets only the part of the image it asks
+    /// for (the rest is canvas), as from any tool.
+    bool cutToRegion = false;
 
 private:
     Ref<Image> image_;
     Output *output_;
 };
+
+/// The factory of a test class constructed from its row, arguments and tags.
+template <class T> Object *NewTestObject(const Registry *reg, const ScriptVal &args, const TagList &tags) {
+    return new T(reg, args, tags);
+}
+
+/// Registers a test tool class `id` made by `make` (an operator tool with
+/// regions and domains, no blend or effect mask controls); returns its ID.
+OvID RegisterTestTool(const char *id, ClassFactory make);
 
 /// Adds an ImageSourceTool named `name` that outputs `img`.
 ImageSourceTool *AddImageSource(OrvaneDoc &doc, const std::string &name, Ref<Image> img);
@@ -46,6 +64,8 @@ Ref<Image> EvalImage(Operator *op, double time = 0.0, const ImgRectI *roi = null
 
 /// Sets a number input by ID; fails the test when the input is missing.
 void SetNumber(Operator *op, const char *id, double value);
+/// Sets several number inputs by ID, in order.
+void SetNumbers(Operator *op, const std::vector<std::pair<const char *, double>> &values);
 void SetPoint(Operator *op, const char *id, double x, double y);
 void SetID(Operator *op, const char *id, const char *value);
 
