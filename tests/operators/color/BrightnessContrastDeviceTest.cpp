@@ -3,50 +3,24 @@
 // and the device path's rules: no device for pre-calculation, inputs
 // uploaded, results stale in main memory until downloaded, chains kept on
 // the device, and a failing device giving the rows' result.
-#include <algorithm>
-#include <cmath>
 #include <cstring>
 #include <map>
 #include <string>
 #include <vector>
 
-#include <gtest/gtest.h>
-
-#include "host/flow/Engine.h"
-#include "host/flow/RenderTask.h"
-#include "host/flow/Request.h"
-#include "host/image/NewImage.h"
 #include "host/krom/GPUMemory.h"
 #include "tests/host/krom/DeviceTestSupport.h"
-#include "tests/support/TestSupport.h"
+#include "tests/operators/color/BrightnessContrastReference.h"
 
-namespace Orvane {
+namespace Orvane::bctest {
 namespace {
-
-using Settings = std::vector<std::pair<const char *, double>>;
 
 /// A source whose data window is offset from the frame on every side.
 Ref<Image> OddSource(int depth) {
-    Ref<Image> full = Orvane::Test::PatternImage(64, 40, depth, 5);
     const ImgRectI dw(-3, 5, 50, 38);
-    Ref<Image> img = full->CopyOfImageTagList({{ImgDataWindow, &dw}});
+    Ref<Image> img = Test::PatternImage(64, 40, depth, 5)->CopyOfImageTagList({{ImgDataWindow, &dw}});
     img->SetCanvasColor(FltPixel{0.2f, -0.1f, 0.6f, 0.5f});
     return img;
-}
-
-Ref<Image> Render(Operator *op, IDeviceContext *device, const ImgRectI *roi, RenderTask *task = nullptr,
-                  uint32_t flags = 0, bool onDevice = false) {
-    RenderTask own;
-    RenderTask &t = task ? *task : own;
-    t.SetDevice(device);
-    EvalOptions opt;
-    opt.task = &t;
-    opt.flags = flags;
-    opt.useCache = false;
-    if (roi) opt.roi = ImageDomain(*roi);
-    Ref<Parameter> p =
-        onDevice ? EvaluateOnDevice(op->FindMainOutput(), 0.0, opt) : Evaluate(op->FindMainOutput(), 0.0, opt);
-    return Ref<Image>(dynamic_cast<Image *>(p.Get()));
 }
 
 /// Largest difference over the data window and the canvas, relative to the
@@ -55,11 +29,10 @@ double MaxDifference(const Image &a, const Image &b) {
     EXPECT_EQ(a.DataWindow(), b.DataWindow());
     double worst = 0;
     auto diff = [&](const FltPixel &p, const FltPixel &q) {
-        const float x[4] = {p.R, p.G, p.B, p.A}, y[4] = {q.R, q.G, q.B, q.A};
-        for (int c = 0; c < 4; ++c) {
-            if (std::isnan(x[c]) && std::isnan(y[c])) continue;
-            worst = std::max(worst, std::fabs(double(x[c]) - y[c]) / std::max(1.0, std::fabs(double(y[c]))));
-        }
+        const Px x = ToPx(p), y = ToPx(q);
+        for (int c = 0; c < 4; ++c)
+            if (!std::isnan(x[c]) || !std::isnan(y[c]))
+                worst = std::max(worst, std::fabs(x[c] - y[c]) / std::max(1.0, std::fabs(y[c])));
     };
     diff(a.GetCanvasColor(), b.GetCanvasColor());
     const ImgRectI dw = a.DataWindow();
@@ -71,28 +44,20 @@ double MaxDifference(const Image &a, const Image &b) {
 class BrightnessContrastDevice : public ::testing::Test {
 protected:
     static void SetUpTestSuite() { Orvane::Test::LoadOperators(); }
-    Operator *MakeBC(OrvaneDoc &doc, Ref<Image> src, const Settings &settings) {
-        auto *source = Orvane::Test::AddImageSource(doc, "Source", std::move(src));
-        Operator *bc = doc.AddTool(OvID("BrightnessContrast"), "BC");
-        EXPECT_TRUE(bc && source);
-        bc->FindInput("Input")->ConnectTo(source->Out());
-        for (const auto &[id, v] : settings) Orvane::Test::SetNumber(bc, id, v);
-        return bc;
-    }
 };
 
 TEST_F(BrightnessContrastDevice, MatchesTheRowsOverControlsDirectionsAndDepths) {
     ORVANE_NEED_OPENCL(ctx);
-    const std::vector<std::pair<const char *, Settings>> cases = {
-        {"gain, lift, gamma", {{"Gain", 1.3}, {"Lift", 0.05}, {"Gamma", 0.7}}},
+    const std::pair<const char *, Settings> cases[] = {
+        {"gain, lift, gamma", {.gain = 1.3, .lift = 0.05, .gamma = 0.7}},
         {"contrast, brightness, saturation, clips",
-         {{"Contrast", 0.4}, {"Brightness", -0.1}, {"Saturation", 1.6}, {"ClipBlack", 1}, {"ClipWhite", 1}}},
-        {"pre-divide, low/high", {{"PreDividePostMultiply", 1}, {"Gain", 0.8}, {"Low", 0.1}, {"High", 0.9}}},
+         {.contrast = 0.4, .brightness = -0.1, .saturation = 1.6, .clipBlack = true, .clipWhite = true}},
+        {"pre-divide, low/high", {.gain = 0.8, .low = 0.1, .high = 0.9, .prePost = true}},
         {"alpha only, high equals low",
-         {{"Alpha", 1}, {"Red", 0}, {"Gamma", 1.8}, {"Saturation", 0.3}, {"Low", 0.2}, {"High", 0.2}}},
-        {"gain equals lift, contrast -1, gamma 0", {{"Gain", 2}, {"Lift", 2}, {"Contrast", -1}, {"Gamma", 0}}},
-        {"gamma 2.2, no saturation", {{"Gamma", 2.2}, {"Saturation", 0}}},
-        {"linear chain (one matrix)", {{"Gain", 1.2}, {"Brightness", 0.1}, {"Saturation", 1.4}, {"Alpha", 1}}},
+         {.gamma = 1.8, .saturation = 0.3, .low = 0.2, .high = 0.2, .red = false, .alpha = true}},
+        {"gain equals lift, contrast -1, gamma 0", {.gain = 2, .lift = 2, .gamma = 0, .contrast = -1}},
+        {"gamma 2.2, no saturation", {.gamma = 2.2, .saturation = 0}},
+        {"linear chain (one matrix)", {.gain = 1.2, .brightness = 0.1, .saturation = 1.4, .alpha = true}},
     };
     // Float results agree to float rounding of the power (the device's powf
     // against the host's); integers to one 16-bit step through the gamma
@@ -102,18 +67,18 @@ TEST_F(BrightnessContrastDevice, MatchesTheRowsOverControlsDirectionsAndDepths) 
                                              {DepthAFlt32, 2e-5},           {DepthAInt16, 3.1 / 65535}};
     const ImgRectI roi(12, 2, 61, 33);
     for (const auto &[name, settings] : cases)
-        for (int direction : {0, 1})
+        for (bool reverse : {false, true})
             for (const auto &[depth, tol] : tolerance) {
-                SCOPED_TRACE(std::string(name) + (direction ? " reverse" : " forward") + " depth " +
+                SCOPED_TRACE(std::string(name) + (reverse ? " reverse" : " forward") + " depth " +
                              std::to_string(depth));
-                OrvaneDoc doc;
+                Rig rig(OddSource(depth));
                 Settings s = settings;
-                s.push_back({"Direction", direction});
-                Operator *bc = MakeBC(doc, OddSource(depth), s);
-                Ref<Image> cpu = Render(bc, nullptr, &roi);
+                s.reverse = reverse;
+                Apply(rig.bc, s);
+                Ref<Image> cpu = Render(rig.bc, &roi);
                 const int launches = ctx->LaunchCount();
                 RenderTask task;
-                Ref<Image> dev = Render(bc, ctx, &roi, &task);
+                Ref<Image> dev = Render(rig.bc, &roi, 0, ctx, &task);
                 ASSERT_TRUE(cpu && dev);
                 EXPECT_GT(ctx->LaunchCount(), launches) << "the device ran";
                 EXPECT_TRUE(task.DeviceLog().empty()) << task.DeviceLog().front();
@@ -123,17 +88,16 @@ TEST_F(BrightnessContrastDevice, MatchesTheRowsOverControlsDirectionsAndDepths) 
 
 TEST_F(BrightnessContrastDevice, WithoutGammaFloatResultsAreTheRowsBits) {
     ORVANE_NEED_OPENCL(ctx);
-    for (int direction : {0, 1}) {
-        OrvaneDoc doc;
-        Operator *bc = MakeBC(doc, OddSource(DepthRGBAFlt32),
-                              {{"Gain", 1.3},
-                               {"Contrast", 0.2},
-                               {"Saturation", 0.6},
-                               {"Low", 0.05},
-                               {"ClipWhite", 1},
-                               {"PreDividePostMultiply", 1},
-                               {"Direction", direction}});
-        Ref<Image> cpu = Render(bc, nullptr, nullptr), dev = Render(bc, ctx, nullptr);
+    for (bool reverse : {false, true}) {
+        Rig rig(OddSource(DepthRGBAFlt32));
+        Apply(rig.bc, {.gain = 1.3,
+                       .contrast = 0.2,
+                       .saturation = 0.6,
+                       .low = 0.05,
+                       .reverse = reverse,
+                       .clipWhite = true,
+                       .prePost = true});
+        Ref<Image> cpu = Render(rig.bc), dev = Render(rig.bc, nullptr, 0, ctx);
         ASSERT_TRUE(cpu && dev);
         ASSERT_EQ(cpu->DataWindow(), dev->DataWindow());
         EXPECT_EQ(std::memcmp(cpu->ScanLine(cpu->DataWindow().y0), dev->ScanLine(dev->DataWindow().y0),
@@ -142,28 +106,23 @@ TEST_F(BrightnessContrastDevice, WithoutGammaFloatResultsAreTheRowsBits) {
     }
 }
 
-TEST_F(BrightnessContrastDevice, PreCalculationNeverReachesTheDevice) {
+TEST_F(BrightnessContrastDevice, InputsAreUploadedAndResultsStayStaleUntilDownloaded) {
     ORVANE_NEED_OPENCL(ctx);
-    OrvaneDoc doc;
-    Operator *bc = MakeBC(doc, OddSource(DepthRGBAFlt32), {{"Gamma", 1.5}});
+    Ref<Image> src = OddSource(DepthRGBAFlt32);
+    Rig rig(src);
+    Apply(rig.bc, {.gain = 1.1, .gamma = 1.5});
+    // A pre-calculation never reaches the device.
     const int launches = ctx->LaunchCount();
-    Ref<Image> shape = Render(bc, ctx, nullptr, nullptr, ReqFlagPreCalc);
+    Ref<Image> shape = Render(rig.bc, nullptr, ReqFlagPreCalc, ctx);
     ASSERT_TRUE(shape);
     EXPECT_TRUE(shape->IsNoData());
     EXPECT_FALSE(shape->GetGPUMem());
     EXPECT_EQ(ctx->LaunchCount(), launches);
-    ASSERT_TRUE(Render(bc, ctx, nullptr));
-    EXPECT_EQ(ctx->LaunchCount(), launches + 1);
-}
 
-TEST_F(BrightnessContrastDevice, InputsAreUploadedAndResultsStayStaleUntilDownloaded) {
-    ORVANE_NEED_OPENCL(ctx);
-    OrvaneDoc doc;
-    Ref<Image> src = OddSource(DepthRGBAFlt32);
-    Operator *bc = MakeBC(doc, src, {{"Gamma", 1.5}, {"Gain", 1.1}});
     EXPECT_FALSE(src->GetGPUMem());
-    Ref<Image> dev = Render(bc, ctx, nullptr, nullptr, 0, /*onDevice=*/true);
+    Ref<Image> dev = Render(rig.bc, nullptr, 0, ctx, nullptr, /*onDevice=*/true);
     ASSERT_TRUE(dev);
+    EXPECT_EQ(ctx->LaunchCount(), launches + 1);
     // The CPU-made input was uploaded when its device image was made, and keeps it.
     ASSERT_TRUE(src->GetGPUMem());
     EXPECT_FALSE(src->IsGPUMemDirty());
@@ -171,23 +130,20 @@ TEST_F(BrightnessContrastDevice, InputsAreUploadedAndResultsStayStaleUntilDownlo
     EXPECT_TRUE(dev->IsGPUMemDirty());
     EXPECT_FALSE(dev->HasScanLineData());
     ASSERT_TRUE(dev->DownloadGPUMem());
-    Ref<Image> cpu = Render(bc, nullptr, nullptr);
-    EXPECT_LE(MaxDifference(*dev, *cpu), 2e-5);
+    EXPECT_LE(MaxDifference(*dev, *Render(rig.bc)), 2e-5);
 }
 
 TEST_F(BrightnessContrastDevice, AChainStaysOnTheDevice) {
     ORVANE_NEED_OPENCL(ctx);
-    OrvaneDoc doc;
-    Operator *first = MakeBC(doc, OddSource(DepthRGBAFlt32), {{"Gamma", 1.5}});
-    Operator *second = doc.AddTool(OvID("BrightnessContrast"), "BC2");
-    second->FindInput("Input")->ConnectTo(first->FindMainOutput());
-    Orvane::Test::SetNumber(second, "Gamma", 1.5);
-    Orvane::Test::SetNumber(second, "Direction", 1);
+    Rig rig(OddSource(DepthRGBAFlt32));
+    Operator *second = rig.AddAfter(rig.bc);
+    Apply(rig.bc, {.gamma = 1.5});
+    Apply(second, {.gamma = 1.5, .reverse = true});
     RenderTask task;
     task.SetDevice(ctx);
     EvalOptions opt;
     opt.task = &task;
-    Ref<Parameter> middle = EvaluateOnDevice(first->FindMainOutput(), 0.0, opt); // cached for the next request
+    Ref<Parameter> middle = EvaluateOnDevice(rig.bc->FindMainOutput(), 0.0, opt); // cached for the next request
     auto *mid = dynamic_cast<Image *>(middle.Get());
     ASSERT_TRUE(mid && mid->IsGPUMemDirty());
     Ref<Parameter> last = Evaluate(second->FindMainOutput(), 0.0, opt);
@@ -195,8 +151,7 @@ TEST_F(BrightnessContrastDevice, AChainStaysOnTheDevice) {
     // The second tool read the first one's image on the device: it never came back.
     EXPECT_FALSE(mid->HasScanLineData());
     // Forward then reverse with the same settings: the input again.
-    Ref<Image> src = OddSource(DepthRGBAFlt32);
-    EXPECT_LE(MaxDifference(*dynamic_cast<Image *>(last.Get()), *src), 1e-4);
+    EXPECT_LE(MaxDifference(*dynamic_cast<Image *>(last.Get()), *OddSource(DepthRGBAFlt32)), 1e-4);
 }
 
 /// A device that refuses to compile anything.
@@ -235,12 +190,12 @@ protected:
 
 TEST_F(BrightnessContrastDevice, AFailingDeviceGivesTheRowsResult) {
     RefusingDevice refusing;
-    for (const Settings &s : {Settings{{"Gamma", 1.7}, {"Saturation", 1.2}}, Settings{{"Gain", 1.5}}}) {
-        OrvaneDoc doc;
-        Operator *bc = MakeBC(doc, OddSource(DepthRGBAFlt32), s);
-        Ref<Image> cpu = Render(bc, nullptr, nullptr);
+    for (const Settings &s : {Settings{.gamma = 1.7, .saturation = 1.2}, Settings{.gain = 1.5}}) {
+        Rig rig(OddSource(DepthRGBAFlt32));
+        Apply(rig.bc, s);
+        Ref<Image> cpu = Render(rig.bc);
         RenderTask task;
-        Ref<Image> fallback = Render(bc, &refusing, nullptr, &task);
+        Ref<Image> fallback = Render(rig.bc, nullptr, 0, &refusing, &task);
         ASSERT_TRUE(cpu && fallback);
         EXPECT_EQ(MaxDifference(*fallback, *cpu), 0.0);
         ASSERT_EQ(task.DeviceLog().size(), 1u);
@@ -249,4 +204,4 @@ TEST_F(BrightnessContrastDevice, AFailingDeviceGivesTheRowsResult) {
 }
 
 } // namespace
-} // namespace Orvane
+} // namespace Orvane::bctest

@@ -7,6 +7,8 @@
 #include <cmath>
 #include <cstdint>
 #include <functional>
+#include <utility>
+#include <vector>
 
 #include <gtest/gtest.h>
 
@@ -14,6 +16,7 @@
 #include "host/core/Tags.h"
 #include "host/flow/Engine.h"
 #include "host/flow/Link.h"
+#include "host/flow/RenderTask.h"
 #include "host/flow/Request.h"
 #include "host/image/NewImage.h"
 #include "tests/support/TestSupport.h"
@@ -30,27 +33,27 @@ struct Settings {
     bool reverse = false, clipBlack = false, clipWhite = false, prePost = false;
 };
 
-inline void Apply(Operator *bc, const Settings &s) {
-    const std::pair<const char *, double> values[] = {
-        {"Gain", s.gain},
-        {"Lift", s.lift},
-        {"Gamma", s.gamma},
-        {"Contrast", s.contrast},
-        {"Brightness", s.brightness},
-        {"Saturation", s.saturation},
-        {"Low", s.low},
-        {"High", s.high},
-        {"Red", s.red},
-        {"Green", s.green},
-        {"Blue", s.blue},
-        {"Alpha", s.alpha},
-        {"Direction", s.reverse},
-        {"ClipBlack", s.clipBlack},
-        {"ClipWhite", s.clipWhite},
-        {"PreDividePostMultiply", s.prePost},
-    };
-    for (const auto &[id, value] : values) Test::SetNumber(bc, id, value);
+/// The tool's inputs with their values under `s`.
+inline std::vector<std::pair<const char *, double>> Values(const Settings &s) {
+    return {{"Gain", s.gain},
+            {"Lift", s.lift},
+            {"Gamma", s.gamma},
+            {"Contrast", s.contrast},
+            {"Brightness", s.brightness},
+            {"Saturation", s.saturation},
+            {"Low", s.low},
+            {"High", s.high},
+            {"Red", s.red},
+            {"Green", s.green},
+            {"Blue", s.blue},
+            {"Alpha", s.alpha},
+            {"Direction", s.reverse},
+            {"ClipBlack", s.clipBlack},
+            {"ClipWhite", s.clipWhite},
+            {"PreDividePostMultiply", s.prePost}};
 }
+
+inline void Apply(Operator *bc, const Settings &s) { Test::SetNumbers(bc, Values(s)); }
 
 /// Sets the application's power and row switches for a scope.
 class AppSwitches {
@@ -88,13 +91,20 @@ struct Rig {
     }
 };
 
-/// Renders a tool's main output without the result cache.
-inline Ref<Image> Render(Operator *op, const ImgRectI *roi = nullptr, uint32_t flags = 0) {
+/// Renders a tool's main output without the result cache (on `device` when
+/// given; `onDevice` keeps the result there).
+inline Ref<Image> Render(Operator *op, const ImgRectI *roi = nullptr, uint32_t flags = 0,
+                         IDeviceContext *device = nullptr, RenderTask *task = nullptr, bool onDevice = false) {
+    RenderTask own;
+    RenderTask &t = task ? *task : own;
+    t.SetDevice(device);
     EvalOptions opt;
+    opt.task = &t;
     opt.flags = flags;
     opt.useCache = false;
     if (roi) opt.roi = ImageDomain(*roi);
-    Ref<Parameter> p = Evaluate(op->FindMainOutput(), 0.0, opt);
+    Ref<Parameter> p =
+        onDevice ? EvaluateOnDevice(op->FindMainOutput(), 0.0, opt) : Evaluate(op->FindMainOutput(), 0.0, opt);
     return Ref<Image>(dynamic_cast<Image *>(p.Get()));
 }
 
