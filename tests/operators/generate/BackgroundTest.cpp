@@ -1,4 +1,5 @@
-// Background: registration, panel, ramps on every depth, and its frame.
+// Background: its panel by mode, ramps on every depth against the formula
+// and the fixed point steps worked out here, and its frame.
 #include <gtest/gtest.h>
 
 #include <algorithm>
@@ -42,130 +43,6 @@ double RampValue(int mode, const double c[4][4], int ch, double u, double v) {
     }
 }
 
-std::vector<std::string> InputIds(const Operator *op) {
-    std::vector<std::string> ids;
-    for (const auto &in : op->Inputs()) ids.push_back(in->ID().Text());
-    return ids;
-}
-
-std::vector<std::string> Texts(const TagList &tags, Tag tag) {
-    std::vector<std::string> out;
-    for (const TagItem *item : tags.FindAll(tag))
-        out.push_back(KindOfTag(tag) == TagKind::ID ? item->AsID().Text() : item->AsText());
-    return out;
-}
-
-// ---- identity and panel ---------------------------------------------------
-
-TEST_F(BackgroundControls, RegistryRowCarriesTheClassIdentity) {
-    const Registry *row = ClassRegistry->Find(OvID("Background"));
-    ASSERT_NE(row, nullptr);
-    const TagList &t = row->Tags();
-    EXPECT_EQ(row->TypeFlags(), RegKindOperator | RegKindTool | RegKindSource);
-    EXPECT_EQ(row->BaseID(), CLSID_SourceOperator);
-    EXPECT_STREQ(row->ClassName(), "Background");
-    EXPECT_STREQ(t.GetText(RegPath, ""), "Tools/Creator/Background");
-    EXPECT_STREQ(t.GetText(RegAbbreviation, ""), "BG");
-    EXPECT_EQ(Texts(t, RegAlias), (std::vector<std::string>{"Constant", "Solid", "Gradient", "Ramp"}));
-    for (Tag on : {RegSupportsRoI, RegSupportsDoD, RegSupportsGPUImages, RegSourceRangeControls, RegSourceSizeControls,
-                   RegSourceAspectControls, RegSourceDepthControls})
-        EXPECT_TRUE(t.GetBool(on)) << std::hex << on;
-    EXPECT_FALSE(t.Has(RegNoMotionBlurControls));
-}
-
-TEST_F(BackgroundControls, InputsComeInPanelOrderBeforeTheImagePage) {
-    std::vector<std::string> expected = {"Type"};
-    for (int c = 0; c < 4; ++c) {
-        if (c > 0) expected.push_back(std::string(kCornerIds[c]) + "Sep");
-        for (const char *ch : {"Red", "Green", "Blue", "Alpha"}) expected.push_back(std::string(kCornerIds[c]) + ch);
-    }
-    for (const char *id :
-         {"GradientType", "Start", "End", "Gradient", "GradientInterpolationMethod", "Offset", "Repeat", "SubPixel"})
-        expected.push_back(id);
-    std::vector<std::string> ids = InputIds(bg);
-    ASSERT_GT(ids.size(), expected.size());
-    EXPECT_EQ(std::vector<std::string>(ids.begin(), ids.begin() + expected.size()), expected);
-    // The image-format controls the class attributes ask for follow on their own page.
-    for (const char *host : {"GlobalIn", "GlobalOut", "Width", "Height", "PixelAspect", "Depth"})
-        EXPECT_NE(std::find(ids.begin() + expected.size(), ids.end(), host), ids.end()) << host;
-
-    ASSERT_GE(bg->Pages().size(), 1u);
-    for (size_t i = 0; i < expected.size(); ++i) EXPECT_EQ(bg->Inputs()[i]->Page(), 0) << expected[i];
-
-    ASSERT_EQ(bg->Nests().size(), 1u);
-    const ControlNest &nest = bg->Nests()[0];
-    EXPECT_EQ(nest.id, OvID("BackgroundNest"));
-    EXPECT_EQ(nest.name, "Background");
-    EXPECT_TRUE(nest.open);
-    EXPECT_EQ(nest.firstInput, 1); // everything after Type
-    EXPECT_EQ(nest.endInput, static_cast<int>(expected.size()));
-
-    Output *out = bg->FindMainOutput();
-    ASSERT_NE(out, nullptr);
-    EXPECT_EQ(out->ID(), OvID("Output"));
-    EXPECT_EQ(out->DataType(), CLSID_DataType_Image);
-}
-
-TEST_F(BackgroundControls, ColourInputsFormFourColourControls) {
-    const char *const labels[4] = {"Top Left", "Top Right", "Bottom Left", "Bottom Right"};
-    const char *const channels[4] = {"Red", "Green", "Blue", "Alpha"};
-    for (int c = 0; c < 4; ++c)
-        for (int ch = 0; ch < 4; ++ch) {
-            const std::string id = std::string(kCornerIds[c]) + channels[ch];
-            SCOPED_TRACE(id);
-            const Input *in = bg->FindInput(id.c_str());
-            ASSERT_NE(in, nullptr);
-            const TagList &t = in->Tags();
-            EXPECT_EQ(in->Name(), std::string(labels[c]) + " " + channels[ch]);
-            EXPECT_EQ(t.GetLong(ControlGroup), c + 1);
-            EXPECT_EQ(t.GetLong(ControlMember), ch);
-            EXPECT_EQ(t.GetLong(ColorChannel), ColorChannelRed + ch);
-            EXPECT_FALSE(t.Has(InputMinAllowed) || t.Has(InputMaxAllowed)); // typed values may leave 0..1
-            const auto *def = dynamic_cast<const Number *>(in->Default().Get());
-            ASSERT_NE(def, nullptr);
-            EXPECT_EQ(def->value, ch == 3 ? 1.0 : 0.0);
-        }
-    for (int c = 1; c < 4; ++c) {
-        const Input *sep = bg->FindInput((std::string(kCornerIds[c]) + "Sep").c_str());
-        ASSERT_NE(sep, nullptr);
-        EXPECT_EQ(sep->Tags().GetID(InputControl), CLSID_InputControl_Label);
-        EXPECT_FALSE(sep->IsExternal());
-    }
-}
-
-TEST_F(BackgroundControls, ChoiceRowsAndGradientControlsHaveTheirDefaults) {
-    const std::pair<const char *, std::vector<std::string>> rows[] = {
-        {"Type", {"SolidColor", "Horizontal", "Vertical", "FourCorner", "Gradient"}},
-        {"GradientType", {"Linear", "Reflect", "Square", "Cross", "Radial", "Angle"}},
-        {"GradientInterpolationMethod", {"RGB", "HLS", "HSV", "LAB"}},
-        {"Repeat", {"Once", "Repeat", "PingPong"}},
-        {"SubPixel", {"1x1", "2x2", "3x3", "4x4", "5x5"}},
-    };
-    for (const auto &[id, ids] : rows) {
-        SCOPED_TRACE(id);
-        const Input *in = bg->FindInput(id);
-        ASSERT_NE(in, nullptr);
-        EXPECT_EQ(Texts(in->Tags(), ListItemId), ids);
-        EXPECT_EQ(Texts(in->Tags(), ListAddItem).size(), ids.size());
-        const auto *def = dynamic_cast<const IDValue *>(in->Default().Get());
-        ASSERT_NE(def, nullptr);
-        EXPECT_EQ(def->value, OvID(ids[0].c_str()));
-    }
-    EXPECT_EQ(Texts(bg->FindInput("Type")->Tags(), ButtonIcon).size(), 5u);
-    EXPECT_TRUE(bg->FindInput("Type")->Notifies());
-    EXPECT_TRUE(bg->FindInput("GradientInterpolationMethod")->Notifies());
-
-    for (const auto &[id, x, y] : {std::tuple{"Start", 0.0, 0.5}, std::tuple{"End", 1.0, 0.5}}) {
-        const auto *p = dynamic_cast<const Point *>(bg->FindInput(id)->Default().Get());
-        ASSERT_NE(p, nullptr) << id;
-        EXPECT_EQ(p->x, x) << id;
-        EXPECT_EQ(p->y, y) << id;
-    }
-    EXPECT_EQ(bg->FindInput("End")->Tags().GetPtr(PreviewInputFirst), bg->FindInput("GradientType"));
-    EXPECT_EQ(bg->FindInput("Gradient")->DataType(), CLSID_DataType_Gradient);
-    EXPECT_EQ(dynamic_cast<const Number *>(bg->FindInput("Offset")->Default().Get())->value, 0.0);
-}
-
 // ---- NotifyChanged ----------------------------------------------------------
 
 struct Visibility {
@@ -174,22 +51,18 @@ struct Visibility {
 };
 
 void ExpectPanel(const Operator *op, const Visibility &v) {
-    for (int c = 0; c < 4; ++c) {
-        for (const char *ch : {"Red", "Green", "Blue", "Alpha"})
-            EXPECT_EQ(op->FindInput((std::string(kCornerIds[c]) + ch).c_str())->IsVisible(), v.corner[c])
-                << kCornerIds[c] << ch;
-        if (c > 0) {
-            EXPECT_EQ(op->FindInput((std::string(kCornerIds[c]) + "Sep").c_str())->IsVisible(), v.corner[c])
-                << kCornerIds[c];
-        }
-    }
+    for (int c = 0; c < 4; ++c)
+        for (const char *ch : {"Red", "Green", "Blue", "Alpha", "Sep"})
+            if (c > 0 || std::string(ch) != "Sep") {
+                EXPECT_EQ(op->FindInput((std::string(kCornerIds[c]) + ch).c_str())->IsVisible(), v.corner[c])
+                    << kCornerIds[c] << ch;
+            }
     for (const char *id :
          {"GradientType", "Start", "End", "Gradient", "GradientInterpolationMethod", "Offset", "Repeat", "SubPixel"})
         EXPECT_EQ(op->FindInput(id)->IsVisible(), v.gradient) << id;
     for (int c = 0; c < 3; ++c)
-        if (v.labels[c]) {
+        if (v.labels[c])
             EXPECT_STREQ(op->FindInput((std::string(kCornerIds[c]) + "Red").c_str())->Label(), v.labels[c]);
-        }
 }
 
 const Visibility kPanels[5] = {
@@ -201,6 +74,11 @@ const Visibility kPanels[5] = {
 };
 
 TEST_F(BackgroundControls, TypeShowsTheControlsAndLabelsOfItsMode) {
+    // As constructed: a solid, opaque black frame.
+    SetNumbers(bg, {{"Width", 4}, {"Height", 3}});
+    Ref<Image> img = EvalImage(bg);
+    ASSERT_TRUE(img);
+    EXPECT_EQ(img->GetFlt(3, 2), (FltPixel{0, 0, 0, 1}));
     Input *type = bg->FindInput("Type");
     // A new tool shows what the default Solid Color needs.
     ExpectPanel(bg, kPanels[0]);
@@ -263,33 +141,12 @@ TEST_F(BackgroundRamp, FloatPixelsFollowTheFormulaOfEachMode) {
         }
 }
 
-TEST_F(BackgroundRamp, TopLeftIsTheTopRowOfAVerticalAndTheLeftColumnOfAHorizontalRamp) {
-    const int W = 9, H = 6;
-    SetCorners(bg, kCorners);
-    Frame(W, H, "Vertical");
-    Ref<Image> vertical = EvalImage(bg);
-    Frame(W, H, "Horizontal");
-    Ref<Image> horizontal = EvalImage(bg);
-    ASSERT_TRUE(vertical && horizontal);
-    for (int i = 0; i < 9; ++i) {
-        const FltPixel top = vertical->GetFlt(i % W, H - 1), left = horizontal->GetFlt(0, i % H);
-        const FltPixel bottom = vertical->GetFlt(i % W, 0), right = horizontal->GetFlt(W - 1, i % H);
-        for (int ch = 0; ch < 4; ++ch) {
-            EXPECT_FLOAT_EQ(Channel(top, ch), float(kCorners[0][ch]));
-            EXPECT_FLOAT_EQ(Channel(left, ch), float(kCorners[0][ch]));
-            EXPECT_FLOAT_EQ(Channel(bottom, ch), float(kCorners[2][ch]));
-            EXPECT_FLOAT_EQ(Channel(right, ch), float(kCorners[1][ch]));
-        }
-    }
-}
-
 TEST_F(BackgroundRamp, EqualEndsGiveExactlyThatColourAcrossTheRow) {
     // 0.3 is not a sum of halves: a blend of two 0.3s may miss it by a unit in the last place.
-    const double c[4] = {0.3, 0.7, 0.1, 0.9}, other[4] = {0.55, 0.25, 0.35, 0.45};
-    SetColor(bg, "TopLeft", c);
-    SetColor(bg, "TopRight", c);
-    SetColor(bg, "BottomLeft", other);
-    SetColor(bg, "BottomRight", other);
+    const double c[4] = {0.3, 0.7, 0.1, 0.9};
+    const double colors[4][4] = {
+        {c[0], c[1], c[2], c[3]}, {c[0], c[1], c[2], c[3]}, {0.55, 0.25, 0.35, 0.45}, {0.55, 0.25, 0.35, 0.45}};
+    SetCorners(bg, colors);
     for (const char *mode : {"Horizontal", "FourCorner"}) {
         Frame(37, 5, mode);
         Ref<Image> img = EvalImage(bg);
@@ -365,35 +222,31 @@ TEST_F(BackgroundRamp, IntegerVerticalAndFourCornerRowsStartFromTheirEnds) {
 TEST_F(BackgroundRamp, IntegerImagesWithColoursBeyondOneRenderClampedThroughFloats) {
     struct Case {
         const char *mode;
-        double tl[4], tr[4], bl[4], br[4];
+        int m;               ///< the ramp of RampValue
+        double colors[4][4]; ///< top left, top right, bottom left, bottom right
     };
     // The last case has its out-of-range colour only on the top right corner.
     const Case cases[] = {
-        {"Horizontal", {-0.5, 0.2, 1.0, 1.0}, {1.5, 0.8, 3.0, 1.0}, {0, 0, 0, 0}, {0, 0, 0, 0}},
-        {"Vertical", {2.0, 0.5, 0.5, 1.0}, {0, 0, 0, 0}, {-1.0, 0.5, 0.2, 1.0}, {0, 0, 0, 0}},
-        {"FourCorner", {0.2, 0.4, 0.6, 1.0}, {4.0, 0.4, -2.0, 1.0}, {0.1, 0.9, 0.5, 1.0}, {0.3, 0.3, 0.3, 1.0}},
+        {"Horizontal", 1, {{-0.5, 0.2, 1.0, 1.0}, {1.5, 0.8, 3.0, 1.0}, {}, {}}},
+        {"Vertical", 2, {{2.0, 0.5, 0.5, 1.0}, {}, {-1.0, 0.5, 0.2, 1.0}, {}}},
+        {"FourCorner", 3, {{0.2, 0.4, 0.6, 1.0}, {4.0, 0.4, -2.0, 1.0}, {0.1, 0.9, 0.5, 1.0}, {0.3, 0.3, 0.3, 1.0}}},
     };
     const int W = 41, H = 7;
     for (const Case &c : cases)
         for (int depthChoice : {2, 1}) {
             SCOPED_TRACE(std::string(c.mode) + (depthChoice == 2 ? " int16" : " int8"));
-            const double colors[4][4] = {{c.tl[0], c.tl[1], c.tl[2], c.tl[3]},
-                                         {c.tr[0], c.tr[1], c.tr[2], c.tr[3]},
-                                         {c.bl[0], c.bl[1], c.bl[2], c.bl[3]},
-                                         {c.br[0], c.br[1], c.br[2], c.br[3]}};
-            SetCorners(bg, colors);
+            SetCorners(bg, c.colors);
             Frame(W, H, c.mode);
             SetNumber(bg, "Depth", depthChoice);
-            const int m = std::string(c.mode) == "Horizontal" ? 1 : std::string(c.mode) == "Vertical" ? 2 : 3;
             const double top = depthChoice == 2 ? 65535.0 : 255.0;
             Ref<Image> img = EvalImage(bg);
             ASSERT_TRUE(img);
             for (int y = 0; y < H; ++y)
                 for (int x = 0; x < W; ++x)
                     for (int ch = 0; ch < 4; ++ch) {
-                        const double f = RampValue(m, colors, ch, x / double(W - 1), y / double(H - 1));
-                        const double want = std::clamp(f, 0.0, 1.0) * top;
-                        ASSERT_NEAR(StoredInt(*img, x, y, ch), want, 1.0) << x << "," << y << " ch " << ch;
+                        const double f = RampValue(c.m, c.colors, ch, x / double(W - 1), y / double(H - 1));
+                        ASSERT_NEAR(StoredInt(*img, x, y, ch), std::clamp(f, 0.0, 1.0) * top, 1.0)
+                            << x << "," << y << " ch " << ch;
                     }
         }
 }
@@ -473,17 +326,20 @@ TEST_F(BackgroundFrame, OpacityFollowsTheAlphasInUse) {
     EXPECT_FALSE(img->IsOpaque());
 }
 
-TEST_F(BackgroundFrame, PreCalculationGivesTheWindowsWithoutPixels) {
+TEST_F(BackgroundFrame, PreCalculationAndARegionOutsideTheFrameMakeNoPixels) {
     Frame(40, 30, "FourCorner");
     EvalOptions opt;
     opt.flags = ReqFlagPreCalc;
     opt.roi = ImageDomain(ImgRectI(5, 5, 10, 10)); // no region in pre-calculation
     Ref<Image> img = Render(bg, opt);
     ASSERT_TRUE(img);
-    EXPECT_TRUE(img->IsNoData());
-    EXPECT_FALSE(img->HasScanLineData());
+    EXPECT_TRUE(img->IsNoData() && !img->HasScanLineData());
     EXPECT_EQ(img->Frame(), ImgRectI(0, 0, 40, 30));
     EXPECT_EQ(img->DataWindow(), img->Frame());
+    opt.flags = 0;
+    opt.roi = ImageDomain(ImgRectI(50, 20, 60, 40));
+    ASSERT_TRUE(img = Render(bg, opt));
+    EXPECT_TRUE(img->DataWindow().IsNull() && !img->HasScanLineData());
 }
 
 TEST_F(BackgroundFrame, RegionRenderEqualsTheCropOfTheFullRender) {
@@ -519,16 +375,6 @@ TEST_F(BackgroundFrame, RegionRenderEqualsTheCropOfTheFullRender) {
             ASSERT_EQ(0, std::memcmp(crop->ScanLine(y), whole->PixelAddress(c.expected.x0, y), crop->RowBytes()))
                 << "row " << y;
     }
-}
-
-TEST_F(BackgroundFrame, RegionOutsideTheFrameGivesAnEmptyImage) {
-    Frame(16, 16, "Horizontal");
-    EvalOptions opt;
-    opt.roi = ImageDomain(ImgRectI(20, 20, 30, 30));
-    Ref<Image> img = Render(bg, opt);
-    ASSERT_TRUE(img);
-    EXPECT_TRUE(img->DataWindow().IsNull());
-    EXPECT_FALSE(img->HasScanLineData());
 }
 
 TEST_F(BackgroundFrame, ProxyHalvesTheSizeAndKeepsTheFullFrameAspect) {

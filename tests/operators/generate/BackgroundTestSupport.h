@@ -28,6 +28,7 @@ using Orvane::Test::EvalImage;
 using Orvane::Test::LoadOperators;
 using Orvane::Test::SetID;
 using Orvane::Test::SetNumber;
+using Orvane::Test::SetNumbers;
 using Orvane::Test::SetPoint;
 
 /// Loads the tool library once for the whole suite.
