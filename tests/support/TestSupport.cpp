@@ -39,6 +39,7 @@ Ref<Image> PatternImage(int w, int h, int depth, unsigned seed) {
 #include "host/flow/DataTypes.h"
 #include "host/flow/Engine.h"
 #include "host/flow/Request.h"
+#include "host/image/TransformMatrix.h"
 
 namespace Orvane::Test {
 namespace {
@@ -110,6 +111,41 @@ ImageSourceTool *AddImageSource(OrvaneDoc &doc, const std::string &name, Ref<Ima
     EXPECT_NE(tool, nullptr);
     if (tool) tool->SetImage(std::move(img));
     return tool;
+}
+
+ValueProbe::ValueProbe(const Registry *reg, const ScriptVal &args, const TagList &tags, bool takesTransforms)
+    : ThreadedOperator(reg, args, tags) {
+    TagList in{{LinkDataType, CLSID_DataType_Image}, {LinkMain, 1}};
+    if (takesTransforms) in.Add({LinkSecondDataType, CLSID_DataType_TransformMatrix});
+    input_ = AddInputTagList("Input", "Input", in);
+    output_ = AddOutputTagList("Output", "Output", {{LinkDataType, CLSID_DataType_Image}, {LinkMain, 1}});
+}
+
+void ValueProbe::Process(Request *req) {
+    Parameter *v = req->GetInputData(input_);
+    if (!req->IsPreCalc())
+        seen.emplace_back(v);
+    else
+        dod = req->GetInputDoD(input_);
+    TagList cut{{WorkRequest, static_cast<const void *>(req)}};
+    const AutoImageRoI roi(req);
+    if (roi) cut.Set({ImgDataWindow, &roi->rect});
+    Ref<Image> pixels = ImageOfValue(v, cut);
+    req->SetOutputData(output_, pixels ? pixels.Get() : v);
+}
+
+ValueProbe *AddValueProbe(OrvaneDoc &doc, Operator *src, bool takesTransforms) {
+    static const OvID takes = RegisterTestTool("TestTakesTransforms",
+                                               [](const Registry *r, const ScriptVal &a, const TagList &t) -> Object * {
+                                                   return new ValueProbe(r, a, t, true);
+                                               });
+    static const OvID images =
+        RegisterTestTool("TestTakesImages", [](const Registry *r, const ScriptVal &a, const TagList &t) -> Object * {
+            return new ValueProbe(r, a, t, false);
+        });
+    auto *probe = dynamic_cast<ValueProbe *>(doc.AddTool(takesTransforms ? takes : images));
+    EXPECT_TRUE(probe && probe->FindInput("Input")->ConnectTo(src->FindMainOutput()));
+    return probe;
 }
 
 Ref<Image> EvalImage(Operator *op, double time, const ImgRectI *roi) {

@@ -59,6 +59,25 @@ OvID RegisterTestTool(const char *id, ClassFactory make);
 /// Adds an ImageSourceTool named `name` that outputs `img`.
 ImageSourceTool *AddImageSource(OrvaneDoc &doc, const std::string &name, Ref<Image> img);
 
+/// A test tool that notes the value it gets on its image input (and, in a
+/// pre-calculation, the input's domain) and hands on that value's pixels
+/// (or the value itself when it has none).
+/// With `takesTransforms` its input also takes a pending transform.
+class ValueProbe : public ThreadedOperator {
+public:
+    ValueProbe(const Registry *reg, const ScriptVal &args, const TagList &tags, bool takesTransforms);
+    void Process(Request *req) override;
+    std::vector<Ref<Parameter>> seen; ///< values of the pixel requests
+    std::optional<ImageDomain> dod;   ///< the input's domain, as the engine told it
+
+private:
+    Input *input_;
+    Output *output_;
+};
+
+/// Adds a ValueProbe reading `src`'s main output.
+ValueProbe *AddValueProbe(OrvaneDoc &doc, Operator *src, bool takesTransforms);
+
 /// Evaluates a tool's main output as an image (null on failure).
 Ref<Image> EvalImage(Operator *op, double time = 0.0, const ImgRectI *roi = nullptr);
 

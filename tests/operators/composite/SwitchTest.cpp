@@ -49,26 +49,7 @@ public:
     int processCount = 0;
 };
 
-/// Takes an image or a pending transform and remembers what it was given.
-class Probe : public ThreadedOperator {
-public:
-    Probe(const Registry *reg, const ScriptVal &args, const TagList &tags) : ThreadedOperator(reg, args, tags) {
-        input = AddInputTagList("Input", "Input",
-                                {{LinkDataType, CLSID_DataType_Image},
-                                 {LinkSecondDataType, CLSID_DataType_TransformMatrix},
-                                 {LinkMain, 1}});
-        output = AddOutputTagList("Output", "Output", {{LinkDataType, CLSID_DataType_Image}, {LinkMain, 1}});
-    }
-    void Process(Request *req) override {
-        if (!req->IsPreCalc()) received = Ref<Parameter>(req->GetInputData(input));
-        req->SetOutputData(output, req->GetInputData(input));
-    }
-    Input *input;
-    Output *output;
-    Ref<Parameter> received;
-};
-
-/// A ValueSource class for each data type, and the probe.
+/// A ValueSource class for each data type.
 template <OvID const &Type> Object *NewValueSource(const Registry *r, const ScriptVal &a, const TagList &t) {
     return new ValueSource(r, a, t, Type);
 }
@@ -76,7 +57,6 @@ struct Classes {
     OvID scene = ts::RegisterTestTool("TestSwitchScene", &NewValueSource<CLSID_DataType_3D>);
     OvID material = ts::RegisterTestTool("TestSwitchMaterial", &NewValueSource<CLSID_DataType_MtlGraph3D>);
     OvID transform = ts::RegisterTestTool("TestSwitchTransform", &NewValueSource<CLSID_DataType_TransformMatrix>);
-    OvID probe = ts::RegisterTestTool("TestSwitchProbe", &ts::NewTestObject<Probe>);
 };
 const Classes &C() {
     static const Classes classes;
@@ -333,17 +313,17 @@ TEST_F(SwitchTest, APendingTransformPassesThroughUnflattened) {
     ts::ImageSourceTool *img = ts::AddImageSource(*doc, "Plain", ts::PatternImage(4, 3));
     ASSERT_TRUE(sw->FindInput("Input0")->ConnectTo(xf->output));
     ASSERT_TRUE(sw->FindInput("Input1")->ConnectTo(img->Out()));
-    auto *probe = dynamic_cast<Probe *>(doc->AddTool(C().probe));
+    ts::ValueProbe *probe = ts::AddValueProbe(*doc, sw, true); // takes images and pending transforms
     ASSERT_NE(probe, nullptr);
-    ASSERT_TRUE(probe->input->ConnectTo(sw->FindMainOutput()));
 
     ts::SetNumber(sw, "Source", 0);
     Eval(probe);
-    EXPECT_EQ(probe->received.Get(), xf->value.Get());
+    ASSERT_EQ(probe->seen.size(), 1u);
+    EXPECT_EQ(probe->seen[0].Get(), xf->value.Get());
     ts::SetNumber(sw, "Source", 1);
     Eval(probe);
-    ASSERT_NE(probe->received, nullptr);
-    EXPECT_EQ(probe->received.Get(), ts::EvalImage(img).Get());
+    ASSERT_EQ(probe->seen.size(), 2u);
+    EXPECT_EQ(probe->seen[1].Get(), ts::EvalImage(img).Get());
 }
 
 } // namespace

@@ -1,5 +1,5 @@
 // The Transform tool in the flow: its controls, what travels on its output
-// (a pending transform for inputs that take one, pixels for the others),
+// (a pending transform for probes that take one, pixels for the others),
 // chains that resample once, flattening, regions of interest, domains, the
 // common controls and caching. Pixels are compared with a single transform
 // made directly on the image (TransformMatrixTest checks those against the
@@ -16,43 +16,6 @@
 
 namespace Orvane::WarpTest {
 namespace {
-
-/// A consumer that notes the value it gets on its image input and hands on
-/// its pixels. `Takes` declares LinkSecondDataType TransformMatrix.
-template <bool Takes> class ValueProbe : public ThreadedOperator {
-public:
-    ValueProbe(const Registry *reg, const ScriptVal &args, const TagList &tags) : ThreadedOperator(reg, args, tags) {
-        TagList in{{LinkDataType, CLSID_DataType_Image}, {LinkMain, 1}};
-        if (Takes) in.Add({LinkSecondDataType, CLSID_DataType_TransformMatrix});
-        input_ = AddInputTagList("Input", "Input", in);
-        output_ = AddOutputTagList("Output", "Output", {{LinkDataType, CLSID_DataType_Image}, {LinkMain, 1}});
-    }
-    void Process(Request *req) override {
-        Parameter *v = req->GetInputData(input_);
-        if (!req->IsPreCalc())
-            seen.emplace_back(v);
-        else
-            dod = req->GetInputDoD(input_);
-        TagList cut{{WorkRequest, static_cast<const void *>(req)}};
-        const AutoImageRoI roi(req);
-        if (roi) cut.Set({ImgDataWindow, &roi->rect});
-        req->SetOutputData(output_, ImageOfValue(v, cut).Get());
-    }
-    std::vector<Ref<Parameter>> seen; ///< values of the pixel requests
-    std::optional<ImageDomain> dod;   ///< the input's domain, as the engine told it
-
-private:
-    Input *input_;
-    Output *output_;
-};
-
-template <bool Takes> ValueProbe<Takes> *AddConsumer(OrvaneDoc &doc, Operator *src) {
-    static const OvID cls = Orvane::Test::RegisterTestTool(Takes ? "TestTakesTransforms" : "TestTakesImages",
-                                                           &Orvane::Test::NewTestObject<ValueProbe<Takes>>);
-    auto *probe = dynamic_cast<ValueProbe<Takes> *>(doc.AddTool(cls));
-    EXPECT_TRUE(probe && probe->FindInput("Input")->ConnectTo(src->FindMainOutput()));
-    return probe;
-}
 
 /// A smooth picture with a non-constant alpha and a canvas.
 Ref<Image> Picture(int w = 48, int h = 40) {
@@ -93,8 +56,8 @@ Ref<Image> Direct(Image *src, const TagList &tags, const ImgRectI *cut = nullptr
 
 TEST_F(TransformTool, ConsumersGetATransformOrPixelsAsTheyDeclare) {
     Operator *xf = Make({{"Angle", 30}});
-    auto *takes = AddConsumer<true>(doc, xf);
-    auto *images = AddConsumer<false>(doc, xf);
+    auto *takes = AddValueProbe(doc, xf, true);
+    auto *images = AddValueProbe(doc, xf, false);
     ASSERT_TRUE(Render(takes) && Render(images));
     ASSERT_EQ(takes->seen.size(), 1u);
     ASSERT_EQ(images->seen.size(), 1u);
@@ -148,7 +111,7 @@ TEST_F(TransformTool, AChainResamplesOnceAndEqualsOneTransform) {
     // Flattening the first makes its pixels at once: two resamplings, and
     // its output is a plain image.
     SetNumber(first, "FlattenTransform", 1);
-    auto *probe = AddConsumer<true>(doc, first);
+    auto *probe = AddValueProbe(doc, first, true);
     before = TransformMatrix::ResampleCount();
     ASSERT_TRUE(Render(second));
     EXPECT_EQ(TransformMatrix::ResampleCount() - before, 2);
@@ -234,7 +197,7 @@ TEST_F(TransformTool, BlendMixesThePixelsOfTheTransform) {
 
 TEST_F(TransformTool, CachedResultsAreNotResampledAgain) {
     Operator *xf = Make({{"Angle", 45}});
-    auto *consumer = AddConsumer<false>(doc, xf);
+    auto *consumer = AddValueProbe(doc, xf, false);
     RenderOptions cached;
     cached.useCache = true;
     ASSERT_TRUE(Render(consumer, cached));

@@ -23,6 +23,7 @@
 
 namespace Orvane::WarpTest {
 
+using Orvane::Test::AddValueProbe;
 using Orvane::Test::LoadOperators;
 using Orvane::Test::PatternImage;
 using Orvane::Test::SetID;
