@@ -61,6 +61,7 @@ void ExpectPixelNear(const FltPixel &got, const FltPixel &want, double tol, cons
 #include "host/flow/DataTypes.h"
 #include "host/flow/Engine.h"
 #include "host/flow/Request.h"
+#include "host/image/TransformMatrix.h"
 
 namespace Orvane::Test {
 namespace {
@@ -88,6 +89,11 @@ const Registry *ImageSourceRow() {
 
 } // namespace
 
+OvID RegisterTestTool(const char *id, ClassFactory make) {
+    return RegisterTool(id, make,
+                        {{RegNoBlendControls, 1}, {RegNoEffectMask, 1}, {RegSupportsRoI, 1}, {RegSupportsDoD, 1}});
+}
+
 ImageSourceTool::ImageSourceTool(const Registry *reg, const ScriptVal &args, const TagList &tags)
     : ThreadedOperator(reg, args, tags) {
     output_ = AddOutputTagList("Output", "Output", {{LinkDataType, CLSID_DataType_Image}, {LinkMain, 1}});
@@ -107,6 +113,12 @@ void ImageSourceTool::Process(Request *req) {
         return;
     }
     ++processCount;
+    asked.push_back(req->RoI());
+    if (cutToRegion && req->RoI() && !req->RoI()->rect.Contains(image_->DataWindow())) {
+        const ImgRectI cut = image_->DataWindow() & req->RoI()->rect;
+        req->SetOutputData(output_, image_->CopyOfImageTagList({{ImgDataWindow, &cut}}).Get());
+        return;
+    }
     req->SetOutputData(output_, image_.Get());
 }
 
@@ -116,6 +128,41 @@ ImageSourceTool *AddImageSource(OrvaneDoc &doc, const std::string &name, Ref<Ima
     EXPECT_NE(tool, nullptr);
     if (tool) tool->SetImage(std::move(img));
     return tool;
+}
+
+ValueProbe::ValueProbe(const Registry *reg, const ScriptVal &args, const TagList &tags, bool takesTransforms)
+    : ThreadedOperator(reg, args, tags) {
+    TagList in{{LinkDataType, CLSID_DataType_Image}, {LinkMain, 1}};
+    if (takesTransforms) in.Add({LinkSecondDataType, CLSID_DataType_TransformMatrix});
+    input_ = AddInputTagList("Input", "Input", in);
+    output_ = AddOutputTagList("Output", "Output", {{LinkDataType, CLSID_DataType_Image}, {LinkMain, 1}});
+}
+
+void ValueProbe::Process(Request *req) {
+    Parameter *v = req->GetInputData(input_);
+    if (!req->IsPreCalc())
+        seen.emplace_back(v);
+    else
+        dod = req->GetInputDoD(input_);
+    TagList cut{{WorkRequest, static_cast<const void *>(req)}};
+    const AutoImageRoI roi(req);
+    if (roi) cut.Set({ImgDataWindow, &roi->rect});
+    Ref<Image> pixels = ImageOfValue(v, cut);
+    req->SetOutputData(output_, pixels ? pixels.Get() : v);
+}
+
+ValueProbe *AddValueProbe(OrvaneDoc &doc, Operator *src, bool takesTransforms) {
+    static const OvID takes = RegisterTestTool("TestTakesTransforms",
+                                               [](const Registry *r, const ScriptVal &a, const TagList &t) -> Object * {
+                                                   return new ValueProbe(r, a, t, true);
+                                               });
+    static const OvID images =
+        RegisterTestTool("TestTakesImages", [](const Registry *r, const ScriptVal &a, const TagList &t) -> Object * {
+            return new ValueProbe(r, a, t, false);
+        });
+    auto *probe = dynamic_cast<ValueProbe *>(doc.AddTool(takesTransforms ? takes : images));
+    EXPECT_TRUE(probe && probe->FindInput("Input")->ConnectTo(src->FindMainOutput()));
+    return probe;
 }
 
 Ref<Image> EvalImage(Operator *op, double time, const ImgRectI *roi) {
@@ -130,6 +177,7 @@ Ref<Image> EvalImage(Operator *op, double time, const EvalOptions &options) {
 }
 
 OvID RegisterTool(const char *id, ClassFactory make, std::initializer_list<TagItem> attrs) {
+    if (ClassRegistry && ClassRegistry->Find(OvID(id))) return OvID(id);
     TagList tags{{RegConstructor, make}, {RegTypeFlags, static_cast<long long>(RegKindOperator | RegKindTool)}};
     for (const TagItem &a : attrs) tags.Set(a);
     Registry::_Init(&ClassRegistry, OvID(id), tags);
@@ -140,6 +188,10 @@ void SetNumber(Operator *op, const char *id, double value) {
     Input *in = op->FindInput(id);
     ASSERT_NE(in, nullptr) << "no input " << id;
     ASSERT_TRUE(in->SetValue(MakeRef<Number>(value))) << id;
+}
+
+void SetNumbers(Operator *op, const std::vector<std::pair<const char *, double>> &values) {
+    for (const auto &[id, value] : values) SetNumber(op, id, value);
 }
 
 void SetPoint(Operator *op, const char *id, double x, double y) {

@@ -2,7 +2,10 @@
 // Helpers shared by the tests: loading the tool library once, making
 // documents and tools, and small image utilities.
 #include <initializer_list>
+#include <optional>
 #include <string>
+#include <utility>
+#include <vector>
 
 #include "host/core/Registry.h"
 #include "host/flow/Engine.h"
@@ -45,14 +48,42 @@ public:
     void Process(Request *req) override;
     Output *Out() const { return output_; }
     int processCount = 0; ///< pixel requests served (pre-calculations not counted)
+    /// The regions of interest of the pixel requests so far (absent: the whole frame).
+    std::vector<std::optional<ImageDomain>> asked;
+    /// When set, a pixel request gets only the part of the image it asks
+    /// for (the rest is canvas), as from any tool.
+    bool cutToRegion = false;
 
 private:
     Ref<Image> image_;
     Output *output_;
 };
 
+/// Registers a test tool class `id` made by `make` (an operator tool with
+/// regions and domains, no blend or effect mask controls); returns its ID.
+OvID RegisterTestTool(const char *id, ClassFactory make);
+
 /// Adds an ImageSourceTool named `name` that outputs `img`.
 ImageSourceTool *AddImageSource(OrvaneDoc &doc, const std::string &name, Ref<Image> img);
+
+/// A test tool that notes the value it gets on its image input (and, in a
+/// pre-calculation, the input's domain) and hands on that value's pixels
+/// (or the value itself when it has none).
+/// With `takesTransforms` its input also takes a pending transform.
+class ValueProbe : public ThreadedOperator {
+public:
+    ValueProbe(const Registry *reg, const ScriptVal &args, const TagList &tags, bool takesTransforms);
+    void Process(Request *req) override;
+    std::vector<Ref<Parameter>> seen; ///< values of the pixel requests
+    std::optional<ImageDomain> dod;   ///< the input's domain, as the engine told it
+
+private:
+    Input *input_;
+    Output *output_;
+};
+
+/// Adds a ValueProbe reading `src`'s main output.
+ValueProbe *AddValueProbe(OrvaneDoc &doc, Operator *src, bool takesTransforms);
 
 /// Evaluates a tool's main output as an image (null on failure).
 Ref<Image> EvalImage(Operator *op, double time = 0.0, const ImgRectI *roi = nullptr);
@@ -69,6 +100,8 @@ OvID RegisterTool(const char *id, ClassFactory make, std::initializer_list<TagIt
 
 /// Sets a number input by ID; fails the test when the input is missing.
 void SetNumber(Operator *op, const char *id, double value);
+/// Sets several number inputs by ID, in order.
+void SetNumbers(Operator *op, const std::vector<std::pair<const char *, double>> &values);
 void SetPoint(Operator *op, const char *id, double x, double y);
 void SetID(Operator *op, const char *id, const char *value);
 

@@ -1,28 +1,350 @@
-// BrightnessContrast pixel values: the tool against an independent model of
-// its steps, on every depth and every row function; the matrix and row routes
-// against each other; forward then reverse; the edge settings.
+// BrightnessContrast: the tool against an independent model of its steps
+// (in double precision for float, in whole numbers for 16-bit) on every depth
+// and row function; forward then reverse; edge settings; pass-through,
+// canvas, windows, regions and workers in the processing frame; and the
+// device against the rows, with the device path's rules.
 #include <algorithm>
+#include <array>
 #include <cmath>
+#include <cstdint>
 #include <cstring>
+#include <functional>
+#include <map>
 #include <string>
+#include <utility>
+#include <vector>
 
 #include <gtest/gtest.h>
 
-#include "tests/operators/color/BrightnessContrastReference.h"
+#include "host/app/Application.h"
+#include "host/core/Parallel.h"
+#include "host/core/Tags.h"
+#include "host/flow/Engine.h"
+#include "host/flow/Link.h"
+#include "host/flow/RenderTask.h"
+#include "host/flow/Request.h"
+#include "host/image/NewImage.h"
+#include "host/krom/GPUMemory.h"
+#include "tests/host/krom/DeviceTestSupport.h"
+#include "tests/support/TestSupport.h"
 
 namespace Orvane::bctest {
 namespace {
+using Px = std::array<double, 4>;
 
-class BrightnessContrastValues : public ::testing::Test {
-protected:
-    void SetUp() override { Orvane::Test::LoadOperators(); }
+/// The tool's inputs (defaults as the tool declares them).
+struct Settings {
+    double gain = 1.0, lift = 0.0, gamma = 1.0, contrast = 0.0, brightness = 0.0, saturation = 1.0;
+    double low = 0.0, high = 1.0;
+    bool red = true, green = true, blue = true, alpha = false;
+    bool reverse = false, clipBlack = false, clipWhite = false, prePost = false;
 };
+
+/// The tool's inputs with their values under `s`.
+std::vector<std::pair<const char *, double>> Values(const Settings &s) {
+    const char *const ids[] = {
+        "Gain", "Lift",  "Gamma", "Contrast", "Brightness", "Saturation", "Low",       "High",
+        "Red",  "Green", "Blue",  "Alpha",    "Direction",  "ClipBlack",  "ClipWhite", "PreDividePostMultiply"};
+    const double values[] = {s.gain, s.lift,  s.gamma, s.contrast, s.brightness, s.saturation, s.low,       s.high,
+                             s.red,  s.green, s.blue,  s.alpha,    s.reverse,    s.clipBlack,  s.clipWhite, s.prePost};
+    std::vector<std::pair<const char *, double>> out;
+    for (size_t i = 0; i < std::size(ids); ++i) out.emplace_back(ids[i], values[i]);
+    return out;
+}
+
+void Apply(Operator *bc, const Settings &s) { Test::SetNumbers(bc, Values(s)); }
+
+/// Sets the application's power and row switches for a scope.
+class AppSwitches {
+public:
+    AppSwitches(bool fastPower, bool vectorRows)
+        : fast_(GetApp()->GetAttrB(AppFastPower)), vector_(GetApp()->GetAttrB(AppVectorRows)) {
+        GetApp()->SetAttrsTagList({{AppFastPower, fastPower}, {AppVectorRows, vectorRows}});
+    }
+    ~AppSwitches() { GetApp()->SetAttrsTagList({{AppFastPower, fast_}, {AppVectorRows, vector_}}); }
+    AppSwitches(const AppSwitches &) = delete;
+    AppSwitches &operator=(const AppSwitches &) = delete;
+
+private:
+    bool fast_, vector_;
+};
+
+/// A document with an image source feeding one BrightnessContrast tool.
+struct Rig {
+    OrvaneDoc doc;
+    Test::ImageSourceTool *source = nullptr;
+    Operator *bc = nullptr;
+
+    explicit Rig(Ref<Image> img) {
+        source = Test::AddImageSource(doc, "Src", std::move(img));
+        bc = doc.AddTool(OvID("BrightnessContrast"));
+        EXPECT_NE(bc, nullptr);
+        if (bc && source) bc->FindInput("Input")->ConnectTo(source->Out());
+    }
+    /// A second tool fed by the first.
+    Operator *AddAfter(Operator *upstream) {
+        Operator *next = doc.AddTool(OvID("BrightnessContrast"));
+        EXPECT_NE(next, nullptr);
+        if (next) next->FindInput("Input")->ConnectTo(upstream->FindMainOutput());
+        return next;
+    }
+};
+
+/// Renders a tool's main output without the result cache (on `device` when
+/// given; `onDevice` keeps the result there).
+Ref<Image> Render(Operator *op, const ImgRectI *roi = nullptr, uint32_t flags = 0, IDeviceContext *device = nullptr,
+                  RenderTask *task = nullptr, bool onDevice = false) {
+    RenderTask own;
+    RenderTask &t = task ? *task : own;
+    t.SetDevice(device);
+    EvalOptions opt;
+    opt.task = &t;
+    opt.flags = flags;
+    opt.useCache = false;
+    if (roi) opt.roi = ImageDomain(*roi);
+    Ref<Parameter> p =
+        onDevice ? EvaluateOnDevice(op->FindMainOutput(), 0.0, opt) : Evaluate(op->FindMainOutput(), 0.0, opt);
+    return Ref<Image>(dynamic_cast<Image *>(p.Get()));
+}
+
+/// An image of the frame size with pixels from `fill` over `window` (default:
+/// the frame) and the given canvas colour.
+Ref<Image> MakeImage(int w, int h, int depth, const std::function<FltPixel(int, int)> &fill,
+                     const ImgRectI *window = nullptr, FltPixel canvas = {}) {
+    const ImgRectI dw = window ? *window : ImgRectI(0, 0, w, h);
+    Ref<Image> img = NewImageTagList(
+        {{ImgWidth, w}, {ImgHeight, h}, {ImgDepth, depth}, {ImgDataWindow, &dw}, {ImgCanvasColor, &canvas}});
+    img->AllocScanLineData();
+    for (int y = dw.y0; y < dw.y1; ++y)
+        for (int x = dw.x0; x < dw.x1; ++x) img->PutFlt(x, y, fill(x, y));
+    return img;
+}
+
+Px ToPx(const FltPixel &p) { return {p.R, p.G, p.B, p.A}; }
+
+/// The stored 16-bit value of channel c at (x, y) (8-bit data widened by 257;
+/// a mask gives its one value for every channel).
+int64_t Stored16(const Image &img, int x, int y, int c) {
+    const int i = x - img.DataWindow().x0;
+    switch (img.Depth()) {
+    case DepthRGBAInt8: return img.Row<uint8_t>(y)[4 * i + c] * 257;
+    case DepthRGBAInt16: return img.Row<uint16_t>(y)[4 * i + c];
+    case DepthAInt8: return img.Row<uint8_t>(y)[i] * 257;
+    case DepthAInt16: return img.Row<uint16_t>(y)[i];
+    default: ADD_FAILURE() << "not an integer depth"; return 0;
+    }
+}
+
+// ---- the model ----
+
+constexpr double kEps = 1.1920929e-07;
+
+/// `x` rounded to a 32-bit float. Out of line on purpose: GCC 12 at -O2 and
+/// above drops the rounding when it packs two double -> float -> double round
+/// trips into one vector operation.
+[[gnu::noinline]] double AsFloat(double x) { return static_cast<float>(x); }
+
+/// What the model derives from the settings.
+struct Model {
+    Settings s;
+    bool on[4];
+    bool doGamma, doSat, useLowHigh;
+    double gain, exponent, finalContrast, finalScale, sat, oneMinusSat;
+    double satMat[3][3]; ///< forward: the saturation matrix; reverse: its inverse
+    bool truePower = true;
+
+    explicit Model(const Settings &st, bool fastPower = true) : s(st), truePower(fastPower) {
+        on[0] = s.red, on[1] = s.green, on[2] = s.blue, on[3] = s.alpha;
+        doGamma = std::fabs(s.gamma - 1.0) >= kEps;
+        doSat = std::fabs(1.0 - s.saturation) >= kEps;
+        useLowHigh = std::fabs(s.low) >= kEps || std::fabs(s.high - 1.0) >= kEps;
+        // The tool holds its derived values as 32-bit floats; the model rounds
+        // them the same way and does its own arithmetic in double.
+        auto f = [](double x) { return AsFloat(x); };
+        sat = f(s.saturation), oneMinusSat = f(1.0 - s.saturation);
+        const double contrast = f(s.contrast + 1.0);
+        const double range = f(s.high - s.low);
+        const double inverseRange = range >= kEps ? f(1.0 / range) : 0.0;
+        const double oneOverGamma = s.gamma < 1e-5 ? 100000.0 : 1.0 / s.gamma;
+        if (!s.reverse) {
+            gain = f(s.gain - s.lift);
+            exponent = f(oneOverGamma);
+            finalContrast = contrast;
+            finalScale = inverseRange;
+        } else {
+            gain = s.gain - s.lift == 0.0 ? 1.0 : f(1.0 / (s.gain - s.lift));
+            exponent = f(s.gamma);
+            finalContrast = contrast == 0.0 ? 1.0 : f(1.0 / contrast);
+            finalScale = range;
+        }
+        // RGB -> Y Cb Cr, chroma times the saturation, back to RGB.
+        const double toYC[3][3] = {
+            {0.299, 0.587, 0.114}, {-0.16873589, -0.33126414, 0.5}, {0.5, -0.4186876, -0.08131241}};
+        const double toRGB[3][3] = {{1.0, 0.0, 1.402}, {1.0, -0.34413627, -0.71413624}, {1.0, 1.772, 0.0}};
+        const double scale[3] = {1.0, s.saturation, s.saturation};
+        double m[3][3];
+        for (int i = 0; i < 3; ++i)
+            for (int j = 0; j < 3; ++j) {
+                m[i][j] = 0.0;
+                for (int k = 0; k < 3; ++k) m[i][j] += toRGB[i][k] * scale[k] * toYC[k][j];
+            }
+        for (int i = 0; i < 3; ++i)
+            if (!on[i])
+                for (int j = 0; j < 3; ++j) m[i][j] = i == j ? 1.0 : 0.0;
+        if (!s.reverse) {
+            for (int i = 0; i < 3; ++i)
+                for (int j = 0; j < 3; ++j) satMat[i][j] = m[i][j];
+            return;
+        }
+        // Inverse by cofactors.
+        const double det = m[0][0] * (m[1][1] * m[2][2] - m[1][2] * m[2][1]) -
+                           m[0][1] * (m[1][0] * m[2][2] - m[1][2] * m[2][0]) +
+                           m[0][2] * (m[1][0] * m[2][1] - m[1][1] * m[2][0]);
+        if (std::fabs(det) < kEps) {
+            doSat = false;
+            for (int i = 0; i < 3; ++i)
+                for (int j = 0; j < 3; ++j) satMat[i][j] = i == j ? 1.0 : 0.0;
+            return;
+        }
+        for (int i = 0; i < 3; ++i)
+            for (int j = 0; j < 3; ++j) {
+                const int r0 = (j + 1) % 3, r1 = (j + 2) % 3, c0 = (i + 1) % 3, c1 = (i + 2) % 3;
+                satMat[i][j] = (m[r0][c0] * m[r1][c1] - m[r0][c1] * m[r1][c0]) / det;
+            }
+    }
+
+    double Power(double x) const {
+        if (truePower) return std::copysign(std::pow(std::fabs(x), exponent), x);
+        return std::pow(std::max(x, 0.0), exponent); // the table reads negative values as 0
+    }
+
+    /// The float steps, one pixel.
+    Px Float(Px p) const {
+        if (s.prePost) {
+            const double k = std::fabs(p[3]) < kEps ? 0.0 : 1.0 / p[3];
+            for (int c = 0; c < 3; ++c)
+                if (on[c]) p[c] *= k;
+        }
+        if (!s.reverse) {
+            for (int c = 0; c < 4; ++c) {
+                if (!on[c]) continue;
+                double x = gain * p[c] + s.lift;
+                if (doGamma) x = Power(x);
+                p[c] = (x - 0.5) * finalContrast + 0.5 + s.brightness;
+            }
+            if (doSat) {
+                const double y = 0.299 * p[0] + 0.587 * p[1] + 0.114 * p[2];
+                for (int c = 0; c < 3; ++c)
+                    if (on[c]) p[c] = p[c] * sat + y * oneMinusSat;
+            }
+            if (useLowHigh)
+                for (int c = 0; c < 4; ++c)
+                    if (on[c]) p[c] = (p[c] - s.low) * finalScale;
+        } else {
+            if (useLowHigh)
+                for (int c = 0; c < 4; ++c)
+                    if (on[c]) p[c] = finalScale * p[c] + s.low;
+            if (doSat) {
+                const Px old = p;
+                for (int c = 0; c < 3; ++c)
+                    if (on[c]) p[c] = satMat[c][0] * old[0] + satMat[c][1] * old[1] + satMat[c][2] * old[2];
+            }
+            for (int c = 0; c < 4; ++c) {
+                if (!on[c]) continue;
+                double x = (p[c] - s.brightness - 0.5) * finalContrast + 0.5;
+                if (doGamma) x = Power(x);
+                p[c] = (x - s.lift) * gain;
+            }
+        }
+        if (s.prePost)
+            for (int c = 0; c < 3; ++c)
+                if (on[c]) p[c] *= p[3];
+        for (int c = 0; c < 4; ++c) {
+            if (on[c] && s.clipBlack && p[c] < 0.0) p[c] = 0.0;
+            if (on[c] && s.clipWhite && p[c] > 1.0) p[c] = 1.0;
+        }
+        return p;
+    }
+
+    /// The 16-bit steps, one pixel of values 0..65535.
+    std::array<int64_t, 4> Int(std::array<int64_t, 4> p) const {
+        auto clamp16 = [](double v) { return static_cast<int64_t>(std::clamp(v, 0.0, 65535.0)); };
+        auto round16 = [](double v) { return static_cast<int64_t>(std::floor(std::clamp(v, 0.0, 65535.0) + 0.5)); };
+        // Cut from the float values the tool holds.
+        const double liftI = std::trunc(AsFloat(s.lift) * 65535.0),
+                     brightI = std::trunc(AsFloat(s.brightness) * 65535.0);
+        const double lowI = std::trunc(AsFloat(s.low) * 65535.0), highI = std::trunc(AsFloat(s.high) * 65535.0);
+        const double contrastI = std::trunc(finalContrast * 16384.0);
+        const bool lowHigh = lowI != 0.0 || highI != 65535.0;
+        auto table = [&](int64_t x) { return doGamma ? round16(std::pow(x / 65535.0, exponent) * 65535.0) : x; };
+        auto contrast = [&](double d) { return std::floor(d * contrastI / 16384.0); };
+        if (s.prePost) {
+            if (p[3] == 0) {
+                for (int c = 0; c < 3; ++c)
+                    if (on[c]) p[c] = 0;
+                if (!on[3]) return p;
+            } else {
+                for (int c = 0; c < 3; ++c)
+                    if (on[c]) p[c] = std::min<int64_t>(65535, p[c] * 65535 / p[3]);
+            }
+        }
+        if (!s.reverse) {
+            for (int c = 0; c < 4; ++c) {
+                if (!on[c]) continue;
+                const int64_t x = table(clamp16(std::trunc(p[c] * gain) + liftI));
+                p[c] = clamp16(contrast(x - 32768.0) + brightI + 32768.0);
+            }
+            if (doSat) {
+                const double y = 0.299 * p[0] + 0.587 * p[1] + 0.114 * p[2];
+                for (int c = 0; c < 3; ++c)
+                    if (on[c]) p[c] = round16(p[c] * sat + y * oneMinusSat);
+            }
+            if (lowHigh)
+                for (int c = 0; c < 4; ++c)
+                    if (on[c]) p[c] = clamp16(std::trunc((p[c] - lowI) * finalScale));
+        } else {
+            if (lowHigh)
+                for (int c = 0; c < 4; ++c)
+                    if (on[c]) p[c] = clamp16(std::trunc(finalScale * p[c]) + lowI);
+            if (doSat) {
+                const auto old = p;
+                for (int c = 0; c < 3; ++c)
+                    if (on[c]) p[c] = round16(satMat[c][0] * old[0] + satMat[c][1] * old[1] + satMat[c][2] * old[2]);
+            }
+            for (int c = 0; c < 4; ++c) {
+                if (!on[c]) continue;
+                const int64_t x = table(clamp16(contrast(p[c] - brightI - 32768.0) + 32768.0));
+                p[c] = clamp16(std::trunc((x - liftI) * gain));
+            }
+        }
+        if (s.prePost)
+            for (int c = 0; c < 3; ++c)
+                if (on[c]) p[c] = static_cast<int64_t>(std::floor(p[c] * p[3] / 65535.0 + 0.5));
+        return p;
+    }
+};
+
+class BrightnessContrast : public ::testing::Test {
+protected:
+    static void SetUpTestSuite() { Orvane::Test::LoadOperators(); }
+};
+using BrightnessContrastDevice = BrightnessContrast;
 
 struct NamedSettings {
     const char *name;
     Settings s;
 };
 
+const Settings kEveryStep{.gain = 1.3,
+                          .lift = 0.05,
+                          .gamma = 1.4,
+                          .contrast = 0.25,
+                          .brightness = 0.05,
+                          .saturation = 0.6,
+                          .low = 0.05,
+                          .high = 0.9};
+const Settings kBlueAndAlpha{
+    .gain = 0.8, .gamma = 0.7, .contrast = -0.3, .saturation = 1.5, .high = 0.7, .green = false, .alpha = true};
 // Settings that cover each step alone and together. The ones without gamma or
 // pre-divide take the matrix route (and on float only without clipping).
 const NamedSettings kSettings[] = {
@@ -33,17 +355,8 @@ const NamedSettings kSettings[] = {
     {"saturation", {.saturation = 0.3}},
     {"saturation, green off", {.saturation = 1.8, .green = false}},
     {"low and high", {.low = 0.1, .high = 0.8}},
-    {"every step",
-     {.gain = 1.3,
-      .lift = 0.05,
-      .gamma = 1.4,
-      .contrast = 0.25,
-      .brightness = 0.05,
-      .saturation = 0.6,
-      .low = 0.05,
-      .high = 0.9}},
-    {"every step, blue and alpha",
-     {.gain = 0.8, .gamma = 0.7, .contrast = -0.3, .saturation = 1.5, .high = 0.7, .green = false, .alpha = true}},
+    {"every step", kEveryStep},
+    {"every step, blue and alpha", kBlueAndAlpha},
     {"pre-divide", {.gain = 1.2, .gamma = 1.3, .saturation = 0.5, .prePost = true}},
     {"pre-divide, alpha processed", {.gain = 1.1, .lift = 0.02, .gamma = 0.8, .alpha = true, .prePost = true}},
     {"clip both", {.gain = 1.5, .lift = -0.2, .clipBlack = true, .clipWhite = true}},
@@ -111,7 +424,7 @@ void ExpectModel(const Model &model, const Image &in, const Image &out, const st
     EXPECT_EQ(failures, 0) << what << " (worst error " << worst << " of the tolerance)";
 }
 
-TEST_F(BrightnessContrastValues, MatchesModelOnEveryDepthAndRowFunction) {
+TEST_F(BrightnessContrast, MatchesModelOnEveryDepthAndRowFunction) {
     struct Mode {
         const char *name;
         bool fastPower, vectorRows;
@@ -139,46 +452,7 @@ TEST_F(BrightnessContrastValues, MatchesModelOnEveryDepthAndRowFunction) {
     }
 }
 
-TEST_F(BrightnessContrastValues, MatrixAndRowRoutesAgree) {
-    // A gamma a hair away from 1 sends the same linear settings down the row
-    // route; its effect is far below the tolerance.
-    const Settings linear[] = {
-        {.gain = 1.7, .lift = 0.1},
-        {.contrast = 0.4, .brightness = -0.1, .saturation = 0.3},
-        {.gain = 0.9, .saturation = 1.8, .low = 0.1, .high = 0.8, .green = false, .alpha = true},
-        {.gain = 1.5, .lift = -0.2, .clipBlack = true, .clipWhite = true}, // rows on float, matrix on integer
-    };
-    for (int depth : {DepthRGBAFlt32, DepthRGBAFlt16, DepthRGBAInt16}) {
-        // The 16-bit steps clamp after each step where the matrix clamps once,
-        // so on integer the values stay where no step leaves 0..1.
-        Ref<Image> src = depth != DepthRGBAInt16 ? Orvane::Test::PatternImage(29, 13, depth, 3)
-                                                 : MakeImage(29, 13, depth, [](int x, int y) {
-                                                       const float t = static_cast<float>((x * 7 + y * 3) % 16) / 100.f;
-                                                       return FltPixel{0.4f + t, 0.55f - t, 0.45f + t / 2, 0.5f + t};
-                                                   });
-        Rig rig(src);
-        for (const Settings &base : linear)
-            for (const Settings &s : {base, Reversed(base)}) {
-                Apply(rig.bc, s);
-                Ref<Image> viaMatrix = Render(rig.bc);
-                Orvane::Test::SetNumber(rig.bc, "Gamma", 1.0 + 4e-7);
-                Ref<Image> viaRows = Render(rig.bc);
-                ASSERT_TRUE(viaMatrix && viaRows);
-                const ImgRectI dw = src->DataWindow();
-                double worst = 0.0;
-                for (int y = dw.y0; y < dw.y1; ++y)
-                    for (int x = dw.x0; x < dw.x1; ++x) {
-                        const Px a = ToPx(viaMatrix->GetFlt(x, y)), b = ToPx(viaRows->GetFlt(x, y));
-                        for (int c = 0; c < 4; ++c)
-                            worst = std::max(worst, std::fabs(a[c] - b[c]) / (1 + std::fabs(a[c])));
-                    }
-                const double tol = depth == DepthRGBAFlt32 ? 2e-5 : depth == DepthRGBAFlt16 ? 1e-3 : 5.0 / 65535.0;
-                EXPECT_LE(worst, tol) << "depth " << depth << (s.reverse ? " reverse" : " forward");
-            }
-    }
-}
-
-TEST_F(BrightnessContrastValues, ReverseUndoesForward) {
+TEST_F(BrightnessContrast, ReverseUndoesForward) {
     const Settings invertible[] = {
         {.gain = 1.7, .lift = 0.1},
         {.gamma = 1.6},
@@ -216,80 +490,40 @@ TEST_F(BrightnessContrastValues, ReverseUndoesForward) {
     }
 }
 
-TEST_F(BrightnessContrastValues, EdgeSettings) {
+TEST_F(BrightnessContrast, EdgeSettings) {
     struct Edge {
         const char *name;
-        Settings s;
-        FltPixel in;
+        FltPixel in, expected;
         bool fastPower;
-        FltPixel expected;
+        Settings s;
     };
     // 0.99999 to the power 100000: about 1/e, where a larger exponent gives 0.
     const float kNearOne = static_cast<float>(std::pow(static_cast<double>(0.99999f), 100000.0));
+    const FltPixel a{0.5f, 0.99999f, 1.0f, 0.3f}, b{0.1f, 0.5f, 1.9f, 0.7f}, c{1.f, 0.25f, -0.5f, 1.f};
+    const FltPixel tiny{1e-8f, 1e-8f, 1e-8f, 1e-8f}, signs{-0.5f, 0.5f, -2.f, 1.f};
+    const Settings alphaOnly{.gain = 2, .saturation = 0.3, .red = false, .green = false, .blue = false, .alpha = true};
+    const Settings contrastBack{.contrast = -1, .brightness = 0.1, .reverse = true};
+    const Settings tinyAlpha{.gain = 2.0, .lift = 0.5, .alpha = true, .prePost = true};
     const Edge edges[] = {
-        {"alpha only: saturation leaves alpha alone",
-         {.gain = 2.0, .saturation = 0.3, .red = false, .green = false, .blue = false, .alpha = true},
-         {0.2f, 0.4f, 0.6f, 0.5f},
-         true,
-         {0.2f, 0.4f, 0.6f, 1.0f}},
-        {"gamma 0 forward: exponent 100000",
-         {.gamma = 0.0},
-         {0.5f, 0.99999f, 1.0f, 0.3f},
-         true,
-         {0.f, kNearOne, 1.f, 0.3f}},
-        {"gamma 0 forward, table", {.gamma = 0.0}, {0.5f, 0.99999f, 1.0f, 0.3f}, false, {0.f, kNearOne, 1.f, 0.3f}},
-        {"high equals low forward", {.low = 0.4, .high = 0.4}, {0.1f, 0.5f, 0.9f, 0.7f}, true, {0.f, 0.f, 0.f, 0.7f}},
-        {"high equals low reverse",
-         {.low = 0.4, .high = 0.4, .reverse = true},
-         {0.1f, 0.5f, 0.9f, 0.7f},
-         true,
-         {0.4f, 0.4f, 0.4f, 0.7f}},
-        {"gain equals lift forward",
-         {.gain = 0.3, .lift = 0.3},
-         {0.1f, 0.5f, 1.9f, 0.7f},
-         true,
-         {0.3f, 0.3f, 0.3f, 0.7f}},
-        {"gain equals lift reverse: gain 1",
-         {.gain = 0.3, .lift = 0.3, .reverse = true},
-         {0.1f, 0.5f, 1.9f, 0.7f},
-         true,
-         {-0.2f, 0.2f, 1.6f, 0.7f}},
-        {"contrast -1 forward",
-         {.contrast = -1.0, .brightness = 0.1},
-         {0.1f, 0.5f, 1.9f, 0.7f},
-         true,
-         {0.6f, 0.6f, 0.6f, 0.7f}},
-        {"contrast -1 reverse: contrast 1",
-         {.contrast = -1.0, .brightness = 0.1, .reverse = true},
-         {0.1f, 0.5f, 1.9f, 0.7f},
-         true,
-         {0.0f, 0.4f, 1.8f, 0.7f}},
-        {"pre-divide with alpha 0",
-         {.gain = 2.0, .lift = 0.1, .gamma = 1.2, .prePost = true},
-         {0.3f, 0.5f, 0.7f, 0.0f},
-         true,
-         {0.f, 0.f, 0.f, 0.f}},
-        {"pre-divide with alpha below eps",
-         {.gain = 2.0, .lift = 0.1, .prePost = true},
-         {1e-8f, 1e-8f, 1e-8f, 1e-8f},
-         true,
-         {0.f, 0.f, 0.f, 1e-8f}},
+        {"alpha only: saturation leaves alpha", {0.2f, 0.4f, 0.6f, 0.5f}, {0.2f, 0.4f, 0.6f, 1.f}, true, alphaOnly},
+        {"gamma 0 forward: exponent 100000", a, {0.f, kNearOne, 1.f, 0.3f}, true, {.gamma = 0.0}},
+        {"gamma 0 forward, table", a, {0.f, kNearOne, 1.f, 0.3f}, false, {.gamma = 0.0}},
+        {"high equals low forward", b, {0.f, 0.f, 0.f, 0.7f}, true, {.low = 0.4, .high = 0.4}},
+        {"high equals low reverse", b, {0.4f, 0.4f, 0.4f, 0.7f}, true, {.low = 0.4, .high = 0.4, .reverse = true}},
+        {"gain equals lift forward", b, {0.3f, 0.3f, 0.3f, 0.7f}, true, {.gain = 0.3, .lift = 0.3}},
+        {"gain = lift reverse: 1", b, {-0.2f, 0.2f, 1.6f, 0.7f}, true, {.gain = 0.3, .lift = 0.3, .reverse = true}},
+        {"contrast -1 forward", b, {0.6f, 0.6f, 0.6f, 0.7f}, true, {.contrast = -1.0, .brightness = 0.1}},
+        {"contrast -1 reverse: 1", b, {0.f, 0.4f, 1.8f, 0.7f}, true, contrastBack},
+        {"pre-divide, alpha 0", {.3f, .5f, .7f, 0}, {}, true, {.gain = 2, .lift = .1, .gamma = 1.2, .prePost = true}},
+        {"pre-divide, alpha below eps", tiny, {0.f, 0.f, 0.f, 1e-8f}, true, {.gain = 2, .lift = 0.1, .prePost = true}},
         // Processed alpha grows from the lift, so the colours show that they
         // started from 0: lift times the new alpha.
-        {"pre-divide with alpha below eps, alpha processed",
-         {.gain = 2.0, .lift = 0.5, .alpha = true, .prePost = true},
-         {1e-8f, 1e-8f, 1e-8f, 1e-8f},
-         true,
-         {0.25f, 0.25f, 0.25f, 0.5f}},
-        {"negative stays negative with true powers",
-         {.gamma = 0.5},
-         {-0.5f, 0.5f, -2.f, 1.f},
-         true,
-         {-0.25f, 0.25f, -4.f, 1.f}},
-        {"negative reads as 0 from the table", {.gamma = 0.5}, {-0.5f, 0.5f, -2.f, 1.f}, false, {0.f, 0.25f, 0.f, 1.f}},
-        {"clip white", {.gain = 2.0, .clipWhite = true}, {1.f, 0.25f, -0.5f, 1.f}, true, {1.f, 0.5f, -1.f, 1.f}},
-        {"no clip: float has no ceiling", {.gain = 2.0}, {1.f, 0.25f, -0.5f, 1.f}, true, {2.f, 0.5f, -1.f, 1.f}},
-        {"clip black", {.gain = 2.0, .clipBlack = true}, {1.f, 0.25f, -0.5f, 1.f}, true, {2.f, 0.5f, 0.f, 1.f}},
+        {"pre-divide, alpha below eps, processed", tiny, {0.25f, 0.25f, 0.25f, 0.5f}, true, tinyAlpha},
+        {"negative stays negative with true powers", signs, {-0.25f, 0.25f, -4.f, 1.f}, true, {.gamma = 0.5}},
+        {"negative reads as 0 from the table", signs, {0.f, 0.25f, 0.f, 1.f}, false, {.gamma = 0.5}},
+        {"clip white", c, {1.f, 0.5f, -1.f, 1.f}, true, {.gain = 2.0, .clipWhite = true}},
+        {"no clip: float has no ceiling", c, {2.f, 0.5f, -1.f, 1.f}, true, {.gain = 2.0}},
+        {"clip black", c, {2.f, 0.5f, 0.f, 1.f}, true, {.gain = 2.0, .clipBlack = true}},
     };
     for (const Edge &e : edges) {
         AppSwitches switches(e.fastPower, true);
@@ -303,29 +537,358 @@ TEST_F(BrightnessContrastValues, EdgeSettings) {
     }
 }
 
-TEST_F(BrightnessContrastValues, VectorAndGeneralRowsGiveTheSameBits) {
-    const Settings s{.gain = 1.3, .lift = 0.05, .gamma = 1.4, .contrast = 0.25, .saturation = 0.6, .prePost = true};
-    for (int depth : {DepthRGBAFlt32, DepthRGBAFlt16})
-        for (bool reverse : {false, true}) {
-            Ref<Image> src = Orvane::Test::PatternImage(41, 7, depth, 11);
-            Rig rig(src);
-            Settings t = s;
-            t.reverse = reverse;
-            Apply(rig.bc, t);
-            Ref<Image> vectorOut, generalOut;
-            {
-                AppSwitches on(true, true);
-                vectorOut = Render(rig.bc);
+TEST_F(BrightnessContrast, DefaultsAndHardLimits) {
+    OrvaneDoc doc;
+    Operator *bc = doc.AddTool(OvID("BrightnessContrast"));
+    ASSERT_NE(bc, nullptr);
+    for (const auto &[id, value] : Values(Settings{}))
+        EXPECT_EQ(dynamic_cast<const Number &>(*bc->FindInput(id)->Default()).value, value) << id;
+    // Typed values below the hard limits are raised; there is no upper one.
+    auto value = [&](const char *id) { return dynamic_cast<const Number &>(*bc->FindInput(id)->Constant()).value; };
+    for (const auto &[id, low] : {std::pair{"Gamma", 0.0}, {"Contrast", -1.0}, {"Saturation", 0.0}}) {
+        Orvane::Test::SetNumber(bc, id, low - 3);
+        EXPECT_EQ(value(id), low) << id;
+    }
+    Orvane::Test::SetNumber(bc, "Gain", 7.5);
+    EXPECT_EQ(value("Gain"), 7.5);
+}
+
+TEST_F(BrightnessContrast, NothingToDoPassesTheSameImageAndPreCalculationMakesNoPixels) {
+    struct Case {
+        const char *name;
+        int depth;
+        bool passes;
+        Settings s;
+    };
+    const Settings noChannel{.gain = 2.0, .gamma = 2.0, .red = false, .green = false, .blue = false};
+    const Settings alphaGain{.gain = 2.0, .red = false, .green = false, .blue = false, .alpha = true};
+    const Case cases[] = {
+        {"defaults, float", DepthRGBAFlt32, true, {}},
+        {"defaults, 16-bit", DepthRGBAInt16, true, {}},
+        {"defaults, mask", DepthAFlt32, true, {}},
+        {"no channel chosen", DepthRGBAFlt32, true, noChannel},
+        {"gain within eps of 1", DepthRGBAFlt32, true, {.gain = 1.0 + 5e-8}},
+        {"clip on integer", DepthRGBAInt16, true, {.clipBlack = true, .clipWhite = true}},
+        {"clip on float", DepthRGBAFlt32, false, {.clipWhite = true}},
+        {"brightness under one 16-bit step", DepthRGBAInt8, true, {.brightness = 1e-6}},
+        {"the same brightness on float", DepthRGBAFlt16, false, {.brightness = 1e-6}},
+        {"low under one 16-bit step", DepthRGBAInt16, true, {.low = 1e-5}},
+        {"the same low on float", DepthRGBAFlt32, false, {.low = 1e-5}},
+        {"high a hair below 1 cuts to 65534", DepthRGBAInt16, false, {.high = 1.0 - 1e-6}},
+        {"reverse defaults", DepthRGBAFlt32, true, {.reverse = true}},
+        {"pre-divide alone", DepthRGBAInt16, false, {.prePost = true}},
+        {"alpha only, gain", DepthRGBAFlt32, false, alphaGain},
+        {"matrix route", DepthRGBAFlt32, false, {.gain = 1.2, .brightness = 0.1}},
+        {"row route", DepthRGBAFlt32, false, {.gamma = 1.3, .prePost = true}},
+    };
+    const ImgRectI outside(100, 100, 120, 110); // beyond the frame and the data
+    for (const Case &c : cases) {
+        SCOPED_TRACE(c.name);
+        Ref<Image> src = Orvane::Test::PatternImage(8, 4, c.depth);
+        Rig rig(src);
+        Apply(rig.bc, c.s);
+        Ref<Image> shape = Render(rig.bc, nullptr, ReqFlagPreCalc);
+        ASSERT_TRUE(shape);
+        EXPECT_TRUE(shape->IsNoData() && !shape->HasScanLineData());
+        EXPECT_EQ(shape->DataWindow(), ImgRectI(0, 0, 8, 4));
+        EXPECT_EQ(shape->Depth(), c.depth);
+        EXPECT_EQ(rig.source->processCount, 0) << "pre-calculation asked the source for pixels";
+        Ref<Image> out = Render(rig.bc);
+        ASSERT_TRUE(out);
+        EXPECT_EQ(out.Get() == src.Get(), c.passes);
+        if (c.passes) continue;
+        Ref<Image> none = Render(rig.bc, &outside);
+        ASSERT_TRUE(none);
+        EXPECT_TRUE(none->DataWindow().IsNull() && none->ValidWindow().IsNull());
+    }
+}
+
+TEST_F(BrightnessContrast, CanvasBeyondTheDataWindowAndRegionsUnderEachClippingMode) {
+    const ImgRectI inWindow(8, 4, 40, 28);
+    const FltPixel canvas{0.2f, 0.4f, 0.6f, 0.8f};
+    struct Route {
+        const char *name;
+        Settings s;
+        bool rows;
+    };
+    const Route routes[] = {{"matrix", {.gain = 1.2, .brightness = 0.1, .saturation = 0.7, .alpha = true}, false},
+                            {"rows", {.gain = 1.2, .gamma = 1.5, .saturation = 0.7, .alpha = true}, true},
+                            {"rows, reverse", {.gain = 1.2, .gamma = 1.5, .reverse = true}, true}};
+    struct Clip {
+        const char *mode;
+        ImgRectI window;
+        bool keepsInputCanvas;
+    };
+    const Clip clips[] = {{"ClippingMode_None", inWindow, false},
+                          {"ClippingMode_Domain", inWindow, true},
+                          {"ClippingMode_Frame", ImgRectI(0, 0, 48, 32), true}};
+    auto fill = [](int x, int y) { return FltPixel{x / 48.f, y / 32.f, (x ^ y) / 64.f, 0.75f}; };
+    for (int depth : {DepthRGBAFlt32, DepthRGBAFlt16, DepthRGBAInt16})
+        for (const Route &route : routes)
+            for (const Clip &clip : clips) {
+                SCOPED_TRACE(std::string(route.name) + ", " + clip.mode + ", depth " + std::to_string(depth));
+                Ref<Image> src = MakeImage(48, 32, depth, fill, &inWindow, canvas);
+                Rig rig(src);
+                Apply(rig.bc, route.s);
+                Orvane::Test::SetID(rig.bc, "ClippingMode", clip.mode);
+                const Model model(route.s);
+                // Integer rows take the 16-bit steps, which clamp between
+                // steps; everything else follows the float steps.
+                const bool integer = depth == DepthRGBAInt16;
+                auto expectedOf = [&](const Px &in) {
+                    if (!integer) return model.Float(in);
+                    Px out = model.Float(in);
+                    std::array<int64_t, 4> p;
+                    for (int c = 0; c < 4; ++c) p[c] = static_cast<int64_t>(in[c] * 65535.0 + 0.5);
+                    const auto r = model.Int(p);
+                    for (int c = 0; c < 4; ++c) out[c] = route.rows ? r[c] / 65535.0 : std::clamp(out[c], 0.0, 1.0);
+                    return out;
+                };
+                // Stored pixels clamp on integer; the matrix's canvas colour does not.
+                const Px storedCanvas = expectedOf(ToPx(src->GetCanvasColor()));
+                const Px processedCanvas =
+                    integer && !route.rows ? model.Float(ToPx(src->GetCanvasColor())) : storedCanvas;
+                const double tol = depth == DepthRGBAFlt32 ? 1e-5 : integer ? 4.0 / 65535 : 1e-3;
+                for (uint32_t flags : {0u, ReqFlagPreCalc}) {
+                    Ref<Image> out = Render(rig.bc, nullptr, flags);
+                    ASSERT_TRUE(out);
+                    EXPECT_EQ(out->DataWindow(), clip.window);
+                    EXPECT_EQ(out->IsNoData(), flags != 0);
+                    const Px outCanvas = ToPx(out->GetCanvasColor());
+                    for (int c = 0; c < 4; ++c)
+                        EXPECT_NEAR(outCanvas[c], clip.keepsInputCanvas ? ToPx(canvas)[c] : processedCanvas[c],
+                                    clip.keepsInputCanvas ? 0.0 : tol);
+                    if (flags) continue;
+                    // Rows and columns beyond the input's window hold the
+                    // processed canvas; inside, the processed pixels.
+                    int mismatches = 0;
+                    for (int y = clip.window.y0; y < clip.window.y1; ++y)
+                        for (int x = clip.window.x0; x < clip.window.x1; ++x) {
+                            const Px got = ToPx(out->GetFlt(x, y));
+                            const Px want =
+                                inWindow.Contains(x, y) ? expectedOf(ToPx(src->GetFlt(x, y))) : storedCanvas;
+                            for (int c = 0; c < 4; ++c) {
+                                const double t = integer ? tol : tol * (1 + std::fabs(want[c]));
+                                if (std::fabs(got[c] - want[c]) > t && ++mismatches <= 3)
+                                    ADD_FAILURE() << "at (" << x << ", " << y << ") channel " << c << ": got " << got[c]
+                                                  << ", expected " << want[c];
+                            }
+                        }
+                    EXPECT_EQ(mismatches, 0);
+                    // A region of interest is the crop of the full render, beyond the data and the frame too.
+                    for (const ImgRectI &roi :
+                         {ImgRectI(5, 7, 30, 20), ImgRectI(0, 0, 10, 5), ImgRectI(38, 25, 60, 40)}) {
+                        Ref<Image> part = Render(rig.bc, &roi);
+                        ASSERT_TRUE(part);
+                        const ImgRectI expected = out->DataWindow() & roi;
+                        EXPECT_EQ(part->DataWindow(), expected);
+                        EXPECT_EQ(part->ValidWindow(), expected);
+                        EXPECT_EQ(part->GetCanvasColor(), out->GetCanvasColor());
+                        for (int y = expected.y0; y < expected.y1; ++y)
+                            EXPECT_EQ(std::memcmp(part->PixelAddress(expected.x0, y), out->PixelAddress(expected.x0, y),
+                                                  static_cast<size_t>(expected.Width()) * part->BytesPerPixel()),
+                                      0)
+                                << "row " << y;
+                    }
+                }
             }
-            {
-                AppSwitches off(true, false);
-                generalOut = Render(rig.bc);
-            }
-            ASSERT_TRUE(vectorOut && generalOut);
-            for (int y = 0; y < 7; ++y)
-                EXPECT_EQ(std::memcmp(vectorOut->ScanLine(y), generalOut->ScanLine(y), vectorOut->RowBytes()), 0)
-                    << "depth " << depth << " row " << y;
+}
+
+TEST_F(BrightnessContrast, SameBitsWithOneWorkerOrManyAndEitherRowFunction) {
+    const int before = WorkerCount();
+    const Settings settings[] = {{.gain = 1.2, .brightness = 0.1, .saturation = 0.8},
+                                 {.gain = 1.1, .gamma = 1.3, .saturation = 0.8, .prePost = true},
+                                 {.gamma = 0.7, .low = 0.1, .reverse = true}};
+    auto expectSame = [](const Ref<Image> &a, const Ref<Image> &b, const std::string &what) {
+        ASSERT_TRUE(a && b && a.Get() != b.Get()) << what;
+        for (int y = 0; y < a->Height(); ++y)
+            ASSERT_EQ(std::memcmp(a->ScanLine(y), b->ScanLine(y), a->RowBytes()), 0) << what << " row " << y;
+    };
+    for (int depth : {DepthRGBAFlt32, DepthRGBAFlt16, DepthRGBAInt8})
+        for (const Settings &s : settings) {
+            Rig rig(Orvane::Test::PatternImage(300, 270, depth, 5));
+            Apply(rig.bc, s);
+            AppSwitches vector(true, true);
+            SetWorkerCount(1);
+            Ref<Image> one = Render(rig.bc);
+            SetWorkerCount(std::max(2, before));
+            Ref<Image> many = Render(rig.bc);
+            SetWorkerCount(before);
+            expectSame(one, many, "workers, depth " + std::to_string(depth));
+            if (depth == DepthRGBAInt8) continue;
+            // The vector rows and the general ones give the same bits.
+            AppSwitches general(true, false);
+            expectSame(many, Render(rig.bc), "row functions, depth " + std::to_string(depth));
         }
+    EXPECT_EQ(WorkerCount(), before);
+}
+
+// ---- on the device ----
+
+/// A source whose data window is offset from the frame on every side.
+Ref<Image> OddSource(int depth) {
+    const ImgRectI dw(-3, 5, 50, 38);
+    Ref<Image> img = Test::PatternImage(64, 40, depth, 5)->CopyOfImageTagList({{ImgDataWindow, &dw}});
+    img->SetCanvasColor(FltPixel{0.2f, -0.1f, 0.6f, 0.5f});
+    return img;
+}
+
+/// Largest difference over the data window and the canvas, relative to the
+/// value's size above 1.
+double MaxDifference(const Image &a, const Image &b) {
+    EXPECT_EQ(a.DataWindow(), b.DataWindow());
+    double worst = 0;
+    auto diff = [&](const FltPixel &p, const FltPixel &q) {
+        const Px x = ToPx(p), y = ToPx(q);
+        for (int c = 0; c < 4; ++c)
+            if (!std::isnan(x[c]) || !std::isnan(y[c]))
+                worst = std::max(worst, std::fabs(x[c] - y[c]) / std::max(1.0, std::fabs(y[c])));
+    };
+    diff(a.GetCanvasColor(), b.GetCanvasColor());
+    const ImgRectI dw = a.DataWindow();
+    for (int y = dw.y0; y < dw.y1; ++y)
+        for (int x = dw.x0; x < dw.x1; ++x) diff(a.GetFlt(x, y), b.GetFlt(x, y));
+    return worst;
+}
+
+TEST_F(BrightnessContrastDevice, MatchesTheRowsOverControlsDirectionsAndDepths) {
+    ORVANE_NEED_OPENCL(ctx);
+    const std::pair<const char *, Settings> cases[] = {
+        {"gain, lift, gamma", {.gain = 1.3, .lift = 0.05, .gamma = 0.7}},
+        {"contrast, brightness, saturation, clips",
+         {.contrast = 0.4, .brightness = -0.1, .saturation = 1.6, .clipBlack = true, .clipWhite = true}},
+        {"pre-divide, low/high", {.gain = 0.8, .low = 0.1, .high = 0.9, .prePost = true}},
+        {"pre-divide, clip white, low",
+         {.gain = 1.3, .contrast = 0.2, .saturation = 0.6, .low = 0.05, .clipWhite = true, .prePost = true}},
+        {"alpha only, high equals low",
+         {.gamma = 1.8, .saturation = 0.3, .low = 0.2, .high = 0.2, .red = false, .alpha = true}},
+        {"gain equals lift, contrast -1, gamma 0", {.gain = 2, .lift = 2, .gamma = 0, .contrast = -1}},
+        {"gamma 2.2, no saturation", {.gamma = 2.2, .saturation = 0}},
+        {"linear chain (one matrix)", {.gain = 1.2, .brightness = 0.1, .saturation = 1.4, .alpha = true}},
+    };
+    // Float results agree to float rounding of the power (the device's powf
+    // against the host's); integers to one 16-bit step through the gamma
+    // table and the fixed point contrast, four for 8 bits.
+    const std::map<int, double> tolerance = {{DepthRGBAFlt32, 2e-5},        {DepthRGBAFlt16, 1e-3},
+                                             {DepthRGBAInt16, 3.1 / 65535}, {DepthRGBAInt8, 1.01 / 255},
+                                             {DepthAFlt32, 2e-5},           {DepthAInt16, 3.1 / 65535}};
+    const ImgRectI roi(12, 2, 61, 33);
+    for (const auto &[name, settings] : cases)
+        for (bool reverse : {false, true})
+            for (const auto &[depth, tol] : tolerance) {
+                SCOPED_TRACE(std::string(name) + (reverse ? " reverse" : " forward") + " depth " +
+                             std::to_string(depth));
+                Rig rig(OddSource(depth));
+                Settings s = settings;
+                s.reverse = reverse;
+                Apply(rig.bc, s);
+                Ref<Image> cpu = Render(rig.bc, &roi);
+                const int launches = ctx->LaunchCount();
+                RenderTask task;
+                Ref<Image> dev = Render(rig.bc, &roi, 0, ctx, &task);
+                ASSERT_TRUE(cpu && dev);
+                EXPECT_GT(ctx->LaunchCount(), launches) << "the device ran";
+                EXPECT_TRUE(task.DeviceLog().empty()) << task.DeviceLog().front();
+                // Without a gamma the float results are the rows' bits.
+                EXPECT_LE(MaxDifference(*dev, *cpu), depth == DepthRGBAFlt32 && s.gamma == 1.0 ? 0.0 : tol);
+            }
+}
+
+TEST_F(BrightnessContrastDevice, InputsAreUploadedAndResultsStayStaleUntilDownloaded) {
+    ORVANE_NEED_OPENCL(ctx);
+    Ref<Image> src = OddSource(DepthRGBAFlt32);
+    Rig rig(src);
+    Apply(rig.bc, {.gain = 1.1, .gamma = 1.5});
+    // A pre-calculation never reaches the device.
+    const int launches = ctx->LaunchCount();
+    Ref<Image> shape = Render(rig.bc, nullptr, ReqFlagPreCalc, ctx);
+    ASSERT_TRUE(shape);
+    EXPECT_TRUE(shape->IsNoData());
+    EXPECT_FALSE(shape->GetGPUMem());
+    EXPECT_EQ(ctx->LaunchCount(), launches);
+
+    EXPECT_FALSE(src->GetGPUMem());
+    Ref<Image> dev = Render(rig.bc, nullptr, 0, ctx, nullptr, /*onDevice=*/true);
+    ASSERT_TRUE(dev);
+    EXPECT_EQ(ctx->LaunchCount(), launches + 1);
+    // The CPU-made input was uploaded when its device image was made, and keeps it.
+    ASSERT_TRUE(src->GetGPUMem());
+    EXPECT_FALSE(src->IsGPUMemDirty());
+    // The result lives on the device; main memory has nothing yet.
+    EXPECT_TRUE(dev->IsGPUMemDirty());
+    EXPECT_FALSE(dev->HasScanLineData());
+    ASSERT_TRUE(dev->DownloadGPUMem());
+    EXPECT_LE(MaxDifference(*dev, *Render(rig.bc)), 2e-5);
+}
+
+TEST_F(BrightnessContrastDevice, AChainStaysOnTheDevice) {
+    ORVANE_NEED_OPENCL(ctx);
+    Rig rig(OddSource(DepthRGBAFlt32));
+    Operator *second = rig.AddAfter(rig.bc);
+    Apply(rig.bc, {.gamma = 1.5});
+    Apply(second, {.gamma = 1.5, .reverse = true});
+    RenderTask task;
+    task.SetDevice(ctx);
+    EvalOptions opt;
+    opt.task = &task;
+    Ref<Parameter> middle = EvaluateOnDevice(rig.bc->FindMainOutput(), 0.0, opt); // cached for the next request
+    auto *mid = dynamic_cast<Image *>(middle.Get());
+    ASSERT_TRUE(mid && mid->IsGPUMemDirty());
+    Ref<Parameter> last = Evaluate(second->FindMainOutput(), 0.0, opt);
+    ASSERT_TRUE(last);
+    // The second tool read the first one's image on the device: it never came back.
+    EXPECT_FALSE(mid->HasScanLineData());
+    // Forward then reverse with the same settings: the input again.
+    EXPECT_LE(MaxDifference(*dynamic_cast<Image *>(last.Get()), *OddSource(DepthRGBAFlt32)), 1e-4);
+}
+
+/// A device that refuses to compile anything.
+class RefusingDevice final : public IDeviceContext {
+    struct Memory final : IDeviceMemory {
+        Memory(IDeviceContext *c, size_t n) : IDeviceMemory(c, n), bytes(n) {}
+        std::vector<uint8_t> bytes;
+    };
+
+public:
+    DeviceBackend Backend() const override { return DeviceBackend::OpenCL; }
+    std::string DeviceName() const override { return "refusing"; }
+    std::string DriverKey() const override { return "refusing"; }
+    std::shared_ptr<IDeviceMemory> Allocate(size_t n, std::string *) override {
+        return std::make_shared<Memory>(this, n);
+    }
+    bool Write(IDeviceMemory &m, size_t at, const void *data, size_t n, std::string *) override {
+        std::memcpy(static_cast<Memory &>(m).bytes.data() + at, data, n);
+        return true;
+    }
+    bool Read(const IDeviceMemory &m, size_t at, void *data, size_t n, std::string *) override {
+        std::memcpy(data, static_cast<const Memory &>(m).bytes.data() + at, n);
+        return true;
+    }
+
+protected:
+    std::shared_ptr<IDeviceKernel> Build(const std::string &, const std::string &, std::vector<KernelParamDecl>,
+                                         std::string *log) override {
+        *log = "refused";
+        return nullptr;
+    }
+    bool DoLaunch(const IDeviceKernel &, const std::vector<KernelArgument> &, int, int, std::string *) override {
+        return false;
+    }
+};
+
+TEST_F(BrightnessContrastDevice, AFailingDeviceGivesTheRowsResult) {
+    RefusingDevice refusing;
+    for (const Settings &s : {Settings{.gamma = 1.7, .saturation = 1.2}, Settings{.gain = 1.5}}) {
+        Rig rig(OddSource(DepthRGBAFlt32));
+        Apply(rig.bc, s);
+        Ref<Image> cpu = Render(rig.bc);
+        RenderTask task;
+        Ref<Image> fallback = Render(rig.bc, nullptr, 0, &refusing, &task);
+        ASSERT_TRUE(cpu && fallback);
+        EXPECT_EQ(MaxDifference(*fallback, *cpu), 0.0);
+        ASSERT_EQ(task.DeviceLog().size(), 1u);
+        EXPECT_NE(task.DeviceLog()[0].find("refused"), std::string::npos) << task.DeviceLog()[0];
+    }
 }
 
 } // namespace

@@ -1,23 +1,123 @@
-// Background: registration, panel, ramps on every depth, and its frame.
+// Background: ramps on every depth against the formula and the fixed point
+// steps worked out here; Gradient mode's six shapes, offset, repeat modes and
+// sub-pixel sampling (the mean of the samples' colours) against positions
+// worked out here in double, interpolation spaces, premultiplication, integer
+// clamping, fast previews and masks; the frame (opacity, windows, regions,
+// proxies, fields); and the device against the rows and the device geometry.
 #include <gtest/gtest.h>
 
 #include <algorithm>
 #include <cmath>
+#include <cstdint>
 #include <cstring>
 #include <string>
-#include <tuple>
 #include <vector>
 
-#include "host/core/Registry.h"
+#include "host/color/ColorSpace.h"
 #include "host/core/Tags.h"
-#include "tests/operators/generate/BackgroundTestSupport.h"
+#include "host/flow/DataTypes.h"
+#include "host/flow/Engine.h"
+#include "host/flow/Gradient.h"
+#include "host/flow/Operator.h"
+#include "host/flow/OrvaneDoc.h"
+#include "host/flow/RenderTask.h"
+#include "host/flow/Request.h"
+#include "host/image/Image.h"
+#include "host/image/PixelConvert.h"
+#include "host/krom/GPUMemory.h"
+#include "tests/host/krom/DeviceTestSupport.h"
+#include "tests/support/TestSupport.h"
 
 namespace Orvane::BgTest {
 namespace {
+// Inside a test body `Test` names the framework's class, so the shared
+// helpers are brought in by name.
+using Orvane::Test::EvalImage;
+using Orvane::Test::LoadOperators;
+using Orvane::Test::SetID;
+using Orvane::Test::SetNumber;
+using Orvane::Test::SetNumbers;
+using Orvane::Test::SetPoint;
 
-using BackgroundControls = BackgroundSuite;
+/// Loads the tool library once for the whole suite.
+class BackgroundSuite : public ::testing::Test {
+protected:
+    static void SetUpTestSuite() { LoadOperators(); }
+    void SetUp() override {
+        bg = doc.AddTool(OvID("Background"));
+        ASSERT_NE(bg, nullptr);
+    }
+    /// Frame size and Type in one go.
+    void Frame(int w, int h, const char *type) {
+        SetNumber(bg, "Width", w);
+        SetNumber(bg, "Height", h);
+        SetID(bg, "Type", type);
+    }
+    OrvaneDoc doc;
+    Operator *bg = nullptr;
+};
+
+/// Sets the four inputs of one corner colour ("TopLeft", "BottomRight", ...).
+void SetColor(Operator *op, const std::string &corner, const double rgba[4]) {
+    static const char *const channels[4] = {"Red", "Green", "Blue", "Alpha"};
+    for (int ch = 0; ch < 4; ++ch) SetNumber(op, (corner + channels[ch]).c_str(), rgba[ch]);
+}
+
+void SetGradient(Operator *op, std::vector<GradientStop> stops) {
+    Input *in = op->FindInput("Gradient");
+    ASSERT_NE(in, nullptr);
+    ASSERT_TRUE(in->SetValue(MakeRef<Gradient>(std::move(stops))));
+}
+
+/// The main output rendered with `opt` (cache off unless asked), or null.
+Ref<Image> Render(Operator *op, EvalOptions opt = {}) {
+    Ref<Parameter> p = Evaluate(op->FindMainOutput(), 0.0, opt);
+    return Ref<Image>(dynamic_cast<Image *>(p.Get()));
+}
+
+/// Runs one field request straight through Process, the way the engine would
+/// for an interlaced render: the inputs' own values, no region, no domain.
+Ref<Image> RenderField(Operator *op, int field) {
+    Output *out = op->FindMainOutput();
+    Request req(op, out, 0.0, 0, nullptr);
+    req.SetField(field);
+    for (const auto &in : op->Inputs()) req.SlotOf(in.get()).data = in->ValueAt(0.0);
+    op->Process(&req);
+    return Ref<Image>(dynamic_cast<Image *>(req.GetOutputData(out)));
+}
+
+float Channel(const FltPixel &p, int ch) { return ch == 0 ? p.R : ch == 1 ? p.G : ch == 2 ? p.B : p.A; }
+
+/// The stored integer of channel `ch` at (x, y) of an 8- or 16-bit image;
+/// single-channel images hold one value per pixel whatever `ch` is.
+int StoredInt(const Image &img, int x, int y, int ch) {
+    const int channels = img.IsMask() ? 1 : 4;
+    const int i = (x - img.DataWindow().x0) * channels + (channels == 4 ? ch : 0);
+    if (img.Format().bytesPerComponent == 1) return img.Row<uint8_t>(y)[i];
+    return img.Row<uint16_t>(y)[i];
+}
+
+/// The fixed point ramp of one row between two end values: each end scaled
+/// by 65535 x 32768 with 0.5 added and truncated, a per-column step of their
+/// difference over (W - 1) truncated towards zero, 16384 added once, and the
+/// 16-bit value in bits 15 and up.
+std::vector<int> FixedRow(float left, float right, int width) {
+    const double one = 65535.0 * 32768.0;
+    const int64_t a = static_cast<int64_t>(static_cast<double>(left) * one + 0.5);
+    const int64_t b = static_cast<int64_t>(static_cast<double>(right) * one + 0.5);
+    const int64_t step = width > 1 ? (b - a) / (width - 1) : 0;
+    std::vector<int> row(width);
+    for (int x = 0; x < width; ++x) row[x] = static_cast<int>((a + 16384 + x * step) >> 15);
+    return row;
+}
+
+/// A 16-bit value as stored in 8 bits (nearest).
+int To8(int v16) { return static_cast<int>(std::floor(v16 * 255.0 / 65535.0 + 0.5)); }
+
 using BackgroundRamp = BackgroundSuite;
 using BackgroundFrame = BackgroundSuite;
+using BackgroundGradient = BackgroundSuite;
+using BackgroundDevice = BackgroundSuite;
 
 const char *const kCornerIds[4] = {"TopLeft", "TopRight", "BottomLeft", "BottomRight"};
 const char *const kModeIds[5] = {"SolidColor", "Horizontal", "Vertical", "FourCorner", "Gradient"};
@@ -42,191 +142,11 @@ double RampValue(int mode, const double c[4][4], int ch, double u, double v) {
     }
 }
 
-std::vector<std::string> InputIds(const Operator *op) {
-    std::vector<std::string> ids;
-    for (const auto &in : op->Inputs()) ids.push_back(in->ID().Text());
-    return ids;
-}
-
-std::vector<std::string> Texts(const TagList &tags, Tag tag) {
-    std::vector<std::string> out;
-    for (const TagItem *item : tags.FindAll(tag))
-        out.push_back(KindOfTag(tag) == TagKind::ID ? item->AsID().Text() : item->AsText());
-    return out;
-}
-
-// ---- identity and panel ---------------------------------------------------
-
-TEST_F(BackgroundControls, RegistryRowCarriesTheClassIdentity) {
-    const Registry *row = ClassRegistry->Find(OvID("Background"));
-    ASSERT_NE(row, nullptr);
-    const TagList &t = row->Tags();
-    EXPECT_EQ(row->TypeFlags(), RegKindOperator | RegKindTool | RegKindSource);
-    EXPECT_EQ(row->BaseID(), CLSID_SourceOperator);
-    EXPECT_STREQ(row->ClassName(), "Background");
-    EXPECT_STREQ(t.GetText(RegPath, ""), "Tools/Creator/Background");
-    EXPECT_STREQ(t.GetText(RegAbbreviation, ""), "BG");
-    EXPECT_EQ(Texts(t, RegAlias), (std::vector<std::string>{"Constant", "Solid", "Gradient", "Ramp"}));
-    for (Tag on : {RegSupportsRoI, RegSupportsDoD, RegSupportsGPUImages, RegSourceRangeControls, RegSourceSizeControls,
-                   RegSourceAspectControls, RegSourceDepthControls})
-        EXPECT_TRUE(t.GetBool(on)) << std::hex << on;
-    EXPECT_FALSE(t.Has(RegNoMotionBlurControls));
-}
-
-TEST_F(BackgroundControls, InputsComeInPanelOrderBeforeTheImagePage) {
-    std::vector<std::string> expected = {"Type"};
-    for (int c = 0; c < 4; ++c) {
-        if (c > 0) expected.push_back(std::string(kCornerIds[c]) + "Sep");
-        for (const char *ch : {"Red", "Green", "Blue", "Alpha"}) expected.push_back(std::string(kCornerIds[c]) + ch);
-    }
-    for (const char *id :
-         {"GradientType", "Start", "End", "Gradient", "GradientInterpolationMethod", "Offset", "Repeat", "SubPixel"})
-        expected.push_back(id);
-    std::vector<std::string> ids = InputIds(bg);
-    ASSERT_GT(ids.size(), expected.size());
-    EXPECT_EQ(std::vector<std::string>(ids.begin(), ids.begin() + expected.size()), expected);
-    // The image-format controls the class attributes ask for follow on their own page.
-    for (const char *host : {"GlobalIn", "GlobalOut", "Width", "Height", "PixelAspect", "Depth"})
-        EXPECT_NE(std::find(ids.begin() + expected.size(), ids.end(), host), ids.end()) << host;
-
-    ASSERT_GE(bg->Pages().size(), 1u);
-    for (size_t i = 0; i < expected.size(); ++i) EXPECT_EQ(bg->Inputs()[i]->Page(), 0) << expected[i];
-
-    ASSERT_EQ(bg->Nests().size(), 1u);
-    const ControlNest &nest = bg->Nests()[0];
-    EXPECT_EQ(nest.id, OvID("BackgroundNest"));
-    EXPECT_EQ(nest.name, "Background");
-    EXPECT_TRUE(nest.open);
-    EXPECT_EQ(nest.firstInput, 1); // everything after Type
-    EXPECT_EQ(nest.endInput, static_cast<int>(expected.size()));
-
-    Output *out = bg->FindMainOutput();
-    ASSERT_NE(out, nullptr);
-    EXPECT_EQ(out->ID(), OvID("Output"));
-    EXPECT_EQ(out->DataType(), CLSID_DataType_Image);
-}
-
-TEST_F(BackgroundControls, ColourInputsFormFourColourControls) {
-    const char *const labels[4] = {"Top Left", "Top Right", "Bottom Left", "Bottom Right"};
-    const char *const channels[4] = {"Red", "Green", "Blue", "Alpha"};
-    for (int c = 0; c < 4; ++c)
-        for (int ch = 0; ch < 4; ++ch) {
-            const std::string id = std::string(kCornerIds[c]) + channels[ch];
-            SCOPED_TRACE(id);
-            const Input *in = bg->FindInput(id.c_str());
-            ASSERT_NE(in, nullptr);
-            const TagList &t = in->Tags();
-            EXPECT_EQ(in->Name(), std::string(labels[c]) + " " + channels[ch]);
-            EXPECT_EQ(t.GetLong(ControlGroup), c + 1);
-            EXPECT_EQ(t.GetLong(ControlMember), ch);
-            EXPECT_EQ(t.GetLong(ColorChannel), ColorChannelRed + ch);
-            EXPECT_FALSE(t.Has(InputMinAllowed) || t.Has(InputMaxAllowed)); // typed values may leave 0..1
-            const auto *def = dynamic_cast<const Number *>(in->Default().Get());
-            ASSERT_NE(def, nullptr);
-            EXPECT_EQ(def->value, ch == 3 ? 1.0 : 0.0);
-        }
-    for (int c = 1; c < 4; ++c) {
-        const Input *sep = bg->FindInput((std::string(kCornerIds[c]) + "Sep").c_str());
-        ASSERT_NE(sep, nullptr);
-        EXPECT_EQ(sep->Tags().GetID(InputControl), CLSID_InputControl_Label);
-        EXPECT_FALSE(sep->IsExternal());
-    }
-}
-
-TEST_F(BackgroundControls, ChoiceRowsAndGradientControlsHaveTheirDefaults) {
-    const std::pair<const char *, std::vector<std::string>> rows[] = {
-        {"Type", {"SolidColor", "Horizontal", "Vertical", "FourCorner", "Gradient"}},
-        {"GradientType", {"Linear", "Reflect", "Square", "Cross", "Radial", "Angle"}},
-        {"GradientInterpolationMethod", {"RGB", "HLS", "HSV", "LAB"}},
-        {"Repeat", {"Once", "Repeat", "PingPong"}},
-        {"SubPixel", {"1x1", "2x2", "3x3", "4x4", "5x5"}},
-    };
-    for (const auto &[id, ids] : rows) {
-        SCOPED_TRACE(id);
-        const Input *in = bg->FindInput(id);
-        ASSERT_NE(in, nullptr);
-        EXPECT_EQ(Texts(in->Tags(), ListItemId), ids);
-        EXPECT_EQ(Texts(in->Tags(), ListAddItem).size(), ids.size());
-        const auto *def = dynamic_cast<const IDValue *>(in->Default().Get());
-        ASSERT_NE(def, nullptr);
-        EXPECT_EQ(def->value, OvID(ids[0].c_str()));
-    }
-    EXPECT_EQ(Texts(bg->FindInput("Type")->Tags(), ButtonIcon).size(), 5u);
-    EXPECT_TRUE(bg->FindInput("Type")->Notifies());
-    EXPECT_TRUE(bg->FindInput("GradientInterpolationMethod")->Notifies());
-
-    for (const auto &[id, x, y] : {std::tuple{"Start", 0.0, 0.5}, std::tuple{"End", 1.0, 0.5}}) {
-        const auto *p = dynamic_cast<const Point *>(bg->FindInput(id)->Default().Get());
-        ASSERT_NE(p, nullptr) << id;
-        EXPECT_EQ(p->x, x) << id;
-        EXPECT_EQ(p->y, y) << id;
-    }
-    EXPECT_EQ(bg->FindInput("End")->Tags().GetPtr(PreviewInputFirst), bg->FindInput("GradientType"));
-    EXPECT_EQ(bg->FindInput("Gradient")->DataType(), CLSID_DataType_Gradient);
-    EXPECT_EQ(dynamic_cast<const Number *>(bg->FindInput("Offset")->Default().Get())->value, 0.0);
-}
-
-// ---- NotifyChanged ----------------------------------------------------------
-
-struct Visibility {
-    bool corner[4], gradient;
-    const char *labels[3]; ///< top left, top right and bottom left colour labels
-};
-
-void ExpectPanel(const Operator *op, const Visibility &v) {
-    for (int c = 0; c < 4; ++c) {
-        for (const char *ch : {"Red", "Green", "Blue", "Alpha"})
-            EXPECT_EQ(op->FindInput((std::string(kCornerIds[c]) + ch).c_str())->IsVisible(), v.corner[c])
-                << kCornerIds[c] << ch;
-        if (c > 0) {
-            EXPECT_EQ(op->FindInput((std::string(kCornerIds[c]) + "Sep").c_str())->IsVisible(), v.corner[c])
-                << kCornerIds[c];
-        }
-    }
-    for (const char *id :
-         {"GradientType", "Start", "End", "Gradient", "GradientInterpolationMethod", "Offset", "Repeat", "SubPixel"})
-        EXPECT_EQ(op->FindInput(id)->IsVisible(), v.gradient) << id;
-    for (int c = 0; c < 3; ++c)
-        if (v.labels[c]) {
-            EXPECT_STREQ(op->FindInput((std::string(kCornerIds[c]) + "Red").c_str())->Label(), v.labels[c]);
-        }
-}
-
-const Visibility kPanels[5] = {
-    {{true, false, false, false}, false, {"Color", nullptr, nullptr}},
-    {{true, true, false, false}, false, {"Left", "Right", nullptr}},
-    {{true, false, true, false}, false, {"Top", nullptr, "Bottom"}},
-    {{true, true, true, true}, false, {"Top Left", "Top Right", "Bottom Left"}},
-    {{false, false, false, false}, true, {nullptr, nullptr, nullptr}},
-};
-
-TEST_F(BackgroundControls, TypeShowsTheControlsAndLabelsOfItsMode) {
-    Input *type = bg->FindInput("Type");
-    // A new tool shows what the default Solid Color needs.
-    ExpectPanel(bg, kPanels[0]);
-    for (int mode : {3, 1, 4, 2, 0, 3}) {
-        SCOPED_TRACE(kModeIds[mode]);
-        Ref<IDValue> v = MakeRef<IDValue>(OvID(kModeIds[mode]));
-        bg->NotifyChanged(type, v.Get(), 0.0, nullptr);
-        ExpectPanel(bg, kPanels[mode]);
-        EXPECT_STREQ(bg->FindInput("BottomRightRed")->Label(), "Bottom Right");
-    }
-    // No value: nothing changes.
-    bg->NotifyChanged(type, nullptr, 0.0, nullptr);
-    ExpectPanel(bg, kPanels[3]);
-}
-
-TEST_F(BackgroundControls, InterpolationSpaceReachesTheGradientControl) {
-    Input *space = bg->FindInput("GradientInterpolationMethod");
-    const Input *gradient = bg->FindInput("Gradient");
-    const std::pair<const char *, int> spaces[] = {{"LAB", 7}, {"HLS", 1}, {"RGB", 0}, {"HSV", 5}};
-    for (const auto &[id, expected] : spaces) {
-        Ref<IDValue> v = MakeRef<IDValue>(OvID(id));
-        bg->NotifyChanged(space, v.Get(), 0.0, nullptr);
-        EXPECT_EQ(gradient->Tags().GetLong(ControlKindValue, -1), expected) << id;
-    }
-    bg->NotifyChanged(space, nullptr, 0.0, nullptr);
-    EXPECT_EQ(gradient->Tags().GetLong(ControlKindValue, -1), 5);
+TEST_F(BackgroundRamp, ANewToolIsASolidOpaqueBlackFrame) {
+    SetNumbers(bg, {{"Width", 4}, {"Height", 3}});
+    Ref<Image> img = EvalImage(bg);
+    ASSERT_TRUE(img);
+    EXPECT_EQ(img->GetFlt(3, 2), (FltPixel{0, 0, 0, 1}));
 }
 
 // ---- ramps ------------------------------------------------------------------
@@ -263,33 +183,12 @@ TEST_F(BackgroundRamp, FloatPixelsFollowTheFormulaOfEachMode) {
         }
 }
 
-TEST_F(BackgroundRamp, TopLeftIsTheTopRowOfAVerticalAndTheLeftColumnOfAHorizontalRamp) {
-    const int W = 9, H = 6;
-    SetCorners(bg, kCorners);
-    Frame(W, H, "Vertical");
-    Ref<Image> vertical = EvalImage(bg);
-    Frame(W, H, "Horizontal");
-    Ref<Image> horizontal = EvalImage(bg);
-    ASSERT_TRUE(vertical && horizontal);
-    for (int i = 0; i < 9; ++i) {
-        const FltPixel top = vertical->GetFlt(i % W, H - 1), left = horizontal->GetFlt(0, i % H);
-        const FltPixel bottom = vertical->GetFlt(i % W, 0), right = horizontal->GetFlt(W - 1, i % H);
-        for (int ch = 0; ch < 4; ++ch) {
-            EXPECT_FLOAT_EQ(Channel(top, ch), float(kCorners[0][ch]));
-            EXPECT_FLOAT_EQ(Channel(left, ch), float(kCorners[0][ch]));
-            EXPECT_FLOAT_EQ(Channel(bottom, ch), float(kCorners[2][ch]));
-            EXPECT_FLOAT_EQ(Channel(right, ch), float(kCorners[1][ch]));
-        }
-    }
-}
-
 TEST_F(BackgroundRamp, EqualEndsGiveExactlyThatColourAcrossTheRow) {
     // 0.3 is not a sum of halves: a blend of two 0.3s may miss it by a unit in the last place.
-    const double c[4] = {0.3, 0.7, 0.1, 0.9}, other[4] = {0.55, 0.25, 0.35, 0.45};
-    SetColor(bg, "TopLeft", c);
-    SetColor(bg, "TopRight", c);
-    SetColor(bg, "BottomLeft", other);
-    SetColor(bg, "BottomRight", other);
+    const double c[4] = {0.3, 0.7, 0.1, 0.9};
+    const double colors[4][4] = {
+        {c[0], c[1], c[2], c[3]}, {c[0], c[1], c[2], c[3]}, {0.55, 0.25, 0.35, 0.45}, {0.55, 0.25, 0.35, 0.45}};
+    SetCorners(bg, colors);
     for (const char *mode : {"Horizontal", "FourCorner"}) {
         Frame(37, 5, mode);
         Ref<Image> img = EvalImage(bg);
@@ -365,35 +264,31 @@ TEST_F(BackgroundRamp, IntegerVerticalAndFourCornerRowsStartFromTheirEnds) {
 TEST_F(BackgroundRamp, IntegerImagesWithColoursBeyondOneRenderClampedThroughFloats) {
     struct Case {
         const char *mode;
-        double tl[4], tr[4], bl[4], br[4];
+        int m;               ///< the ramp of RampValue
+        double colors[4][4]; ///< top left, top right, bottom left, bottom right
     };
     // The last case has its out-of-range colour only on the top right corner.
     const Case cases[] = {
-        {"Horizontal", {-0.5, 0.2, 1.0, 1.0}, {1.5, 0.8, 3.0, 1.0}, {0, 0, 0, 0}, {0, 0, 0, 0}},
-        {"Vertical", {2.0, 0.5, 0.5, 1.0}, {0, 0, 0, 0}, {-1.0, 0.5, 0.2, 1.0}, {0, 0, 0, 0}},
-        {"FourCorner", {0.2, 0.4, 0.6, 1.0}, {4.0, 0.4, -2.0, 1.0}, {0.1, 0.9, 0.5, 1.0}, {0.3, 0.3, 0.3, 1.0}},
+        {"Horizontal", 1, {{-0.5, 0.2, 1.0, 1.0}, {1.5, 0.8, 3.0, 1.0}, {}, {}}},
+        {"Vertical", 2, {{2.0, 0.5, 0.5, 1.0}, {}, {-1.0, 0.5, 0.2, 1.0}, {}}},
+        {"FourCorner", 3, {{0.2, 0.4, 0.6, 1.0}, {4.0, 0.4, -2.0, 1.0}, {0.1, 0.9, 0.5, 1.0}, {0.3, 0.3, 0.3, 1.0}}},
     };
     const int W = 41, H = 7;
     for (const Case &c : cases)
         for (int depthChoice : {2, 1}) {
             SCOPED_TRACE(std::string(c.mode) + (depthChoice == 2 ? " int16" : " int8"));
-            const double colors[4][4] = {{c.tl[0], c.tl[1], c.tl[2], c.tl[3]},
-                                         {c.tr[0], c.tr[1], c.tr[2], c.tr[3]},
-                                         {c.bl[0], c.bl[1], c.bl[2], c.bl[3]},
-                                         {c.br[0], c.br[1], c.br[2], c.br[3]}};
-            SetCorners(bg, colors);
+            SetCorners(bg, c.colors);
             Frame(W, H, c.mode);
             SetNumber(bg, "Depth", depthChoice);
-            const int m = std::string(c.mode) == "Horizontal" ? 1 : std::string(c.mode) == "Vertical" ? 2 : 3;
             const double top = depthChoice == 2 ? 65535.0 : 255.0;
             Ref<Image> img = EvalImage(bg);
             ASSERT_TRUE(img);
             for (int y = 0; y < H; ++y)
                 for (int x = 0; x < W; ++x)
                     for (int ch = 0; ch < 4; ++ch) {
-                        const double f = RampValue(m, colors, ch, x / double(W - 1), y / double(H - 1));
-                        const double want = std::clamp(f, 0.0, 1.0) * top;
-                        ASSERT_NEAR(StoredInt(*img, x, y, ch), want, 1.0) << x << "," << y << " ch " << ch;
+                        const double f = RampValue(c.m, c.colors, ch, x / double(W - 1), y / double(H - 1));
+                        ASSERT_NEAR(StoredInt(*img, x, y, ch), std::clamp(f, 0.0, 1.0) * top, 1.0)
+                            << x << "," << y << " ch " << ch;
                     }
         }
 }
@@ -473,17 +368,20 @@ TEST_F(BackgroundFrame, OpacityFollowsTheAlphasInUse) {
     EXPECT_FALSE(img->IsOpaque());
 }
 
-TEST_F(BackgroundFrame, PreCalculationGivesTheWindowsWithoutPixels) {
+TEST_F(BackgroundFrame, PreCalculationAndARegionOutsideTheFrameMakeNoPixels) {
     Frame(40, 30, "FourCorner");
     EvalOptions opt;
     opt.flags = ReqFlagPreCalc;
     opt.roi = ImageDomain(ImgRectI(5, 5, 10, 10)); // no region in pre-calculation
     Ref<Image> img = Render(bg, opt);
     ASSERT_TRUE(img);
-    EXPECT_TRUE(img->IsNoData());
-    EXPECT_FALSE(img->HasScanLineData());
+    EXPECT_TRUE(img->IsNoData() && !img->HasScanLineData());
     EXPECT_EQ(img->Frame(), ImgRectI(0, 0, 40, 30));
     EXPECT_EQ(img->DataWindow(), img->Frame());
+    opt.flags = 0;
+    opt.roi = ImageDomain(ImgRectI(50, 20, 60, 40));
+    ASSERT_TRUE(img = Render(bg, opt));
+    EXPECT_TRUE(img->DataWindow().IsNull() && !img->HasScanLineData());
 }
 
 TEST_F(BackgroundFrame, RegionRenderEqualsTheCropOfTheFullRender) {
@@ -519,16 +417,6 @@ TEST_F(BackgroundFrame, RegionRenderEqualsTheCropOfTheFullRender) {
             ASSERT_EQ(0, std::memcmp(crop->ScanLine(y), whole->PixelAddress(c.expected.x0, y), crop->RowBytes()))
                 << "row " << y;
     }
-}
-
-TEST_F(BackgroundFrame, RegionOutsideTheFrameGivesAnEmptyImage) {
-    Frame(16, 16, "Horizontal");
-    EvalOptions opt;
-    opt.roi = ImageDomain(ImgRectI(20, 20, 30, 30));
-    Ref<Image> img = Render(bg, opt);
-    ASSERT_TRUE(img);
-    EXPECT_TRUE(img->DataWindow().IsNull());
-    EXPECT_FALSE(img->HasScanLineData());
 }
 
 TEST_F(BackgroundFrame, ProxyHalvesTheSizeAndKeepsTheFullFrameAspect) {
@@ -619,6 +507,429 @@ TEST_F(BackgroundFrame, FieldRowsSitOnEveryOtherLineOfTheFrame) {
                 EXPECT_NEAR(Channel(img->GetFlt(2, y), ch), bottom[ch] * (1 - v) + top[ch] * v, 1e-6) << y;
         }
     }
+}
+
+// ---- Gradient mode ----
+
+enum Shape { Linear, Reflect, Square, Cross, Radial, Angle };
+const char *const kShapeIds[] = {"Linear", "Reflect", "Square", "Cross", "Radial", "Angle"};
+enum Fold { Once, Repeat, PingPong };
+const char *const kFoldIds[] = {"Once", "Repeat", "PingPong"};
+const char *const kSubPixelIds[] = {"", "1x1", "2x2", "3x3", "4x4", "5x5"};
+
+struct GradientCase {
+    const char *name;
+    Shape shape;
+    double sx, sy, ex, ey; ///< Start and End as the controls hold them
+    double offset;
+    Fold fold;
+    int subpixel;
+};
+
+/// One sample's gradient position, from the geometry in double.
+struct Sample {
+    double position; ///< after offset and folding
+    bool nearJump;   ///< within rounding of a jump of the position
+};
+
+Sample SampleAt(const GradientCase &c, double aspect, double px, double py) {
+    const double sx = c.sx, sy = c.sy * aspect, ex = c.ex, ey = c.ey * aspect;
+    const double dx = ex - sx, dy = ey - sy, L2 = dx * dx + dy * dy, L = std::sqrt(L2);
+    const double ox = px - sx, oy = py - sy;
+    const double a = (dx * ox + dy * oy) / L2, b = (-dy * ox + dx * oy) / L2;
+    const double radial = std::sqrt(std::pow(px / L - sx / L, 2) + oy * oy / L2);
+    bool nearJump = false;
+    double p = 0;
+    switch (c.shape) {
+    case Linear: p = a; break;
+    case Reflect: p = std::fabs(a); break;
+    case Square: p = std::max(std::fabs(a), std::fabs(b)); break;
+    case Cross: p = std::min(std::fabs(a), std::fabs(b)); break;
+    case Radial: p = radial; break;
+    case Angle: {
+        const double cosine = radial > 0 ? a / radial : 0.0;
+        const double turn = std::acos(std::clamp(cosine, -1.0, 1.0)) / (2 * M_PI);
+        p = b >= 0 ? turn : 1 - turn;
+        // The angle jumps from 1 to 0 across the ray from Start towards End,
+        // and near that line and its extension acos magnifies float rounding.
+        nearJump = radial < 1e-4 || 1 - std::fabs(cosine) < 1e-4;
+        break;
+    }
+    }
+    p -= c.offset;
+    if (c.fold == Repeat) {
+        nearJump |= std::fabs(p - std::round(p)) < 1e-4;
+        p -= std::floor(p);
+    } else if (c.fold == PingPong) {
+        p -= 2 * std::floor(p / 2);
+        if (p > 1) p = 2 - p;
+    }
+    return {p, nearJump};
+}
+
+/// The pixel's value under the default black-to-white gradient: the mean of
+/// the clamped positions of its n x n samples at (x + j/n, y + i/n) / (W, H),
+/// the sample row's step added after the aspect scaling. False when a sample
+/// lies on a jump, where float and double may fall on different sides.
+/// With `device`, the device's form: positions against W - 1 and H - 1, the
+/// row step added before the aspect scaling, and the colour read from the
+/// 256-entry table (entry k at k/255) through a linear sampler over texel
+/// centres, which for this ramp gives (256 t - 0.5) / 255, clamped.
+bool ExpectedGrey(const GradientCase &c, int W, int H, int x, int y, double &value, bool device = false) {
+    const int n = c.subpixel;
+    const double aspect = double(H) / W;
+    double sum = 0;
+    for (int i = 0; i < n; ++i)
+        for (int j = 0; j < n; ++j) {
+            double px = (x + double(j) / n) / W, py = aspect * (double(y) / H) + double(i) / (n * H);
+            if (device) px = (x + double(j) / n) / (W - 1), py = aspect * ((y + double(i) / n) / (H - 1));
+            const Sample s = SampleAt(c, aspect, px, py);
+            if (s.nearJump) return false;
+            sum += device ? std::clamp((256.0 * s.position - 0.5) / 255.0, 0.0, 1.0) : std::clamp(s.position, 0.0, 1.0);
+        }
+    value = sum / (n * n);
+    return true;
+}
+
+void SetUpGradient(Operator *op, const GradientCase &c) {
+    SetID(op, "GradientType", kShapeIds[c.shape]);
+    SetPoint(op, "Start", c.sx, c.sy);
+    SetPoint(op, "End", c.ex, c.ey);
+    SetNumber(op, "Offset", c.offset);
+    SetID(op, "Repeat", kFoldIds[c.fold]);
+    SetID(op, "SubPixel", kSubPixelIds[c.subpixel]);
+}
+
+// The first case is the tool's defaults, rendered without setting a control.
+const GradientCase kCases[] = {
+    {"linear, the defaults", Linear, 0.0, 0.5, 1.0, 0.5, 0.0, Once, 1},
+    {"linear, diagonal, offset", Linear, 0.2, 0.1, 0.8, 0.9, 0.25, Once, 1},
+    {"reflect", Reflect, 0.5, 0.5, 0.9, 0.6, 0.0, Once, 1},
+    {"square", Square, 0.5, 0.4, 0.8, 0.5, 0.0, Once, 1},
+    {"cross, negative offset", Cross, 0.5, 0.4, 0.8, 0.5, -0.1, Once, 1},
+    {"radial: raw X, aspect-scaled Y offset", Radial, 0.4, 0.6, 0.7, 0.8, 0.0, Once, 1},
+    {"angle", Angle, 0.5, 0.5, 0.9, 0.7, 0.0, Once, 1},
+    {"angle pointing down-left", Angle, 0.6, 0.7, 0.2, 0.1, 0.0, Once, 1},
+    {"linear repeat", Linear, 0.1, 0.5, 0.35, 0.5, 0.33, Repeat, 1},
+    {"linear ping-pong", Linear, 0.1, 0.5, 0.35, 0.5, 0.3, PingPong, 1},
+    {"linear once, far offset", Linear, 0.0, 0.5, 1.0, 0.5, -1.5, Once, 1},
+    {"linear ping-pong, far offset", Linear, 0.0, 0.5, 1.0, 0.5, -1.5, PingPong, 1},
+    {"linear repeat, far offset", Linear, 0.0, 0.5, 1.0, 0.5, -2.25, Repeat, 1},
+    {"radial repeat", Radial, 0.5, 0.5, 0.6, 0.5, -0.2, Repeat, 1},
+    {"angle ping-pong", Angle, 0.3, 0.2, 0.6, 0.9, 0.6, PingPong, 1},
+    {"square 2x2", Square, 0.5, 0.5, 0.7, 0.6, 0.0, Once, 2},
+    {"steep linear 3x3", Linear, 0.5, 0.5, 0.52, 0.5, 0.0, Once, 3},
+    {"angle repeat 4x4", Angle, 0.5, 0.5, 0.8, 0.5, 0.1, Repeat, 4},
+    {"small radial 5x5", Radial, 0.5, 0.5, 0.55, 0.5, 0.0, Once, 5},
+    {"reflect ping-pong 3x3", Reflect, 0.45, 0.3, 0.5, 0.45, 1.2, PingPong, 3},
+};
+
+TEST_F(BackgroundGradient, EachShapeFoldAndSubPixelGridMatchesTheGeometry) {
+    const int W = 40, H = 24; // aspect 0.6, so that Y scaling matters
+    Frame(W, H, "Gradient");
+    for (const GradientCase &c : kCases) {
+        SCOPED_TRACE(c.name);
+        if (&c != kCases) SetUpGradient(bg, c);
+        Ref<Image> img = EvalImage(bg);
+        ASSERT_TRUE(img);
+        int checked = 0;
+        for (int y = 0; y < H; ++y)
+            for (int x = 0; x < W; ++x) {
+                double want;
+                if (!ExpectedGrey(c, W, H, x, y, want)) continue;
+                ++checked;
+                const FltPixel p = img->GetFlt(x, y);
+                ASSERT_NEAR(p.R, want, 2e-5) << x << "," << y;
+                ASSERT_NEAR(p.G, want, 2e-5) << x << "," << y;
+                ASSERT_NEAR(p.B, want, 2e-5) << x << "," << y;
+                ASSERT_EQ(p.A, 1.0f) << x << "," << y;
+            }
+        EXPECT_GT(checked, W * H * 9 / 10);
+    }
+}
+
+TEST_F(BackgroundGradient, OnTheDeviceEachCaseFollowsTheDeviceGeometry) {
+    ORVANE_NEED_OPENCL(ctx);
+    const int W = 40, H = 24;
+    Frame(W, H, "Gradient");
+    for (const GradientCase &c : kCases) {
+        SCOPED_TRACE(c.name);
+        SetUpGradient(bg, c);
+        RenderTask task;
+        task.SetDevice(ctx);
+        EvalOptions opt;
+        opt.task = &task;
+        opt.useCache = false;
+        const int launches = ctx->LaunchCount();
+        Ref<Image> img = Render(bg, opt);
+        ASSERT_TRUE(img);
+        EXPECT_EQ(ctx->LaunchCount(), launches + 1);
+        int checked = 0;
+        for (int y = 0; y < H; ++y)
+            for (int x = 0; x < W; ++x) {
+                double want;
+                if (!ExpectedGrey(c, W, H, x, y, want, true)) continue;
+                ++checked;
+                const FltPixel p = img->GetFlt(x, y);
+                ASSERT_NEAR(p.R, want, 5e-5) << x << "," << y;
+                ASSERT_NEAR(p.B, want, 5e-5) << x << "," << y;
+                ASSERT_NEAR(p.A, 1.0f, 1e-6) << x << "," << y;
+            }
+        EXPECT_GT(checked, W * H * 9 / 10);
+    }
+}
+
+TEST_F(BackgroundGradient, CoincidentStartAndEndGiveTheColourAtZeroEverywhere) {
+    // Red at -1, blue at 1: position 0 is their midpoint. Offset and folding
+    // would move it anywhere else.
+    SetGradient(bg, {{-1.0, 1, 0, 0, 1}, {1.0, 0, 0, 1, 1}});
+    Frame(12, 7, "Gradient");
+    SetPoint(bg, "Start", 0.3, 0.3);
+    SetPoint(bg, "End", 0.3, 0.3);
+    SetNumber(bg, "Offset", 0.25);
+    SetID(bg, "Repeat", "PingPong");
+    SetID(bg, "SubPixel", "3x3");
+    for (const char *shape : {"Linear", "Radial", "Angle"})
+        for (int depthChoice : {4, 2}) {
+            SCOPED_TRACE(std::string(shape) + " depth " + std::to_string(depthChoice));
+            SetID(bg, "GradientType", shape);
+            SetNumber(bg, "Depth", depthChoice);
+            Ref<Image> img = EvalImage(bg);
+            ASSERT_TRUE(img);
+            for (int y = 0; y < 7; ++y)
+                for (int x = 0; x < 12; ++x) {
+                    if (depthChoice == 4) {
+                        EXPECT_EQ(img->GetFlt(x, y), (FltPixel{0.5f, 0.0f, 0.5f, 1.0f})) << x << "," << y;
+                    } else { // 0.5 x 65535 = 32767.5, truncated
+                        const int want[4] = {32767, 0, 32767, 65535};
+                        for (int ch = 0; ch < 4; ++ch) EXPECT_EQ(StoredInt(*img, x, y, ch), want[ch]);
+                    }
+                }
+        }
+}
+
+TEST_F(BackgroundGradient, InterpolationSpaceReachesTheGradient) {
+    // Red to blue: RGB passes through a dark purple, HSV and HLS through
+    // magenta, LAB through its own blend.
+    const Ref<Gradient> reference = MakeRef<Gradient>(std::vector<GradientStop>{{0.0, 1, 0, 0, 1}, {1.0, 0, 0, 1, 1}});
+    SetGradient(bg, reference->Stops());
+    Frame(64, 4, "Gradient");
+    SetPoint(bg, "Start", 0.0, 0.5);
+    SetPoint(bg, "End", 1.0, 0.5);
+    const std::pair<const char *, ColorSpaceType> spaces[] = {{"RGB", ColorSpaceType::RGB},
+                                                              {"HLS", ColorSpaceType::HLS},
+                                                              {"HSV", ColorSpaceType::HSV},
+                                                              {"LAB", ColorSpaceType::LAB}};
+    std::vector<FltPixel> middles;
+    for (const auto &[id, space] : spaces) {
+        SCOPED_TRACE(id);
+        SetID(bg, "GradientInterpolationMethod", id);
+        Ref<Image> img = EvalImage(bg);
+        ASSERT_TRUE(img);
+        for (int x : {0, 8, 16, 32, 40, 63}) { // x / 64 is exact in float
+            float r, g, b, a;
+            reference->QuickEvaluate(x / 64.0, r, g, b, a, static_cast<int>(space));
+            const FltPixel p = img->GetFlt(x, 1);
+            EXPECT_NEAR(p.R, r, 1e-6) << x;
+            EXPECT_NEAR(p.G, g, 1e-6) << x;
+            EXPECT_NEAR(p.B, b, 1e-6) << x;
+            EXPECT_NEAR(p.A, a, 1e-6) << x;
+        }
+        middles.push_back(img->GetFlt(32, 1));
+    }
+    // HSV's middle is magenta (1, 0, 1); RGB's is (0.5, 0, 0.5).
+    EXPECT_NEAR(middles[0].R, 0.5f, 1e-6);
+    EXPECT_NEAR(middles[2].R, 1.0f, 1e-5);
+    EXPECT_NEAR(middles[2].B, 1.0f, 1e-5);
+    EXPECT_GT(std::fabs(middles[3].R - middles[0].R) + std::fabs(middles[3].B - middles[0].B), 0.05);
+}
+
+TEST_F(BackgroundGradient, StraightGradientColoursArePremultiplied) {
+    SetGradient(bg, {{0.0, 0.8f, 0.4f, 0.2f, 0.5f}, {1.0, 0.2f, 0.6f, 1.0f, 0.25f}});
+    Frame(32, 4, "Gradient");
+    SetPoint(bg, "Start", 0.0, 0.5);
+    SetPoint(bg, "End", 1.0, 0.5);
+    Ref<Image> img = EvalImage(bg);
+    ASSERT_TRUE(img);
+    EXPECT_FALSE(img->IsOpaque());
+    const double c0[4] = {0.8, 0.4, 0.2, 0.5}, c1[4] = {0.2, 0.6, 1.0, 0.25};
+    for (int x = 0; x < 32; ++x) {
+        const double t = x / 32.0;
+        const double alpha = c0[3] + (c1[3] - c0[3]) * t;
+        const FltPixel p = img->GetFlt(x, 2);
+        for (int ch = 0; ch < 3; ++ch)
+            EXPECT_NEAR(Channel(p, ch), (c0[ch] + (c1[ch] - c0[ch]) * t) * alpha, 1e-6) << x << " ch " << ch;
+        EXPECT_NEAR(p.A, alpha, 1e-6) << x;
+    }
+}
+
+TEST_F(BackgroundGradient, IntegerImagesClampAndTruncateFloatImagesDoNot) {
+    // One stop: the same colour at every position, beyond 0..1 in two channels.
+    SetGradient(bg, {{0.0, 2.0f, -1.0f, 0.5f, 1.0f}});
+    Frame(9, 5, "Gradient");
+    SetID(bg, "GradientType", "Radial");
+    struct Case {
+        int depthChoice;
+        double want[4];
+    };
+    const Case cases[] = {{4, {2.0, -1.0, 0.5, 1.0}},
+                          {3, {2.0, -1.0, 0.5, 1.0}},
+                          {2, {65535, 0, 32767, 65535}},
+                          {1, {255, 0, double(To8(32767)), 255}}};
+    for (const Case &c : cases) {
+        SCOPED_TRACE(c.depthChoice);
+        SetNumber(bg, "Depth", c.depthChoice);
+        Ref<Image> img = EvalImage(bg);
+        ASSERT_TRUE(img);
+        for (int ch = 0; ch < 4; ++ch) {
+            const double got = c.depthChoice >= 3 ? Channel(img->GetFlt(4, 2), ch) : StoredInt(*img, 4, 2, ch);
+            EXPECT_EQ(got, c.want[ch]) << "ch " << ch;
+        }
+    }
+}
+
+TEST_F(BackgroundGradient, IntegerRampsTruncateTheSampledColour) {
+    const GradientCase c{"", Linear, 0.1, 0.2, 0.9, 0.7, 0.0, Once, 2};
+    const int W = 50, H = 20;
+    Frame(W, H, "Gradient");
+    SetUpGradient(bg, c);
+    SetNumber(bg, "Depth", 2);
+    Ref<Image> img = EvalImage(bg);
+    ASSERT_TRUE(img);
+    for (int y = 0; y < H; ++y)
+        for (int x = 0; x < W; ++x) {
+            double want;
+            ASSERT_TRUE(ExpectedGrey(c, W, H, x, y, want));
+            ASSERT_NEAR(StoredInt(*img, x, y, 0), std::floor(want * 65535.0), 1.0) << x << "," << y;
+            ASSERT_EQ(StoredInt(*img, x, y, 3), 65535);
+        }
+}
+
+TEST_F(BackgroundGradient, FastInteractivePreviewsSkipTheSubPixelGrid) {
+    Frame(24, 12, "Gradient");
+    SetUpGradient(bg, {"", Radial, 0.5, 0.5, 0.6, 0.5, 0.0, Repeat, 3});
+    EvalOptions plain;
+    plain.useCache = false;
+    Ref<Image> fine = Render(bg, plain);
+    RenderTask interactive, batch;
+    interactive.interactive = true;
+    EvalOptions quick = plain, quickBatch = plain;
+    quick.flags = quickBatch.flags = ReqFlagQuick;
+    quick.task = &interactive;
+    quickBatch.task = &batch;
+    Ref<Image> preview = Render(bg, quick), batchQuick = Render(bg, quickBatch);
+    SetID(bg, "SubPixel", "1x1");
+    Ref<Image> coarse = Render(bg, plain);
+    ASSERT_TRUE(fine && preview && batchQuick && coarse);
+    const size_t bytes = fine->RowBytes();
+    bool fineDiffers = false;
+    for (int y = 0; y < 12; ++y) {
+        EXPECT_EQ(0, std::memcmp(preview->ScanLine(y), coarse->ScanLine(y), bytes)) << y;
+        EXPECT_EQ(0, std::memcmp(batchQuick->ScanLine(y), fine->ScanLine(y), bytes)) << y;
+        fineDiffers |= std::memcmp(fine->ScanLine(y), coarse->ScanLine(y), bytes) != 0;
+    }
+    EXPECT_TRUE(fineDiffers);
+    EXPECT_EQ(preview->Attrs().GetLong(ImgQuickMode), 1);
+}
+
+TEST_F(BackgroundGradient, MasksHoldTheGradientAlpha) {
+    SetGradient(bg, {{0.0, 1, 1, 1, 0}, {1.0, 1, 1, 1, 1}});
+    const GradientCase c{"", Linear, 0.1, 0.5, 0.9, 0.5, 0.0, Once, 1};
+    const int W = 30, H = 6;
+    for (int depth = 1; depth <= 4; ++depth) {
+        SCOPED_TRACE(depth);
+        doc.SetPref(PREF_FFDepth, depth);
+        Frame(W, H, "Gradient");
+        SetUpGradient(bg, c);
+        EvalOptions opt;
+        opt.useCache = false; // the document's depth is not part of the cache key
+        Ref<Image> img = Render(bg, opt);
+        ASSERT_TRUE(img);
+        ASSERT_EQ(img->Depth(), depth);
+        EXPECT_FALSE(img->IsOpaque());
+        for (int x = 0; x < W; ++x) {
+            double want;
+            ASSERT_TRUE(ExpectedGrey(c, W, H, x, 3, want));
+            if (depth == 2)
+                EXPECT_NEAR(StoredInt(*img, x, 3, 3), std::floor(want * 65535.0), 1.0) << x;
+            else if (depth == 1)
+                EXPECT_NEAR(StoredInt(*img, x, 3, 3), want * 255.0, 1.0) << x;
+            else
+                EXPECT_NEAR(img->GetFlt(x, 3).A, want, depth == 3 ? 1e-3 : 2e-5) << x;
+        }
+    }
+}
+
+// ---- on the device ----
+
+TEST_F(BackgroundDevice, RampsMatchTheRowsInEveryModeAndDepth) {
+    ORVANE_NEED_OPENCL(ctx);
+    const double tl[4] = {0.9, 0.2, 0.1, 1}, tr[4] = {0.1, 0.8, 0.3, 0.7}, bl[4] = {0.0, 0.3, 0.9, 1},
+                 br[4] = {0.5, 0.5, 0.05, 0.4};
+    SetColor(bg, "TopLeft", tl);
+    SetColor(bg, "TopRight", tr);
+    SetColor(bg, "BottomLeft", bl);
+    SetColor(bg, "BottomRight", br);
+    const ImgRectI roi(7, 3, 97, 55); // lines up with nothing
+    for (const char *type : {"SolidColor", "Horizontal", "Vertical", "FourCorner"})
+        for (int choice : {4, 3, 2, 1}) { // float32, float16, int16, int8
+            const int depth = choice + 4;
+            SCOPED_TRACE(std::string(type) + " depth " + std::to_string(depth));
+            Frame(101, 57, type);
+            SetNumber(bg, "Depth", choice);
+            EvalOptions cpuOpt;
+            cpuOpt.useCache = false;
+            cpuOpt.roi = ImageDomain(roi);
+            Ref<Image> cpu = Render(bg, cpuOpt);
+            RenderTask task;
+            task.SetDevice(ctx);
+            EvalOptions devOpt = cpuOpt;
+            devOpt.task = &task;
+            const int launches = ctx->LaunchCount();
+            Ref<Image> dev = Render(bg, devOpt);
+            ASSERT_TRUE(cpu && dev);
+            ASSERT_EQ(cpu->Depth(), depth);
+            EXPECT_EQ(ctx->LaunchCount(), launches + 1);
+            EXPECT_EQ(dev->IsOpaque(), cpu->IsOpaque());
+            ASSERT_EQ(dev->DataWindow(), cpu->DataWindow());
+            const ImgRectI dw = cpu->DataWindow();
+            if (FormatOfDepth(depth).isFloat) {
+                EXPECT_EQ(std::memcmp(dev->ScanLine(dw.y0), cpu->ScanLine(dw.y0), cpu->RowBytes() * dw.Height()), 0);
+                continue;
+            }
+            for (int y = dw.y0; y < dw.y1; ++y)
+                for (int x = dw.x0; x < dw.x1; ++x) {
+                    Pixel a, b;
+                    LoadPixel(depth, dev->PixelAddress(x, y), 1, &a);
+                    LoadPixel(depth, cpu->PixelAddress(x, y), 1, &b);
+                    const int step = depth == DepthRGBAInt8 ? 257 : 1;
+                    ASSERT_LE(std::abs(a.R - b.R), step) << x << "," << y;
+                    ASSERT_LE(std::abs(a.G - b.G), step) << x << "," << y;
+                    ASSERT_LE(std::abs(a.B - b.B), step) << x << "," << y;
+                    ASSERT_LE(std::abs(a.A - b.A), step) << x << "," << y;
+                }
+        }
+}
+
+TEST_F(BackgroundDevice, FieldRequestsUseTheRows) {
+    ORVANE_NEED_OPENCL(ctx);
+    Frame(32, 20, "Vertical");
+    const Ref<Image> rows = RenderField(bg, 1);
+    // The same field request, now from a render that has a device.
+    RenderTask task;
+    task.SetDevice(ctx);
+    Output *out = bg->FindMainOutput();
+    Request req(bg, out, 0.0, 0, &task);
+    req.SetField(1);
+    for (const auto &in : bg->Inputs()) req.SlotOf(in.get()).data = in->ValueAt(0.0);
+    const int launches = ctx->LaunchCount();
+    bg->Process(&req);
+    auto *field = dynamic_cast<Image *>(req.GetOutputData(out));
+    ASSERT_TRUE(field && rows);
+    EXPECT_EQ(ctx->LaunchCount(), launches); // the kernel has no field form
+    EXPECT_FALSE(field->GetGPUMem());
+    ASSERT_EQ(field->DataWindow(), rows->DataWindow());
+    EXPECT_EQ(std::memcmp(field->ScanLine(0), rows->ScanLine(0), rows->RowBytes() * rows->DataWindow().Height()), 0);
 }
 
 } // namespace

@@ -10,18 +10,12 @@ namespace {
 class CropTool : public ::testing::Test {
 protected:
     static void SetUpTestSuite() { LoadOperators(); }
-    Operator *Make(Ref<Image> src, int x, int y, int w, int h) {
-        probe = AddProbe(doc, std::move(src));
-        Operator *crp = AddTool(doc, "Crop", probe);
-        SetNumber(crp, "XOffset", x);
-        SetNumber(crp, "YOffset", y);
-        SetNumber(crp, "XSize", w);
-        SetNumber(crp, "YSize", h);
+    Operator *Make(Ref<Image> src, int x, int y, int w, int h, OrvaneDoc *in = nullptr) {
+        OrvaneDoc &d = in ? *in : doc;
+        probe = AddProbe(d, std::move(src));
+        Operator *crp = AddTool(d, "Crop", probe);
+        SetNumbers(crp, {{"XOffset", x}, {"YOffset", y}, {"XSize", w}, {"YSize", h}});
         return crp;
-    }
-    double Control(Operator *op, const char *id) {
-        const auto *n = dynamic_cast<const Number *>(op->FindInput(id)->Constant().Get());
-        return n ? n->value : -1.0;
     }
     OrvaneDoc doc;
     ProbeSource *probe = nullptr;
@@ -31,6 +25,14 @@ protected:
 void ExpectCut(const Image &out, const Image &src, int ox, int oy, const ImgRectI &r) {
     for (int y = r.y0; y < r.y1; ++y)
         for (int x = r.x0; x < r.x1; ++x) ASSERT_EQ(out.GetFlt(x, y), src.GetFlt(x + ox, y + oy)) << x << "," << y;
+}
+
+/// The four box controls: x and y offset, x and y size.
+void ExpectBox(Operator *crp, double x, double y, double w, double h) {
+    EXPECT_EQ(Control(crp, "XOffset"), x);
+    EXPECT_EQ(Control(crp, "YOffset"), y);
+    EXPECT_EQ(Control(crp, "XSize"), w);
+    EXPECT_EQ(Control(crp, "YSize"), h);
 }
 
 TEST_F(CropTool, TheCutIsTheSourcesPixelsMoved) {
@@ -52,12 +54,14 @@ TEST_F(CropTool, TheCutIsTheSourcesPixelsMoved) {
 
     // A cut reaching beyond the source: canvas there.
     SetID(crp, "ClippingMode", "ClippingMode_Frame");
-    SetNumber(crp, "XOffset", -4);
-    SetNumber(crp, "YOffset", 26);
+    SetNumbers(crp, {{"XOffset", -4}, {"YOffset", 26}});
     out = Render(crp);
     ASSERT_NE(out, nullptr);
     EXPECT_EQ(out->DataWindow(), ImgRectI(4, 0, 16, 4));
     ExpectCut(*out, *src, -4, 26, ImgRectI(0, 0, 16, 10));
+
+    // A pass-through render hands on the input itself.
+    EXPECT_EQ(Render(crp, {.passThrough = true}).Get(), src.Get());
 }
 
 TEST_F(CropTool, EveryDepthCutsTheSame) {
@@ -65,12 +69,7 @@ TEST_F(CropTool, EveryDepthCutsTheSame) {
         SCOPED_TRACE(depth);
         OrvaneDoc d;
         Ref<Image> src = PatternImage(21, 13, depth, 4);
-        Operator *crp = AddTool(d, "Crop", AddProbe(d, src));
-        SetNumber(crp, "XOffset", 3);
-        SetNumber(crp, "YOffset", 2);
-        SetNumber(crp, "XSize", 11);
-        SetNumber(crp, "YSize", 9);
-        Ref<Image> out = Render(crp);
+        Ref<Image> out = Render(Make(src, 3, 2, 11, 9, &d));
         ASSERT_NE(out, nullptr);
         EXPECT_EQ(out->Depth(), depth);
         ExpectCut(*out, *src, 3, 2, ImgRectI(0, 0, 11, 9));
@@ -82,16 +81,13 @@ TEST_F(CropTool, ControlsAreFullResolutionPixelsOfAProxy) {
     // floor(2.5 + 0.5) = 3; size 16 x 10 -> 8 x 5.
     Ref<Image> src = PatternImage(20, 15, 8, 9);
     src->SetAttrsTagList({{ImgFullWidth, 40}, {ImgFullHeight, 30}});
-    Operator *crp = Make(src, 7, 5, 16, 10);
-    Ref<Image> out = Render(crp, {.proxy = 2});
+    Ref<Image> out = Render(Make(src, 7, 5, 16, 10), {.proxy = 2});
     ASSERT_NE(out, nullptr);
     EXPECT_EQ(out->Width(), 8);
     EXPECT_EQ(out->Height(), 5);
     EXPECT_EQ(out->GetAttrL(ImgFullWidth), 16);
     EXPECT_EQ(out->GetAttrL(ImgFullHeight), 10);
     ExpectCut(*out, *src, 4, 3, ImgRectI(0, 0, 8, 5));
-    // The input was asked for what the cut reads.
-    ASSERT_FALSE(probe->asked.empty());
 }
 
 TEST_F(CropTool, KeptAspectAndCentringWriteTheControls) {
@@ -101,8 +97,7 @@ TEST_F(CropTool, KeptAspectAndCentringWriteTheControls) {
     Ref<Image> out = Render(crp);
     ASSERT_NE(out, nullptr);
     // floor((40 - 16) / 2 + 0.5) = 12, floor((30 - 10) / 2 + 0.5) = 10.
-    EXPECT_EQ(Control(crp, "XOffset"), 12.0);
-    EXPECT_EQ(Control(crp, "YOffset"), 10.0);
+    ExpectBox(crp, 12, 10, 16, 10);
     ExpectCut(*out, *src, 12, 10, ImgRectI(0, 0, 16, 10));
 
     // Keep Aspect: 16 / (40 / 30) + 0.5 = 12.5, cut to 12; centred again: y = 9.
@@ -110,55 +105,31 @@ TEST_F(CropTool, KeptAspectAndCentringWriteTheControls) {
     out = Render(crp);
     ASSERT_NE(out, nullptr);
     EXPECT_EQ(out->Height(), 12);
-    EXPECT_EQ(Control(crp, "YSize"), 12.0);
-    EXPECT_EQ(Control(crp, "YOffset"), 9.0);
+    ExpectBox(crp, 12, 9, 16, 12);
     ExpectCut(*out, *src, 12, 9, ImgRectI(0, 0, 16, 12));
 
     // Write-protected: the same frame, the controls as they were.
     OrvaneDoc d;
     d.SetWriteProtected(true);
-    Operator *locked = AddTool(d, "Crop", AddProbe(d, src));
-    SetNumber(locked, "XSize", 16);
-    SetNumber(locked, "YSize", 10);
-    SetNumber(locked, "KeepCentered", 1);
-    SetNumber(locked, "KeepAspect", 1);
+    Operator *locked = Make(src, 0, 0, 16, 10, &d);
+    SetNumbers(locked, {{"KeepCentered", 1}, {"KeepAspect", 1}});
     out = Render(locked);
     ASSERT_NE(out, nullptr);
     ExpectCut(*out, *src, 12, 9, ImgRectI(0, 0, 16, 12));
-    EXPECT_EQ(Control(locked, "XOffset"), 0.0);
-    EXPECT_EQ(Control(locked, "YSize"), 10.0);
-}
+    ExpectBox(locked, 0, 0, 16, 10);
 
-TEST_F(CropTool, ResetButtonsAndPassThrough) {
-    Ref<Image> src = PatternImage(40, 30, 8, 3);
-    Operator *crp = Make(src, 7, 5, 16, 10);
-    Ref<Image> out = Render(crp, {.passThrough = true});
-    EXPECT_EQ(out.Get(), src.Get()); // the input itself
-    ASSERT_NE(Render(crp), nullptr);
-    SetNumber(crp, "ResetOffset", 1);
-    EXPECT_EQ(Control(crp, "XOffset"), 0.0);
-    EXPECT_EQ(Control(crp, "YOffset"), 0.0);
-    SetNumber(crp, "ResetSize", 1);
-    EXPECT_EQ(Control(crp, "XSize"), 40.0);
-    EXPECT_EQ(Control(crp, "YSize"), 30.0);
+    // The reset buttons: no offset, the source's size.
+    SetNumbers(crp, {{"ResetOffset", 1}, {"ResetSize", 1}});
+    ExpectBox(crp, 0, 0, 40, 30);
 }
 
 TEST_F(CropTool, ARegionOfInterestGivesTheWholeFramesPixels) {
-    Ref<Image> src = PatternImage(40, 30, 8, 6);
-    Operator *crp = Make(src, 9, 4, 25, 20);
-    Ref<Image> whole = Render(crp);
-    ASSERT_NE(whole, nullptr);
-    for (const ImgRectI roi : {ImgRectI(0, 0, 5, 5), ImgRectI(10, 3, 25, 20), ImgRectI(20, 15, 24, 19)}) {
-        probe->asked.clear();
-        Ref<Image> part = Render(crp, {.roi = roi});
-        ASSERT_NE(part, nullptr);
-        ExpectSamePixels(*part, *whole, roi);
-        ASSERT_EQ(probe->asked.size(), 1u);
-        ASSERT_TRUE(probe->asked[0].has_value());
-        ImgRectI moved = roi;
-        moved.Offset(9, 4);
-        EXPECT_EQ(probe->asked[0]->rect, moved);
-    }
+    Operator *crp = Make(PatternImage(40, 30, 8, 6), 9, 4, 25, 20);
+    ExpectRegionsMatchWhole(crp, {ImgRectI(0, 0, 5, 5), ImgRectI(10, 3, 25, 20), ImgRectI(20, 15, 24, 19)});
+    // The input is asked for the region moved by the offset.
+    ASSERT_EQ(probe->asked.size(), 4u);
+    ASSERT_TRUE(probe->asked[2].has_value());
+    EXPECT_EQ(probe->asked[2]->rect, ImgRectI(19, 7, 34, 24));
 }
 
 /// Presses Auto Crop and renders (the press is passive: no cache).
@@ -177,41 +148,38 @@ TEST_F(CropTool, AutoCropFindsTheBoxOfWhatDiffersFromTheBorder) {
     Ref<Image> out = AutoCrop(crp);
     ASSERT_NE(out, nullptr);
     // Columns 0 .. 33 and rows 0 .. 24: the corner pixel counts as content.
-    EXPECT_EQ(Control(crp, "XOffset"), 0.0);
-    EXPECT_EQ(Control(crp, "YOffset"), 0.0);
-    EXPECT_EQ(Control(crp, "XSize"), 34.0);
-    EXPECT_EQ(Control(crp, "YSize"), 25.0);
+    ExpectBox(crp, 0, 0, 34, 25);
     EXPECT_EQ(out->Width(), 34);
     EXPECT_EQ(out->Height(), 25);
 
     src->PutFlt(0, 0, bg);
     out = AutoCrop(crp);
     ASSERT_NE(out, nullptr);
-    EXPECT_EQ(Control(crp, "XOffset"), 10.0);
-    EXPECT_EQ(Control(crp, "YOffset"), 5.0);
-    EXPECT_EQ(Control(crp, "XSize"), 24.0);
-    EXPECT_EQ(Control(crp, "YSize"), 20.0);
+    ExpectBox(crp, 10, 5, 24, 20);
     ExpectCut(*out, *src, 10, 5, ImgRectI(0, 0, 24, 20));
 
     // Once done, a render without a press leaves the controls alone.
     SetNumber(crp, "XSize", 30);
     ASSERT_NE(Render(crp), nullptr);
     EXPECT_EQ(Control(crp, "XSize"), 30.0);
+
+    // On a proxy the box comes back in full-resolution pixels.
+    Ref<Image> proxy = FlatImage(20, 15, DepthRGBAFlt32, {});
+    proxy->FillWithin({1.f, 1.f, 1.f, 1.f}, ImgRectI(3, 4, 8, 6));
+    proxy->SetAttrsTagList({{ImgFullWidth, 40}, {ImgFullHeight, 30}});
+    OrvaneDoc d;
+    Operator *half = Make(proxy, 0, 0, 40, 30, &d);
+    ASSERT_NE(AutoCrop(half), nullptr);
+    ExpectBox(half, 6, 8, 10, 4);
 }
 
 TEST_F(CropTool, AutoCropOnAFlatImageChangesNothing) {
     for (int depth : {5, 6, 7, 8, 1, 4}) {
         SCOPED_TRACE(depth);
         OrvaneDoc d;
-        Operator *crp = AddTool(d, "Crop", AddProbe(d, FlatImage(40, 30, depth, {0.5f, 0.25f, 0.75f, 1.f})));
-        SetNumber(crp, "XOffset", 3);
-        SetNumber(crp, "XSize", 17);
-        SetNumber(crp, "YSize", 12);
+        Operator *crp = Make(FlatImage(40, 30, depth, {0.5f, 0.25f, 0.75f, 1.f}), 3, 0, 17, 12, &d);
         ASSERT_NE(AutoCrop(crp), nullptr);
-        EXPECT_EQ(Control(crp, "XOffset"), 3.0);
-        EXPECT_EQ(Control(crp, "YOffset"), 0.0);
-        EXPECT_EQ(Control(crp, "XSize"), 17.0);
-        EXPECT_EQ(Control(crp, "YSize"), 12.0);
+        ExpectBox(crp, 3, 0, 17, 12);
     }
 }
 
@@ -240,28 +208,12 @@ TEST_F(CropTool, AutoCropComparesTheChosenChannelsExactlyOrWithinAMillionth) {
         OrvaneDoc d;
         Ref<Image> src = FlatImage(30, 20, c.depth, c.bg);
         src->FillWithin(c.mark, ImgRectI(4, 6, 9, 8));
-        Operator *crp = AddTool(d, "Crop", AddProbe(d, src));
-        SetNumber(crp, "XSize", 30);
-        SetNumber(crp, "YSize", 20);
+        Operator *crp = Make(src, 0, 0, 30, 20, &d);
         SetNumber(crp, "Alpha", c.alphaOn ? 1 : 0);
         ASSERT_NE(AutoCrop(crp), nullptr);
-        const auto *w = dynamic_cast<const Number *>(crp->FindInput("XSize")->Constant().Get());
-        const auto *y = dynamic_cast<const Number *>(crp->FindInput("YOffset")->Constant().Get());
-        EXPECT_EQ(w->value, c.found ? 5.0 : 30.0);
-        EXPECT_EQ(y->value, c.found ? 6.0 : 0.0);
+        EXPECT_EQ(Control(crp, "XSize"), c.found ? 5.0 : 30.0);
+        EXPECT_EQ(Control(crp, "YOffset"), c.found ? 6.0 : 0.0);
     }
-}
-
-TEST_F(CropTool, AutoCropOfAProxyGivesFullResolutionControls) {
-    Ref<Image> src = FlatImage(20, 15, DepthRGBAFlt32, {});
-    src->FillWithin({1.f, 1.f, 1.f, 1.f}, ImgRectI(3, 4, 8, 6));
-    src->SetAttrsTagList({{ImgFullWidth, 40}, {ImgFullHeight, 30}});
-    Operator *crp = Make(src, 0, 0, 40, 30);
-    ASSERT_NE(AutoCrop(crp), nullptr);
-    EXPECT_EQ(Control(crp, "XOffset"), 6.0);
-    EXPECT_EQ(Control(crp, "YOffset"), 8.0);
-    EXPECT_EQ(Control(crp, "XSize"), 10.0);
-    EXPECT_EQ(Control(crp, "YSize"), 4.0);
 }
 
 } // namespace

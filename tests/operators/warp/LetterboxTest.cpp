@@ -15,9 +15,7 @@ protected:
     Operator *Make(Ref<Image> src, int w, int h, int mode = 0) {
         probe = AddProbe(doc, std::move(src));
         Operator *lbx = AddTool(doc, "Letterbox", probe);
-        SetNumber(lbx, "Width", w);
-        SetNumber(lbx, "Height", h);
-        SetNumber(lbx, "Mode", mode);
+        SetNumbers(lbx, {{"Width", w}, {"Height", h}, {"Mode", mode}});
         return lbx;
     }
     OrvaneDoc doc;
@@ -30,10 +28,9 @@ struct Placement {
 };
 
 /// The host's resizer with a placement, Linear filter, reading `read`.
-Ref<Image> Reference(const Image &src, int w, int h, const ImgRectI &window, const Placement &p, const ImgRectI &read,
-                     int filter = RszLinear) {
+Ref<Image> Reference(const Image &src, int w, int h, const ImgRectI &window, const Placement &p, const ImgRectI &read) {
     return DirectResize(src, w, h, window,
-                        {{ResizeFilter, filter},
+                        {{ResizeFilter, RszLinear},
                          {ResizeWindow, RszWindowHanning},
                          {ResizeXScale, p.xs},
                          {ResizeYScale, p.ys},
@@ -44,83 +41,61 @@ Ref<Image> Reference(const Image &src, int w, int h, const ImgRectI &window, con
                          {ResizeSourceWindow, &read}});
 }
 
-TEST_F(LetterboxTool, AWideFrameSitsBetweenBars) {
-    // 200 x 100 into 100 x 100: sh = 100 x (100 x 1 / 1) / (200 x 1) = 50, placed 25 up.
-    Ref<Image> src = PatternImage(200, 100, 8, 1);
-    Operator *lbx = Make(src, 100, 100);
-    Ref<Image> out = Render(lbx);
-    ASSERT_NE(out, nullptr);
-    EXPECT_EQ(out->Width(), 100);
-    EXPECT_EQ(out->Height(), 100);
-    EXPECT_EQ(out->DataWindow(), ImgRectI(0, 25, 100, 75));
-    EXPECT_TRUE(out->IsCanvasColorClear());
-    const Placement p{0.5, 0.5, 0.0, 25.0, EdgeDuplicate, EdgeCanvas};
-    Ref<Image> ref = Reference(*src, 100, 100, out->DataWindow(), p, src->Frame());
-    ExpectSamePixels(*out, *ref, ImgRectI(-2, -2, 102, 102));
-
-    // With no excess the centre changes nothing.
-    SetPoint(lbx, "Center", 0.2, 0.9);
-    Ref<Image> moved = Render(lbx);
-    ASSERT_NE(moved, nullptr);
-    EXPECT_EQ(moved->DataWindow(), out->DataWindow());
-    ExpectSamePixels(*moved, *out, ImgRectI(0, 0, 100, 100));
-}
-
-TEST_F(LetterboxTool, ATallFramePansWithinItsExcess) {
-    // 100 x 200 into 100 x 100: sh = 200, excess e = 50 on each side.
-    Ref<Image> src = PatternImage(100, 200, 8, 2);
-    Operator *lbx = Make(src, 100, 100);
+TEST_F(LetterboxTool, ModesPlaceAndPanTheFrameAsWorkedOutByHand) {
+    constexpr int D = EdgeDuplicate, C = EdgeCanvas;
     struct Case {
-        double cy, oy;
+        const char *what;
+        int w, h, mode;
+        double cx, cy, aspectX;
+        ImgRectI window;
+        Placement p;
     };
-    // oy = clamp((0.5 - cy) x 200, -50, 50); the source's origin lands at (100 - 200) / 2 + oy.
-    for (const Case c : {Case{0.5, 0.0}, Case{0.6, -20.0}, Case{1.0, -50.0}, Case{-3.0, 50.0}}) {
-        SCOPED_TRACE(c.cy);
-        SetPoint(lbx, "Center", 0.5, c.cy);
+    const Case cases[] = {
+        // 200 x 100 into 100 x 100: sh = 100 x (100 x 1 / 1) / (200 x 1) = 50, placed 25 up.
+        {"wide between bars", 200, 100, 0, 0.5, 0.5, 1.0, {0, 25, 100, 75}, {0.5, 0.5, 0, 25, D, C}},
+        {"no excess: the centre changes nothing",
+         200,
+         100,
+         0,
+         0.2,
+         0.9,
+         1.0,
+         {0, 25, 100, 75},
+         {0.5, 0.5, 0, 25, D, C}},
+        // 100 x 200: sh = 200, excess 50 on each side; oy = clamp((0.5 - cy) x 200, -50, 50)
+        // and the source's origin lands at (100 - 200) / 2 + oy.
+        {"tall, centred", 100, 200, 0, 0.5, 0.5, 1.0, {0, -50, 100, 150}, {1, 1, 0, -50, D, C}},
+        {"tall, panned", 100, 200, 0, 0.5, 0.6, 1.0, {0, -70, 100, 130}, {1, 1, 0, -70, D, C}},
+        {"tall, pan clamped low", 100, 200, 0, 0.5, 1.0, 1.0, {0, -100, 100, 100}, {1, 1, 0, -100, D, C}},
+        {"tall, pan clamped high", 100, 200, 0, 0.5, -3.0, 1.0, {0, 0, 100, 200}, {1, 1, 0, 0, D, C}},
+        // Pan and scan: sw = 200 x (100 x 1 / 1) / (100 x 1) = 200, e = 50.
+        {"pan and scan", 200, 100, 1, 0.5, 0.5, 1.0, {-50, 0, 150, 100}, {1, 1, -50, 0, C, D}},
+        // Center X 0.1: (0.5 - 0.1) x 200 = 80, clamped to 50: the left edge shows.
+        {"pan and scan, clamped", 200, 100, 1, 0.1, 0.5, 1.0, {0, 0, 200, 100}, {1, 1, 0, 0, C, D}},
+        // At 0.5 : 1 the frame needs sh = 100 x (100 x 0.5) / 200 = 25 lines: 37.5 .. 62.5 outward.
+        {"output pixel aspect", 200, 100, 0, 0.5, 0.5, 0.5, {0, 37, 100, 63}, {0.5, 0.25, 0, 37.5, D, C}},
+    };
+    for (const Case &c : cases) {
+        SCOPED_TRACE(c.what);
+        OrvaneDoc d;
+        Ref<Image> src = PatternImage(c.w, c.h, 8, c.w + c.h);
+        Operator *lbx = AddTool(d, "Letterbox", AddProbe(d, src));
+        SetNumbers(lbx, {{"Width", 100}, {"Height", 100}, {"Mode", c.mode}});
+        SetPoint(lbx, "Center", c.cx, c.cy);
+        SetPoint(lbx, "PixelAspect", c.aspectX, 1.0);
         Ref<Image> out = Render(lbx);
         ASSERT_NE(out, nullptr);
-        const double origin = -50.0 + c.oy;
-        EXPECT_EQ(out->DataWindow(), ImgRectI(0, static_cast<int>(origin), 100, static_cast<int>(origin) + 200));
-        const Placement p{1.0, 1.0, 0.0, origin, EdgeDuplicate, EdgeCanvas};
-        Ref<Image> ref = Reference(*src, 100, 100, out->DataWindow(), p, src->Frame());
-        ExpectSamePixels(*out, *ref, ImgRectI(0, 0, 100, 100));
+        EXPECT_EQ(out->Width(), 100);
+        EXPECT_EQ(out->Height(), 100);
+        EXPECT_DOUBLE_EQ(out->XScale(), c.aspectX);
+        EXPECT_TRUE(out->IsCanvasColorClear());
+        EXPECT_EQ(out->DataWindow(), c.window);
+        Ref<Image> ref = Reference(*src, 100, 100, out->DataWindow(), c.p, src->Frame());
+        ExpectSamePixels(*out, *ref, ImgRectI(-2, -2, 102, 102));
+        // The legacy pair is kept for documents but read by nothing.
+        SetNumber(lbx, "AspectX", 3.0);
+        EXPECT_EQ(Render(lbx)->DataWindow(), c.window);
     }
-}
-
-TEST_F(LetterboxTool, PanAndScanSpansTheHeight) {
-    // 200 x 100 into 100 x 100: sw = 200 x (100 x 1 / 1) / (100 x 1) = 200, e = 50.
-    Ref<Image> src = PatternImage(200, 100, 8, 3);
-    Operator *lbx = Make(src, 100, 100, 1);
-    Ref<Image> out = Render(lbx);
-    ASSERT_NE(out, nullptr);
-    EXPECT_EQ(out->DataWindow(), ImgRectI(-50, 0, 150, 100));
-    Placement p{1.0, 1.0, -50.0, 0.0, EdgeCanvas, EdgeDuplicate};
-    ExpectSamePixels(*out, *Reference(*src, 100, 100, out->DataWindow(), p, src->Frame()), ImgRectI(0, 0, 100, 100));
-
-    // Center X = 0.1: (0.5 - 0.1) x 200 = 80, clamped to 50: the left edge shows.
-    SetPoint(lbx, "Center", 0.1, 0.5);
-    out = Render(lbx);
-    ASSERT_NE(out, nullptr);
-    EXPECT_EQ(out->DataWindow(), ImgRectI(0, 0, 200, 100));
-    p.ox = 0.0;
-    ExpectSamePixels(*out, *Reference(*src, 100, 100, out->DataWindow(), p, src->Frame()), ImgRectI(0, 0, 100, 100));
-}
-
-TEST_F(LetterboxTool, TheOutputsPixelAspectShapesThePicture) {
-    // At 0.5 : 1 a 200 x 100 square-pixel frame needs sh = 100 x (100 x 0.5) / 200 = 25 lines.
-    Ref<Image> src = PatternImage(200, 100, 8, 4);
-    Operator *lbx = Make(src, 100, 100);
-    SetPoint(lbx, "PixelAspect", 0.5, 1.0);
-    Ref<Image> out = Render(lbx);
-    ASSERT_NE(out, nullptr);
-    EXPECT_DOUBLE_EQ(out->XScale(), 0.5);
-    EXPECT_DOUBLE_EQ(out->YScale(), 1.0);
-    EXPECT_EQ(out->DataWindow(), ImgRectI(0, 37, 100, 63)); // 37.5 .. 62.5 outward
-    const Placement p{0.5, 0.25, 0.0, 37.5, EdgeDuplicate, EdgeCanvas};
-    ExpectSamePixels(*out, *Reference(*src, 100, 100, out->DataWindow(), p, src->Frame()), ImgRectI(0, 0, 100, 100));
-    // The legacy pair is kept for documents but read by nothing.
-    SetNumber(lbx, "AspectX", 3.0);
-    EXPECT_EQ(Render(lbx)->DataWindow(), out->DataWindow());
 }
 
 TEST_F(LetterboxTool, FramingMakesACanvasRealAndClearsWhatLiesBeyond) {
@@ -175,8 +150,7 @@ TEST_F(LetterboxTool, ProxyFieldsAndTheFrameFormat) {
     field->SetScale(1.0, 2.0);
     field->SetAttrsTagList({{ImgField, 0}});
     Operator *flbx = AddTool(d, "Letterbox", AddProbe(d, field));
-    SetNumber(flbx, "Width", 100);
-    SetNumber(flbx, "Height", 100);
+    SetNumbers(flbx, {{"Width", 100}, {"Height", 100}});
     out = Render(flbx);
     ASSERT_NE(out, nullptr);
     EXPECT_EQ(out->Height(), 50);
@@ -187,9 +161,7 @@ TEST_F(LetterboxTool, ProxyFieldsAndTheFrameFormat) {
     doc.SetPref(PREF_FFWidth, 160);
     doc.SetPref(PREF_FFHeight, 90);
     SetNumber(lbx, "UseFrameFormatSettings", 1);
-    const auto *w = dynamic_cast<const Number *>(lbx->FindInput("Width")->Constant().Get());
-    ASSERT_NE(w, nullptr);
-    EXPECT_EQ(w->value, 160.0);
+    EXPECT_EQ(Control(lbx, "Width"), 160.0);
     out = Render(lbx);
     ASSERT_NE(out, nullptr);
     EXPECT_EQ(out->Width(), 160);
@@ -200,20 +172,10 @@ TEST_F(LetterboxTool, ARegionOfInterestGivesTheWholeFramesPixels) {
     for (int mode : {0, 1}) {
         SCOPED_TRACE(mode);
         OrvaneDoc d;
-        ProbeSource *p = AddProbe(d, PatternImage(90, 40, 8, 8));
-        Operator *lbx = AddTool(d, "Letterbox", p);
-        SetNumber(lbx, "Width", 64);
-        SetNumber(lbx, "Height", 48);
-        SetNumber(lbx, "Mode", mode);
-        SetNumber(lbx, "FilterMethod", 8);
+        Operator *lbx = AddTool(d, "Letterbox", AddProbe(d, PatternImage(90, 40, 8, 8)));
+        SetNumbers(lbx, {{"Width", 64}, {"Height", 48}, {"Mode", mode}, {"FilterMethod", 8}});
         SetPoint(lbx, "Center", 0.3, 0.3);
-        Ref<Image> whole = Render(lbx);
-        ASSERT_NE(whole, nullptr);
-        for (const ImgRectI roi : {ImgRectI(0, 0, 9, 48), ImgRectI(30, 20, 40, 30), ImgRectI(60, 40, 64, 48)}) {
-            Ref<Image> part = Render(lbx, {.roi = roi});
-            ASSERT_NE(part, nullptr);
-            ExpectSamePixels(*part, *whole, roi);
-        }
+        ExpectRegionsMatchWhole(lbx, {ImgRectI(0, 0, 9, 48), ImgRectI(30, 20, 40, 30), ImgRectI(60, 40, 64, 48)});
     }
 }
 

@@ -1,6 +1,6 @@
-// Scale: the parity rule worked by hand, fields and proxies, the window's
-// reach, a size of zero, pixels against the host's resizer called directly,
-// and regions of interest against whole frames.
+// Scale: the parity rule, fields, proxies, the window's reach and the lock
+// worked out by hand, a size of zero, pixels against the host's resizer
+// called directly, and regions of interest against whole frames.
 #include "tests/operators/warp/WarpTestSupport.h"
 
 namespace Orvane::WarpTest::ScaleT {
@@ -9,22 +9,7 @@ namespace {
 class ScaleTool : public ::testing::Test {
 protected:
     static void SetUpTestSuite() { LoadOperators(); }
-    Operator *Make(Ref<Image> src, double x, double y = -1.0) {
-        probe = AddProbe(doc, std::move(src));
-        Operator *scl = AddTool(doc, "Scale", probe);
-        SetNumber(scl, "XSize", x);
-        if (y >= 0.0) {
-            SetNumber(scl, "LockXY", 0);
-            SetNumber(scl, "YSize", y);
-        }
-        return scl;
-    }
-    OrvaneDoc doc;
-    ProbeSource *probe = nullptr;
 };
-
-/// An image of w x h without pixels: enough for the windows.
-Ref<Image> Frame(int w, int h) { return NewImageTagList({{ImgWidth, w}, {ImgHeight, h}}); }
 
 TEST_F(ScaleTool, TheSizeKeepsItsParity) {
     // x = w / 2 x s; odd w: ceil(x - 1/2) + 1/2, even w: ceil(x); side = truncate(2x + 1/2).
@@ -36,62 +21,67 @@ TEST_F(ScaleTool, TheSizeKeepsItsParity) {
     const Case cases[] = {{5, 1.0, 5},  {5, 0.5, 3}, {6, 0.5, 4},      {7, 0.5, 5},      {4, 1.3, 6}, {9, 2.0, 19},
                           {8, 0.25, 2}, {1, 0.1, 1}, {1920, 0.5, 960}, {1921, 0.5, 961}, {3, 3.0, 9}, {2, 0.01, 2}};
     for (const Case &c : cases) {
-        SCOPED_TRACE(testing::Message() << c.w << " at " << c.s);
         OrvaneDoc d;
-        Operator *scl = AddTool(d, "Scale", AddProbe(d, Frame(c.w, 10)));
+        Operator *scl = AddTool(d, "Scale", AddProbe(d, NewImageTagList({{ImgWidth, c.w}, {ImgHeight, 10}})));
         SetNumber(scl, "XSize", c.s);
         Ref<Image> shape = Shape(scl);
         ASSERT_NE(shape, nullptr);
-        EXPECT_EQ(shape->Width(), c.expected);
-        EXPECT_EQ(shape->Width() % 2, c.w % 2);
+        EXPECT_EQ(shape->Width(), c.expected) << c.w << " at " << c.s;
     }
 }
 
-TEST_F(ScaleTool, FieldsCountTheirFramesHeightAndProxiesDivide) {
-    // A field of a 40 x 30 frame: 30 at 0.5 gives 7.5, up to 8: 16 lines, 8 per field.
-    Ref<Image> field = NewImageTagList({{ImgWidth, 40}, {ImgHeight, 15}, {ImgYScale, 2.0}, {ImgField, 0}});
-    Operator *scl = Make(field, 0.5);
-    Ref<Image> shape = Shape(scl);
-    ASSERT_NE(shape, nullptr);
-    EXPECT_EQ(shape->Width(), 20);
-    EXPECT_EQ(shape->Height(), 8);
-
-    // A half-size proxy of a 45 x 30 frame, scaled by 1.2: 45 x 0.6 = 27 (odd),
-    // ceil(26.5) + 0.5 = 27.5 -> 55; 30 x 0.6 = 18 -> 36; halved: 27 x 18.
-    OrvaneDoc d;
-    Ref<Image> proxy = NewImageTagList({{ImgWidth, 22}, {ImgHeight, 15}, {ImgFullWidth, 45}, {ImgFullHeight, 30}});
-    Operator *scl2 = AddTool(d, "Scale", AddProbe(d, proxy));
-    SetNumber(scl2, "XSize", 1.2);
-    shape = Shape(scl2, {.proxy = 2});
-    ASSERT_NE(shape, nullptr);
-    EXPECT_EQ(shape->Width(), 27);
-    EXPECT_EQ(shape->Height(), 18);
-    EXPECT_EQ(shape->GetAttrL(ImgFullWidth), 55);
-    EXPECT_EQ(shape->GetAttrL(ImgFullHeight), 36);
-}
-
-TEST_F(ScaleTool, TheWindowGrowsByTheFiltersReach) {
-    // Linear (radius 1) at 0.5 reaches 2 source pixels: (0 - 2) x 0.5 = -1, (40 + 2) x 0.5 = 21, (30 + 2) x 0.5 = 16.
-    Operator *scl = Make(Frame(40, 30), 0.5);
-    Ref<Image> shape = Shape(scl);
-    ASSERT_NE(shape, nullptr);
-    EXPECT_EQ(shape->DataWindow(), ImgRectI(-1, -1, 21, 16));
-    // Duplicate edges and Nearest Neighbor do not grow it.
-    SetNumber(scl, "Edges", 1);
-    EXPECT_EQ(Shape(scl)->DataWindow(), ImgRectI(0, 0, 20, 15));
-    SetNumber(scl, "Edges", 0);
-    SetNumber(scl, "FilterMethod", 0);
-    EXPECT_EQ(Shape(scl)->DataWindow(), ImgRectI(0, 0, 20, 15));
-    // Enlarging, the reach is the filter's own radius: Lanczos 3 at 2: (0 - 3) x 2, (40 + 3) x 2.
-    SetNumber(scl, "FilterMethod", 8);
-    SetNumber(scl, "XSize", 2.0);
-    EXPECT_EQ(Shape(scl)->DataWindow(), ImgRectI(-6, -6, 86, 66));
+TEST_F(ScaleTool, FieldsProxiesReachAndLockWorkedOutByHand) {
+    struct Case {
+        const char *what;
+        Ref<Image> src;
+        std::vector<std::pair<const char *, double>> controls;
+        int proxy, w, h;
+        ImgRectI window; ///< checked when not empty
+    };
+    // A field of a 40 x 30 frame: 30 at 0.5 gives 7.5, up to 8: 16 lines, 8 per field. A
+    // half-size proxy of a 45 x 30 frame at 1.2: 45 x 0.6 = 27 (odd), ceil(26.5) + 0.5 = 27.5
+    // -> 55; 30 x 0.6 = 18 -> 36; halved: 27 x 18.
+    const Ref<Image> frame = NewImageTagList({{ImgWidth, 40}, {ImgHeight, 30}});
+    const Ref<Image> field = NewImageTagList({{ImgWidth, 40}, {ImgHeight, 15}, {ImgYScale, 2.0}, {ImgField, 0}});
+    const Ref<Image> proxy =
+        NewImageTagList({{ImgWidth, 22}, {ImgHeight, 15}, {ImgFullWidth, 45}, {ImgFullHeight, 30}});
+    const Case cases[] = {
+        {"field", field, {{"XSize", 0.5}}, 1, 20, 8, {}},
+        {"proxy", proxy, {{"XSize", 1.2}}, 2, 27, 18, {}},
+        // Linear (radius 1) at 0.5 reaches 2 source pixels: (0 - 2) x 0.5 = -1, (40 + 2) x 0.5 = 21.
+        {"linear reach", frame, {{"XSize", 0.5}}, 1, 20, 16, {-1, -1, 21, 16}},
+        {"duplicated edges do not grow it", frame, {{"XSize", 0.5}, {"Edges", 1}}, 1, 20, 16, {0, 0, 20, 15}},
+        {"nor does the nearest pixel", frame, {{"XSize", 0.5}, {"FilterMethod", 0}}, 1, 20, 16, {0, 0, 20, 15}},
+        // Enlarging, the reach is the filter's own radius: Lanczos 3 at 2: (0 - 3) x 2, (40 + 3) x 2.
+        {"lanczos enlarging", frame, {{"XSize", 2.0}, {"FilterMethod", 8}}, 1, 80, 60, {-6, -6, 86, 66}},
+        {"locked: Y Size ignored", frame, {{"XSize", 0.5}, {"YSize", 3.0}}, 1, 20, 16, {}},
+        {"unlocked", frame, {{"XSize", 0.5}, {"YSize", 3.0}, {"LockXY", 0}}, 1, 20, 90, {}},
+    };
+    for (const Case &c : cases) {
+        SCOPED_TRACE(c.what);
+        OrvaneDoc d;
+        Operator *scl = AddTool(d, "Scale", AddProbe(d, c.src));
+        SetNumbers(scl, c.controls);
+        EXPECT_EQ(scl->FindInput("YSize")->IsVisible(), Control(scl, "LockXY") == 0.0);
+        Ref<Image> shape = Shape(scl, {.proxy = c.proxy});
+        ASSERT_NE(shape, nullptr);
+        EXPECT_EQ(shape->Width(), c.w);
+        EXPECT_EQ(shape->Height(), c.h);
+        EXPECT_TRUE(c.window.IsNull() || shape->DataWindow() == c.window);
+        if (c.proxy > 1) {
+            EXPECT_EQ(shape->GetAttrL(ImgFullWidth), 55);
+            EXPECT_EQ(shape->GetAttrL(ImgFullHeight), 36);
+        }
+    }
 }
 
 TEST_F(ScaleTool, ASizeOfZeroGivesZerosAndAsksForNothing) {
+    OrvaneDoc doc;
     Ref<Image> src = PatternImage(40, 30);
     src->SetCanvasColor(FltPixel{0.5f, 0.5f, 0.5f, 1.f});
-    Operator *scl = Make(src, 0.0, 1.0);
+    ProbeSource *probe = AddProbe(doc, src);
+    Operator *scl = AddTool(doc, "Scale", probe);
+    SetNumbers(scl, {{"LockXY", 0}, {"XSize", 0.0}, {"YSize", 1.0}});
     Ref<Image> out = Render(scl, {.roi = ImgRectI(0, 0, 1, 30)});
     ASSERT_NE(out, nullptr);
     EXPECT_TRUE(out->DataWindow().IsNull());
@@ -101,8 +91,7 @@ TEST_F(ScaleTool, ASizeOfZeroGivesZerosAndAsksForNothing) {
     ASSERT_TRUE(probe->asked[0].has_value());
     EXPECT_TRUE(probe->asked[0]->rect.IsNull()); // collapsed on the middle of the region
     // Negative sizes count as not above zero.
-    SetNumber(scl, "YSize", -2.0);
-    SetNumber(scl, "XSize", 1.0);
+    SetNumbers(scl, {{"YSize", -2.0}, {"XSize", 1.0}});
     out = Render(scl);
     ASSERT_NE(out, nullptr);
     EXPECT_TRUE(out->DataWindow().IsNull());
@@ -120,11 +109,8 @@ TEST_F(ScaleTool, PixelsAreTheHostResizersAtTheExactFactors) {
         OrvaneDoc d;
         Ref<Image> src = PatternImage(37, 29, c.depth, 11);
         Operator *scl = AddTool(d, "Scale", AddProbe(d, src));
-        SetNumber(scl, "LockXY", 0);
-        SetNumber(scl, "XSize", c.x);
-        SetNumber(scl, "YSize", c.y);
-        SetNumber(scl, "Edges", c.edges);
-        SetNumber(scl, "FilterMethod", c.method);
+        SetNumbers(scl,
+                   {{"LockXY", 0}, {"XSize", c.x}, {"YSize", c.y}, {"Edges", c.edges}, {"FilterMethod", c.method}});
         Ref<Image> out = Render(scl);
         ASSERT_NE(out, nullptr);
         const int edges = c.edges ? EdgeDuplicate : EdgeCanvas;
@@ -145,32 +131,12 @@ TEST_F(ScaleTool, ARegionOfInterestGivesTheWholeFramesPixels) {
     for (double s : {0.45, 1.0, 2.3}) {
         SCOPED_TRACE(s);
         OrvaneDoc d;
-        ProbeSource *p = AddProbe(d, PatternImage(50, 40, 8, 3));
-        Operator *scl = AddTool(d, "Scale", p);
-        SetNumber(scl, "XSize", s);
-        SetNumber(scl, "FilterMethod", 8);
-        Ref<Image> whole = Render(scl);
-        ASSERT_NE(whole, nullptr);
-        const ImgRectI dw = whole->DataWindow();
-        for (const ImgRectI roi : {ImgRectI(dw.x0, dw.y0, dw.x0 + 5, dw.y0 + 4), ImgRectI(7, 9, 13, 30),
-                                   ImgRectI(dw.x1 - 3, dw.y1 - 8, dw.x1, dw.y1)}) {
-            Ref<Image> part = Render(scl, {.roi = roi});
-            ASSERT_NE(part, nullptr);
-            ExpectSamePixels(*part, *whole, roi);
-        }
+        Operator *scl = AddTool(d, "Scale", AddProbe(d, PatternImage(50, 40, 8, 3)));
+        SetNumbers(scl, {{"XSize", s}, {"FilterMethod", 8}});
+        const ImgRectI dw = Shape(scl)->DataWindow();
+        ExpectRegionsMatchWhole(scl, {ImgRectI(dw.x0, dw.y0, dw.x0 + 5, dw.y0 + 4), ImgRectI(7, 9, 13, 30),
+                                      ImgRectI(dw.x1 - 3, dw.y1 - 8, dw.x1, dw.y1)});
     }
-}
-
-TEST_F(ScaleTool, LockingHidesTheYSizeAndScalesBothAxesByX) {
-    Operator *scl = Make(Frame(40, 30), 0.5);
-    EXPECT_FALSE(scl->FindInput("YSize")->IsVisible());
-    SetNumber(scl, "YSize", 3.0); // ignored while locked
-    Ref<Image> shape = Shape(scl);
-    ASSERT_NE(shape, nullptr);
-    EXPECT_EQ(shape->Height(), 16);
-    SetNumber(scl, "LockXY", 0);
-    EXPECT_TRUE(scl->FindInput("YSize")->IsVisible());
-    EXPECT_EQ(Shape(scl)->Height(), 90);
 }
 
 } // namespace

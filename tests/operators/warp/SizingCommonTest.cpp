@@ -1,7 +1,6 @@
 // The shared sizing vocabulary on its own: window arithmetic against
-// hand-worked corners, the source's format from its attributes, the aspect
-// keeping sizes, the attributes written back, and the coefficient tables
-// kept while their key holds.
+// hand-worked corners, the aspect keeping sizes, the attributes written back,
+// and the coefficient tables kept while their key holds.
 #include <gtest/gtest.h>
 
 #include <cmath>
@@ -11,14 +10,14 @@
 #include "host/image/NewImage.h"
 #include "host/image/ResizeFilters.h"
 #include "operators/warp/SizingCommon.h"
-#include "tests/support/TestSupport.h"
+#include "tests/operators/warp/WarpTestSupport.h"
 
 namespace Orvane::WarpTest::Common {
 namespace {
 
 constexpr int E = DomainEndless;
 
-TEST(SizingWindows, ScaledCornersRoundOutwardInSinglePrecision) {
+TEST(SizingWindows, CornersRoundOutwardEndlessSidesStayAndPlacingInverts) {
     // Hand-worked: 3 x 0.5 = 1.5 down to 1, -5 x 1.5 = -7.5 down to -8,
     // 17 x 0.5 = 8.5 up to 9, 9 x 1.5 = 13.5 up to 14.
     EXPECT_EQ(ScaleWindow(ImgRectI(3, -5, 17, 9), 0.5f, 1.5f), ImgRectI(1, -8, 9, 14));
@@ -27,16 +26,12 @@ TEST(SizingWindows, ScaledCornersRoundOutwardInSinglePrecision) {
     EXPECT_EQ(ScaleWindow(ImgRectI(0, 0, 21, 21), 1.f / 7.f, 1.f / 7.f), ImgRectI(0, 0, 4, 4));
     // A reach grows each side before scaling: (2 - 1.5) x 2 = 1, (10 + 1.5) x 2 = 23.
     EXPECT_EQ(ScaleWindow(ImgRectI(2, 2, 10, 10), 2.f, 2.f, 1.5f, 0.f), ImgRectI(1, 4, 23, 20));
-}
 
-TEST(SizingWindows, EndlessSidesStayWhereTheyAre) {
     EXPECT_EQ(ScaleWindow(ImgRectI(-E, 4, E, E), 0.25f, 3.f), ImgRectI(-E, 12, E, E));
     EXPECT_EQ(ScaleWindow(ImgRectI(-E, -E, 7, E), 0.5f, 0.5f, 2.f, 2.f), ImgRectI(-E, -E, 5, E));
     EXPECT_EQ(PlaceWindow(ImgRectI(-E, 0, 10, E), 0.5, 2.0, 3.25, -1.0), ImgRectI(-E, -1, 9, E));
     EXPECT_EQ(SourceRegion(ImgRectI(-E, 3, E, 8), 2.0, 2.0, 1.0, 1.0), ImgRectI(-E, 5, E, 17));
-}
 
-TEST(SizingWindows, PlacedAndSourceRegionsInvertEachOther) {
     // Placing (x0 x 0.5 + 3.25): 4 -> 5.25 down to 5, 10 -> 8.25 up to 9.
     EXPECT_EQ(PlaceWindow(ImgRectI(4, 4, 10, 10), 0.5, 0.5, 3.25, 0.0), ImgRectI(5, 2, 9, 5));
     // Back: (5 - 3.25) x 2 - 1 = 2.5 down to 2, (9 - 3.25) x 2 + 1 = 12.5 up to 13.
@@ -50,60 +45,23 @@ TEST(SizingWindows, PlacedAndSourceRegionsInvertEachOther) {
         }
 }
 
-TEST(SizingFormat, AttributesOrTheImagesOwnValues) {
-    Ref<Image> plain = NewImageTagList({{ImgWidth, 64}, {ImgHeight, 36}, {ImgXScale, 1.5}, {ImgYScale, 0.75}});
-    const SourceFormat a = ReadSourceFormat(*plain);
-    EXPECT_EQ(a.fullWidth, 64);
-    EXPECT_EQ(a.fullHeight, 36);
-    EXPECT_DOUBLE_EQ(a.aspectX, 1.5);
-    EXPECT_DOUBLE_EQ(a.aspectY, 0.75);
-    EXPECT_FALSE(a.IsField());
-    EXPECT_FALSE(a.fullWidthAttr || a.fullHeightAttr || a.fullXScaleAttr || a.fullYScaleAttr);
-
-    // A proxy of a 1920 x 1080 frame at half size, square pixels at full resolution.
-    Ref<Image> proxy = NewImageTagList({{ImgWidth, 960},
-                                        {ImgHeight, 540},
-                                        {ImgXScale, 2.0},
-                                        {ImgYScale, 2.0},
-                                        {ImgFullWidth, 1920},
-                                        {ImgFullHeight, 1080},
-                                        {ImgFullXScale, 1.0},
-                                        {ImgFullYScale, 1.0}});
-    const SourceFormat b = ReadSourceFormat(*proxy);
-    EXPECT_EQ(b.fullWidth, 1920);
-    EXPECT_EQ(b.fullHeight, 1080);
-    EXPECT_DOUBLE_EQ(b.aspectX, 1.0);
-    EXPECT_DOUBLE_EQ(b.FrameAspect(), 16.0 / 9.0);
-
-    // One field of a 720 x 486 frame: 243 lines, each standing for two.
-    Ref<Image> field = NewImageTagList({{ImgWidth, 720},
-                                        {ImgHeight, 243},
-                                        {ImgXScale, 0.9},
-                                        {ImgYScale, 1.8},
-                                        {ImgField, 1},
-                                        {ImgFieldOffset, 0.5 / 243}});
-    const SourceFormat c = ReadSourceFormat(*field);
-    EXPECT_TRUE(c.IsField());
-    EXPECT_EQ(c.fullHeight, 486);
-    EXPECT_DOUBLE_EQ(c.aspectY, 0.9);
-    EXPECT_DOUBLE_EQ(c.FrameAspect(), 720 * 0.9 / (486 * 0.9));
-}
-
-TEST(SizingFormat, AspectKeepingSizes) {
+TEST(SizingFormat, AspectKeepingSizesAndListChoices) {
     SourceFormat hd;
     hd.width = hd.fullWidth = 1920;
     hd.height = hd.fullHeight = 1080;
-    // 1280 wide at square pixels: 720. At a target pixel aspect of 0.9 : 1
-    // each pixel is narrower, so fewer lines: 1280 x 0.9 / (16 / 9) = 648.
-    EXPECT_EQ(HeightKeepingAspect(hd, 1280, 1.0, 1.0), 720);
+    // At a target pixel aspect of 0.9 : 1 each pixel is narrower, so fewer
+    // lines: 1280 x 0.9 / (16 / 9) = 648; 1000 x 9 / 16 = 562.5 rounds up.
     EXPECT_EQ(HeightKeepingAspect(hd, 1280, 0.9, 1.0), 648);
-    EXPECT_EQ(WidthKeepingAspect(hd, 720, 1.0, 1.0), 1280);
-    // 1000 x 9 / 16 = 562.5 rounds up.
     EXPECT_EQ(HeightKeepingAspect(hd, 1000, 1.0, 1.0), 563);
+    EXPECT_EQ(WidthKeepingAspect(hd, 720, 1.0, 1.0), 1280);
     // A zero aspect gives no finite size: the result stays within
     // 1..MaxFrameSize() rather than wrapping.
     EXPECT_EQ(WidthKeepingAspect(hd, 720, 0.0, 1.0), static_cast<int>(MaxFrameSize()));
     EXPECT_EQ(HeightKeepingAspect(hd, 1280, 0.0, 1.0), 1);
+    // A list choice is its rounded number, kept within the list.
+    EXPECT_EQ(FilterValue(4.6), RszCatmullRom);
+    EXPECT_EQ(FilterValue(14), RszBessel);
+    EXPECT_EQ(WindowValue(3), RszWindowKaiser);
 }
 
 TEST(SizingFormat, AttributesFollowTheResultAndKeepTheProxyRatio) {
@@ -139,15 +97,6 @@ TEST(SizingFormat, AttributesFollowTheResultAndKeepTheProxyRatio) {
     EXPECT_DOUBLE_EQ(out2->YScale(), 2.0);
 }
 
-TEST(SizingChoices, FilterAndWindowNumbersTheHostTakes) {
-    EXPECT_EQ(FilterValue(0), RszNearest);
-    EXPECT_EQ(FilterValue(2), RszLinear);
-    EXPECT_EQ(FilterValue(10), RszBessel);
-    EXPECT_EQ(FilterValue(4.6), RszCatmullRom); // a list choice is its rounded number
-    EXPECT_EQ(WindowValue(0), RszWindowHanning);
-    EXPECT_EQ(WindowValue(3), RszWindowKaiser);
-}
-
 /// A source and a destination for the table tests.
 struct Pair {
     Ref<Image> src = NewImageTagList({{ImgWidth, 40}, {ImgHeight, 30}, {ImgDepth, DepthRGBAFlt32}});
@@ -168,65 +117,46 @@ struct Pair {
 TEST(SizingTables, KeptWhileTheKeyHoldsAndRebuiltOnAnyChange) {
     Pair p;
     ResizeTables tables;
-    ASSERT_TRUE(tables.Prepare(*p.src, p.dst.Get(), p.key, p.tags));
-    EXPECT_EQ(tables.Builds(), 1);
-    void *x = tables.XTable(), *y = tables.YTable();
-    ASSERT_NE(x, nullptr);
-    ASSERT_NE(y, nullptr);
-    ASSERT_TRUE(tables.Prepare(*p.src, p.dst.Get(), p.key, p.tags));
-    EXPECT_EQ(tables.Builds(), 1);
-    EXPECT_EQ(tables.XTable(), x); // the very same tables
-    EXPECT_EQ(tables.YTable(), y);
-
-    // Each part of the key on its own makes new tables.
-    const auto changes = std::vector<void (*)(ResizeKey &)>{
-        [](ResizeKey &k) { k.srcFrame.x1 += 1; },
-        [](ResizeKey &k) { k.srcWindow.y0 -= 2; },
-        [](ResizeKey &k) { k.dstFrame.y1 += 1; },
-        [](ResizeKey &k) { k.dstWindow.x1 -= 3; },
-        [](ResizeKey &k) { k.readWindow.x1 = 9; },
-        [](ResizeKey &k) { k.filter = RszLanczos; },
-        [](ResizeKey &k) { k.window = RszWindowKaiser; },
-        [](ResizeKey &k) { k.xEdges = EdgeDuplicate; },
-        [](ResizeKey &k) { k.yEdges = EdgeMirror; },
-        [](ResizeKey &k) { k.xScale = 0.25; },
-        [](ResizeKey &k) { k.yScale = 0.5; },
-        [](ResizeKey &k) { k.xOffset = 1.5; },
-        [](ResizeKey &k) { k.yOffset = -2.0; },
-    };
+    // A second frame with the same key: the very same tables, resampling as fresh ones.
+    Ref<Image> src = Orvane::Test::PatternImage(40, 30), fresh = NewImageTagList({{ImgLikeImage, p.dst.Get()}});
+    ASSERT_TRUE(fresh->AllocScanLineData() && src->ResizeTagList(fresh.Get(), p.tags));
+    void *x = nullptr, *y = nullptr;
+    for (int frame = 0; frame < 2; ++frame) {
+        Ref<Image> out = NewImageTagList({{ImgLikeImage, p.dst.Get()}});
+        ASSERT_TRUE(ResizeInto(*src, out.Get(), tables, p.key, p.tags));
+        EXPECT_EQ(tables.Builds(), 1);
+        EXPECT_TRUE(tables.XTable() && tables.YTable());
+        EXPECT_TRUE(frame == 0 || (tables.XTable() == x && tables.YTable() == y));
+        x = tables.XTable(), y = tables.YTable();
+        ExpectSamePixels(*out, *fresh, ImgRectI(0, 0, 20, 15));
+    }
+    // Each part of the key on its own makes new tables, and so does going back.
+    const auto changes = std::vector<void (*)(ResizeKey &)>{[](ResizeKey &k) { k.srcFrame.x1 += 1; },
+                                                            [](ResizeKey &k) { k.srcWindow.y0 -= 2; },
+                                                            [](ResizeKey &k) { k.dstFrame.y1 += 1; },
+                                                            [](ResizeKey &k) { k.dstWindow.x1 -= 3; },
+                                                            [](ResizeKey &k) { k.readWindow.x1 = 9; },
+                                                            [](ResizeKey &k) { k.filter = RszLanczos; },
+                                                            [](ResizeKey &k) { k.window = RszWindowKaiser; },
+                                                            [](ResizeKey &k) { k.xEdges = EdgeDuplicate; },
+                                                            [](ResizeKey &k) { k.yEdges = EdgeMirror; },
+                                                            [](ResizeKey &k) { k.xScale = 0.25; },
+                                                            [](ResizeKey &k) { k.yScale = 0.5; },
+                                                            [](ResizeKey &k) { k.xOffset = 1.5; },
+                                                            [](ResizeKey &k) { k.yOffset = -2.0; }};
     long builds = tables.Builds();
     for (size_t i = 0; i < changes.size(); ++i) {
         ResizeKey k = p.key;
         changes[i](k);
         ASSERT_TRUE(tables.Prepare(*p.src, p.dst.Get(), k, p.tags)) << i;
         EXPECT_EQ(tables.Builds(), ++builds) << "change " << i;
-        // and back: the first key's tables are made again
         ASSERT_TRUE(tables.Prepare(*p.src, p.dst.Get(), p.key, p.tags)) << i;
         EXPECT_EQ(tables.Builds(), ++builds) << "back from change " << i;
     }
     tables.Free();
-    EXPECT_EQ(tables.XTable(), nullptr);
-    EXPECT_EQ(tables.YTable(), nullptr);
+    EXPECT_FALSE(tables.XTable() || tables.YTable());
     ASSERT_TRUE(tables.Prepare(*p.src, p.dst.Get(), p.key, p.tags));
     EXPECT_EQ(tables.Builds(), builds + 1); // freed tables are not reused
-}
-
-TEST(SizingTables, KeptTablesResampleAsFreshOnes) {
-    Pair p;
-    Ref<Image> src = Orvane::Test::PatternImage(40, 30);
-    ResizeTables tables;
-    Ref<Image> a = NewImageTagList({{ImgLikeImage, p.dst.Get()}}), b = NewImageTagList({{ImgLikeImage, p.dst.Get()}});
-    ASSERT_TRUE(ResizeInto(*src, a.Get(), tables, p.key, p.tags));
-    ASSERT_TRUE(ResizeInto(*src, b.Get(), tables, p.key, p.tags)); // second frame: kept tables
-    EXPECT_EQ(tables.Builds(), 1);
-    Ref<Image> fresh = NewImageTagList({{ImgLikeImage, p.dst.Get()}});
-    ASSERT_TRUE(fresh->AllocScanLineData());
-    ASSERT_TRUE(src->ResizeTagList(fresh.Get(), p.tags));
-    for (int y = 0; y < 15; ++y)
-        for (int x = 0; x < 20; ++x) {
-            ASSERT_EQ(a->GetFlt(x, y), fresh->GetFlt(x, y)) << x << "," << y;
-            ASSERT_EQ(b->GetFlt(x, y), fresh->GetFlt(x, y)) << x << "," << y;
-        }
 }
 
 } // namespace

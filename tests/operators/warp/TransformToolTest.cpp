@@ -1,5 +1,5 @@
 // The Transform tool in the flow: its controls, what travels on its output
-// (a pending transform for inputs that take one, pixels for the others),
+// (a pending transform for probes that take one, pixels for the others),
 // chains that resample once, flattening, regions of interest, domains, the
 // common controls and caching. Pixels are compared with a single transform
 // made directly on the image (TransformMatrixTest checks those against the
@@ -17,64 +17,6 @@
 namespace Orvane::WarpTest {
 namespace {
 
-/// A consumer that notes the value it gets on its image input and hands on
-/// its pixels. `Takes` declares LinkSecondDataType TransformMatrix.
-template <bool Takes> class ValueProbe : public ThreadedOperator {
-public:
-    ValueProbe(const Registry *reg, const ScriptVal &args, const TagList &tags) : ThreadedOperator(reg, args, tags) {
-        TagList in{{LinkDataType, CLSID_DataType_Image}, {LinkMain, 1}};
-        if (Takes) in.Add({LinkSecondDataType, CLSID_DataType_TransformMatrix});
-        input_ = AddInputTagList("Input", "Input", in);
-        output_ = AddOutputTagList("Output", "Output", {{LinkDataType, CLSID_DataType_Image}, {LinkMain, 1}});
-    }
-    void Process(Request *req) override {
-        Parameter *v = req->GetInputData(input_);
-        if (!req->IsPreCalc())
-            seen.emplace_back(v);
-        else
-            dod = req->GetInputDoD(input_);
-        TagList cut{{WorkRequest, static_cast<const void *>(req)}};
-        const AutoImageRoI roi(req);
-        if (roi) cut.Set({ImgDataWindow, &roi->rect});
-        req->SetOutputData(output_, ImageOfValue(v, cut).Get());
-    }
-    std::vector<Ref<Parameter>> seen; ///< values of the pixel requests
-    std::optional<ImageDomain> dod;   ///< the input's domain, as the engine told it
-
-private:
-    Input *input_;
-    Output *output_;
-};
-
-template <bool Takes> ValueProbe<Takes> *AddConsumer(OrvaneDoc &doc, Operator *src) {
-    static const OvID cls(Takes ? "TestTakesTransforms" : "TestTakesImages");
-    static const Registry *row = [] {
-        TagList tags{{RegConstructor,
-                      +[](const Registry *reg, const ScriptVal &args, const TagList &t) -> Object * {
-                          return new ValueProbe<Takes>(reg, args, t);
-                      }},
-                     {RegTypeFlags, static_cast<long long>(RegKindOperator | RegKindTool)},
-                     {RegName, "Test Consumer"},
-                     {RegNoBlendControls, 1},
-                     {RegNoEffectMask, 1},
-                     {RegSupportsRoI, 1},
-                     {RegSupportsDoD, 1}};
-        return Registry::_Init(&ClassRegistry, cls, tags);
-    }();
-    (void)row;
-    auto *probe = dynamic_cast<ValueProbe<Takes> *>(doc.AddTool(cls));
-    EXPECT_NE(probe, nullptr);
-    if (probe) {
-        EXPECT_TRUE(probe->FindInput("Input")->ConnectTo(src->FindMainOutput()));
-    }
-    return probe;
-}
-
-class TransformTool : public ::testing::Test {
-protected:
-    void SetUp() override { LoadOperators(); }
-};
-
 /// A smooth picture with a non-constant alpha and a canvas.
 Ref<Image> Picture(int w = 48, int h = 40) {
     Ref<Image> img = NewImageTagList({{ImgWidth, w}, {ImgHeight, h}, {ImgDepth, 8}});
@@ -87,6 +29,22 @@ Ref<Image> Picture(int w = 48, int h = 40) {
     return img;
 }
 
+class TransformTool : public ::testing::Test {
+protected:
+    static void SetUpTestSuite() { LoadOperators(); }
+    /// A Transform of `img` (default: the picture) with these controls.
+    Operator *Make(const std::vector<std::pair<const char *, double>> &controls, Ref<Image> img = nullptr) {
+        src = AddProbe(doc, img ? img : pic, "Src" + std::to_string(++sources));
+        Operator *xf = AddTool(doc, "Transform", src);
+        SetNumbers(xf, controls);
+        return xf;
+    }
+    OrvaneDoc doc;
+    Ref<Image> pic = Picture();
+    ProbeSource *src = nullptr;
+    int sources = 0;
+};
+
 /// The pixels a single transform with `tags` makes of `src` over `cut`.
 Ref<Image> Direct(Image *src, const TagList &tags, const ImgRectI *cut = nullptr) {
     auto tm = MakeRef<TransformMatrix>(src);
@@ -96,61 +54,10 @@ Ref<Image> Direct(Image *src, const TagList &tags, const ImgRectI *cut = nullptr
     return tm->ApplyTransformTagList(apply);
 }
 
-TEST_F(TransformTool, RegistersWithItsControlsInOrder) {
-    const Registry *row = ClassRegistry->Find(OvID("Transform"));
-    ASSERT_NE(row, nullptr);
-    EXPECT_EQ(row->TypeFlags(), RegKindOperator | RegKindTool);
-    EXPECT_EQ(row->BaseID(), CLSID_ThreadedOperator);
-    EXPECT_STREQ(row->Tags().GetText(RegAbbreviation, ""), "Xf");
-    EXPECT_STREQ(row->Tags().GetText(RegPath, ""), "Tools/Transform/Transform");
-    for (Tag on : {RegSupportsRoI, RegSupportsDoD, RegSupportsGPUImages}) EXPECT_TRUE(row->Tags().GetBool(on));
-
-    OrvaneDoc doc;
-    Operator *xf = doc.AddTool(OvID("Transform"));
-    ASSERT_NE(xf, nullptr);
-    EXPECT_FALSE(xf->IsPlaceholder());
-    const char *order[] = {
-        "Center",       "Pivot",           "UseSizeAndAspect", "Size",     "Aspect", "XSize",
-        "YSize",        "Angle",           "FlipHoriz",        "FlipVert", "Edges",  "FilterMethod",
-        "WindowMethod", "InvertTransform", "FlattenTransform", "Width",    "Height", "UseFrameFormatSettings",
-        "Input"};
-    int last = -1;
-    for (const char *id : order) {
-        const Input *in = xf->FindInput(id);
-        ASSERT_NE(in, nullptr) << id;
-        EXPECT_GT(in->Index(), last) << id;
-        last = in->Index();
-    }
-    EXPECT_DOUBLE_EQ(xf->FindInput("Aspect")->Tags().GetDouble(InputMinAllowed), 0.01);
-    EXPECT_DOUBLE_EQ(xf->FindInput("FilterMethod")->Tags().GetDouble(InputDefault), 2.0);
-    EXPECT_TRUE(xf->FindInput("Width")->IsPassive());
-    bool takes = false;
-    for (const TagItem *t : xf->FindInput("Input")->Tags().FindAll(LinkSecondDataType))
-        takes |= t->AsID() == CLSID_DataType_TransformMatrix;
-    EXPECT_TRUE(takes);
-
-    // Size and Aspect, or X Size and Y Size; the window list for Sinc and Bessel only.
-    auto shown = [&](const char *id) { return xf->FindInput(id)->IsVisible(); };
-    EXPECT_TRUE(shown("Size") && shown("Aspect") && !shown("XSize") && !shown("YSize") && !shown("WindowMethod"));
-    SetNumber(xf, "UseSizeAndAspect", 0);
-    EXPECT_TRUE(!shown("Size") && !shown("Aspect") && shown("XSize") && shown("YSize"));
-    SetNumber(xf, "FilterMethod", 9);
-    EXPECT_TRUE(shown("WindowMethod"));
-    SetNumber(xf, "FilterMethod", 8);
-    EXPECT_FALSE(shown("WindowMethod"));
-    // Hard limits: Aspect never reaches 0, Edges stays within its four buttons.
-    SetNumber(xf, "Aspect", 0);
-    EXPECT_DOUBLE_EQ(dynamic_cast<const Number *>(xf->FindInput("Aspect")->Constant().Get())->value, 0.01);
-}
-
 TEST_F(TransformTool, ConsumersGetATransformOrPixelsAsTheyDeclare) {
-    Ref<Image> pic = Picture();
-    OrvaneDoc doc;
-    ProbeSource *src = AddProbe(doc, pic);
-    Operator *xf = AddTool(doc, "Transform", src);
-    SetNumber(xf, "Angle", 30);
-    auto *takes = AddConsumer<true>(doc, xf);
-    auto *images = AddConsumer<false>(doc, xf);
+    Operator *xf = Make({{"Angle", 30}});
+    auto *takes = AddValueProbe(doc, xf, true);
+    auto *images = AddValueProbe(doc, xf, false);
     ASSERT_TRUE(Render(takes) && Render(images));
     ASSERT_EQ(takes->seen.size(), 1u);
     ASSERT_EQ(images->seen.size(), 1u);
@@ -177,18 +84,10 @@ TEST_F(TransformTool, ConsumersGetATransformOrPixelsAsTheyDeclare) {
 }
 
 TEST_F(TransformTool, AChainResamplesOnceAndEqualsOneTransform) {
-    Ref<Image> pic = Picture();
-    OrvaneDoc doc;
-    ProbeSource *src = AddProbe(doc, pic);
-    Operator *first = AddTool(doc, "Transform", src);
-    SetNumber(first, "Angle", 20);
-    SetNumber(first, "Size", 1.2);
-    SetNumber(first, "FilterMethod", 5); // Catmull-Rom
+    Operator *first = Make({{"Angle", 20}, {"Size", 1.2}, {"FilterMethod", 5}}); // Catmull-Rom
     Operator *second = AddTool(doc, "Transform", first);
-    SetNumber(second, "Angle", 15);
-    SetNumber(second, "Size", 1.1);
+    SetNumbers(second, {{"Angle", 15}, {"Size", 1.1}, {"FilterMethod", 5}});
     SetPoint(second, "Center", 0.55, 0.45);
-    SetNumber(second, "FilterMethod", 5);
 
     long before = TransformMatrix::ResampleCount();
     Ref<Image> chained = Render(second);
@@ -212,7 +111,7 @@ TEST_F(TransformTool, AChainResamplesOnceAndEqualsOneTransform) {
     // Flattening the first makes its pixels at once: two resamplings, and
     // its output is a plain image.
     SetNumber(first, "FlattenTransform", 1);
-    auto *probe = AddConsumer<true>(doc, first);
+    auto *probe = AddValueProbe(doc, first, true);
     before = TransformMatrix::ResampleCount();
     ASSERT_TRUE(Render(second));
     EXPECT_EQ(TransformMatrix::ResampleCount() - before, 2);
@@ -222,22 +121,13 @@ TEST_F(TransformTool, AChainResamplesOnceAndEqualsOneTransform) {
 }
 
 TEST_F(TransformTool, ARegionNeedsOnlyWhatItReads) {
-    Ref<Image> pic = Picture(64, 64);
+    Ref<Image> big = Picture(64, 64);
     for (int edges : {0, 2}) {
         SCOPED_TRACE(edges);
-        OrvaneDoc doc;
-        ProbeSource *src = AddProbe(doc, pic);
-        Operator *a = AddTool(doc, "Transform", src);
-        SetNumber(a, "Angle", 40);
-        SetNumber(a, "Size", 0.7);
-        SetNumber(a, "FilterMethod", 8); // Lanczos
-        SetNumber(a, "Edges", edges);
+        Operator *a = Make({{"Angle", 40}, {"Size", 0.7}, {"FilterMethod", 8}, {"Edges", edges}}, big); // Lanczos
         Operator *b = AddTool(doc, "Transform", a);
-        SetNumber(b, "Angle", -25);
-        SetNumber(b, "Size", 1.6);
+        SetNumbers(b, {{"Angle", -25}, {"Size", 1.6}, {"FilterMethod", 9}, {"Edges", edges}}); // Sinc, the widest
         SetPoint(b, "Center", 0.6, 0.52);
-        SetNumber(b, "FilterMethod", 9); // Sinc, the widest
-        SetNumber(b, "Edges", edges);
         const ImgRectI region(20, 25, 36, 33);
         Ref<Image> whole = Render(b);
         src->asked.clear();
@@ -259,13 +149,8 @@ TEST_F(TransformTool, ARegionNeedsOnlyWhatItReads) {
 }
 
 TEST_F(TransformTool, EdgesFillTheFrameAndInvertUndoes) {
-    Ref<Image> pic = Picture(32, 32);
-    OrvaneDoc doc;
-    ProbeSource *src = AddProbe(doc, pic);
-    Operator *xf = AddTool(doc, "Transform", src);
-    SetNumber(xf, "Size", 0.5);
-    SetNumber(xf, "Edges", 1); // Wrap: the picture repeats four times over the frame
-    SetNumber(xf, "FilterMethod", 0);
+    pic = Picture(32, 32);
+    Operator *xf = Make({{"Size", 0.5}, {"Edges", 1}, {"FilterMethod", 0}}); // Wrap: the picture repeats four times
     Ref<Image> tiled = Render(xf);
     ASSERT_TRUE(tiled);
     EXPECT_EQ(tiled->DataWindow(), ImgRectI(0, 0, 32, 32));
@@ -281,34 +166,25 @@ TEST_F(TransformTool, EdgesFillTheFrameAndInvertUndoes) {
 
     // A Transform with the same controls inverted after it gives the
     // identity: the source comes through untouched.
-    SetNumber(xf, "Edges", 0);
-    SetNumber(xf, "Angle", 33);
+    SetNumbers(xf, {{"Edges", 0}, {"Angle", 33}});
     SetPoint(xf, "Pivot", 0.3, 0.6);
     Operator *undo = AddTool(doc, "Transform", xf);
-    SetNumber(undo, "Size", 0.5);
-    SetNumber(undo, "Angle", 33);
+    SetNumbers(undo, {{"Size", 0.5}, {"Angle", 33}, {"InvertTransform", 1}});
     SetPoint(undo, "Pivot", 0.3, 0.6);
-    SetNumber(undo, "InvertTransform", 1);
     const long before = TransformMatrix::ResampleCount();
     Ref<Image> back = Render(undo);
     EXPECT_EQ(back.Get(), pic.Get());
     EXPECT_EQ(TransformMatrix::ResampleCount(), before);
 
     // Size 0 is singular: inverting leaves it, and nothing of the picture shows.
-    SetNumber(xf, "Size", 0);
-    SetNumber(xf, "InvertTransform", 1);
+    SetNumbers(xf, {{"Size", 0}, {"InvertTransform", 1}});
     Ref<Image> none = Render(xf);
     ASSERT_TRUE(none);
     EXPECT_TRUE(none->DataWindow().IsNull());
 }
 
 TEST_F(TransformTool, BlendMixesThePixelsOfTheTransform) {
-    Ref<Image> pic = Picture();
-    OrvaneDoc doc;
-    ProbeSource *src = AddProbe(doc, pic);
-    Operator *xf = AddTool(doc, "Transform", src);
-    SetNumber(xf, "Angle", 12);
-    SetNumber(xf, "Blend", 0.25);
+    Operator *xf = Make({{"Angle", 12}, {"Blend", 0.25}});
     Ref<Image> mixed = Render(xf);
     Ref<Image> full = Direct(pic.Get(), {{XfAngle, 12.0}, {XfFilter, RszLinear}});
     ASSERT_TRUE(mixed && full);
@@ -320,11 +196,8 @@ TEST_F(TransformTool, BlendMixesThePixelsOfTheTransform) {
 }
 
 TEST_F(TransformTool, CachedResultsAreNotResampledAgain) {
-    OrvaneDoc doc;
-    ProbeSource *src = AddProbe(doc, Picture());
-    Operator *xf = AddTool(doc, "Transform", src);
-    SetNumber(xf, "Angle", 45);
-    auto *consumer = AddConsumer<false>(doc, xf);
+    Operator *xf = Make({{"Angle", 45}});
+    auto *consumer = AddValueProbe(doc, xf, false);
     RenderOptions cached;
     cached.useCache = true;
     ASSERT_TRUE(Render(consumer, cached));
@@ -339,10 +212,21 @@ TEST_F(TransformTool, CachedResultsAreNotResampledAgain) {
     EXPECT_EQ(TransformMatrix::ResampleCount(), before + 1);
 }
 
-TEST_F(TransformTool, AMissingInputFailsWithOneLine) {
-    OrvaneDoc doc;
+TEST_F(TransformTool, ControlsShowByChoiceAndAMissingInputFailsWithOneLine) {
     Operator *xf = doc.AddTool(OvID("Transform"));
     ASSERT_NE(xf, nullptr);
+    // Size and Aspect, or X Size and Y Size; the window list for Sinc and Bessel only.
+    auto shown = [&](const char *id) { return xf->FindInput(id)->IsVisible(); };
+    EXPECT_TRUE(shown("Size") && shown("Aspect") && !shown("XSize") && !shown("YSize") && !shown("WindowMethod"));
+    SetNumber(xf, "UseSizeAndAspect", 0);
+    EXPECT_TRUE(!shown("Size") && !shown("Aspect") && shown("XSize") && shown("YSize"));
+    SetNumber(xf, "FilterMethod", 9);
+    EXPECT_TRUE(shown("WindowMethod"));
+    SetNumber(xf, "FilterMethod", 8);
+    EXPECT_FALSE(shown("WindowMethod"));
+    SetNumber(xf, "Aspect", 0); // never reaches 0
+    EXPECT_DOUBLE_EQ(Control(xf, "Aspect"), 0.01);
+
     EXPECT_EQ(Render(xf), nullptr);
     const auto lines = doc.ConsoleLines();
     ASSERT_EQ(lines.size(), 1u);

@@ -1,15 +1,14 @@
 #pragma once
-// Helpers shared by the sizing tool tests: a source tool that records the
-// regions it is asked for, rendering with request options, the host's
-// resizer called directly (the reference the tools must match), and pixel
-// comparisons.
+// Helpers shared by the sizing tool tests: a source that hands on only the
+// region it is asked for and notes it, rendering with request options, the
+// host's resizer called directly (the reference the tools must match), and
+// pixel comparisons.
 #include <gtest/gtest.h>
 
+#include <initializer_list>
 #include <optional>
 #include <string>
-#include <vector>
 
-#include "host/core/Registry.h"
 #include "host/core/Tags.h"
 #include "host/flow/DataTypes.h"
 #include "host/flow/Engine.h"
@@ -24,63 +23,19 @@
 
 namespace Orvane::WarpTest {
 
+using Orvane::Test::AddValueProbe;
 using Orvane::Test::LoadOperators;
 using Orvane::Test::PatternImage;
 using Orvane::Test::SetID;
 using Orvane::Test::SetNumber;
+using Orvane::Test::SetNumbers;
 using Orvane::Test::SetPoint;
+using ProbeSource = Orvane::Test::ImageSourceTool;
 
-/// Outputs a fixed image (windows only in a pre-calculation), cut to the
-/// region each pixel request asks for, and notes that region.
-class ProbeSource : public ThreadedOperator {
-public:
-    ProbeSource(const Registry *reg, const ScriptVal &args, const TagList &tags) : ThreadedOperator(reg, args, tags) {
-        output_ = AddOutputTagList("Output", "Output", {{LinkDataType, CLSID_DataType_Image}, {LinkMain, 1}});
-    }
-    void SetImage(Ref<Image> img) { image_ = std::move(img); }
-    void Process(Request *req) override {
-        if (!image_) return req->SetOutputData(output_, nullptr);
-        if (req->IsPreCalc()) {
-            const ImgRectI dw = image_->DataWindow();
-            const FltPixel canvas = image_->GetCanvasColor();
-            Ref<Image> shape = NewImageTagList(
-                {{ImgLikeImage, image_.Get()}, {ImgDataWindow, &dw}, {ImgNoData, 1}, {ImgCanvasColor, &canvas}});
-            return req->SetOutputData(output_, shape.Get());
-        }
-        asked.push_back(req->RoI());
-        if (!req->RoI() || req->RoI()->rect.Contains(image_->DataWindow()))
-            return req->SetOutputData(output_, image_.Get());
-        // Only what was asked for: the rest is canvas, as from any tool.
-        const ImgRectI cut = image_->DataWindow() & req->RoI()->rect;
-        req->SetOutputData(output_, image_->CopyOfImageTagList({{ImgDataWindow, &cut}}).Get());
-    }
-    /// The regions of interest of the pixel requests so far (absent: the whole frame).
-    std::vector<std::optional<ImageDomain>> asked;
-
-private:
-    Ref<Image> image_;
-    Output *output_;
-};
-
+/// A source of `img` that cuts it to each pixel request's region and notes the region.
 inline ProbeSource *AddProbe(OrvaneDoc &doc, Ref<Image> img, const std::string &name = "Src") {
-    static const OvID probeClass("TestWarpProbe");
-    static const Registry *row = [] {
-        TagList tags{{RegConstructor,
-                      +[](const Registry *reg, const ScriptVal &args, const TagList &t) -> Object * {
-                          return new ProbeSource(reg, args, t);
-                      }},
-                     {RegTypeFlags, static_cast<long long>(RegKindOperator | RegKindTool | RegKindSource)},
-                     {RegName, "Test Probe"},
-                     {RegNoBlendControls, 1},
-                     {RegNoEffectMask, 1},
-                     {RegSupportsRoI, 1},
-                     {RegSupportsDoD, 1}};
-        return Registry::_Init(&ClassRegistry, probeClass, tags);
-    }();
-    (void)row;
-    auto *probe = dynamic_cast<ProbeSource *>(doc.AddTool(probeClass, name));
-    EXPECT_NE(probe, nullptr);
-    if (probe) probe->SetImage(std::move(img));
+    ProbeSource *probe = Orvane::Test::AddImageSource(doc, name, std::move(img));
+    if (probe) probe->cutToRegion = true;
     return probe;
 }
 
@@ -88,15 +43,23 @@ inline ProbeSource *AddProbe(OrvaneDoc &doc, Ref<Image> img, const std::string &
 inline Operator *AddTool(OrvaneDoc &doc, const char *cls, Operator *src) {
     Operator *op = doc.AddTool(OvID(cls));
     EXPECT_NE(op, nullptr) << cls;
-    if (op && src) EXPECT_TRUE(op->FindInput("Input")->ConnectTo(src->FindMainOutput()));
+    if (op && src) {
+        EXPECT_TRUE(op->FindInput("Input")->ConnectTo(src->FindMainOutput()));
+    }
     return op;
+}
+
+/// The constant value of a number input (-1 when it has none).
+inline double Control(Operator *op, const char *id) {
+    const auto *n = dynamic_cast<const Number *>(op->FindInput(id)->Constant().Get());
+    return n ? n->value : -1.0;
 }
 
 struct RenderOptions {
     uint32_t flags = 0;
     int proxy = 1;
     bool passThrough = false;
-    std::optional<ImgRectI> roi;
+    std::optional<ImgRectI> roi = std::nullopt;
     bool useCache = false;
 };
 
@@ -114,11 +77,17 @@ inline Ref<Image> Render(Operator *op, const RenderOptions &o = {}) {
     return Ref<Image>(dynamic_cast<Image *>(p.Get()));
 }
 
+/// The image exists and has a frame of w x h.
+inline ::testing::AssertionResult Sized(const Ref<Image> &img, int w, int h) {
+    if (img && img->Width() == w && img->Height() == h) return ::testing::AssertionSuccess();
+    if (!img) return ::testing::AssertionFailure() << "no image";
+    return ::testing::AssertionFailure() << "frame " << img->Width() << " x " << img->Height();
+}
+
 /// The pre-calculation of the tool's main output (windows, no pixels).
-inline Ref<Image> Shape(Operator *op, const RenderOptions &o = {}) {
-    RenderOptions pre = o;
-    pre.flags |= ReqFlagPreCalc;
-    return Render(op, pre);
+inline Ref<Image> Shape(Operator *op, RenderOptions o = {}) {
+    o.flags |= ReqFlagPreCalc;
+    return Render(op, o);
 }
 
 /// The host's resizer called directly: `src` into a new w x h image over
@@ -126,10 +95,7 @@ inline Ref<Image> Shape(Operator *op, const RenderOptions &o = {}) {
 inline Ref<Image> DirectResize(const Image &src, int w, int h, const ImgRectI &window, const TagList &tags) {
     Ref<Image> out = NewImageTagList(
         {{ImgLikeImage, &src}, {ImgWidth, w}, {ImgHeight, h}, {ImgDataWindow, &window}, {ImgValidWindow, &window}});
-    EXPECT_NE(out, nullptr);
-    if (!out) return out;
-    EXPECT_TRUE(out->AllocScanLineData());
-    EXPECT_TRUE(src.ResizeTagList(out.Get(), tags));
+    EXPECT_TRUE(out && out->AllocScanLineData() && src.ResizeTagList(out.Get(), tags));
     return out;
 }
 
@@ -139,12 +105,21 @@ inline void ExpectSamePixels(const Image &a, const Image &b, const ImgRectI &r, 
     for (int y = r.y0; y < r.y1 && bad < 5; ++y)
         for (int x = r.x0; x < r.x1 && bad < 5; ++x) {
             const FltPixel p = a.GetFlt(x, y), q = b.GetFlt(x, y);
-            if (!(p == q)) {
-                ++bad;
+            if (!(p == q) && ++bad)
                 ADD_FAILURE() << what << " pixel (" << x << ", " << y << "): " << p.R << " " << p.G << " " << p.B << " "
                               << p.A << " against " << q.R << " " << q.G << " " << q.B << " " << q.A;
-            }
         }
+}
+
+/// Each region rendered alone holds the whole frame's pixels there.
+inline void ExpectRegionsMatchWhole(Operator *op, std::initializer_list<ImgRectI> regions) {
+    Ref<Image> whole = Render(op);
+    ASSERT_NE(whole, nullptr);
+    for (const ImgRectI &roi : regions) {
+        Ref<Image> part = Render(op, {.roi = roi});
+        ASSERT_NE(part, nullptr);
+        ExpectSamePixels(*part, *whole, roi);
+    }
 }
 
 /// An image of w x h whose every pixel is `c`.
