@@ -80,7 +80,8 @@ TEST(RefHandle, CopyMoveReleaseReset) {
         Ref<Counted> d;
         d = c; // copy assignment
         EXPECT_EQ(p->RefCount(), 3);
-        d = d; // self assignment keeps the count
+        const Ref<Counted> &same = d; // assigned through another name, as real self assignment happens
+        d = same;                     // self assignment keeps the count
         EXPECT_EQ(p->RefCount(), 3);
         d = std::move(c);
         EXPECT_EQ(p->RefCount(), 2);

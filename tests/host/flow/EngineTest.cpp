@@ -623,8 +623,9 @@ TEST(Engine, AnAbortedRenderReturnsNullSilently) {
         {"in CheckRequest", OwnCheck},
         {"in Process, after the output was set", OwnProcess},
     };
-    for (const auto &[name, where] : cases) {
-        SCOPED_TRACE(name);
+    for (const auto &c : cases) {
+        const Where where = c.second; // a plain variable, captured by the lambdas below
+        SCOPED_TRACE(c.first);
         Ref<OrvaneDoc> doc = MakeRef<OrvaneDoc>();
         ts::ImageSourceTool *src = ts::AddImageSource(*doc, "Src", ts::PatternImage(12, 8));
         Probe *up = AddProbe(*doc, "Up");

@@ -13,6 +13,7 @@
 #include "host/core/Parallel.h"
 #include "host/core/Tags.h"
 #include "host/image/Image.h"
+#include "tests/support/CompilerHalf.h"
 
 namespace Orvane::mtxtest {
 namespace {
@@ -261,7 +262,7 @@ double Quantise(int depth, double v) {
         return std::round(v * max) / max;
     case 2: {
         volatile float f = static_cast<float>(v);
-        return static_cast<float>(static_cast<_Float16>(f));
+        return static_cast<float>(static_cast<Test::CompilerHalf>(f));
     }
     default: return static_cast<float>(v);
     }

@@ -7,8 +7,10 @@
 #include <cstring>
 #include <limits>
 
-// The reference is the compiler's own binary16 type (GCC on x86-64), whose
-// conversions round to nearest even in the library's soft-float routines.
+#include "tests/support/CompilerHalf.h"
+
+// The reference is the compiler's own binary16 type, whose conversions round
+// to nearest even in the compiler runtime's soft-float routines.
 namespace Orvane::halftest {
 namespace {
 
@@ -26,16 +28,16 @@ float BitsFloat(uint32_t b) {
 
 uint16_t RefToHalf(float f) {
     volatile float in = f; // keep the conversion at run time
-    const _Float16 h = static_cast<_Float16>(in);
+    const Test::CompilerHalf h = static_cast<Test::CompilerHalf>(in);
     uint16_t bits;
     std::memcpy(&bits, &h, sizeof bits);
     return bits;
 }
 
 float RefToFloat(uint16_t bits) {
-    _Float16 h;
+    Test::CompilerHalf h;
     std::memcpy(&h, &bits, sizeof h);
-    volatile _Float16 v = h;
+    volatile Test::CompilerHalf v = h;
     return static_cast<float>(v);
 }
 

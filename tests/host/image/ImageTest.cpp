@@ -14,6 +14,7 @@
 #include "host/core/Tags.h"
 #include "host/image/NewImage.h"
 #include "host/image/PixelConvert.h"
+#include "tests/support/CompilerHalf.h"
 
 namespace Orvane::imagetest {
 namespace {
@@ -35,7 +36,7 @@ long NearestCode(float v, long max) {
 
 float HalfRound(float v) {
     volatile float in = v;
-    const _Float16 h = static_cast<_Float16>(in);
+    const Orvane::Test::CompilerHalf h = static_cast<Orvane::Test::CompilerHalf>(in);
     return static_cast<float>(h);
 }
 
@@ -512,7 +513,7 @@ TEST(PixelRuns, HalfLoadsAndStores) {
     const int n = static_cast<int>(halves.size());
     std::vector<float> exact(n);
     for (int i = 0; i < n; ++i) {
-        _Float16 h;
+        Orvane::Test::CompilerHalf h;
         std::memcpy(&h, &halves[i], 2);
         exact[i] = static_cast<float>(h);
     }
@@ -543,7 +544,7 @@ TEST(PixelRuns, HalfLoadsAndStores) {
     std::vector<uint16_t> out(65536);
     StorePixel(DepthAFlt16, in.data(), 65536, reinterpret_cast<uint8_t *>(out.data()));
     for (uint32_t v = 0; v < 65536; ++v) {
-        _Float16 h;
+        Orvane::Test::CompilerHalf h;
         std::memcpy(&h, &out[v], 2);
         const double want = v / 65535.0;
         ASSERT_LE(std::fabs(static_cast<double>(h) - want), 0.5 * HalfStep(want) * 1.001) << v;

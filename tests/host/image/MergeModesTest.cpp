@@ -279,11 +279,18 @@ TEST(MergeModes, NonSeparableModesKeepTheirParts) {
         const RGB out{o.R, o.G, o.B};
         const RGB fs{f[0], f[1], f[2]}, bs{b[0], b[1], b[2]};
         SCOPED_TRACE(mode);
-        if (mode == MrgLuminosity || mode == MrgColor)
+        if (mode == MrgLuminosity || mode == MrgColor) {
             EXPECT_NEAR(Lum(out), Lum(mode == MrgLuminosity ? fs : bs), 1e-6);
-        if (mode == MrgColor || mode == MrgHue || mode == MrgSaturation) EXPECT_NEAR(Lum(out), Lum(bs), 1e-6);
-        if (mode == MrgSaturation) EXPECT_NEAR(SatD(out), SatD(fs), 1e-6);
-        if (mode == MrgHue || mode == MrgLuminosity) EXPECT_NEAR(SatD(out), SatD(bs), 1e-6);
+        }
+        if (mode == MrgColor || mode == MrgHue || mode == MrgSaturation) {
+            EXPECT_NEAR(Lum(out), Lum(bs), 1e-6);
+        }
+        if (mode == MrgSaturation) {
+            EXPECT_NEAR(SatD(out), SatD(fs), 1e-6);
+        }
+        if (mode == MrgHue || mode == MrgLuminosity) {
+            EXPECT_NEAR(SatD(out), SatD(bs), 1e-6);
+        }
     }
 }
 
@@ -451,7 +458,9 @@ TEST(MergeImages, OffsetsPlaceTheForeground) {
             const bool under = x >= 5 && x < 9 && y >= 0 && y < 2;
             const FltPixel f = under ? FgAt(x - 5, y + 1) : FltPixel{};
             ASSERT_TRUE(Near4(dst->GetFlt(x, y), Reference(Controls{}, D(f), D(BgAt(x, y))))) << x << "," << y;
-            if (!under) ASSERT_EQ(dst->GetFlt(x, y), BgAt(x, y)); // copied as it is
+            if (!under) {
+                ASSERT_EQ(dst->GetFlt(x, y), BgAt(x, y)); // copied as it is
+            }
         }
 }
 
@@ -475,7 +484,9 @@ TEST(MergeImages, CopiedBackgroundEqualsTheComputedMerge) {
             for (int y = 0; y < 12; ++y)
                 for (int x = 0; x < 16; ++x) {
                     ASSERT_EQ(copied->GetFlt(x, y), computed->GetFlt(x, y)) << x << "," << y;
-                    if (!fw.Contains(x, y)) ASSERT_EQ(copied->GetFlt(x, y), bg->GetFlt(x, y)) << x << "," << y;
+                    if (!fw.Contains(x, y)) {
+                        ASSERT_EQ(copied->GetFlt(x, y), bg->GetFlt(x, y)) << x << "," << y;
+                    }
                 }
         }
     }

@@ -88,7 +88,9 @@ inline ProbeSource *AddProbe(OrvaneDoc &doc, Ref<Image> img, const std::string &
 inline Operator *AddTool(OrvaneDoc &doc, const char *cls, Operator *src) {
     Operator *op = doc.AddTool(OvID(cls));
     EXPECT_NE(op, nullptr) << cls;
-    if (op && src) EXPECT_TRUE(op->FindInput("Input")->ConnectTo(src->FindMainOutput()));
+    if (op && src) {
+        EXPECT_TRUE(op->FindInput("Input")->ConnectTo(src->FindMainOutput()));
+    }
     return op;
 }
 
@@ -96,7 +98,7 @@ struct RenderOptions {
     uint32_t flags = 0;
     int proxy = 1;
     bool passThrough = false;
-    std::optional<ImgRectI> roi;
+    std::optional<ImgRectI> roi = std::nullopt;
     bool useCache = false;
 };
 
