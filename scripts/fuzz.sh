@@ -5,9 +5,10 @@
 #   scripts/fuzz.sh                 every harness, 20 s each
 #   scripts/fuzz.sh 300 png raw     fuzz_png and fuzz_raw, 5 minutes each
 #   build-fuzz/bin/fuzz_png FILE    runs one input again
-# Corpora grow in build-fuzz/corpus/<target>/, seeded with files our own
-# writers make (fuzz_seeds), the example documents, and the damaged OpenEXR
-# files of the shared test data when it is there.
+# Corpora grow in build-fuzz/corpus/<target>/, starting from seeds made at
+# run time: files of our own writers (fuzz_seeds), kinds of file only other
+# programs write (ImageMagick), the example documents, and the damaged
+# OpenEXR files of the shared test data when it is there.
 set -euo pipefail
 cd "$(dirname "$0")/.."
 seconds="${1:-20}"
@@ -20,11 +21,38 @@ for t in "${targets[@]}"; do
 done
 
 out=build-fuzz
+seeds="$out/seeds"
 cmake --preset fuzz >/dev/null
 cmake --build --preset fuzz -j "${ORVANE_JOBS:-2}" --target fuzz_seeds "${targets[@]/#/fuzz_}"
-"$out/bin/fuzz_seeds" "$out/seeds"
-mkdir -p "$out/seeds/document" "$out/crashes"
-cp examples/*.flow "$out/seeds/document/"
+"$out/bin/fuzz_seeds" "$seeds"
+mkdir -p "$seeds/document" "$out/crashes"
+cp examples/*.flow "$seeds/document/"
+
+# seed TARGET [FORMAT:]FILE CONVERT-ARGS...: a small file made by
+# ImageMagick, with the harness's control byte after it.
+seed() {
+  local target=$1 file=${2#*:} format=
+  [[ $2 != *:* ]] || format=${2%%:*}:
+  shift 2
+  if convert -seed 1 -size 16x12 "$@" "$format$seeds/$target/$file" 2>/dev/null; then
+    printf '\0' >>"$seeds/$target/$file"
+  else
+    echo "fuzz.sh: ImageMagick made no $target/$file"
+  fi
+}
+if command -v convert >/dev/null; then
+  seed bmp BMP3:palette.bmp xc: -fx 'rand()' -colors 200 -type Palette -compress None
+  seed bmp BMP2:os2.bmp gradient:red-blue
+  seed targa palette.tga gradient:red-blue -type Palette -compress RLE
+  seed targa grey.tga gradient: -type Grayscale
+  seed jpeg progressive.jpg gradient:red-blue -interlace JPEG
+  seed jpeg grey.jpg gradient: -type Grayscale
+  seed ipl JPEG:cmyk.ipl gradient:red-blue -colorspace CMYK
+  seed png PNG8:palette.png gradient:red-blue
+  seed png grey16.png gradient: -depth 16 -type Grayscale
+  seed png interlaced.png gradient:red-blue -interlace PNG
+  seed png transparent.png gradient:red-blue -transparent red
+fi
 
 # Limits: a reader must refuse a damaged file without a huge allocation.
 # The harness skips the pixels of a header over its pixel budget; what is
@@ -35,26 +63,23 @@ failed=()
 for t in "${targets[@]}"; do
   corpus="$out/corpus/$t"
   mkdir -p "$corpus"
-  seeds=()
+  dirs=("$corpus" "$seeds/$t")
   extra=()
-  case "$t" in
-    document) seeds=("$out/seeds/$t") extra=(-dict="$out/seeds/document.dict") ;;
-    openexr)
-      seeds=("$out/seeds/$t")
-      for d in ../shared/testdata /work/shared/testdata; do
-        if [ -d "$d/openexr-images/Damaged" ]; then seeds+=("$d/openexr-images/Damaged"); break; fi
-      done ;;
-    *) seeds=("$out/seeds/$t") ;;
-  esac
+  [ "$t" != document ] || extra=(-dict="$seeds/document.dict")
+  for d in ../shared/testdata /work/shared/testdata; do
+    if [ "$t" = openexr ] && [ -d "$d/openexr-images/Damaged" ]; then
+      dirs+=("$d/openexr-images/Damaged")
+      break
+    fi
+  done
   log="$out/fuzz-$t.log"
   echo "fuzz.sh: fuzz_$t for ${seconds} s (log $log)"
-  if ! "$out/bin/fuzz_$t" "${options[@]}" "${extra[@]}" -artifact_prefix="$out/crashes/$t-" \
-    "$corpus" "${seeds[@]}" >"$log" 2>&1; then
+  if ! "$out/bin/fuzz_$t" "${options[@]}" "${extra[@]}" -artifact_prefix="$out/crashes/$t-" "${dirs[@]}" \
+    >"$log" 2>&1; then
     failed+=("$t")
     tail -n 60 "$log"
   fi
-  grep -E "^stat::number_of_executed_units|^Done" "$log" | tr '\n' ' ' || true
-  echo
+  grep -E "^#[0-9]+ *DONE" "$log" || true
 done
 if [ ${#failed[@]} -gt 0 ]; then
   echo "fuzz.sh: FAILED: ${failed[*]}; inputs in $out/crashes/" >&2

@@ -9,9 +9,10 @@
 namespace Orvane::Fuzz {
 
 /// Pixels (data window area) a header may ask for before the harness skips
-/// reading the pixels: a file that claims a huge image is refused by the
-/// readers only when memory runs out, so the harness stops short of that.
-constexpr int64_t kPixelBudget = int64_t(1) << 21;
+/// reading the pixels. A few bytes can claim a huge image, which the readers
+/// do not refuse by its size yet; the budget keeps such inputs from
+/// exhausting memory, and small images keep the runs fast.
+constexpr int64_t kPixelBudget = int64_t(1) << 18;
 
 /// Loads the tool library from beside the host library; aborts when it cannot.
 void LoadOperators();

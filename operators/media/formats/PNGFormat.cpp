@@ -73,10 +73,17 @@ struct PngHandle {
                     : png_create_read_struct(PNG_LIBPNG_VER_STRING, &channel, ErrorFn, WarningFn);
         if (png) info = png_create_info_struct(png);
         if (png && info) {
-            if (write)
+            if (write) {
                 png_set_write_fn(png, &channel, WriteFn, FlushFn);
-            else
+            } else {
                 png_set_read_fn(png, &channel, ReadFn);
+                // libpng sets a chunk's data aside at the length the chunk
+                // states before reading it. Only the chunks read here are
+                // handled; the others (text, profiles, ...) are skipped unread.
+                static const png_byte kUsed[] = "gAMA\0sRGB\0pHYs";
+                png_set_keep_unknown_chunks(png, PNG_HANDLE_CHUNK_NEVER, nullptr, -1);
+                png_set_keep_unknown_chunks(png, PNG_HANDLE_CHUNK_AS_DEFAULT, kUsed, 3);
+            }
         }
     }
     ~PngHandle() {
