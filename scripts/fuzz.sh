@@ -79,7 +79,7 @@ for t in "${targets[@]}"; do
     failed+=("$t")
     tail -n 60 "$log"
   fi
-  grep -E "^#[0-9]+ *DONE" "$log" || true
+  grep -E "^#[0-9]+[[:space:]]+DONE" "$log" || true
 done
 if [ ${#failed[@]} -gt 0 ]; then
   echo "fuzz.sh: FAILED: ${failed[*]}; inputs in $out/crashes/" >&2

@@ -75,12 +75,10 @@ std::vector<uint8_t> Write(const char *format, Image *image, const Options &opti
     }
     f->SetupSave(tool, &req);
     MemoryIO io;
-    if (!f->SaveHeader(&io, image) || !f->SaveFrame(0, image)) {
-        std::fprintf(stderr, "%s: %s\n", format, f->Error().c_str());
-        return {};
-    }
+    const bool ok = f->SaveHeader(&io, image) && f->SaveFrame(0, image);
     f->CleanupSave(tool);
-    return io.Data();
+    if (!ok) std::fprintf(stderr, "%s: %s\n", format, f->Error().c_str());
+    return ok ? io.Data() : std::vector<uint8_t>();
 }
 
 void WriteFile(const std::filesystem::path &path, const std::string &bytes) {
