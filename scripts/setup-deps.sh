@@ -9,6 +9,8 @@ packages=(
   # kernels on the CPU so that every machine exercises the device path.
   ocl-icd-opencl-dev opencl-headers pocl-opencl-icd
   clang-format
+  # The fuzz harnesses and the clang preset (libFuzzer and the sanitizers come with it).
+  clang
   # Tests compare our file formats with these programs.
   netpbm imagemagick openexr libjpeg-turbo-progs
   # Blur, resize and merge results and speeds are compared with these.

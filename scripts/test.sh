@@ -1,8 +1,11 @@
 #!/usr/bin/env bash
 # Builds Orvane and runs every test, from a fresh Debian 12 machine:
-# installs the packages, checks formatting, configures, builds, runs ctest.
-#   scripts/test.sh            release build in build/
+# installs the packages, checks formatting, configures, builds, runs ctest;
+# after the release suite, each fuzz harness runs briefly (scripts/fuzz.sh).
+#   scripts/test.sh            release build in build/, then the fuzzers in build-fuzz/
 #   scripts/test.sh asan       AddressSanitizer + UBSan build in build-asan/
+#   scripts/test.sh clang      release build with Clang in build-clang/
+# ORVANE_FUZZ_SECONDS sets the seconds each harness runs (default 10; 0 skips them).
 set -euo pipefail
 cd "$(dirname "$0")/.."
 preset="${1:-release}"
@@ -16,3 +19,6 @@ cmake --build --preset "$preset" -j "$jobs"
 # The device tests run on OpenCL; setup-deps installs PoCL, so a missing
 # device is a failure here rather than a skip.
 ORVANE_REQUIRE_DEVICE=opencl ctest --preset "$preset" -j "$jobs"
+if [ "$preset" = release ] && [ "${ORVANE_FUZZ_SECONDS:-10}" != 0 ]; then
+  scripts/fuzz.sh "${ORVANE_FUZZ_SECONDS:-10}"
+fi

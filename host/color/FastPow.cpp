@@ -103,7 +103,9 @@ struct Consts {
 // selects into branches, sinks the division into one of them, and then cannot
 // vectorise the loop (the division might trap).
 template <int W> [[gnu::always_inline]] inline void PowStreams(const float *x, float *out, int n, const Consts &c) {
+#if !defined(__clang__) // Clang has no plain equivalent (its assume_safety also forces vectorisation)
 #pragma GCC ivdep
+#endif
     for (int i = 0; i < n; ++i) {
         uint32_t ix[W];
         int32_t ia[W];

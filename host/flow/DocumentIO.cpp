@@ -46,7 +46,7 @@ ScriptVal SavedValue(const Input &in) {
     if (in.Link()) return ScriptVal::Ref(in.Link()->Owner()->Name() + "." + in.Link()->ID().Text());
     if (!in.UnresolvedLink().empty()) return ScriptVal::Ref(in.UnresolvedLink());
     if (in.Curve()) return in.Curve()->ToScript();
-    if (!in.Constant() || in.IsDefault()) return ScriptVal();
+    if (!in.Constant() || (in.IsDefault() && !in.WrittenInDocument())) return ScriptVal();
     return in.Constant()->ToScript();
 }
 
@@ -255,6 +255,7 @@ private:
             ApplyInputValue(doc_, in, *p.value,
                             {.keepUnknownLinks = options_.lenient, .lenient = options_.lenient, .checkLoops = false});
         if (!problem.empty() && !last) return false;
+        in->SetWrittenInDocument(problem.empty());
         KeepComments("Tools." + op.Name() + ".Inputs." + in->ID().Text(), *p.value);
         if (!problem.empty()) Problem(p.value, place + ": " + problem);
         if (in->Link()) linkValues_[in] = p.value;

@@ -31,8 +31,8 @@
 // unchanged in lenient loading. A class is found by its ID, an old ID, an
 // alias or its name, and saved under its ID.
 //
-// Saving writes values that differ from their defaults, the kept parts, and
-// the comments the document was read with. Saving what was loaded gives the
+// Saving writes values that differ from their defaults or that the document
+// gave, the kept parts, and the comments the document was read with. Saving what was loaded gives the
 // same bytes for a document this program wrote. Saving writes a temporary
 // file beside the target and renames it, so a failed save never leaves a
 // damaged document. Loading and saving take time linear in the document.

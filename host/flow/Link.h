@@ -82,6 +82,11 @@ public:
     bool IsAnimated() const { return curve_ != nullptr; }
     /// True when the value is the default constant.
     bool IsDefault() const;
+    /// Set for a value a document gave: saved again even when it equals the
+    /// default, since tools may work other values out from it (a clip's out
+    /// point follows its in point unless the document says otherwise).
+    bool WrittenInDocument() const { return writtenInDocument_; }
+    void SetWrittenInDocument(bool written) { writtenInDocument_ = written; }
     /// The unlinked value at `time` (constant or curve); null for a link or
     /// an image input without a link.
     Ref<Parameter> ValueAt(double time) const;
@@ -111,6 +116,7 @@ private:
     std::unique_ptr<AnimCurve> curve_;
     Output *link_ = nullptr;
     std::string unresolvedLink_;
+    bool writtenInDocument_ = false;
 };
 
 class ORVANE_API Output {

@@ -141,24 +141,26 @@ void ResampleAxis::SourceSpan(int begin, int end, int &lo, int &hi) const {
 // The sums below are the ones the device kernels repeat (ResizeKernels.cpp);
 // contraction into fused multiply-adds would change their bits, so it is off
 // for this part, also in the clone for processors that have it.
+#if defined(__clang__)
+#pragma float_control(push)
+#pragma clang fp contract(off)
+#else
 #pragma GCC push_options
 #pragma GCC optimize("fp-contract=off")
-// The vector helpers are inlined into each clone; their ABI never shows.
-#pragma GCC diagnostic push
-#pragma GCC diagnostic ignored "-Wpsabi"
+#endif
 
 namespace resample {
 
 // Eight floats, and four, as the processor's vectors (two SSE registers or one
-// AVX register for eight), loaded and stored unaligned.
+// AVX register for eight). *At8(p) is the eight floats at p as a vector
+// (unaligned, aliasing the floats). At8 returns a pointer: no vector passes
+// by value between a clone and a helper built for another processor, and the
+// pointer keeps the unaligned type (a returned reference loses it in Clang).
 typedef float V8 __attribute__((vector_size(32)));
 typedef float V4 __attribute__((vector_size(16)));
-inline V8 Load8(const float *p) {
-    V8 v;
-    std::memcpy(&v, p, sizeof v);
-    return v;
-}
-inline void Store8(float *p, V8 v) { std::memcpy(p, &v, sizeof v); }
+typedef float V8Unaligned __attribute__((vector_size(32), aligned(4), may_alias));
+inline const V8Unaligned *At8(const float *p) { return reinterpret_cast<const V8Unaligned *>(p); }
+inline V8Unaligned *At8(float *p) { return reinterpret_cast<V8Unaligned *>(p); }
 
 /// Across, four channels: out pixel i = sum over taps of w * pixel, the even
 /// taps and the odd taps summed apart and added last. `w4` holds each weight
@@ -170,7 +172,7 @@ AcrossRGBA(const float *src, int origin, const int *first, const float *w4, int 
         const float *s = src + 4 * (first[i] - origin);
         const float *w = w4 + static_cast<size_t>(i) * n;
         V8 a = {0, 0, 0, 0, 0, 0, 0, 0};
-        for (int k = 0; k < n; k += 8) a += Load8(w + k) * Load8(s + k);
+        for (int k = 0; k < n; k += 8) a += *At8(w + k) * *At8(s + k);
         const V4 even = {a[0], a[1], a[2], a[3]}, odd = {a[4], a[5], a[6], a[7]};
         const V4 sum = even + odd;
         std::memcpy(out + 4 * i, &sum, sizeof sum);
@@ -189,9 +191,9 @@ __attribute__((target_clones("arch=x86-64-v3", "default"))) void AcrossRGBA2(con
         const float *w = w4 + static_cast<size_t>(i) * n;
         V8 a = {0, 0, 0, 0, 0, 0, 0, 0}, b = a;
         for (int k = 0; k < n; k += 8) {
-            const V8 wk = Load8(w + k);
-            a += wk * Load8(s0 + k);
-            b += wk * Load8(s1 + k);
+            const V8 wk = *At8(w + k);
+            a += wk * *At8(s0 + k);
+            b += wk * *At8(s1 + k);
         }
         const V4 sa = V4{a[0], a[1], a[2], a[3]} + V4{a[4], a[5], a[6], a[7]};
         const V4 sb = V4{b[0], b[1], b[2], b[3]} + V4{b[4], b[5], b[6], b[7]};
@@ -224,17 +226,17 @@ __attribute__((target_clones("arch=x86-64-v3", "default"))) void Down(const floa
         for (int k = 0; k < taps; ++k) {
             const V8 wk = {w[k], w[k], w[k], w[k], w[k], w[k], w[k], w[k]};
             const float *r = rows[k] + x0;
-            a0 += wk * Load8(r), a1 += wk * Load8(r + 8), a2 += wk * Load8(r + 16), a3 += wk * Load8(r + 24);
-            a4 += wk * Load8(r + 32), a5 += wk * Load8(r + 40), a6 += wk * Load8(r + 48), a7 += wk * Load8(r + 56);
+            a0 += wk * *At8(r), a1 += wk * *At8(r + 8), a2 += wk * *At8(r + 16), a3 += wk * *At8(r + 24);
+            a4 += wk * *At8(r + 32), a5 += wk * *At8(r + 40), a6 += wk * *At8(r + 48), a7 += wk * *At8(r + 56);
         }
         float *o = out + x0;
-        Store8(o, a0), Store8(o + 8, a1), Store8(o + 16, a2), Store8(o + 24, a3);
-        Store8(o + 32, a4), Store8(o + 40, a5), Store8(o + 48, a6), Store8(o + 56, a7);
+        *At8(o) = a0, *At8(o + 8) = a1, *At8(o + 16) = a2, *At8(o + 24) = a3;
+        *At8(o + 32) = a4, *At8(o + 40) = a5, *At8(o + 48) = a6, *At8(o + 56) = a7;
     }
     for (; x0 + 8 <= len; x0 += 8) {
         V8 a = {};
-        for (int k = 0; k < taps; ++k) a += w[k] * Load8(rows[k] + x0);
-        Store8(out + x0, a);
+        for (int k = 0; k < taps; ++k) a += w[k] * *At8(rows[k] + x0);
+        *At8(out + x0) = a;
     }
     for (int x = x0; x < len; ++x) {
         float acc = 0.f;
@@ -245,8 +247,11 @@ __attribute__((target_clones("arch=x86-64-v3", "default"))) void Down(const floa
 
 } // namespace resample
 
-#pragma GCC diagnostic pop
+#if defined(__clang__)
+#pragma float_control(pop)
+#else
 #pragma GCC pop_options
+#endif
 
 namespace resample {
 

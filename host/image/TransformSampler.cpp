@@ -411,8 +411,9 @@ template <ComponentType CT, int C> void RunGeneral(Job &job) {
         return a.edges == EdgeCanvas ? std::pair{a.dataLo, a.dataHi}
                                      : std::pair{std::max(a.dataLo, a.frameLo), std::min(a.dataHi, a.frameHi)};
     };
-    const auto [xLo, xHi] = inside(job.ax);
-    const auto [yLo, yHi] = inside(job.ay);
+    // Plain variables rather than structured bindings: the row lambda captures them.
+    const std::pair<int, int> xs = inside(job.ax), ys = inside(job.ay);
+    const int xLo = xs.first, xHi = xs.second, yLo = ys.first, yHi = ys.second;
     ForRows(job, [&](int y, FltPixel *out) {
         thread_local std::vector<int> xi, yi;
         thread_local std::vector<float> xw, yw;

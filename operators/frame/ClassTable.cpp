@@ -16,7 +16,6 @@ namespace {
 // Kinds (RegTypeFlags) of the rows below.
 constexpr uint32_t kTool = RegKindOperator | RegKindTool;
 constexpr uint32_t kTwoImage = kTool | RegKindTwoImage;
-constexpr uint32_t kVarInputs = kTool | RegKindVariableInputs;
 constexpr uint32_t kSource = kTool | RegKindSource;
 constexpr uint32_t kTerminal = kTool | RegKindTerminal;
 constexpr uint32_t kMask = kTool | RegKindMask;

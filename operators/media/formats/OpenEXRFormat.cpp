@@ -42,6 +42,7 @@
 #include "host/image/PixelConvert.h"
 #include "host/media/IOClass.h"
 #include "operators/frame/Registration.h"
+#include "operators/media/formats/ExrHeaderScan.h"
 #include "operators/media/formats/ExrStreams.h"
 
 namespace Orvane {
@@ -99,6 +100,8 @@ const char *const kDefaultChoice = "Default";
 /// a data window may hold: damaged headers must not make us ask for terabytes.
 constexpr int64_t kCoordLimit = int64_t(8) * MaxImageSide;
 constexpr int64_t kMaxWindowPixels = int64_t(1) << 28;
+/// Tile sides any data window may have (larger ones must fit the window).
+constexpr int64_t kSmallTile = 256;
 
 AuxChannelKind KindOfSlot(int slot) { return static_cast<AuxChannelKind>(slot - OpenEXRFormat::FirstAuxSlot); }
 
@@ -107,6 +110,8 @@ void EnsureThreads() {
     std::call_once(once, [] {
         const unsigned n = std::thread::hardware_concurrency();
         Imf::setGlobalThreadCount(n > 1 ? static_cast<int>(n) : 0);
+        // The library then refuses larger windows before it sizes any table by them.
+        Imf::Header::setMaxImageSize(MaxImageSide, MaxImageSide);
     });
 }
 
@@ -749,6 +754,8 @@ bool OpenEXRFormat::LoadHeader(IOClass *stream) {
     auto r = std::make_unique<Reader>();
     r->start = io->Tell();
     try {
+        std::string damage;
+        if (!ExrHeadersFit(io, damage)) return Fail(damage);
         r->stream = std::make_unique<FileIStream>(io);
         r->file = std::make_unique<Imf::MultiPartInputFile>(*r->stream, Imf::globalThreadCount());
         for (int p = 0; p < r->file->parts(); ++p) {
@@ -901,6 +908,15 @@ bool OpenEXRFormat::LoadHeader(IOClass *stream) {
                         " is out of range");
         if (int64_t(P.dataWindow.Width()) * P.dataWindow.Height() > ef::kMaxWindowPixels)
             return Fail("OpenEXR: data window too large");
+        // The library sets buffers of whole tiles aside before it reads a
+        // pixel; a tile larger than the data window (beyond a small size) is damage.
+        if (P.tiled) {
+            const Imf::TileDescription &tiles = h.tileDescription();
+            if (int64_t(tiles.xSize) > std::max<int64_t>(P.dataWindow.Width(), ef::kSmallTile) ||
+                int64_t(tiles.ySize) > std::max<int64_t>(P.dataWindow.Height(), ef::kSmallTile))
+                return Fail("OpenEXR: tiles of " + std::to_string(tiles.xSize) + " x " + std::to_string(tiles.ySize) +
+                            " are larger than the data window");
+        }
         width = static_cast<int>(w);
         height = static_cast<int>(hh);
         dataWindow = ef::ImageWindow(P, height);

@@ -73,10 +73,17 @@ struct PngHandle {
                     : png_create_read_struct(PNG_LIBPNG_VER_STRING, &channel, ErrorFn, WarningFn);
         if (png) info = png_create_info_struct(png);
         if (png && info) {
-            if (write)
+            if (write) {
                 png_set_write_fn(png, &channel, WriteFn, FlushFn);
-            else
+            } else {
                 png_set_read_fn(png, &channel, ReadFn);
+                // libpng sets a chunk's data aside at the length the chunk
+                // states before reading it. Only the chunks read here are
+                // handled; the others (text, profiles, ...) are skipped unread.
+                static const png_byte kUsed[] = "gAMA\0sRGB\0pHYs";
+                png_set_keep_unknown_chunks(png, PNG_HANDLE_CHUNK_NEVER, nullptr, -1);
+                png_set_keep_unknown_chunks(png, PNG_HANDLE_CHUNK_AS_DEFAULT, kUsed, 3);
+            }
         }
     }
     ~PngHandle() {
@@ -165,11 +172,15 @@ bool DecodeRows(PngHandle &h, const Header &hd, DecodeJob &job) {
     if (setjmp(png_jmpbuf(h.png))) return false;
     png_set_expand(h.png);
     png_set_gray_to_rgb(h.png);
-    if (!hd.alpha) png_set_filler(h.png, hd.bitDepth == 16 ? 0xffff : 0xff, PNG_FILLER_AFTER);
+    // An opaque alpha channel where the rows have none. Not only when the
+    // header promised none: libpng drops a tRNS chunk that came too early.
+    png_set_filler(h.png, hd.bitDepth == 16 ? 0xffff : 0xff, PNG_FILLER_AFTER);
     const int passes = png_set_interlace_handling(h.png);
     png_read_update_info(h.png, h.info);
     const int bitDepth = png_get_bit_depth(h.png, h.info);
     const size_t rowBytes = png_get_rowbytes(h.png, h.info);
+    if (png_get_channels(h.png, h.info) != 4 || rowBytes < size_t(hd.width) * 4 * (bitDepth / 8))
+        png_error(h.png, "rows do not decode to four channels");
     Image &image = *job.image;
     const int height = image.Height();
     const ImgRectI dw = image.DataWindow() & image.Frame();

@@ -60,8 +60,9 @@ TEST(RefHandle, CountsEveryHandleAndDeletesWithTheLast) {
         Ref<Counted> c = std::move(b); // move: no change
         EXPECT_EQ(b.Get(), nullptr);
         Ref<Counted> d;
-        d = c; // copy assignment
-        d = d; // self assignment keeps the count
+        d = c;                        // copy assignment
+        const Ref<Counted> &same = d; // assigned through another name, as real self assignment happens
+        d = same;                     // self assignment keeps the count
         EXPECT_EQ(p->RefCount(), 3);
         d = std::move(c);
         EXPECT_FALSE(c);

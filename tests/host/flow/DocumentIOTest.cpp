@@ -253,7 +253,7 @@ return Orvane.Document{
         Center = {0.25,0.75},
         Size = Curve { {10, 2}, {0,1,Interp="Hold"} },
     } },
-    ["Mid"] = DocAlias {},
+    ["Mid"] = DocAlias { Inputs = { Width = 100 } },
   },
   Prefs = { FrameHeight = 720, },
   RenderRange = {5, 50}, Version = 1, GlobalRange={0,200},
@@ -268,10 +268,11 @@ return Orvane.Document{
     EXPECT_EQ(Keys(&root),
               (std::vector<std::string>{"Version", "Program", "GlobalRange", "RenderRange", "Prefs", "Tools"}));
     EXPECT_EQ(Keys(root.Find("Tools")), (std::vector<std::string>{"Alpha", "Mid", "Zed"}));
-    // Declaration order; defaults (Width's included, though it asks to be saved) are not added.
+    // Declaration order; defaults are not added (Width's neither, though it asks to be saved), but one the document
+    // gave stays.
     EXPECT_EQ(InputKeys(canonical, "Zed"), (std::vector<std::string>{"Size", "Width", "Input"}));
     EXPECT_EQ(InputKeys(canonical, "Alpha"), (std::vector<std::string>{"Size", "Center", "Mode", "Choice"}));
-    EXPECT_EQ(InputKeys(canonical, "Mid"), std::vector<std::string>{});
+    EXPECT_EQ(InputKeys(canonical, "Mid"), std::vector<std::string>{"Width"});
     EXPECT_EQ(ToolIn(canonical, "Mid").ClassName(), DocToolClass) << "an alias is saved as the class's ID";
     EXPECT_EQ(ToolIn(canonical, "Alpha").Find("Inputs")->Find("Choice")->AsNumber(), 1);
     const ScriptVal size = *ToolIn(canonical, "Alpha").Find("Inputs")->Find("Size");

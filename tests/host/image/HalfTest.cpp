@@ -7,8 +7,10 @@
 #include <cstdint>
 #include <limits>
 
-// The reference is the compiler's own binary16 type (GCC on x86-64), whose
-// conversions round to nearest even in the library's soft-float routines.
+#include "tests/support/CompilerHalf.h"
+
+// The reference is the compiler's own binary16 type, whose conversions round
+// to nearest even in the compiler runtime's soft-float routines.
 namespace Orvane::halftest {
 namespace {
 
@@ -17,7 +19,7 @@ float BitsFloat(uint32_t b) { return std::bit_cast<float>(b); }
 
 uint16_t RefToHalf(float f) {
     volatile float in = f; // keep the conversion at run time
-    return std::bit_cast<uint16_t>(static_cast<_Float16>(in));
+    return std::bit_cast<uint16_t>(static_cast<Orvane::Test::CompilerHalf>(in));
 }
 
 bool IsHalfNaN(uint16_t h) { return (h & 0x7c00u) == 0x7c00u && (h & 0x3ffu) != 0; }
@@ -36,7 +38,7 @@ TEST(HalfConvert, EveryHalfWidensExactlyAndRoundTrips) {
     for (uint32_t i = 0; i < 0x10000u; ++i) {
         const uint16_t h = static_cast<uint16_t>(i);
         const float f = HalfToFloat(h);
-        volatile _Float16 ref = std::bit_cast<_Float16>(h);
+        volatile Orvane::Test::CompilerHalf ref = std::bit_cast<Orvane::Test::CompilerHalf>(h);
         if (IsHalfNaN(h)) { // NaN, with its sign, both ways
             ++nanCount;
             ASSERT_TRUE(std::isnan(f) && std::signbit(f) == ((h & 0x8000u) != 0)) << std::hex << "half 0x" << i;

@@ -234,7 +234,7 @@ TEST(PixelRuns, EveryCodeLoadsAsItsValueAndStoresBack) {
                                        : void(std::memcpy(&raw[2 * i], &codes[i], 2));
         auto value = [&](uint16_t code) -> double {
             if (!half) return code / (fmt.bytesPerComponent == 1 ? 255.0 : 65535.0);
-            _Float16 h;
+            Orvane::Test::CompilerHalf h;
             std::memcpy(&h, &code, 2);
             return static_cast<float>(h);
         };
@@ -274,7 +274,7 @@ TEST(PixelRuns, SixteenBitValuesNarrowAndWidenToTheNearest) {
         StorePixel(DepthRGBAInt8, &px, 1, b8);
         ASSERT_EQ(b8[0], std::lround(v / 257.0)) << v;
         ASSERT_EQ(U16ToU8(static_cast<uint16_t>(v)), std::lround(v / 257.0)) << v;
-        _Float16 h[4];
+        Orvane::Test::CompilerHalf h[4];
         StorePixel(DepthRGBAFlt16, &px, 1, reinterpret_cast<uint8_t *>(h));
         ASSERT_LE(std::fabs(static_cast<double>(h[0]) - v / 65535.0), 0.5 * HalfStep(v / 65535.0) * 1.001) << v;
         float f[4];

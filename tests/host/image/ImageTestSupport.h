@@ -21,6 +21,7 @@
 #include "host/image/Image.h"
 #include "host/image/NewImage.h"
 #include "host/image/ResizeFilters.h"
+#include "tests/support/CompilerHalf.h"
 #include "tests/support/TestSupport.h"
 
 namespace Orvane::Test {
@@ -74,7 +75,7 @@ inline double StoredValue(int depth, double v) {
     case 1: return NearestCode(v, 65535) / 65535.0;
     case 2: {
         volatile float in = static_cast<float>(v);
-        return static_cast<float>(static_cast<_Float16>(in));
+        return static_cast<float>(static_cast<Test::CompilerHalf>(in));
     }
     default: return static_cast<float>(v);
     }

@@ -45,8 +45,10 @@ std::vector<std::pair<const char *, double>> Values(const Settings &s) {
     const char *const ids[] = {
         "Gain", "Lift",  "Gamma", "Contrast", "Brightness", "Saturation", "Low",       "High",
         "Red",  "Green", "Blue",  "Alpha",    "Direction",  "ClipBlack",  "ClipWhite", "PreDividePostMultiply"};
-    const double values[] = {s.gain, s.lift,  s.gamma, s.contrast, s.brightness, s.saturation, s.low,       s.high,
-                             s.red,  s.green, s.blue,  s.alpha,    s.reverse,    s.clipBlack,  s.clipWhite, s.prePost};
+    const double values[] = {s.gain,         s.lift,        s.gamma,         s.contrast,        s.brightness,
+                             s.saturation,   s.low,         s.high,          1.0 * s.red,       1.0 * s.green,
+                             1.0 * s.blue,   1.0 * s.alpha, 1.0 * s.reverse, 1.0 * s.clipBlack, 1.0 * s.clipWhite,
+                             1.0 * s.prePost};
     std::vector<std::pair<const char *, double>> out;
     for (size_t i = 0; i < std::size(ids); ++i) out.emplace_back(ids[i], values[i]);
     return out;

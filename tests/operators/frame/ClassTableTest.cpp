@@ -131,10 +131,14 @@ TEST(ClassTable, CommonControlAndImageAttributesSitWhereTheyMeanSomething) {
         if (noMotionBlur.count(row.id)) {
             EXPECT_TRUE(OffersTool(row.kind) || std::string(row.id) == "TrackerModifier") << row.id;
         }
-        if (row.kind & RegKindMask) EXPECT_FALSE(noMotionBlur.count(row.id)) << row.id;
+        if (row.kind & RegKindMask) {
+            EXPECT_FALSE(noMotionBlur.count(row.id)) << row.id;
+        }
         // Regions, domains and device images only for tools that make images.
         for (Tag tag : {RegSupportsRoI, RegSupportsDoD, RegSupportsGPUImages})
-            if (row.attrs.Has(tag)) EXPECT_TRUE(IsImageTool(row)) << row.id << std::hex << " " << tag;
+            if (row.attrs.Has(tag)) {
+                EXPECT_TRUE(IsImageTool(row)) << row.id << std::hex << " " << tag;
+            }
     }
     EXPECT_EQ(noObject, expectedNoObject);
     // Tools that read anywhere in their input, and the generators, do not take a partial domain.
@@ -157,7 +161,9 @@ TEST(ClassTable, FormatsAndModifiersNameWhatTheyReadAndMake) {
         }
         // A mask yields a mask; a modifier either names the one data type it
         // takes (Publish, Perturb) or yields one of these.
-        if (row.kind & RegKindMask) EXPECT_STREQ(row.attrs.GetText(RegOutputType), "Mask");
+        if (row.kind & RegKindMask) {
+            EXPECT_STREQ(row.attrs.GetText(RegOutputType), "Mask");
+        }
         if (row.kind != 5) continue;
         EXPECT_NE(row.attrs.Has(RegInputType), row.attrs.Has(RegOutputType));
         if (row.attrs.Has(RegOutputType)) {

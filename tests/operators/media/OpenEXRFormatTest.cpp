@@ -599,6 +599,27 @@ TEST_F(OpenEXRFormatTest, DamagedFilesFailCleanly) {
     }
     EXPECT_GT(files, 80);
 
+    // Headers stating sizes the library would set memory aside for before
+    // reading (found by fuzzing): refused at the header.
+    Bytes hugeValue = {'j', 0, 'j', 0}, hugeTiles, tiles;
+    Put32(hugeValue, 0x7ffffff0u); // an attribute of an unknown type claiming 2 GB
+    Put32(tiles, 32), Put32(tiles, 3022880), tiles.push_back(0);
+    Attr(hugeTiles, "tiles", "tiledesc", tiles); // 770 MB a tile, on an 8 x 5 window
+    const struct {
+        Bytes attribute;
+        uint8_t flags; // second byte of the version field
+        const char *error;
+    } headers[] = {{hugeValue, 0, "attribute j claims 2147483632 bytes"},
+                   {hugeTiles, 0x02, "tiles of 32 x 3022880 are larger than the data window"}};
+    for (const auto &h : headers) {
+        Bytes file = OffsetFile(0);
+        file[5] |= h.flags;
+        file.insert(file.begin() + 8, h.attribute.begin(), h.attribute.end());
+        const LoadResult r = Load(kId, file);
+        EXPECT_FALSE(r.headerOk) << h.error;
+        EXPECT_NE(r.error.find(h.error), std::string::npos) << r.error;
+    }
+
     // Truncated files and streams that fail: false with a reason, never a crash.
     Ref<Image> src = Pattern(40, 30, DepthRGBAFlt16, ImgRectI(0, 0, 40, 30));
     const Bytes whole = SaveWith(kId, src.Get(), {{"Compression", 3}});
