@@ -10,6 +10,7 @@
 #include "host/core/Registry.h"
 #include "host/core/Tags.h"
 #include "host/image/Image.h"
+#include "host/image/PixelMemory.h"
 #include "host/media/IOClass.h"
 #include "host/media/ImageFormat.h"
 
@@ -55,6 +56,7 @@ void LoadOperators() {
         std::fprintf(stderr, "cannot load the tool library: %s\n", error.c_str());
         std::abort();
     }
+    SetPixelMemoryLimit(kPixelMemoryLimit, "the fuzzing limit");
 }
 
 void Fatal(const char *why) {
@@ -72,7 +74,6 @@ void ReadImage(const char *formatId, const uint8_t *data, size_t size) {
     const Ref<Image> head = ReadOnce(*format, io, 1, {{ClipFrameHeaderOnly, 1}});
     if (!head) return;
     const ImgRectI dw = head->DataWindow();
-    if (int64_t(dw.Width()) * dw.Height() > kPixelBudget) return;
 
     // Proxy scale 1 to 4; with bit 2, a region: the lower right of the window.
     const int proxy = 1 + (control & 3);

@@ -8,13 +8,13 @@
 
 namespace Orvane::Fuzz {
 
-/// Pixels (data window area) a header may ask for before the harness skips
-/// reading the pixels. A few bytes can claim a huge image, which the readers
-/// do not refuse by its size yet; the budget keeps such inputs from
-/// exhausting memory, and small images keep the runs fast.
-constexpr int64_t kPixelBudget = int64_t(1) << 18;
+/// The process's pixel memory limit while fuzzing. A few bytes can claim a
+/// huge image; the host's header budget must refuse it before any pixel is
+/// allocated, and small images keep the runs fast.
+constexpr size_t kPixelMemoryLimit = size_t(64) << 20;
 
-/// Loads the tool library from beside the host library; aborts when it cannot.
+/// Loads the tool library from beside the host library and sets the pixel
+/// memory limit; aborts when it cannot.
 void LoadOperators();
 /// Prints `why` and aborts, so the fuzzer keeps the input.
 [[noreturn]] void Fatal(const char *why);
