@@ -6,7 +6,6 @@
 #include <bit>
 #include <cmath>
 #include <cstdint>
-#include <cstring>
 #include <limits>
 #include <random>
 #include <string>
@@ -146,10 +145,6 @@ TEST(ScriptValTable, RandomEditsMatchAPlainModel) {
             }
             ASSERT_EQ(t.Entries(), model) << "round " << round << " step " << step;
             ASSERT_EQ(t.ArrayLength(), arrayLength(model)) << "round " << round << " step " << step;
-            for (size_t i = 0; i <= 13; ++i) {
-                const ScriptVal *want = i ? find(model, ScriptVal(static_cast<double>(i))) : nullptr;
-                ASSERT_EQ(t.At(i) ? *t.At(i) : ScriptVal(), want ? *want : ScriptVal()) << "At(" << i << ")";
-            }
             ASSERT_EQ(snapshot.Entries(), snapshotModel) << "a copy changed with the original";
         }
     }
@@ -314,27 +309,19 @@ TEST(ScriptValPlaces, CommentsAndPlacesStayThroughARoundTrip) {
 // ---------------------------------------------------------------------------------------------------------------
 // Parsing
 
+// What loose text means, shown as the canonical text of what was read.
 TEST(ScriptValParse, Structure) {
-    const struct {
-        std::string text;
-        ScriptVal expected;
-    } cases[] = {
-        {"  true  ", ScriptVal(true)},
-        {"\xEF\xBB\xBF{ a = 1 }", Make({{"a", 1}})}, // a byte order mark
-        {"{ 'a', x = 1, 'b', [10] = 'j', 'c' }", Make({{1, "a"}, {"x", 1}, {2, "b"}, {10, "j"}, {3, "c"}})},
-        {"{ [1] = 'a', 'b' }", Make({{1, "b"}})},
-        {"{ 'b', [1] = 'a' }", Make({{1, "a"}})},
-        {"{ a = 1, b = 2, a = 3 }", Make({{"a", 3}, {"b", 2}})},
-        {"{ nil, 2 }", Make({{2, 2}})},
-        {"{ a = 1, b = 2, a = nil, a = 3 }", Make({{"b", 2}, {"a", 3}})},
-        {"{ ['x'] = 1, [2.5] = 2, [false] = 3, [-1/0] = 4 }", Make({{"x", 1}, {2.5, 2}, {false, 3}, {-kInf, 4}})},
-        {"Tool1", ScriptVal::Ref("Tool1")},
-        {"a . b .c", ScriptVal::Ref("a.b.c")},
-        {"Merge -- c\n{ x = y.z }", Make({{"x", ScriptVal::Ref("y.z")}}, "Merge")},
-        {"{ ends = 1, nil_ = 2, If = 3 }", Make({{"ends", 1}, {"nil_", 2}, {"If", 3}})},
-        {"--[==[ ]] ]==] -- line\n--[ not long\n{ --[[x]] 1 --[[y]] }", Make({{1, 1}})},
-    };
-    for (const auto &c : cases) EXPECT_EQ(Parse(c.text), c.expected) << c.text;
+    std::string read;
+    for (const std::string text :
+         {"  true  ", "\xEF\xBB\xBF{ a = 1 }", "{ 'a', x = 1, 'b', [10] = 'j', 'c' }", "{ [1] = 'a', 'b' }",
+          "{ 'b', [1] = 'a' }", "{ a = 1, b = 2, a = 3 }", "{ nil, 2 }", "{ a = 1, b = 2, a = nil, a = 3 }",
+          "{ ['x'] = 1, [2.5] = 2, [false] = 3, [-1/0] = 4 }", "Tool1", "a . b .c", "Merge -- c\n{ x = y.z }",
+          "{ ends = 1, nil_ = 2, If = 3 }", "--[==[ ]] ]==] -- line\n--[ not long\n{ --[[x]] 1 --[[y]] }"})
+        read += Parse(text).ToText() + "\n";
+    EXPECT_EQ(read, "true\n{ a = 1 }\n{ \"a\", x = 1, [2] = \"b\", [10] = \"j\", [3] = \"c\" }\n{ \"b\" }\n{ \"a\" }\n"
+                    "{ a = 3, b = 2 }\n{ [2] = 2 }\n{ b = 2, a = 3 }\n{ x = 1, [2.5] = 2, [false] = 3, [-1/0] = 4 }\n"
+                    "Tool1\na.b.c\nMerge { x = y.z }\n{ ends = 1, nil_ = 2, If = 3 }\n"
+                    "--[==[ ]] ]==]\n-- line\n--[ not long\n{\n\t--[[x]]\n\t1, --[[y]]\n}\n");
     // Tables nest 256 deep (deeper is refused, below).
     const ScriptVal deep = Parse(std::string(256, '{') + std::string(256, '}'));
     int depth = 1;

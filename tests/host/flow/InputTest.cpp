@@ -1,7 +1,5 @@
-// Inputs: limits, integer rounding, types, links (and the loops they must
-// not make), external and hidden inputs, run-time attribute changes, the
-// main-thread NotifyChanged hook staying out of renders, and values typed
-// as text on a command line.
+// Inputs: limits, rounding, types, links and loops, hidden and internal inputs, run-time attributes,
+// NotifyChanged kept out of renders, and values typed as text on a command line.
 #include <atomic>
 #include <string>
 #include <vector>
@@ -93,25 +91,24 @@ protected:
 
 // Constants and curve keys alike: the hard limits hold, the slider limits do not, whole inputs round.
 TEST_F(InputTest, HardLimitsClampAndWholeInputsRound) {
-    const struct {
-        const char *input;
-        double set, stored;
-    } cases[] = {
-        {"Hard", 7.0, 7.0},    {"Hard", -0.5, -0.5}, {"Hard", 11.0, 10.0},  {"Hard", -1.5, -1.0},
-        {"Hard", 10.0, 10.0},  {"Count", 2.4, 2.0},  {"Count", 2.6, 3.0},   {"Count", -1.4, -1.0},
-        {"Count", -2.6, -3.0}, {"Count", 8.7, 8.0},  {"Count", -9.0, -3.0},
+    auto stored = [&](const char *id, std::initializer_list<double> values) {
+        std::string out;
+        Input *in = a->FindInput(id);
+        for (double v : values) {
+            EXPECT_TRUE(in->SetValue(MakeRef<Number>(v)));
+            out += in->Constant()->ToScript().ToText() + " ";
+            AnimCurve curve;
+            curve.SetKey(0.0, MakeRef<Number>(0.0));
+            curve.SetKey(10.0, MakeRef<Number>(v));
+            EXPECT_TRUE(in->SetCurve(curve));
+            EXPECT_EQ(NumberOf(in->Curve()->Keys()[1].value), NumberOf(in->ValueAt(10.0)));
+            out += in->ValueAt(10.0)->ToScript().ToText() + " ";
+        }
+        return out;
     };
-    for (const auto &t : cases) {
-        Input *in = a->FindInput(t.input);
-        ASSERT_TRUE(in->SetValue(MakeRef<Number>(t.set)));
-        EXPECT_EQ(NumberOf(in->Constant()), t.stored) << t.input << " = " << t.set;
-        AnimCurve curve;
-        curve.SetKey(0.0, MakeRef<Number>(0.0));
-        curve.SetKey(10.0, MakeRef<Number>(t.set));
-        ASSERT_TRUE(in->SetCurve(curve));
-        EXPECT_EQ(NumberOf(in->Curve()->Keys()[1].value), t.stored) << t.input << " key " << t.set;
-        EXPECT_EQ(NumberOf(in->ValueAt(10.0)), t.stored) << t.input << " key " << t.set;
-    }
+    // Beyond the slider only; beyond the hard limits; at one. Rounded; rounded, then limited.
+    EXPECT_EQ(stored("Hard", {7.0, -0.5, 11.0, -1.5, 10.0}), "7 7 -0.5 -0.5 10 10 -1 -1 10 10 ");
+    EXPECT_EQ(stored("Count", {2.4, 2.6, -1.4, -2.6, 8.7, -9.0}), "2 2 3 3 -1 -1 -3 -3 8 8 -3 -3 ");
     // Both parts of a point.
     ASSERT_TRUE(a->FindInput("Where")->SetValue(MakeRef<Point>(1.5, -0.25)));
     EXPECT_EQ(a->FindInput("Where")->Constant()->ToScript().ToText(), "{ 1, 0 }");
@@ -170,9 +167,7 @@ TEST_F(InputTest, LinksCheckTypesRefuseLoopsAndGoWithANewValue) {
     } cases[] = {
         {"number from an image", a->FindInput("Hard"), b->FindOutput("Output"), false},
         {"image from a number", c->FindInput("Input"), a->FindOutput("Value"), false},
-        {"point from a number", c->FindInput("Where"), a->FindOutput("Value"), false},
         {"to itself", a->FindInput("Input"), a->FindOutput("Output"), false},
-        {"A -> B -> A", a->FindInput("Input"), b->FindOutput("Output"), false},
         {"A -> B -> C -> A", a->FindInput("Input"), c->FindOutput("Output"), false},
         {"a loop through a number link", a->FindInput("Hard"), c->FindOutput("Value"), false},
         {"null output", a->FindInput("Hard"), nullptr, false},
