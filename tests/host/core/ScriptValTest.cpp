@@ -50,9 +50,6 @@ void ExpectPlacesInText(const ScriptVal &v, const std::string &text) {
     for (const auto &entry : v.Entries()) ExpectPlacesInText(entry.second, text);
 }
 
-// ---------------------------------------------------------------------------------------------------------------
-// Values and tables
-
 TEST(ScriptValValue, Equality) {
     const struct {
         ScriptVal a, b;
@@ -165,9 +162,6 @@ TEST(ScriptValTable, TableOfMakesWhatSetMakesAndRefusesRepeatedKeys) {
     EXPECT_THROW(ScriptVal::TableOf("not a name", {}), std::invalid_argument);
 }
 
-// ---------------------------------------------------------------------------------------------------------------
-// Numbers and texts
-
 TEST(ScriptValNumbers, WrittenShortestReadBackBitExactAndReadInEveryForm) {
     std::string written;
     for (double d : {0.0, -0.0, -42.0, 0.1, 1e5, 1e300, 5e-324, kInf, -kInf, kNaN, -kNaN, 1.0 / 3, 0x1p53 + 2})
@@ -225,9 +219,6 @@ TEST(ScriptValText, WrittenWithEscapesAndReadInEveryForm) {
                     R"(" "a\0b" "a\0b" "a\nb\nc" )"
                     R"("\nl1\nl2\nl3" "a]]b]=]c" "a\\nb" )");
 }
-
-// ---------------------------------------------------------------------------------------------------------------
-// Writing, places and comments
 
 TEST(ScriptValWrite, ScalarsSmallTablesAndTheOneLineLimit) {
     ScriptVal mixed = ScriptVal::Table();
@@ -299,9 +290,6 @@ TEST(ScriptValPlaces, CommentsAndPlacesStayThroughARoundTrip) {
               std::make_tuple(2, 3, 8, 12));
     EXPECT_EQ(std::make_pair(ScriptVal(1).Line(), ScriptVal(1).Column()), std::make_pair(0, 0));
 }
-
-// ---------------------------------------------------------------------------------------------------------------
-// Parsing
 
 // What loose text means, shown as the canonical text of what was read.
 TEST(ScriptValParse, Structure) {
