@@ -1,6 +1,5 @@
-// Inputs: limits, integer rounding, types, links (and the loops they must
-// not make), external and hidden inputs, run-time attribute changes, and the
-// main-thread NotifyChanged hook staying out of renders.
+// Inputs: limits, rounding, types, links and loops, hidden and internal inputs, run-time attributes,
+// NotifyChanged kept out of renders, and values typed as text on a command line.
 #include <atomic>
 #include <string>
 #include <vector>
@@ -12,11 +11,10 @@
 #include "host/flow/AnimCurve.h"
 #include "host/flow/DataTypes.h"
 #include "host/flow/Engine.h"
+#include "host/flow/InputValue.h"
 #include "host/flow/Request.h"
-#include "tests/support/TestSupport.h"
 
 namespace Orvane::inputtest {
-namespace ts = ::Orvane::Test;
 namespace {
 
 /// A tool with one input of each kind the tests need. Its "Value" output is
@@ -24,46 +22,27 @@ namespace {
 class KnobsTool : public ThreadedOperator {
 public:
     KnobsTool(const Registry *reg, const ScriptVal &args, const TagList &tags) : ThreadedOperator(reg, args, tags) {
-        AddInputTagList("Hard", "Hard",
-                        {{LinkDataType, CLSID_DataType_Number},
-                         {InputMinAllowed, -1.0},
-                         {InputMaxAllowed, 10.0},
-                         {InputSliderLow, 0.0},
-                         {InputSliderHigh, 5.0},
-                         {InputDefault, 2.0}});
-        AddInputTagList("Slider", "Slider",
-                        {{LinkDataType, CLSID_DataType_Number},
-                         {InputSliderLow, 0.0},
-                         {InputSliderHigh, 1.0},
-                         {InputDefault, 0.5}});
-        AddInputTagList("Count", "Count",
-                        {{LinkDataType, CLSID_DataType_Number},
-                         {InputInteger, 1},
-                         {InputMinAllowed, -3.0},
-                         {InputMaxAllowed, 8.0}});
-        AddInputTagList("Where", "Where",
-                        {{LinkDataType, CLSID_DataType_Point},
-                         {InputMinAllowed, 0.0},
-                         {InputMaxAllowed, 1.0},
-                         {InputDefaultX, 0.5},
-                         {InputDefaultY, 0.25}});
-        AddInputTagList("Caption", "Caption", {{LinkDataType, CLSID_DataType_Text}, {InputDefaultText, "hello"}});
-        AddInputTagList("Mode", "Mode",
-                        {{LinkDataType, CLSID_DataType_OvID},
-                         {InputDefaultId, OvID("ModeB")},
-                         {ListAddItem, "A"},
-                         {ListItemId, OvID("ModeA")},
-                         {ListAddItem, "B"},
-                         {ListItemId, OvID("ModeB")}});
-        AddInputTagList("Hidden", "Hidden",
-                        {{LinkDataType, CLSID_DataType_Number}, {ControlVisible, 0}, {InputDefault, 3.0}});
-        AddInputTagList("Internal", "Internal",
-                        {{LinkDataType, CLSID_DataType_Number}, {InputExternal, 0}, {InputDefault, 4.0}});
-        AddInputTagList("Notified", "Notified",
-                        {{LinkDataType, CLSID_DataType_Number}, {InputNotify, 1}, {InputDefault, 1.0}});
-        AddInputTagList("Input", "Input", {{LinkDataType, CLSID_DataType_Image}, {LinkMain, 1}, {InputRequired, 0}});
+        const OvID number = CLSID_DataType_Number, idA("ModeA"), idB("ModeB");
+        Knob("Hard", number,
+             {{InputMinAllowed, -1.0}, {InputMaxAllowed, 10.0}, {InputSliderLow, 0.0}, {InputSliderHigh, 5.0}});
+        Knob("Count", number, {{InputInteger, 1}, {InputMinAllowed, -3.0}, {InputMaxAllowed, 8.0}});
+        Knob("Where", CLSID_DataType_Point,
+             {{InputMinAllowed, 0.0}, {InputMaxAllowed, 1.0}, {InputDefaultX, 0.5}, {InputDefaultY, 0.25}});
+        Knob("Caption", CLSID_DataType_Text, {{InputDefaultText, "hello"}});
+        Knob("Mode", CLSID_DataType_OvID,
+             {{InputDefaultId, idB}, {ListAddItem, "A"}, {ListItemId, idA}, {ListAddItem, "B"}, {ListItemId, idB}});
+        Knob("Blend", number, {{ListAddItem, "Normal"}, {ListAddItem, "Soft Light"}});
+        Knob("File", CLSID_DataType_Clip, {});
+        Knob("Hidden", number, {{ControlVisible, 0}, {InputDefault, 3.0}});
+        Knob("Internal", number, {{InputExternal, 0}, {InputDefault, 4.0}});
+        Knob("Notified", number, {{InputNotify, 1}, {InputDefault, 1.0}});
+        Knob("Input", CLSID_DataType_Image, {{LinkMain, 1}, {InputRequired, 0}});
         AddOutputTagList("Output", "Output", {{LinkDataType, CLSID_DataType_Image}, {LinkMain, 1}});
-        value = AddOutputTagList("Value", "Value", {{LinkDataType, CLSID_DataType_Number}});
+        value = AddOutputTagList("Value", "Value", {{LinkDataType, number}});
+    }
+    void Knob(const char *id, OvID type, TagList tags) {
+        tags.Add({LinkDataType, type});
+        AddInputTagList(id, id, tags);
     }
     void NotifyChanged(Input *in, Parameter *param, double time, TagList *tags) override {
         ++notifications;
@@ -80,13 +59,12 @@ public:
     int processCount = 0;
 };
 
-Object *MakeKnobs(const Registry *reg, const ScriptVal &args, const TagList &tags) {
-    return new KnobsTool(reg, args, tags);
-}
-
 OvID KnobsClass() {
     static const OvID id = [] {
-        TagList tags{{RegConstructor, &MakeKnobs},
+        auto make = [](const Registry *reg, const ScriptVal &args, const TagList &tags) -> Object * {
+            return new KnobsTool(reg, args, tags);
+        };
+        TagList tags{{RegConstructor, +make},
                      {RegTypeFlags, static_cast<long long>(RegKindOperator | RegKindTool)},
                      {RegNoBlendControls, 1},
                      {RegNoEffectMask, 1}};
@@ -96,264 +74,205 @@ OvID KnobsClass() {
     return id;
 }
 
-struct Knobs {
-    Ref<OrvaneDoc> doc = MakeRef<OrvaneDoc>();
-    KnobsTool *Add(const std::string &name) {
-        auto *k = dynamic_cast<KnobsTool *>(doc->AddTool(KnobsClass(), name));
-        EXPECT_NE(k, nullptr);
-        return k;
-    }
-};
-
 double NumberOf(const Ref<Parameter> &p) {
     auto *n = dynamic_cast<const Number *>(p.Get());
     EXPECT_NE(n, nullptr);
     return n ? n->value : -12345.0;
 }
 
-TEST(Input, HardLimitsClampValuesAndSliderLimitsDoNot) {
-    struct Case {
-        const char *input;
-        double set, stored;
+// A flow of three knob tools, A, B and C.
+class InputTest : public ::testing::Test {
+protected:
+    KnobsTool *Add(const char *name) { return dynamic_cast<KnobsTool *>(doc->AddTool(KnobsClass(), name)); }
+    void SetUp() override { ASSERT_TRUE(a && b && c); }
+    Ref<OrvaneDoc> doc = MakeRef<OrvaneDoc>();
+    KnobsTool *a = Add("A"), *b = Add("B"), *c = Add("C");
+};
+
+// Constants and curve keys alike: the hard limits hold, the slider limits do not, whole inputs round.
+TEST_F(InputTest, HardLimitsClampAndWholeInputsRound) {
+    auto stored = [&](const char *id, std::initializer_list<double> values) {
+        std::string out;
+        Input *in = a->FindInput(id);
+        for (double v : values) {
+            EXPECT_TRUE(in->SetValue(MakeRef<Number>(v)));
+            out += in->ValueAt(10.0)->ToScript().ToText() + " "; // the curve set before is gone
+            AnimCurve curve;
+            curve.SetKey(0.0, MakeRef<Number>(0.0));
+            curve.SetKey(10.0, MakeRef<Number>(v));
+            EXPECT_TRUE(in->SetCurve(curve));
+            EXPECT_EQ(NumberOf(in->Curve()->Keys()[1].value), NumberOf(in->ValueAt(10.0)));
+            out += in->ValueAt(10.0)->ToScript().ToText() + " ";
+        }
+        return out;
     };
-    const Case cases[] = {
-        {"Hard", 4.5, 4.5},    {"Hard", 7.0, 7.0},   // beyond the slider, within the hard limits
-        {"Hard", 11.0, 10.0},  {"Hard", -1.5, -1.0}, // beyond the hard limits
-        {"Hard", -1.0, -1.0},  {"Hard", 10.0, 10.0}, // at them
-        {"Slider", 3.5, 3.5},  {"Slider", -2.0, -2.0},
-        {"Count", 2.4, 2.0},   {"Count", 2.6, 3.0}, // rounded
-        {"Count", -1.4, -1.0}, {"Count", -2.6, -3.0},
-        {"Count", 8.7, 8.0},   {"Count", -9.0, -3.0}, // rounded, then limited
-    };
-    Knobs k;
-    KnobsTool *t = k.Add("K1");
-    for (const Case &c : cases) {
-        SCOPED_TRACE(std::string(c.input) + " = " + std::to_string(c.set));
-        Input *in = t->FindInput(c.input);
-        ASSERT_TRUE(in->SetValue(MakeRef<Number>(c.set)));
-        EXPECT_EQ(NumberOf(in->Constant()), c.stored);
-        EXPECT_EQ(NumberOf(in->ValueAt(0.0)), c.stored);
-    }
+    // Beyond the slider only; beyond the hard limits; at one. Rounded; rounded, then limited.
+    EXPECT_EQ(stored("Hard", {7.0, -0.5, 11.0, -1.5, 10.0}), "7 7 -0.5 -0.5 10 10 -1 -1 10 10 ");
+    EXPECT_EQ(stored("Count", {2.4, 2.6, -1.4, -2.6, 8.7, -9.0}), "2 2 3 3 -1 -1 -3 -3 8 8 -3 -3 ");
     // Both parts of a point.
-    Input *where = t->FindInput("Where");
-    ASSERT_TRUE(where->SetValue(MakeRef<Point>(1.5, -0.25)));
-    auto *p = dynamic_cast<const Point *>(where->Constant().Get());
-    ASSERT_NE(p, nullptr);
-    EXPECT_EQ(p->x, 1.0);
-    EXPECT_EQ(p->y, 0.0);
+    ASSERT_TRUE(a->FindInput("Where")->SetValue(MakeRef<Point>(1.5, -0.25)));
+    EXPECT_EQ(a->FindInput("Where")->Constant()->ToScript().ToText(), "{ 1, 0 }");
 }
 
-TEST(Input, CurveKeysObeyTheHardLimits) {
-    Knobs k;
-    KnobsTool *t = k.Add("K1");
-    struct Case {
-        const char *input;
-        double keys[3], stored[3];
-    };
-    const Case cases[] = {
-        {"Hard", {-5.0, 3.0, 25.0}, {-1.0, 3.0, 10.0}},
-        {"Slider", {-5.0, 0.5, 25.0}, {-5.0, 0.5, 25.0}},
-        {"Count", {-7.0, 1.6, 9.2}, {-3.0, 2.0, 8.0}},
-    };
-    for (const Case &c : cases) {
-        SCOPED_TRACE(c.input);
-        AnimCurve curve;
-        for (int i = 0; i < 3; ++i) curve.SetKey(10.0 * i, MakeRef<Number>(c.keys[i]));
-        Input *in = t->FindInput(c.input);
-        ASSERT_TRUE(in->SetCurve(curve));
-        ASSERT_TRUE(in->IsAnimated());
-        ASSERT_EQ(in->Curve()->Keys().size(), 3u);
-        for (int i = 0; i < 3; ++i) {
-            EXPECT_EQ(NumberOf(in->Curve()->Keys()[i].value), c.stored[i]);
-            EXPECT_EQ(NumberOf(in->ValueAt(10.0 * i)), c.stored[i]);
-        }
-    }
-}
-
-TEST(Input, ValuesOfTheWrongTypeAreRefused) {
-    Knobs k;
-    KnobsTool *t = k.Add("K1");
-    struct Case {
-        const char *input;
-        Ref<Parameter> value;
-    };
-    const Case cases[] = {
-        {"Hard", MakeRef<Text>("7")},
-        {"Hard", MakeRef<Point>(1.0, 2.0)},
-        {"Where", MakeRef<Number>(0.5)},
-        {"Caption", MakeRef<Number>(1.0)},
-        {"Caption", MakeRef<IDValue>(OvID("hello"))},
-        {"Mode", MakeRef<Text>("ModeA")},
-        {"Input", MakeRef<Number>(1.0)},
-        {"Hard", nullptr},
-    };
-    for (const Case &c : cases) {
-        SCOPED_TRACE(c.input);
-        Input *in = t->FindInput(c.input);
+TEST_F(InputTest, ValuesOfTheWrongTypeAreRefused) {
+    const Ref<Parameter> text = MakeRef<Text>("ModeA"), point = MakeRef<Point>(1.0, 2.0), number = MakeRef<Number>(0.5),
+                         id = MakeRef<IDValue>(OvID("hello"));
+    const std::pair<const char *, Ref<Parameter>> cases[] = {{"Hard", text},      {"Hard", point},  {"Where", number},
+                                                             {"Caption", number}, {"Caption", id},  {"Mode", text},
+                                                             {"Input", number},   {"Hard", nullptr}};
+    for (const auto &[input, value] : cases) {
+        Input *in = a->FindInput(input);
         const Ref<Parameter> before = in->Constant();
-        EXPECT_FALSE(in->SetValue(c.value));
-        EXPECT_EQ(in->Constant().Get(), before.Get()) << "the old value stays";
+        EXPECT_FALSE(in->SetValue(value)) << input;
+        EXPECT_EQ(in->Constant().Get(), before.Get()) << input << ": the old value stays";
         AnimCurve curve;
-        if (c.value) {
-            curve.SetKey(0.0, c.value);
-            EXPECT_FALSE(in->SetCurve(curve));
-            EXPECT_FALSE(in->IsAnimated());
-        }
+        curve.SetKey(0.0, value ? value : text);
+        EXPECT_FALSE(in->SetCurve(curve) || in->IsAnimated()) << input;
     }
 }
 
-TEST(Input, DefaultsComeFromTheTagsAndIsDefaultTracksThem) {
-    Knobs k;
-    KnobsTool *t = k.Add("K1");
-    for (const char *id : {"Hard", "Slider", "Count", "Where", "Caption", "Mode", "Hidden"})
-        EXPECT_TRUE(t->FindInput(id)->IsDefault()) << id;
-    EXPECT_EQ(NumberOf(t->FindInput("Hard")->Constant()), 2.0);
-    EXPECT_EQ(dynamic_cast<const Text &>(*t->FindInput("Caption")->Constant()).value, "hello");
-    EXPECT_EQ(dynamic_cast<const IDValue &>(*t->FindInput("Mode")->Constant()).value, OvID("ModeB"));
-    const auto &where = dynamic_cast<const Point &>(*t->FindInput("Where")->Constant());
-    EXPECT_EQ(where.x, 0.5);
-    EXPECT_EQ(where.y, 0.25);
+TEST_F(InputTest, DefaultsComeFromTheTagsAndIsDefaultTracksThem) {
+    std::string defaults;
+    for (const char *id : {"Hard", "Where", "Caption", "Mode", "Hidden"}) {
+        EXPECT_TRUE(a->FindInput(id)->IsDefault()) << id;
+        defaults += a->FindInput(id)->Constant()->ToScript().ToText() + " ";
+    }
+    EXPECT_EQ(defaults, "0 { 0.5, 0.25 } \"hello\" \"ModeB\" 3 ");
 
-    Input *hard = t->FindInput("Hard");
-    ASSERT_TRUE(hard->SetValue(MakeRef<Number>(3.0)));
-    EXPECT_FALSE(hard->IsDefault());
-    ASSERT_TRUE(hard->SetValue(MakeRef<Number>(2.0))); // an equal value, not the same object
-    EXPECT_TRUE(hard->IsDefault());
+    Input *hidden = a->FindInput("Hidden");
+    ASSERT_TRUE(hidden->SetValue(MakeRef<Number>(2.0)));
+    EXPECT_FALSE(hidden->IsDefault());
+    ASSERT_TRUE(hidden->SetValue(MakeRef<Number>(3.0))); // an equal value, not the same object
+    EXPECT_TRUE(hidden->IsDefault());
     AnimCurve curve;
-    curve.SetKey(0.0, MakeRef<Number>(2.0));
-    ASSERT_TRUE(hard->SetCurve(curve));
-    EXPECT_FALSE(hard->IsDefault()) << "an animated input is not at its default";
-    hard->ResetValue();
-    EXPECT_TRUE(hard->IsDefault());
-    EXPECT_FALSE(hard->IsAnimated());
+    curve.SetKey(0.0, MakeRef<Number>(3.0));
+    ASSERT_TRUE(hidden->SetCurve(curve));
+    EXPECT_FALSE(hidden->IsDefault()) << "an animated input is not at its default";
+    hidden->ResetValue();
+    EXPECT_TRUE(hidden->IsDefault() && !hidden->IsAnimated());
     // A value that rounds to the default is the default.
-    ASSERT_TRUE(t->FindInput("Count")->SetValue(MakeRef<Number>(0.3)));
-    EXPECT_TRUE(t->FindInput("Count")->IsDefault());
+    ASSERT_TRUE(a->FindInput("Count")->SetValue(MakeRef<Number>(0.3)));
+    EXPECT_TRUE(a->FindInput("Count")->IsDefault());
 }
 
-TEST(Input, ConnectToChecksTypesAndRefusesLoops) {
-    Knobs k;
-    KnobsTool *a = k.Add("A");
-    KnobsTool *b = k.Add("B");
-    KnobsTool *c = k.Add("C");
-    struct Case {
+TEST_F(InputTest, LinksCheckTypesRefuseLoopsAndGoWithANewValue) {
+    // Links first made: B.Input <- A.Output, C.Input <- B.Output (A -> B -> C).
+    ASSERT_TRUE(b->FindInput("Input")->ConnectTo(a->FindOutput("Output")));
+    ASSERT_TRUE(c->FindInput("Input")->ConnectTo(b->FindOutput("Output")));
+    const struct {
         const char *name;
         Input *in;
         Output *out;
         bool ok;
-    };
-    // Links first made: B.Input <- A.Output, C.Input <- B.Output (A -> B -> C).
-    ASSERT_TRUE(b->FindInput("Input")->ConnectTo(a->FindOutput("Output")));
-    ASSERT_TRUE(c->FindInput("Input")->ConnectTo(b->FindOutput("Output")));
-    const Case cases[] = {
+    } cases[] = {
         {"number from an image", a->FindInput("Hard"), b->FindOutput("Output"), false},
         {"image from a number", c->FindInput("Input"), a->FindOutput("Value"), false},
-        {"point from a number", c->FindInput("Where"), a->FindOutput("Value"), false},
         {"to itself", a->FindInput("Input"), a->FindOutput("Output"), false},
-        {"A -> B -> A", a->FindInput("Input"), b->FindOutput("Output"), false},
         {"A -> B -> C -> A", a->FindInput("Input"), c->FindOutput("Output"), false},
         {"a loop through a number link", a->FindInput("Hard"), c->FindOutput("Value"), false},
         {"null output", a->FindInput("Hard"), nullptr, false},
+        {"internal input", c->FindInput("Internal"), a->FindOutput("Value"), false},
         {"number from a number", c->FindInput("Hard"), a->FindOutput("Value"), true},
         {"image from a second branch", c->FindInput("Input"), a->FindOutput("Output"), true},
     };
-    for (const Case &t : cases) {
-        SCOPED_TRACE(t.name);
+    for (const auto &t : cases) {
         Output *before = t.in->Link();
-        EXPECT_EQ(t.in->ConnectTo(t.out), t.ok);
-        EXPECT_EQ(t.in->Link(), t.ok ? t.out : before);
+        EXPECT_EQ(t.in->ConnectTo(t.out), t.ok) << t.name;
+        EXPECT_EQ(t.in->Link(), t.ok ? t.out : before) << t.name;
     }
     // Consumers follow the links.
     EXPECT_EQ(a->FindOutput("Output")->Consumers(),
               (std::vector<Input *>{b->FindInput("Input"), c->FindInput("Input")}));
     EXPECT_TRUE(b->FindOutput("Output")->Consumers().empty()) << "C's Input moved on to A";
-}
 
-TEST(Input, DisconnectAndSetValueDropTheLink) {
-    Knobs k;
-    KnobsTool *a = k.Add("A");
-    KnobsTool *b = k.Add("B");
+    // Disconnect and SetValue drop a link.
     Input *hard = b->FindInput("Hard");
-    ASSERT_TRUE(hard->ConnectTo(a->FindOutput("Value")));
+    ASSERT_TRUE(hard->ConnectTo(c->FindOutput("Value")));
     EXPECT_FALSE(hard->IsDefault());
     EXPECT_FALSE(hard->ValueAt(0.0)) << "a linked input has no value of its own";
     hard->Disconnect();
-    EXPECT_EQ(hard->Link(), nullptr);
-    EXPECT_TRUE(a->FindOutput("Value")->Consumers().empty());
-    EXPECT_TRUE(hard->IsDefault());
+    EXPECT_TRUE(hard->Link() == nullptr && c->FindOutput("Value")->Consumers().empty() && hard->IsDefault());
     hard->Disconnect(); // again: nothing happens
 
-    ASSERT_TRUE(hard->ConnectTo(a->FindOutput("Value")));
+    ASSERT_TRUE(hard->ConnectTo(c->FindOutput("Value")));
     ASSERT_TRUE(hard->SetValue(MakeRef<Number>(6.0)));
-    EXPECT_EQ(hard->Link(), nullptr);
-    EXPECT_TRUE(a->FindOutput("Value")->Consumers().empty());
+    EXPECT_TRUE(hard->Link() == nullptr && c->FindOutput("Value")->Consumers().empty());
     // Once the link is gone, the other way round is no longer a loop.
-    Input *back = a->FindInput("Hard");
-    EXPECT_TRUE(back->ConnectTo(b->FindOutput("Value")));
+    EXPECT_TRUE(c->FindInput("Hard")->ConnectTo(b->FindOutput("Value")));
 }
 
-TEST(Input, AHiddenControlStillDeliversItsValue) {
-    Knobs k;
-    KnobsTool *t = k.Add("K1");
-    Input *hidden = t->FindInput("Hidden");
-    EXPECT_FALSE(hidden->IsVisible());
+// Hidden inputs, inputs changed to hidden and internal inputs all deliver their values to renders.
+TEST_F(InputTest, AttributesChangeAtRunTimeAndHiddenAndInternalInputsStillDeliver) {
+    Input *hidden = a->FindInput("Hidden"), *hard = a->FindInput("Hard"), *internal = a->FindInput("Internal");
+    EXPECT_FALSE(hidden->IsVisible() || internal->IsExternal());
     ASSERT_TRUE(hidden->SetValue(MakeRef<Number>(7.5)));
-    EXPECT_EQ(NumberOf(Evaluate(t->value, 0.0)), 7.5);
-    // Hidden at run time, after the value was set.
-    Input *hard = t->FindInput("Hard");
+    EXPECT_EQ(NumberOf(Evaluate(a->value, 0.0)), 7.5);
     ASSERT_TRUE(hard->SetValue(MakeRef<Number>(6.25)));
     hard->SetAttrsTagList({{ControlVisible, 0}});
     EXPECT_FALSE(hard->IsVisible());
-    t->watch = "Hard";
-    EXPECT_EQ(NumberOf(Evaluate(t->value, 1.0)), 6.25);
-}
-
-TEST(Input, SetAttrsTagListChangesTagsAtRunTime) {
-    Knobs k;
-    KnobsTool *t = k.Add("K1");
-    Input *hard = t->FindInput("Hard");
-    EXPECT_TRUE(hard->IsVisible());
-    hard->SetAttrsTagList({{ControlVisible, 0}});
-    EXPECT_FALSE(hard->IsVisible());
-    hard->SetAttrsTagList({{ControlVisible, 1}, {ControlLabel, "Strength"}});
-    EXPECT_TRUE(hard->IsVisible());
-    EXPECT_STREQ(hard->Label(), "Strength");
-    // New limits hold for values set afterwards.
-    hard->SetAttrsTagList({{InputMaxAllowed, 3.0}});
-    ASSERT_TRUE(hard->SetValue(MakeRef<Number>(9.0)));
-    EXPECT_EQ(NumberOf(hard->Constant()), 3.0);
-    EXPECT_EQ(hard->Tags().GetDouble(InputMinAllowed), -1.0) << "other tags stay";
-}
-
-TEST(Input, AnInternalInputTakesNoLinkAndNoCurve) {
-    Knobs k;
-    KnobsTool *a = k.Add("A");
-    KnobsTool *b = k.Add("B");
-    Input *internal = b->FindInput("Internal");
-    EXPECT_FALSE(internal->IsExternal());
-    EXPECT_FALSE(internal->ConnectTo(a->FindOutput("Value")));
-    EXPECT_EQ(internal->Link(), nullptr);
+    a->watch = "Hard";
+    EXPECT_EQ(NumberOf(Evaluate(a->value, 1.0)), 6.25);
     AnimCurve curve;
     curve.SetKey(0.0, MakeRef<Number>(1.0));
-    curve.SetKey(5.0, MakeRef<Number>(2.0));
-    EXPECT_FALSE(internal->SetCurve(curve));
-    EXPECT_FALSE(internal->IsAnimated());
-    // It still holds a constant, which reaches the render.
+    EXPECT_FALSE(internal->SetCurve(curve) || internal->IsAnimated()) << "an internal input takes no curve";
     ASSERT_TRUE(internal->SetValue(MakeRef<Number>(9.0)));
-    b->watch = "Internal";
-    EXPECT_EQ(NumberOf(Evaluate(b->value, 0.0)), 9.0);
+    a->watch = "Internal";
+    EXPECT_EQ(NumberOf(Evaluate(a->value, 2.0)), 9.0);
+    // Shown again with a new label; a new limit holds for values set afterwards, other tags stay.
+    hard->SetAttrsTagList({{ControlVisible, 1}, {ControlLabel, "Strength"}, {InputMaxAllowed, 3.0}});
+    EXPECT_TRUE(hard->IsVisible());
+    EXPECT_STREQ(hard->Label(), "Strength");
+    ASSERT_TRUE(hard->SetValue(MakeRef<Number>(9.0)));
+    EXPECT_EQ(NumberOf(hard->Constant()), 3.0);
+    EXPECT_EQ(hard->Tags().GetDouble(InputMinAllowed), -1.0);
 }
 
-TEST(Input, RendersDoNotCallNotifyChanged) {
-    Knobs k;
-    KnobsTool *a = k.Add("A");
-    KnobsTool *b = k.Add("B");
+TEST_F(InputTest, RendersDoNotCallNotifyChanged) {
     ASSERT_TRUE(b->FindInput("Notified")->ConnectTo(a->FindOutput("Value")));
     b->watch = "Notified";
     const int before = b->notifications.load() + a->notifications.load();
     for (double time : {0.0, 1.0, 2.0}) EXPECT_EQ(NumberOf(Evaluate(b->value, time)), 3.0);
     EXPECT_EQ(b->processCount, 3);
     EXPECT_EQ(b->notifications.load() + a->notifications.load(), before);
+}
+
+// Text as typed on a command line: script syntax where it parses, text as it stands for inputs that take text,
+// a link only to a tool that exists.
+TEST_F(InputTest, TextBecomesTheValueTheInputTakes) {
+    std::string read;
+    for (const std::string set :
+         {"Hard=2.5", "Hard=\"7\"", "Hard=Nope.Value", "Where={ 0.5, 0.25 }", "Caption=two words", "Caption=\"quoted\"",
+          "Caption=42", "Caption=A", "Caption=A.Output", "Caption=Nope.Output", "File=renders/a.####.exr", "Mode=ModeA",
+          "Blend=Soft Light", "Blend=1"}) {
+        const size_t eq = set.find('=');
+        read += InputValueFromText(*doc, a->FindInput(set.substr(0, eq).c_str()), set.substr(eq + 1)).ToText() + " ";
+    }
+    // Written back as script: texts in quotes, links bare.
+    EXPECT_EQ(read, "2.5 \"7\" Nope.Value { 0.5, 0.25 } \"two words\" \"quoted\" \"42\" \"A\" A.Output \"Nope.Output\" "
+                    "\"renders/a.####.exr\" \"ModeA\" \"Soft Light\" 1 ");
+    // A choice by name, as typed, sets its number.
+    Input *blend = a->FindInput("Blend");
+    for (const auto &[text, choice] : {std::pair{"soft light", 1.0}, std::pair{"Normal", 0.0}}) {
+        EXPECT_EQ(ApplyInputValue(*doc, blend, InputValueFromText(*doc, blend, text)), "") << text;
+        EXPECT_EQ(NumberOf(blend->Constant()), choice) << text;
+    }
+    std::string refusals;
+    for (const char *text : {"1 2", "{ 0.5"}) {
+        try {
+            ADD_FAILURE() << "read as " << InputValueFromText(*doc, a->FindInput("Hard"), text).ToText();
+        } catch (const std::invalid_argument &e) {
+            refusals += e.what() + std::string("\n");
+        }
+    }
+    EXPECT_EQ(refusals,
+              "expects a number or Tool.Output, not '1 2' (unexpected number after the value)\n"
+              "expects a number or Tool.Output, not '{ 0.5' (expected '}' to close table opened at line 1)\n");
+    // The entries of list inputs, with the IDs of ID lists.
+    std::string choices;
+    for (const char *id : {"Mode", "Blend", "Hard"})
+        for (const InputChoice &choice : InputChoices(a->FindInput(id)))
+            choices += choice.label + "=" + choice.id + " ";
+    EXPECT_EQ(choices, "A=ModeA B=ModeB Normal= Soft Light= ");
 }
 
 } // namespace
