@@ -286,7 +286,7 @@ std::string IndexKey(const ScriptVal &key) {
 
 // Collects the fields of one table while it is parsed, with the semantics of ScriptVal::Set applied in order
 // (a later value for a key wins; nil removes), without a linear search for every field.
-class TableBuilder {
+template <class Make> class TableBuilder {
 public:
     std::vector<ScriptVal::Entry> entries;
     // Called with the earlier key and the new one when a key is given again.
@@ -295,6 +295,7 @@ public:
     void Positional(ScriptVal value) {
         ++positional_;
         ScriptVal key(static_cast<double>(positional_));
+        Make::Place(key, value.Line(), value.Column()); // a positional key stands where its value does
         // Positional keys only grow, so until a keyed field appears none can already exist.
         if (!keyed_) {
             if (!value.IsNil()) entries.emplace_back(std::move(key), std::move(value));
@@ -791,7 +792,7 @@ private:
         const size_t open = cur_.pos;
         if (++depth_ > kMaxDepth) Fail(open, "nesting too deep");
         Next();
-        TableBuilder fields;
+        TableBuilder<Make> fields;
         if (notes_)
             fields.onRepeat = [this](const ScriptVal &first, const ScriptVal &again) {
                 notes_->emplace_back(again.Line(), again.Column(),

@@ -141,6 +141,12 @@ Ref<Parameter> CheckedParameter(const Input *in, const ScriptVal &v, bool lenien
     return value;
 }
 
+/// "expects a number or Tool.Output": what the input takes, a link included.
+std::string ExpectsOrLink(const Input *in) {
+    const std::string what = std::string("expects ") + ExpectedValueText(in);
+    return IsImageDataType(in->DataType()) ? what : what + " or Tool.Output";
+}
+
 std::vector<std::string> ToolNames(const OrvaneDoc &doc) {
     std::vector<std::string> names;
     for (const Operator *op : doc.Tools()) names.push_back(op->Name());
@@ -202,7 +208,7 @@ std::string ApplyInputValue(OrvaneDoc &doc, Input *in, const ScriptVal &v, const
         // A bare word is a name for inputs that take names, never a link.
         if (v.AsText().find('.') == std::string::npos) {
             if (TakesWords(in)) return ApplyInputValue(doc, in, ScriptVal(v.AsText()), options);
-            return std::string("expects ") + ExpectedValueText(in) + " or Tool.Output, not '" + v.AsText() + "'";
+            return ExpectsOrLink(in) + ", not '" + v.AsText() + "'";
         }
         return ApplyLink(doc, in, v.AsText(), options);
     }
@@ -242,8 +248,7 @@ ScriptVal InputValueFromText(const OrvaneDoc &doc, const Input *in, const std::s
         value = ScriptVal::FromText(text);
     } catch (const ScriptParseError &e) {
         if (TakesWords(in)) return ScriptVal(text);
-        throw std::invalid_argument(std::string("expects ") + ExpectedValueText(in) + " or Tool.Output, not '" + text +
-                                    "' (" + e.Message() + ")");
+        throw std::invalid_argument(ExpectsOrLink(in) + ", not '" + text + "' (" + e.Message() + ")");
     }
     if (words && !value.IsText()) {
         // Text as it stands, unless it names an existing tool's output.

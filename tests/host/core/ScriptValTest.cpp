@@ -326,6 +326,7 @@ TEST(ScriptValParse, RepeatedKeysAreNotedWithBothPlaces) {
           "line 2, column 38: [true] is given twice (first at line 2)"}},
         {"{ a = 1, a = nil, a = 3 }", {"line 1, column 10: 'a' is given twice (first at line 1)"}},
         {"{ a = 1, t = { a = 2 } }", {}},
+        {"{ [1] = 'a',\n 'b' }", {"line 2, column 2: [1] is given twice (first at line 1)"}},
         {many + "\n\n k7 = 2 }", {"line 3, column 2: 'k7' is given twice (first at line 1)"}},
     };
     for (const auto &c : cases) {
