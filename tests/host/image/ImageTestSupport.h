@@ -70,6 +70,16 @@ inline Ref<Image> Filled(int w, int h, int depth, const std::function<FltPixel(i
 /// The kind of component a depth stores: 0 8-bit, 1 16-bit, 2 half, 3 float.
 inline int Kind(int depth) { return (depth - 1) % 4; }
 
+/// Half a step of the grid `depth` stores values on, at v: how far a stored value may lie from v.
+inline double HalfCode(int depth, double v) {
+    switch (Kind(depth)) {
+    case 0: return 0.5 / 255;
+    case 1: return 0.5 / 65535;
+    case 2: return std::ldexp(1.0, std::ilogb(std::max(std::fabs(v), 0x1p-14)) - 11);
+    default: return 0;
+    }
+}
+
 /// A request of a render that has been aborted.
 struct AbortedRequest {
     RenderTask task;
@@ -80,23 +90,26 @@ struct AbortedRequest {
 inline float Channel(const FltPixel &p, int c) { return c == 0 ? p.R : c == 1 ? p.G : c == 2 ? p.B : p.A; }
 template <size_t N> double Channel(const std::array<double, N> &p, int c) { return p[c]; }
 
-/// Whether every channel from `c0` of `img` over `window` lies within `tol` of
+/// Whether channels c0 to c1 - 1 of `img` over `window` lie within `tol` of
 /// want(x, y, c), or of channel c of want(x, y); says where not.
-template <class F>
-::testing::AssertionResult AllNear(const Image &img, const ImgRectI &window, double tol, F want, int c0 = 0) {
+template <class F>::testing::AssertionResult AllNear(const Image &img, const ImgRectI &window, double tol, F want,
+                                                     int c0 = 0, int c1 = 4) {
     for (int y = window.y0; y < window.y1; ++y)
-        for (int x = window.x0; x < window.x1; ++x)
-            for (int c = c0; c < 4; ++c) {
-                const double got = Channel(img.GetFlt(x, y), c);
-                double w;
-                if constexpr (std::is_invocable_v<F, int, int, int>)
-                    w = want(x, y, c);
-                else
-                    w = Channel(want(x, y), c);
-                if (!(std::fabs(got - w) <= tol))
-                    return ::testing::AssertionFailure()
-                           << "at " << x << "," << y << " channel " << c << ": " << got << ", want " << w;
+        for (int x = window.x0; x < window.x1; ++x) {
+            double w[4];
+            if constexpr (std::is_invocable_v<F, int, int, int>)
+                for (int c = c0; c < c1; ++c) w[c] = want(x, y, c);
+            else {
+                const auto p = want(x, y);
+                for (int c = 0; c < 4; ++c) w[c] = Channel(p, c);
             }
+            for (int c = c0; c < c1; ++c) {
+                const double got = Channel(img.GetFlt(x, y), c);
+                if (!(std::fabs(got - w[c]) <= tol))
+                    return ::testing::AssertionFailure()
+                           << "at " << x << "," << y << " channel " << c << ": " << got << ", want " << w[c];
+            }
+        }
     return ::testing::AssertionSuccess();
 }
 
