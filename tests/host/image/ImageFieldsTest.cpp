@@ -1,10 +1,6 @@
 // Field copies, field dominance reversal and window cuts. Rows carry their
 // own row number in red (and column in green), so every written line tells
 // where it came from; the expected layouts are worked out by hand per case.
-#include <gtest/gtest.h>
-
-#include <vector>
-
 #include "tests/host/image/ImageTestSupport.h"
 
 namespace Orvane::imgfieldstest {
@@ -14,13 +10,9 @@ using namespace ::Orvane::Test;
 constexpr float kMarker = -7.f;
 
 /// A w x h image whose pixel (x, y) is (y, x, 100 + y, 1), over `dw` when given.
-Ref<Image> RowImage(int w, int h, int depth = DepthRGBAFlt32, const ImgRectI *dw = nullptr) {
-    Ref<Image> img = Blank(w, h, depth, dw);
-    EXPECT_TRUE(img && img->AllocScanLineData());
-    const ImgRectI r = img->DataWindow();
-    for (int y = r.y0; y < r.y1; ++y)
-        for (int x = r.x0; x < r.x1; ++x) img->PutFlt(x, y, {float(y), float(x), 100.f + y, 1.f});
-    return img;
+Ref<Image> RowImage(int w, int h, int depth = DepthRGBAFlt32, const ImgRectI *dw = nullptr, FltPixel canvas = {}) {
+    auto rows = [](int x, int y) { return FltPixel{float(y), float(x), 100.f + y, 1.f}; };
+    return Filled(w, h, depth, rows, dw, canvas);
 }
 
 /// The source row each row of `img` shows (red), -1 for a zero row, -2 for the marker.
@@ -55,23 +47,22 @@ TEST(CopyField, FullHeightLinesLandWhereExpected) {
         {6, 0, 1, 1, Self, {1, 1, 3, 3, 5, 5}},      // into the same image: read before written
     };
     for (const auto &c : cases) {
-        SCOPED_TRACE(testing::Message() << "h " << c.h << " field " << c.field << " dest " << c.dest << " mode "
-                                        << c.mode << " into " << c.into);
-        Ref<Image> src = RowImage(4, c.h), marked = RowImage(4, c.h);
-        marked->Fill({kMarker, 0, 0, 1});
-        Image *into = c.into == New ? nullptr : c.into == Marked ? marked.Get() : src.Get();
-        Ref<Image> out = src->CopyField(c.field, into, c.dest, c.mode);
-        ASSERT_TRUE(out);
-        EXPECT_EQ(out.Get() == src.Get(), c.into == Self);
-        EXPECT_EQ(RowsOf(*out), c.rows);
+        Ref<Image> src = RowImage(4, c.h), marked = Filled(4, c.h, DepthRGBAFlt32, [](int, int) {
+                                               return FltPixel{kMarker, 0, 0, 1};
+                                           });
+        Ref<Image> out =
+            src->CopyField(c.field, c.into == New ? nullptr : (c.into == Marked ? marked : src).Get(), c.dest, c.mode);
+        ASSERT_TRUE(out && (out.Get() == src.Get()) == (c.into == Self)) << &c - cases;
+        EXPECT_EQ(RowsOf(*out), c.rows) << "h " << c.h << " field " << c.field << " dest " << c.dest << " mode "
+                                        << c.mode << " into " << c.into;
     }
 }
 
 TEST(CopyField, ConvertsDepthsAndRefusesWhatDoesNotFit) {
     // Into an integer frame: the float rows stored at its depth; lines not written stay zero.
-    Ref<Image> into = Blank(4, 6, DepthRGBAInt16), small = Blank(4, 6, DepthRGBAFlt32);
-    ASSERT_TRUE(into->AllocScanLineData() && small->AllocScanLineData());
-    for (int y = 0; y < 6; ++y) small->FillWithin({y / 8.f, 0.5f, 0.25f, 1.f}, ImgRectI(0, y, 4, y + 1));
+    Ref<Image> into = Blank(4, 6, DepthRGBAInt16);
+    Ref<Image> small = Filled(4, 6, DepthRGBAFlt32, [](int, int y) { return FltPixel{y / 8.f, 0.5f, 0.25f, 1.f}; });
+    ASSERT_TRUE(into->AllocScanLineData());
     ASSERT_TRUE(small->CopyField(0, into.Get(), 2, 1));
     for (int y = 0; y < 6; ++y) EXPECT_NEAR(into->GetFlt(2, y).R, (5 - y) % 2 == 0 ? y / 8.f : 0.f, 1e-4) << y;
 
@@ -92,39 +83,28 @@ TEST(CopyField, HalfHeightImagesAreTaggedAndKeepTheWindows) {
         std::vector<int> rows; // the frame rows of the field's rows, bottom up
     } cases[] = {{5, 0, {0, 2, 4}}, {5, 1, {1, 3}}, {6, 0, {1, 3, 5}}, {6, 1, {0, 2, 4}}, {1, 0, {0}}};
     for (const auto &c : cases) {
-        SCOPED_TRACE(testing::Message() << "h " << c.h << " field " << c.field);
         Ref<Image> src = PatternAt(3, c.h, DepthRGBAInt16);
         src->SetScale(1.5, 0.75);
         Ref<Image> out = src->CopyField(c.field, nullptr, -1, 1);
-        ASSERT_TRUE(out);
         const int n = static_cast<int>(c.rows.size());
-        EXPECT_EQ(out->Height(), n);
-        EXPECT_EQ(out->Depth(), DepthRGBAInt16);
-        EXPECT_EQ(out->GetAttrL(ImgField, -1), c.field);
-        EXPECT_EQ(out->GetAttrL(ImgFullHeight), c.h);
+        ASSERT_TRUE(out && out->Height() == n && out->Depth() == DepthRGBAInt16) << "h " << c.h << " field " << c.field;
+        EXPECT_TRUE(out->GetAttrL(ImgField, -1) == c.field && out->GetAttrL(ImgFullHeight) == c.h);
         EXPECT_DOUBLE_EQ(out->GetAttrD(ImgFieldOffset, -1.0), c.rows[0] * 0.5 / n);
         EXPECT_DOUBLE_EQ(out->YScale(), 1.5);
-        for (int yh = 0; yh < n; ++yh) EXPECT_EQ(out->GetFlt(1, yh), src->GetFlt(1, c.rows[yh])) << yh;
+        for (int yh = 0; yh < n; ++yh) EXPECT_EQ(out->GetFlt(1, yh), src->GetFlt(1, c.rows[yh])) << c.h << " " << yh;
     }
     // Rows 1..5 of a 6-line frame: field 0 is rows 1, 3, 5 (all inside), field 1 rows 0, 2, 4 (row 0 outside).
     const ImgRectI dw(1, 1, 4, 6);
-    Ref<Image> src = RowImage(6, 6, DepthRGBAFlt32, &dw);
     const FltPixel canvas{0.25f, 0.5f, 0.75f, 1.f};
-    src->SetCanvasColor(canvas);
+    Ref<Image> src = RowImage(6, 6, DepthRGBAFlt32, &dw, canvas);
     Ref<Image> f0 = src->CopyField(0, nullptr, -1, 1), f1 = src->CopyField(1, nullptr, -1, 1);
     ASSERT_TRUE(f0 && f1);
-    EXPECT_EQ(f0->DataWindow(), ImgRectI(1, 0, 4, 3));
-    EXPECT_EQ(f1->DataWindow(), ImgRectI(1, 1, 4, 3));
-    EXPECT_EQ(f0->GetFlt(2, 2).R, 5.f);
-    EXPECT_EQ(f1->GetFlt(2, 1).R, 2.f);
-    EXPECT_EQ(f1->GetFlt(2, 0), canvas);
+    EXPECT_TRUE(f0->DataWindow() == ImgRectI(1, 0, 4, 3) && f1->DataWindow() == ImgRectI(1, 1, 4, 3));
+    EXPECT_TRUE(f0->GetFlt(2, 2).R == 5.f && f1->GetFlt(2, 1).R == 2.f && f1->GetFlt(2, 0) == canvas);
     // A full-height copy keeps the windows; lines of the other field are zero inside them.
     Ref<Image> full = src->CopyField(1, nullptr, 2, 1);
-    ASSERT_TRUE(full);
-    EXPECT_EQ(full->DataWindow(), dw);
-    EXPECT_EQ(full->GetFlt(2, 2).R, 2.f);
-    EXPECT_EQ(full->GetFlt(2, 3), FltPixel{});
-    EXPECT_EQ(full->GetFlt(0, 3), canvas);
+    ASSERT_TRUE(full && full->DataWindow() == dw);
+    EXPECT_TRUE(full->GetFlt(2, 2).R == 2.f && full->GetFlt(2, 3) == FltPixel{} && full->GetFlt(0, 3) == canvas);
 }
 
 TEST(ReverseFieldDominance, MovesThePictureDownOneLine) {
@@ -132,21 +112,17 @@ TEST(ReverseFieldDominance, MovesThePictureDownOneLine) {
         Ref<Image> img = PatternAt(3, 5, depth), before = PatternAt(3, 5, depth);
         img->ReverseFieldDominance();
         const int want[5] = {1, 2, 3, 4, 4}; // the top line repeats
-        for (int y = 0; y < 5; ++y)
-            for (int x = 0; x < 3; ++x) EXPECT_EQ(img->GetFlt(x, y), before->GetFlt(x, want[y])) << x << "," << y;
+        EXPECT_TRUE(AllNear(*img, img->DataWindow(), 0, [&](int x, int y) { return before->GetFlt(x, want[y]); }));
     }
     // A window below the frame's top: the row above the window is canvas; auxiliary planes move too.
     const ImgRectI dw(0, 0, 3, 3);
-    Ref<Image> low = RowImage(3, 5, DepthRGBAFlt32, &dw);
     const FltPixel canvas{0.5f, 0.5f, 0.5f, 0.5f};
-    low->SetCanvasColor(canvas);
+    Ref<Image> low = RowImage(3, 5, DepthRGBAFlt32, &dw, canvas);
     low->AddAuxChannel(AuxChannelKind::Z);
     for (int y = 0; y < 3; ++y) low->AuxRow(AuxChannelKind::Z, y)[1] = 10.f + y;
     low->ReverseFieldDominance();
-    EXPECT_EQ(low->GetFlt(1, 1).R, 2.f);
-    EXPECT_EQ(low->GetFlt(1, 2), canvas);
-    EXPECT_EQ(low->AuxRow(AuxChannelKind::Z, 0)[1], 11.f);
-    EXPECT_EQ(low->AuxRow(AuxChannelKind::Z, 2)[1], 0.f);
+    EXPECT_TRUE(low->GetFlt(1, 1).R == 2.f && low->GetFlt(1, 2) == canvas);
+    EXPECT_TRUE(low->AuxRow(AuxChannelKind::Z, 0)[1] == 11.f && low->AuxRow(AuxChannelKind::Z, 2)[1] == 0.f);
     // Images the caller does not own stay as they are.
     Ref<Image> shared = RowImage(3, 5);
     shared->SetReadOnly();
@@ -156,9 +132,8 @@ TEST(ReverseFieldDominance, MovesThePictureDownOneLine) {
 
 TEST(CopyOfImageTagList, CutsAndGrowsWithCanvasOutside) {
     const ImgRectI dw(2, 1, 6, 5), grown(0, 0, 8, 6), cut(3, 2, 5, 4);
-    Ref<Image> src = RowImage(8, 6, DepthRGBAFlt32, &dw);
     const FltPixel canvas{0.1f, 0.2f, 0.3f, 0.4f}, black{0, 0, 0, 1};
-    src->SetCanvasColor(canvas);
+    Ref<Image> src = RowImage(8, 6, DepthRGBAFlt32, &dw, canvas);
     src->SetValidWindow(ImgRectI(2, 1, 5, 4));
     src->AddAuxChannel(AuxChannelKind::Z);
     for (int y = dw.y0; y < dw.y1; ++y)
@@ -169,12 +144,9 @@ TEST(CopyOfImageTagList, CutsAndGrowsWithCanvasOutside) {
     Ref<Image> small = src->CopyOfImageTagList({{ImgDataWindow, &cut}});
     Ref<Image> eight = src->CopyOfImageTagList({{ImgDepth, DepthRGBAInt8}, {ImgCanvasColor, &black}});
     ASSERT_TRUE(same && big && small && eight);
-    EXPECT_EQ(same->DataWindow(), dw);
-    EXPECT_EQ(same->ValidWindow(), src->ValidWindow());
-    EXPECT_EQ(same->GetCanvasColor(), canvas);
-    EXPECT_EQ(big->ValidWindow(), grown);
-    EXPECT_EQ(small->DataWindow(), cut);
-    EXPECT_EQ(small->ValidWindow(), cut);
+    EXPECT_TRUE(same->DataWindow() == dw && same->ValidWindow() == src->ValidWindow() &&
+                same->GetCanvasColor() == canvas);
+    EXPECT_TRUE(big->ValidWindow() == grown && small->DataWindow() == cut && small->ValidWindow() == cut);
     for (int y = 0; y < 6; ++y)
         for (int x = 0; x < 8; ++x) {
             EXPECT_EQ(big->GetFlt(x, y), dw.Contains(x, y) ? src->GetFlt(x, y) : canvas) << x << "," << y;
@@ -183,12 +155,9 @@ TEST(CopyOfImageTagList, CutsAndGrowsWithCanvasOutside) {
                 EXPECT_EQ(small->AuxRow(AuxChannelKind::Z, y)[x - cut.x0], 10.f * y + (x - dw.x0));
             }
         }
-    EXPECT_EQ(big->AuxRow(AuxChannelKind::Z, 0)[0], 0.f);
-    EXPECT_EQ(big->AuxRow(AuxChannelKind::Z, 3)[4], 10.f * 3 + 2);
-    // Another depth and canvas through the usual tags.
-    EXPECT_EQ(eight->Depth(), DepthRGBAInt8);
-    EXPECT_EQ(eight->GetCanvasColor(), black);
-    EXPECT_EQ(eight->GetFlt(3, 2).G, 1.f); // 3 clamps to white
+    EXPECT_TRUE(big->AuxRow(AuxChannelKind::Z, 0)[0] == 0.f && big->AuxRow(AuxChannelKind::Z, 3)[4] == 10.f * 3 + 2);
+    // Another depth and canvas through the usual tags; 3 clamps to white.
+    EXPECT_TRUE(eight->Depth() == DepthRGBAInt8 && eight->GetCanvasColor() == black && eight->GetFlt(3, 2).G == 1.f);
 }
 
 } // namespace

@@ -1,25 +1,37 @@
 #pragma once
-// Helpers the image tests share: blank and pattern images at any depth, what
-// a depth stores of a value (worked out here, not by the host's converters),
-// the resize filters written out from their definitions, image comparisons,
-// and the files and commands of the other programs results are held against.
+// Helpers the image, colour and device tests share: blank, filled and pattern
+// images at any depth, what a depth stores of a value (worked out here, not
+// by the host's converters), the resize filters written out from their
+// definitions, image comparisons, and the files and commands of the other
+// programs results are held against. Includes what these tests commonly use.
 #include <gtest/gtest.h>
 
 #include <algorithm>
+#include <array>
+#include <atomic>
 #include <cmath>
+#include <cstdint>
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
 #include <filesystem>
 #include <fstream>
+#include <functional>
+#include <limits>
 #include <numbers>
+#include <numeric>
 #include <string>
+#include <type_traits>
+#include <vector>
 
 #include <unistd.h>
 
 #include "host/core/Tags.h"
+#include "host/flow/RenderTask.h"
+#include "host/flow/Request.h"
 #include "host/image/Image.h"
 #include "host/image/NewImage.h"
+#include "host/image/PixelConvert.h"
 #include "host/image/ResizeFilters.h"
 #include "tests/support/CompilerHalf.h"
 #include "tests/support/TestSupport.h"
@@ -33,15 +45,73 @@ inline Ref<Image> Blank(int w, int h, int depth, const ImgRectI *dw = nullptr) {
     return NewImageTagList(tags);
 }
 
-/// The test pattern stored at `depth`, so that reads give what the depth holds.
-inline Ref<Image> PatternAt(int w, int h, int depth, unsigned seed = 3, const ImgRectI *dw = nullptr) {
+/// The test pattern stored at `depth`, so that reads give what the depth holds; `canvas` beyond `dw`.
+inline Ref<Image> PatternAt(int w, int h, int depth, unsigned seed = 3, const ImgRectI *dw = nullptr,
+                            FltPixel canvas = {}) {
     Ref<Image> img = Blank(w, h, depth, dw);
     EXPECT_TRUE(img->AllocScanLineData());
     img->ImageCopy(PatternImage(w, h, DepthRGBAFlt32, seed).Get());
+    img->SetCanvasColor(canvas);
     return img;
 }
 
+/// A w x h image of `depth` whose data window (`dw`, else the frame) holds f(x, y), with `canvas` beyond.
+inline Ref<Image> Filled(int w, int h, int depth, const std::function<FltPixel(int, int)> &f,
+                         const ImgRectI *dw = nullptr, FltPixel canvas = {}) {
+    Ref<Image> img = Blank(w, h, depth, dw);
+    EXPECT_TRUE(img->AllocScanLineData());
+    img->SetCanvasColor(canvas);
+    const ImgRectI r = img->DataWindow();
+    for (int y = r.y0; y < r.y1; ++y)
+        for (int x = r.x0; x < r.x1; ++x) img->PutFlt(x, y, f(x, y));
+    return img;
+}
+
+/// The kind of component a depth stores: 0 8-bit, 1 16-bit, 2 half, 3 float.
+inline int Kind(int depth) { return (depth - 1) % 4; }
+
+/// Half a step of the grid `depth` stores values on, at v: how far a stored value may lie from v.
+inline double HalfCode(int depth, double v) {
+    switch (Kind(depth)) {
+    case 0: return 0.5 / 255;
+    case 1: return 0.5 / 65535;
+    case 2: return std::ldexp(1.0, std::ilogb(std::max(std::fabs(v), 0x1p-14)) - 11);
+    default: return 0;
+    }
+}
+
+/// A request of a render that has been aborted.
+struct AbortedRequest {
+    RenderTask task;
+    Request req{nullptr, nullptr, 0.0, 0, &task};
+    AbortedRequest() { task.Abort(); }
+};
+
 inline float Channel(const FltPixel &p, int c) { return c == 0 ? p.R : c == 1 ? p.G : c == 2 ? p.B : p.A; }
+template <size_t N> double Channel(const std::array<double, N> &p, int c) { return p[c]; }
+
+/// Whether channels c0 to c1 - 1 of `img` over `window` lie within `tol` of
+/// want(x, y, c), or of channel c of want(x, y); says where not.
+template <class F>::testing::AssertionResult AllNear(const Image &img, const ImgRectI &window, double tol, F want,
+                                                     int c0 = 0, int c1 = 4) {
+    for (int y = window.y0; y < window.y1; ++y)
+        for (int x = window.x0; x < window.x1; ++x) {
+            double w[4];
+            if constexpr (std::is_invocable_v<F, int, int, int>)
+                for (int c = c0; c < c1; ++c) w[c] = want(x, y, c);
+            else {
+                const auto p = want(x, y);
+                for (int c = 0; c < 4; ++c) w[c] = Channel(p, c);
+            }
+            for (int c = c0; c < c1; ++c) {
+                const double got = Channel(img.GetFlt(x, y), c);
+                if (!(std::fabs(got - w[c]) <= tol))
+                    return ::testing::AssertionFailure()
+                           << "at " << x << "," << y << " channel " << c << ": " << got << ", want " << w[c];
+            }
+        }
+    return ::testing::AssertionSuccess();
+}
 
 /// The largest difference between two images over `window`, all channels.
 inline double MaxDiff(const Image &a, const Image &b, const ImgRectI &window) {
@@ -70,7 +140,7 @@ inline long NearestCode(double v, long max) {
 
 /// What a component reads back as after v is stored at `depth`.
 inline double StoredValue(int depth, double v) {
-    switch ((depth - 1) % 4) {
+    switch (Kind(depth)) {
     case 0: return NearestCode(v, 255) / 255.0;
     case 1: return NearestCode(v, 65535) / 65535.0;
     case 2: {
