@@ -48,6 +48,16 @@ std::string RectText(const ImgRectI &r) {
            std::to_string(r.y1) + ")";
 }
 
+std::string ConsoleText(const OrvaneDoc &doc) {
+    std::string text;
+    for (const ConsoleLine &line : doc.ConsoleLines())
+        text += (line.code == ConsoleError     ? "error: "
+                 : line.code == ConsoleWarning ? "warning: "
+                                               : "") +
+                line.text + "\n";
+    return text;
+}
+
 void ExpectPixelNear(const FltPixel &got, const FltPixel &want, double tol, const std::string &where) {
     EXPECT_NEAR(got.R, want.R, tol) << where << " red";
     EXPECT_NEAR(got.G, want.G, tol) << where << " green";

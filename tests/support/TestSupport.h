@@ -33,6 +33,9 @@ Ref<Image> WindowedImage(int w, int h, const ImgRectI &dw, const FltPixel &canva
 /// "(x0,y0,x1,y1)", for comparisons whose failure should read well.
 std::string RectText(const ImgRectI &r);
 
+/// The document's console, a line each: "error: text", "warning: text" or the text of any other code.
+std::string ConsoleText(const OrvaneDoc &doc);
+
 /// Expects each channel of `got` within `tol` of `want`.
 void ExpectPixelNear(const FltPixel &got, const FltPixel &want, double tol, const std::string &where = "");
 

@@ -341,9 +341,7 @@ TEST_F(MotionBlur, AFailingSampleFailsTheFrame) {
     bar->failAfter = 2.0;
     EXPECT_TRUE(Eval(bar, 1.5));
     EXPECT_FALSE(Eval(bar, 2.0));
-    const auto lines = doc->ConsoleLines();
-    ASSERT_EQ(lines.size(), 1u);
-    EXPECT_EQ(lines[0].text, "Bar: no bar after time 2");
+    EXPECT_EQ(ts::ConsoleText(*doc), "error: Bar: no bar after time 2\n");
 }
 
 } // namespace
