@@ -48,6 +48,16 @@ std::string RectText(const ImgRectI &r) {
            std::to_string(r.y1) + ")";
 }
 
+std::string ConsoleText(const OrvaneDoc &doc) {
+    std::string text;
+    for (const ConsoleLine &line : doc.ConsoleLines())
+        text += (line.code == ConsoleError     ? "error: "
+                 : line.code == ConsoleWarning ? "warning: "
+                                               : "") +
+                line.text + "\n";
+    return text;
+}
+
 void ExpectPixelNear(const FltPixel &got, const FltPixel &want, double tol, const std::string &where) {
     EXPECT_NEAR(got.R, want.R, tol) << where << " red";
     EXPECT_NEAR(got.G, want.G, tol) << where << " green";
@@ -66,38 +76,51 @@ void ExpectPixelNear(const FltPixel &got, const FltPixel &want, double tol, cons
 namespace Orvane::Test {
 namespace {
 
-const OvID ImageSourceClass("TestImageSource");
-
-Object *MakeImageSource(const Registry *reg, const ScriptVal &args, const TagList &tags) {
-    return new ImageSourceTool(reg, args, tags);
+OvID RegisterToolWith(const char *id, ClassFactory make, const TagList &attrs) {
+    if (ClassRegistry && ClassRegistry->Find(OvID(id))) return OvID(id);
+    TagList tags{{RegConstructor, make}, {RegTypeFlags, static_cast<long long>(RegKindOperator | RegKindTool)}};
+    for (const TagItem &a : attrs.Items()) tags.Set(a);
+    Registry::_Init(&ClassRegistry, OvID(id), tags);
+    return OvID(id);
 }
 
-const Registry *ImageSourceRow() {
-    static const Registry *row = [] {
-        TagList tags{{RegConstructor, &MakeImageSource},
-                     {RegTypeFlags, static_cast<long long>(RegKindOperator | RegKindTool | RegKindSource)},
-                     {RegName, "Test Image Source"},
-                     {RegAbbreviation, "Src"},
-                     {RegNoBlendControls, 1},
-                     {RegNoEffectMask, 1},
-                     {RegSupportsRoI, 1},
-                     {RegSupportsDoD, 1}};
-        return Registry::_Init(&ClassRegistry, ImageSourceClass, tags);
-    }();
-    return row;
+OvID ImageSourceClass() {
+    return RegisterTestTool("TestImageSource", &MakeTool<ImageSourceTool>,
+                            {{RegTypeFlags, static_cast<long long>(RegKindOperator | RegKindTool | RegKindSource)},
+                             {RegName, "Test Image Source"},
+                             {RegAbbreviation, "Src"}});
 }
 
 } // namespace
 
-OvID RegisterTestTool(const char *id, ClassFactory make) {
-    return RegisterTool(id, make,
-                        {{RegNoBlendControls, 1}, {RegNoEffectMask, 1}, {RegSupportsRoI, 1}, {RegSupportsDoD, 1}});
+OvID RegisterTestTool(const char *id, ClassFactory make, std::initializer_list<TagItem> extra) {
+    TagList attrs{{RegNoBlendControls, 1}, {RegNoEffectMask, 1}, {RegSupportsRoI, 1}, {RegSupportsDoD, 1}};
+    for (const TagItem &a : extra) attrs.Set(a);
+    return RegisterToolWith(id, make, attrs);
+}
+
+Input *AddIn(Operator *op, const char *id, OvID type, TagList tags) {
+    tags.Set({LinkDataType, type});
+    return op->AddInputTagList(id, id, tags);
+}
+
+Input *AddImageIn(Operator *op, TagList tags) {
+    tags.Set({LinkMain, 1});
+    return AddIn(op, "Input", CLSID_DataType_Image, tags);
+}
+
+Output *AddImageOut(Operator *op) {
+    return op->AddOutputTagList("Output", "Output", {{LinkDataType, CLSID_DataType_Image}, {LinkMain, 1}});
+}
+
+AnimCurve NumberCurve(const std::vector<std::pair<double, double>> &keys, KeyInterp interp) {
+    AnimCurve curve;
+    for (const auto &[t, v] : keys) curve.SetKey(t, MakeRef<Number>(v), interp);
+    return curve;
 }
 
 ImageSourceTool::ImageSourceTool(const Registry *reg, const ScriptVal &args, const TagList &tags)
-    : ThreadedOperator(reg, args, tags) {
-    output_ = AddOutputTagList("Output", "Output", {{LinkDataType, CLSID_DataType_Image}, {LinkMain, 1}});
-}
+    : ThreadedOperator(reg, args, tags), output_(AddImageOut(this)) {}
 
 void ImageSourceTool::Process(Request *req) {
     if (!image_) {
@@ -123,8 +146,7 @@ void ImageSourceTool::Process(Request *req) {
 }
 
 ImageSourceTool *AddImageSource(OrvaneDoc &doc, const std::string &name, Ref<Image> img) {
-    ImageSourceRow();
-    auto *tool = dynamic_cast<ImageSourceTool *>(doc.AddTool(ImageSourceClass, name));
+    auto *tool = dynamic_cast<ImageSourceTool *>(doc.AddTool(ImageSourceClass(), name));
     EXPECT_NE(tool, nullptr);
     if (tool) tool->SetImage(std::move(img));
     return tool;
@@ -132,10 +154,9 @@ ImageSourceTool *AddImageSource(OrvaneDoc &doc, const std::string &name, Ref<Ima
 
 ValueProbe::ValueProbe(const Registry *reg, const ScriptVal &args, const TagList &tags, bool takesTransforms)
     : ThreadedOperator(reg, args, tags) {
-    TagList in{{LinkDataType, CLSID_DataType_Image}, {LinkMain, 1}};
-    if (takesTransforms) in.Add({LinkSecondDataType, CLSID_DataType_TransformMatrix});
-    input_ = AddInputTagList("Input", "Input", in);
-    output_ = AddOutputTagList("Output", "Output", {{LinkDataType, CLSID_DataType_Image}, {LinkMain, 1}});
+    input_ =
+        AddImageIn(this, takesTransforms ? TagList{{LinkSecondDataType, CLSID_DataType_TransformMatrix}} : TagList{});
+    output_ = AddImageOut(this);
 }
 
 void ValueProbe::Process(Request *req) {
@@ -177,33 +198,24 @@ Ref<Image> EvalImage(Operator *op, double time, const EvalOptions &options) {
 }
 
 OvID RegisterTool(const char *id, ClassFactory make, std::initializer_list<TagItem> attrs) {
-    if (ClassRegistry && ClassRegistry->Find(OvID(id))) return OvID(id);
-    TagList tags{{RegConstructor, make}, {RegTypeFlags, static_cast<long long>(RegKindOperator | RegKindTool)}};
-    for (const TagItem &a : attrs) tags.Set(a);
-    Registry::_Init(&ClassRegistry, OvID(id), tags);
-    return OvID(id);
+    return RegisterToolWith(id, make, TagList(attrs));
 }
 
-void SetNumber(Operator *op, const char *id, double value) {
+namespace {
+void SetValue(Operator *op, const char *id, Ref<Parameter> value) {
     Input *in = op->FindInput(id);
     ASSERT_NE(in, nullptr) << "no input " << id;
-    ASSERT_TRUE(in->SetValue(MakeRef<Number>(value))) << id;
+    ASSERT_TRUE(in->SetValue(std::move(value))) << id;
 }
+} // namespace
+
+void SetNumber(Operator *op, const char *id, double value) { SetValue(op, id, MakeRef<Number>(value)); }
 
 void SetNumbers(Operator *op, const std::vector<std::pair<const char *, double>> &values) {
     for (const auto &[id, value] : values) SetNumber(op, id, value);
 }
 
-void SetPoint(Operator *op, const char *id, double x, double y) {
-    Input *in = op->FindInput(id);
-    ASSERT_NE(in, nullptr) << "no input " << id;
-    ASSERT_TRUE(in->SetValue(MakeRef<Point>(x, y))) << id;
-}
-
-void SetID(Operator *op, const char *id, const char *value) {
-    Input *in = op->FindInput(id);
-    ASSERT_NE(in, nullptr) << "no input " << id;
-    ASSERT_TRUE(in->SetValue(MakeRef<IDValue>(OvID(value)))) << id;
-}
+void SetPoint(Operator *op, const char *id, double x, double y) { SetValue(op, id, MakeRef<Point>(x, y)); }
+void SetID(Operator *op, const char *id, const char *value) { SetValue(op, id, MakeRef<IDValue>(OvID(value))); }
 
 } // namespace Orvane::Test

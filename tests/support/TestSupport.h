@@ -8,6 +8,7 @@
 #include <vector>
 
 #include "host/core/Registry.h"
+#include "host/flow/AnimCurve.h"
 #include "host/flow/Engine.h"
 #include "host/flow/Operator.h"
 #include "host/flow/OrvaneDoc.h"
@@ -31,6 +32,9 @@ Ref<Image> WindowedImage(int w, int h, const ImgRectI &dw, const FltPixel &canva
 
 /// "(x0,y0,x1,y1)", for comparisons whose failure should read well.
 std::string RectText(const ImgRectI &r);
+
+/// The document's console, a line each: "error: text", "warning: text" or the text of any other code.
+std::string ConsoleText(const OrvaneDoc &doc);
 
 /// Expects each channel of `got` within `tol` of `want`.
 void ExpectPixelNear(const FltPixel &got, const FltPixel &want, double tol, const std::string &where = "");
@@ -60,8 +64,25 @@ private:
 };
 
 /// Registers a test tool class `id` made by `make` (an operator tool with
-/// regions and domains, no blend or effect mask controls); returns its ID.
-OvID RegisterTestTool(const char *id, ClassFactory make);
+/// regions and domains, no blend or effect mask controls, `extra` on top);
+/// returns its ID.
+OvID RegisterTestTool(const char *id, ClassFactory make, std::initializer_list<TagItem> extra = {});
+
+/// One T for the whole test program, made on first use (classes of test tools
+/// are registered this way, after the registry exists).
+template <class T> const T &Once() {
+    static const T once;
+    return once;
+}
+
+/// Adds an input whose name and ID are `id`, of data type `type`, `tags` on top.
+Input *AddIn(Operator *op, const char *id, OvID type, TagList tags = {});
+/// The main image input "Input" (`tags` on top) and the main image output "Output".
+Input *AddImageIn(Operator *op, TagList tags = {});
+Output *AddImageOut(Operator *op);
+
+/// A curve of numbers with one key per (time, value), all of `interp`.
+AnimCurve NumberCurve(const std::vector<std::pair<double, double>> &keys, KeyInterp interp = KeyInterp::Linear);
 
 /// Adds an ImageSourceTool named `name` that outputs `img`.
 ImageSourceTool *AddImageSource(OrvaneDoc &doc, const std::string &name, Ref<Image> img);

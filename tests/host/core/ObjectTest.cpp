@@ -28,9 +28,6 @@ void OnThreads(int n, const std::function<void(int)> &fn) {
     for (auto &t : threads) t.join();
 }
 
-// ---------------------------------------------------------------------------------------------------------------
-// Ref<T>
-
 std::atomic<int> aliveCount{0};
 
 class Counted : public RefObject {
@@ -90,37 +87,18 @@ TEST(RefHandle, CountsEveryHandleAndDeletesWithTheLast) {
     Ref<Counted> empty;
     empty.Reset(); // no-op on an empty handle
     EXPECT_TRUE(empty == Ref<Counted>(static_cast<Counted *>(nullptr)));
-}
 
-TEST(RefHandle, ConcurrentSharingCountsEveryReference) {
-    aliveCount = 0;
-    Ref<Counted> obj = MakeRef<Counted>(0);
-    OnThreads(4, [&obj](int) {
-        for (int i = 0; i < 20000; ++i) {
-            Ref<Counted> a = obj;
-            Ref<RefObject> b = a;
-        }
-    });
-    EXPECT_EQ(obj->RefCount(), 1);
-    obj.Reset();
-    EXPECT_EQ(aliveCount, 0);
-}
-
-TEST(RefObjectAttrs, MergedAndPersisted) {
+    // Attributes: later values win, earlier ones stay, and text is the object's own.
     Ref<Counted> obj = MakeRef<Counted>();
     std::string label = "label text";
     obj->SetAttrsTagList({{0x10000f10, 3}, {0x20000f10, 0.5}, {0x30000f10, label.c_str()}});
     obj->SetAttrsTagList({{0x10000f10, 4}, {0x10000f11, 1}});
     label.assign(label.size(), '#');
-    EXPECT_EQ(obj->GetAttrL(0x10000f10), 4);
-    EXPECT_EQ(obj->GetAttrD(0x20000f10), 0.5);
-    EXPECT_TRUE(obj->GetAttrB(0x10000f11));
+    EXPECT_EQ(std::tuple(obj->GetAttrL(0x10000f10), obj->GetAttrD(0x20000f10), obj->GetAttrB(0x10000f11)),
+              std::tuple(4LL, 0.5, true));
     EXPECT_EQ(obj->GetAttrL(0x10000f12, -2), -2);
     EXPECT_STREQ(obj->Attrs().GetText(0x30000f10), "label text");
 }
-
-// ---------------------------------------------------------------------------------------------------------------
-// Reuser
 
 template <size_t N> struct Blob : Reuser { unsigned char bytes[N]; };
 
@@ -155,43 +133,6 @@ TEST(ReuserBlocks, FreedBlockIsHandedOutAgain) {
     EXPECT_EQ(Reuser::CachedBlocks(), 0u);
 }
 
-TEST(ReuserBlocks, NoBlockHasTwoOwnersUnderConcurrency) {
-    // Blocks of two size classes, stamped with their owner, round and place,
-    // checked after the other threads have had the chance to take them.
-    struct Large : Reuser {
-        uint64_t stamp[6];
-    };
-    struct Small : Reuser {
-        uint64_t stamp;
-    };
-    std::atomic<int> clobbered{0};
-    OnThreads(6, [&](int t) {
-        std::vector<Large *> large(12);
-        std::vector<Small *> small(12);
-        for (uint64_t round = 0; round < 3000; ++round) {
-            auto stampOf = [&](size_t i) { return uint64_t(t) << 48 | round << 8 | i; };
-            for (size_t i = 0; i < large.size(); ++i) {
-                large[i] = new Large;
-                small[i] = new Small{{}, stampOf(i)};
-                for (uint64_t &s : large[i]->stamp) s = stampOf(i);
-            }
-            std::this_thread::yield();
-            for (size_t i = 0; i < large.size(); ++i) {
-                bool ok = small[i]->stamp == stampOf(i);
-                for (uint64_t s : large[i]->stamp) ok = ok && s == stampOf(i);
-                clobbered += !ok;
-                delete large[i];
-                delete small[i];
-            }
-        }
-    });
-    EXPECT_EQ(clobbered.load(), 0);
-    Reuser::Trim();
-}
-
-// ---------------------------------------------------------------------------------------------------------------
-// OvID
-
 TEST(OvIDIntern, EqualTextSharesOnePointer) {
     const std::string built = std::string("ObjTest") + "Interned";
     const OvID a("ObjTestInterned"), b(built), c(std::string_view("ObjTestInternedXYZ", 15));
@@ -213,15 +154,49 @@ TEST(OvIDIntern, EqualTextSharesOnePointer) {
         for (const char *y : ordered) EXPECT_EQ(OvID(x) < OvID(y), std::string(x) < y) << x << " < " << y;
 }
 
-TEST(OvIDIntern, ManyThreadsAgree) {
-    constexpr int Threads = 8, Names = 2000;
+// Threads share one object, take blocks of two size classes stamped with their owner, round and place (checked
+// after the other threads have had the chance to take them), and intern names, each in an order of its own.
+TEST(Concurrency, ReferencesBlocksAndInternedNamesStayConsistent) {
+    struct Large : Reuser {
+        uint64_t stamp[6];
+    };
+    struct Small : Reuser {
+        uint64_t stamp;
+    };
+    constexpr int Threads = 6, Names = 2000;
+    aliveCount = 0;
+    Ref<Counted> shared = MakeRef<Counted>(0);
+    std::atomic<int> clobbered{0};
     std::vector<std::vector<const char *>> seen(Threads, std::vector<const char *>(Names));
     OnThreads(Threads, [&](int t) {
-        for (int i = 0; i < Names; ++i) {
-            const int n = (i * 7 + t * 13) % Names; // each thread in its own order
+        std::vector<Large *> large(12);
+        std::vector<Small *> small(12);
+        for (uint64_t round = 0; round < 3000; ++round) {
+            const int n = (round * 7 + t * 13) % Names;
             seen[t][n] = OvID("ObjTestThreaded" + std::to_string(n)).Text();
+            auto stampOf = [&](size_t i) { return uint64_t(t) << 48 | round << 8 | i; };
+            for (size_t i = 0; i < large.size(); ++i) {
+                large[i] = new Large;
+                small[i] = new Small{{}, stampOf(i)};
+                for (uint64_t &s : large[i]->stamp) s = stampOf(i);
+            }
+            std::this_thread::yield();
+            for (size_t i = 0; i < large.size(); ++i) {
+                const Ref<Counted> a = shared;
+                const Ref<RefObject> b = a;
+                bool ok = small[i]->stamp == stampOf(i);
+                for (uint64_t s : large[i]->stamp) ok = ok && s == stampOf(i);
+                clobbered += !ok;
+                delete large[i];
+                delete small[i];
+            }
         }
     });
+    EXPECT_EQ(clobbered.load(), 0);
+    Reuser::Trim();
+    EXPECT_EQ(shared->RefCount(), 1);
+    shared.Reset();
+    EXPECT_EQ(aliveCount, 0);
     std::set<const char *> distinct;
     for (int n = 0; n < Names; ++n) {
         const OvID expect("ObjTestThreaded" + std::to_string(n));
@@ -230,9 +205,6 @@ TEST(OvIDIntern, ManyThreadsAgree) {
     }
     EXPECT_EQ(distinct.size(), static_cast<size_t>(Names));
 }
-
-// ---------------------------------------------------------------------------------------------------------------
-// Type links
 
 struct TypeRoot {};
 struct TypeMid {};
@@ -244,18 +216,14 @@ struct TypeCycleB {};
 TEST(ScriptInfoTypes, DerivationFollowsTheRecordedLinks) {
     SetTypeInfo(typeid(TypeMid), typeid(TypeRoot));
     SetTypeInfo(typeid(TypeLeaf), typeid(TypeMid));
-    const struct {
-        const std::type_info &type, &base;
-        bool derives;
-    } cases[] = {
-        {typeid(TypeLeaf), typeid(TypeMid), true},    {typeid(TypeLeaf), typeid(TypeRoot), true},
-        {typeid(TypeMid), typeid(TypeRoot), true},    {typeid(TypeRoot), typeid(TypeLeaf), false},
-        {typeid(TypeMid), typeid(TypeLeaf), false},   {typeid(TypeLoose), typeid(TypeRoot), false},
-        {typeid(TypeLoose), typeid(TypeLoose), true}, // a type is its own base, recorded or not
-        {typeid(TypeRoot), typeid(TypeLoose), false},
-    };
-    for (const auto &c : cases)
-        EXPECT_EQ(TypeDerivesFrom(c.type, c.base), c.derives) << c.type.name() << " from " << c.base.name();
+    // Whether each of Root, Mid, Leaf and Loose derives from each of them: a type is its own base, recorded or not.
+    std::string derives;
+    for (const std::type_info *t : {&typeid(TypeRoot), &typeid(TypeMid), &typeid(TypeLeaf), &typeid(TypeLoose)}) {
+        for (const std::type_info *b : {&typeid(TypeRoot), &typeid(TypeMid), &typeid(TypeLeaf), &typeid(TypeLoose)})
+            derives += TypeDerivesFrom(*t, *b) ? '1' : '0';
+        derives += ' ';
+    }
+    EXPECT_EQ(derives, "1000 1100 1110 0001 ");
 
     // Re-recording a link replaces it; clearing one cuts the chain there.
     SetTypeInfo(typeid(TypeLeaf), typeid(TypeLoose));
@@ -276,9 +244,6 @@ TEST(ScriptInfoTypes, DerivationFollowsTheRecordedLinks) {
     ClearTypeInfo(typeid(TypeCycleA));
     ClearTypeInfo(typeid(TypeCycleB));
 }
-
-// ---------------------------------------------------------------------------------------------------------------
-// Parallel
 
 // Restores the worker count a test changed.
 struct WorkerCountGuard {
@@ -323,7 +288,7 @@ TEST(ParallelJobs, RangeCoveredExactlyOnce) {
     EXPECT_EQ(calls, 0);
 }
 
-TEST(ParallelJobs, NestedJobsAndJobsFromManyThreadsComplete) {
+TEST(ParallelJobs, NestedJobsAndJobsFromManyThreadsCompleteAndOneWorkerIsTheCallingThread) {
     WorkerCountGuard guard;
     for (int workers : {1, 4}) {
         SetWorkerCount(workers);
@@ -348,10 +313,8 @@ TEST(ParallelJobs, NestedJobsAndJobsFromManyThreadsComplete) {
         for (int rep = 0; rep < 10; ++rep) ParallelRange(0, N, count, 16);
     });
     for (const auto &row : hits) EXPECT_EQ(Wrong(row, 10), 0) << "from many threads";
-}
 
-TEST(ParallelJobs, OneWorkerRunsInTheCallingThread) {
-    WorkerCountGuard guard;
+    // One worker runs in the calling thread.
     SetWorkerCount(1);
     const std::thread::id caller = std::this_thread::get_id();
     std::atomic<int> elsewhere{0}, covered{0};

@@ -4,12 +4,12 @@
 // by reference, a chain under a memory limit).
 #include <optional>
 #include <string>
+#include <tuple>
 #include <vector>
 
 #include <gtest/gtest.h>
 
 #include "host/core/Tags.h"
-#include "host/flow/AnimCurve.h"
 #include "host/flow/DataTypes.h"
 #include "host/flow/Request.h"
 #include "host/flow/ResultCache.h"
@@ -36,37 +36,27 @@ CacheKey Key(const Output &out, double time = 0.0, uint32_t traits = 0, uint64_t
     return CacheKey{&out, time, traits, state};
 }
 
-TEST(ResultCache, FindsOnlyWhatWasStoredUnderTheSameKey) {
+TEST(ResultCache, FindsOnlyWhatWasStoredUnderTheSameKeyAndRegionsOnlyWhatTheyCover) {
     Outputs o;
     ResultCache cache;
-    Ref<Parameter> v = MakeRef<Number>(1.0);
+    Ref<Parameter> v = MakeRef<Number>(1.0), img = Img(4, 4);
     cache.Store(Key(o.a), Whole, v);
     EXPECT_EQ(cache.Find(Key(o.a), Whole).Get(), v.Get());
-    const CacheKey others[] = {Key(o.b), Key(o.a, 1.0), Key(o.a, 0.0, ReqFlagPreCalc), Key(o.a, 0.0, 0, 8)};
-    for (const CacheKey &k : others) EXPECT_FALSE(cache.Find(k, Whole));
+    for (const CacheKey &k : {Key(o.b), Key(o.a, 1.0), Key(o.a, 0.0, ReqFlagPreCalc), Key(o.a, 0.0, 0, 8)})
+        EXPECT_FALSE(cache.Find(k, Whole));
     EXPECT_EQ(cache.Entries(), 1u);
-    const ResultCache::Stats s = cache.GetStats();
-    EXPECT_EQ(s.hits, 1u);
-    EXPECT_EQ(s.misses, 4u);
-}
+    EXPECT_EQ(std::pair(cache.GetStats().hits, cache.GetStats().misses), std::pair(size_t(1), size_t(4)));
 
-TEST(ResultCache, RegionResultsServeOnlyRegionsTheyCover) {
-    const struct {
-        const char *name;
-        std::optional<ImageDomain> asked;
-        bool served;
-    } cases[] = {
+    cache.Store(Key(o.a, 2.0), Region(2, 2, 10, 8), img);
+    const std::tuple<const char *, std::optional<ImageDomain>, bool> asked[] = {
         {"the same region", Region(2, 2, 10, 8), true},
         {"a region inside", Region(3, 4, 9, 5), true},
         {"a region reaching out", Region(1, 2, 10, 8), false},
         {"a disjoint region", Region(20, 20, 30, 30), false},
         {"the whole frame", Whole, false},
     };
-    Outputs o;
-    ResultCache cache;
-    Ref<Parameter> v = Img(4, 4);
-    cache.Store(Key(o.a), Region(2, 2, 10, 8), v);
-    for (const auto &c : cases) EXPECT_EQ(cache.Find(Key(o.a), c.asked).Get(), c.served ? v.Get() : nullptr) << c.name;
+    for (const auto &[name, region, served] : asked)
+        EXPECT_EQ(cache.Find(Key(o.a, 2.0), region).Get(), served ? img.Get() : nullptr) << name;
 }
 
 TEST(ResultCache, AWholeFrameResultServesAllAndReplacesRegionResults) {
@@ -130,10 +120,10 @@ TEST(ResultCache, EvictsLeastRecentlyUsedBeyondTheBudget) {
     EXPECT_EQ(cache.Bytes(), 0u);
 }
 
-TEST(ResultCache, StoringTheSameKeyAgainReplacesAndCountsOnce) {
+TEST(ResultCache, StoringTheSameKeyAgainReplacesAndForgetDropsOneOutputsEntries) {
     Outputs o;
     ResultCache cache;
-    Ref<Parameter> first = Img(8, 8), second = Img(4, 4);
+    Ref<Parameter> first = Img(8, 8), second = Img(4, 4), y = Img(6, 6);
     cache.Store(Key(o.a), Region(0, 0, 4, 4), first);
     cache.Store(Key(o.a), Region(0, 0, 4, 4), second);
     EXPECT_EQ(cache.Entries(), 1u);
@@ -144,15 +134,9 @@ TEST(ResultCache, StoringTheSameKeyAgainReplacesAndCountsOnce) {
     cache.Store(Key(o.a, 1), Whole, nullptr); // nothing to keep
     EXPECT_EQ(cache.Entries(), 1u);
     EXPECT_EQ(cache.Bytes(), second->SizeOf());
-}
 
-TEST(ResultCache, ForgetDropsOneOutputsEntries) {
-    Outputs o;
-    ResultCache cache;
-    Ref<Parameter> x = Img(4, 4), y = Img(6, 6);
-    cache.Store(Key(o.a, 0), Whole, x);
-    cache.Store(Key(o.a, 1), Region(0, 0, 2, 2), x);
-    cache.Store(Key(o.a, 1), Region(5, 5, 6, 6), x);
+    cache.Store(Key(o.a, 1), Region(0, 0, 2, 2), first);
+    cache.Store(Key(o.a, 1), Region(5, 5, 6, 6), first);
     cache.Store(Key(o.b, 0), Whole, y);
     cache.Forget(&o.a);
     EXPECT_EQ(cache.Entries(), 1u);
@@ -184,11 +168,10 @@ FltPixel Scaled(const FltPixel &p, double gain) {
 
 /// out = in x Gain over the input's data window; View is passive.
 struct GainTool : ThreadedOperator {
-    GainTool(const Registry *reg, const ScriptVal &args, const TagList &tags) : ThreadedOperator(reg, args, tags) {
-        input = AddInputTagList("Input", "Input", {{LinkDataType, CLSID_DataType_Image}, {LinkMain, 1}});
-        gain = AddInputTagList("Gain", "Gain", {{LinkDataType, CLSID_DataType_Number}, {InputDefault, 1.0}});
-        AddInputTagList("View", "View", {{LinkDataType, CLSID_DataType_Number}, {InputPassive, 1}});
-        output = AddOutputTagList("Output", "Output", {{LinkDataType, CLSID_DataType_Image}, {LinkMain, 1}});
+    GainTool(const Registry *reg, const ScriptVal &args, const TagList &tags)
+        : ThreadedOperator(reg, args, tags),
+          gain(ts::AddIn(this, "Gain", CLSID_DataType_Number, {{InputDefault, 1.0}})) {
+        ts::AddIn(this, "View", CLSID_DataType_Number, {{InputPassive, 1}});
     }
     void Process(Request *req) override {
         auto *src = dynamic_cast<Image *>(req->GetInputData(input));
@@ -204,20 +187,18 @@ struct GainTool : ThreadedOperator {
         }
         req->SetOutputData(output, img.Get());
     }
-    Input *input, *gain;
-    Output *output;
+    Input *input = ts::AddImageIn(this), *gain;
+    Output *output = ts::AddImageOut(this);
     int processCount = 0;
 };
 
 /// Hands on its input, by reference, as it was `Offset` frames earlier.
 struct ShiftTool : ThreadedOperator {
-    ShiftTool(const Registry *reg, const ScriptVal &args, const TagList &tags) : ThreadedOperator(reg, args, tags) {
-        input = AddInputTagList("Input", "Input", {{LinkDataType, CLSID_DataType_Image}, {LinkMain, 1}});
-        // Read before the image's level, so CheckRequest knows it when it sets the time.
-        offset = AddInputTagList("Offset", "Offset",
-                                 {{LinkDataType, CLSID_DataType_Number}, {InputDefault, 5.0}, {InputPriority, -2}});
-        output = AddOutputTagList("Output", "Output", {{LinkDataType, CLSID_DataType_Image}, {LinkMain, 1}});
-    }
+    // Offset is read before the image's level, so CheckRequest knows it when it sets the time.
+    ShiftTool(const Registry *reg, const ScriptVal &args, const TagList &tags)
+        : ThreadedOperator(reg, args, tags), input(ts::AddImageIn(this)),
+          offset(ts::AddIn(this, "Offset", CLSID_DataType_Number, {{InputDefault, 5.0}, {InputPriority, -2}})),
+          output(ts::AddImageOut(this)) {}
     void CheckRequest(Request *req) override {
         ThreadedOperator::CheckRequest(req);
         if (req->GetPri() != input->Priority()) return;
@@ -229,21 +210,14 @@ struct ShiftTool : ThreadedOperator {
     Output *output;
 };
 
-OvID Register(const char *id, ClassFactory make, TagItem extra = {RegSupportsDoD, 1}) {
-    return ts::RegisterTool(
-        id, make, {{RegNoBlendControls, 1}, {RegNoEffectMask, 1}, {RegSupportsRoI, 1}, {RegSupportsDoD, 1}, extra});
-}
-
 struct Classes {
-    OvID gain = Register("CacheTestGain", &ts::MakeTool<GainTool>);
-    OvID noCache = Register("CacheTestGainNoCache", &ts::MakeTool<GainTool>, {RegNoCache, 1});
-    OvID unpredictable = Register("CacheTestGainUnpredictable", &ts::MakeTool<GainTool>, {RegUnpredictable, 1});
-    OvID shift = Register("CacheTestShift", &ts::MakeTool<ShiftTool>);
+    OvID gain = ts::RegisterTestTool("CacheTestGain", &ts::MakeTool<GainTool>);
+    OvID noCache = ts::RegisterTestTool("CacheTestGainNoCache", &ts::MakeTool<GainTool>, {{RegNoCache, 1}});
+    OvID unpredictable =
+        ts::RegisterTestTool("CacheTestGainUnpredictable", &ts::MakeTool<GainTool>, {{RegUnpredictable, 1}});
+    OvID shift = ts::RegisterTestTool("CacheTestShift", &ts::MakeTool<ShiftTool>);
 };
-const Classes &C() {
-    static const Classes classes;
-    return classes;
-}
+const Classes &C() { return ts::Once<Classes>(); }
 
 Ref<Image> Eval(Operator *op, double time = 0.0, const std::optional<ImageDomain> &roi = std::nullopt,
                 bool useCache = true) {
@@ -251,12 +225,7 @@ Ref<Image> Eval(Operator *op, double time = 0.0, const std::optional<ImageDomain
 }
 
 /// A gain of `first` at frame 0 rising to 3 at frame 10.
-AnimCurve GainCurve(double first) {
-    AnimCurve curve;
-    curve.SetKey(0.0, MakeRef<Number>(first));
-    curve.SetKey(10.0, MakeRef<Number>(3.0));
-    return curve;
-}
+AnimCurve GainCurve(double first) { return ts::NumberCurve({{0.0, first}, {10.0, 3.0}}); }
 
 /// Src -> Gain1, and more tools added below either.
 struct Chain {
@@ -271,7 +240,7 @@ struct Chain {
     }
 };
 
-TEST(EngineCache, RegionsAreServedWhenCoveredAndRenderedWhenNot) {
+TEST(EngineCache, RegionsAreServedWhenCoveredAndRenderedWhenNotAndUseCacheFalseBypassesTheCache) {
     Chain c;
     ASSERT_TRUE(Eval(c.tool, 0.0, Region(2, 1, 8, 5)));
     ASSERT_TRUE(Eval(c.tool, 0.0, Region(3, 2, 6, 4))); // inside: served
@@ -283,28 +252,25 @@ TEST(EngineCache, RegionsAreServedWhenCoveredAndRenderedWhenNot) {
     EXPECT_EQ(c.tool->processCount, 3);
     EXPECT_EQ(Eval(c.tool, 0.0, Region(0, 0, 2, 2)).Get(), whole.Get());
     EXPECT_EQ(c.tool->processCount, 3);
+    const int sourceRenders = c.src->processCount;
+    for (int i = 0; i < 2; ++i) ASSERT_TRUE(Eval(c.tool, 0.0, Whole, false));
+    EXPECT_EQ(c.tool->processCount, 5);
+    EXPECT_EQ(c.src->processCount, sourceRenders + 2);
 }
 
 TEST(EngineCache, InputChangesRenderAgainUnlessPassive) {
-    const struct {
-        const char *name, *input;
-        double value;
-        bool renders;
-    } cases[] = {
-        {"a non-passive input", "Gain", 2.0, true},
-        {"a passive input", "View", 3.0, false},
-        {"the same value again", "Gain", 1.0, false},
-    };
-    for (const auto &c : cases) {
-        SCOPED_TRACE(c.name);
+    for (const auto &[name, input, value, renders] : {std::tuple{"a non-passive input", "Gain", 2.0, true},
+                                                      {"a passive input", "View", 3.0, false},
+                                                      {"the same value again", "Gain", 1.0, false}}) {
+        SCOPED_TRACE(name);
         Chain ch;
         Ref<Image> before = Eval(ch.tool);
         ASSERT_TRUE(before);
-        ts::SetNumber(ch.tool, c.input, c.value);
+        ts::SetNumber(ch.tool, input, value);
         Ref<Image> after = Eval(ch.tool);
         ASSERT_TRUE(after);
-        EXPECT_EQ(ch.tool->processCount, c.renders ? 2 : 1);
-        EXPECT_EQ(after.Get() != before.Get(), c.renders);
+        EXPECT_EQ(ch.tool->processCount, renders ? 2 : 1);
+        EXPECT_EQ(after.Get() != before.Get(), renders);
         EXPECT_EQ(ch.src->processCount, 1) << "the source did not change";
     }
 }
@@ -363,14 +329,6 @@ TEST(EngineCache, VolatileToolsAndAllBelowThemAreNeverCached) {
         EXPECT_FALSE(StateHash(below->output, 0.0));
         EXPECT_TRUE(StateHash(aside->output, 0.0));
     }
-}
-
-TEST(EngineCache, UseCacheFalseBypassesTheCache) {
-    Chain c;
-    ASSERT_TRUE(Eval(c.tool));
-    for (int i = 0; i < 2; ++i) ASSERT_TRUE(Eval(c.tool, 0.0, Whole, false));
-    EXPECT_EQ(c.tool->processCount, 3);
-    EXPECT_EQ(c.src->processCount, 3);
 }
 
 TEST(EngineCache, PassThroughHandsOnTheSameObject) {

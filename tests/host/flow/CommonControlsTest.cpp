@@ -20,13 +20,11 @@ namespace {
 
 /// Outputs a fixed image given by the test, or passes its input on when it
 /// has none. Pre-calculation gives the same windows without pixels.
-class FixedTool : public ThreadedOperator {
+class Tool : public ThreadedOperator {
 public:
-    FixedTool(const Registry *reg, const ScriptVal &args, const TagList &tags, bool withInput = true)
-        : ThreadedOperator(reg, args, tags) {
-        if (withInput) input = AddInputTagList("Input", "Input", {{LinkDataType, CLSID_DataType_Image}, {LinkMain, 1}});
-        output = AddOutputTagList("Output", "Output", {{LinkDataType, CLSID_DataType_Image}, {LinkMain, 1}});
-    }
+    Tool(const Registry *reg, const ScriptVal &args, const TagList &tags, bool withInput = true)
+        : ThreadedOperator(reg, args, tags), input(withInput ? ts::AddImageIn(this) : nullptr),
+          output(ts::AddImageOut(this)) {}
     void Process(Request *req) override {
         if (!result) return req->SetOutputData(output, req->GetInputData(input));
         if (!req->IsPreCalc()) return req->SetOutputData(output, result);
@@ -37,14 +35,13 @@ public:
             NewImageTagList(
                 {{ImgLikeImage, result.Get()}, {ImgDataWindow, &dw}, {ImgNoData, 1}, {ImgCanvasColor, &canvas}}));
     }
-    Input *input = nullptr;
+    Input *input;
     Output *output;
     Ref<Image> result;
 };
-struct Generator : FixedTool {
-    Generator(const Registry *reg, const ScriptVal &args, const TagList &tags) : FixedTool(reg, args, tags, false) {}
+struct Generator : Tool {
+    Generator(const Registry *reg, const ScriptVal &args, const TagList &tags) : Tool(reg, args, tags, false) {}
 };
-using Tool = FixedTool;
 
 struct Classes {
     ClassFactory make = &ts::MakeTool<Tool>;
@@ -56,53 +53,40 @@ struct Classes {
     OvID generator =
         ts::RegisterTool("CommonTestGenerator", &ts::MakeTool<Generator>, {{RegSupportsRoI, 1}, {RegSupportsDoD, 1}});
 };
-const Classes &C() {
-    static const Classes classes;
-    return classes;
-}
+const Classes &C() { return ts::Once<Classes>(); }
 
 TEST(CommonControls, ExistAsTheClassAsksFor) {
     const char *const ids[] = {"Blend",      "ProcessRed",        "ProcessGreen",     "ProcessBlue",    "ProcessAlpha",
                                "EffectMask", "EffectMaskChannel", "EffectMaskInvert", "MultiplyByMask", "ClippingMode"};
     enum { HasBlend = 1, HasMask = 2, HasClipping = 4 };
-    const struct {
-        const char *name;
-        OvID cls;
-        int has;
-    } cases[] = {
-        {"plain tool", C().plain, HasBlend | HasMask | HasClipping},
-        {"no blend controls", C().noBlend, HasMask | HasClipping},
-        {"no effect mask", C().noMask, HasBlend | HasClipping},
-        {"without domains", C().noDoD, HasBlend | HasMask},
-        {"without main input", C().generator, HasBlend | HasMask},
-        {"neither", C().bare, 0},
-    };
-    for (const auto &c : cases) {
-        SCOPED_TRACE(c.name);
+    for (const auto &[name, cls, has] : {std::tuple{"plain tool", C().plain, HasBlend | HasMask | HasClipping},
+                                         {"no blend controls", C().noBlend, HasMask | HasClipping},
+                                         {"no effect mask", C().noMask, HasBlend | HasClipping},
+                                         {"without domains", C().noDoD, HasBlend | HasMask},
+                                         {"without main input", C().generator, HasBlend | HasMask},
+                                         {"neither", C().bare, 0}}) {
+        SCOPED_TRACE(name);
         Ref<OrvaneDoc> doc = MakeRef<OrvaneDoc>();
-        Operator *op = doc->AddTool(c.cls, "T1");
+        Operator *op = doc->AddTool(cls, "T1");
         ASSERT_NE(op, nullptr);
-        for (int i = 0; i < 10; ++i) {
-            const int group = i < 5 ? HasBlend : i < 9 ? HasMask : HasClipping;
-            EXPECT_EQ(op->FindInput(ids[i]) != nullptr, (c.has & group) != 0) << ids[i];
-        }
-        EXPECT_EQ(op->Common().blend != nullptr, (c.has & HasBlend) != 0);
-        EXPECT_EQ(op->Common().effectMask != nullptr, (c.has & HasMask) != 0);
-        EXPECT_EQ(op->Common().clippingMode != nullptr, (c.has & HasClipping) != 0);
-        if (Input *mask = op->FindInput("EffectMask")) {
-            EXPECT_EQ(mask->Priority(), PriorityMask);
-            EXPECT_FALSE(mask->IsRequired());
-            EXPECT_EQ(mask->DataType(), CLSID_DataType_Mask);
-        }
+        for (int i = 0; i < 10; ++i)
+            EXPECT_EQ(op->FindInput(ids[i]) != nullptr, (has & (i < 5   ? HasBlend
+                                                                : i < 9 ? HasMask
+                                                                        : HasClipping)) != 0)
+                << ids[i];
+        EXPECT_EQ(op->Common().blend != nullptr, (has & HasBlend) != 0);
+        EXPECT_EQ(op->Common().effectMask != nullptr, (has & HasMask) != 0);
+        EXPECT_EQ(op->Common().clippingMode != nullptr, (has & HasClipping) != 0);
+        const Input *mask = op->FindInput("EffectMask"), *clip = op->FindInput("ClippingMode");
+        EXPECT_TRUE(!mask || (mask->Priority() == PriorityMask && !mask->IsRequired() &&
+                              mask->DataType() == CLSID_DataType_Mask));
+        EXPECT_TRUE(!clip || dynamic_cast<const IDValue &>(*clip->Default()).value == ClippingMode_None);
         if (Input *blend = op->FindInput("Blend")) {
             EXPECT_EQ(dynamic_cast<const Number &>(*blend->Default()).value, 1.0);
             for (const auto &[set, kept] : {std::pair{1.5, 1.0}, {-0.5, 0.0}}) {
                 ASSERT_TRUE(blend->SetValue(MakeRef<Number>(set)));
                 EXPECT_EQ(dynamic_cast<const Number &>(*blend->Constant()).value, kept) << "Blend stays within 0..1";
             }
-        }
-        if (Input *clip = op->FindInput("ClippingMode")) {
-            EXPECT_EQ(dynamic_cast<const IDValue &>(*clip->Default()).value, ClippingMode_None);
         }
     }
 }
@@ -164,16 +148,18 @@ void RunMix(const MixCase &c) {
     tool->result = res;
     ASSERT_TRUE(c.generator || tool->input->ConnectTo(ts::AddImageSource(*doc, "Src", src)->Out()));
     ASSERT_TRUE(!mask || tool->Common().effectMask->ConnectTo(ts::AddImageSource(*doc, "MaskSrc", mask)->Out()));
-    ts::SetNumber(tool, "Blend", c.blend);
-    const char *const channels[4] = {"ProcessRed", "ProcessGreen", "ProcessBlue", "ProcessAlpha"};
-    for (int ch = 0; ch < 4; ++ch) ts::SetNumber(tool, channels[ch], c.process[ch] ? 1.0 : 0.0);
-    ts::SetNumber(tool, "EffectMaskChannel", c.channel);
-    ts::SetNumber(tool, "EffectMaskInvert", c.invert ? 1.0 : 0.0);
-    ts::SetNumber(tool, "MultiplyByMask", c.multiply ? 1.0 : 0.0);
+    ts::SetNumbers(tool, {{"ProcessRed", c.process[0]},
+                          {"ProcessGreen", c.process[1]},
+                          {"ProcessBlue", c.process[2]},
+                          {"ProcessAlpha", c.process[3]}});
+    ts::SetNumbers(tool, {{"Blend", c.blend},
+                          {"EffectMaskChannel", c.channel},
+                          {"EffectMaskInvert", c.invert},
+                          {"MultiplyByMask", c.multiply}});
 
     Ref<Image> out = ts::EvalImage(tool, 0.0, c.roi ? &*c.roi : nullptr);
     ASSERT_TRUE(out);
-    EXPECT_TRUE(doc->ConsoleLines().empty());
+    EXPECT_EQ(ts::ConsoleText(*doc), "");
     const Image *in = c.generator ? nullptr : src.Get();
     // The canvas follows the same rule as the pixels.
     ts::ExpectPixelNear(out->GetCanvasColor(),
@@ -191,48 +177,37 @@ void RunMix(const MixCase &c) {
     EXPECT_TRUE(!c.roi || c.roi->Contains(out->DataWindow())) << ts::RectText(out->DataWindow());
 }
 
-TEST(CommonControls, BlendAndChannelSwitchesMixResultAndInput) {
-    for (const MixCase &c : {
-             MixCase{.name = "blend 0.25", .blend = 0.25},
-             MixCase{.name = "blend 0", .blend = 0.0},
-             MixCase{.name = "blend 0.25, result window larger than the input's",
-             .blend = 0.25,
-             .srcWindow = {4, 4, 8, 8},
-             .resWindow = {0, 0, 16, 12},
-             .srcCanvas = {0.5f, 0.25f, 0.f, 1.f}},
-             MixCase{.name = "red and alpha off", .process = {false, true, true, false}},
-             MixCase{.name = "green off, blend 0.6", .blend = 0.6, .process = {true, false, true, true}},
-             MixCase{.name = "all off", .blend = 0.6, .process = {false, false, false, false}},
-         })
-        RunMix(c);
-}
-
-TEST(CommonControls, TheEffectMaskWeighsTheResult) {
-    for (const MixCase &c : {
-             MixCase{.name = "alpha", .mask = RGBAMask},
-             MixCase{.name = "red, blend 0.7", .blend = 0.7, .mask = RGBAMask, .channel = 1},
-             MixCase{.name = "green, inverted", .mask = RGBAMask, .channel = 2, .invert = true},
-             MixCase{.name = "blue", .mask = RGBAMask, .channel = 3},
-             MixCase{.name = "luminance of a grey mask", .mask = GreyRGBAMask, .channel = 4},
-             MixCase{.name = "luminance, inverted, blend 0.4",
-             .blend = 0.4,
-             .mask = GreyRGBAMask,
-             .channel = 4,
-             .invert = true},
-             MixCase{.name = "single-channel mask, green", .mask = SingleChannelMask, .channel = 2},
-             MixCase{.name = "multiply by mask", .mask = RGBAMask, .multiply = true},
-             MixCase{.name = "multiply by an inverted mask, blend 0.5",
-             .blend = 0.5,
-             .mask = RGBAMask,
-             .channel = 1,
-             .invert = true,
-             .multiply = true},
-             MixCase{.name = "generator, masked", .mask = RGBAMask, .channel = 1, .generator = true},
-             MixCase{.name = "region", .blend = 0.5, .mask = RGBAMask, .roi = ImgRectI(2, 3, 9, 8)},
-         })
-        RunMix(c);
-    MixCase generator{.name = "generator, blend 0.25: mixed with transparent black", .blend = 0.25, .generator = true};
-    RunMix(generator);
+TEST(CommonControls, BlendChannelSwitchesAndTheEffectMaskMixResultAndInput) {
+    const MixCase cases[] = {
+        {.name = "blend 0.25", .blend = 0.25},
+        {.name = "blend 0", .blend = 0.0},
+        {.name = "result window larger than the input's, blend 0.25",
+         .blend = 0.25,
+         .srcWindow = {4, 4, 8, 8},
+         .resWindow = {0, 0, 16, 12},
+         .srcCanvas = {0.5f, 0.25f, 0.f, 1.f}},
+        {.name = "red and alpha off", .process = {false, true, true, false}},
+        {.name = "green off, blend 0.6", .blend = 0.6, .process = {true, false, true, true}},
+        {.name = "all off", .blend = 0.6, .process = {false, false, false, false}},
+        {.name = "alpha mask", .mask = RGBAMask},
+        {.name = "red mask, blend 0.7", .blend = 0.7, .mask = RGBAMask, .channel = 1},
+        {.name = "green mask, inverted", .mask = RGBAMask, .channel = 2, .invert = true},
+        {.name = "blue mask", .mask = RGBAMask, .channel = 3},
+        {.name = "luminance of a grey mask", .mask = GreyRGBAMask, .channel = 4},
+        {.name = "luminance, inverted, blend 0.4", .blend = 0.4, .mask = GreyRGBAMask, .channel = 4, .invert = true},
+        {.name = "single-channel mask, green", .mask = SingleChannelMask, .channel = 2},
+        {.name = "multiply by mask", .mask = RGBAMask, .multiply = true},
+        {.name = "multiply by inverted red, blend 0.5",
+         .blend = 0.5,
+         .mask = RGBAMask,
+         .channel = 1,
+         .invert = true,
+         .multiply = true},
+        {.name = "generator, masked", .mask = RGBAMask, .channel = 1, .generator = true},
+        {.name = "generator, blend 0.25: mixed with transparent black", .blend = 0.25, .generator = true},
+        {.name = "region", .blend = 0.5, .mask = RGBAMask, .roi = ImgRectI(2, 3, 9, 8)},
+    };
+    for (const MixCase &c : cases) RunMix(c);
 }
 
 TEST(CommonControls, DataWindowsGrowWhereTheMixNeedsThem) {
@@ -265,8 +240,7 @@ TEST(CommonControls, UntouchedResultsAndPassedThroughInputsAreHandedOnAsTheyAre)
     ASSERT_TRUE(plain->input->ConnectTo(pass->output));
     ASSERT_TRUE(
         pass->Common().effectMask->ConnectTo(ts::AddImageSource(*doc, "Mask", ts::PatternImage(16, 12))->Out()));
-    ts::SetNumber(pass, "Blend", 0.25);
-    ts::SetNumber(pass, "ProcessGreen", 0);
+    ts::SetNumbers(pass, {{"Blend", 0.25}, {"ProcessGreen", 0}});
     EXPECT_EQ(ts::EvalImage(pass).Get(), src.Get()) << "an input passed on is left alone";
     plain->result = ts::WindowedImage(16, 12, {3, 2, 15, 11}, {0.2f, 0.4f, 0.1f, 0.5f}, 41);
     EXPECT_EQ(ts::EvalImage(plain).Get(), plain->result.Get()) << "the defaults leave the result as it is";

@@ -8,19 +8,16 @@
 #include <algorithm>
 #include <filesystem>
 #include <fstream>
-#include <sstream>
 #include <string>
+#include <tuple>
 #include <vector>
 
 #include <gtest/gtest.h>
 
-#include "host/core/Registry.h"
 #include "host/core/ScriptVal.h"
 #include "host/core/Tags.h"
-#include "host/flow/AnimCurve.h"
 #include "host/flow/DataTypes.h"
 #include "host/flow/DocumentIO.h"
-#include "host/flow/Engine.h"
 #include "host/flow/Gradient.h"
 #include "host/flow/Request.h"
 #include "tests/support/TestSupport.h"
@@ -29,97 +26,74 @@ namespace Orvane::documentiotest {
 namespace ts = ::Orvane::Test;
 namespace {
 
+using Names = std::vector<std::string>;
+
 /// A tool with one input of each kind a document stores, declared in the
 /// order Size, Center, Caption, Mode, Colors, Width, Histo, Choice, Input.
 class DocTool : public ThreadedOperator {
 public:
     DocTool(const Registry *reg, const ScriptVal &args, const TagList &tags) : ThreadedOperator(reg, args, tags) {
-        AddInputTagList("Size", "Size",
-                        {{LinkDataType, CLSID_DataType_Number}, {InputDefault, 1.0}, {InputMinAllowed, 0.0}});
-        AddInputTagList("Center", "Center",
-                        {{LinkDataType, CLSID_DataType_Point}, {InputDefaultX, 0.5}, {InputDefaultY, 0.5}});
-        AddInputTagList("Caption", "Caption", {{LinkDataType, CLSID_DataType_Text}});
-        AddInputTagList("Mode", "Mode",
-                        {{LinkDataType, CLSID_DataType_OvID},
-                         {InputDefaultId, OvID("ModeA")},
-                         {ListAddItem, "Mode A"},
-                         {ListItemId, OvID("ModeA")},
-                         {ListAddItem, "Mode B"},
-                         {ListItemId, OvID("ModeB")},
-                         {ListAcceptedId, OvID("ModeOld")}});
-        AddInputTagList("Colors", "Colors", {{LinkDataType, CLSID_DataType_Gradient}});
-        AddInputTagList("Width", "Width",
-                        {{LinkDataType, CLSID_DataType_Number},
-                         {InputDefault, 100.0},
-                         {InputInteger, 1},
-                         {InputMaxAllowed, 1000.0},
-                         {LinkForceSave, 1}});
-        AddInputTagList("Histo", "Histo", {{LinkDataType, CLSID_DataType_Number}, {LinkNotSaved, 1}});
-        AddInputTagList("Choice", "Choice",
-                        {{LinkDataType, CLSID_DataType_Number},
-                         {ListAddItem, "First"},
-                         {ListAddItem, "Soft Light"},
-                         {ListAddItem, "Third"}});
-        AddInputTagList("Input", "Input", {{LinkDataType, CLSID_DataType_Image}, {LinkMain, 1}, {InputRequired, 0}});
-        output = AddOutputTagList("Output", "Output", {{LinkDataType, CLSID_DataType_Image}, {LinkMain, 1}});
-        AddOutputTagList("Value", "Value", {{LinkDataType, CLSID_DataType_Number}});
+        const OvID number = CLSID_DataType_Number, a("ModeA"), b("ModeB");
+        ts::AddIn(this, "Size", number, {{InputDefault, 1.0}, {InputMinAllowed, 0.0}});
+        ts::AddIn(this, "Center", CLSID_DataType_Point, {{InputDefaultX, 0.5}, {InputDefaultY, 0.5}});
+        ts::AddIn(this, "Caption", CLSID_DataType_Text);
+        ts::AddIn(this, "Mode", CLSID_DataType_OvID,
+                  {{InputDefaultId, a},
+                   {ListAddItem, "Mode A"},
+                   {ListItemId, a},
+                   {ListAddItem, "Mode B"},
+                   {ListItemId, b},
+                   {ListAcceptedId, OvID("ModeOld")}});
+        ts::AddIn(this, "Colors", CLSID_DataType_Gradient);
+        ts::AddIn(this, "Width", number,
+                  {{InputDefault, 100.0}, {InputInteger, 1}, {InputMaxAllowed, 1000.0}, {LinkForceSave, 1}});
+        ts::AddIn(this, "Histo", number, {{LinkNotSaved, 1}});
+        ts::AddIn(this, "Choice", number,
+                  {{ListAddItem, "First"}, {ListAddItem, "Soft Light"}, {ListAddItem, "Third"}});
+        ts::AddImageIn(this, {{InputRequired, 0}});
+        output = ts::AddImageOut(this);
+        AddOutputTagList("Value", "Value", {{LinkDataType, number}});
     }
     void Process(Request *req) override { req->SetOutputData(output, req->GetInputData(FindInput("Input"))); }
     Output *output;
 };
 
-Object *MakeDocTool(const Registry *reg, const ScriptVal &args, const TagList &tags) {
-    return new DocTool(reg, args, tags);
-}
-
 const char *const DocToolClass = "DocIOTestTool";
 
-void RegisterOnce() {
-    static const bool done = [] {
-        TagList tags{{RegConstructor, &MakeDocTool},
-                     {RegTypeFlags, static_cast<long long>(RegKindOperator | RegKindTool)},
-                     {RegAbbreviation, "DT"},
-                     {RegName, "Doc Test Tool"},
-                     {RegAlias, "DocAlias"},
-                     {RegNoBlendControls, 1},
-                     {RegNoEffectMask, 1}};
-        Registry::_Init(&ClassRegistry, OvID(DocToolClass), tags);
-        return true;
-    }();
-    (void)done;
+OvID DocToolID() {
+    return ts::RegisterTool(DocToolClass, &ts::MakeTool<DocTool>,
+                            {{RegAbbreviation, "DT"},
+                             {RegName, "Doc Test Tool"},
+                             {RegAlias, "DocAlias"},
+                             {RegNoBlendControls, 1},
+                             {RegNoEffectMask, 1}});
 }
 
 Operator *AddDocTool(OrvaneDoc &doc, const std::string &name) {
-    RegisterOnce();
-    Operator *op = doc.AddTool(OvID(DocToolClass), name);
+    Operator *op = doc.AddTool(DocToolID(), name);
     EXPECT_NE(op, nullptr) << name;
     return op;
 }
 
 DocumentLoadResult Load(const std::string &text, OrvaneDoc &doc, bool lenient = false) {
-    RegisterOnce();
+    DocToolID();
     return LoadDocument(text, doc, {.lenient = lenient});
 }
 
-/// The table of one tool in saved text.
+/// The table of one tool in saved text, and the keys of its inputs.
 ScriptVal ToolIn(const std::string &text, const std::string &tool) {
-    const ScriptVal root = ScriptVal::FromText(text);
-    const ScriptVal *t = root.Find("Tools")->Find(tool);
+    const ScriptVal root = ScriptVal::FromText(text), *t = root.Find("Tools")->Find(tool);
     return t ? *t : ScriptVal();
 }
-
-std::vector<std::string> Keys(const ScriptVal *table) {
-    std::vector<std::string> keys;
+Names Keys(const ScriptVal *table) {
+    Names keys;
     if (table && table->IsTable())
         for (const auto &[k, v] : table->Entries()) keys.push_back(k.IsText() ? k.AsText() : k.ToText());
     return keys;
 }
-std::vector<std::string> InputKeys(const std::string &text, const std::string &tool) {
-    const ScriptVal t = ToolIn(text, tool);
-    return Keys(t.Find("Inputs"));
-}
+Names InputKeys(const std::string &text, const std::string &tool) { return Keys(ToolIn(text, tool).Find("Inputs")); }
 
-std::string Joined(const std::vector<std::string> &lines) {
+std::string Joined(const Names &lines) {
     std::string all;
     for (const std::string &l : lines) all += l + "\n";
     return all;
@@ -128,13 +102,12 @@ std::string Joined(const std::vector<std::string> &lines) {
 /// Saves, loads into a fresh document, saves again: both texts must match, and so must a third generation.
 void ExpectStableRoundTrip(const OrvaneDoc &doc) {
     const std::string first = SaveDocument(doc);
-    Ref<OrvaneDoc> again = MakeRef<OrvaneDoc>();
+    Ref<OrvaneDoc> again = MakeRef<OrvaneDoc>(), third = MakeRef<OrvaneDoc>();
     const DocumentLoadResult r = Load(first, *again);
     ASSERT_TRUE(r.ok) << r.error << "\n" << first;
     EXPECT_TRUE(r.warnings.empty()) << Joined(r.warnings);
     const std::string second = SaveDocument(*again);
     EXPECT_EQ(second, first);
-    Ref<OrvaneDoc> third = MakeRef<OrvaneDoc>();
     ASSERT_TRUE(Load(second, *third).ok);
     EXPECT_EQ(SaveDocument(*third), first);
 }
@@ -143,101 +116,55 @@ Ref<Gradient> TwoStops() {
     return MakeRef<Gradient>(std::vector<GradientStop>{{0.0, 1.f, 0.f, 0.f, 1.f}, {0.5, 0.f, 1.f, 0.f, 0.5f}});
 }
 
-TEST(DocumentIO, SaveLoadSaveGivesTheSameBytes) {
-    struct Case {
-        const char *name;
-        void (*build)(OrvaneDoc &);
-    };
-    const Case cases[] = {
-        {"empty", [](OrvaneDoc &) {}},
-        {"constants",
-         [](OrvaneDoc &doc) {
-             Operator *t = AddDocTool(doc, "Const1");
-             ts::SetNumber(t, "Size", 1.0 / 3.0);
-             ts::SetPoint(t, "Center", 0.1 + 0.2, -1e-300);
-             ASSERT_TRUE(
-                 t->FindInput("Caption")->SetValue(MakeRef<Text>("tab\there \"quoted\"\nnext line \\ caf\xc3\xa9")));
-             ts::SetID(t, "Mode", "ModeB");
-             ts::SetNumber(t, "Choice", 2);
-             ASSERT_TRUE(t->FindInput("Colors")->SetValue(TwoStops()));
-             ts::SetNumber(AddDocTool(doc, "Const2"), "Size", 1e21);
-         }},
-        {"curves",
-         [](OrvaneDoc &doc) {
-             Operator *t = AddDocTool(doc, "Anim1");
-             AnimCurve size;
-             size.SetKey(0, MakeRef<Number>(1.0));
-             size.SetKey(12, MakeRef<Number>(2.25), KeyInterp::Smooth);
-             size.SetKey(24, MakeRef<Number>(3.0), KeyInterp::Hold);
-             ASSERT_TRUE(t->FindInput("Size")->SetCurve(size));
-             AnimCurve center;
-             center.SetKey(-5, MakeRef<Point>(0.0, 1.0), KeyInterp::Smooth);
-             center.SetKey(5, MakeRef<Point>(1.0, 0.0));
-             ASSERT_TRUE(t->FindInput("Center")->SetCurve(center));
-             AnimCurve colors;
-             colors.SetKey(0, TwoStops());
-             colors.SetKey(10, MakeRef<Gradient>());
-             ASSERT_TRUE(t->FindInput("Colors")->SetCurve(colors));
-         }},
-        {"links",
-         [](OrvaneDoc &doc) {
-             Operator *a = AddDocTool(doc, "Src");
-             Operator *b = AddDocTool(doc, "Blur_2");
-             Operator *c = AddDocTool(doc, "after");
-             ASSERT_TRUE(b->FindInput("Input")->ConnectTo(a->FindOutput("Output")));
-             ASSERT_TRUE(c->FindInput("Input")->ConnectTo(b->FindOutput("Output")));
-             ASSERT_TRUE(c->FindInput("Size")->ConnectTo(a->FindOutput("Value")));
-         }},
-        {"preferences and ranges",
-         [](OrvaneDoc &doc) {
-             doc.SetPref(PREF_FFWidth, 1280);
-             doc.SetPref(PREF_FFFrameRate, 23.976);
-             doc.SetGlobalRange(-10, 250.5);
-             doc.SetRenderRange(12, 48);
-             AddDocTool(doc, "One");
-         }},
-    };
-    for (const Case &c : cases) {
-        SCOPED_TRACE(c.name);
-        Ref<OrvaneDoc> doc = MakeRef<OrvaneDoc>();
-        c.build(*doc);
-        if (HasFatalFailure()) return;
-        ExpectStableRoundTrip(*doc);
-    }
-}
-
-TEST(DocumentIO, LoadingRestoresWhatWasSaved) {
+TEST(DocumentIO, SaveLoadSaveGivesTheSameBytesAndRestoresWhatWasSaved) {
+    ExpectStableRoundTrip(*MakeRef<OrvaneDoc>());
+    // Constants of every kind, curves of numbers, points and gradients, links, preferences and ranges.
     Ref<OrvaneDoc> doc = MakeRef<OrvaneDoc>();
-    Operator *a = AddDocTool(*doc, "A1");
-    Operator *b = AddDocTool(*doc, "B1");
-    ts::SetNumber(a, "Size", 0.1);
-    ASSERT_TRUE(b->FindInput("Input")->ConnectTo(a->FindOutput("Output")));
-    ASSERT_TRUE(b->FindInput("Size")->ConnectTo(a->FindOutput("Value")));
-    AnimCurve curve;
-    curve.SetKey(2, MakeRef<Point>(1.0, 2.0), KeyInterp::Smooth);
-    curve.SetKey(4, MakeRef<Point>(3.0, 4.0), KeyInterp::Hold);
-    ASSERT_TRUE(a->FindInput("Center")->SetCurve(curve));
-    doc->SetPref(PREF_FFHeight, 576);
-    doc->SetGlobalRange(3, 33);
-    doc->SetRenderRange(4, 5);
+    Operator *c = AddDocTool(*doc, "Const1"), *a = AddDocTool(*doc, "Anim1");
+    ts::SetNumber(c, "Size", 1.0 / 3.0);
+    ts::SetPoint(c, "Center", 0.1 + 0.2, -1e-300);
+    ASSERT_TRUE(c->FindInput("Caption")->SetValue(MakeRef<Text>("tab\there \"quoted\"\nnext line \\ caf\xc3\xa9")));
+    ts::SetID(c, "Mode", "ModeB");
+    ts::SetNumber(c, "Choice", 2);
+    ASSERT_TRUE(c->FindInput("Colors")->SetValue(TwoStops()));
+    ts::SetNumber(AddDocTool(*doc, "Const2"), "Size", 1e21);
+    AnimCurve size = ts::NumberCurve({{0, 1.0}}), center, colors;
+    size.SetKey(12, MakeRef<Number>(2.25), KeyInterp::Smooth);
+    size.SetKey(24, MakeRef<Number>(3.0), KeyInterp::Hold);
+    ASSERT_TRUE(a->FindInput("Size")->SetCurve(size));
+    center.SetKey(-5, MakeRef<Point>(0.0, 1.0), KeyInterp::Smooth);
+    center.SetKey(5, MakeRef<Point>(1.0, 0.0), KeyInterp::Hold);
+    ASSERT_TRUE(a->FindInput("Center")->SetCurve(center));
+    colors.SetKey(0, TwoStops());
+    colors.SetKey(10, MakeRef<Gradient>());
+    ASSERT_TRUE(a->FindInput("Colors")->SetCurve(colors));
+    Operator *src = AddDocTool(*doc, "Src"), *mid = AddDocTool(*doc, "Blur_2"), *end = AddDocTool(*doc, "after");
+    ASSERT_TRUE(mid->FindInput("Input")->ConnectTo(src->FindOutput("Output")));
+    ASSERT_TRUE(end->FindInput("Input")->ConnectTo(mid->FindOutput("Output")));
+    ASSERT_TRUE(end->FindInput("Size")->ConnectTo(src->FindOutput("Value")));
+    doc->SetPref(PREF_FFWidth, 1280);
+    doc->SetPref(PREF_FFFrameRate, 23.976);
+    doc->SetGlobalRange(-10, 250.5);
+    doc->SetRenderRange(12, 48);
+    ExpectStableRoundTrip(*doc);
 
     Ref<OrvaneDoc> back = MakeRef<OrvaneDoc>();
     ASSERT_TRUE(Load(SaveDocument(*doc), *back).ok);
-    Operator *a2 = back->FindTool("A1");
-    Operator *b2 = back->FindTool("B1");
-    ASSERT_TRUE(a2 && b2);
-    EXPECT_TRUE(a2->FindInput("Size")->Constant()->Equals(Number(0.1)));
-    EXPECT_EQ(b2->FindInput("Input")->Link(), a2->FindOutput("Output"));
-    EXPECT_EQ(b2->FindInput("Size")->Link(), a2->FindOutput("Value"));
-    const AnimCurve *c = a2->FindInput("Center")->Curve();
-    ASSERT_NE(c, nullptr);
-    ASSERT_EQ(c->Keys().size(), 2u);
-    EXPECT_EQ(c->Keys()[0].interp, KeyInterp::Smooth);
-    EXPECT_TRUE(c->Keys()[1].value->Equals(Point(3.0, 4.0)));
-    EXPECT_EQ(back->GetPrefLong(PREF_FFHeight), 576);
-    EXPECT_FALSE(back->PrefIsSet(PREF_FFWidth));
+    Operator *c2 = back->FindTool("Const1"), *a2 = back->FindTool("Anim1"), *src2 = back->FindTool("Src");
+    ASSERT_TRUE(c2 && a2 && src2);
+    EXPECT_TRUE(c2->FindInput("Size")->Constant()->Equals(Number(1.0 / 3.0)));
+    EXPECT_TRUE(c2->FindInput("Colors")->Constant()->Equals(*TwoStops()));
+    EXPECT_EQ(back->FindTool("Blur_2")->FindInput("Input")->Link(), src2->FindOutput("Output"));
+    EXPECT_EQ(back->FindTool("after")->FindInput("Size")->Link(), src2->FindOutput("Value"));
+    const AnimCurve *curve = a2->FindInput("Center")->Curve();
+    ASSERT_TRUE(curve && curve->Keys().size() == 2u);
+    EXPECT_EQ(curve->Keys()[0].interp, KeyInterp::Smooth);
+    EXPECT_EQ(curve->Keys()[1].interp, KeyInterp::Hold);
+    EXPECT_TRUE(curve->Keys()[1].value->Equals(Point(1.0, 0.0)));
+    EXPECT_EQ(back->GetPrefLong(PREF_FFWidth), 1280);
+    EXPECT_FALSE(back->PrefIsSet(PREF_FFHeight));
     EXPECT_EQ(std::vector<double>({back->GlobalStart(), back->GlobalEnd(), back->RenderStart(), back->RenderEnd()}),
-              std::vector<double>({3, 33, 4, 5}));
+              std::vector<double>({-10, 250.5, 12, 48}));
 }
 
 TEST(DocumentIO, AHandWrittenDocumentComesBackCanonicalWithItsComments) {
@@ -259,101 +186,69 @@ return Orvane.Document{
   RenderRange = {5, 50}, Version = 1, GlobalRange={0,200},
 }
 )";
-    Ref<OrvaneDoc> doc = MakeRef<OrvaneDoc>();
+    Ref<OrvaneDoc> doc = MakeRef<OrvaneDoc>(), again = MakeRef<OrvaneDoc>();
     const DocumentLoadResult r = Load(hand, *doc);
     ASSERT_TRUE(r.ok) << r.error;
     EXPECT_TRUE(r.warnings.empty()) << Joined(r.warnings);
     const std::string canonical = SaveDocument(*doc);
     const ScriptVal root = ScriptVal::FromText(canonical);
-    EXPECT_EQ(Keys(&root),
-              (std::vector<std::string>{"Version", "Program", "GlobalRange", "RenderRange", "Prefs", "Tools"}));
-    EXPECT_EQ(Keys(root.Find("Tools")), (std::vector<std::string>{"Alpha", "Mid", "Zed"}));
-    // Declaration order; defaults are not added (Width's neither, though it asks to be saved), but one the document
-    // gave stays.
-    EXPECT_EQ(InputKeys(canonical, "Zed"), (std::vector<std::string>{"Size", "Width", "Input"}));
-    EXPECT_EQ(InputKeys(canonical, "Alpha"), (std::vector<std::string>{"Size", "Center", "Mode", "Choice"}));
-    EXPECT_EQ(InputKeys(canonical, "Mid"), std::vector<std::string>{"Width"});
+    EXPECT_EQ(Keys(&root), (Names{"Version", "Program", "GlobalRange", "RenderRange", "Prefs", "Tools"}));
+    EXPECT_EQ(Keys(root.Find("Tools")), (Names{"Alpha", "Mid", "Zed"}));
+    // Declaration order; defaults are not added (Width's neither, though it asks to be saved), but one the
+    // document gave stays.
+    EXPECT_EQ(InputKeys(canonical, "Zed"), (Names{"Size", "Width", "Input"}));
+    EXPECT_EQ(InputKeys(canonical, "Alpha"), (Names{"Size", "Center", "Mode", "Choice"}));
+    EXPECT_EQ(InputKeys(canonical, "Mid"), Names{"Width"});
     EXPECT_EQ(ToolIn(canonical, "Mid").ClassName(), DocToolClass) << "an alias is saved as the class's ID";
-    EXPECT_EQ(ToolIn(canonical, "Alpha").Find("Inputs")->Find("Choice")->AsNumber(), 1);
-    const ScriptVal size = *ToolIn(canonical, "Alpha").Find("Inputs")->Find("Size");
-    ASSERT_EQ(size.ArrayLength(), 2u);
-    EXPECT_EQ(size.At(1)->At(1)->AsNumber(), 0) << "keys in time order";
+    const ScriptVal alpha = *ToolIn(canonical, "Alpha").Find("Inputs");
+    EXPECT_EQ(alpha.Find("Choice")->AsNumber(), 1);
+    ASSERT_EQ(alpha.Find("Size")->ArrayLength(), 2u);
+    EXPECT_EQ(alpha.Find("Size")->At(1)->At(1)->AsNumber(), 0) << "keys in time order";
     // The leading block, a comment before a tool and one after an input's value stay where they were.
     for (const char *kept :
          {"-- written by hand, in an order of its own\n-- orvane-render: --frames 5-50\n"
           "Orvane.Document {\n",
           "\t\t-- the last step\n\t\tZed = DocIOTestTool {", "\"ModeB\", -- a bare word for an ID\n"})
         EXPECT_NE(canonical.find(kept), std::string::npos) << kept << "\n" << canonical;
+    ASSERT_TRUE(Load(canonical, *again).ok);
+    EXPECT_EQ(SaveDocument(*again), canonical);
     // Editing keeps them; removing a tool drops its own.
     ts::SetNumber(doc->FindTool("Alpha"), "Size", 5);
     EXPECT_NE(SaveDocument(*doc).find("-- a bare word for an ID"), std::string::npos);
     doc->RemoveTool("Zed");
     EXPECT_EQ(SaveDocument(*doc).find("-- the last step"), std::string::npos);
-    Ref<OrvaneDoc> again = MakeRef<OrvaneDoc>();
-    ASSERT_TRUE(Load(canonical, *again).ok);
-    EXPECT_EQ(SaveDocument(*again), canonical);
 }
 
 TEST(DocumentIO, OnlyValuesThatDifferFromTheirDefaultsAreWritten) {
-    struct Case {
-        const char *name;
-        void (*set)(Operator *, Operator *);
-        std::vector<std::string> keys;
-    };
-    const Case cases[] = {
-        {"defaults", [](Operator *, Operator *) {}, {}},
-        {"values equal to the defaults",
-         [](Operator *t, Operator *) {
-             ts::SetNumber(t, "Size", 1.0);
-             ts::SetPoint(t, "Center", 0.5, 0.5);
-             ts::SetID(t, "Mode", "ModeA");
-             ts::SetNumber(t, "Width", 100);
-             ASSERT_TRUE(t->FindInput("Colors")->SetValue(MakeRef<Gradient>()));
-             ASSERT_TRUE(t->FindInput("Caption")->SetValue(MakeRef<Text>("")));
-         },
-         {}},
-        {"a value never saved", [](Operator *t, Operator *) { ts::SetNumber(t, "Histo", 5.0); }, {}},
-        {"a value never saved, linked",
-         [](Operator *t, Operator *u) { ASSERT_TRUE(t->FindInput("Histo")->ConnectTo(u->FindOutput("Value"))); },
-         {}},
-        {"changed values",
-         [](Operator *t, Operator *) {
-             ts::SetNumber(t, "Width", 3.0);
-             ts::SetID(t, "Mode", "ModeB");
-             ts::SetNumber(t, "Size", 0.0);
-         },
-         {"Size", "Mode", "Width"}},
-        {"a curve holding the default",
-         [](Operator *t, Operator *) {
-             AnimCurve c;
-             c.SetKey(0, MakeRef<Number>(1.0));
-             ASSERT_TRUE(t->FindInput("Size")->SetCurve(c));
-         },
-         {"Size"}},
-        {"a link",
-         [](Operator *t, Operator *u) { ASSERT_TRUE(t->FindInput("Input")->ConnectTo(u->FindOutput("Output"))); },
-         {"Input"}},
-    };
-    for (const Case &c : cases) {
-        SCOPED_TRACE(c.name);
-        Ref<OrvaneDoc> doc = MakeRef<OrvaneDoc>();
-        Operator *t = AddDocTool(*doc, "T1");
-        Operator *u = AddDocTool(*doc, "U1");
-        c.set(t, u);
-        if (HasFatalFailure()) return;
-        const std::string text = SaveDocument(*doc);
-        EXPECT_EQ(InputKeys(text, "T1"), c.keys) << text;
-        ExpectStableRoundTrip(*doc);
-    }
+    Ref<OrvaneDoc> doc = MakeRef<OrvaneDoc>();
+    Operator *u = AddDocTool(*doc, "U1"), *same = AddDocTool(*doc, "Same"), *changed = AddDocTool(*doc, "Changed");
+    ts::SetNumbers(same, {{"Size", 1.0}, {"Width", 100}});
+    ts::SetPoint(same, "Center", 0.5, 0.5);
+    ts::SetID(same, "Mode", "ModeA");
+    ASSERT_TRUE(same->FindInput("Colors")->SetValue(MakeRef<Gradient>()));
+    ASSERT_TRUE(same->FindInput("Caption")->SetValue(MakeRef<Text>("")));
+    ts::SetNumber(AddDocTool(*doc, "Unsaved"), "Histo", 5.0);
+    ASSERT_TRUE(AddDocTool(*doc, "UnsavedLink")->FindInput("Histo")->ConnectTo(u->FindOutput("Value")));
+    ts::SetNumber(changed, "Width", 3.0);
+    ts::SetID(changed, "Mode", "ModeB");
+    ts::SetNumber(changed, "Size", 0.0);
+    ASSERT_TRUE(AddDocTool(*doc, "Curve")->FindInput("Size")->SetCurve(ts::NumberCurve({{0, 1.0}})));
+    ASSERT_TRUE(AddDocTool(*doc, "Linked")->FindInput("Input")->ConnectTo(u->FindOutput("Output")));
+    const std::string text = SaveDocument(*doc);
+    for (const auto &[tool, keys] : {std::pair<const char *, Names>{"U1", {}},
+                                     {"Same", {}},
+                                     {"Unsaved", {}},
+                                     {"UnsavedLink", {}},
+                                     {"Changed", {"Size", "Mode", "Width"}},
+                                     {"Curve", {"Size"}},
+                                     {"Linked", {"Input"}}})
+        EXPECT_EQ(InputKeys(text, tool), keys) << tool << "\n" << text;
+    ExpectStableRoundTrip(*doc);
 }
 
 TEST(DocumentIO, ValuesAreCheckedAndChoicesTakenByName) {
-    struct Case {
-        const char *value;     ///< Name = value, for tool A1
-        const char *problem;   ///< "" when it loads
-        const char *leniently; ///< the value set when loaded leniently ("" when left alone)
-    };
-    const Case cases[] = {
+    // Name = value for tool A1; the problem ("" when it loads); the value set when loaded leniently ("": left alone).
+    const std::tuple<const char *, const char *, const char *> cases[] = {
         {"Size = 2", "", "2"},
         {"Size = -2", "A1.Size: -2 is below the least allowed value 0", "0"},
         {"Size = 0/0", "A1.Size: expects a finite number, got 0/0", "1"},
@@ -382,28 +277,26 @@ TEST(DocumentIO, ValuesAreCheckedAndChoicesTakenByName) {
         {"Input = B1.Outptu", "A1.Input: tool 'B1' has no output 'Outptu' (did you mean 'Output'?)", ""},
         {"Input = B1.Value", "A1.Input: cannot take B1.Value", ""},
     };
-    for (const Case &c : cases) {
-        SCOPED_TRACE(c.value);
+    for (const auto &[value, problem, leniently] : cases) {
+        SCOPED_TRACE(value);
         const std::string text = "Orvane.Document { Tools = {\n\tA1 = DocIOTestTool { Inputs = { " +
-                                 std::string(c.value) + " } },\n\tB1 = DocIOTestTool {} } }";
+                                 std::string(value) + " } },\n\tB1 = DocIOTestTool {} } }";
         for (const bool lenient : {false, true}) {
             Ref<OrvaneDoc> doc = MakeRef<OrvaneDoc>();
             const DocumentLoadResult r = Load(text, *doc, lenient);
-            EXPECT_EQ(r.ok, lenient || !*c.problem) << r.error;
-            ASSERT_EQ(r.problems.size(), *c.problem ? 1u : 0u) << r.error << Joined(r.warnings);
-            if (*c.problem) {
+            EXPECT_EQ(r.ok, lenient || !*problem) << r.error;
+            ASSERT_EQ(r.problems.size(), *problem ? 1u : 0u) << r.error << Joined(r.warnings);
+            if (*problem) {
                 const DocumentProblem &p = r.problems[0];
                 EXPECT_EQ(p.error, !lenient);
-                EXPECT_EQ(p.message.rfind(c.problem, 0), 0u) << p.message;
-                EXPECT_EQ(p.line, 2);
-                const size_t valueAt = text.find(c.value) + std::string(c.value).find('=') + 2;
-                EXPECT_EQ(p.column, static_cast<int>(valueAt - text.find('\n'))) << "the value's column";
+                EXPECT_EQ(p.message.rfind(problem, 0), 0u) << p.message;
+                const size_t valueAt = text.find(value) + std::string(value).find('=') + 2;
+                EXPECT_EQ(std::pair(p.line, p.column), std::pair(2, static_cast<int>(valueAt - text.find('\n'))));
             }
-            if (!lenient || !*c.leniently) continue;
-            const std::string name(c.value, std::string(c.value).find(' '));
-            const Input *in = doc->FindTool("A1")->FindInput(name.c_str());
+            if (!lenient || !*leniently) continue;
+            const Input *in = doc->FindTool("A1")->FindInput(std::string(value, std::string(value).find(' ')).c_str());
             ASSERT_TRUE(in->Constant());
-            EXPECT_EQ(in->Constant()->ToScript().ToText(), c.leniently);
+            EXPECT_EQ(in->Constant()->ToScript().ToText(), leniently);
         }
     }
 }
@@ -448,30 +341,24 @@ TEST(DocumentIO, EveryProblemOfADocumentIsReportedInTextOrder) {
 }
 
 TEST(DocumentIO, SyntaxErrorsAndNonDocumentsFailAtOnce) {
-    struct Case {
-        std::string text;
-        std::string problem;
-    };
-    const Case cases[] = {
-        {"Orvane.Document {\n\tTools = {\n\t\tA = DocIOTestTool { Inputs = { Size = @ } },\n\t},\n}\n",
-         "line 3, column 41: unexpected symbol '@'"},
-        {"Orvane.Document {\n\tVersion = 1\n\tGlobalRange = { 0, 10 },\n}\n", "line 3, column 2: "},
-        {"Orvane.Document { GlobalRange = { -x, 10 } }", "line 1, column 35: '-' must be followed by a number"},
-        {"Project { Tools = { } }", "line 1, column 1: not an Orvane document"},
-        {"42", "not an Orvane document"},
-        {"Orvane.Document { Tools = 5 }", "line 1, column 27: Tools must be a table"},
-    };
-    for (const Case &c : cases) {
-        SCOPED_TRACE(c.text);
+    for (const auto &[text, problem] : {
+             std::pair<std::string, std::string>{
+                 "Orvane.Document {\n\tTools = {\n\t\tA = DocIOTestTool { Inputs = { Size = @ } },\n\t},\n}\n",
+                 "line 3, column 41: unexpected symbol '@'"},
+             {"Orvane.Document {\n\tVersion = 1\n\tGlobalRange = { 0, 10 },\n}\n", "line 3, column 2: "},
+             {"Orvane.Document { GlobalRange = { -x, 10 } }", "line 1, column 35: '-' must be followed by a number"},
+             {"Project { Tools = { } }", "line 1, column 1: not an Orvane document"},
+             {"42", "not an Orvane document"},
+             {"Orvane.Document { Tools = 5 }", "line 1, column 27: Tools must be a table"},
+         })
         for (const bool lenient : {false, true}) {
             Ref<OrvaneDoc> doc = MakeRef<OrvaneDoc>();
-            const DocumentLoadResult r = Load(c.text, *doc, lenient);
+            const DocumentLoadResult r = Load(text, *doc, lenient);
             EXPECT_FALSE(r.ok);
             ASSERT_EQ(r.problems.size(), 1u) << r.error;
-            EXPECT_NE(r.error.find(c.problem), std::string::npos) << r.error;
+            EXPECT_NE(r.error.find(problem), std::string::npos) << r.error;
             EXPECT_TRUE(doc->Tools().empty());
         }
-    }
 }
 
 TEST(DocumentIO, LenientLoadingKeepsWhatItDoesNotKnowAndWritesItBack) {
@@ -494,32 +381,27 @@ TEST(DocumentIO, LenientLoadingKeepsWhatItDoesNotKnowAndWritesItBack) {
 	},
 }
 )";
-    Ref<OrvaneDoc> strict = MakeRef<OrvaneDoc>();
+    Ref<OrvaneDoc> strict = MakeRef<OrvaneDoc>(), doc = MakeRef<OrvaneDoc>(), again = MakeRef<OrvaneDoc>();
     EXPECT_FALSE(Load(text, *strict).ok);
-    Ref<OrvaneDoc> doc = MakeRef<OrvaneDoc>();
     const DocumentLoadResult r = Load(text, *doc, true);
     ASSERT_TRUE(r.ok) << r.error;
     EXPECT_EQ(r.warnings.size(), 6u) << Joined(r.warnings); // Layout, FuturePref, FancyThing, Bogus, two links
     EXPECT_EQ(doc->FindTool("Mystery1"), nullptr);
-    Operator *a = doc->FindTool("A1");
-    EXPECT_EQ(a->FindInput("Input")->UnresolvedLink(), "Mystery1.Output");
+    EXPECT_EQ(doc->FindTool("A1")->FindInput("Input")->UnresolvedLink(), "Mystery1.Output");
     EXPECT_EQ(doc->GetPrefLong(PREF_FFWidth), 1280);
 
     const std::string saved = SaveDocument(*doc);
-    const ScriptVal source = ScriptVal::FromText(text), root = ScriptVal::FromText(saved);
-    for (const char *entry : {"Layout"}) EXPECT_EQ(root.Find(entry)->ToText(), source.Find(entry)->ToText());
+    const ScriptVal source = ScriptVal::FromText(text), root = ScriptVal::FromText(saved), a1 = ToolIn(saved, "A1");
+    EXPECT_EQ(root.Find("Layout")->ToText(), source.Find("Layout")->ToText());
     EXPECT_EQ(root.Find("Prefs")->Find("FuturePref")->ToText(), "{ Mode = \"fast\" }");
     EXPECT_EQ(ToolIn(saved, "Mystery1"), *source.Find("Tools")->Find("Mystery1"));
-    const ScriptVal a1 = ToolIn(saved, "A1");
-    EXPECT_EQ(InputKeys(saved, "A1"), (std::vector<std::string>{"Size", "Input", "Bogus"}));
+    EXPECT_EQ(InputKeys(saved, "A1"), (Names{"Size", "Input", "Bogus"}));
     EXPECT_EQ(a1.Find("Inputs")->Find("Size")->ToText(), "Mystery1.Amount");
     EXPECT_EQ(*a1.Find("ViewInfo"), *source.Find("Tools")->Find("A1")->Find("ViewInfo"));
-    Ref<OrvaneDoc> again = MakeRef<OrvaneDoc>();
     ASSERT_TRUE(Load(saved, *again, true).ok);
     EXPECT_EQ(SaveDocument(*again), saved);
-
     // A value set later takes the place of the unresolved link.
-    ts::SetNumber(a, "Size", 4.0);
+    ts::SetNumber(doc->FindTool("A1"), "Size", 4.0);
     EXPECT_EQ(ToolIn(SaveDocument(*doc), "A1").Find("Inputs")->Find("Size")->ToText(), "4");
 }
 
@@ -542,121 +424,88 @@ TEST(DocumentIO, APlannedToolKeepsItsSettingsWithOneWarning) {
     EXPECT_EQ(now.Size(), was.Size());
     for (const auto &[key, value] : was.Entries()) EXPECT_EQ(now.Find(key)->ToText(), value.ToText());
     // Asked for a result, it fails with one line.
-    Operator *glow = doc->FindTool("Glow1");
-    EXPECT_FALSE(Evaluate(glow->FindMainOutput(), 0.0));
-    const std::vector<ConsoleLine> lines = doc->ConsoleLines();
-    ASSERT_EQ(lines.size(), 1u);
-    EXPECT_NE(lines[0].text.find("is not available yet"), std::string::npos) << lines[0].text;
+    EXPECT_FALSE(Evaluate(doc->FindTool("Glow1")->FindMainOutput(), 0.0));
+    EXPECT_EQ(ts::ConsoleText(*doc), "error: Glow1: the Glow tool is not available yet in this version of Orvane\n");
 }
 
 TEST(DocumentIO, AnyNameOfAClassMakesItAndItIsSavedByItsID) {
     ts::LoadOperators();
-    const struct {
-        const char *written, *saved;
-    } cases[] = {{"SetBgColor", "SetCanvasColor"}, // an old ID
-                 {"Resize", "BetterResize"},       // an alias
-                 {"DocAlias", DocToolClass}};
-    for (const auto &c : cases) {
-        SCOPED_TRACE(c.written);
+    // An old ID, an alias, and an alias of this file's class.
+    for (const auto &[written, saved] :
+         {std::pair{"SetBgColor", "SetCanvasColor"}, {"Resize", "BetterResize"}, {"DocAlias", DocToolClass}}) {
         Ref<OrvaneDoc> doc = MakeRef<OrvaneDoc>();
         const DocumentLoadResult r =
-            Load(std::string("Orvane.Document { Tools = { T1 = ") + c.written + " { } } }", *doc);
+            Load(std::string("Orvane.Document { Tools = { T1 = ") + written + " { } } }", *doc);
         ASSERT_TRUE(r.ok) << r.error;
-        EXPECT_EQ(doc->FindTool("T1")->ClassID(), OvID(c.saved));
-        EXPECT_EQ(ToolIn(SaveDocument(*doc), "T1").ClassName(), c.saved);
+        EXPECT_EQ(doc->FindTool("T1")->ClassID(), OvID(saved));
+        EXPECT_EQ(ToolIn(SaveDocument(*doc), "T1").ClassName(), saved);
     }
 }
-
-// ---- files ---------------------------------------------------------------
-
-struct TempDir {
-    std::filesystem::path path;
-    explicit TempDir(const std::string &name) {
-        path = std::filesystem::temp_directory_path() / ("orvane-doctest-" + name + "-" + std::to_string(getpid()));
-        std::filesystem::remove_all(path);
-        std::filesystem::create_directories(path);
-    }
-    ~TempDir() {
-        std::error_code ignored;
-        std::filesystem::permissions(path, std::filesystem::perms::owner_all, ignored);
-        std::filesystem::remove_all(path, ignored);
-    }
-    std::vector<std::string> Entries() const {
-        std::vector<std::string> names;
-        for (const auto &e : std::filesystem::directory_iterator(path)) names.push_back(e.path().filename().string());
-        std::sort(names.begin(), names.end());
-        return names;
-    }
-};
 
 std::string ReadFile(const std::filesystem::path &p) {
-    std::ifstream in(p, std::ios::binary);
-    std::ostringstream s;
-    s << in.rdbuf();
-    return s.str();
+    return std::string(std::istreambuf_iterator<char>(std::ifstream(p, std::ios::binary).rdbuf()), {});
 }
-
 void WriteFile(const std::filesystem::path &p, const std::string &text) { std::ofstream(p, std::ios::binary) << text; }
 
-Ref<OrvaneDoc> SmallDoc() {
-    Ref<OrvaneDoc> doc = MakeRef<OrvaneDoc>();
+TEST(DocumentIO, SavingReplacesAFileWholeOrLeavesWhatWasThereAndOnlyFilesAreRead) {
+    namespace fs = std::filesystem;
+    struct TempDir {
+        fs::path path = fs::temp_directory_path() / ("orvane-doctest-" + std::to_string(getpid()));
+        TempDir() { fs::remove_all(path), fs::create_directories(path); }
+        ~TempDir() {
+            std::error_code ignored;
+            fs::permissions(path, fs::perms::owner_all, ignored);
+            fs::remove_all(path, ignored);
+        }
+        Names Entries() const {
+            Names names;
+            for (const auto &e : fs::directory_iterator(path)) names.push_back(e.path().filename().string());
+            std::sort(names.begin(), names.end());
+            return names;
+        }
+    } dir;
+    Ref<OrvaneDoc> doc = MakeRef<OrvaneDoc>(), back = MakeRef<OrvaneDoc>();
     ts::SetNumber(AddDocTool(*doc, "T1"), "Size", 7.0);
-    return doc;
-}
-
-TEST(DocumentIO, SavingAFileReplacesItWhole) {
-    TempDir dir("replace");
-    Ref<OrvaneDoc> doc = SmallDoc();
-    const std::filesystem::path target = dir.path / "comp.orv";
+    const fs::path target = dir.path / "comp.orv";
+    std::string error;
     for (const bool existing : {false, true}) {
-        SCOPED_TRACE(existing ? "over an existing file" : "a new file");
         if (existing) WriteFile(target, std::string(10000, 'x'));
-        std::string error;
         ASSERT_TRUE(SaveDocumentFile(*doc, target.string(), error)) << error;
         EXPECT_EQ(ReadFile(target), SaveDocument(*doc));
-        EXPECT_EQ(dir.Entries(), (std::vector<std::string>{"comp.orv"})) << "no temporary file remains";
+        EXPECT_EQ(dir.Entries(), Names{"comp.orv"}) << "no temporary file remains";
     }
-    Ref<OrvaneDoc> back = MakeRef<OrvaneDoc>();
     const DocumentLoadResult r = LoadDocumentFile(target.string(), *back);
     ASSERT_TRUE(r.ok) << r.error;
     EXPECT_EQ(SaveDocument(*back), SaveDocument(*doc));
-}
 
-TEST(DocumentIO, AFailedSaveLeavesWhatWasThereAndOnlyFilesAreRead) {
-    TempDir dir("fail");
-    Ref<OrvaneDoc> doc = SmallDoc();
+    // Failed saves: under a plain file, onto a folder.
+    fs::remove(target);
     WriteFile(dir.path / "plain", "not a folder");
-    std::string error;
     EXPECT_FALSE(SaveDocumentFile(*doc, (dir.path / "plain" / "comp.orv").string(), error));
     EXPECT_EQ(ReadFile(dir.path / "plain"), "not a folder");
-    std::filesystem::create_directory(dir.path / "taken");
+    fs::create_directory(dir.path / "taken");
     WriteFile(dir.path / "taken" / "inside", "keep");
     EXPECT_FALSE(SaveDocumentFile(*doc, (dir.path / "taken").string(), error));
     EXPECT_EQ(ReadFile(dir.path / "taken" / "inside"), "keep");
-    EXPECT_EQ(dir.Entries(), (std::vector<std::string>{"plain", "taken"})) << "no temporary file remains";
+    EXPECT_EQ(dir.Entries(), (Names{"plain", "taken"})) << "no temporary file remains";
 
     // Reading: a missing file, a folder, and a FIFO with no writer (which must not wait for one).
     ASSERT_EQ(mkfifo((dir.path / "pipe").c_str(), 0600), 0);
     for (const auto &[name, says] : {std::pair{"absent.orv", "cannot open"}, std::pair{"taken", "not a regular file"},
                                      std::pair{"pipe", "not a regular file"}}) {
-        Ref<OrvaneDoc> other = MakeRef<OrvaneDoc>();
-        const DocumentLoadResult r = LoadDocumentFile((dir.path / name).string(), *other);
-        EXPECT_FALSE(r.ok);
-        EXPECT_NE(r.error.find(says), std::string::npos) << r.error;
-        EXPECT_NE(r.error.find(name), std::string::npos) << r.error;
+        const DocumentLoadResult failed = LoadDocumentFile((dir.path / name).string(), *MakeRef<OrvaneDoc>());
+        EXPECT_FALSE(failed.ok);
+        EXPECT_NE(failed.error.find(says), std::string::npos) << failed.error;
+        EXPECT_NE(failed.error.find(name), std::string::npos) << failed.error;
     }
-}
 
-TEST(DocumentIO, SavingIntoAReadOnlyFolderFailsAndKeepsTheOldFile) {
-    if (geteuid() == 0) GTEST_SKIP() << "folder permissions do not bind the superuser";
-    TempDir dir("readonly");
-    const std::filesystem::path target = dir.path / "comp.orv";
+    // Into a read-only folder (folder permissions do not bind the superuser).
+    if (geteuid() == 0) return;
     WriteFile(target, "the old document");
-    std::filesystem::permissions(dir.path, std::filesystem::perms::owner_read | std::filesystem::perms::owner_exec);
-    std::string error;
-    EXPECT_FALSE(SaveDocumentFile(*SmallDoc(), target.string(), error));
+    fs::permissions(dir.path, fs::perms::owner_read | fs::perms::owner_exec);
+    EXPECT_FALSE(SaveDocumentFile(*doc, target.string(), error));
     EXPECT_FALSE(error.empty());
-    std::filesystem::permissions(dir.path, std::filesystem::perms::owner_all);
+    fs::permissions(dir.path, fs::perms::owner_all);
     EXPECT_EQ(ReadFile(target), "the old document");
 }
 

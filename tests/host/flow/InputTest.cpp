@@ -1,21 +1,21 @@
 // Inputs: limits, rounding, types, links and loops, hidden and internal inputs, run-time attributes,
-// NotifyChanged kept out of renders, and values typed as text on a command line.
-#include <atomic>
+// NotifyChanged for inputs that ask for it and never from renders, and values typed as text on a command line.
 #include <string>
 #include <vector>
 
 #include <gtest/gtest.h>
 
-#include "host/core/Registry.h"
 #include "host/core/Tags.h"
-#include "host/flow/AnimCurve.h"
 #include "host/flow/DataTypes.h"
-#include "host/flow/Engine.h"
 #include "host/flow/InputValue.h"
 #include "host/flow/Request.h"
+#include "tests/support/TestSupport.h"
 
 namespace Orvane::inputtest {
+namespace ts = ::Orvane::Test;
 namespace {
+
+using Names = std::vector<std::string>;
 
 /// A tool with one input of each kind the tests need. Its "Value" output is
 /// the number that reached Process through the input named by `watch`.
@@ -23,29 +23,28 @@ class KnobsTool : public ThreadedOperator {
 public:
     KnobsTool(const Registry *reg, const ScriptVal &args, const TagList &tags) : ThreadedOperator(reg, args, tags) {
         const OvID number = CLSID_DataType_Number, idA("ModeA"), idB("ModeB");
-        Knob("Hard", number,
-             {{InputMinAllowed, -1.0}, {InputMaxAllowed, 10.0}, {InputSliderLow, 0.0}, {InputSliderHigh, 5.0}});
-        Knob("Count", number, {{InputInteger, 1}, {InputMinAllowed, -3.0}, {InputMaxAllowed, 8.0}});
-        Knob("Where", CLSID_DataType_Point,
-             {{InputMinAllowed, 0.0}, {InputMaxAllowed, 1.0}, {InputDefaultX, 0.5}, {InputDefaultY, 0.25}});
-        Knob("Caption", CLSID_DataType_Text, {{InputDefaultText, "hello"}});
-        Knob("Mode", CLSID_DataType_OvID,
-             {{InputDefaultId, idB}, {ListAddItem, "A"}, {ListItemId, idA}, {ListAddItem, "B"}, {ListItemId, idB}});
-        Knob("Blend", number, {{ListAddItem, "Normal"}, {ListAddItem, "Soft Light"}});
-        Knob("File", CLSID_DataType_Clip, {});
-        Knob("Hidden", number, {{ControlVisible, 0}, {InputDefault, 3.0}});
-        Knob("Internal", number, {{InputExternal, 0}, {InputDefault, 4.0}});
-        Knob("Notified", number, {{InputNotify, 1}, {InputDefault, 1.0}});
-        Knob("Input", CLSID_DataType_Image, {{LinkMain, 1}, {InputRequired, 0}});
-        AddOutputTagList("Output", "Output", {{LinkDataType, CLSID_DataType_Image}, {LinkMain, 1}});
+        ts::AddIn(this, "Hard", number,
+                  {{InputMinAllowed, -1.0}, {InputMaxAllowed, 10.0}, {InputSliderLow, 0.0}, {InputSliderHigh, 5.0}});
+        ts::AddIn(this, "Count", number, {{InputInteger, 1}, {InputMinAllowed, -3.0}, {InputMaxAllowed, 8.0}});
+        ts::AddIn(this, "Where", CLSID_DataType_Point,
+                  {{InputMinAllowed, 0.0}, {InputMaxAllowed, 1.0}, {InputDefaultX, 0.5}, {InputDefaultY, 0.25}});
+        ts::AddIn(this, "Caption", CLSID_DataType_Text, {{InputDefaultText, "hello"}});
+        ts::AddIn(
+            this, "Mode", CLSID_DataType_OvID,
+            {{InputDefaultId, idB}, {ListAddItem, "A"}, {ListItemId, idA}, {ListAddItem, "B"}, {ListItemId, idB}});
+        ts::AddIn(this, "Blend", number, {{ListAddItem, "Normal"}, {ListAddItem, "Soft Light"}});
+        ts::AddIn(this, "File", CLSID_DataType_Clip);
+        ts::AddIn(this, "Hidden", number, {{ControlVisible, 0}, {InputDefault, 3.0}});
+        ts::AddIn(this, "Internal", number, {{InputExternal, 0}, {InputDefault, 4.0}});
+        ts::AddIn(this, "Notified", number, {{InputNotify, 1}, {InputDefault, 1.0}});
+        ts::AddIn(this, "Quiet", number, {{InputNotify, 1}, {InputInitialNotify, 0}}); // not told its first value
+        ts::AddImageIn(this, {{InputRequired, 0}});
+        ts::AddImageOut(this);
         value = AddOutputTagList("Value", "Value", {{LinkDataType, number}});
     }
-    void Knob(const char *id, OvID type, TagList tags) {
-        tags.Add({LinkDataType, type});
-        AddInputTagList(id, id, tags);
-    }
     void NotifyChanged(Input *in, Parameter *param, double time, TagList *tags) override {
-        ++notifications;
+        if (auto *n = dynamic_cast<Number *>(param))
+            heard.push_back(in->ID().Text() + (" " + ScriptVal(n->value).ToText()));
         ThreadedOperator::NotifyChanged(in, param, time, tags);
     }
     void Process(Request *req) override {
@@ -55,24 +54,9 @@ public:
     }
     Output *value;
     std::string watch = "Hidden";
-    std::atomic<int> notifications{0};
+    Names heard; ///< "input value" for each NotifyChanged with a number
     int processCount = 0;
 };
-
-OvID KnobsClass() {
-    static const OvID id = [] {
-        auto make = [](const Registry *reg, const ScriptVal &args, const TagList &tags) -> Object * {
-            return new KnobsTool(reg, args, tags);
-        };
-        TagList tags{{RegConstructor, +make},
-                     {RegTypeFlags, static_cast<long long>(RegKindOperator | RegKindTool)},
-                     {RegNoBlendControls, 1},
-                     {RegNoEffectMask, 1}};
-        Registry::_Init(&ClassRegistry, OvID("InputTestKnobs"), tags);
-        return OvID("InputTestKnobs");
-    }();
-    return id;
-}
 
 double NumberOf(const Ref<Parameter> &p) {
     auto *n = dynamic_cast<const Number *>(p.Get());
@@ -83,7 +67,11 @@ double NumberOf(const Ref<Parameter> &p) {
 // A flow of three knob tools, A, B and C.
 class InputTest : public ::testing::Test {
 protected:
-    KnobsTool *Add(const char *name) { return dynamic_cast<KnobsTool *>(doc->AddTool(KnobsClass(), name)); }
+    KnobsTool *Add(const char *name) {
+        static const OvID cls = ts::RegisterTool("InputTestKnobs", &ts::MakeTool<KnobsTool>,
+                                                 {{RegNoBlendControls, 1}, {RegNoEffectMask, 1}});
+        return dynamic_cast<KnobsTool *>(doc->AddTool(cls, name));
+    }
     void SetUp() override { ASSERT_TRUE(a && b && c); }
     Ref<OrvaneDoc> doc = MakeRef<OrvaneDoc>();
     KnobsTool *a = Add("A"), *b = Add("B"), *c = Add("C");
@@ -97,10 +85,7 @@ TEST_F(InputTest, HardLimitsClampAndWholeInputsRound) {
         for (double v : values) {
             EXPECT_TRUE(in->SetValue(MakeRef<Number>(v)));
             out += in->ValueAt(10.0)->ToScript().ToText() + " "; // the curve set before is gone
-            AnimCurve curve;
-            curve.SetKey(0.0, MakeRef<Number>(0.0));
-            curve.SetKey(10.0, MakeRef<Number>(v));
-            EXPECT_TRUE(in->SetCurve(curve));
+            EXPECT_TRUE(in->SetCurve(ts::NumberCurve({{0.0, 0.0}, {10.0, v}})));
             EXPECT_EQ(NumberOf(in->Curve()->Keys()[1].value), NumberOf(in->ValueAt(10.0)));
             out += in->ValueAt(10.0)->ToScript().ToText() + " ";
         }
@@ -144,9 +129,7 @@ TEST_F(InputTest, DefaultsComeFromTheTagsAndIsDefaultTracksThem) {
     EXPECT_FALSE(hidden->IsDefault());
     ASSERT_TRUE(hidden->SetValue(MakeRef<Number>(3.0))); // an equal value, not the same object
     EXPECT_TRUE(hidden->IsDefault());
-    AnimCurve curve;
-    curve.SetKey(0.0, MakeRef<Number>(3.0));
-    ASSERT_TRUE(hidden->SetCurve(curve));
+    ASSERT_TRUE(hidden->SetCurve(ts::NumberCurve({{0.0, 3.0}})));
     EXPECT_FALSE(hidden->IsDefault()) << "an animated input is not at its default";
     hidden->ResetValue();
     EXPECT_TRUE(hidden->IsDefault() && !hidden->IsAnimated());
@@ -212,9 +195,8 @@ TEST_F(InputTest, AttributesChangeAtRunTimeAndHiddenAndInternalInputsStillDelive
     EXPECT_FALSE(hard->IsVisible());
     a->watch = "Hard";
     EXPECT_EQ(NumberOf(Evaluate(a->value, 1.0)), 6.25);
-    AnimCurve curve;
-    curve.SetKey(0.0, MakeRef<Number>(1.0));
-    EXPECT_FALSE(internal->SetCurve(curve) || internal->IsAnimated()) << "an internal input takes no curve";
+    EXPECT_FALSE(internal->SetCurve(ts::NumberCurve({{0.0, 1.0}})) || internal->IsAnimated())
+        << "an internal input takes no curve";
     ASSERT_TRUE(internal->SetValue(MakeRef<Number>(9.0)));
     a->watch = "Internal";
     EXPECT_EQ(NumberOf(Evaluate(a->value, 2.0)), 9.0);
@@ -227,13 +209,24 @@ TEST_F(InputTest, AttributesChangeAtRunTimeAndHiddenAndInternalInputsStillDelive
     EXPECT_EQ(hard->Tags().GetDouble(InputMinAllowed), -1.0);
 }
 
-TEST_F(InputTest, RendersDoNotCallNotifyChanged) {
+TEST_F(InputTest, NotifyChangedHearsFirstValuesAndChangesOfNotifyingInputsButNeverRenders) {
+    EXPECT_EQ(a->heard, Names{"Notified 1"});
+    a->heard.clear();
+    Input *notified = a->FindInput("Notified");
+    ASSERT_TRUE(notified->SetValue(MakeRef<Number>(2.5)));
+    ASSERT_TRUE(a->FindInput("Quiet")->SetValue(MakeRef<Number>(-1)));
+    ASSERT_TRUE(a->FindInput("Hard")->SetValue(MakeRef<Number>(9)));
+    ASSERT_TRUE(notified->SetCurve(ts::NumberCurve({{0, 4}, {10, 8}}))); // heard with its value at the start
+    notified->ResetValue();                                              // heard with the default
+    EXPECT_FALSE(notified->SetValue(MakeRef<Text>("x"))) << "a value refused changes nothing and is not heard";
+    EXPECT_EQ(a->heard, (Names{"Notified 2.5", "Quiet -1", "Notified 4", "Notified 1"}));
+
     ASSERT_TRUE(b->FindInput("Notified")->ConnectTo(a->FindOutput("Value")));
     b->watch = "Notified";
-    const int before = b->notifications.load() + a->notifications.load();
+    a->heard.clear(), b->heard.clear();
     for (double time : {0.0, 1.0, 2.0}) EXPECT_EQ(NumberOf(Evaluate(b->value, time)), 3.0);
     EXPECT_EQ(b->processCount, 3);
-    EXPECT_EQ(b->notifications.load() + a->notifications.load(), before);
+    EXPECT_TRUE(a->heard.empty() && b->heard.empty());
 }
 
 // Text as typed on a command line: script syntax where it parses, text as it stands for inputs that take text,

@@ -7,6 +7,7 @@
 
 #include <cmath>
 #include <string>
+#include <tuple>
 #include <vector>
 
 #include "host/core/Tags.h"
@@ -27,10 +28,8 @@ namespace {
 class MovingBar : public ThreadedOperator {
 public:
     MovingBar(const Registry *reg, const ScriptVal &args, const TagList &tags, bool withInput = false)
-        : ThreadedOperator(reg, args, tags) {
-        if (withInput) input = AddInputTagList("Input", "Input", {{LinkDataType, CLSID_DataType_Image}, {LinkMain, 1}});
-        output = AddOutputTagList("Output", "Output", {{LinkDataType, CLSID_DataType_Image}, {LinkMain, 1}});
-    }
+        : ThreadedOperator(reg, args, tags), input(withInput ? ts::AddImageIn(this) : nullptr),
+          output(ts::AddImageOut(this)) {}
     static ImgRectI Window(double t) {
         const int x = static_cast<int>(std::floor(4 * t));
         return ImgRectI(x, 1, x + 2, 3);
@@ -64,7 +63,7 @@ public:
         }
         req->SetOutputData(output, img);
     }
-    Input *input = nullptr;
+    Input *input;
     Output *output;
     std::vector<double> times;
     std::vector<uint32_t> flags;
@@ -83,20 +82,12 @@ struct NumberTool : ThreadedOperator {
 };
 
 struct Classes {
-    OvID bar =
-        ts::RegisterTool("TestMotionBar", &ts::MakeTool<MovingBar>,
-                         {{RegNoBlendControls, 1}, {RegNoEffectMask, 1}, {RegSupportsRoI, 1}, {RegSupportsDoD, 1}});
-    OvID pass =
-        ts::RegisterTool("TestMotionPass", &ts::MakeTool<PassingBar>,
-                         {{RegNoBlendControls, 1}, {RegNoEffectMask, 1}, {RegSupportsRoI, 1}, {RegSupportsDoD, 1}});
-    OvID still = ts::RegisterTool("TestMotionStill", &ts::MakeTool<MovingBar>,
-                                  {{RegNoMotionBlurControls, 1}, {RegSupportsRoI, 1}, {RegSupportsDoD, 1}});
+    OvID bar = ts::RegisterTestTool("TestMotionBar", &ts::MakeTool<MovingBar>);
+    OvID pass = ts::RegisterTestTool("TestMotionPass", &ts::MakeTool<PassingBar>);
+    OvID still = ts::RegisterTestTool("TestMotionStill", &ts::MakeTool<MovingBar>, {{RegNoMotionBlurControls, 1}});
     OvID number = ts::RegisterTool("TestMotionNumber", &ts::MakeTool<NumberTool>);
 };
-const Classes &C() {
-    static const Classes classes;
-    return classes;
-}
+const Classes &C() { return ts::Once<Classes>(); }
 
 /// The sample times as the controls document them.
 std::vector<double> SampleTimes(double t, int n, double angle, double bias, double spread) {
@@ -112,11 +103,8 @@ void ExpectTimes(const std::vector<double> &got, const std::vector<double> &want
 }
 
 void SetBlur(Operator *op, int quality, double angle, double bias, double spread) {
-    ts::SetNumber(op, "MotionBlur", 1);
-    ts::SetNumber(op, "MotionBlurQuality", quality);
-    ts::SetNumber(op, "MotionBlurShutterAngle", angle);
-    ts::SetNumber(op, "MotionBlurCenterBias", bias);
-    ts::SetNumber(op, "MotionBlurSampleSpread", spread);
+    ts::SetNumbers(op, {{"MotionBlur", 1}, {"MotionBlurQuality", quality}, {"MotionBlurShutterAngle", angle}});
+    ts::SetNumbers(op, {{"MotionBlurCenterBias", bias}, {"MotionBlurSampleSpread", spread}});
 }
 
 Ref<Image> Eval(Operator *op, double time, bool cache = false, const ImgRectI *roi = nullptr, uint32_t flags = 0) {
@@ -173,20 +161,18 @@ TEST_F(MotionBlur, ControlsComeWithImageToolsThatDoNotRefuseThem) {
 }
 
 TEST_F(MotionBlur, SamplesAreRenderedAtTheShutterTimesAndAveraged) {
-    const struct {
-        int quality;
-        double angle, bias, spread, time;
-    } cases[] = {
+    // Samples, shutter angle, centre bias, sample spread, time.
+    const std::tuple<int, double, double, double, double> cases[] = {
         {2, 180, 0, 1, 1.0}, {4, 360, 0, 1, 1.0},        {5, 270, 0.5, 1, 1.25}, {3, 90, -1, 0.5, 2.0},
         {6, 360, 1, 1, 0.5}, {8, 180, -0.25, 0.75, 1.5}, {16, 360, 0, 1, 2.0},
     };
-    for (const auto &c : cases) {
-        SCOPED_TRACE(testing::Message() << c.quality << " samples, " << c.angle << " deg, bias " << c.bias
-                                        << ", spread " << c.spread << " at " << c.time);
+    for (const auto &[quality, angle, bias, spread, time] : cases) {
+        SCOPED_TRACE(testing::Message() << quality << " samples, " << angle << " deg, bias " << bias << ", spread "
+                                        << spread << " at " << time);
         MovingBar *bar = AddBar(C().bar, "Bar");
-        SetBlur(bar, c.quality, c.angle, c.bias, c.spread);
-        const std::vector<double> want = SampleTimes(c.time, c.quality, c.angle, c.bias, c.spread);
-        Ref<Image> img = Eval(bar, c.time);
+        SetBlur(bar, quality, angle, bias, spread);
+        const std::vector<double> want = SampleTimes(time, quality, angle, bias, spread);
+        Ref<Image> img = Eval(bar, time);
         ASSERT_TRUE(img);
         ExpectTimes(bar->times, want);
         // The union of the samples' windows, and per pixel the mean of what
@@ -198,50 +184,39 @@ TEST_F(MotionBlur, SamplesAreRenderedAtTheShutterTimesAndAveraged) {
         for (int y = 0; y < 4; ++y)
             for (int x = -1; x <= 16; ++x) ExpectMean(*img, x, y, want, &MovingBar::At, 1e-6);
         ExpectMean(*img, 100, 100, want, &MovingBar::At, 1e-6); // the canvas
-        // The pre-calculation gives the same windows without pixels.
-        Ref<Image> shape = Eval(bar, c.time, false, nullptr, ReqFlagPreCalc);
+        // The pre-calculation gives the same windows without pixels; a region cuts the blurred window.
+        Ref<Image> shape = Eval(bar, time, false, nullptr, ReqFlagPreCalc);
         ASSERT_TRUE(shape);
         EXPECT_TRUE(shape->IsNoData());
         EXPECT_EQ(shape->DataWindow(), dw);
+        const ImgRectI roi(dw.x0 + 1, 0, dw.x1, 2);
+        Ref<Image> part = Eval(bar, time, false, &roi);
+        ASSERT_TRUE(part);
+        EXPECT_EQ(part->DataWindow(), dw & roi);
+        for (int x = roi.x0; x < roi.x1; ++x) EXPECT_EQ(part->GetFlt(x, 1), img->GetFlt(x, 1)) << x;
         doc->RemoveTool("Bar");
     }
 }
 
 TEST_F(MotionBlur, OffOneSampleOrAClosedShutterIsTheFrameItself) {
-    const struct {
-        const char *name;
-        bool on;
-        int quality;
-        double angle, bias, spread, renderedAt;
-    } cases[] = {{"Off", false, 8, 360, 0, 1, 1.1},
-                 {"OneSample", true, 1, 360, 0, 1, 1.1},
-                 {"ClosedShutter", true, 8, 0, 0, 1, 1.1},
-                 {"NoSpreadRendersOnceAtTheMiddle", true, 6, 180, 1, 0, 1.35}};
-    for (const auto &c : cases) {
-        SCOPED_TRACE(c.name);
-        MovingBar *bar = AddBar(C().bar, c.name);
-        SetBlur(bar, c.quality, c.angle, c.bias, c.spread);
-        ts::SetNumber(bar, "MotionBlur", c.on);
+    // On, samples, shutter angle, centre bias, sample spread, and the one time rendered.
+    const std::tuple<const char *, bool, int, double, double, double, double> cases[] = {
+        {"Off", false, 8, 360, 0, 1, 1.1},
+        {"OneSample", true, 1, 360, 0, 1, 1.1},
+        {"ClosedShutter", true, 8, 0, 0, 1, 1.1},
+        {"NoSpreadRendersOnceAtTheMiddle", true, 6, 180, 1, 0, 1.35}};
+    for (const auto &[name, on, quality, angle, bias, spread, renderedAt] : cases) {
+        SCOPED_TRACE(name);
+        MovingBar *bar = AddBar(C().bar, name);
+        SetBlur(bar, quality, angle, bias, spread);
+        ts::SetNumber(bar, "MotionBlur", on);
         Ref<Image> out = Eval(bar, 1.1);
         ASSERT_TRUE(out);
-        ExpectTimes(bar->times, {c.renderedAt});
-        EXPECT_EQ(out->DataWindow(), MovingBar::Window(c.renderedAt));
-        EXPECT_EQ(out->GetFlt(out->DataWindow().x0, 1), MovingBar::Inside(c.renderedAt));
-        EXPECT_EQ(bar->flags, std::vector<uint32_t>{c.renderedAt == 1.1 ? 0u : 1u << 20}) << "a sample only when moved";
+        ExpectTimes(bar->times, {renderedAt});
+        EXPECT_EQ(out->DataWindow(), MovingBar::Window(renderedAt));
+        EXPECT_EQ(out->GetFlt(out->DataWindow().x0, 1), MovingBar::Inside(renderedAt));
+        EXPECT_EQ(bar->flags, std::vector<uint32_t>{renderedAt == 1.1 ? 0u : 1u << 20}) << "a sample only when moved";
     }
-}
-
-TEST_F(MotionBlur, ARegionOfInterestCutsTheBlurredWindow) {
-    MovingBar *bar = AddBar(C().bar, "Bar");
-    SetBlur(bar, 4, 360, 0, 1); // samples at 0.625, 0.875, 1.125, 1.375: bars from x = 2 to 7
-    Ref<Image> whole = Eval(bar, 1.0);
-    ASSERT_TRUE(whole);
-    EXPECT_EQ(whole->DataWindow(), ImgRectI(2, 1, 7, 3));
-    const ImgRectI roi(3, 0, 5, 2);
-    Ref<Image> part = Eval(bar, 1.0, false, &roi);
-    ASSERT_TRUE(part);
-    EXPECT_EQ(part->DataWindow(), ImgRectI(3, 1, 5, 2));
-    for (int x = 3; x < 5; ++x) EXPECT_EQ(part->GetFlt(x, 1), whole->GetFlt(x, 1)) << x;
 }
 
 TEST_F(MotionBlur, EveryDepthAveragesAnAnimatedBackground) {
@@ -255,11 +230,7 @@ TEST_F(MotionBlur, EveryDepthAveragesAnAnimatedBackground) {
         {{0, 0.0}, {10, 1.0}, {20, 0.25}}, {{0, 1.0}, {20, 0.0}}, {{0, 0.3}}, {{0, 0.5}, {20, 1.0}}};
     Input *channels[4] = {bg->FindInput("TopLeftRed"), bg->FindInput("TopLeftGreen"), bg->FindInput("TopLeftBlue"),
                           bg->FindInput("TopLeftAlpha")};
-    for (int ch = 0; ch < 4; ++ch) {
-        AnimCurve curve;
-        for (const auto &[t, v] : keys[ch]) curve.SetKey(t, MakeRef<Number>(v));
-        ASSERT_TRUE(channels[ch]->SetCurve(curve));
-    }
+    for (int ch = 0; ch < 4; ++ch) ASSERT_TRUE(channels[ch]->SetCurve(ts::NumberCurve(keys[ch])));
     // The background's colour at a sample time, from its inputs' curves.
     auto colourAt = [&](double t, int, int) {
         float v[4];
@@ -370,9 +341,7 @@ TEST_F(MotionBlur, AFailingSampleFailsTheFrame) {
     bar->failAfter = 2.0;
     EXPECT_TRUE(Eval(bar, 1.5));
     EXPECT_FALSE(Eval(bar, 2.0));
-    const auto lines = doc->ConsoleLines();
-    ASSERT_EQ(lines.size(), 1u);
-    EXPECT_EQ(lines[0].text, "Bar: no bar after time 2");
+    EXPECT_EQ(ts::ConsoleText(*doc), "error: Bar: no bar after time 2\n");
 }
 
 } // namespace
