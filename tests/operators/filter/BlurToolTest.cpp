@@ -24,17 +24,7 @@ namespace ts = ::Orvane::Test;
 
 /// An RGBA float frame w x h with the test pattern over `window` and a canvas.
 Ref<Image> Source(int w, int h, const ImgRectI &window) {
-    Ref<Image> pat = ts::PatternImage(window.Width(), window.Height(), DepthRGBAFlt32, 5);
-    const FltPixel canvas{0.1f, 0.2f, 0.3f, 0.4f};
-    Ref<Image> img = NewImageTagList({{ImgWidth, w},
-                                      {ImgHeight, h},
-                                      {ImgDepth, DepthRGBAFlt32},
-                                      {ImgDataWindow, &window},
-                                      {ImgCanvasColor, &canvas}});
-    EXPECT_TRUE(img->AllocScanLineData());
-    for (int y = window.y0; y < window.y1; ++y)
-        for (int x = window.x0; x < window.x1; ++x) img->PutFlt(x, y, pat->GetFlt(x - window.x0, y - window.y0));
-    return img;
+    return ts::WindowedImage(w, h, window, {0.1f, 0.2f, 0.3f, 0.4f}, 5, DepthRGBAFlt32);
 }
 
 /// The tool's output, with the cache off so that every call reaches the tools.
@@ -43,8 +33,7 @@ Ref<Image> Render(Operator *op, const std::optional<ImgRectI> &roi = std::nullop
     opt.useCache = false;
     opt.flags = flags;
     if (roi) opt.roi = ImageDomain(*roi);
-    Ref<Parameter> p = Evaluate(op->FindMainOutput(), 0.0, opt);
-    return Ref<Image>(dynamic_cast<Image *>(p.Get()));
+    return Ref<Image>(dynamic_cast<Image *>(Evaluate(op->FindMainOutput(), 0.0, opt).Get()));
 }
 
 /// A control length of `pixels` on a frame `width` wide, and the normalised
@@ -52,9 +41,13 @@ Ref<Image> Render(Operator *op, const std::optional<ImgRectI> &roi = std::nullop
 double Control(double pixels, int width) { return pixels * 720.0 / width; }
 double Sent(double pixels, int width) { return Control(pixels, width) / 720.0; }
 
-/// Whether `got` is what the host call gives for `src` into got's window with these tags.
-::testing::AssertionResult IsHostBlur(const Ref<Image> &got, Image *src, const TagList &tags) {
+/// Whether `got` is what the host call gives for `src` into got's window: a blur of `type` with the sizes
+/// sent (x and y), reading `source`, four passes and every channel unless `extra` says otherwise.
+::testing::AssertionResult IsHostBlur(const Ref<Image> &got, Image *src, int type, double x, double y,
+                                      const ImgRectI &source, const TagList &extra = {}) {
     if (!got) return ::testing::AssertionFailure() << "no image";
+    TagList tags{{BlurFilterType, type}, {BlurXSize, x}, {BlurYSize, y}, {BlurPasses, 4}, {BlurSourceWindow, &source}};
+    tags.Merge(extra);
     const ImgRectI w = got->DataWindow();
     Ref<Image> want = NewImageTagList({{ImgLikeImage, src}, {ImgDataWindow, &w}});
     if (!src->BlurTagList(want.Get(), tags)) return ::testing::AssertionFailure() << "the host blur failed";
@@ -70,10 +63,10 @@ class BlurTool : public ::testing::Test {
 protected:
     static void SetUpTestSuite() { ts::LoadOperators(); }
 
-    /// A Blur fed by a source of `img` that notes what it is asked for.
-    Operator *Make(Ref<Image> img) {
-        probe = ts::AddImageSource(doc, "Src", std::move(img));
-        Operator *blur = doc.AddTool(OvID("Blur"));
+    /// A Blur in `d` fed by a source of `img` that notes what it is asked for.
+    Operator *Make(Ref<Image> img, OrvaneDoc *d = nullptr, Operator *blur = nullptr) {
+        probe = ts::AddImageSource(d ? *d : doc, "Src", std::move(img));
+        if (!blur) blur = doc.AddTool(OvID("Blur"));
         EXPECT_TRUE(blur && probe && blur->FindInput("Input")->ConnectTo(probe->Out()));
         return blur;
     }
@@ -115,14 +108,9 @@ TEST_F(BlurTool, FilterTableWithItsFallback) {
     Operator *blur = Make(img);
     ts::SetNumber(blur, "XBlurSize", Control(20, 48)); // wide enough that the fast Gaussian is not the exact one
     for (const auto &[id, type] : table) {
-        SCOPED_TRACE(id ? id : "default");
         if (id) ts::SetID(blur, "Filter", id);
-        EXPECT_TRUE(IsHostBlur(Render(blur), img.Get(),
-                               {{BlurFilterType, type},
-                                {BlurXSize, Sent(20, 48)},
-                                {BlurYSize, Sent(20, 48)},
-                                {BlurPasses, 4},
-                                {BlurSourceWindow, &frame}}));
+        EXPECT_TRUE(IsHostBlur(Render(blur), img.Get(), type, Sent(20, 48), Sent(20, 48), frame))
+            << (id ? id : "default");
     }
 }
 
@@ -166,15 +154,10 @@ TEST_F(BlurTool, WindowsUnderEachClippingMode) {
     for (const Case &c : cases) {
         SCOPED_TRACE(c.mode ? c.mode : "default");
         if (c.mode) ts::SetID(blur, "ClippingMode", c.mode);
-        const TagList tags{{BlurFilterType, BlurBox},
-                           {BlurXSize, Sent(5, 64)},
-                           {BlurYSize, Sent(3, 64)},
-                           {BlurPasses, 4},
-                           {BlurSourceWindow, &c.source}};
         Ref<Image> got = Render(blur);
         ASSERT_TRUE(got);
         EXPECT_EQ(got->DataWindow(), c.out);
-        EXPECT_TRUE(IsHostBlur(got, img.Get(), tags));
+        EXPECT_TRUE(IsHostBlur(got, img.Get(), BlurBox, Sent(5, 64), Sent(3, 64), c.source));
         // Pre-calculation: the same windows from the domain, without pixels.
         Ref<Image> shape = Render(blur, std::nullopt, ReqFlagPreCalc);
         ASSERT_TRUE(shape && shape->IsNoData());
@@ -184,12 +167,10 @@ TEST_F(BlurTool, WindowsUnderEachClippingMode) {
         // source window is never narrowed by the region.
         probe->asked.clear();
         Ref<Image> part = Render(blur, roi);
-        ASSERT_TRUE(part);
+        ASSERT_TRUE(part && probe->asked.size() == 1 && probe->asked[0].has_value());
         EXPECT_EQ(part->DataWindow(), c.out & roi);
-        ASSERT_EQ(probe->asked.size(), 1u);
-        ASSERT_TRUE(probe->asked[0].has_value());
         EXPECT_EQ(probe->asked[0]->rect, c.asked);
-        EXPECT_TRUE(IsHostBlur(part, img.Get(), tags));
+        EXPECT_TRUE(IsHostBlur(part, img.Get(), BlurBox, Sent(5, 64), Sent(3, 64), c.source));
     }
 }
 
@@ -204,18 +185,13 @@ TEST_F(BlurTool, UnboundedKindsKeepTheFrameAndAskForTheWholeInput) {
         ts::SetID(blur, "ClippingMode", mode);
         probe->asked.clear();
         Ref<Image> got = Render(blur, ImgRectI(10, 10, 20, 20));
-        ASSERT_TRUE(got);
+        ASSERT_TRUE(got && probe->asked.size() == 1);
         EXPECT_EQ(got->DataWindow(), frame) << "the region does not narrow it either";
-        ASSERT_EQ(probe->asked.size(), 1u);
         EXPECT_FALSE(probe->asked[0].has_value()) << "the whole input";
         EXPECT_EQ(Render(blur, std::nullopt, ReqFlagPreCalc)->DataWindow(), dw) << "the domain in pre-calculation";
         // The source window is still sent: the frame, or the domain.
         const ImgRectI source = std::string(mode) == "ClippingMode_Frame" ? frame : dw;
-        EXPECT_TRUE(IsHostBlur(got, img.Get(),
-                               {{BlurFilterType, BlurVYV5Gaussian},
-                                {BlurXSize, Sent(4, 64)},
-                                {BlurYSize, Sent(4, 64)},
-                                {BlurSourceWindow, &source}}));
+        EXPECT_TRUE(IsHostBlur(got, img.Get(), BlurVYV5Gaussian, Sent(4, 64), Sent(4, 64), source));
     }
 }
 
@@ -228,20 +204,12 @@ TEST_F(BlurTool, PassesLockAndChannelsReachTheHost) {
     ts::SetNumbers(blur, {{"XBlurSize", Control(6, 50)}, {"YBlurSize", Control(2, 50)}, {"Passes", 2}, {"Green", 0}});
     Ref<Image> got = Render(blur);
     ASSERT_TRUE(got);
-    TagList two{{BlurFilterType, BlurMultiBox},
-                {BlurXSize, Sent(6, 50)},
-                {BlurYSize, Sent(6, 50)},
-                {BlurDoGreen, 0},
-                {BlurPasses, 2},
-                {BlurSourceWindow, &frame}};
-    TagList four = two;
-    four.Set({BlurPasses, 4});
-    EXPECT_TRUE(IsHostBlur(got, img.Get(), two));
-    EXPECT_FALSE(IsHostBlur(got, img.Get(), four));
+    const TagList two{{BlurDoGreen, 0}, {BlurPasses, 2}}, four{{BlurDoGreen, 0}};
+    EXPECT_TRUE(IsHostBlur(got, img.Get(), BlurMultiBox, Sent(6, 50), Sent(6, 50), frame, two));
+    EXPECT_FALSE(IsHostBlur(got, img.Get(), BlurMultiBox, Sent(6, 50), Sent(6, 50), frame, four));
     EXPECT_EQ(got->GetFlt(20, 20).G, img->GetFlt(20, 20).G) << "green is off";
     ts::SetNumber(blur, "LockXY", 0);
-    two.Set({BlurYSize, Sent(2, 50)});
-    EXPECT_TRUE(IsHostBlur(Render(blur), img.Get(), two));
+    EXPECT_TRUE(IsHostBlur(Render(blur), img.Get(), BlurMultiBox, Sent(6, 50), Sent(2, 50), frame, two));
 }
 
 TEST_F(BlurTool, BlendCountsOnce) {
@@ -273,29 +241,18 @@ TEST_F(BlurTool, BlendCountsOnce) {
 TEST_F(BlurTool, SoftenLoadedFromADocumentIsTheFallbackKernel) {
     // A document read after construction keeps "Soften" as it stands (no
     // button shows it) and the tool blurs with the fallback kernel.
-    const std::string text = R"(Orvane.Document {
-	Version = 1,
-	Tools = {
-		Blur1 = Blur { Inputs = { Filter = "Soften", XBlurSize = 36 } },
-	},
-})";
     OrvaneDoc loaded;
-    const DocumentLoadResult result = LoadDocument(text, loaded);
+    const DocumentLoadResult result = LoadDocument("Orvane.Document { Version = 1, Tools = { Blur1 = Blur { Inputs = { "
+                                                   "Filter = \"Soften\", XBlurSize = 36 } } } }",
+                                                   loaded);
     ASSERT_TRUE(result.error.empty()) << result.error;
     Operator *blur = loaded.FindTool("Blur1");
     ASSERT_NE(blur, nullptr);
     const auto *id = dynamic_cast<const IDValue *>(blur->FindInput("Filter")->Constant().Get());
-    ASSERT_NE(id, nullptr);
-    EXPECT_EQ(id->value, OvID("Soften"));
+    ASSERT_TRUE(id && id->value == OvID("Soften"));
     const ImgRectI frame(0, 0, 64, 32);
     Ref<Image> img = Source(64, 32, frame);
-    ASSERT_TRUE(blur->FindInput("Input")->ConnectTo(ts::AddImageSource(loaded, "Src", img)->Out()));
-    EXPECT_TRUE(IsHostBlur(Render(blur), img.Get(),
-                           {{BlurFilterType, BlurSoften},
-                            {BlurXSize, 0.05},
-                            {BlurYSize, 0.05},
-                            {BlurPasses, 4},
-                            {BlurSourceWindow, &frame}}));
+    EXPECT_TRUE(IsHostBlur(Render(Make(img, &loaded, blur)), img.Get(), BlurSoften, 0.05, 0.05, frame));
 }
 
 } // namespace

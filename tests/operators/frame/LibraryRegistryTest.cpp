@@ -19,18 +19,11 @@ namespace {
 class LibraryRegistry : public ::testing::Test {
 protected:
     void SetUp() override { Orvane::Test::LoadOperators(); }
-
-    /// Rows of the library: everything but what the tests register themselves.
-    static std::vector<const Registry *> LibraryRows() {
-        std::vector<const Registry *> rows;
-        for (const Registry *r : ClassRegistry->Rows())
-            if (std::string(r->ID().Text()).rfind("Test", 0) != 0) rows.push_back(r);
-        return rows;
-    }
 };
 
 TEST_F(LibraryRegistry, EveryCreatableRowCarriesTheVocabularyVersionAndHooks) {
-    for (const Registry *r : LibraryRows()) {
+    for (const Registry *r : ClassRegistry->Rows()) {
+        if (std::string(r->ID().Text()).rfind("Test", 0) == 0) continue; // registered by the tests
         SCOPED_TRACE(r->ID().Text());
         if (r->ID() == OvID("VolumeFogLighting")) {
             // A bare marker: its type and the hidden attribute, nothing else.
@@ -48,43 +41,35 @@ TEST_F(LibraryRegistry, EveryCreatableRowCarriesTheVocabularyVersionAndHooks) {
 }
 
 TEST_F(LibraryRegistry, OldClassIdsCreateTheClassThatReplacedThem) {
-    const struct {
-        const char *old, *now;
-    } cases[] = {{"SetBgColor", "SetCanvasColor"},
-                 {"PeturbNumber", "PerturbNumber"},
-                 {"PeturbPolyLine", "PerturbPolyLine"},
-                 {"Brazel.FastNoiseBrazel", "FastNoise"},
-                 {"sOffset", "FastNoise"}};
-    for (const auto &c : cases) {
-        SCOPED_TRACE(c.old);
-        const Registry *row = ClassRegistry->Find(OvID(c.old));
-        ASSERT_NE(row, nullptr);
-        EXPECT_EQ(row->ID(), OvID(c.now));
-        OrvaneDoc doc;
-        Operator *op = doc.AddTool(OvID(c.old));
-        ASSERT_NE(op, nullptr);
-        EXPECT_EQ(op->ClassID(), OvID(c.now));
+    OrvaneDoc doc;
+    for (const auto &[old, now] : {std::pair{"SetBgColor", "SetCanvasColor"},
+                                   {"PeturbNumber", "PerturbNumber"},
+                                   {"PeturbPolyLine", "PerturbPolyLine"},
+                                   {"Brazel.FastNoiseBrazel", "FastNoise"},
+                                   {"sOffset", "FastNoise"}}) {
+        const Registry *row = ClassRegistry->Find(OvID(old));
+        Operator *op = doc.AddTool(OvID(old));
+        ASSERT_TRUE(row && op) << old;
+        EXPECT_EQ(row->ID(), OvID(now)) << old;
+        EXPECT_EQ(op->ClassID(), OvID(now)) << old;
     }
 }
 
 TEST_F(LibraryRegistry, APlannedToolConstructsButEveryRequestFailsWithOneLine) {
     OrvaneDoc doc;
-    Operator *blur = doc.AddTool(OvID("Glow"));
-    ASSERT_NE(blur, nullptr);
-    EXPECT_TRUE(blur->IsPlaceholder());
-    EXPECT_EQ(Evaluate(blur->FindMainOutput(), 0.0), nullptr);
+    Operator *glow = doc.AddTool(OvID("Glow"));
+    ASSERT_TRUE(glow && glow->IsPlaceholder());
+    EXPECT_EQ(Evaluate(glow->FindMainOutput(), 0.0), nullptr);
     const auto lines = doc.ConsoleLines();
     ASSERT_EQ(lines.size(), 1u);
     EXPECT_EQ(lines[0].code, ConsoleError);
-    EXPECT_EQ(lines[0].text, blur->Name() + ": the Glow tool is not available yet in this version of Orvane");
+    EXPECT_EQ(lines[0].text, glow->Name() + ": the Glow tool is not available yet in this version of Orvane");
 }
 
 TEST_F(LibraryRegistry, NonToolClassesAreNotAddedToFlows) {
     OrvaneDoc doc;
-    EXPECT_EQ(doc.AddTool(OvID("PNGFormat")), nullptr);
-    EXPECT_EQ(doc.AddTool(OvID("SwitchBase")), nullptr);
-    EXPECT_EQ(doc.AddTool(OvID("VolumeFogLighting")), nullptr);
-    EXPECT_EQ(doc.AddTool(OvID("NoSuchClass")), nullptr);
+    for (const char *id : {"PNGFormat", "SwitchBase", "VolumeFogLighting", "NoSuchClass"})
+        EXPECT_EQ(doc.AddTool(OvID(id)), nullptr) << id;
 }
 
 /// Every planned class stands in the registry with the identity the

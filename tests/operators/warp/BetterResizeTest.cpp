@@ -2,6 +2,8 @@
 // proxy, field, endless sides), pixels against the
 // host's resizer called directly, regions of interest against whole frames,
 // the draft filter, and the controls following one another.
+#include <array>
+
 #include "tests/operators/warp/WarpTestSupport.h"
 
 #include "host/app/Application.h"
@@ -10,20 +12,15 @@
 namespace Orvane::WarpTest::ResizeT {
 namespace {
 
-constexpr int E = DomainEndless;
-
 class ResizeTool : public ::testing::Test {
 protected:
     static void SetUpTestSuite() { LoadOperators(); }
     /// A Resize of `src` to w x h.
-    Operator *Make(Ref<Image> src, int w, int h) {
-        probe = AddProbe(doc, std::move(src));
-        Operator *rsz = AddTool(doc, "BetterResize", probe);
-        SetNumbers(rsz, {{"Width", w}, {"Height", h}});
-        return rsz;
+    Operator *Make(Ref<Image> src, int w, int h, OrvaneDoc *in = nullptr) {
+        OrvaneDoc &d = in ? *in : doc;
+        return AddTool(d, "BetterResize", AddProbe(d, std::move(src)), {{"Width", w}, {"Height", h}});
     }
     OrvaneDoc doc;
-    ProbeSource *probe = nullptr;
 };
 
 TEST_F(ResizeTool, SizesKeptAspectAndTheHeightControl) {
@@ -47,19 +44,19 @@ TEST_F(ResizeTool, SizesKeptAspectAndTheHeightControl) {
     // A write-protected document keeps its height control; the frame keeps its aspect all the same.
     OrvaneDoc locked;
     locked.SetWriteProtected(true);
-    Operator *fixed = AddTool(locked, "BetterResize", AddProbe(locked, PatternImage(64, 36)));
-    SetNumbers(fixed, {{"Width", 32}, {"Height", 20}, {"KeepAspect", 1}});
+    Operator *fixed = Make(PatternImage(64, 36), 32, 20, &locked);
+    SetNumber(fixed, "KeepAspect", 1);
     EXPECT_TRUE(Sized(Render(fixed), 32, 18));
     EXPECT_EQ(Control(fixed, "Height"), 20.0);
 
     // An animated height gets a key at the rendered time (0).
     OrvaneDoc animated;
-    Operator *keyed = AddTool(animated, "BetterResize", AddProbe(animated, PatternImage(64, 36)));
+    Operator *keyed = Make(PatternImage(64, 36), 32, 20, &animated);
     AnimCurve curve;
     curve.SetKey(0.0, MakeRef<Number>(20.0));
     curve.SetKey(10.0, MakeRef<Number>(40.0));
     ASSERT_TRUE(keyed->FindInput("Height")->SetCurve(curve));
-    SetNumbers(keyed, {{"Width", 32}, {"KeepAspect", 1}});
+    SetNumber(keyed, "KeepAspect", 1);
     ASSERT_NE(Render(keyed), nullptr);
     const AnimCurve *now = keyed->FindInput("Height")->Curve();
     ASSERT_TRUE(now && now->Keys().size() == 2u);
@@ -81,8 +78,8 @@ TEST_F(ResizeTool, ProxyAndFieldDivideTheSizeAndTheAttributesKeepTheFullOne) {
     Ref<Image> field = PatternImage(64, 18);
     field->SetScale(1.0, 2.0);
     field->SetAttrsTagList({{ImgField, 1}, {ImgFullHeight, 18}, {ImgFieldOffset, 0.5 / 18}});
-    Operator *frsz = AddTool(fieldDoc, "BetterResize", AddProbe(fieldDoc, field));
-    SetNumbers(frsz, {{"Width", 32}, {"Height", 20}, {"KeepAspect", 1}});
+    Operator *frsz = Make(field, 32, 20, &fieldDoc);
+    SetNumber(frsz, "KeepAspect", 1);
     ASSERT_TRUE(Sized(out = Render(frsz), 32, 9));
     EXPECT_EQ(out->GetAttrL(ImgFullHeight), 9);
     EXPECT_DOUBLE_EQ(out->GetAttrD(ImgFieldOffset), 0.5 / 9);
@@ -96,8 +93,7 @@ TEST_F(ResizeTool, WindowsScaleAndEndlessSidesStay) {
     ASSERT_NE(out, nullptr);
     // x by 2: -16 .. 82; y by 1.5: 4.5 down to 4, 45 up.
     EXPECT_EQ(out->DataWindow(), ImgRectI(-16, 4, 82, 45));
-    // Clipping Mode Frame: the new frame, whatever the source covers; the
-    // pixels both windows hold are the same.
+    // Clipping Mode Frame: the new frame, whatever the source covers; the pixels both windows hold are the same.
     SetID(rsz, "ClippingMode", "ClippingMode_Frame");
     Ref<Image> framed = Render(rsz);
     ASSERT_NE(framed, nullptr);
@@ -108,32 +104,26 @@ TEST_F(ResizeTool, WindowsScaleAndEndlessSidesStay) {
     OrvaneDoc doc2;
     const ImgRectI endless(-E, 3, E, E);
     Ref<Image> open = NewImageTagList({{ImgWidth, 64}, {ImgHeight, 36}, {ImgDataWindow, &endless}});
-    Operator *rsz2 = AddTool(doc2, "BetterResize", AddProbe(doc2, open));
-    SetNumbers(rsz2, {{"Width", 32}, {"Height", 72}});
-    Ref<Image> shape = Shape(rsz2);
-    ASSERT_NE(shape, nullptr);
-    EXPECT_TRUE(shape->IsNoData());
+    Ref<Image> shape = Shape(Make(open, 32, 72, &doc2));
+    ASSERT_TRUE(shape && shape->IsNoData());
     EXPECT_EQ(shape->DataWindow(), ImgRectI(-E, 6, E, E));
 }
 
 TEST_F(ResizeTool, PixelsAreTheHostResizersForEveryFilterAndWindow) {
-    struct Case {
-        int method, window, depth, w, h;
-    };
-    const Case cases[] = {{0, 0, 8, 23, 17}, {1, 0, 8, 23, 17}, {2, 0, 8, 61, 45},  {5, 0, 6, 23, 40},
-                          {8, 0, 7, 17, 11}, {9, 3, 8, 55, 12}, {10, 2, 5, 30, 30}, {3, 0, 8, 80, 60},
-                          {6, 0, 8, 13, 7},  {7, 1, 8, 41, 29}, {4, 0, 8, 40, 30}};
-    for (const Case &c : cases) {
-        SCOPED_TRACE(testing::Message() << "method " << c.method << " window " << c.window << " depth " << c.depth);
+    // Filter and window methods, depth, size.
+    const std::array<int, 5> cases[] = {{0, 0, 8, 23, 17}, {1, 0, 8, 23, 17}, {2, 0, 8, 61, 45},  {5, 0, 6, 23, 40},
+                                        {8, 0, 7, 17, 11}, {9, 3, 8, 55, 12}, {10, 2, 5, 30, 30}, {3, 0, 8, 80, 60},
+                                        {6, 0, 8, 13, 7},  {7, 1, 8, 41, 29}, {4, 0, 8, 40, 30}};
+    for (const auto &[method, window, depth, w, h] : cases) {
+        SCOPED_TRACE(testing::Message() << "method " << method << " window " << window << " depth " << depth);
         OrvaneDoc d;
-        Ref<Image> src = PatternImage(40, 30, c.depth, 7);
-        Operator *rsz = AddTool(d, "BetterResize", AddProbe(d, src));
-        SetNumbers(rsz, {{"Width", c.w}, {"Height", c.h}, {"FilterMethod", c.method}, {"WindowMethod", c.window}});
+        Ref<Image> src = PatternImage(40, 30, depth, 7);
+        Operator *rsz = Make(src, w, h, &d);
+        SetNumbers(rsz, {{"FilterMethod", method}, {"WindowMethod", window}});
         Ref<Image> out = Render(rsz);
-        ASSERT_NE(out, nullptr);
-        EXPECT_EQ(out->Depth(), c.depth);
-        Ref<Image> ref = DirectResize(*src, c.w, c.h, out->DataWindow(),
-                                      {{ResizeFilter, c.method + 1}, {ResizeWindow, c.window + 100}});
+        ASSERT_TRUE(out && out->Depth() == depth);
+        Ref<Image> ref =
+            DirectResize(*src, w, h, out->DataWindow(), {{ResizeFilter, method + 1}, {ResizeWindow, window + 100}});
         ExpectSamePixels(*out, *ref, out->DataWindow().Grown(2, 2));
     }
 }
@@ -143,8 +133,7 @@ TEST_F(ResizeTool, ARegionOfInterestGivesTheWholeFramesPixels) {
         SCOPED_TRACE(method);
         OrvaneDoc d;
         ProbeSource *p = AddProbe(d, PatternImage(50, 40, 8, 3));
-        Operator *rsz = AddTool(d, "BetterResize", p);
-        SetNumbers(rsz, {{"Width", 31}, {"Height", 67}, {"FilterMethod", method}});
+        Operator *rsz = AddTool(d, "BetterResize", p, {{"Width", 31}, {"Height", 67}, {"FilterMethod", method}});
         const ImgRectI roi(20, 50, 31, 67);
         ExpectRegionsMatchWhole(rsz, {ImgRectI(3, 5, 11, 20), roi, ImgRectI(0, 0, 2, 3)});
         EXPECT_EQ(Render(rsz, {.roi = roi})->ValidWindow(), roi);
@@ -162,17 +151,14 @@ TEST_F(ResizeTool, OnlyAQuickRequestWithTheApplicationsSwitchDropsTheFilter) {
     Ref<Image> nearest = DirectResize(*src, 27, 19, frame, {{ResizeFilter, RszNearest}});
     Ref<Image> filtered = DirectResize(*src, 27, 19, frame, {{ResizeFilter, RszCatmullRom}});
 
-    struct Case {
-        bool appSwitch, quick, hiQOnly, dropped;
-    };
-    for (const Case c : {Case{true, true, true, true}, Case{false, true, true, false}, Case{true, false, true, false},
-                         Case{true, true, false, false}}) {
-        SCOPED_TRACE(testing::Message() << c.appSwitch << c.quick << c.hiQOnly);
-        GetApp()->SetAttrsTagList({{AppFastScale, c.appSwitch ? 1 : 0}});
-        SetNumber(rsz, "HiQOnly", c.hiQOnly ? 1 : 0);
-        Ref<Image> out = Render(rsz, {.flags = c.quick ? ReqFlagQuick : 0u});
+    // The application's switch, a quick request, HiQOnly: the filter is dropped only with all three.
+    for (const auto [appSwitch, quick, hiQOnly] : {std::array{1, 1, 1}, {0, 1, 1}, {1, 0, 1}, {1, 1, 0}}) {
+        SCOPED_TRACE(testing::Message() << appSwitch << quick << hiQOnly);
+        GetApp()->SetAttrsTagList({{AppFastScale, appSwitch}});
+        SetNumber(rsz, "HiQOnly", hiQOnly);
+        Ref<Image> out = Render(rsz, {.flags = quick ? ReqFlagQuick : 0u});
         ASSERT_NE(out, nullptr);
-        ExpectSamePixels(*out, c.dropped ? *nearest : *filtered, frame);
+        ExpectSamePixels(*out, appSwitch && quick && hiQOnly ? *nearest : *filtered, frame);
     }
     GetApp()->SetAttrsTagList({{AppFastScale, 0}});
 }

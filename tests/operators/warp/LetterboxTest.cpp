@@ -7,19 +7,14 @@
 namespace Orvane::WarpTest::LetterboxT {
 namespace {
 
-constexpr int E = DomainEndless;
-
 class LetterboxTool : public ::testing::Test {
 protected:
     static void SetUpTestSuite() { LoadOperators(); }
-    Operator *Make(Ref<Image> src, int w, int h, int mode = 0) {
-        probe = AddProbe(doc, std::move(src));
-        Operator *lbx = AddTool(doc, "Letterbox", probe);
-        SetNumbers(lbx, {{"Width", w}, {"Height", h}, {"Mode", mode}});
-        return lbx;
+    Operator *Make(Ref<Image> src, int mode = 0, OrvaneDoc *in = nullptr) {
+        OrvaneDoc &d = in ? *in : doc;
+        return AddTool(d, "Letterbox", AddProbe(d, std::move(src)), {{"Width", 100}, {"Height", 100}, {"Mode", mode}});
     }
     OrvaneDoc doc;
-    ProbeSource *probe = nullptr;
 };
 
 struct Placement {
@@ -53,15 +48,7 @@ TEST_F(LetterboxTool, ModesPlaceAndPanTheFrameAsWorkedOutByHand) {
     const Case cases[] = {
         // 200 x 100 into 100 x 100: sh = 100 x (100 x 1 / 1) / (200 x 1) = 50, placed 25 up.
         {"wide between bars", 200, 100, 0, 0.5, 0.5, 1.0, {0, 25, 100, 75}, {0.5, 0.5, 0, 25, D, C}},
-        {"no excess: the centre changes nothing",
-         200,
-         100,
-         0,
-         0.2,
-         0.9,
-         1.0,
-         {0, 25, 100, 75},
-         {0.5, 0.5, 0, 25, D, C}},
+        {"no excess: no pan", 200, 100, 0, 0.2, 0.9, 1.0, {0, 25, 100, 75}, {0.5, 0.5, 0, 25, D, C}},
         // 100 x 200: sh = 200, excess 50 on each side; oy = clamp((0.5 - cy) x 200, -50, 50)
         // and the source's origin lands at (100 - 200) / 2 + oy.
         {"tall, centred", 100, 200, 0, 0.5, 0.5, 1.0, {0, -50, 100, 150}, {1, 1, 0, -50, D, C}},
@@ -79,14 +66,11 @@ TEST_F(LetterboxTool, ModesPlaceAndPanTheFrameAsWorkedOutByHand) {
         SCOPED_TRACE(c.what);
         OrvaneDoc d;
         Ref<Image> src = PatternImage(c.w, c.h, 8, c.w + c.h);
-        Operator *lbx = AddTool(d, "Letterbox", AddProbe(d, src));
-        SetNumbers(lbx, {{"Width", 100}, {"Height", 100}, {"Mode", c.mode}});
+        Operator *lbx = Make(src, c.mode, &d);
         SetPoint(lbx, "Center", c.cx, c.cy);
         SetPoint(lbx, "PixelAspect", c.aspectX, 1.0);
         Ref<Image> out = Render(lbx);
-        ASSERT_NE(out, nullptr);
-        EXPECT_EQ(out->Width(), 100);
-        EXPECT_EQ(out->Height(), 100);
+        ASSERT_TRUE(Sized(out, 100, 100));
         EXPECT_DOUBLE_EQ(out->XScale(), c.aspectX);
         EXPECT_TRUE(out->IsCanvasColorClear());
         EXPECT_EQ(out->DataWindow(), c.window);
@@ -103,18 +87,16 @@ TEST_F(LetterboxTool, FramingMakesACanvasRealAndClearsWhatLiesBeyond) {
     const ImgRectI dw(20, 10, 180, 90);
     const FltPixel red{1.f, 0.f, 0.f, 1.f};
     Ref<Image> src = full->CopyOfImageTagList({{ImgDataWindow, &dw}, {ImgCanvasColor, &red}});
-    Operator *lbx = Make(src, 100, 100);
+    Operator *lbx = Make(src);
     Ref<Image> out = Render(lbx);
     ASSERT_NE(out, nullptr);
     EXPECT_TRUE(out->IsCanvasColorClear());
     EXPECT_EQ(out->DataWindow(), ImgRectI(0, 25, 100, 75)); // the whole frame, red where the source had canvas
     // Made by hand: the frame with red outside the window, clear beyond.
     const ImgRectI frame = src->Frame();
-    const FltPixel clear{};
-    Ref<Image> real = NewImageTagList({{ImgLikeImage, src.Get()}, {ImgDataWindow, &frame}, {ImgCanvasColor, &clear}});
-    ASSERT_TRUE(real->AllocScanLineData());
-    for (int y = 0; y < 100; ++y)
-        for (int x = 0; x < 200; ++x) real->PutFlt(x, y, dw.Contains(x, y) ? full->GetFlt(x, y) : red);
+    Ref<Image> real = FlatImage(200, 100, DepthRGBAFlt32, red);
+    for (int y = dw.y0; y < dw.y1; ++y)
+        for (int x = dw.x0; x < dw.x1; ++x) real->PutFlt(x, y, full->GetFlt(x, y));
     const Placement p{0.5, 0.5, 0.0, 25.0, EdgeDuplicate, EdgeCanvas};
     ExpectSamePixels(*out, *Reference(*real, 100, 100, out->DataWindow(), p, frame), ImgRectI(-2, -2, 102, 102));
 
@@ -134,11 +116,9 @@ TEST_F(LetterboxTool, ProxyFieldsAndTheFrameFormat) {
     // A half-size proxy of 200 x 100 into 100 x 100 at proxy 2: 50 x 50, sh = 25.
     Ref<Image> src = PatternImage(100, 50, 8, 6);
     src->SetAttrsTagList({{ImgFullWidth, 200}, {ImgFullHeight, 100}});
-    Operator *lbx = Make(src, 100, 100);
+    Operator *lbx = Make(src);
     Ref<Image> out = Render(lbx, {.proxy = 2});
-    ASSERT_NE(out, nullptr);
-    EXPECT_EQ(out->Width(), 50);
-    EXPECT_EQ(out->Height(), 50);
+    ASSERT_TRUE(Sized(out, 50, 50));
     EXPECT_EQ(out->DataWindow(), ImgRectI(0, 12, 50, 38)); // 12.5 .. 37.5 outward
     EXPECT_EQ(out->GetAttrL(ImgFullWidth), 100);
     EXPECT_EQ(out->GetAttrL(ImgFullHeight), 100);
@@ -149,11 +129,7 @@ TEST_F(LetterboxTool, ProxyFieldsAndTheFrameFormat) {
     Ref<Image> field = PatternImage(200, 50, 8, 7);
     field->SetScale(1.0, 2.0);
     field->SetAttrsTagList({{ImgField, 0}});
-    Operator *flbx = AddTool(d, "Letterbox", AddProbe(d, field));
-    SetNumbers(flbx, {{"Width", 100}, {"Height", 100}});
-    out = Render(flbx);
-    ASSERT_NE(out, nullptr);
-    EXPECT_EQ(out->Height(), 50);
+    ASSERT_TRUE(Sized(out = Render(Make(field, 0, &d)), 100, 50));
     EXPECT_DOUBLE_EQ(out->YScale(), 2.0);
     EXPECT_EQ(out->DataWindow(), ImgRectI(0, 12, 100, 38));
 
@@ -162,18 +138,15 @@ TEST_F(LetterboxTool, ProxyFieldsAndTheFrameFormat) {
     doc.SetPref(PREF_FFHeight, 90);
     SetNumber(lbx, "UseFrameFormatSettings", 1);
     EXPECT_EQ(Control(lbx, "Width"), 160.0);
-    out = Render(lbx);
-    ASSERT_NE(out, nullptr);
-    EXPECT_EQ(out->Width(), 160);
-    EXPECT_EQ(out->Height(), 90);
+    EXPECT_TRUE(Sized(Render(lbx), 160, 90));
 }
 
 TEST_F(LetterboxTool, ARegionOfInterestGivesTheWholeFramesPixels) {
     for (int mode : {0, 1}) {
         SCOPED_TRACE(mode);
         OrvaneDoc d;
-        Operator *lbx = AddTool(d, "Letterbox", AddProbe(d, PatternImage(90, 40, 8, 8)));
-        SetNumbers(lbx, {{"Width", 64}, {"Height", 48}, {"Mode", mode}, {"FilterMethod", 8}});
+        Operator *lbx = Make(PatternImage(90, 40, 8, 8), mode, &d);
+        SetNumbers(lbx, {{"Width", 64}, {"Height", 48}, {"FilterMethod", 8}});
         SetPoint(lbx, "Center", 0.3, 0.3);
         ExpectRegionsMatchWhole(lbx, {ImgRectI(0, 0, 9, 48), ImgRectI(30, 20, 40, 30), ImgRectI(60, 40, 64, 48)});
     }

@@ -1,6 +1,8 @@
 // Scale: the parity rule, fields, proxies, the window's reach and the lock
 // worked out by hand, a size of zero, pixels against the host's resizer
 // called directly, and regions of interest against whole frames.
+#include <tuple>
+
 #include "tests/operators/warp/WarpTestSupport.h"
 
 namespace Orvane::WarpTest::ScaleT {
@@ -13,20 +15,14 @@ protected:
 
 TEST_F(ScaleTool, TheSizeKeepsItsParity) {
     // x = w / 2 x s; odd w: ceil(x - 1/2) + 1/2, even w: ceil(x); side = truncate(2x + 1/2).
-    struct Case {
-        int w;
-        double s;
-        int expected;
-    };
-    const Case cases[] = {{5, 1.0, 5},  {5, 0.5, 3}, {6, 0.5, 4},      {7, 0.5, 5},      {4, 1.3, 6}, {9, 2.0, 19},
-                          {8, 0.25, 2}, {1, 0.1, 1}, {1920, 0.5, 960}, {1921, 0.5, 961}, {3, 3.0, 9}, {2, 0.01, 2}};
-    for (const Case &c : cases) {
+    const std::tuple<int, double, int> cases[] = {{5, 1.0, 5},      {5, 0.5, 3},      {6, 0.5, 4},  {7, 0.5, 5},
+                                                  {4, 1.3, 6},      {9, 2.0, 19},     {8, 0.25, 2}, {1, 0.1, 1},
+                                                  {1920, 0.5, 960}, {1921, 0.5, 961}, {3, 3.0, 9},  {2, 0.01, 2}};
+    for (const auto &[w, s, expected] : cases) {
         OrvaneDoc d;
-        Operator *scl = AddTool(d, "Scale", AddProbe(d, NewImageTagList({{ImgWidth, c.w}, {ImgHeight, 10}})));
-        SetNumber(scl, "XSize", c.s);
-        Ref<Image> shape = Shape(scl);
-        ASSERT_NE(shape, nullptr);
-        EXPECT_EQ(shape->Width(), c.expected) << c.w << " at " << c.s;
+        Ref<Image> shape =
+            Shape(AddTool(d, "Scale", AddProbe(d, NewImageTagList({{ImgWidth, w}, {ImgHeight, 10}})), {{"XSize", s}}));
+        EXPECT_EQ(shape ? shape->Width() : -1, expected) << w << " at " << s;
     }
 }
 
@@ -60,13 +56,10 @@ TEST_F(ScaleTool, FieldsProxiesReachAndLockWorkedOutByHand) {
     for (const Case &c : cases) {
         SCOPED_TRACE(c.what);
         OrvaneDoc d;
-        Operator *scl = AddTool(d, "Scale", AddProbe(d, c.src));
-        SetNumbers(scl, c.controls);
+        Operator *scl = AddTool(d, "Scale", AddProbe(d, c.src), c.controls);
         EXPECT_EQ(scl->FindInput("YSize")->IsVisible(), Control(scl, "LockXY") == 0.0);
         Ref<Image> shape = Shape(scl, {.proxy = c.proxy});
-        ASSERT_NE(shape, nullptr);
-        EXPECT_EQ(shape->Width(), c.w);
-        EXPECT_EQ(shape->Height(), c.h);
+        ASSERT_TRUE(Sized(shape, c.w, c.h));
         EXPECT_TRUE(c.window.IsNull() || shape->DataWindow() == c.window);
         if (c.proxy > 1) {
             EXPECT_EQ(shape->GetAttrL(ImgFullWidth), 55);
@@ -80,8 +73,7 @@ TEST_F(ScaleTool, ASizeOfZeroGivesZerosAndAsksForNothing) {
     Ref<Image> src = PatternImage(40, 30);
     src->SetCanvasColor(FltPixel{0.5f, 0.5f, 0.5f, 1.f});
     ProbeSource *probe = AddProbe(doc, src);
-    Operator *scl = AddTool(doc, "Scale", probe);
-    SetNumbers(scl, {{"LockXY", 0}, {"XSize", 0.0}, {"YSize", 1.0}});
+    Operator *scl = AddTool(doc, "Scale", probe, {{"LockXY", 0}, {"XSize", 0.0}, {"YSize", 1.0}});
     Ref<Image> out = Render(scl, {.roi = ImgRectI(0, 0, 1, 30)});
     ASSERT_NE(out, nullptr);
     EXPECT_TRUE(out->DataWindow().IsNull());
@@ -98,27 +90,24 @@ TEST_F(ScaleTool, ASizeOfZeroGivesZerosAndAsksForNothing) {
 }
 
 TEST_F(ScaleTool, PixelsAreTheHostResizersAtTheExactFactors) {
-    struct Case {
-        double x, y;
-        int edges, method, depth;
-    };
-    const Case cases[] = {{0.5, 0.5, 0, 2, 8},  {1.7, 1.7, 0, 5, 8}, {0.8, 1.3, 1, 8, 8},
-                          {0.37, 0.6, 0, 1, 6}, {2.0, 0.5, 1, 0, 5}, {1.0, 1.0, 0, 4, 7}};
-    for (const Case &c : cases) {
-        SCOPED_TRACE(testing::Message() << c.x << " x " << c.y << " edges " << c.edges << " method " << c.method);
+    // x and y factors, Duplicate edges (or Canvas), filter method, depth.
+    const std::tuple<double, double, bool, int, int> cases[] = {{0.5, 0.5, false, 2, 8}, {1.7, 1.7, false, 5, 8},
+                                                                {0.8, 1.3, true, 8, 8},  {0.37, 0.6, false, 1, 6},
+                                                                {2.0, 0.5, true, 0, 5},  {1.0, 1.0, false, 4, 7}};
+    for (const auto &[x, y, duplicate, method, depth] : cases) {
+        SCOPED_TRACE(testing::Message() << x << " x " << y << " edges " << duplicate << " method " << method);
         OrvaneDoc d;
-        Ref<Image> src = PatternImage(37, 29, c.depth, 11);
-        Operator *scl = AddTool(d, "Scale", AddProbe(d, src));
-        SetNumbers(scl,
-                   {{"LockXY", 0}, {"XSize", c.x}, {"YSize", c.y}, {"Edges", c.edges}, {"FilterMethod", c.method}});
-        Ref<Image> out = Render(scl);
+        Ref<Image> src = PatternImage(37, 29, depth, 11);
+        Ref<Image> out = Render(
+            AddTool(d, "Scale", AddProbe(d, src),
+                    {{"LockXY", 0}, {"XSize", x}, {"YSize", y}, {"Edges", duplicate}, {"FilterMethod", method}}));
         ASSERT_NE(out, nullptr);
-        const int edges = c.edges ? EdgeDuplicate : EdgeCanvas;
+        const int edges = duplicate ? EdgeDuplicate : EdgeCanvas;
         Ref<Image> ref = DirectResize(*src, out->Width(), out->Height(), out->DataWindow(),
-                                      {{ResizeFilter, c.method + 1},
+                                      {{ResizeFilter, method + 1},
                                        {ResizeWindow, RszWindowHanning},
-                                       {ResizeXScale, c.x},
-                                       {ResizeYScale, c.y},
+                                       {ResizeXScale, x},
+                                       {ResizeYScale, y},
                                        {ResizeXOffset, 0.0},
                                        {ResizeYOffset, 0.0},
                                        {ResizeXEdges, edges},
@@ -131,8 +120,8 @@ TEST_F(ScaleTool, ARegionOfInterestGivesTheWholeFramesPixels) {
     for (double s : {0.45, 1.0, 2.3}) {
         SCOPED_TRACE(s);
         OrvaneDoc d;
-        Operator *scl = AddTool(d, "Scale", AddProbe(d, PatternImage(50, 40, 8, 3)));
-        SetNumbers(scl, {{"XSize", s}, {"FilterMethod", 8}});
+        Operator *scl =
+            AddTool(d, "Scale", AddProbe(d, PatternImage(50, 40, 8, 3)), {{"XSize", s}, {"FilterMethod", 8}});
         const ImgRectI dw = Shape(scl)->DataWindow();
         ExpectRegionsMatchWhole(scl, {ImgRectI(dw.x0, dw.y0, dw.x0 + 5, dw.y0 + 4), ImgRectI(7, 9, 13, 30),
                                       ImgRectI(dw.x1 - 3, dw.y1 - 8, dw.x1, dw.y1)});

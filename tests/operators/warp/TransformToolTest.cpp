@@ -35,9 +35,7 @@ protected:
     /// A Transform of `img` (default: the picture) with these controls.
     Operator *Make(const std::vector<std::pair<const char *, double>> &controls, Ref<Image> img = nullptr) {
         src = AddProbe(doc, img ? img : pic, "Src" + std::to_string(++sources));
-        Operator *xf = AddTool(doc, "Transform", src);
-        SetNumbers(xf, controls);
-        return xf;
+        return AddTool(doc, "Transform", src, controls);
     }
     OrvaneDoc doc;
     Ref<Image> pic = Picture();
@@ -58,14 +56,11 @@ TEST_F(TransformTool, ConsumersGetATransformOrPixelsAsTheyDeclare) {
     Operator *xf = Make({{"Angle", 30}});
     auto *takes = AddValueProbe(doc, xf, true);
     auto *images = AddValueProbe(doc, xf, false);
-    ASSERT_TRUE(Render(takes) && Render(images));
-    ASSERT_EQ(takes->seen.size(), 1u);
-    ASSERT_EQ(images->seen.size(), 1u);
+    ASSERT_TRUE(Render(takes) && Render(images) && takes->seen.size() == 1 && images->seen.size() == 1);
     auto *tm = dynamic_cast<TransformMatrix *>(takes->seen[0].Get());
-    ASSERT_NE(tm, nullptr);
-    EXPECT_EQ(tm->Source(), pic.Get());
     auto *img = dynamic_cast<Image *>(images->seen[0].Get());
-    ASSERT_NE(img, nullptr);
+    ASSERT_TRUE(tm && img);
+    EXPECT_EQ(tm->Source(), pic.Get());
     // The pixels are the transform's, and the domain the engine reported is
     // the transform's output window in the output frame.
     ExpectSamePixels(*img, *tm->ApplyTransformTagList({}), ImgRectI(-5, -5, 53, 45));
@@ -76,17 +71,14 @@ TEST_F(TransformTool, ConsumersGetATransformOrPixelsAsTheyDeclare) {
     Ref<Image> outside = Render(xf);
     ASSERT_TRUE(outside);
     ExpectSamePixels(*outside, *img, ImgRectI(-5, -5, 53, 45));
-
     // With nothing to do the input image itself is handed on.
     SetNumber(xf, "Angle", 0);
-    Ref<Image> same = Render(xf);
-    EXPECT_EQ(same.Get(), pic.Get());
+    EXPECT_EQ(Render(xf).Get(), pic.Get());
 }
 
 TEST_F(TransformTool, AChainResamplesOnceAndEqualsOneTransform) {
     Operator *first = Make({{"Angle", 20}, {"Size", 1.2}, {"FilterMethod", 5}}); // Catmull-Rom
-    Operator *second = AddTool(doc, "Transform", first);
-    SetNumbers(second, {{"Angle", 15}, {"Size", 1.1}, {"FilterMethod", 5}});
+    Operator *second = AddTool(doc, "Transform", first, {{"Angle", 15}, {"Size", 1.1}, {"FilterMethod", 5}});
     SetPoint(second, "Center", 0.55, 0.45);
 
     long before = TransformMatrix::ResampleCount();
@@ -108,15 +100,13 @@ TEST_F(TransformTool, AChainResamplesOnceAndEqualsOneTransform) {
             worst = std::max(worst, std::fabs(double(chained->GetFlt(x, y).G) - once->GetFlt(x, y).G));
     EXPECT_LT(worst, 1e-5); // the two matrices differ only in rounding
 
-    // Flattening the first makes its pixels at once: two resamplings, and
-    // its output is a plain image.
+    // Flattening the first makes its pixels at once: two resamplings, and its output is a plain image.
     SetNumber(first, "FlattenTransform", 1);
     auto *probe = AddValueProbe(doc, first, true);
     before = TransformMatrix::ResampleCount();
     ASSERT_TRUE(Render(second));
     EXPECT_EQ(TransformMatrix::ResampleCount() - before, 2);
-    ASSERT_TRUE(Render(probe));
-    ASSERT_FALSE(probe->seen.empty());
+    ASSERT_TRUE(Render(probe) && !probe->seen.empty());
     EXPECT_NE(dynamic_cast<Image *>(probe->seen.back().Get()), nullptr);
 }
 
@@ -124,9 +114,10 @@ TEST_F(TransformTool, ARegionNeedsOnlyWhatItReads) {
     Ref<Image> big = Picture(64, 64);
     for (int edges : {0, 2}) {
         SCOPED_TRACE(edges);
-        Operator *a = Make({{"Angle", 40}, {"Size", 0.7}, {"FilterMethod", 8}, {"Edges", edges}}, big); // Lanczos
-        Operator *b = AddTool(doc, "Transform", a);
-        SetNumbers(b, {{"Angle", -25}, {"Size", 1.6}, {"FilterMethod", 9}, {"Edges", edges}}); // Sinc, the widest
+        // Lanczos, then Sinc (the widest).
+        Operator *a = Make({{"Angle", 40}, {"Size", 0.7}, {"FilterMethod", 8}, {"Edges", edges}}, big);
+        Operator *b =
+            AddTool(doc, "Transform", a, {{"Angle", -25}, {"Size", 1.6}, {"FilterMethod", 9}, {"Edges", edges}});
         SetPoint(b, "Center", 0.6, 0.52);
         const ImgRectI region(20, 25, 36, 33);
         Ref<Image> whole = Render(b);
@@ -137,11 +128,10 @@ TEST_F(TransformTool, ARegionNeedsOnlyWhatItReads) {
         ExpectSamePixels(*part, *whole, region);
         ASSERT_EQ(src->asked.size(), 1u);
         if (edges == EdgeCanvas) {
+            // A 16 x 8 region reads about 48 x 48 of the source through the two steps and the widest filter's reach.
             ASSERT_TRUE(src->asked[0]);
-            // A 16 x 8 region reads about 48 x 48 of the source through the
-            // two steps and the widest filter's reach.
-            const ImgRectI r = src->asked[0]->rect;
-            EXPECT_TRUE(r.Width() < 64 && r.Height() < 64) << r.x0 << " " << r.y0 << " " << r.x1 << " " << r.y1;
+            EXPECT_TRUE(src->asked[0]->rect.Width() < 64 && src->asked[0]->rect.Height() < 64)
+                << RectText(src->asked[0]->rect);
         } else {
             EXPECT_FALSE(src->asked[0]); // folding edges read the whole frame
         }
@@ -168,8 +158,7 @@ TEST_F(TransformTool, EdgesFillTheFrameAndInvertUndoes) {
     // identity: the source comes through untouched.
     SetNumbers(xf, {{"Edges", 0}, {"Angle", 33}});
     SetPoint(xf, "Pivot", 0.3, 0.6);
-    Operator *undo = AddTool(doc, "Transform", xf);
-    SetNumbers(undo, {{"Size", 0.5}, {"Angle", 33}, {"InvertTransform", 1}});
+    Operator *undo = AddTool(doc, "Transform", xf, {{"Size", 0.5}, {"Angle", 33}, {"InvertTransform", 1}});
     SetPoint(undo, "Pivot", 0.3, 0.6);
     const long before = TransformMatrix::ResampleCount();
     Ref<Image> back = Render(undo);

@@ -12,40 +12,31 @@
 #include "host/core/Tags.h"
 #include "host/flow/DataTypes.h"
 #include "host/flow/Engine.h"
-#include "host/flow/Operator.h"
-#include "host/flow/OrvaneDoc.h"
 #include "host/flow/RenderTask.h"
 #include "host/flow/Request.h"
-#include "host/image/Image.h"
 #include "host/image/NewImage.h"
 #include "host/image/ResizeFilters.h"
 #include "tests/support/TestSupport.h"
 
 namespace Orvane::WarpTest {
 
-using Orvane::Test::AddValueProbe;
-using Orvane::Test::LoadOperators;
-using Orvane::Test::PatternImage;
-using Orvane::Test::SetID;
-using Orvane::Test::SetNumber;
-using Orvane::Test::SetNumbers;
-using Orvane::Test::SetPoint;
-using ProbeSource = Orvane::Test::ImageSourceTool;
+using namespace Orvane::Test;
+using ProbeSource = ImageSourceTool;
+constexpr int E = DomainEndless;
 
 /// A source of `img` that cuts it to each pixel request's region and notes the region.
 inline ProbeSource *AddProbe(OrvaneDoc &doc, Ref<Image> img, const std::string &name = "Src") {
-    ProbeSource *probe = Orvane::Test::AddImageSource(doc, name, std::move(img));
+    ProbeSource *probe = AddImageSource(doc, name, std::move(img));
     if (probe) probe->cutToRegion = true;
     return probe;
 }
 
-/// A tool of `cls` in `doc` reading `src`.
-inline Operator *AddTool(OrvaneDoc &doc, const char *cls, Operator *src) {
+/// A tool of `cls` in `doc` reading `src` (with these number controls).
+inline Operator *AddTool(OrvaneDoc &doc, const char *cls, Operator *src,
+                         const std::vector<std::pair<const char *, double>> &controls = {}) {
     Operator *op = doc.AddTool(OvID(cls));
-    EXPECT_NE(op, nullptr) << cls;
-    if (op && src) {
-        EXPECT_TRUE(op->FindInput("Input")->ConnectTo(src->FindMainOutput()));
-    }
+    EXPECT_TRUE(op && (!src || op->FindInput("Input")->ConnectTo(src->FindMainOutput()))) << cls;
+    if (op) SetNumbers(op, controls);
     return op;
 }
 
@@ -73,8 +64,7 @@ inline Ref<Image> Render(Operator *op, const RenderOptions &o = {}) {
     opt.task = &task;
     opt.useCache = o.useCache;
     if (o.roi) opt.roi = ImageDomain(*o.roi);
-    Ref<Parameter> p = Evaluate(op->FindMainOutput(), 0.0, opt);
-    return Ref<Image>(dynamic_cast<Image *>(p.Get()));
+    return Ref<Image>(dynamic_cast<Image *>(Evaluate(op->FindMainOutput(), 0.0, opt).Get()));
 }
 
 /// The image exists and has a frame of w x h.
