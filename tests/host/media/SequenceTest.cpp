@@ -4,9 +4,9 @@
 
 #include <filesystem>
 #include <fstream>
-#include <unistd.h>
 
 #include "host/media/Sequence.h"
+#include "tests/support/TestSupport.h"
 
 namespace Orvane::sequencetest {
 namespace {
@@ -134,19 +134,16 @@ TEST(SequenceName, MatchingRespectsPaddingPrefixAndSuffix) {
 }
 
 TEST(SequenceScan, FindsTheFramesAndTheGapsInAFolder) {
-    const std::filesystem::path dir =
-        std::filesystem::temp_directory_path() / ("orvane-seq-" + std::to_string(getpid()));
-    std::filesystem::create_directories(dir);
+    const Orvane::Test::TempDir dir;
     for (const char *name : {"a.0003.exr", "a.0004.exr", "a.0007.exr", "a.0010.exr", "a.-0001.exr", "a.004.exr",
                              "b.0005.exr", "a.0005.png"})
         std::ofstream(dir / name) << "x";
     std::filesystem::create_directories(dir / "a.0006.exr"); // a folder is no frame
-    const SequenceScan scan = ScanSequence(ParseSequenceName((dir / "a.0003.exr").string()));
+    const SequenceScan scan = ScanSequence(ParseSequenceName(dir / "a.0003.exr"));
     EXPECT_EQ(scan.frames, (std::vector<int64_t>{-1, 3, 4, 7, 10}));
     const std::vector<std::pair<int64_t, int64_t>> gaps{{0, 2}, {5, 6}, {8, 9}};
     EXPECT_EQ(scan.gaps, gaps);
-    EXPECT_TRUE(ScanSequence(ParseSequenceName((dir / "nothing.0001.exr").string())).frames.empty());
-    std::filesystem::remove_all(dir);
+    EXPECT_TRUE(ScanSequence(ParseSequenceName(dir / "nothing.0001.exr")).frames.empty());
 }
 
 } // namespace
