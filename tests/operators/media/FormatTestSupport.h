@@ -6,6 +6,7 @@
 // files independently.
 #include <gtest/gtest.h>
 
+#include <algorithm>
 #include <array>
 #include <atomic>
 #include <cmath>
@@ -60,7 +61,6 @@ inline bool SaveTo(IOClass *io, const char *id, Image *img, const Options &optio
     OrvaneDoc doc;
     Operator *tool = Orvane::Test::AddImageSource(doc, "Saver", Ref<Image>(img));
     Ref<ImageFormat> f = MakeFormat(id);
-    if (!tool || !f) return false;
     f->AddSaveInputs(tool);
     Request req(tool, nullptr, 0.0, 0, nullptr);
     for (const auto &[name, value] : options) {
@@ -76,17 +76,12 @@ inline bool SaveTo(IOClass *io, const char *id, Image *img, const Options &optio
     return ok;
 }
 
-/// SaveTo memory: the file, or empty on failure with the reason in `error`
-/// (a test failure without it).
-inline Bytes SaveWith(const char *id, Image *img, const Options &options, std::string *error = nullptr) {
+/// SaveTo memory: the file (empty, and a test failure, when it fails).
+inline Bytes SaveWith(const char *id, Image *img, const Options &options) {
     MemoryIO io;
-    std::string why;
-    if (SaveTo(&io, id, img, options, why)) return io.Data();
-    if (error)
-        *error = why;
-    else
-        ADD_FAILURE() << id << " save: " << why;
-    return {};
+    std::string error;
+    EXPECT_TRUE(SaveTo(&io, id, img, options, error)) << id << " save: " << error;
+    return io.Data();
 }
 
 struct LoadResult {
@@ -96,19 +91,15 @@ struct LoadResult {
 };
 
 /// Reads one frame of `data`; `prepare` may set the proxy scale, the abort
-/// word or attributes before the header is read.
+/// word or attributes before the header is read. A failure must say why.
 template <class Prepare> LoadResult Load(const char *id, const Bytes &data, const TagList &tags, Prepare prepare) {
     LoadResult r;
     Ref<ImageFormat> f = MakeFormat(id);
-    if (!f) return r;
     prepare(*f);
     MemoryIO io(data);
     r.headerOk = f->LoadHeader(&io);
-    Ref<Image> img;
-    if (r.headerOk && f->LoadFrameTagList(0, img, tags)) {
-        r.image = img;
-        return r;
-    }
+    if (r.headerOk && f->LoadFrameTagList(0, r.image, tags)) return r;
+    r.image = nullptr;
     r.error = f->Error();
     EXPECT_FALSE(r.error.empty()) << id << ": a failure says why";
     return r;

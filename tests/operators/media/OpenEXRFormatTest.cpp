@@ -45,11 +45,6 @@ void ExpectSame(const Image &want, const Image &got, float tolerance = 0.f) {
         }
 }
 
-Ref<Image> LoadWith(const Bytes &data, const Options &options, const Choices &choices = {}, int eye = 0,
-                    std::string *error = nullptr) {
-    return FmtTest::LoadWith(kId, data, options, choices, eye, error);
-}
-
 // ---- files made here, byte by byte, in the published layout ----
 
 struct Channel {
@@ -214,24 +209,19 @@ TEST_F(OpenEXRFormatTest, RoundTripsEveryCompressionAndWindow) {
 
 TEST_F(OpenEXRFormatTest, SavesFromEveryDepthWithEveryDepthChoice) {
     if (!HaveProgram("exrheader")) GTEST_SKIP() << "exrheader is not installed";
-    // Image depth by Depth choice (Auto, float16, float32): the file's colour
-    // type (auxiliary channels are float but for float16), as exrheader reads it.
-    struct Row {
-        int depth;
-        const char *colour[3];
-    };
-    const Row rows[] = {
-        {DepthAInt8, {"16-bit", "16-bit", "32-bit"}},     {DepthAInt16, {"32-bit", "16-bit", "32-bit"}},
-        {DepthAFlt16, {"16-bit", "16-bit", "32-bit"}},    {DepthAFlt32, {"32-bit", "16-bit", "32-bit"}},
-        {DepthRGBAInt8, {"16-bit", "16-bit", "32-bit"}},  {DepthRGBAInt16, {"32-bit", "16-bit", "32-bit"}},
-        {DepthRGBAFlt16, {"16-bit", "16-bit", "32-bit"}}, {DepthRGBAFlt32, {"32-bit", "16-bit", "32-bit"}}};
+    // Every image depth by Depth choice (Auto, float16, float32): the file's
+    // colour is half for float16, and for Auto from int8 and float16 images;
+    // auxiliary channels are float but for float16; as exrheader reads them.
     TempDir dir;
     const ImgRectI window(2, 1, 9, 5); // 11 x 6 frame: file lines 1..4, columns 2..8
-    for (const Row &row : rows)
+    for (int depth = DepthAInt8; depth <= DepthRGBAFlt32; ++depth)
         for (int mode = 0; mode < 3; ++mode) {
-            SCOPED_TRACE(testing::Message() << "depth " << row.depth << " mode " << mode);
+            SCOPED_TRACE(testing::Message() << "depth " << depth << " mode " << mode);
+            const bool eightOrHalf =
+                depth == DepthAInt8 || depth == DepthAFlt16 || depth == DepthRGBAInt8 || depth == DepthRGBAFlt16;
+            const bool half = mode == 1 || (mode == 0 && eightOrHalf);
             Ref<Image> src =
-                NewImageTagList({{ImgWidth, 11}, {ImgHeight, 6}, {ImgDepth, row.depth}, {ImgDataWindow, &window}});
+                NewImageTagList({{ImgWidth, 11}, {ImgHeight, 6}, {ImgDepth, depth}, {ImgDataWindow, &window}});
             ASSERT_TRUE(src && src->AllocScanLineData() && src->AddAuxChannel(AuxChannelKind::Z));
             src->SetScale(2.0, 1.0);
             for (int y = window.y0; y < window.y1; ++y)
@@ -244,8 +234,7 @@ TEST_F(OpenEXRFormatTest, SavesFromEveryDepthWithEveryDepthChoice) {
             ASSERT_FALSE(b.empty());
             WriteFile(dir / "d.exr", b);
             const std::string header = CaptureText("exrheader '" + dir / "d.exr" + "'");
-            const bool half = std::string(row.colour[mode]) == "16-bit";
-            EXPECT_NE(header.find(std::string("R, ") + row.colour[mode] + " floating-point"), std::string::npos)
+            EXPECT_NE(header.find(std::string("R, ") + (half ? "16" : "32") + "-bit floating-point"), std::string::npos)
                 << header;
             EXPECT_NE(header.find(std::string("Z, ") + (mode == 1 ? "16-bit" : "32-bit")), std::string::npos) << header;
             EXPECT_NE(header.find("dataWindow (type box2i): (2 1) - (8 4)"), std::string::npos) << header;
@@ -425,19 +414,14 @@ TEST_F(OpenEXRFormatTest, TiledMultiPartMultiViewAndLayeredFilesReadWhatIsChosen
                          dir / "v.exr" + "'"));
     // Two colour layers, one with lower-case names, no alpha, and a channel no
     // slot reads; pixel x of layer channel c holds x + the layer's and the channel's offsets.
-    const Bytes layered = HandMade(ImgRectI(0, 0, 3, 1), ImgRectI(0, 0, 3, 1),
-                                   {{"beauty.r", 1},
-                                    {"beauty.g", 1},
-                                    {"beauty.b", 1},
-                                    {"diffuse.R", 1},
-                                    {"diffuse.G", 1},
-                                    {"diffuse.B", 1},
-                                    {"mask", 1}},
-                                   [](int x, int, const std::string &c) {
-                                       const char last =
-                                           static_cast<char>(std::toupper(static_cast<unsigned char>(c.back())));
-                                       return (c[0] == 'd' ? 10.f : 0.f) + x + ChannelIndex(std::string(1, last)) / 4.f;
-                                   });
+    std::vector<Channel> names;
+    for (const char *n : {"beauty.r", "beauty.g", "beauty.b", "diffuse.R", "diffuse.G", "diffuse.B", "mask"})
+        names.push_back({n, 1});
+    const Bytes layered =
+        HandMade(ImgRectI(0, 0, 3, 1), ImgRectI(0, 0, 3, 1), names, [](int x, int, const std::string &c) {
+            const char last = static_cast<char>(std::toupper(static_cast<unsigned char>(c.back())));
+            return (c[0] == 'd' ? 10.f : 0.f) + x + ChannelIndex(std::string(1, last)) / 4.f;
+        });
     const std::map<std::string, Bytes> files = {{"tiled", ReadFile(dir / "t.exr")},
                                                 {"parts", ReadFile(dir / "p.exr")},
                                                 {"views", ReadFile(dir / "v.exr")},
@@ -466,7 +450,7 @@ TEST_F(OpenEXRFormatTest, TiledMultiPartMultiViewAndLayeredFilesReadWhatIsChosen
         SCOPED_TRACE(testing::Message() << row.file << " eye " << row.eye << " "
                                         << (row.choices.empty() ? "" : row.choices[0].second));
         std::string error;
-        Ref<Image> img = LoadWith(files.at(row.file), {}, row.choices, row.eye, &error);
+        Ref<Image> img = LoadWith(kId, files.at(row.file), {}, row.choices, row.eye, &error);
         if (row.error) {
             EXPECT_FALSE(img);
             EXPECT_NE(error.find(row.error), std::string::npos) << error;
@@ -535,8 +519,8 @@ TEST_F(OpenEXRFormatTest, SampleImagesMatchExrheader) {
     Ref<Image> eyes[2];
     for (int eye = 0; eye < 2; ++eye) {
         const char *view = eye ? "right" : "left";
-        Ref<Image> single = LoadWith(singleFile, {}, {{"View", view}});
-        Ref<Image> multi = LoadWith(multiFile, {}, {{"View", view}});
+        Ref<Image> single = LoadWith(kId, singleFile, {}, {{"View", view}});
+        Ref<Image> multi = LoadWith(kId, multiFile, {}, {{"View", view}});
         ASSERT_TRUE(single && multi) << view;
         EXPECT_EQ(differing(*single, *multi), 0) << view;
         ASSERT_TRUE(multi->Metadata().Find("name"));
@@ -624,18 +608,18 @@ TEST_F(OpenEXRFormatTest, DisplayOptionsFollowTheirFormula) {
     const Bytes b = SaveWith(kId, src.Get(), {});
     // Defaults (and Bypass over any setting) leave every value as stored.
     for (const Options &o : {Options{}, Options{{"Bypass", 1}, {"Exposure", 3}, {"Defog", 0.01}}}) {
-        Ref<Image> same = LoadWith(b, o);
+        Ref<Image> same = LoadWith(kId, b, o);
         ASSERT_TRUE(same);
         ExpectSame(*src, *same);
     }
-    Ref<Image> lit = LoadWith(b, {{"Exposure", 1}});
+    Ref<Image> lit = LoadWith(kId, b, {{"Exposure", 1}});
     ASSERT_TRUE(lit);
     const double gain = std::pow(2.0, 1 + 2.47393) * 0.184874;
     EXPECT_NEAR(lit->GetFlt(0, 0).R, low * gain, 1e-6);
     EXPECT_EQ(lit->GetFlt(0, 0).B, 0.f);                                   // negatives clip at 0
     EXPECT_EQ(lit->GetFlt(0, 0).A, 0.5f);                                  // alpha untouched
     EXPECT_NEAR(lit->GetFlt(1, 0).G, std::pow(2.0, 3.5) * 0.184874, 1e-4); // 2^kneeHigh lands on 2^3.5
-    Ref<Image> fog = LoadWith(b, {{"Defog", 0.01}});
+    Ref<Image> fog = LoadWith(kId, b, {{"Defog", 0.01}});
     ASSERT_TRUE(fog);
     EXPECT_NEAR(fog->GetFlt(0, 0).R, (low - 0.01) * std::pow(2.0, 2.47393) * 0.184874, 1e-6);
 }
