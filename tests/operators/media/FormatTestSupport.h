@@ -180,15 +180,18 @@ inline Pixel Smooth(int x, int y, bool alpha = false) {
             alpha ? v(x * 0.04 - y * 0.03) : uint16_t(65535)};
 }
 
-/// `got` has the size and the 16-bit pixels of `want`, opaque unless `alpha`.
-inline void ExpectSamePixels(const Image &want, const Image &got, bool alpha = true) {
+/// `got` has the window of `want` and its pixels within `tolerance` (as
+/// floats; 0: exactly), opaque unless `alpha`; reports the first few others.
+inline void ExpectSamePixels(const Image &want, const Image &got, bool alpha = true, float tolerance = 0) {
     ASSERT_EQ(got.DataWindow(), want.DataWindow());
     const ImgRectI w = want.DataWindow();
+    int bad = 0;
     for (int y = w.y0; y < w.y1; ++y)
         for (int x = w.x0; x < w.x1; ++x) {
-            Pixel p = At(want, x, y);
-            if (!alpha) p.A = 65535;
-            ASSERT_EQ(At(got, x, y), p) << x << "," << y;
+            const FltPixel a = want.GetFlt(x, y), b = got.GetFlt(x, y);
+            const float d = std::max({std::fabs(a.R - b.R), std::fabs(a.G - b.G), std::fabs(a.B - b.B),
+                                      std::fabs((alpha ? a.A : 1.f) - b.A)});
+            if (!(d <= tolerance) && ++bad < 4) ADD_FAILURE() << "pixel " << x << "," << y << " off by " << d;
         }
 }
 

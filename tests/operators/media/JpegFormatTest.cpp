@@ -1,8 +1,12 @@
-// JpegFormat: write and read back within a stated error, our files as djpeg
-// and ImageMagick read them, proxy scaling exactly as djpeg scales, density,
-// ICC colour spaces, refusal of four-component files, broken frame headers.
-// Files of cjpeg and ImageMagick, damage, regions, the abort word and full
-// disks are in EveryFormatTest.cpp.
+// The JPEG family. JpegFormat: write and read back within a stated error, our
+// files as djpeg and ImageMagick read them, proxy scaling exactly as djpeg
+// scales, density, ICC colour spaces, refusal of four-component files, broken
+// frame headers. IPLFormat (four-component streams holding R, G, B and A):
+// round trips within a stated error, the Quality option as ImageMagick
+// estimates it, ImageMagick's four-component files, the marker check,
+// refusal of three components, proxy scaling. Files of cjpeg and
+// ImageMagick, damage, regions, the abort word and full disks are in
+// EveryFormatTest.cpp.
 #include "host/flow/Parameter.h"
 #include "tests/operators/media/FormatTestSupport.h"
 
@@ -12,9 +16,10 @@ namespace jpeg_format_test {
 using namespace Orvane::FmtTest;
 
 class JpegFormatTest : public FormatSuite {};
+class IPLFormatTest : public FormatSuite {};
 
-Ref<Image> SmoothImage(int w, int h) {
-    return MakeImage(w, h, DepthRGBAInt8, [](int x, int y) { return Smooth(x, y); });
+Ref<Image> SmoothImage(int w, int h, bool alpha = false) {
+    return MakeImage(w, h, DepthRGBAInt8, [alpha](int x, int y) { return Smooth(x, y, alpha); });
 }
 
 /// What djpeg (the same library at its default settings) decodes from a file, as 8-bit RGBA.
@@ -26,32 +31,52 @@ std::string Identify(const std::string &format, const std::string &path) {
     return CaptureText("identify -format '" + format + "' '" + path + "'");
 }
 
-// Default quality (97, no chroma subsampling) on a smooth picture: PSNR above
-// 40 dB and no sample off by more than 12 codes; alpha reads as opaque.
-TEST_F(JpegFormatTest, WriteReadIsClose) {
-    const int w = 96, h = 64;
-    Ref<Image> src = SmoothImage(w, h);
-    for (const Options &opts : {Options{}, Options{{"Quality", 90}, {"ChromaSubsampling", 1}}}) {
-        SCOPED_TRACE(opts.empty() ? "defaults" : "quality 90, subsampled");
-        LoadResult r = Load("JpegFormat", SaveWith("JpegFormat", src.Get(), opts));
+// A smooth picture written and read back: no sample off by more than the
+// row's codes (JPEG: colour, alpha read as opaque; IPL: alpha kept too), a
+// PSNR above the row's; the quality as ImageMagick estimates it. IPL files
+// start with the Adobe marker its check wants.
+TEST_F(JpegFormatTest, WriteReadIsCloseForBothKinds) {
+    TempDir dir;
+    const struct {
+        const char *id;
+        Options options;
+        int maxError;
+        double minPSNR;
+        const char *identify;
+    } cases[] = {
+        {"JpegFormat", {}, 12, 40, "97 96 64 sRGB"}, // quality 97, no chroma subsampling
+        {"JpegFormat", {{"Quality", 90}, {"ChromaSubsampling", 1}}, 24, 34, "90 96 64 sRGB"},
+        {"IPLFormat", {}, 6, 0, "93 96 64 CMYK"},
+        {"IPLFormat", {{"Quality", 100}}, 2, 0, "100 96 64 CMYK"},
+        {"IPLFormat", {{"Quality", 60}}, 20, 0, "60 96 64 CMYK"},
+    };
+    for (const auto &c : cases) {
+        SCOPED_TRACE(::testing::Message() << c.id << " " << c.identify);
+        const bool ipl = std::string(c.id) == "IPLFormat";
+        Ref<Image> src = SmoothImage(96, 64, ipl);
+        const Bytes bytes = SaveWith(c.id, src.Get(), c.options);
+        if (ipl) {
+            EXPECT_EQ(bytes[3], 0xEE);
+            EXPECT_EQ(std::memcmp(&bytes[6], "Adobe", 5), 0);
+        }
+        LoadResult r = Load(c.id, bytes);
         ASSERT_TRUE(r.image) << r.error;
         ASSERT_EQ(r.image->DataWindow(), src->DataWindow());
         double sq = 0;
         int worst = 0;
-        bool opaque = true;
-        for (int y = 0; y < h; ++y)
-            for (int x = 0; x < w; ++x) {
+        for (int y = 0; y < 64; ++y)
+            for (int x = 0; x < 96; ++x) {
                 const Pixel a = At(*src, x, y), b = At(*r.image, x, y);
                 for (int e : {(a.R >> 8) - (b.R >> 8), (a.G >> 8) - (b.G >> 8), (a.B >> 8) - (b.B >> 8)}) {
                     sq += double(e) * e;
                     worst = std::max(worst, std::abs(e));
                 }
-                opaque &= b.A == 65535;
+                worst = std::max(worst, std::abs((a.A >> 8) - (b.A >> 8)));
             }
-        const double psnr = 10 * std::log10(255.0 * 255.0 / (sq / (3.0 * w * h) + 1e-12));
-        EXPECT_GT(psnr, opts.empty() ? 40.0 : 34.0);
-        EXPECT_LE(worst, opts.empty() ? 12 : 24);
-        EXPECT_TRUE(opaque);
+        EXPECT_GT(10 * std::log10(255.0 * 255.0 / (sq / (3.0 * 96 * 64) + 1e-12)), c.minPSNR);
+        EXPECT_LE(worst, c.maxError);
+        WriteFile(dir / "q.jpg", bytes);
+        EXPECT_EQ(Identify("%Q %w %h %[colorspace]", dir / "q.jpg"), c.identify);
     }
 }
 
@@ -241,6 +266,56 @@ TEST_F(JpegFormatTest, FrameHeadersAndHeaderOnlyReads) {
     ASSERT_TRUE(r.image) << r.error;
     EXPECT_EQ(r.image->Width(), 64);
     EXPECT_FALSE(r.image->HasScanLineData());
+}
+
+// ---- IPL ----
+
+// A four-component file from ImageMagick (Adobe inverted ink values) reads
+// with exactly the samples ImageMagick decodes, inverted back; JpegFormat
+// refuses the same file, and ours.
+TEST_F(IPLFormatTest, ReadsFourComponentFilesFromImageMagick) {
+    TempDir dir;
+    ASSERT_TRUE(RunShell("convert -size 23x11 gradient:red-blue -colorspace CMYK -quality 90 '" + dir / "c.jpg" + "'"));
+    Bytes ink = Capture("convert '" + dir / "c.jpg" + "' -depth 8 cmyk:-");
+    for (uint8_t &v : ink) v = uint8_t(255 - v);
+    const Bytes bytes = ReadFile(dir / "c.jpg");
+    LoadResult r = Load("IPLFormat", bytes);
+    ASSERT_TRUE(r.image) << r.error;
+    EXPECT_EQ(Mismatches(*r.image, ink, 23, 11), 0);
+    EXPECT_FALSE(Load("JpegFormat", bytes).headerOk);
+    EXPECT_FALSE(Load("JpegFormat", Save("IPLFormat", r.image.Get())).headerOk);
+}
+
+// Three components under the IPL name are refused, with or without a JFIF
+// marker; a stream whose first marker is neither JFIF nor Adobe fails the check.
+TEST_F(IPLFormatTest, RefusesOtherStreams) {
+    const Bytes rgb = Save("JpegFormat", SmoothImage(16, 16, true).Get());
+    ASSERT_EQ(std::memcmp(&rgb[6], "JFIF", 4), 0);
+    Ref<ImageFormat> fmt = MakeFormat("IPLFormat");
+    MemoryIO a(rgb);
+    EXPECT_TRUE(fmt->CheckFormat(&a)); // the markers pass; the component count does not
+    LoadResult r = Load("IPLFormat", rgb);
+    EXPECT_FALSE(r.headerOk);
+    EXPECT_NE(r.error.find("3"), std::string::npos) << r.error;
+    // Our four-component file with its APP14 renamed: no longer an IPL start.
+    Bytes four = Save("IPLFormat", SmoothImage(16, 16, true).Get());
+    four[6] = 'X';
+    MemoryIO b(four);
+    EXPECT_FALSE(fmt->CheckFormat(&b));
+    EXPECT_EQ(b.Tell(), 0); // the check leaves the stream where it was
+    EXPECT_FALSE(Load("IPLFormat", four).headerOk);
+    // Fewer than 16 bytes.
+    EXPECT_FALSE(Load("IPLFormat", Bytes(four.begin(), four.begin() + 15)).headerOk);
+}
+
+// Proxy scale 2 halves (rounding up); each scaled pixel is near the mean of
+// the 2 x 2 it covers (a smooth picture).
+TEST_F(IPLFormatTest, ProxyScale) {
+    const Bytes bytes = Save("IPLFormat", SmoothImage(45, 31, true).Get());
+    LoadResult half = LoadAt("IPLFormat", bytes, 2), full = Load("IPLFormat", bytes);
+    ASSERT_TRUE(half.image && full.image) << half.error;
+    EXPECT_EQ(half.image->DataWindow(), ImgRectI(0, 0, 23, 16));
+    EXPECT_NEAR(At(*half.image, 10, 7).A >> 8, At(*full.image, 20, 14).A >> 8, 6);
 }
 
 } // namespace jpeg_format_test

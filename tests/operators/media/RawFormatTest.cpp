@@ -157,26 +157,12 @@ TEST_F(RawFormatTest, HeaderFieldsByteForByte) {
             // The size field: the plain data's size, or patched to the bytes written.
             EXPECT_EQ(U32(b, 16), compression ? b.size() - dataAt : uint32_t(rows * cols * (mainPix + auxPix)));
             EXPECT_EQ(b.size() - dataAt, U32(b, 16));
-            const std::pair<size_t, int> ints[] = {{20, 37},
-                                                   {24, 9},
-                                                   {28, cols * mainPix},
-                                                   {32, cols * auxPix},
-                                                   {36, depth},
-                                                   {40, -3},
-                                                   {44, -2},
-                                                   {48, 30},
-                                                   {52, 11},
-                                                   {56, 0},
-                                                   {60, 0},
-                                                   {64, 20},
-                                                   {68, 5},
-                                                   {108, 2},
-                                                   {112, 0},
-                                                   {116, 90125},
-                                                   {120, 74},
-                                                   {124, 18},
-                                                   {144, 1}};
-            for (auto [at, v] : ints) EXPECT_EQ(S32(b, at), v) << "at " << at;
+            // Size, line sizes, depth, data and valid windows, then the proxy scale,
+            // time code, full size and field; the scales and field offset are doubles.
+            const int offsets[] = {20, 24, 28, 32, 36, 40, 44, 48, 52, 56, 60, 64, 68, 108, 112, 116, 120, 124, 144};
+            const int want[] = {
+                37, 9, cols * mainPix, cols * auxPix, depth, -3, -2, 30, 11, 0, 0, 20, 5, 2, 0, 90125, 74, 18, 1};
+            for (size_t i = 0; i < std::size(offsets); ++i) EXPECT_EQ(S32(b, offsets[i]), want[i]) << offsets[i];
             for (auto [at, v] : {std::pair{72, 1.5}, {80, 0.75}, {96, 0.5}, {128, 3.0}, {136, 1.5}})
                 EXPECT_EQ(F64(b, at), v) << "at " << at;
             EXPECT_EQ(S16(b, 180), mainPix);

@@ -107,61 +107,58 @@ TEST_F(TargaFormatTest, PacketsFollowTheRule) {
 }
 
 TEST_F(TargaFormatTest, OriginsMapsGreyAndSixteenBitFiles) {
-    const int w = 3, h = 2;
-    // Top-origin, right-to-left, 24 bits: stored rows top first, columns from the right.
-    Bytes top = Header(2, w, h, 24, 0x20 | 0x10);
-    for (int s = 0; s < h; ++s)
-        for (int k = 0; k < w; ++k) top.insert(top.end(), {uint8_t(s * 10 + k), 0, 0});
-    LoadResult r = Load("TargaFormat", top);
-    ASSERT_TRUE(r.image) << r.error;
-    for (int y = 0; y < h; ++y)
-        for (int x = 0; x < w; ++x)
-            EXPECT_EQ(At(*r.image, x, y).B, ((h - 1 - y) * 10 + w - 1 - x) * 257) << x << "," << y;
-    // The same as a run-length file whose packet runs on into the next line.
-    Bytes topRle = Header(10, w, h, 24, 0x20);
-    topRle.insert(topRle.end(), {0x83, 7, 8, 9, 0x01, 1, 2, 3, 4, 5, 6});
-    r = Load("TargaFormat", topRle);
-    ASSERT_TRUE(r.image) << r.error;
-    const Pixel seven{9 * 257, 8 * 257, 7 * 257, 65535};
-    EXPECT_EQ(At(*r.image, 0, 1), seven);
-    EXPECT_EQ(At(*r.image, 2, 1), seven);
-    EXPECT_EQ(At(*r.image, 0, 0), seven); // the run's fourth pixel starts the second stored line
-    EXPECT_EQ(At(*r.image, 1, 0), (Pixel{3 * 257, 2 * 257, 1 * 257, 65535}));
-    EXPECT_EQ(At(*r.image, 2, 0), (Pixel{6 * 257, 5 * 257, 4 * 257, 65535}));
-
-    // Colour map of 24-bit entries starting at index 2, after an ID of 5 bytes.
-    Bytes mapped = Header(1, 2, 1, 8, 0, 5, 1, 2, 3, 24);
-    mapped.insert(mapped.end(), {'i', 'd', 'e', 'n', 't'});
-    mapped.insert(mapped.end(), {10, 20, 30, 40, 50, 60, 70, 80, 90}); // entries 2, 3, 4 (BGR)
-    mapped.insert(mapped.end(), {4, 2});
-    r = Load("TargaFormat", mapped);
-    ASSERT_TRUE(r.image) << r.error;
-    EXPECT_EQ(At(*r.image, 0, 0), (Pixel{90 * 257, 80 * 257, 70 * 257, 65535}));
-    EXPECT_EQ(At(*r.image, 1, 0), (Pixel{30 * 257, 20 * 257, 10 * 257, 65535}));
-
-    // 32-bit map entries keep alpha when the descriptor says so.
-    Bytes map32 = Header(1, 1, 1, 8, 8, 0, 1, 0, 1, 32);
-    map32.insert(map32.end(), {1, 2, 3, 4, 0});
-    r = Load("TargaFormat", map32);
-    ASSERT_TRUE(r.image) << r.error;
-    EXPECT_EQ(At(*r.image, 0, 0), (Pixel{3 * 257, 2 * 257, 1 * 257, 4 * 257}));
-
-    // 16 bits, 5-5-5 with an alpha bit.
-    Bytes sixteen = Header(2, 2, 1, 16, 1);
-    const uint16_t a = 0x8000 | (31 << 10) | (1 << 5) | 16, b = (0 << 10) | (31 << 5) | 0;
-    sixteen.insert(sixteen.end(), {uint8_t(a), uint8_t(a >> 8), uint8_t(b), uint8_t(b >> 8)});
-    r = Load("TargaFormat", sixteen);
-    ASSERT_TRUE(r.image) << r.error;
-    EXPECT_EQ(At(*r.image, 0, 0), (Pixel{255 * 257, 8 * 257, 132 * 257, 65535}));
-    EXPECT_EQ(At(*r.image, 1, 0), (Pixel{0, 255 * 257, 0, 0}));
-
-    // Grey, run-length.
-    Bytes grey = Header(11, 4, 1, 8, 0);
-    grey.insert(grey.end(), {0x81, 50, 0x01, 7, 9});
-    r = Load("TargaFormat", grey);
-    ASSERT_TRUE(r.image) << r.error;
-    EXPECT_EQ(At(*r.image, 1, 0), (Pixel{50 * 257, 50 * 257, 50 * 257, 65535}));
-    EXPECT_EQ(At(*r.image, 3, 0), (Pixel{9 * 257, 9 * 257, 9 * 257, 65535}));
+    auto file = [](Bytes header, const Bytes &data) {
+        header.insert(header.end(), data.begin(), data.end());
+        return header;
+    };
+    auto bgra = [](int b, int g, int r, int a = 255) {
+        return Pixel{uint16_t(r * 257), uint16_t(g * 257), uint16_t(b * 257), uint16_t(a * 257)};
+    };
+    const struct {
+        const char *what;
+        Bytes file;
+        std::vector<std::tuple<int, int, Pixel>> pixels;
+    } cases[] = {
+        // Stored rows top first, columns from the right.
+        {"top-origin, right to left",
+         file(Header(2, 3, 2, 24, 0x30), {0, 0, 0, 1, 0, 0, 2, 0, 0, 10, 0, 0, 11, 0, 0, 12, 0, 0}),
+         {{0, 1, bgra(2, 0, 0)},
+          {1, 1, bgra(1, 0, 0)},
+          {2, 1, bgra(0, 0, 0)},
+          {0, 0, bgra(12, 0, 0)},
+          {1, 0, bgra(11, 0, 0)},
+          {2, 0, bgra(10, 0, 0)}}},
+        // The run's fourth pixel starts the second stored line.
+        {"top-origin run-length",
+         file(Header(10, 3, 2, 24, 0x20), {0x83, 7, 8, 9, 0x01, 1, 2, 3, 4, 5, 6}),
+         {{0, 1, bgra(7, 8, 9)},
+          {2, 1, bgra(7, 8, 9)},
+          {0, 0, bgra(7, 8, 9)},
+          {1, 0, bgra(1, 2, 3)},
+          {2, 0, bgra(4, 5, 6)}}},
+        // 24-bit entries 2, 3, 4 after an ID of 5 bytes.
+        {"colour map",
+         file(Header(1, 2, 1, 8, 0, 5, 1, 2, 3, 24),
+              {'i', 'd', 'e', 'n', 't', 10, 20, 30, 40, 50, 60, 70, 80, 90, 4, 2}),
+         {{0, 0, bgra(70, 80, 90)}, {1, 0, bgra(10, 20, 30)}}},
+        // 32-bit entries keep alpha when the descriptor says so.
+        {"colour map with alpha",
+         file(Header(1, 1, 1, 8, 8, 0, 1, 0, 1, 32), {1, 2, 3, 4, 0}),
+         {{0, 0, bgra(1, 2, 3, 4)}}},
+        // 5-5-5 with an alpha bit: 0x8000 | 31 << 10 | 1 << 5 | 16, then 31 << 5.
+        {"16 bits",
+         file(Header(2, 2, 1, 16, 1), {0x30, 0xfc, 0xe0, 0x03}),
+         {{0, 0, Pixel{255 * 257, 8 * 257, 132 * 257, 65535}}, {1, 0, Pixel{0, 255 * 257, 0, 0}}}},
+        {"grey run-length",
+         file(Header(11, 4, 1, 8, 0), {0x81, 50, 0x01, 7, 9}),
+         {{1, 0, bgra(50, 50, 50)}, {3, 0, bgra(9, 9, 9)}}},
+    };
+    for (const auto &c : cases) {
+        SCOPED_TRACE(c.what);
+        const LoadResult r = Load("TargaFormat", c.file);
+        ASSERT_TRUE(r.image) << r.error;
+        for (const auto &[x, y, p] : c.pixels) EXPECT_EQ(At(*r.image, x, y), p) << x << "," << y;
+    }
 
     // A top-origin copy of a plain file reads the same, regions too.
     Ref<Image> src = Image8(150, 9, 4);
@@ -170,7 +167,7 @@ TEST_F(TargaFormatTest, OriginsMapsGreyAndSixteenBitFiles) {
     flipped[17] |= 0x20;
     for (int s = 8; s >= 0; --s)
         flipped.insert(flipped.end(), plain.begin() + 18 + s * 600, plain.begin() + 18 + (s + 1) * 600);
-    r = Load("TargaFormat", flipped);
+    const LoadResult r = Load("TargaFormat", flipped);
     ASSERT_TRUE(r.image) << r.error;
     ExpectSamePixels(*src, *r.image);
     ExpectRegionsMatchFullRead("TargaFormat", flipped);
