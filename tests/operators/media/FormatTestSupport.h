@@ -302,12 +302,8 @@ private:
 
 // ---- files and programs ----
 
-inline bool HaveProgram(const char *name) {
-    const std::string cmd = std::string("command -v ") + name + " >/dev/null 2>&1";
-    return std::system(cmd.c_str()) == 0;
-}
-
 inline bool RunShell(const std::string &cmd) { return std::system((cmd + " 2>/dev/null").c_str()) == 0; }
+inline bool HaveProgram(const char *name) { return RunShell(std::string("command -v ") + name + " >/dev/null"); }
 
 /// Standard output of a command (binary).
 inline Bytes Capture(const std::string &cmd) {
@@ -324,7 +320,7 @@ inline Bytes Capture(const std::string &cmd) {
 /// Standard output of a command as text.
 inline std::string CaptureText(const std::string &cmd) {
     const Bytes out = Capture(cmd);
-    return std::string(out.begin(), out.end());
+    return {out.begin(), out.end()};
 }
 
 inline Bytes ReadFile(const std::string &path) {
@@ -334,22 +330,6 @@ inline Bytes ReadFile(const std::string &path) {
 inline void WriteFile(const std::string &path, const Bytes &data) {
     std::ofstream f(path, std::ios::binary);
     f.write(reinterpret_cast<const char *>(data.data()), static_cast<std::streamsize>(data.size()));
-}
-
-/// A binary PPM (rows top first) of w x h, pixel (x, row) = rgb(x, row); a
-/// PAM with alpha when rgb gives four values.
-template <class Rgb> Bytes MakePPM(int w, int h, Rgb rgb) {
-    const size_t n = rgb(0, 0).size();
-    const std::string size = std::to_string(w) + (n == 3 ? " " : "\nHEIGHT ") + std::to_string(h);
-    const std::string head = n == 3 ? "P6\n" + size + "\n255\n"
-                                    : "P7\nWIDTH " + size + "\nDEPTH 4\nMAXVAL 255\nTUPLTYPE RGB_ALPHA\nENDHDR\n";
-    Bytes out(head.begin(), head.end());
-    for (int row = 0; row < h; ++row)
-        for (int x = 0; x < w; ++x) {
-            const auto c = rgb(x, row);
-            out.insert(out.end(), c.begin(), c.end());
-        }
-    return out;
 }
 
 /// Pixels of `img` (rows from the bottom) that differ from 8-bit RGBA
