@@ -48,6 +48,12 @@ protected:
         Ref<Image> img = Orvane::Test::EvalImage(loader, t);
         return img ? At(*img, 0, 0).R / 1000 : -1;
     }
+    /// Evaluates a tool's main output for a render task.
+    static Ref<Parameter> Render(Operator *op, double t, RenderTask &task, uint32_t flags = 0) {
+        EvalOptions options;
+        options.task = &task, options.flags = flags;
+        return Evaluate(op->FindMainOutput(), t, options);
+    }
     /// The frame a file holds, read back through a clip.
     static Ref<Image> ReadBack(const std::string &path) {
         std::string error;
@@ -158,10 +164,7 @@ TEST_F(LoaderSaver, AlphaOptionsAndDepth) {
 TEST_F(LoaderSaver, ProxyRendersAreShrunkByWholeFactors) {
     RenderTask task;
     task.proxyScale = 2;
-    EvalOptions options;
-    options.task = &task;
-    options.flags = ReqFlagProxy;
-    Ref<Parameter> v = Evaluate(loader->FindMainOutput(), 0, options);
+    Ref<Parameter> v = Render(loader, 0, task, ReqFlagProxy);
     auto *img = dynamic_cast<Image *>(v.Get());
     ASSERT_NE(img, nullptr);
     EXPECT_EQ(img->Width(), W / 2);
@@ -179,9 +182,7 @@ TEST_F(LoaderSaver, SaverNumbersFilesAndWritesOnlyInRenders) {
     Set(loader, "GlobalIn", ScriptVal(3));
     RenderTask task;
     task.startTime = 3;
-    EvalOptions options;
-    options.task = &task;
-    auto render = [&](double t) { return Evaluate(saver->FindMainOutput(), t, options); };
+    auto render = [&](double t) { return Render(saver, t, task); };
 
     // Without "Create Folder During Render" a missing folder fails the frame.
     EXPECT_FALSE(render(5));
@@ -208,8 +209,7 @@ TEST_F(LoaderSaver, SaverNumbersFilesAndWritesOnlyInRenders) {
 
     // An interactive look passes the image on and writes nothing.
     task.interactive = true;
-    options.flags = ReqFlagInteractive;
-    EXPECT_TRUE(render(6));
+    EXPECT_TRUE(Render(saver, 6, task, ReqFlagInteractive));
     EXPECT_FALSE(std::filesystem::exists(dir / "out/shot.1003.raw"));
 }
 
@@ -251,9 +251,7 @@ TEST_F(LoaderSaver, SaverCutsToTheFrameAndCanSaveAlphaAsColor) {
     Set(saver, "Clip", ScriptVal(dir / "cut.raw"));
     Set(saver, "SaveAlphaToColor", ScriptVal(1));
     RenderTask task;
-    EvalOptions options;
-    options.task = &task;
-    ASSERT_TRUE(Evaluate(saver->FindMainOutput(), 0, options));
+    ASSERT_TRUE(Render(saver, 0, task));
     Ref<Image> read = ReadBack(dir / "cut.raw");
     ASSERT_TRUE(read);
     EXPECT_EQ(read->DataWindow(), ImgRectI(0, 0, 8, 6));
