@@ -127,22 +127,6 @@ TEST_F(BMPFormatTest, DeeperImagesKeepTheTopEightBitsAndCanvasFillsOutside) {
         }
 }
 
-TEST_F(BMPFormatTest, OnePixelWide24BitHasAStrideOfFour) {
-    // Made by hand: 1 x 3, 24 bits, lines of 3 bytes plus one padding byte.
-    Bytes b(54 + 12, 0);
-    b[0] = 'B', b[1] = 'M';
-    Put32(b, 10, 54), Put32(b, 14, 40), Put32(b, 18, 1), Put32(b, 22, 3), Put16(b, 26, 1), Put16(b, 28, 24);
-    for (int y = 0; y < 3; ++y) {
-        for (int c = 0; c < 3; ++c) b[54 + 4 * y + c] = static_cast<uint8_t>(10 * (c + 1) + y);
-        b[57 + 4 * y] = 0xee; // padding, never read as a pixel
-    }
-    const LoadResult r = Load("BMPFormat", b);
-    ASSERT_TRUE(r.image) << r.error;
-    for (int y = 0; y < 3; ++y)
-        EXPECT_EQ(At(*r.image, 0, y),
-                  (Pixel{uint16_t((30 + y) * 257), uint16_t((20 + y) * 257), uint16_t((10 + y) * 257), 65535}));
-}
-
 TEST_F(BMPFormatTest, NegativeHeightMeansTopLineFirst) {
     Ref<Image> src = Image8(7, 5, 44);
     for (bool alpha : {false, true}) {
