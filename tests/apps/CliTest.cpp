@@ -204,7 +204,7 @@ TEST(CliCheck, ListsEveryProblemWithItsPlaceAndTheExamplesPass) {
                                            "\t\tM1 = Merge { Inputs = { FilterMethod = 42 } },\n\t},\n}\n");
     const CliRun r = Orvane("check " + Quote(flow.string()));
     EXPECT_EQ(r.exitCode, 2);
-    for (const std::string &line :
+    for (const char *line :
          {":2:16: RenderRange is reversed", ":4:35: B1.Filter: no choice 'Gausian' (did you mean 'Gaussian'?)",
           ":4:58: B1.XBlurSize: -1 is below the least allowed value 0",
           ":5:42: M1.FilterMethod: 42 is not a choice (0 Nearest Neighbor"})

@@ -2,6 +2,9 @@
 
 #include <gtest/gtest.h>
 
+#include <cstdlib>
+#include <filesystem>
+
 #include "host/app/Application.h"
 #include "host/core/Tags.h"
 #include "host/image/NewImage.h"
@@ -12,6 +15,17 @@ void LoadOperators() {
     std::string error;
     const std::string path = std::string(ORVANE_BINARY_DIR) + "/liborvaneoperators.so";
     ASSERT_TRUE(GetApp()->LoadModule(path, error)) << "cannot load the tool library: " << error;
+}
+
+TempDir::TempDir() {
+    std::string pattern = (std::filesystem::temp_directory_path() / "orvane-test-XXXXXX").string();
+    EXPECT_NE(mkdtemp(pattern.data()), nullptr) << pattern;
+    path = pattern;
+}
+
+TempDir::~TempDir() {
+    std::error_code ignored;
+    std::filesystem::remove_all(path, ignored);
 }
 
 std::string SourcePath(const std::string &relative) { return std::string(ORVANE_SOURCE_DIR) + "/" + relative; }

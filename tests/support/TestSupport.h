@@ -22,6 +22,17 @@ void LoadOperators();
 /// A path under the source tree.
 std::string SourcePath(const std::string &relative);
 
+/// A fresh folder under the system's temporary folder, removed with all it
+/// holds when the object goes.
+struct TempDir {
+    std::string path;
+    TempDir();
+    ~TempDir();
+    TempDir(const TempDir &) = delete;
+    TempDir &operator=(const TempDir &) = delete;
+    std::string operator/(const std::string &name) const { return path + "/" + name; }
+};
+
 /// An RGBA float image of w x h with a deterministic, non-constant pattern
 /// (values spread over -0.25..1.5 in every channel, alpha included).
 Ref<Image> PatternImage(int w, int h, int depth = 8, unsigned seed = 1);

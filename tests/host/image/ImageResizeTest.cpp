@@ -130,8 +130,9 @@ TEST(ResampleAxis, WeightsSumToOneRunsAreEvenAndAreaFiltersSpreadEvenly) {
                 // away from the ends counts the same, 1 / factor, so averages are kept.
                 const double factor = 1.0 / scale;
                 if ((filter == RszBox || filter == RszLinear) && scale < 1 &&
-                    std::fabs(factor - std::round(factor)) < 1e-9)
+                    std::fabs(factor - std::round(factor)) < 1e-9) {
                     for (int j = 8; j < src - 8; ++j) EXPECT_NEAR(received[j], scale, 1e-6) << j;
+                }
             }
     ResampleAxis bad;
     for (auto [scale, offset, lo] :
@@ -154,7 +155,8 @@ TEST(ResizeTagList, EveryFilterMatchesTheDirectConvolution) {
             if (window != RszWindowHanning && filter != RszSinc && filter != RszBessel) continue;
             for (const auto &[sx, sy, ox, oy, w, h] : geometries) {
                 const Request2D r{
-                    filter, window, sx, sy, ox, oy, kEdges[(filter + window) % 4], kEdges[(filter + window + 1) % 4]};
+                    filter, window, sx, sy, ox, oy, kEdges[(filter + window) % 4], kEdges[(filter + window + 1) % 4],
+                    {}};
                 Ref<Image> dst = Blank(int(w), int(h), DepthRGBAFlt32);
                 ASSERT_TRUE(src->ResizeTagList(dst.Get(), r.Tags()));
                 EXPECT_TRUE(Matches(*dst, *src, r, 2e-5))
@@ -261,7 +263,7 @@ TEST(ResizeTagList, DataWindowsCanvasAndDepths) {
     // A source whose data window is part of the frame and one reaching past it,
     // read at every depth into outputs of other depths and windows.
     const ImgRectI inside(2, 1, 12, 8), beyond(-3, -2, 15, 11), part(-4, 3, 25, 14);
-    const Request2D r{RszMitchell, RszWindowHanning, 21.0 / 13, 14.0 / 9, 0, 0, EdgeCanvas, EdgeMirror};
+    const Request2D r{RszMitchell, RszWindowHanning, 21.0 / 13, 14.0 / 9, 0, 0, EdgeCanvas, EdgeMirror, {}};
     for (const ImgRectI *sw : {&inside, &beyond})
         for (int sd : {DepthAInt8, DepthAFlt16, DepthRGBAInt8, DepthRGBAInt16, DepthRGBAFlt16, DepthRGBAFlt32})
             for (int dd : {DepthAFlt32, DepthRGBAInt16, DepthRGBAFlt32}) {

@@ -315,7 +315,9 @@ TEST(TransformMatrix, EdgeModesFoldAtTheFrameBorder) {
         // end, and pixels without a cut stop at the frame.
         const int E = DomainEndless;
         EXPECT_EQ(tm->OutputDataWindow(), edges == EdgeCanvas ? ImgRectI(0, 0, 5, 1) : ImgRectI(-E, -E, E, E));
-        if (edges != EdgeCanvas) EXPECT_EQ(tm->ApplyTransformTagList({})->DataWindow(), ImgRectI(0, 0, 4, 1));
+        if (edges != EdgeCanvas) {
+            EXPECT_EQ(tm->ApplyTransformTagList({})->DataWindow(), ImgRectI(0, 0, 4, 1));
+        }
     }
 }
 

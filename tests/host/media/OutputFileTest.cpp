@@ -10,18 +10,14 @@
 #include <unistd.h>
 
 #include "host/media/OutputFile.h"
+#include "tests/support/TestSupport.h"
 
 namespace Orvane::outputfiletest {
 namespace {
 
 namespace fs = std::filesystem;
 
-struct TempDir {
-    fs::path path = fs::temp_directory_path() / ("orvane-out-" + std::to_string(getpid()) + "-" +
-                                                 ::testing::UnitTest::GetInstance()->current_test_info()->name());
-    TempDir() { fs::create_directories(path); }
-    ~TempDir() { fs::remove_all(path); }
-};
+using Orvane::Test::TempDir;
 
 /// A process number that no process has now: a child that has exited and been reaped.
 long DeadPid() {
@@ -71,8 +67,8 @@ TEST(OutputFile, OnlyRegularFilesAreReplacedAndLinksToThemWrittenThrough) {
 TEST(OutputFile, StaleTemporariesOfTheSameOutputAreRemoved) {
     TempDir dir;
     // This process's temporary for a file sits beside it and names the host and process.
-    const fs::path temp = TemporaryFileFor((dir.path / "f.0001.exr").string());
-    EXPECT_EQ(temp.parent_path(), dir.path);
+    const fs::path temp = TemporaryFileFor(dir / "f.0001.exr");
+    EXPECT_EQ(temp.parent_path(), fs::path(dir.path));
     TemporaryName mine;
     ASSERT_TRUE(ParseTemporaryName(temp.filename().string(), mine));
     EXPECT_EQ(mine.target, "f.0001.exr");
@@ -92,15 +88,15 @@ TEST(OutputFile, StaleTemporariesOfTheSameOutputAreRemoved) {
         {"f.0001.exr", true, false},
     };
     for (const auto &c : cases) {
-        std::ofstream(dir.path / c.name) << "partial";
-        if (c.oldFile) fs::last_write_time(dir.path / c.name, old);
+        std::ofstream(dir / c.name) << "partial";
+        if (c.oldFile) fs::last_write_time(dir / c.name, old);
     }
-    EXPECT_EQ(RemoveStaleTemporaries(ParseSequenceName((dir.path / "f.####.exr").string())), 2);
-    for (const auto &c : cases) EXPECT_EQ(fs::exists(dir.path / c.name), !c.removed) << c.name;
+    EXPECT_EQ(RemoveStaleTemporaries(ParseSequenceName(dir / "f.####.exr")), 2);
+    for (const auto &c : cases) EXPECT_EQ(fs::exists(dir / c.name), !c.removed) << c.name;
 
     // A name without a number: the one file's temporaries.
-    std::ofstream(dir.path / (".still.png.orvane-tmp-" + mine.host + "-" + dead)) << "partial";
-    EXPECT_EQ(RemoveStaleTemporaries(ParseSequenceName((dir.path / "still.png").string())), 1);
+    std::ofstream(dir / (".still.png.orvane-tmp-" + mine.host + "-" + dead)) << "partial";
+    EXPECT_EQ(RemoveStaleTemporaries(ParseSequenceName(dir / "still.png")), 1);
 }
 
 } // namespace

@@ -4,9 +4,9 @@
 
 #include <filesystem>
 #include <fstream>
-#include <unistd.h>
 
 #include "host/media/Sequence.h"
+#include "tests/support/TestSupport.h"
 
 namespace Orvane::sequencetest {
 namespace {
@@ -44,55 +44,50 @@ TEST(SequenceName, ParsesTheLastNumberBeforeTheExtension) {
     }
 }
 
-TEST(SequenceName, FrameNamesKeepThePaddingAndGrowWhenNeeded) {
-    const SequenceName s = ParseSequenceName("out/render.0100.exr");
-    EXPECT_EQ(SequencePath(s, 7), "out/render.0007.exr");
-    EXPECT_EQ(SequencePath(s, 12345), "out/render.12345.exr");
-    EXPECT_EQ(SequencePath(s, -23), "out/render.-0023.exr");
-    EXPECT_EQ(SequenceDisplayName(s), "out/render.####.exr");
-    const SequenceName one = ParseSequenceName("f9.png");
-    EXPECT_EQ(SequencePath(one, 10), "f10.png");
-    EXPECT_EQ(SequenceDisplayName(one), "f#.png");
-    // The display form reads back as the same sequence; the last run of signs counts.
-    const SequenceName hashes = ParseSequenceName("out/v#2/render_######.exr");
-    EXPECT_EQ(SequencePath(hashes, 1012), "out/v#2/render_001012.exr");
-    EXPECT_EQ(SequenceDisplayName(ParseSequenceName(SequenceDisplayName(s))), SequenceDisplayName(s));
-    for (int padding = 1; padding <= 8; ++padding) {
-        SequenceName p = ParseSequenceName("x." + std::string(padding, '0') + ".raw");
-        ASSERT_EQ(p.padding, padding);
-        const std::string name = SequencePath(p, 1001);
-        int64_t number = 0;
-        EXPECT_TRUE(MatchesSequence(p, name, number)) << name;
-        EXPECT_EQ(number, 1001);
-    }
-}
-
-TEST(SequenceName, MarkersGiveThePlaceAndPaddingOfTheNumber) {
+// Frame names keep the padding and grow when needed; markers give the place
+// and padding of the number.
+TEST(SequenceName, FrameNamesFromNumbersAndMarkers) {
     const struct {
-        const char *path, *frame7, *frame1234;
+        const char *path, *frame7, *frame12345, *display;
     } cases[] = {
-        {"o/shot.####.exr", "o/shot.0007.exr", "o/shot.1234.exr"},
-        {"shot.%04d.exr", "shot.0007.exr", "shot.1234.exr"},
-        {"shot.%d.exr", "shot.7.exr", "shot.1234.exr"},
-        {"shot.%4d.exr", "shot.0007.exr", "shot.1234.exr"}, // zeros, not spaces, in a file name
-        {"shot_$F4.exr", "shot_0007.exr", "shot_1234.exr"},
-        {"v2_%03d_final.tif", "v2_007_final.tif", "v2_1234_final.tif"},   // the marker wins over digits
-        {"take.%05d.$F2.png", "take.%05d.07.png", "take.%05d.1234.png"},  // the last marker counts
-        {"v#1/plate.%02d.dpx", "v#1/plate.07.dpx", "v#1/plate.1234.dpx"}, // markers in folders are text
-        {"odd.%123d.exr", "odd.%007d.exr", "odd.%1234d.exr"},             // no marker: the digits rule
+        {"out/render.0100.exr", "out/render.0007.exr", "out/render.12345.exr", "out/render.####.exr"},
+        {"f9.png", "f7.png", "f12345.png", "f#.png"},
+        {"o/shot.####.exr", "o/shot.0007.exr", "o/shot.12345.exr", "o/shot.####.exr"},
+        // The last run of signs counts.
+        {"out/v#2/render_######.exr", "out/v#2/render_000007.exr", "out/v#2/render_012345.exr",
+         "out/v#2/render_######.exr"},
+        {"shot.%04d.exr", "shot.0007.exr", "shot.12345.exr", nullptr},
+        {"shot.%d.exr", "shot.7.exr", "shot.12345.exr", nullptr},
+        {"shot.%4d.exr", "shot.0007.exr", "shot.12345.exr", nullptr}, // zeros, not spaces, in a file name
+        {"shot_$F4.exr", "shot_0007.exr", "shot_12345.exr", nullptr},
+        {"v2_%03d_final.tif", "v2_007_final.tif", "v2_12345_final.tif", nullptr},   // the marker wins over digits
+        {"take.%05d.$F2.png", "take.%05d.07.png", "take.%05d.12345.png", nullptr},  // the last marker counts
+        {"v#1/plate.%02d.dpx", "v#1/plate.07.dpx", "v#1/plate.12345.dpx", nullptr}, // markers in folders are text
+        {"odd.%123d.exr", "odd.%007d.exr", "odd.%12345d.exr", nullptr},             // no marker: the digits rule
     };
     for (const auto &c : cases) {
         SCOPED_TRACE(c.path);
         const SequenceName s = ParseSequenceName(c.path);
         ASSERT_TRUE(s.hasNumber);
         EXPECT_EQ(SequencePath(s, 7), c.frame7);
-        EXPECT_EQ(SequencePath(s, 1234), c.frame1234);
+        EXPECT_EQ(SequencePath(s, 12345), c.frame12345);
+        if (c.display) {
+            EXPECT_EQ(SequenceDisplayName(s), c.display);
+        }
         // The display form names the same files, and the files belong to it.
         EXPECT_EQ(SequencePath(ParseSequenceName(SequenceDisplayName(s)), 7), c.frame7);
         int64_t n = 0;
-        const std::string file = SequencePath(s, 1234);
+        const std::string file = c.frame12345;
         EXPECT_TRUE(MatchesSequence(s, file.substr(file.rfind('/') + 1), n));
-        EXPECT_EQ(n, 1234);
+        EXPECT_EQ(n, 12345);
+    }
+    EXPECT_EQ(SequencePath(ParseSequenceName("out/render.0100.exr"), -23), "out/render.-0023.exr");
+    for (int padding = 1; padding <= 8; ++padding) {
+        SequenceName p = ParseSequenceName("x." + std::string(padding, '0') + ".raw");
+        ASSERT_EQ(p.padding, padding);
+        int64_t number = 0;
+        EXPECT_TRUE(MatchesSequence(p, SequencePath(p, 1001), number)) << padding;
+        EXPECT_EQ(number, 1001);
     }
 }
 
@@ -134,19 +129,16 @@ TEST(SequenceName, MatchingRespectsPaddingPrefixAndSuffix) {
 }
 
 TEST(SequenceScan, FindsTheFramesAndTheGapsInAFolder) {
-    const std::filesystem::path dir =
-        std::filesystem::temp_directory_path() / ("orvane-seq-" + std::to_string(getpid()));
-    std::filesystem::create_directories(dir);
+    const Orvane::Test::TempDir dir;
     for (const char *name : {"a.0003.exr", "a.0004.exr", "a.0007.exr", "a.0010.exr", "a.-0001.exr", "a.004.exr",
                              "b.0005.exr", "a.0005.png"})
         std::ofstream(dir / name) << "x";
     std::filesystem::create_directories(dir / "a.0006.exr"); // a folder is no frame
-    const SequenceScan scan = ScanSequence(ParseSequenceName((dir / "a.0003.exr").string()));
+    const SequenceScan scan = ScanSequence(ParseSequenceName(dir / "a.0003.exr"));
     EXPECT_EQ(scan.frames, (std::vector<int64_t>{-1, 3, 4, 7, 10}));
     const std::vector<std::pair<int64_t, int64_t>> gaps{{0, 2}, {5, 6}, {8, 9}};
     EXPECT_EQ(scan.gaps, gaps);
-    EXPECT_TRUE(ScanSequence(ParseSequenceName((dir / "nothing.0001.exr").string())).frames.empty());
-    std::filesystem::remove_all(dir);
+    EXPECT_TRUE(ScanSequence(ParseSequenceName(dir / "nothing.0001.exr")).frames.empty());
 }
 
 } // namespace

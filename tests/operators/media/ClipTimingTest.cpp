@@ -7,51 +7,34 @@
 namespace Orvane {
 namespace {
 
-ClipPlacement Clip10(double start = 100) {
-    ClipPlacement c;
-    c.start = start;
-    c.trimIn = 2;
-    c.trimOut = 5; // file frames 2..5 used
-    c.end = start + 3;
-    return c;
-}
-
-TEST(ClipTiming, HoldsTrimsAndReverse) {
-    ClipPlacement c = Clip10();
-    c.holdFirst = 2;
-    c.holdLast = 1;
-    c.end = c.start + ElementLength(c) - 1; // 2 + 4 + 1 = 7 frames
-    ASSERT_EQ(ElementLength(c), 7);
-    const int64_t forward[] = {2, 2, 2, 3, 4, 5, 5};
-    for (int i = 0; i < 7; ++i) EXPECT_EQ(FileFrameAt(c, 100 + i), forward[i]) << i;
-    // Reversal follows the holds: the head holds the last used frame.
-    c.reverse = true;
-    const int64_t backward[] = {5, 5, 5, 4, 3, 2, 2};
-    for (int i = 0; i < 7; ++i) EXPECT_EQ(FileFrameAt(c, 100 + i), backward[i]) << i;
-    // Fractional times (fields) truncate toward the frame they lie in.
-    c.reverse = false;
-    EXPECT_EQ(FileFrameAt(c, 103.5), 3);
-    EXPECT_FALSE(FileFrameAt(c, 99.5));
-    EXPECT_FALSE(FileFrameAt(c, 107));
-}
-
-TEST(ClipTiming, LoopRepeatsAfterTheEndOnly) {
-    ClipPlacement c = Clip10();
-    c.loop = true;
-    for (int i = 0; i < 12; ++i) EXPECT_EQ(FileFrameAt(c, 100 + i), 2 + i % 4) << i;
-    EXPECT_EQ(FileFrameAt(c, 100 + 4000003), 5); // far away, no slow walk
-    EXPECT_FALSE(FileFrameAt(c, 99));            // before the start nothing, loop or not
-    // Up to 0.00005 before the end the last frame holds, and a loop does not wrap yet.
-    EXPECT_EQ(FileFrameAt(c, 103.99994), 5);
-    EXPECT_EQ(FileFrameAt(c, 104), 2);
-    c.loop = false;
-    EXPECT_EQ(FileFrameAt(c, 103.99994), 5);
-    EXPECT_FALSE(FileFrameAt(c, 103.99996));
-    c.loop = true;
+// A clip at frame 100 using file frames 2..5; each row sets holds, reverse
+// and loop, and gives the file frame at times (-1: none).
+TEST(ClipTiming, HoldsTrimsReverseAndLoop) {
+    const struct {
+        int holdFirst, holdLast;
+        bool reverse, loop;
+        std::vector<std::pair<double, int64_t>> frames;
+    } rows[] = {
+        // Holds of 2 and 1 make 7 frames; fields truncate toward the frame they lie in.
+        {2, 1, false, false, {{99.5, -1}, {100, 2}, {102, 2}, {103, 3}, {103.5, 3}, {104, 4}, {106, 5}, {107, -1}}},
+        // Reversal follows the holds: the head holds the last used frame.
+        {2, 1, true, false, {{100, 5}, {102, 5}, {103, 4}, {104, 3}, {105, 2}, {106, 2}}},
+        // A loop repeats after the end only, far away too (no slow walk); up
+        // to 0.00005 before the end the last frame holds and no loop wraps.
+        {0, 0, false, true, {{99, -1}, {100, 2}, {103, 5}, {104, 2}, {111, 5}, {4000103, 5}, {103.99994, 5}}},
+        {0, 0, false, false, {{103.99994, 5}, {103.99996, -1}}},
+    };
+    for (const auto &row : rows) {
+        ClipPlacement c;
+        c.start = 100, c.trimIn = 2, c.trimOut = 5, c.holdFirst = row.holdFirst, c.holdLast = row.holdLast;
+        c.reverse = row.reverse, c.loop = row.loop;
+        c.end = c.start + ElementLength(c) - 1;
+        for (auto [t, frame] : row.frames) EXPECT_EQ(FileFrameAt(c, t).value_or(-1), frame) << t;
+    }
     // A one-frame range looping holds that frame everywhere after the start.
-    c.trimOut = c.trimIn;
-    c.end = c.start;
-    for (double t : {100.0, 101.0, 150.5}) EXPECT_EQ(FileFrameAt(c, t), 2) << t;
+    ClipPlacement one;
+    one.start = one.end = 100, one.trimIn = one.trimOut = 2, one.loop = true;
+    for (double t : {100.0, 101.0, 150.5}) EXPECT_EQ(FileFrameAt(one, t), 2) << t;
 }
 
 TEST(ClipTiming, ClipSearchFindsTheElementOrTheOneBeforeAGap) {

@@ -1,29 +1,22 @@
 #pragma once
 // Helpers shared by the still image format tests: making a format from its
-// registry row, saving to and loading from memory, test images with known
-// 8-bit and 16-bit values, a temporary folder, and running the netpbm and
-// ImageMagick programs to make and read files independently.
+// registry row, saving to and loading from memory (through a tool's options
+// when given), test images with known values, comparing images and regions,
+// a temporary folder, and running netpbm and ImageMagick to make and read
+// files independently.
 #include <gtest/gtest.h>
 
-#include <sys/stat.h>
-#include <unistd.h>
-
 #include <algorithm>
+#include <array>
 #include <atomic>
-#include <cstdio>
-#include <cstdlib>
+#include <cmath>
+#include <cstring>
 #include <fstream>
-#include <memory>
-#include <string>
-#include <vector>
+#include <functional>
 
 #include "host/core/Registry.h"
-#include "host/core/Tags.h"
 #include "host/flow/DataTypes.h"
-#include "host/flow/Operator.h"
-#include "host/flow/OrvaneDoc.h"
 #include "host/flow/Request.h"
-#include "host/image/Image.h"
 #include "host/image/NewImage.h"
 #include "host/image/PixelConvert.h"
 #include "host/media/IOClass.h"
@@ -33,6 +26,9 @@
 namespace Orvane::FmtTest {
 
 using Bytes = std::vector<uint8_t>;
+using Options = std::vector<std::pair<const char *, double>>;
+using Choices = std::vector<std::pair<const char *, const char *>>;
+using Orvane::Test::TempDir;
 
 /// Loads the tool library once for the whole suite.
 class FormatSuite : public ::testing::Test {
@@ -48,34 +44,23 @@ inline Ref<ImageFormat> MakeFormat(const char *id) {
     return f;
 }
 
-/// Saves `img` with a fresh format object (options at their defaults unless
-/// `setup` changes the object first). Empty on failure, with the reason in `error`.
-template <class Setup> Bytes Save(const char *id, Image *img, Setup setup, std::string *error = nullptr) {
+/// Saves `img` with a fresh format at its defaults, no tool involved.
+inline Bytes Save(const char *id, Image *img) {
     Ref<ImageFormat> f = MakeFormat(id);
-    if (!f) return {};
-    f->SetupSave(nullptr, nullptr);
-    setup(*f);
     MemoryIO io;
-    if (!f->SaveHeader(&io, img) || !f->SaveFrame(0, img)) {
-        if (error) *error = f->Error();
-        ADD_FAILURE() << id << " save: " << f->Error();
-        return {};
-    }
+    f->SetupSave(nullptr, nullptr);
+    EXPECT_TRUE(f->SaveHeader(&io, img) && f->SaveFrame(0, img)) << id << " save: " << f->Error();
     return io.Data();
 }
-inline Bytes Save(const char *id, Image *img) {
-    return Save(id, img, [](ImageFormat &) {});
-}
 
-using Options = std::vector<std::pair<const char *, double>>;
-
-/// Saves through a writing tool: the format adds its inputs to a tool, the
-/// options are given to a request for that tool, and SetupSave reads them.
-inline Bytes SaveWith(const char *id, Image *img, const Options &options, std::string *error = nullptr) {
+/// Saves to `io` through a writing tool: the format adds its inputs to a
+/// tool, the options are given to a request for that tool, and SetupSave
+/// reads them. False with the reason in `error` on failure.
+inline bool SaveTo(IOClass *io, const char *id, Image *img, const Options &options, std::string &error,
+                   const std::atomic<bool> *abort = nullptr) {
     OrvaneDoc doc;
     Operator *tool = Orvane::Test::AddImageSource(doc, "Saver", Ref<Image>(img));
     Ref<ImageFormat> f = MakeFormat(id);
-    if (!tool || !f) return {};
     f->AddSaveInputs(tool);
     Request req(tool, nullptr, 0.0, 0, nullptr);
     for (const auto &[name, value] : options) {
@@ -84,16 +69,18 @@ inline Bytes SaveWith(const char *id, Image *img, const Options &options, std::s
         if (in) req.SetInputData(in, MakeRef<Number>(value).Get());
     }
     f->SetupSave(tool, &req);
-    MemoryIO io;
-    const bool ok = f->SaveHeader(&io, img) && f->SaveFrame(0, img);
+    f->abortFlag = abort;
+    const bool ok = f->SaveHeader(io, img) && f->SaveFrame(0, img);
     f->CleanupSave(tool);
-    if (!ok) {
-        if (error)
-            *error = f->Error();
-        else
-            ADD_FAILURE() << id << " save: " << f->Error();
-        return {};
-    }
+    error = f->Error();
+    return ok;
+}
+
+/// SaveTo memory: the file (empty, and a test failure, when it fails).
+inline Bytes SaveWith(const char *id, Image *img, const Options &options) {
+    MemoryIO io;
+    std::string error;
+    EXPECT_TRUE(SaveTo(&io, id, img, options, error)) << id << " save: " << error;
     return io.Data();
 }
 
@@ -104,38 +91,48 @@ struct LoadResult {
 };
 
 /// Reads one frame of `data`; `prepare` may set the proxy scale, the abort
-/// word or attributes before the header is read.
+/// word or attributes before the header is read. A failure must say why.
 template <class Prepare> LoadResult Load(const char *id, const Bytes &data, const TagList &tags, Prepare prepare) {
     LoadResult r;
     Ref<ImageFormat> f = MakeFormat(id);
-    if (!f) return r;
     prepare(*f);
     MemoryIO io(data);
     r.headerOk = f->LoadHeader(&io);
-    if (!r.headerOk) {
-        r.error = f->Error();
-        EXPECT_FALSE(r.error.empty()) << "a failure says why";
-        return r;
-    }
-    Ref<Image> img;
-    if (!f->LoadFrameTagList(0, img, tags)) {
-        r.error = f->Error();
-        EXPECT_FALSE(r.error.empty()) << "a failure says why";
-        return r;
-    }
-    r.image = img;
+    if (r.headerOk && f->LoadFrameTagList(0, r.image, tags)) return r;
+    r.image = nullptr;
+    r.error = f->Error();
+    EXPECT_FALSE(r.error.empty()) << id << ": a failure says why";
     return r;
 }
 inline LoadResult Load(const char *id, const Bytes &data, const TagList &tags = {}) {
     return Load(id, data, tags, [](ImageFormat &) {});
 }
 
-/// Reads one frame at a proxy scale, of a region when given.
-inline LoadResult LoadAt(const char *id, const Bytes &data, int proxy, const ImgRectI *region = nullptr) {
-    ImageDomain domain(region ? *region : ImgRectI());
-    TagList tags;
-    if (region) tags.Add({ClipFrameRegion, static_cast<const void *>(&domain)});
-    return Load(id, data, tags, [proxy](ImageFormat &f) { f.proxyScale = proxy; });
+/// Reads one frame at a proxy scale.
+inline LoadResult LoadAt(const char *id, const Bytes &data, int proxy) {
+    return Load(id, data, {}, [proxy](ImageFormat &f) { f.proxyScale = proxy; });
+}
+
+/// Loads through a reading tool whose inputs hold `options` and the choices
+/// (Part, View, Layer...), for stereo eye `eye`; null with `error` on failure.
+inline Ref<Image> LoadWith(const char *id, const Bytes &data, const Options &options, const Choices &choices = {},
+                           int eye = 0, std::string *error = nullptr) {
+    OrvaneDoc doc;
+    Operator *tool = Orvane::Test::AddImageSource(doc, "Loader", nullptr);
+    Ref<ImageFormat> f = MakeFormat(id);
+    f->AddLoadInputs(tool);
+    Request req(tool, nullptr, 0.0, 0, nullptr);
+    for (const auto &[name, value] : options) req.SetInputData(tool->FindInput(name), MakeRef<Number>(value).Get());
+    for (const auto &[name, v] : choices) req.SetInputData(tool->FindInput(name), MakeRef<IDValue>(OvID(v)).Get());
+    f->SetupLoad(tool, &req);
+    f->SetAttrsTagList({{FormatStereoEye, eye}});
+    MemoryIO io(data);
+    Ref<Image> img;
+    if (!f->LoadHeader(&io) || !f->LoadFrameTagList(0, img, {})) {
+        if (error) *error = f->Error();
+        return nullptr;
+    }
+    return img;
 }
 
 /// 16-bit view of pixel (x, y) of the data window.
@@ -147,11 +144,19 @@ inline Pixel At(const Image &img, int x, int y) {
     return p;
 }
 
-inline void Put(Image &img, int x, int y, const Pixel &p) { StorePixel(img.Depth(), &p, 1, img.PixelAddress(x, y)); }
+inline Ref<Image> MakeImage(int w, int h, int depth, const std::function<Pixel(int, int)> &f) {
+    Ref<Image> img = NewImageTagList({{ImgWidth, w}, {ImgHeight, h}, {ImgDepth, depth}});
+    EXPECT_TRUE(img && img->AllocScanLineData());
+    for (int y = 0; y < h; ++y)
+        for (int x = 0; x < w; ++x) {
+            const Pixel p = f(x, y);
+            StorePixel(depth, &p, 1, img->PixelAddress(x, y));
+        }
+    return img;
+}
 
-/// A w x h RGBA image of `depth` whose 8-bit values differ from pixel to
-/// pixel (a hash of x, y and the channel), with some equal neighbours so
-/// that run-length coders see runs too.
+/// 8-bit values that differ from pixel to pixel (a hash of x, y and the
+/// channel), with some equal neighbours so that run-length coders see runs.
 inline uint8_t Value8(int x, int y, int c, unsigned seed = 1) {
     if ((x / 3 + y) % 4 == 0) x = 0; // runs
     unsigned h = static_cast<unsigned>(x) * 73856093u ^ static_cast<unsigned>(y) * 19349663u ^
@@ -159,19 +164,127 @@ inline uint8_t Value8(int x, int y, int c, unsigned seed = 1) {
     h ^= h >> 13, h *= 0x5bd1e995u, h ^= h >> 15;
     return static_cast<uint8_t>(h);
 }
+/// A w x h RGBA image of `depth` holding Value8 in every channel.
 inline Ref<Image> Image8(int w, int h, unsigned seed = 1, int depth = DepthRGBAInt8) {
-    Ref<Image> img = NewImageTagList({{ImgWidth, w}, {ImgHeight, h}, {ImgDepth, depth}});
-    EXPECT_TRUE(img && img->AllocScanLineData());
-    for (int y = 0; y < h; ++y)
-        for (int x = 0; x < w; ++x) {
-            Pixel p;
-            p.R = static_cast<uint16_t>(Value8(x, y, 0, seed) * 257);
-            p.G = static_cast<uint16_t>(Value8(x, y, 1, seed) * 257);
-            p.B = static_cast<uint16_t>(Value8(x, y, 2, seed) * 257);
-            p.A = static_cast<uint16_t>(Value8(x, y, 3, seed) * 257);
-            Put(*img, x, y, p);
+    return MakeImage(w, h, depth, [seed](int x, int y) {
+        auto v = [&](int c) { return static_cast<uint16_t>(Value8(x, y, c, seed) * 257); };
+        return Pixel{v(0), v(1), v(2), v(3)};
+    });
+}
+
+/// A smooth picture with some detail (what lossy coders are made for), 8-bit
+/// values; opaque unless `alpha`, which gives a smooth ramp.
+inline Pixel Smooth(int x, int y, bool alpha = false) {
+    const auto v = [](double t) { return uint16_t(std::lround(127.5 + 120 * std::sin(t)) * 257); };
+    return {v(x * 0.05 + y * 0.02), v(y * 0.07 - 1.0), v((x + y) * 0.03 + 2.0),
+            alpha ? v(x * 0.04 - y * 0.03) : uint16_t(65535)};
+}
+
+/// `got` has the window of `want` and its pixels within `tolerance` (as
+/// floats; 0: exactly), opaque unless `alpha`; reports the first few others.
+inline void ExpectSamePixels(const Image &want, const Image &got, bool alpha = true, float tolerance = 0) {
+    ASSERT_EQ(got.DataWindow(), want.DataWindow());
+    const ImgRectI w = want.DataWindow();
+    int bad = 0;
+    for (int y = w.y0; y < w.y1; ++y)
+        for (int x = w.x0; x < w.x1; ++x) {
+            const FltPixel a = want.GetFlt(x, y), b = got.GetFlt(x, y);
+            const float d = std::max({std::fabs(a.R - b.R), std::fabs(a.G - b.G), std::fabs(a.B - b.B),
+                                      std::fabs((alpha ? a.A : 1.f) - b.A)});
+            if (!(d <= tolerance) && ++bad < 4) ADD_FAILURE() << "pixel " << x << "," << y << " off by " << d;
         }
-    return img;
+}
+
+/// Main rows and auxiliary planes of `got` hold the bytes of `want` over `win`.
+inline void ExpectSameRows(const Image &want, const Image &got, const ImgRectI &win) {
+    ASSERT_EQ(got.Depth(), want.Depth());
+    const size_t bpp = static_cast<size_t>(want.BytesPerPixel());
+    for (int y = win.y0; y < win.y1; ++y) {
+        ASSERT_EQ(std::memcmp(got.PixelAddress(win.x0, y), want.PixelAddress(win.x0, y), win.Width() * bpp), 0)
+            << "row " << y;
+        for (int k = 0; k < int(AuxChannelKind::Count); ++k) {
+            const auto kind = static_cast<AuxChannelKind>(k);
+            if (!want.HasAuxChannel(kind)) continue;
+            ASSERT_TRUE(got.HasAuxChannel(kind)) << k;
+            const float *a = want.AuxRow(kind, y) + (win.x0 - want.DataWindow().x0);
+            const float *b = got.AuxRow(kind, y) + (win.x0 - got.DataWindow().x0);
+            ASSERT_EQ(std::memcmp(a, b, sizeof(float) * win.Width()), 0) << "auxiliary " << k << " row " << y;
+        }
+    }
+}
+
+/// Regions of a file (all of it, inside, one corner pixel, reaching out of
+/// the data window on either side, wholly outside it) read as exactly the
+/// crop of the full read; outside the window the image is empty.
+inline void ExpectRegionsMatchFullRead(const char *id, const Bytes &data) {
+    const LoadResult full = Load(id, data);
+    ASSERT_TRUE(full.image) << full.error;
+    const ImgRectI w = full.image->DataWindow();
+    for (const ImgRectI &rect :
+         {w, ImgRectI(w.x0 + 3, w.y0 + 2, w.x1 - 5, w.y1 - 3), ImgRectI(w.x1 - 1, w.y1 - 1, w.x1, w.y1),
+          ImgRectI(w.x0 - 9, w.y0 - 9, w.x0 + 4, w.y0 + 3), ImgRectI(w.x1 - 6, w.y1 - 2, w.x1 + 30, w.y1 + 30),
+          ImgRectI(w.x1 + 5, w.y1 + 5, w.x1 + 9, w.y1 + 9)}) {
+        SCOPED_TRACE(::testing::Message()
+                     << id << " region " << rect.x0 << "," << rect.y0 << " " << rect.x1 << "," << rect.y1);
+        const ImageDomain region(rect);
+        const LoadResult part = Load(id, data, {{ClipFrameRegion, &region}});
+        ASSERT_TRUE(part.image) << part.error;
+        const ImgRectI want = rect & w;
+        if (want.IsNull()) {
+            EXPECT_TRUE(part.image->DataWindow().IsNull());
+            continue;
+        }
+        ASSERT_EQ(part.image->DataWindow(), want);
+        ExpectSameRows(*full.image, *part.image, want);
+    }
+}
+
+/// Damaged copies of a good file fail with a reason or read to a sane image:
+/// every cut short of the file (each within the first `header` or 256
+/// bytes, then 64 spread over the rest; a reader may do without the last
+/// `tail` bytes, an end marker), each of the first `header` bytes
+/// flipped three ways, and 300 scatterings of a few bytes after the header,
+/// a third of them cut short too. `sizeKept`: a damaged read that succeeds
+/// has the stored size. `prepare` readies each format object. Returns how
+/// many of the scattered reads failed.
+inline int ExpectDamageFailsCleanly(
+    const char *id, const Bytes &good, size_t header, bool sizeKept, size_t tail = 0,
+    void (*prepare)(ImageFormat &) = [](ImageFormat &) {}) {
+    auto Load = [&](const char *format, const Bytes &data) { return FmtTest::Load(format, data, {}, prepare); };
+    const LoadResult whole = Load(id, good);
+    EXPECT_TRUE(whole.image) << whole.error;
+    if (!whole.image) return 0;
+    auto sane = [&](const LoadResult &r, bool sameSize) {
+        if (!r.image) return false;
+        EXPECT_GT(r.image->Width(), 0);
+        EXPECT_GT(r.image->Height(), 0);
+        EXPECT_TRUE(!sameSize ||
+                    (r.image->Width() == whole.image->Width() && r.image->Height() == whole.image->Height()));
+        return true;
+    };
+    const size_t dense = std::max<size_t>(header, 256), step = std::max<size_t>(1, good.size() / 64);
+    const size_t end = good.size() - tail;
+    for (size_t cut = 0; cut < end; cut += cut < dense ? 1 : step)
+        EXPECT_FALSE(Load(id, Bytes(good.begin(), good.begin() + long(cut))).image) << id << " cut at " << cut;
+    EXPECT_FALSE(Load(id, Bytes(good.begin(), good.begin() + long(end - 1))).image) << id << " cut at " << end - 1;
+    for (size_t at = 0; at < std::min(header, good.size()); ++at)
+        for (uint8_t mask : {uint8_t(0xff), uint8_t(0x80), uint8_t(0x01)}) {
+            Bytes bad = good;
+            bad[at] ^= mask;
+            sane(Load(id, bad), false);
+        }
+    uint32_t state = 12345;
+    auto next = [&state] { return state = state * 1664525u + 1013904223u; };
+    const size_t from = std::max<size_t>(header, 2);
+    int failed = 0;
+    for (int round = 0; round < 300 && from < good.size(); ++round) {
+        Bytes bad = good;
+        for (int i = 0, hits = 1 + int(next() % 4); i < hits; ++i)
+            bad[from + next() % (bad.size() - from)] = uint8_t(next() >> 24);
+        if (round % 3 == 0) bad.resize(from + next() % (bad.size() - from));
+        failed += !sane(Load(id, bad), sizeKept);
+    }
+    return failed;
 }
 
 /// A memory stream that takes only the first `limit` bytes written: a full disk.
@@ -189,28 +302,8 @@ private:
 
 // ---- files and programs ----
 
-/// A folder under /tmp removed with its files when the test ends.
-struct TempDir {
-    std::string path;
-    TempDir() {
-        char buf[] = "/tmp/orvane-fmt-XXXXXX";
-        const char *p = mkdtemp(buf);
-        EXPECT_NE(p, nullptr);
-        path = p ? p : "/tmp";
-    }
-    ~TempDir() {
-        const std::string cmd = "rm -rf '" + path + "'";
-        if (path.rfind("/tmp/orvane-fmt-", 0) == 0) (void)std::system(cmd.c_str());
-    }
-    std::string operator/(const std::string &name) const { return path + "/" + name; }
-};
-
-inline bool HaveProgram(const char *name) {
-    const std::string cmd = std::string("command -v ") + name + " >/dev/null 2>&1";
-    return std::system(cmd.c_str()) == 0;
-}
-
 inline bool RunShell(const std::string &cmd) { return std::system((cmd + " 2>/dev/null").c_str()) == 0; }
+inline bool HaveProgram(const char *name) { return RunShell(std::string("command -v ") + name + " >/dev/null"); }
 
 /// Standard output of a command (binary).
 inline Bytes Capture(const std::string &cmd) {
@@ -227,7 +320,7 @@ inline Bytes Capture(const std::string &cmd) {
 /// Standard output of a command as text.
 inline std::string CaptureText(const std::string &cmd) {
     const Bytes out = Capture(cmd);
-    return std::string(out.begin(), out.end());
+    return {out.begin(), out.end()};
 }
 
 inline Bytes ReadFile(const std::string &path) {
@@ -239,43 +332,19 @@ inline void WriteFile(const std::string &path, const Bytes &data) {
     f.write(reinterpret_cast<const char *>(data.data()), static_cast<std::streamsize>(data.size()));
 }
 
-/// A binary PPM (rows top first) of w x h, pixel (x, row) = rgb(x, row).
-template <class Rgb> Bytes MakePPM(int w, int h, Rgb rgb) {
-    const std::string head = "P6\n" + std::to_string(w) + " " + std::to_string(h) + "\n255\n";
-    Bytes out(head.begin(), head.end());
+/// Pixels of `img` (rows from the bottom) that differ from 8-bit RGBA
+/// samples stored top row first; alpha is compared only when `alpha`.
+/// -1 when the sizes differ.
+inline int Mismatches(const Image &img, const Bytes &rgba, int w, int h, bool alpha = true) {
+    if (img.Width() != w || img.Height() != h || rgba.size() != size_t(w) * h * 4) return -1;
+    int bad = 0;
     for (int row = 0; row < h; ++row)
         for (int x = 0; x < w; ++x) {
-            const auto c = rgb(x, row);
-            out.insert(out.end(), {c[0], c[1], c[2]});
+            const Pixel p = At(img, x, h - 1 - row);
+            const uint8_t *q = &rgba[(size_t(row) * w + x) * 4];
+            bad += p.R != q[0] * 257 || p.G != q[1] * 257 || p.B != q[2] * 257 || (alpha && p.A != q[3] * 257);
         }
-    return out;
-}
-
-/// Pixels of a P6 or P7-free netpbm PPM (maxval 255), rows top first, 3 bytes each.
-inline bool ParsePPM(const Bytes &ppm, int &w, int &h, Bytes &rgb) {
-    size_t pos = 0;
-    auto token = [&]() {
-        std::string t;
-        while (pos < ppm.size()) {
-            const char c = static_cast<char>(ppm[pos]);
-            if (c == '#') {
-                while (pos < ppm.size() && ppm[pos] != '\n') ++pos;
-            } else if (isspace(static_cast<unsigned char>(c))) {
-                if (!t.empty()) break;
-                ++pos;
-            } else {
-                t.push_back(c), ++pos;
-            }
-        }
-        return t;
-    };
-    if (token() != "P6") return false;
-    w = std::atoi(token().c_str()), h = std::atoi(token().c_str());
-    const int maxval = std::atoi(token().c_str());
-    ++pos;
-    if (maxval != 255 || w <= 0 || h <= 0 || ppm.size() < pos + size_t(w) * h * 3) return false;
-    rgb.assign(ppm.begin() + static_cast<long>(pos), ppm.begin() + static_cast<long>(pos + size_t(w) * h * 3));
-    return true;
+    return bad;
 }
 
 } // namespace Orvane::FmtTest

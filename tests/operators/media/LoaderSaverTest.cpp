@@ -4,9 +4,6 @@
 // (numbering, folders, failures).
 #include <gtest/gtest.h>
 
-#include <algorithm>
-#include <cmath>
-#include <cstring>
 #include <filesystem>
 
 #include "host/flow/Engine.h"
@@ -23,20 +20,10 @@ constexpr int W = 6, H = 4;
 
 /// Frame k of the test sequence: R = 1000 k + x + 10 y, G 500, B 65535, alpha one half.
 Ref<Image> Frame16(int k) {
-    Ref<Image> img = NewImageTagList({{ImgWidth, W}, {ImgHeight, H}, {ImgDepth, DepthRGBAInt16}});
-    img->AllocScanLineData();
-    for (int y = 0; y < H; ++y)
-        for (int x = 0; x < W; ++x) {
-            uint16_t *p = reinterpret_cast<uint16_t *>(img->PixelAddress(x, y));
-            p[0] = static_cast<uint16_t>(1000 * k + x + 10 * y);
-            p[1] = 500;
-            p[2] = 65535;
-            p[3] = 32768;
-        }
-    return img;
+    return MakeImage(W, H, DepthRGBAInt16, [k](int x, int y) {
+        return Pixel{uint16_t(1000 * k + x + 10 * y), 500, 65535, 32768};
+    });
 }
-
-uint16_t R16(const Image &img, int x, int y) { return reinterpret_cast<const uint16_t *>(img.PixelAddress(x, y))[0]; }
 
 class LoaderSaver : public FormatSuite {
 protected:
@@ -59,7 +46,20 @@ protected:
     /// The file number a time shows (R of pixel 0,0 / 1000), -1 for no image.
     int FileAt(double t) {
         Ref<Image> img = Orvane::Test::EvalImage(loader, t);
-        return img ? R16(*img, 0, 0) / 1000 : -1;
+        return img ? At(*img, 0, 0).R / 1000 : -1;
+    }
+    /// Evaluates a tool's main output for a render task.
+    static Ref<Parameter> Render(Operator *op, double t, RenderTask &task, uint32_t flags = 0) {
+        EvalOptions options;
+        options.task = &task, options.flags = flags;
+        return Evaluate(op->FindMainOutput(), t, options);
+    }
+    /// The frame a file holds, read back through a clip.
+    static Ref<Image> ReadBack(const std::string &path) {
+        std::string error;
+        Ref<Image> img = Clip(path).GetFrameTagList(0, {}, error);
+        EXPECT_TRUE(img) << error;
+        return img;
     }
     std::string LastConsole() {
         const auto lines = doc.ConsoleLines();
@@ -84,50 +84,36 @@ TEST_F(LoaderSaver, LoaderPlacesTheSequenceOnTheTimeLine) {
     EXPECT_EQ(FileAt(15), -1);
     EXPECT_NE(LastConsole().find("Plate"), std::string::npos);
     Set(loader, "Reverse", ScriptVal(1));
-    EXPECT_EQ(FileAt(10), 4);
-    EXPECT_EQ(FileAt(14), 1);
+    for (auto [t, file] : {std::pair{10, 4}, {14, 1}}) EXPECT_EQ(FileAt(t), file) << t;
     Set(loader, "Loop", ScriptVal(1));
     Set(loader, "Reverse", ScriptVal(0));
-    EXPECT_EQ(FileAt(15), 1);
-    EXPECT_EQ(FileAt(17), 2);
-    // The trims choose the files used.
+    for (auto [t, file] : {std::pair{15, 1}, {17, 2}}) EXPECT_EQ(FileAt(t), file) << t;
+    // The trims choose the files used (looping the two used frames).
     Set(loader, "ClipTimeStart", ScriptVal(2));
     Set(loader, "HoldFirstFrame", ScriptVal(0));
-    EXPECT_EQ(FileAt(10), 3);
-    EXPECT_EQ(FileAt(11), 4);
-    EXPECT_EQ(FileAt(12), 3); // looping the two used frames
+    for (auto [t, file] : {std::pair{10, 3}, {11, 4}, {12, 3}}) EXPECT_EQ(FileAt(t), file) << t;
 }
 
-TEST_F(LoaderSaver, MissingFramesFailHoldOrFill) {
+TEST_F(LoaderSaver, MissingFramesFillHoldOrFail) {
     std::filesystem::remove(dir / "plate.1002.raw");
-    EXPECT_EQ(FileAt(0), 1); // records the clip's frame size
-    EXPECT_EQ(FileAt(1), -1);
-    // The file once, and the frame by the file's own number.
-    EXPECT_EQ(LastConsole(), "Plate failed to load file \"" + (dir / "plate.1002.raw") +
-                                 "\" (frame 1002) : No such file or directory");
-    Set(loader, "MissingFrames", ScriptVal(1));
-    EXPECT_EQ(FileAt(1), 1);
-    EXPECT_EQ(FileAt(2), 3);
+    // A colour, before anything was read: sized from the header of a frame
+    // that exists, not from the document.
     Set(loader, "MissingFrames", ScriptVal(2));
     Set(loader, "Red", ScriptVal(0.25));
     Set(loader, "Alpha", ScriptVal(1));
-    Ref<Image> filled = Orvane::Test::EvalImage(loader, 1);
-    ASSERT_TRUE(filled);
-    const FltPixel p = filled->GetFlt(2, 2);
-    EXPECT_EQ(p.R, 0.25f);
-    EXPECT_EQ(p.G, 0.0f);
-    EXPECT_EQ(p.A, 1.0f);
-}
-
-TEST_F(LoaderSaver, AColourForAMissingFrameTakesTheSizeOfTheClipsFrames) {
-    // Nothing read yet: the size comes from the header of a frame that exists, not the document.
-    std::filesystem::remove(dir / "plate.1002.raw");
-    Set(loader, "MissingFrames", ScriptVal(2));
     ASSERT_NE(doc.GetFrameFormat().width, W);
     Ref<Image> filled = Orvane::Test::EvalImage(loader, 1);
     ASSERT_TRUE(filled);
-    EXPECT_EQ(filled->Width(), W);
-    EXPECT_EQ(filled->Height(), H);
+    EXPECT_EQ(filled->DataWindow(), ImgRectI(0, 0, W, H));
+    EXPECT_EQ(filled->GetFlt(2, 2), (FltPixel{0.25f, 0.f, 0.f, 1.f}));
+    Set(loader, "MissingFrames", ScriptVal(1));
+    EXPECT_EQ(FileAt(1), 1);
+    EXPECT_EQ(FileAt(2), 3);
+    // Failing names the file once, and the frame by the file's own number.
+    Set(loader, "MissingFrames", ScriptVal(0));
+    EXPECT_EQ(FileAt(1), -1);
+    EXPECT_EQ(LastConsole(), "Plate failed to load file \"" + (dir / "plate.1002.raw") +
+                                 "\" (frame 1002) : No such file or directory");
 }
 
 TEST_F(LoaderSaver, AHeaderAskingForMoreThanTheMemoryLimitIsRefusedBeforeAllocating) {
@@ -160,7 +146,7 @@ TEST_F(LoaderSaver, AlphaOptionsAndDepth) {
     for (int y = 0; y < H; ++y)
         for (int x = 0; x < W; ++x) {
             const double r = 1000 + x + 10 * y;
-            EXPECT_EQ(R16(*post, x, y), std::lround(r * 32768 / 65535)) << x << "," << y;
+            EXPECT_EQ(At(*post, x, y).R, std::lround(r * 32768 / 65535)) << x << "," << y;
         }
     Set(loader, "PostMultiplyByAlpha", ScriptVal(0));
     Set(loader, "InvertAlpha", ScriptVal(1));
@@ -178,10 +164,7 @@ TEST_F(LoaderSaver, AlphaOptionsAndDepth) {
 TEST_F(LoaderSaver, ProxyRendersAreShrunkByWholeFactors) {
     RenderTask task;
     task.proxyScale = 2;
-    EvalOptions options;
-    options.task = &task;
-    options.flags = ReqFlagProxy;
-    Ref<Parameter> v = Evaluate(loader->FindMainOutput(), 0, options);
+    Ref<Parameter> v = Render(loader, 0, task, ReqFlagProxy);
     auto *img = dynamic_cast<Image *>(v.Get());
     ASSERT_NE(img, nullptr);
     EXPECT_EQ(img->Width(), W / 2);
@@ -199,9 +182,7 @@ TEST_F(LoaderSaver, SaverNumbersFilesAndWritesOnlyInRenders) {
     Set(loader, "GlobalIn", ScriptVal(3));
     RenderTask task;
     task.startTime = 3;
-    EvalOptions options;
-    options.task = &task;
-    auto render = [&](double t) { return Evaluate(saver->FindMainOutput(), t, options); };
+    auto render = [&](double t) { return Render(saver, t, task); };
 
     // Without "Create Folder During Render" a missing folder fails the frame.
     EXPECT_FALSE(render(5));
@@ -210,11 +191,9 @@ TEST_F(LoaderSaver, SaverNumbersFilesAndWritesOnlyInRenders) {
     ASSERT_TRUE(render(5));
     EXPECT_EQ(saver->FrameFileName(5, &task), dir / "out/shot.1005.raw");
     // The file holds the loaded frame exactly.
-    Clip back(dir / "out/shot.1005.raw");
-    std::string error;
-    Ref<Image> read = back.GetFrameTagList(0, {}, error);
-    ASSERT_TRUE(read) << error;
-    EXPECT_EQ(R16(*read, 4, 2), 3000 + 4 + 20);
+    Ref<Image> read = ReadBack(dir / "out/shot.1005.raw");
+    ASSERT_TRUE(read);
+    EXPECT_EQ(At(*read, 4, 2).R, 3000 + 4 + 20);
 
     // Saver-relative numbering counts from the render's first frame.
     Set(saver, "SetSequenceStart", ScriptVal(1));
@@ -230,8 +209,7 @@ TEST_F(LoaderSaver, SaverNumbersFilesAndWritesOnlyInRenders) {
 
     // An interactive look passes the image on and writes nothing.
     task.interactive = true;
-    options.flags = ReqFlagInteractive;
-    EXPECT_TRUE(render(6));
+    EXPECT_TRUE(Render(saver, 6, task, ReqFlagInteractive));
     EXPECT_FALSE(std::filesystem::exists(dir / "out/shot.1003.raw"));
 }
 
@@ -273,18 +251,11 @@ TEST_F(LoaderSaver, SaverCutsToTheFrameAndCanSaveAlphaAsColor) {
     Set(saver, "Clip", ScriptVal(dir / "cut.raw"));
     Set(saver, "SaveAlphaToColor", ScriptVal(1));
     RenderTask task;
-    EvalOptions options;
-    options.task = &task;
-    ASSERT_TRUE(Evaluate(saver->FindMainOutput(), 0, options));
-    Clip back(dir / "cut.raw");
-    std::string error;
-    Ref<Image> read = back.GetFrameTagList(0, {}, error);
-    ASSERT_TRUE(read) << error;
+    ASSERT_TRUE(Render(saver, 0, task));
+    Ref<Image> read = ReadBack(dir / "cut.raw");
+    ASSERT_TRUE(read);
     EXPECT_EQ(read->DataWindow(), ImgRectI(0, 0, 8, 6));
-    const FltPixel p = read->GetFlt(3, 3);
-    EXPECT_EQ(p.R, 0.75f);
-    EXPECT_EQ(p.B, 0.75f);
-    EXPECT_EQ(p.A, 0.75f);
+    EXPECT_EQ(read->GetFlt(3, 3), (FltPixel{0.75f, 0.75f, 0.75f, 0.75f}));
 }
 
 } // namespace

@@ -3,18 +3,10 @@
 // and Metadata; files built byte by byte here (and turned tiled, multi-part
 // and multi-view by the OpenEXR tools) read to known values; the sample
 // images against what exrheader reports; damaged files; regions; options.
-#include <gtest/gtest.h>
-
-#include <cmath>
-#include <cstdlib>
-#include <cstring>
 #include <filesystem>
-#include <functional>
 #include <map>
 #include <regex>
-#include <string>
 #include <tuple>
-#include <vector>
 
 #include "host/image/Half.h"
 #include "tests/operators/media/FormatTestSupport.h"
@@ -38,41 +30,6 @@ Ref<Image> Pattern(int w, int h, int depth, const ImgRectI &window, bool smooth 
             auto v = [&](int c) { return smooth ? 0.25f + 0.01f * (x + 2 * y + 5 * c) : Value(x, y, c) + extra; };
             img->PutFlt(x, y, {v(0), v(1), v(2), v(3)});
         }
-    return img;
-}
-
-void ExpectSame(const Image &want, const Image &got, float tolerance = 0.f) {
-    ASSERT_EQ(got.DataWindow(), want.DataWindow());
-    int bad = 0;
-    for (int y = want.DataWindow().y0; y < want.DataWindow().y1; ++y)
-        for (int x = want.DataWindow().x0; x < want.DataWindow().x1; ++x) {
-            const FltPixel a = want.GetFlt(x, y), b = got.GetFlt(x, y);
-            const float d =
-                std::max({std::fabs(a.R - b.R), std::fabs(a.G - b.G), std::fabs(a.B - b.B), std::fabs(a.A - b.A)});
-            if (!(d <= tolerance) && ++bad < 4) ADD_FAILURE() << "pixel " << x << "," << y << " off by " << d;
-        }
-}
-
-using Choices = std::vector<std::pair<const char *, const char *>>;
-
-/// Loads through a reading tool whose inputs hold `options` and the choices (Part, View, Layer, Channel...).
-Ref<Image> LoadWith(const Bytes &data, const Options &options, const Choices &choices = {}, int eye = 0,
-                    std::string *error = nullptr) {
-    OrvaneDoc doc;
-    Operator *tool = Orvane::Test::AddImageSource(doc, "Loader", nullptr);
-    Ref<ImageFormat> f = MakeFormat(kId);
-    f->AddLoadInputs(tool);
-    Request req(tool, nullptr, 0.0, 0, nullptr);
-    for (const auto &[name, value] : options) req.SetInputData(tool->FindInput(name), MakeRef<Number>(value).Get());
-    for (const auto &[name, id] : choices) req.SetInputData(tool->FindInput(name), MakeRef<IDValue>(OvID(id)).Get());
-    f->SetupLoad(tool, &req);
-    f->SetAttrsTagList({{FormatStereoEye, eye}});
-    MemoryIO io(data);
-    Ref<Image> img;
-    if (!f->LoadHeader(&io) || !f->LoadFrameTagList(0, img, {})) {
-        if (error) *error = f->Error();
-        return nullptr;
-    }
     return img;
 }
 
@@ -234,30 +191,28 @@ TEST_F(OpenEXRFormatTest, RoundTripsEveryCompressionAndWindow) {
                 const LoadResult r = Load(kId, b);
                 ASSERT_TRUE(r.image) << r.error;
                 EXPECT_EQ(r.image->Depth(), depth);
-                ExpectSame(*src, *r.image, lossless ? 0.f : depth == DepthRGBAFlt32 && c == 5 ? 1e-4f : 0.02f);
+                ExpectSamePixels(*src, *r.image, true,
+                                 lossless                            ? 0.f
+                                 : depth == DepthRGBAFlt32 && c == 5 ? 1e-4f
+                                                                     : 0.02f);
             }
 }
 
 TEST_F(OpenEXRFormatTest, SavesFromEveryDepthWithEveryDepthChoice) {
     if (!HaveProgram("exrheader")) GTEST_SKIP() << "exrheader is not installed";
-    // Image depth by Depth choice (Auto, float16, float32): the file's colour
-    // type (auxiliary channels are float but for float16), as exrheader reads it.
-    struct Row {
-        int depth;
-        const char *colour[3];
-    };
-    const Row rows[] = {
-        {DepthAInt8, {"16-bit", "16-bit", "32-bit"}},     {DepthAInt16, {"32-bit", "16-bit", "32-bit"}},
-        {DepthAFlt16, {"16-bit", "16-bit", "32-bit"}},    {DepthAFlt32, {"32-bit", "16-bit", "32-bit"}},
-        {DepthRGBAInt8, {"16-bit", "16-bit", "32-bit"}},  {DepthRGBAInt16, {"32-bit", "16-bit", "32-bit"}},
-        {DepthRGBAFlt16, {"16-bit", "16-bit", "32-bit"}}, {DepthRGBAFlt32, {"32-bit", "16-bit", "32-bit"}}};
+    // Every image depth by Depth choice (Auto, float16, float32): the file's
+    // colour is half for float16, and for Auto from int8 and float16 images;
+    // auxiliary channels are float but for float16; as exrheader reads them.
     TempDir dir;
     const ImgRectI window(2, 1, 9, 5); // 11 x 6 frame: file lines 1..4, columns 2..8
-    for (const Row &row : rows)
+    for (int depth = DepthAInt8; depth <= DepthRGBAFlt32; ++depth)
         for (int mode = 0; mode < 3; ++mode) {
-            SCOPED_TRACE(testing::Message() << "depth " << row.depth << " mode " << mode);
+            SCOPED_TRACE(testing::Message() << "depth " << depth << " mode " << mode);
+            const bool eightOrHalf =
+                depth == DepthAInt8 || depth == DepthAFlt16 || depth == DepthRGBAInt8 || depth == DepthRGBAFlt16;
+            const bool half = mode == 1 || (mode == 0 && eightOrHalf);
             Ref<Image> src =
-                NewImageTagList({{ImgWidth, 11}, {ImgHeight, 6}, {ImgDepth, row.depth}, {ImgDataWindow, &window}});
+                NewImageTagList({{ImgWidth, 11}, {ImgHeight, 6}, {ImgDepth, depth}, {ImgDataWindow, &window}});
             ASSERT_TRUE(src && src->AllocScanLineData() && src->AddAuxChannel(AuxChannelKind::Z));
             src->SetScale(2.0, 1.0);
             for (int y = window.y0; y < window.y1; ++y)
@@ -270,8 +225,7 @@ TEST_F(OpenEXRFormatTest, SavesFromEveryDepthWithEveryDepthChoice) {
             ASSERT_FALSE(b.empty());
             WriteFile(dir / "d.exr", b);
             const std::string header = CaptureText("exrheader '" + dir / "d.exr" + "'");
-            const bool half = std::string(row.colour[mode]) == "16-bit";
-            EXPECT_NE(header.find(std::string("R, ") + row.colour[mode] + " floating-point"), std::string::npos)
+            EXPECT_NE(header.find(std::string("R, ") + (half ? "16" : "32") + "-bit floating-point"), std::string::npos)
                 << header;
             EXPECT_NE(header.find(std::string("Z, ") + (mode == 1 ? "16-bit" : "32-bit")), std::string::npos) << header;
             EXPECT_NE(header.find("dataWindow (type box2i): (2 1) - (8 4)"), std::string::npos) << header;
@@ -321,29 +275,27 @@ TEST_F(OpenEXRFormatTest, AuxiliaryChannelsAndChannelBoxes) {
 TEST_F(OpenEXRFormatTest, MetadataRoundTripsWithTypes) {
     Ref<Image> src = Pattern(8, 6, DepthRGBAFlt16, ImgRectI(0, 0, 8, 6));
     ScriptVal &md = src->Metadata();
-    md.Set("owner", ScriptVal("Test Studio"));
-    md.Set("TimeCode", ScriptVal("01:02:03:04"));
-    md.Set("Focus", ScriptVal(2.5));
-    md.Set("aperture", ScriptVal(2.8));
-    md.Set("frameCount", ScriptVal(42));
-    md.Set("exactness", ScriptVal(0.1));
-    ScriptVal types = ScriptVal::Table();
-    types.Set("frameCount", ScriptVal("int"));
-    types.Set("exactness", ScriptVal("double"));
-    md.Set("OpenEXRTypes", types);
-    ScriptVal v2 = ScriptVal::Table("v2f"), box = ScriptVal::Table("box2i"), m = ScriptVal::Table("m44f");
+    ScriptVal types = ScriptVal::Table(), v2 = ScriptVal::Table("v2f"), box = ScriptVal::Table("box2i"),
+              m = ScriptVal::Table("m44f"), names = ScriptVal::Table(), nested = ScriptVal::Table();
+    types.Set("frameCount", ScriptVal("int")).Set("exactness", ScriptVal("double"));
     for (double d : {1.5, -2.0}) v2.Append(ScriptVal(d));
     for (double d : {-1.0, 2.0, 30.0, 40.0}) box.Append(ScriptVal(d));
     for (int i = 0; i < 16; ++i) m.Append(ScriptVal(i % 5 == 0 ? 1.0 : 0.0));
-    md.Set("offset", v2);
-    md.Set("crop", box);
-    md.Set("worldToCamera", m);
-    ScriptVal names = ScriptVal::Table();
     names.Append(ScriptVal("left")).Append(ScriptVal("beauty"));
-    md.Set("tags", names);
-    ScriptVal nested = ScriptVal::Table();
-    nested.Set("Gamma", ScriptVal(2.2));
-    md.Set("GammaSpace", nested); // no file form: left out
+    nested.Set("Gamma", ScriptVal(2.2)); // no file form: left out
+    for (auto &[key, value] : std::vector<std::pair<const char *, ScriptVal>>{{"owner", ScriptVal("Test Studio")},
+                                                                              {"TimeCode", ScriptVal("01:02:03:04")},
+                                                                              {"Focus", ScriptVal(2.5)},
+                                                                              {"aperture", ScriptVal(2.8)},
+                                                                              {"frameCount", ScriptVal(42)},
+                                                                              {"exactness", ScriptVal(0.1)},
+                                                                              {"OpenEXRTypes", types},
+                                                                              {"offset", v2},
+                                                                              {"crop", box},
+                                                                              {"worldToCamera", m},
+                                                                              {"tags", names},
+                                                                              {"GammaSpace", nested}})
+        md.Set(key, value);
     const Bytes b = SaveWith(kId, src.Get(), {});
     if (HaveProgram("exrheader")) {
         TempDir dir;
@@ -367,10 +319,9 @@ TEST_F(OpenEXRFormatTest, MetadataRoundTripsWithTypes) {
     EXPECT_EQ(got.Find("tags")->At(2)->AsText(), "beauty");
     const ScriptVal *t = got.Find("OpenEXRTypes");
     ASSERT_TRUE(t);
-    EXPECT_EQ(t->Find("frameCount")->AsText(), "int");
-    EXPECT_EQ(t->Find("exactness")->AsText(), "double");
-    EXPECT_EQ(t->Find("Focus")->AsText(), "float");
-    EXPECT_EQ(t->Find("TimeCode")->AsText(), "timecode");
+    for (auto [key, type] :
+         {std::pair{"frameCount", "int"}, {"exactness", "double"}, {"Focus", "float"}, {"TimeCode", "timecode"}})
+        EXPECT_EQ(t->Find(key)->AsText(), type) << key;
 }
 
 // ---- files made independently ----
@@ -451,19 +402,14 @@ TEST_F(OpenEXRFormatTest, TiledMultiPartMultiViewAndLayeredFilesReadWhatIsChosen
                          dir / "v.exr" + "'"));
     // Two colour layers, one with lower-case names, no alpha, and a channel no
     // slot reads; pixel x of layer channel c holds x + the layer's and the channel's offsets.
-    const Bytes layered = HandMade(ImgRectI(0, 0, 3, 1), ImgRectI(0, 0, 3, 1),
-                                   {{"beauty.r", 1},
-                                    {"beauty.g", 1},
-                                    {"beauty.b", 1},
-                                    {"diffuse.R", 1},
-                                    {"diffuse.G", 1},
-                                    {"diffuse.B", 1},
-                                    {"mask", 1}},
-                                   [](int x, int, const std::string &c) {
-                                       const char last =
-                                           static_cast<char>(std::toupper(static_cast<unsigned char>(c.back())));
-                                       return (c[0] == 'd' ? 10.f : 0.f) + x + ChannelIndex(std::string(1, last)) / 4.f;
-                                   });
+    std::vector<Channel> names;
+    for (const char *n : {"beauty.r", "beauty.g", "beauty.b", "diffuse.R", "diffuse.G", "diffuse.B", "mask"})
+        names.push_back({n, 1});
+    const Bytes layered =
+        HandMade(ImgRectI(0, 0, 3, 1), ImgRectI(0, 0, 3, 1), names, [](int x, int, const std::string &c) {
+            const char last = static_cast<char>(std::toupper(static_cast<unsigned char>(c.back())));
+            return (c[0] == 'd' ? 10.f : 0.f) + x + ChannelIndex(std::string(1, last)) / 4.f;
+        });
     const std::map<std::string, Bytes> files = {{"tiled", ReadFile(dir / "t.exr")},
                                                 {"parts", ReadFile(dir / "p.exr")},
                                                 {"views", ReadFile(dir / "v.exr")},
@@ -492,7 +438,7 @@ TEST_F(OpenEXRFormatTest, TiledMultiPartMultiViewAndLayeredFilesReadWhatIsChosen
         SCOPED_TRACE(testing::Message() << row.file << " eye " << row.eye << " "
                                         << (row.choices.empty() ? "" : row.choices[0].second));
         std::string error;
-        Ref<Image> img = LoadWith(files.at(row.file), {}, row.choices, row.eye, &error);
+        Ref<Image> img = LoadWith(kId, files.at(row.file), {}, row.choices, row.eye, &error);
         if (row.error) {
             EXPECT_FALSE(img);
             EXPECT_NE(error.find(row.error), std::string::npos) << error;
@@ -561,8 +507,8 @@ TEST_F(OpenEXRFormatTest, SampleImagesMatchExrheader) {
     Ref<Image> eyes[2];
     for (int eye = 0; eye < 2; ++eye) {
         const char *view = eye ? "right" : "left";
-        Ref<Image> single = LoadWith(singleFile, {}, {{"View", view}});
-        Ref<Image> multi = LoadWith(multiFile, {}, {{"View", view}});
+        Ref<Image> single = LoadWith(kId, singleFile, {}, {{"View", view}});
+        Ref<Image> multi = LoadWith(kId, multiFile, {}, {{"View", view}});
         ASSERT_TRUE(single && multi) << view;
         EXPECT_EQ(differing(*single, *multi), 0) << view;
         ASSERT_TRUE(multi->Metadata().Find("name"));
@@ -585,7 +531,32 @@ TEST_F(OpenEXRFormatTest, SampleImagesMatchExrheader) {
     EXPECT_LT(sum / n, 0.05);
 }
 
-TEST_F(OpenEXRFormatTest, DamagedFilesFailCleanly) {
+TEST_F(OpenEXRFormatTest, DamagedFilesAndFullDisksFailWithTheLibrarysReason) {
+    // Truncation and other damage of our own files: EveryFormatTest.cpp.
+    Ref<Image> src = Pattern(40, 30, DepthRGBAFlt16, ImgRectI(0, 0, 40, 30));
+    Ref<ImageFormat> f = MakeFormat(kId);
+    f->SetupSave(nullptr, nullptr);
+    LimitedIO full(int64_t(Save(kId, src.Get()).size()) / 2);
+    EXPECT_FALSE(f->SaveHeader(&full, src.Get()) && f->SaveFrame(0, src.Get()));
+    EXPECT_NE(f->Error().find("OpenEXR"), std::string::npos) << f->Error();
+
+    // Headers stating sizes the library would set memory aside for before
+    // reading (found by fuzzing): refused at the header.
+    Bytes hugeValue = {'j', 0, 'j', 0}, hugeTiles, tiles;
+    Put32(hugeValue, 0x7ffffff0u); // an attribute of an unknown type claiming 2 GB
+    Put32(tiles, 32), Put32(tiles, 3022880), tiles.push_back(0);
+    Attr(hugeTiles, "tiles", "tiledesc", tiles); // 770 MB a tile, on an 8 x 5 window
+    for (auto [attribute, flags, error] :
+         {std::tuple{hugeValue, 0, "attribute j claims 2147483632 bytes"},
+          {hugeTiles, 0x02, "tiles of 32 x 3022880 are larger than the data window"}}) {
+        Bytes file = OffsetFile(0);
+        file[5] |= flags; // second byte of the version field: tiled
+        file.insert(file.begin() + 8, attribute.begin(), attribute.end());
+        const LoadResult r = Load(kId, file);
+        EXPECT_FALSE(r.headerOk) << error;
+        EXPECT_NE(r.error.find(error), std::string::npos) << r.error;
+    }
+
     const std::string dir = Samples() + "/Damaged";
     if (!std::filesystem::is_directory(dir)) GTEST_SKIP() << dir << " is absent";
     int files = 0;
@@ -598,40 +569,6 @@ TEST_F(OpenEXRFormatTest, DamagedFilesFailCleanly) {
         ++files;
     }
     EXPECT_GT(files, 80);
-
-    // Headers stating sizes the library would set memory aside for before
-    // reading (found by fuzzing): refused at the header.
-    Bytes hugeValue = {'j', 0, 'j', 0}, hugeTiles, tiles;
-    Put32(hugeValue, 0x7ffffff0u); // an attribute of an unknown type claiming 2 GB
-    Put32(tiles, 32), Put32(tiles, 3022880), tiles.push_back(0);
-    Attr(hugeTiles, "tiles", "tiledesc", tiles); // 770 MB a tile, on an 8 x 5 window
-    const struct {
-        Bytes attribute;
-        uint8_t flags; // second byte of the version field
-        const char *error;
-    } headers[] = {{hugeValue, 0, "attribute j claims 2147483632 bytes"},
-                   {hugeTiles, 0x02, "tiles of 32 x 3022880 are larger than the data window"}};
-    for (const auto &h : headers) {
-        Bytes file = OffsetFile(0);
-        file[5] |= h.flags;
-        file.insert(file.begin() + 8, h.attribute.begin(), h.attribute.end());
-        const LoadResult r = Load(kId, file);
-        EXPECT_FALSE(r.headerOk) << h.error;
-        EXPECT_NE(r.error.find(h.error), std::string::npos) << r.error;
-    }
-
-    // Truncated files and streams that fail: false with a reason, never a crash.
-    Ref<Image> src = Pattern(40, 30, DepthRGBAFlt16, ImgRectI(0, 0, 40, 30));
-    const Bytes whole = SaveWith(kId, src.Get(), {{"Compression", 3}});
-    for (size_t cut : {size_t(3), size_t(200), whole.size() / 2, whole.size() - 5}) {
-        const LoadResult r = Load(kId, Bytes(whole.begin(), whole.begin() + static_cast<long>(cut)));
-        EXPECT_FALSE(r.image) << cut;
-    }
-    Ref<ImageFormat> f = MakeFormat(kId);
-    f->SetupSave(nullptr, nullptr);
-    LimitedIO full(whole.size() / 2);
-    EXPECT_FALSE(f->SaveHeader(&full, src.Get()) && f->SaveFrame(0, src.Get()));
-    EXPECT_NE(f->Error().find("OpenEXR"), std::string::npos) << f->Error();
 }
 
 // ---- regions and options ----
@@ -664,16 +601,8 @@ TEST_F(OpenEXRFormatTest, RegionsDecodeOnlyTheirRows) {
         const ImgRectI want = rect & window;
         ASSERT_EQ(img->DataWindow(), want);
         EXPECT_LT(io.read - header, static_cast<int64_t>(b.size()) / 8);
-        for (int y = want.y0; y < want.y1; ++y)
-            for (int x = want.x0; x < want.x1; ++x) ASSERT_EQ(img->GetFlt(x, y), src->GetFlt(x, y));
+        if (!want.IsNull()) ExpectSameRows(*src, *img, want);
     }
-    const LoadResult pre = Load(kId, b, {{ClipFrameHeaderOnly, 1}});
-    ASSERT_TRUE(pre.image) << pre.error;
-    EXPECT_TRUE(pre.image->IsNoData());
-    EXPECT_EQ(pre.image->DataWindow(), window);
-    std::atomic<bool> stop{true};
-    const LoadResult aborted = Load(kId, b, {}, [&](ImageFormat &fmt) { fmt.abortFlag = &stop; });
-    EXPECT_FALSE(aborted.image);
 }
 
 TEST_F(OpenEXRFormatTest, DisplayOptionsFollowTheirFormula) {
@@ -684,18 +613,18 @@ TEST_F(OpenEXRFormatTest, DisplayOptionsFollowTheirFormula) {
     const Bytes b = SaveWith(kId, src.Get(), {});
     // Defaults (and Bypass over any setting) leave every value as stored.
     for (const Options &o : {Options{}, Options{{"Bypass", 1}, {"Exposure", 3}, {"Defog", 0.01}}}) {
-        Ref<Image> same = LoadWith(b, o);
+        Ref<Image> same = LoadWith(kId, b, o);
         ASSERT_TRUE(same);
-        ExpectSame(*src, *same);
+        ExpectSamePixels(*src, *same);
     }
-    Ref<Image> lit = LoadWith(b, {{"Exposure", 1}});
+    Ref<Image> lit = LoadWith(kId, b, {{"Exposure", 1}});
     ASSERT_TRUE(lit);
     const double gain = std::pow(2.0, 1 + 2.47393) * 0.184874;
     EXPECT_NEAR(lit->GetFlt(0, 0).R, low * gain, 1e-6);
     EXPECT_EQ(lit->GetFlt(0, 0).B, 0.f);                                   // negatives clip at 0
     EXPECT_EQ(lit->GetFlt(0, 0).A, 0.5f);                                  // alpha untouched
     EXPECT_NEAR(lit->GetFlt(1, 0).G, std::pow(2.0, 3.5) * 0.184874, 1e-4); // 2^kneeHigh lands on 2^3.5
-    Ref<Image> fog = LoadWith(b, {{"Defog", 0.01}});
+    Ref<Image> fog = LoadWith(kId, b, {{"Defog", 0.01}});
     ASSERT_TRUE(fog);
     EXPECT_NEAR(fog->GetFlt(0, 0).R, (low - 0.01) * std::pow(2.0, 2.47393) * 0.184874, 1e-6);
 }
