@@ -4,6 +4,7 @@
 // when any part fails, and saves atomically, keeping the document's comments.
 #include <cstdio>
 #include <filesystem>
+#include <functional>
 #include <string>
 #include <vector>
 
@@ -63,6 +64,18 @@ void LoadForEdit(const EditArgs &a, OrvaneDoc &doc, const char *command, size_t 
     if (a.positional.size() < least) throw CliError(ExitUsage, std::string("see orvane ") + command + " --help");
     LoadLibrary();
     LoadFlow(a.positional[0], doc, a.lenient);
+}
+
+/// Loads FLOW, applies `edit` to each argument after it in order, and saves
+/// atomically; nothing is saved when an edit throws.
+int EditEach(const char *command, const std::vector<std::string> &args,
+             const std::function<void(OrvaneDoc &, const std::string &)> &edit) {
+    const EditArgs a = ParseEditArgs(command, args, false);
+    OrvaneDoc doc;
+    LoadForEdit(a, doc, command, 2);
+    for (size_t i = 1; i < a.positional.size(); ++i) edit(doc, a.positional[i]);
+    Save(doc, a.positional[0]);
+    return ExitOk;
 }
 
 } // namespace
@@ -126,20 +139,11 @@ int RunAdd(const std::vector<std::string> &args) {
 }
 
 int RunSetCommand(const std::vector<std::string> &args) {
-    const EditArgs a = ParseEditArgs("set", args, false);
-    OrvaneDoc doc;
-    LoadForEdit(a, doc, "set", 2);
-    for (size_t i = 1; i < a.positional.size(); ++i) ApplySet(doc, a.positional[i], "set");
-    Save(doc, a.positional[0]);
-    return ExitOk;
+    return EditEach("set", args, [](OrvaneDoc &doc, const std::string &arg) { ApplySet(doc, arg, "set"); });
 }
 
 int RunConnect(const std::vector<std::string> &args) {
-    const EditArgs a = ParseEditArgs("connect", args, false);
-    OrvaneDoc doc;
-    LoadForEdit(a, doc, "connect", 2);
-    for (size_t i = 1; i < a.positional.size(); ++i) {
-        const std::string &link = a.positional[i];
+    return EditEach("connect", args, [](OrvaneDoc &doc, const std::string &link) {
         const size_t eq = link.find('=');
         if (eq == std::string::npos)
             throw CliError(ExitUsage, "connect expects TOOL.INPUT=OTHER[.OUTPUT], not '" + link + "'");
@@ -150,24 +154,16 @@ int RunConnect(const std::vector<std::string> &args) {
             source += std::string(".") + main->ID().Text();
         }
         ApplySet(doc, link.substr(0, eq + 1) + source, "connect");
-    }
-    Save(doc, a.positional[0]);
-    return ExitOk;
+    });
 }
 
 int RunRemove(const std::vector<std::string> &args) {
-    const EditArgs a = ParseEditArgs("remove", args, false);
-    OrvaneDoc doc;
-    LoadForEdit(a, doc, "remove", 2);
-    for (size_t i = 1; i < a.positional.size(); ++i) {
-        Operator &op = FindTool(doc, a.positional[i], "remove");
-        for (const auto &out : op.Outputs())
+    return EditEach("remove", args, [](OrvaneDoc &doc, const std::string &name) {
+        for (const auto &out : FindTool(doc, name, "remove").Outputs())
             for (const Input *in : out->Consumers())
                 std::printf("unlinked %s.%s\n", in->Owner()->Name().c_str(), in->ID().Text());
-        doc.RemoveTool(a.positional[i]);
-    }
-    Save(doc, a.positional[0]);
-    return ExitOk;
+        doc.RemoveTool(name);
+    });
 }
 
 } // namespace Orvane::Cli
