@@ -1,9 +1,6 @@
 #pragma once
-// Helpers shared by the still image format tests: making a format from its
-// registry row, saving to and loading from memory (through a tool's options
-// when given), test images with known values, comparing images and regions,
-// a temporary folder, and running netpbm and ImageMagick to make and read
-// files independently.
+// Helpers of the still image format tests: saving and loading through a format (and a tool's options), test
+// images, comparisons, damage, little-endian fields, and running other programs.
 #include <gtest/gtest.h>
 
 #include <algorithm>
@@ -56,8 +53,9 @@ inline Bytes Save(const char *id, Image *img) {
 /// Saves to `io` through a writing tool: the format adds its inputs to a
 /// tool, the options are given to a request for that tool, and SetupSave
 /// reads them. False with the reason in `error` on failure.
+/// `predicted`: where the format's size prediction after SetupSave goes.
 inline bool SaveTo(IOClass *io, const char *id, Image *img, const Options &options, std::string &error,
-                   const std::atomic<bool> *abort = nullptr) {
+                   const std::atomic<bool> *abort = nullptr, int64_t *predicted = nullptr) {
     OrvaneDoc doc;
     Operator *tool = Orvane::Test::AddImageSource(doc, "Saver", Ref<Image>(img));
     Ref<ImageFormat> f = MakeFormat(id);
@@ -69,6 +67,7 @@ inline bool SaveTo(IOClass *io, const char *id, Image *img, const Options &optio
         if (in) req.SetInputData(in, MakeRef<Number>(value).Get());
     }
     f->SetupSave(tool, &req);
+    if (predicted) *predicted = f->PredictFileSize(img);
     f->abortFlag = abort;
     const bool ok = f->SaveHeader(io, img) && f->SaveFrame(0, img);
     f->CleanupSave(tool);
@@ -77,10 +76,10 @@ inline bool SaveTo(IOClass *io, const char *id, Image *img, const Options &optio
 }
 
 /// SaveTo memory: the file (empty, and a test failure, when it fails).
-inline Bytes SaveWith(const char *id, Image *img, const Options &options) {
+inline Bytes SaveWith(const char *id, Image *img, const Options &options, int64_t *predicted = nullptr) {
     MemoryIO io;
     std::string error;
-    EXPECT_TRUE(SaveTo(&io, id, img, options, error)) << id << " save: " << error;
+    EXPECT_TRUE(SaveTo(&io, id, img, options, error, nullptr, predicted)) << id << " save: " << error;
     return io.Data();
 }
 
@@ -286,6 +285,15 @@ inline int ExpectDamageFailsCleanly(
     }
     return failed;
 }
+
+/// Little-endian fields of a file.
+inline uint32_t U32(const Bytes &b, size_t at) {
+    return b[at] | b[at + 1] << 8 | b[at + 2] << 16 | uint32_t(b[at + 3]) << 24;
+}
+inline void Put32(Bytes &b, size_t at, uint32_t v) {
+    for (int i = 0; i < 4; ++i) b[at + i] = uint8_t(v >> (8 * i));
+}
+inline void Put16(Bytes &b, size_t at, uint32_t v) { b[at] = uint8_t(v), b[at + 1] = uint8_t(v >> 8); }
 
 /// A memory stream that takes only the first `limit` bytes written: a full disk.
 class LimitedIO : public MemoryIO {
