@@ -1,5 +1,4 @@
-// Clips: frames of a sequence read and written through a format, with the
-// format found by extension and check, and frames written atomically.
+// Clips: frames of a sequence read and written through a format found by extension and check, written atomically.
 #include <gtest/gtest.h>
 
 #include <cstring>
@@ -63,18 +62,13 @@ public:
 class Clips : public ::testing::Test {
 protected:
     static void SetUpTestSuite() {
-        static const Registry *row = [] {
-            TagList tags{{RegConstructor,
-                          +[](const Registry *reg, const ScriptVal &args, const TagList &tags) -> Object * {
-                              return new TestFormat(reg, args, tags);
-                          }},
-                         {RegTypeFlags, static_cast<long long>(RegFamilyImageFormat)},
-                         {RegFormatName, "Test Frames"},
-                         {RegFormatExtension, ".tfmt"},
-                         {RegFormatCanLoad, 1},
-                         {RegFormatCanSave, 1}};
-            return Registry::_Init(&ClassRegistry, OvID("TestFrameFormat"), tags);
-        }();
+        static TagList tags{{RegConstructor, &Orvane::Test::MakeTool<TestFormat>},
+                            {RegTypeFlags, static_cast<long long>(RegFamilyImageFormat)},
+                            {RegFormatName, "Test Frames"},
+                            {RegFormatExtension, ".tfmt"},
+                            {RegFormatCanLoad, 1},
+                            {RegFormatCanSave, 1}};
+        static const Registry *row = Registry::_Init(&ClassRegistry, OvID("TestFrameFormat"), tags);
         (void)row;
     }
     TempDir dir;

@@ -1,6 +1,4 @@
-// FileIO and MemoryIO: reads, writes, the three seek origins, sizes and
-// short reads, checked against bytes the test knows; reading refuses what is
-// not a regular file without waiting.
+// FileIO and MemoryIO against bytes the test knows; reading refuses what is not a regular file without waiting.
 #include <gtest/gtest.h>
 
 #include <fcntl.h>
@@ -27,12 +25,11 @@ std::vector<uint8_t> Bytes(int n, int start = 0) {
     return v;
 }
 
-/// The checks every stream must pass, given one holding `data` (64 bytes or
-/// more) at position 0: each step reads (`origin` < 0) or seeks, and gives
-/// `result` (bytes read, or 1 for a seek done) and the position after it.
-/// A read returns the bytes at the position it started from.
+/// The checks every stream holding `data` (64 bytes or more) at position 0 must pass: each step reads (`origin`
+/// Read) or seeks, and gives `result` (bytes read, or 1 for a seek done) and the position after it. Short reads at
+/// the end, relative seeks both ways, refused negative seeks, seeks and reads past the end.
 void CheckReadAndSeek(IOClass &io, const std::vector<uint8_t> &data) {
-    const int64_t n = static_cast<int64_t>(data.size());
+    const int64_t n = static_cast<int64_t>(data.size()), past = n + 100, end3 = n - 3;
     EXPECT_EQ(io.Size(), n);
     constexpr int Read = -1, Start = IOClass::SeekStart, Absolute = IOClass::SeekAbsolute,
                   Relative = IOClass::SeekRelative;
@@ -40,28 +37,11 @@ void CheckReadAndSeek(IOClass &io, const std::vector<uint8_t> &data) {
         int64_t amount;
         int origin;
         int64_t result, tell;
-    } steps[] = {
-        {10, Read, 10, 10},
-        {n + 5, Read, n - 10, n}, // a short read at the end returns what is there
-        {4, Read, 0, n},
-        {5, Start, 1, 5},
-        {20, Absolute, 1, 20},
-        {1, Read, 1, 21},
-        {-11, Relative, 1, 10},
-        {1, Read, 1, 11},
-        {4, Relative, 1, 15}, // relative, both ways
-        {-1, Start, 0, 15},
-        {-1, Absolute, 0, 15},
-        {0, Start, 1, 0},
-        {-1, Relative, 0, 0},
-        {n + 100, Start, 1, n + 100},
-        {4, Read, 0, n + 100}, // past the end: nothing to read
-        {n - 3, Start, 1, n - 3},
-        {4, Read, 3, n},
-        {0, Start, 1, 0},
-        {0, Read, 0, 0},
-        {-3, Read, 0, 0},
-    };
+    } steps[] = {{10, Read, 10, 10},    {n + 5, Read, n - 10, n}, {4, Read, 0, n},        {5, Start, 1, 5},
+                 {20, Absolute, 1, 20}, {1, Read, 1, 21},         {-11, Relative, 1, 10}, {1, Read, 1, 11},
+                 {4, Relative, 1, 15},  {-1, Start, 0, 15},       {-1, Absolute, 0, 15},  {0, Start, 1, 0},
+                 {-1, Relative, 0, 0},  {past, Start, 1, past},   {4, Read, 0, past},     {end3, Start, 1, end3},
+                 {4, Read, 3, n},       {0, Start, 1, 0},         {0, Read, 0, 0},        {-3, Read, 0, 0}};
     std::vector<uint8_t> buf(data.size() + 10);
     for (const auto &s : steps) {
         SCOPED_TRACE(::testing::Message() << s.amount << " origin " << s.origin << " from " << io.Tell());
@@ -76,7 +56,7 @@ void CheckReadAndSeek(IOClass &io, const std::vector<uint8_t> &data) {
         EXPECT_EQ(io.Size(), n); // and the size does not move the position
         EXPECT_EQ(io.Tell(), s.tell);
     }
-    ASSERT_TRUE(io.Seek(n - 3, IOClass::SeekStart));
+    ASSERT_TRUE(io.Seek(end3, IOClass::SeekStart));
     EXPECT_FALSE(io.ReadExact(buf.data(), 4));
 }
 

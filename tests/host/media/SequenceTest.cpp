@@ -1,5 +1,4 @@
-// Numbered file sequences: parsing names, writing frame names, matching and
-// scanning a folder with gaps.
+// Numbered file sequences: parsing and writing names, matching, scanning a folder with gaps.
 #include <gtest/gtest.h>
 
 #include <filesystem>

@@ -39,10 +39,7 @@ TEST(ClipTiming, HoldsTrimsReverseAndLoop) {
 
 TEST(ClipTiming, ClipSearchFindsTheElementOrTheOneBeforeAGap) {
     std::vector<ClipPlacement> list(2);
-    list[0].start = 0;
-    list[0].end = 9;
-    list[1].start = 20;
-    list[1].end = 29;
+    list[0].start = 0, list[0].end = 9, list[1].start = 20, list[1].end = 29;
     EXPECT_FALSE(FindClipAt(list, -1));
     EXPECT_EQ(FindClipAt(list, 9.5), 0u);
     EXPECT_EQ(FindClipAt(list, 15), 0u); // in the gap: the clip before it answers
@@ -92,26 +89,26 @@ TEST(ClipTiming, PullUpRebuildsFilmFramesAndDoublesAtTheEdges) {
     EXPECT_EQ(mixed, 0); // the advanced cadence rebuilds film frames from whole video frames
 }
 
-TEST(ClipTiming, TrimsConvertBetweenFilmAndVideoFrames) {
-    // Five video frames hold four film frames: the conversions of the cadence start.
-    EXPECT_EQ(ConvertPullFrame(0, ImportPullUp, 0, 0), 0);
-    EXPECT_EQ(ConvertPullFrame(0, ImportPullDown, 0, 0), 0);
-    EXPECT_EQ(ConvertPullFrame(7, ImportNormal, 0, 3), 7);
-    // A trim out at the last video frame of two cycles ends at film frame 7.
-    EXPECT_EQ(ConvertPullFrame(9, ImportPullUp, 0, 0), 7);
-    // Film frame 7 ends at video frame 9.
-    EXPECT_EQ(ConvertPullFrame(7, ImportPullDown, 0, 0), 9);
-}
-
-TEST(ClipTiming, FieldOrderByProcessMode) {
-    EXPECT_EQ(FieldForTime(0, 3.5, 0.5), -1);
-    // PAL: the first field of frame 3 is field 1 ((n - 1) & 1 with n = 6).
-    EXPECT_EQ(FieldForTime(1, 3.0, 0.5), 1);
-    EXPECT_EQ(FieldForTime(1, 3.5, 0.5), 0);
-    EXPECT_EQ(FieldForTime(2, 3.0, 0.5), 0);
-    EXPECT_EQ(FieldForTime(2, 3.5, 0.5), 1);
-    EXPECT_EQ(FieldForTime(3, 3.0, 0.5), FieldForTime(1, 3.0, 0.5));
-    EXPECT_EQ(FieldForTime(4, 3.0, 0.5), FieldForTime(2, 3.0, 0.5));
+// Five video frames hold four film frames: a trim out at the last video frame of two cycles ends at film
+// frame 7, which ends at video frame 9. Fields: PAL's first field of frame 3 is field 1 ((n - 1) & 1, n = 6),
+// modes 3 and 4 order as 1 and 2.
+TEST(ClipTiming, TrimsConvertBetweenFilmAndVideoFramesAndFieldsFollowTheMode) {
+    for (auto [frame, mode, first, want] : {std::tuple{0, ImportPullUp, 0, 0},
+                                            {0, ImportPullDown, 0, 0},
+                                            {7, ImportNormal, 3, 7},
+                                            {9, ImportPullUp, 0, 7},
+                                            {7, ImportPullDown, 0, 9}})
+        EXPECT_EQ(ConvertPullFrame(frame, mode, 0, first), want) << frame << " mode " << mode;
+    for (auto [mode, time, field] : {std::tuple{0, 3.5, -1},
+                                     {1, 3.0, 1},
+                                     {1, 3.5, 0},
+                                     {2, 3.0, 0},
+                                     {2, 3.5, 1},
+                                     {3, 3.0, 1},
+                                     {3, 3.5, 0},
+                                     {4, 3.0, 0},
+                                     {4, 3.5, 1}})
+        EXPECT_EQ(FieldForTime(mode, time, 0.5), field) << mode << " at " << time;
 }
 
 } // namespace
