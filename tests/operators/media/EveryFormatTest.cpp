@@ -174,8 +174,6 @@ TEST_F(EveryFormat, DamagedFilesFailCleanly) {
         EXPECT_GE(ExpectDamageFailsCleanly(f.id, SampleFile(f), f.header, f.sizeKept, f.tail), f.minFailed) << Name(f);
 }
 
-// ---- other programs ----
-
 bool HavePrograms() {
     for (const char *p : {"convert", "ppmtobmp", "bmptopnm", "ppmtotga", "tgatoppm", "pngtopnm", "cjpeg", "djpeg"})
         if (!HaveProgram(p)) return false;

@@ -50,9 +50,7 @@ inline Bytes Save(const char *id, Image *img) {
     return io.Data();
 }
 
-/// Saves to `io` through a writing tool: the format adds its inputs to a
-/// tool, the options are given to a request for that tool, and SetupSave
-/// reads them. False with the reason in `error` on failure.
+/// Saves to `io` through a writing tool given `options`; false with the reason in `error` on failure.
 /// `predicted`: where the format's size prediction after SetupSave goes.
 inline bool SaveTo(IOClass *io, const char *id, Image *img, const Options &options, std::string &error,
                    const std::atomic<bool> *abort = nullptr, int64_t *predicted = nullptr) {
@@ -89,8 +87,7 @@ struct LoadResult {
     bool headerOk = false;
 };
 
-/// Reads one frame of `data`; `prepare` may set the proxy scale, the abort
-/// word or attributes before the header is read. A failure must say why.
+/// Reads one frame of `data`; `prepare` readies the format first. A failure must say why.
 template <class Prepare> LoadResult Load(const char *id, const Bytes &data, const TagList &tags, Prepare prepare) {
     LoadResult r;
     Ref<ImageFormat> f = MakeFormat(id);
@@ -112,8 +109,7 @@ inline LoadResult LoadAt(const char *id, const Bytes &data, int proxy) {
     return Load(id, data, {}, [proxy](ImageFormat &f) { f.proxyScale = proxy; });
 }
 
-/// Loads through a reading tool whose inputs hold `options` and the choices
-/// (Part, View, Layer...), for stereo eye `eye`; null with `error` on failure.
+/// Loads through a reading tool given `options` and choices, for stereo eye `eye`; null with `error` on failure.
 inline Ref<Image> LoadWith(const char *id, const Bytes &data, const Options &options, const Choices &choices = {},
                            int eye = 0, std::string *error = nullptr) {
     OrvaneDoc doc;
@@ -154,8 +150,7 @@ inline Ref<Image> MakeImage(int w, int h, int depth, const std::function<Pixel(i
     return img;
 }
 
-/// 8-bit values that differ from pixel to pixel (a hash of x, y and the
-/// channel), with some equal neighbours so that run-length coders see runs.
+/// 8-bit values hashed from x, y and the channel, with some equal neighbours so that run-length coders see runs.
 inline uint8_t Value8(int x, int y, int c, unsigned seed = 1) {
     if ((x / 3 + y) % 4 == 0) x = 0; // runs
     unsigned h = static_cast<unsigned>(x) * 73856093u ^ static_cast<unsigned>(y) * 19349663u ^
@@ -171,16 +166,14 @@ inline Ref<Image> Image8(int w, int h, unsigned seed = 1, int depth = DepthRGBAI
     });
 }
 
-/// A smooth picture with some detail (what lossy coders are made for), 8-bit
-/// values; opaque unless `alpha`, which gives a smooth ramp.
+/// A smooth picture with some detail (what lossy coders are made for); opaque unless `alpha`.
 inline Pixel Smooth(int x, int y, bool alpha = false) {
     const auto v = [](double t) { return uint16_t(std::lround(127.5 + 120 * std::sin(t)) * 257); };
     return {v(x * 0.05 + y * 0.02), v(y * 0.07 - 1.0), v((x + y) * 0.03 + 2.0),
             alpha ? v(x * 0.04 - y * 0.03) : uint16_t(65535)};
 }
 
-/// `got` has the window of `want` and its pixels within `tolerance` (as
-/// floats; 0: exactly), opaque unless `alpha`; reports the first few others.
+/// `got` has the window of `want` and its pixels within `tolerance` (0: exactly), opaque unless `alpha`.
 inline void ExpectSamePixels(const Image &want, const Image &got, bool alpha = true, float tolerance = 0) {
     ASSERT_EQ(got.DataWindow(), want.DataWindow());
     const ImgRectI w = want.DataWindow();
@@ -212,9 +205,8 @@ inline void ExpectSameRows(const Image &want, const Image &got, const ImgRectI &
     }
 }
 
-/// Regions of a file (all of it, inside, one corner pixel, reaching out of
-/// the data window on either side, wholly outside it) read as exactly the
-/// crop of the full read; outside the window the image is empty.
+/// Regions of a file (all, inside, a corner pixel, reaching out on either side, wholly outside) read as exactly
+/// the crop of the full read; outside the window the image is empty.
 inline void ExpectRegionsMatchFullRead(const char *id, const Bytes &data) {
     const LoadResult full = Load(id, data);
     ASSERT_TRUE(full.image) << full.error;
@@ -238,14 +230,10 @@ inline void ExpectRegionsMatchFullRead(const char *id, const Bytes &data) {
     }
 }
 
-/// Damaged copies of a good file fail with a reason or read to a sane image:
-/// every cut short of the file (each within the first `header` or 256
-/// bytes, then 64 spread over the rest; a reader may do without the last
-/// `tail` bytes, an end marker), each of the first `header` bytes
-/// flipped three ways, and 300 scatterings of a few bytes after the header,
-/// a third of them cut short too. `sizeKept`: a damaged read that succeeds
-/// has the stored size. `prepare` readies each format object. Returns how
-/// many of the scattered reads failed.
+/// Damaged copies of a good file fail with a reason or read to a sane image: cuts (every byte in the first
+/// max(`header`, 256), then 64 more; the last `tail` bytes may be missing), each of the first `header` bytes
+/// flipped three ways, and 300 scatterings after the header, a third cut short too. `sizeKept`: a damaged read
+/// that succeeds has the stored size. Returns how many of the scattered reads failed.
 inline int ExpectDamageFailsCleanly(
     const char *id, const Bytes &good, size_t header, bool sizeKept, size_t tail = 0,
     void (*prepare)(ImageFormat &) = [](ImageFormat &) {}) {
@@ -308,8 +296,6 @@ private:
     int64_t limit_;
 };
 
-// ---- files and programs ----
-
 inline bool RunShell(const std::string &cmd) { return std::system((cmd + " 2>/dev/null").c_str()) == 0; }
 inline bool HaveProgram(const char *name) { return RunShell(std::string("command -v ") + name + " >/dev/null"); }
 
@@ -340,9 +326,8 @@ inline void WriteFile(const std::string &path, const Bytes &data) {
     f.write(reinterpret_cast<const char *>(data.data()), static_cast<std::streamsize>(data.size()));
 }
 
-/// Pixels of `img` (rows from the bottom) that differ from 8-bit RGBA
-/// samples stored top row first; alpha is compared only when `alpha`.
-/// -1 when the sizes differ.
+/// Pixels of `img` that differ from 8-bit RGBA samples stored top row first (alpha only when `alpha`); -1 when the
+/// sizes differ.
 inline int Mismatches(const Image &img, const Bytes &rgba, int w, int h, bool alpha = true) {
     if (img.Width() != w || img.Height() != h || rgba.size() != size_t(w) * h * 4) return -1;
     int bad = 0;

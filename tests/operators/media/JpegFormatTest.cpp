@@ -149,28 +149,16 @@ Bytes Profile(const std::string &desc, int gamma8) {
     auto be32 = [&](uint32_t v) {
         for (int s = 24; s >= 0; s -= 8) p.push_back(uint8_t(v >> s));
     };
-    const uint32_t tags = gamma8 > 0 ? 2 : 1;
-    be32(tags);
-    const uint32_t descAt = 132 + 12 * tags, descLen = 12 + uint32_t(desc.size()) + 1;
+    const uint32_t tags = gamma8 > 0 ? 2 : 1, descAt = 132 + 12 * tags, descLen = 12 + uint32_t(desc.size()) + 1;
     const uint32_t curveAt = (descAt + descLen + 3) & ~3u;
-    p.insert(p.end(), {'d', 'e', 's', 'c'});
-    be32(descAt);
-    be32(descLen);
-    if (gamma8 > 0) {
-        p.insert(p.end(), {'r', 'T', 'R', 'C'});
-        be32(curveAt);
-        be32(14);
-    }
-    p.insert(p.end(), {'d', 'e', 's', 'c', 0, 0, 0, 0});
-    be32(uint32_t(desc.size()) + 1);
-    p.insert(p.end(), desc.begin(), desc.end());
-    p.push_back(0);
+    be32(tags);
+    p.insert(p.end(), {'d', 'e', 's', 'c'}), be32(descAt), be32(descLen);
+    if (gamma8 > 0) p.insert(p.end(), {'r', 'T', 'R', 'C'}), be32(curveAt), be32(14);
+    p.insert(p.end(), {'d', 'e', 's', 'c', 0, 0, 0, 0}), be32(uint32_t(desc.size()) + 1);
+    p.insert(p.end(), desc.c_str(), desc.c_str() + desc.size() + 1);
     p.resize(curveAt, 0);
-    if (gamma8 > 0) {
-        p.insert(p.end(), {'c', 'u', 'r', 'v', 0, 0, 0, 0});
-        be32(1);
-        p.insert(p.end(), {uint8_t(gamma8 >> 8), uint8_t(gamma8)});
-    }
+    if (gamma8 > 0)
+        p.insert(p.end(), {'c', 'u', 'r', 'v', 0, 0, 0, 0, 0, 0, 0, 1, uint8_t(gamma8 >> 8), uint8_t(gamma8)});
     for (int i = 0; i < 4; ++i) p[i] = uint8_t(p.size() >> (24 - 8 * i));
     return p;
 }
@@ -249,8 +237,6 @@ TEST_F(JpegFormatTest, FrameHeadersAndHeaderOnlyReads) {
     EXPECT_EQ(r.image->Width(), 64);
     EXPECT_FALSE(r.image->HasScanLineData());
 }
-
-// ---- IPL ----
 
 // A four-component file from ImageMagick (Adobe inverted ink values) reads
 // with exactly the samples ImageMagick decodes, inverted back; JpegFormat

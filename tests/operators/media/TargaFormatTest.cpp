@@ -107,50 +107,42 @@ TEST_F(TargaFormatTest, OriginsMapsGreyAndSixteenBitFiles) {
     auto bgra = [](int b, int g, int r, int a = 255) {
         return Pixel{uint16_t(r * 257), uint16_t(g * 257), uint16_t(b * 257), uint16_t(a * 257)};
     };
+    // Every pixel of each file, bottom row first.
     const struct {
         const char *what;
         Bytes file;
-        std::vector<std::tuple<int, int, Pixel>> pixels;
+        std::vector<Pixel> pixels;
     } cases[] = {
         // Stored rows top first, columns from the right.
         {"top-origin, right to left",
          file(Header(2, 3, 2, 24, 0x30), {0, 0, 0, 1, 0, 0, 2, 0, 0, 10, 0, 0, 11, 0, 0, 12, 0, 0}),
-         {{0, 1, bgra(2, 0, 0)},
-          {1, 1, bgra(1, 0, 0)},
-          {2, 1, bgra(0, 0, 0)},
-          {0, 0, bgra(12, 0, 0)},
-          {1, 0, bgra(11, 0, 0)},
-          {2, 0, bgra(10, 0, 0)}}},
+         {bgra(12, 0, 0), bgra(11, 0, 0), bgra(10, 0, 0), bgra(2, 0, 0), bgra(1, 0, 0), bgra(0, 0, 0)}},
         // The run's fourth pixel starts the second stored line.
         {"top-origin run-length",
          file(Header(10, 3, 2, 24, 0x20), {0x83, 7, 8, 9, 0x01, 1, 2, 3, 4, 5, 6}),
-         {{0, 1, bgra(7, 8, 9)},
-          {2, 1, bgra(7, 8, 9)},
-          {0, 0, bgra(7, 8, 9)},
-          {1, 0, bgra(1, 2, 3)},
-          {2, 0, bgra(4, 5, 6)}}},
+         {bgra(7, 8, 9), bgra(1, 2, 3), bgra(4, 5, 6), bgra(7, 8, 9), bgra(7, 8, 9), bgra(7, 8, 9)}},
         // 24-bit entries 2, 3, 4 after an ID of 5 bytes.
         {"colour map",
          file(Header(1, 2, 1, 8, 0, 5, 1, 2, 3, 24),
               {'i', 'd', 'e', 'n', 't', 10, 20, 30, 40, 50, 60, 70, 80, 90, 4, 2}),
-         {{0, 0, bgra(70, 80, 90)}, {1, 0, bgra(10, 20, 30)}}},
+         {bgra(70, 80, 90), bgra(10, 20, 30)}},
         // 32-bit entries keep alpha when the descriptor says so.
-        {"colour map with alpha",
-         file(Header(1, 1, 1, 8, 8, 0, 1, 0, 1, 32), {1, 2, 3, 4, 0}),
-         {{0, 0, bgra(1, 2, 3, 4)}}},
+        {"colour map with alpha", file(Header(1, 1, 1, 8, 8, 0, 1, 0, 1, 32), {1, 2, 3, 4, 0}), {bgra(1, 2, 3, 4)}},
         // 5-5-5 with an alpha bit: 0x8000 | 31 << 10 | 1 << 5 | 16, then 31 << 5.
         {"16 bits",
          file(Header(2, 2, 1, 16, 1), {0x30, 0xfc, 0xe0, 0x03}),
-         {{0, 0, Pixel{255 * 257, 8 * 257, 132 * 257, 65535}}, {1, 0, Pixel{0, 255 * 257, 0, 0}}}},
+         {Pixel{255 * 257, 8 * 257, 132 * 257, 65535}, Pixel{0, 255 * 257, 0, 0}}},
         {"grey run-length",
          file(Header(11, 4, 1, 8, 0), {0x81, 50, 0x01, 7, 9}),
-         {{1, 0, bgra(50, 50, 50)}, {3, 0, bgra(9, 9, 9)}}},
+         {bgra(50, 50, 50), bgra(50, 50, 50), bgra(7, 7, 7), bgra(9, 9, 9)}},
     };
     for (const auto &c : cases) {
         SCOPED_TRACE(c.what);
         const LoadResult r = Load("TargaFormat", c.file);
         ASSERT_TRUE(r.image) << r.error;
-        for (const auto &[x, y, p] : c.pixels) EXPECT_EQ(At(*r.image, x, y), p) << x << "," << y;
+        const int w = r.image->Width();
+        ASSERT_EQ(size_t(w * r.image->Height()), c.pixels.size());
+        for (int i = 0; i < int(c.pixels.size()); ++i) EXPECT_EQ(At(*r.image, i % w, i / w), c.pixels[i]) << i;
     }
 
     // A top-origin copy of a plain file reads the same, regions too.
