@@ -1,5 +1,4 @@
-// What a write may replace, and clearing the temporaries of writers that
-// are gone.
+// What a write may replace, and clearing the temporaries of writers that are gone.
 #include <gtest/gtest.h>
 
 #include <filesystem>

@@ -43,8 +43,7 @@ TEST(SequenceName, ParsesTheLastNumberBeforeTheExtension) {
     }
 }
 
-// Frame names keep the padding and grow when needed; markers give the place
-// and padding of the number.
+// Frame names keep the padding and grow when needed; markers give the place and padding of the number.
 TEST(SequenceName, FrameNamesFromNumbersAndMarkers) {
     const struct {
         const char *path, *frame7, *frame12345, *display;

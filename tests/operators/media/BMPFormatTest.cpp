@@ -11,8 +11,8 @@ class BMPFormatTest : public FormatSuite {};
 /// The stored line size of 24-bit pixels: whole pixels rounded up to 4 bytes.
 int64_t PaddedStride(int w) { return (int64_t(w) * 3 + 3) / 4 * 4; }
 
-/// An 8-bit palette file made by hand. `os2`: the 12-byte header with 3-byte
-/// entries. Index of pixel (x, y) (y from the bottom) = (x * 5 + y * 3) % entries.
+/// An 8-bit palette file made by hand. `os2`: the 12-byte header with 3-byte entries. Index of pixel (x, y) (y from the
+/// bottom) = (x * 5 + y * 3) % entries.
 Bytes PaletteBMP(int w, int h, bool os2, int entries, std::vector<uint8_t> &bgrPalette) {
     bgrPalette.resize(size_t(entries) * 3);
     for (int i = 0; i < entries * 3; ++i) bgrPalette[i] = static_cast<uint8_t>(i * 37 + 11);
@@ -49,8 +49,8 @@ TEST_F(BMPFormatTest, HeadersAndLinesByteForByteAndBackAt24And32Bits) {
             const int at = alpha ? 66 : 54;
             const int64_t stride = alpha ? 4 * w : PaddedStride(w);
             ASSERT_EQ(int64_t(b.size()), at + stride * h);
-            // The header as the format defines it (the file size of 24-bit
-            // files counts no padding); compression stays 0 with the masks.
+            // The header as the format defines it (the file size of 24-bit files counts no padding); compression stays
+            // 0 with the masks.
             Bytes header(at, 0);
             header[0] = 'B', header[1] = 'M';
             Put32(header, 2, alpha ? 4u * w * h + 66 : 3u * (w * h + 18));

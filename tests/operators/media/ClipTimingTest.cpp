@@ -1,5 +1,5 @@
-// Time-to-frame arithmetic of clips: holds, trims, loop, reverse, and the
-// 2:3 cadences checked against the film frames each video field shows.
+// Time-to-frame arithmetic of clips: holds, trims, loop, reverse, and the 2:3 cadences checked against the film frames
+// each video field shows.
 #include <gtest/gtest.h>
 
 #include "operators/media/ClipTiming.h"
@@ -7,8 +7,8 @@
 namespace Orvane {
 namespace {
 
-// A clip at frame 100 using file frames 2..5; each row sets holds, reverse
-// and loop, and gives the file frame at times (-1: none).
+// A clip at frame 100 using file frames 2..5; each row sets holds, reverse and loop, and gives the file frame at times
+// (-1: none).
 TEST(ClipTiming, HoldsTrimsReverseAndLoop) {
     const struct {
         int holdFirst, holdLast;
@@ -19,8 +19,8 @@ TEST(ClipTiming, HoldsTrimsReverseAndLoop) {
         {2, 1, false, false, {{99.5, -1}, {100, 2}, {102, 2}, {103, 3}, {103.5, 3}, {104, 4}, {106, 5}, {107, -1}}},
         // Reversal follows the holds: the head holds the last used frame.
         {2, 1, true, false, {{100, 5}, {102, 5}, {103, 4}, {104, 3}, {105, 2}, {106, 2}}},
-        // A loop repeats after the end only, far away too (no slow walk); up
-        // to 0.00005 before the end the last frame holds and no loop wraps.
+        // A loop repeats after the end only, far away too (no slow walk); up to 0.00005 before the end the last frame
+        // holds and no loop wraps.
         {0, 0, false, true, {{99, -1}, {100, 2}, {103, 5}, {104, 2}, {111, 5}, {4000103, 5}, {103.99994, 5}}},
         {0, 0, false, false, {{103.99994, 5}, {103.99996, -1}}},
     };
@@ -48,9 +48,8 @@ TEST(ClipTiming, ClipSearchFindsTheElementOrTheOneBeforeAGap) {
     EXPECT_FALSE(FileFrameAt(list[0], 15)); // ... and gives nothing there without loop
 }
 
-// Standard 2:3 pull-down: film frames A B C D become video frames AA BB BC CD DD
-// (first field, second field). The plan's first field comes from plan.frame, the
-// second from frame + 1 when mixed.
+// Standard 2:3 pull-down: film frames A B C D become video frames AA BB BC CD DD (first field, second field). The
+// plan's first field comes from plan.frame, the second from frame + 1 when mixed.
 TEST(ClipTiming, PullDownFollowsTheTwoThreeCadence) {
     const int fields[5][2] = {{0, 0}, {1, 1}, {1, 2}, {2, 3}, {3, 3}};
     for (int64_t v = 0; v < 15; ++v) {
@@ -69,8 +68,8 @@ TEST(ClipTiming, PullDownFollowsTheTwoThreeCadence) {
     }
 }
 
-// Pull-up undoes it: film frame A is video 0, B video 1, C the fields of videos 2
-// and 3, D video 4, then every five video frames four film frames.
+// Pull-up undoes it: film frame A is video 0, B video 1, C the fields of videos 2 and 3, D video 4, then every five
+// video frames four film frames.
 TEST(ClipTiming, PullUpRebuildsFilmFramesAndDoublesAtTheEdges) {
     const int video[4] = {0, 1, 2, 4};
     for (int64_t f = 0; f < 12; ++f) {
@@ -89,9 +88,9 @@ TEST(ClipTiming, PullUpRebuildsFilmFramesAndDoublesAtTheEdges) {
     EXPECT_EQ(mixed, 0); // the advanced cadence rebuilds film frames from whole video frames
 }
 
-// Five video frames hold four film frames: a trim out at the last video frame of two cycles ends at film
-// frame 7, which ends at video frame 9. Fields: PAL's first field of frame 3 is field 1 ((n - 1) & 1, n = 6),
-// modes 3 and 4 order as 1 and 2.
+// Five video frames hold four film frames: a trim out at the last video frame of two cycles ends at film frame 7, which
+// ends at video frame 9. Fields: PAL's first field of frame 3 is field 1 ((n - 1) & 1, n = 6), modes 3 and 4 order as 1
+// and 2.
 TEST(ClipTiming, TrimsConvertBetweenFilmAndVideoFramesAndFieldsFollowTheMode) {
     for (auto [frame, mode, first, want] : {std::tuple{0, ImportPullUp, 0, 0},
                                             {0, ImportPullDown, 0, 0},

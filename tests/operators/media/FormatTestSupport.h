@@ -1,6 +1,6 @@
 #pragma once
-// Helpers of the still image format tests: saving and loading through a format (and a tool's options), test
-// images, comparisons, damage, little-endian fields, and running other programs.
+// Helpers of the still image format tests: saving and loading through a format (and a tool's options), test images,
+// comparisons, damage, little-endian fields, and running other programs.
 #include <gtest/gtest.h>
 
 #include <algorithm>
@@ -50,8 +50,8 @@ inline Bytes Save(const char *id, Image *img) {
     return io.Data();
 }
 
-/// Saves to `io` through a writing tool given `options`; false with the reason in `error` on failure.
-/// `predicted`: where the format's size prediction after SetupSave goes.
+/// Saves to `io` through a writing tool given `options`; false with the reason in `error` on failure. `predicted`:
+/// where the format's size prediction after SetupSave goes.
 inline bool SaveTo(IOClass *io, const char *id, Image *img, const Options &options, std::string &error,
                    const std::atomic<bool> *abort = nullptr, int64_t *predicted = nullptr) {
     OrvaneDoc doc;
@@ -205,8 +205,8 @@ inline void ExpectSameRows(const Image &want, const Image &got, const ImgRectI &
     }
 }
 
-/// Regions of a file (all, inside, a corner pixel, reaching out on either side, wholly outside) read as exactly
-/// the crop of the full read; outside the window the image is empty.
+/// Regions of a file (all, inside, a corner pixel, reaching out on either side, wholly outside) read as exactly the
+/// crop of the full read; outside the window the image is empty.
 inline void ExpectRegionsMatchFullRead(const char *id, const Bytes &data) {
     const LoadResult full = Load(id, data);
     ASSERT_TRUE(full.image) << full.error;
@@ -231,9 +231,9 @@ inline void ExpectRegionsMatchFullRead(const char *id, const Bytes &data) {
 }
 
 /// Damaged copies of a good file fail with a reason or read to a sane image: cuts (every byte in the first
-/// max(`header`, 256), then 64 more; the last `tail` bytes may be missing), each of the first `header` bytes
-/// flipped three ways, and 300 scatterings after the header, a third cut short too. `sizeKept`: a damaged read
-/// that succeeds has the stored size. Returns how many of the scattered reads failed.
+/// max(`header`, 256), then 64 more; the last `tail` bytes may be missing), each of the first `header` bytes flipped
+/// three ways, and 300 scatterings after the header, a third cut short too. `sizeKept`: a damaged read that succeeds
+/// has the stored size. Returns how many of the scattered reads failed.
 inline int ExpectDamageFailsCleanly(
     const char *id, const Bytes &good, size_t header, bool sizeKept, size_t tail = 0,
     void (*prepare)(ImageFormat &) = [](ImageFormat &) {}) {

@@ -23,10 +23,9 @@ std::string Identify(const std::string &format, const std::string &path) {
     return CaptureText("identify -format '" + format + "' '" + path + "'");
 }
 
-// A smooth picture written and read back: no sample off by more than the
-// row's codes (JPEG: colour, alpha read as opaque; IPL: alpha kept too), a
-// PSNR above the row's; the quality as ImageMagick estimates it. IPL files
-// start with the Adobe marker its check wants.
+// A smooth picture written and read back: no sample off by more than the row's codes (JPEG: colour, alpha read as
+// opaque; IPL: alpha kept too), a PSNR above the row's; the quality as ImageMagick estimates it. IPL files start with
+// the Adobe marker its check wants.
 TEST_F(JpegFormatTest, WriteReadIsCloseForBothKinds) {
     TempDir dir;
     const struct {
@@ -72,9 +71,8 @@ TEST_F(JpegFormatTest, WriteReadIsCloseForBothKinds) {
     }
 }
 
-// Our files: djpeg decodes what we decode; ImageMagick reads the size, the
-// quality and the sampling asked for, the defaults (quality 97, no chroma
-// subsampling, no resolution) and a custom resolution in dots per inch.
+// Our files: djpeg decodes what we decode; ImageMagick reads the size, the quality and the sampling asked for, the
+// defaults (quality 97, no chroma subsampling, no resolution) and a custom resolution in dots per inch.
 TEST_F(JpegFormatTest, OurFilesAsDjpegAndImageMagickReadThem) {
     TempDir dir;
     Ref<Image> src = SmoothImage(77, 45); // not multiples of the block size
@@ -97,8 +95,8 @@ TEST_F(JpegFormatTest, OurFilesAsDjpegAndImageMagickReadThem) {
     }
 }
 
-// Proxy scale 2 halves the size (rounding up) through libjpeg's scaling,
-// exactly as djpeg -scale 1/2 decodes; 4 quarters it.
+// Proxy scale 2 halves the size (rounding up) through libjpeg's scaling, exactly as djpeg -scale 1/2 decodes; 4
+// quarters it.
 TEST_F(JpegFormatTest, ProxyScaleDecodesAsDjpegScales) {
     TempDir dir;
     Ref<Image> src = SmoothImage(101, 60);
@@ -131,8 +129,7 @@ TEST_F(JpegFormatTest, DensitiesGiveThePixelAspect) {
     EXPECT_DOUBLE_EQ(fmt->aspectX / fmt->aspectY, 0.5);
 }
 
-/// Inserts an APP2 ICC profile marker after SOI: FF E2, length,
-/// "ICC_PROFILE\0", chunk 1 of 1, the profile.
+/// Inserts an APP2 ICC profile marker after SOI: FF E2, length, "ICC_PROFILE\0", chunk 1 of 1, the profile.
 Bytes WithICC(const Bytes &jpeg, const Bytes &icc) {
     const size_t len = 2 + 12 + 2 + icc.size();
     Bytes seg = {0xFF, 0xE2, uint8_t(len >> 8), uint8_t(len)};
@@ -163,8 +160,7 @@ Bytes Profile(const std::string &desc, int gamma8) {
     return p;
 }
 
-// The words of the profile's description name the colour space; a power
-// tone curve gives the gamma.
+// The words of the profile's description name the colour space; a power tone curve gives the gamma.
 TEST_F(JpegFormatTest, ICCProfileFillsMetadata) {
     const Bytes plain = Save("JpegFormat", SmoothImage(8, 8).Get());
     struct Case {
@@ -215,8 +211,8 @@ TEST_F(JpegFormatTest, ResolutionSliderFollowsItsCheckbox) {
     EXPECT_FALSE(dpi->IsVisible());
 }
 
-// A frame header (SOF) with zero components or 12-bit precision fails; a
-// header-only read decodes nothing, so pixel data need not even be there.
+// A frame header (SOF) with zero components or 12-bit precision fails; a header-only read decodes nothing, so pixel
+// data need not even be there.
 TEST_F(JpegFormatTest, FrameHeadersAndHeaderOnlyReads) {
     const Bytes bytes = Save("JpegFormat", SmoothImage(64, 48).Get());
     auto marker = [&](uint8_t code) {
@@ -238,9 +234,8 @@ TEST_F(JpegFormatTest, FrameHeadersAndHeaderOnlyReads) {
     EXPECT_FALSE(r.image->HasScanLineData());
 }
 
-// A four-component file from ImageMagick (Adobe inverted ink values) reads
-// with exactly the samples ImageMagick decodes, inverted back; JpegFormat
-// refuses the same file, saying the file is IPL's, and ours.
+// A four-component file from ImageMagick (Adobe inverted ink values) reads with exactly the samples ImageMagick
+// decodes, inverted back; JpegFormat refuses the same file, saying the file is IPL's, and ours.
 TEST_F(IPLFormatTest, ReadsFourComponentFilesFromImageMagick) {
     TempDir dir;
     ASSERT_TRUE(RunShell("convert -size 23x11 gradient:red-blue -colorspace CMYK -quality 90 '" + dir / "c.jpg" + "'"));
@@ -257,8 +252,8 @@ TEST_F(IPLFormatTest, ReadsFourComponentFilesFromImageMagick) {
     EXPECT_FALSE(Load("JpegFormat", Save("IPLFormat", r.image.Get())).headerOk);
 }
 
-// Three components under the IPL name are refused, with or without a JFIF
-// marker; a stream whose first marker is neither JFIF nor Adobe fails the check.
+// Three components under the IPL name are refused, with or without a JFIF marker; a stream whose first marker is
+// neither JFIF nor Adobe fails the check.
 TEST_F(IPLFormatTest, RefusesOtherStreams) {
     const Bytes rgb = Save("JpegFormat", SmoothImage(16, 16, true).Get());
     ASSERT_EQ(std::memcmp(&rgb[6], "JFIF", 4), 0);
@@ -279,8 +274,7 @@ TEST_F(IPLFormatTest, RefusesOtherStreams) {
     EXPECT_FALSE(Load("IPLFormat", Bytes(four.begin(), four.begin() + 15)).headerOk);
 }
 
-// Proxy scale 2 halves (rounding up); each scaled pixel is near the mean of
-// the 2 x 2 it covers (a smooth picture).
+// Proxy scale 2 halves (rounding up); each scaled pixel is near the mean of the 2 x 2 it covers (a smooth picture).
 TEST_F(IPLFormatTest, ProxyScale) {
     const Bytes bytes = Save("IPLFormat", SmoothImage(45, 31, true).Get());
     LoadResult half = LoadAt("IPLFormat", bytes, 2), full = Load("IPLFormat", bytes);

@@ -1,5 +1,5 @@
-// Loader and Saver in a document: which file a time reads, missing frames, the memory limit, the import options,
-// and where the Saver writes.
+// Loader and Saver in a document: which file a time reads, missing frames, the memory limit, the import options, and
+// where the Saver writes.
 #include <gtest/gtest.h>
 
 #include <filesystem>
@@ -94,8 +94,7 @@ TEST_F(LoaderSaver, LoaderPlacesTheSequenceOnTheTimeLine) {
 
 TEST_F(LoaderSaver, MissingFramesFillHoldOrFail) {
     std::filesystem::remove(dir / "plate.1002.raw");
-    // A colour, before anything was read: sized from the header of a frame
-    // that exists, not from the document.
+    // A colour, before anything was read: sized from the header of a frame that exists, not from the document.
     Set(loader, {{"MissingFrames", 2}, {"Red", 0.25}, {"Alpha", 1}});
     ASSERT_NE(doc.GetFrameFormat().width, W);
     Ref<Image> filled = Orvane::Test::EvalImage(loader, 1);

@@ -1,5 +1,5 @@
-// OpenEXRFormat: round trips, auxiliary channels, Metadata, files built byte by byte (and turned tiled, multi-part
-// and multi-view by the OpenEXR tools), the sample images against exrheader, damage, regions, display options.
+// OpenEXRFormat: round trips, auxiliary channels, Metadata, files built byte by byte (and turned tiled, multi-part and
+// multi-view by the OpenEXR tools), the sample images against exrheader, damage, regions, display options.
 #include <filesystem>
 #include <map>
 #include <regex>
@@ -16,8 +16,8 @@ const char *const kId = "OpenEXRFormat";
 
 float Value(int x, int y, int c) { return static_cast<float>((x * 3 + y * 5 + c * 7) % 32) / 4.f - 2.f; }
 
-/// A w x h image of `depth` whose data window is `window`; each pixel is
-/// Value() (plus a third for float32, so half precision would not do).
+/// A w x h image of `depth` whose data window is `window`; each pixel is Value() (plus a third for float32, so half
+/// precision would not do).
 Ref<Image> Pattern(int w, int h, int depth, const ImgRectI &window, bool smooth = false) {
     Ref<Image> img = NewImageTagList({{ImgWidth, w}, {ImgHeight, h}, {ImgDepth, depth}, {ImgDataWindow, &window}});
     EXPECT_TRUE(img && img->AllocScanLineData());
@@ -47,8 +47,8 @@ void Attr(Bytes &b, const std::string &name, const std::string &type, const Byte
     b.insert(b.end(), value.begin(), value.end());
 }
 
-/// An uncompressed scan-line file; channel c of file pixel (x, y) is value(x, y, c).
-/// A deep one holds one sample a pixel.
+/// An uncompressed scan-line file; channel c of file pixel (x, y) is value(x, y, c). A deep one holds one sample a
+/// pixel.
 Bytes HandMade(const ImgRectI &display, const ImgRectI &data, std::vector<Channel> channels,
                const std::function<float(int, int, const std::string &)> &value, bool deep = false) {
     std::sort(channels.begin(), channels.end(), [](auto &a, auto &b) { return a.name < b.name; });
@@ -103,8 +103,8 @@ Bytes HandMade(const ImgRectI &display, const ImgRectI &data, std::vector<Channe
 const std::vector<Channel> kRGBA = {{"R", 1}, {"G", 1}, {"B", 1}, {"A", 1}};
 int ChannelIndex(const std::string &n) { return n == "R" ? 0 : n == "G" ? 1 : n == "B" ? 2 : 3; }
 
-/// Display (1,1)-(12,8), data (3,2)-(10,6): the image is 12 x 8 with data
-/// window x 2..10, y 2..7, image (x, y) being file (x + 1, 8 - y).
+/// Display (1,1)-(12,8), data (3,2)-(10,6): the image is 12 x 8 with data window x 2..10, y 2..7, image (x, y) being
+/// file (x + 1, 8 - y).
 const ImgRectI kDisplay(1, 1, 12, 8), kData(3, 2, 10, 6), kImageWindow(2, 2, 10, 7);
 Bytes OffsetFile(int seed) {
     return HandMade(kDisplay, kData, kRGBA,
@@ -141,8 +141,8 @@ ImgRectI Flipped(const ImgRectI &data, const ImgRectI &display) {
                     h - (data.y0 - display.y0));
 }
 
-/// The OpenEXR sample images: $ORVANE_TESTDATA, else the shared folder beside
-/// the source tree, else the workplace's shared folder (a clone may live elsewhere).
+/// The OpenEXR sample images: $ORVANE_TESTDATA, else the shared folder beside the source tree, else the workplace's
+/// shared folder (a clone may live elsewhere).
 std::string Samples() {
     if (const char *env = std::getenv("ORVANE_TESTDATA")) return std::string(env) + "/openexr-images";
     for (const char *root : {ORVANE_SOURCE_DIR "/../shared/testdata", "/work/shared/testdata"})
@@ -177,9 +177,8 @@ TEST_F(OpenEXRFormatTest, RoundTripsEveryCompressionAndWindow) {
 
 TEST_F(OpenEXRFormatTest, SavesFromEveryDepthWithEveryDepthChoice) {
     if (!HaveProgram("exrheader")) GTEST_SKIP() << "exrheader is not installed";
-    // Every image depth by Depth choice (Auto, float16, float32): the file's
-    // colour is half for float16, and for Auto from int8 and float16 images;
-    // auxiliary channels are float but for float16; as exrheader reads them.
+    // Every image depth by Depth choice (Auto, float16, float32): the file's colour is half for float16, and for Auto
+    // from int8 and float16 images; auxiliary channels are float but for float16; as exrheader reads them.
     TempDir dir;
     const ImgRectI window(2, 1, 9, 5); // 11 x 6 frame: file lines 1..4, columns 2..8
     for (int depth = DepthAInt8; depth <= DepthRGBAFlt32; ++depth)
@@ -358,8 +357,8 @@ TEST_F(OpenEXRFormatTest, TiledMultiPartMultiViewAndLayeredFilesReadWhatIsChosen
     // The right view is the file's default; the left eye is still read first.
     ASSERT_TRUE(RunShell("exrmultiview -z zip right '" + dir / "b.exr" + "' left '" + dir / "a.exr" + "' '" +
                          dir / "v.exr" + "'"));
-    // Two colour layers, one with lower-case names, no alpha, and a channel no
-    // slot reads; pixel x of layer channel c holds x + the layer's and the channel's offsets.
+    // Two colour layers, one with lower-case names, no alpha, and a channel no slot reads; pixel x of layer channel c
+    // holds x + the layer's and the channel's offsets.
     std::vector<Channel> names;
     for (const char *n : {"beauty.r", "beauty.g", "beauty.b", "diffuse.R", "diffuse.G", "diffuse.B", "mask"})
         names.push_back({n, 1});
@@ -448,8 +447,7 @@ TEST_F(OpenEXRFormatTest, SampleImagesMatchExrheader) {
         }
     EXPECT_GE(files, 30);
 
-    // Each eye of the single-part multi-view and the multi-part Beachball
-    // frame agree, and the two eyes differ.
+    // Each eye of the single-part multi-view and the multi-part Beachball frame agree, and the two eyes differ.
     const Bytes singleFile = ReadFile(Samples() + "/Beachball/singlepart.0001.exr");
     const Bytes multiFile = ReadFile(Samples() + "/Beachball/multipart.0001.exr");
     auto differing = [](const Image &a, const Image &b) {
@@ -496,8 +494,8 @@ TEST_F(OpenEXRFormatTest, DamagedFilesAndFullDisksFailWithTheLibrarysReason) {
     EXPECT_FALSE(f->SaveHeader(&full, src.Get()) && f->SaveFrame(0, src.Get()));
     EXPECT_NE(f->Error().find("OpenEXR"), std::string::npos) << f->Error();
 
-    // Headers stating sizes the library would set memory aside for before
-    // reading (found by fuzzing): refused at the header.
+    // Headers stating sizes the library would set memory aside for before reading (found by fuzzing): refused at the
+    // header.
     Bytes hugeValue = {'j', 0, 'j', 0}, hugeTiles, tiles;
     Put32(hugeValue, 0x7ffffff0u); // an attribute of an unknown type claiming 2 GB
     Put32(tiles, 32), Put32(tiles, 3022880), tiles.push_back(0);

@@ -1,5 +1,5 @@
-// RawFormat: everything an image carries at every depth and compression, the header byte for byte, run-length
-// packets, the Metadata size limit, empty windows, regions, refused, damaged and truncated files.
+// RawFormat: everything an image carries at every depth and compression, the header byte for byte, run-length packets,
+// the Metadata size limit, empty windows, regions, refused, damaged and truncated files.
 #include "host/image/PixelMemory.h"
 #include "tests/operators/media/FormatTestSupport.h"
 
@@ -28,10 +28,9 @@ Bytes SaveRaw(Image *img, int compression) {
 
 void RestoreTags(ImageFormat &f) { f.SetAttrsTagList({{FormatRestoreTags, 1}}); }
 
-/// A frame with everything an image can carry: a data window reaching out
-/// of the frame, a smaller valid window, canvas colour, aspect, attributes of
-/// every kind, two auxiliary channels and Metadata. Pixel bytes come from
-/// Value8, so there are runs, and on float depths any bit pattern.
+/// A frame with everything an image can carry: a data window reaching out of the frame, a smaller valid window, canvas
+/// colour, aspect, attributes of every kind, two auxiliary channels and Metadata. Pixel bytes come from Value8, so
+/// there are runs, and on float depths any bit pattern.
 Ref<Image> Rich(int depth, int w = 37, int h = 9, ImgRectI dw = ImgRectI(-3, -2, 30, 11)) {
     const ImgRectI valid(0, 0, 20, 5);
     const FltPixel canvas{0.25f, 0.5f, 0.75f, 1.0f};
@@ -138,8 +137,8 @@ TEST_F(RawFormatTest, HeaderFieldsByteForByte) {
             // The size field: the plain data's size, or patched to the bytes written.
             EXPECT_EQ(U32(b, 16), compression ? b.size() - dataAt : uint32_t(rows * cols * (mainPix + auxPix)));
             EXPECT_EQ(b.size() - dataAt, U32(b, 16));
-            // Size, line sizes, depth, data and valid windows, then the proxy scale,
-            // time code, full size and field; the scales and field offset are doubles.
+            // Size, line sizes, depth, data and valid windows, then the proxy scale, time code, full size and field;
+            // the scales and field offset are doubles.
             const int offsets[] = {20, 24, 28, 32, 36, 40, 44, 48, 52, 56, 60, 64, 68, 108, 112, 116, 120, 124, 144};
             const int want[] = {
                 37, 9, cols * mainPix, cols * auxPix, depth, -3, -2, 30, 11, 0, 0, 20, 5, 2, 0, 90125, 74, 18, 1};
@@ -299,8 +298,8 @@ TEST_F(RawFormatTest, DamagedAndTruncatedFilesFailCleanly) {
     Bytes c = SaveRaw(src.Get(), 0);
     Put32(c, 16, 12345);
     EXPECT_TRUE(Load("RawFormat", c).image);
-    // With the size field at the frame's height (6 lines of 7 stored), only
-    // that many bytes are read: the last auxiliary lines stay zero.
+    // With the size field at the frame's height (6 lines of 7 stored), only that many bytes are read: the last
+    // auxiliary lines stay zero.
     Bytes d = SaveRaw(src.Get(), 0);
     const uint32_t oneRow = 20 * 8 + 20 * 8; // main and auxiliary line of the window
     Put32(d, 16, oneRow * 6);

@@ -1,5 +1,5 @@
-// TargaFormat: files as an independent decoder reads them, the packet rule, files made by hand, proxy scale,
-// refused headers.
+// TargaFormat: files as an independent decoder reads them, the packet rule, files made by hand, proxy scale, refused
+// headers.
 #include "tests/operators/media/FormatTestSupport.h"
 
 namespace Orvane {
@@ -19,8 +19,8 @@ Bytes Header(int type, int w, int h, int bits, int descriptor, int idLength = 0,
     return b;
 }
 
-/// Decodes run-length packets independently: the pixel bytes in order;
-/// `crossed` when a packet ran over the end of a line of `w` pixels.
+/// Decodes run-length packets independently: the pixel bytes in order; `crossed` when a packet ran over the end of a
+/// line of `w` pixels.
 Bytes Unpack(const Bytes &b, size_t pos, int w, int h, int bpp, bool &crossed) {
     Bytes out;
     crossed = false;
@@ -64,8 +64,7 @@ TEST_F(TargaFormatTest, HeadersLinesAndPacketsAsAnIndependentDecoderReadsThem) {
                 ExpectSamePixels(*src, *r.image, alpha);
             }
     }
-    // Compressed with alpha by default, through a tool or without one; the
-    // predicted size covers the file.
+    // Compressed with alpha by default, through a tool or without one; the predicted size covers the file.
     Ref<Image> img = Image8(5, 5);
     int64_t predicted = 0;
     for (const Bytes &b : {Save("TargaFormat", img.Get()), SaveWith("TargaFormat", img.Get(), {}, &predicted)}) {
