@@ -121,52 +121,52 @@ TEST_F(BMPFormatTest, NegativeHeightMeansTopLineFirst) {
 }
 
 TEST_F(BMPFormatTest, PalettesOfShortAndLongHeaders) {
-    struct Case {
-        int w, h;
-        bool os2;
-        int entries;
-        bool zeroOffset; ///< with a zero pixel offset the pixels follow the palette
-    } cases[] = {{5, 3, true, 256, false},
-                 {8, 2, true, 256, false},
-                 {1, 1, true, 256, false},
-                 {6, 4, false, 16, false}, // 16 colours used: only 16 entries are read
-                 {6, 4, true, 256, true}};
-    for (const Case &c : cases) {
-        SCOPED_TRACE(::testing::Message() << c.w << "x" << c.h << (c.os2 ? " short" : " long") << " header");
+    // Width, height, short header, entries (16 colours used: only 16 are read), and a zero pixel offset (the pixels
+    // follow the palette).
+    for (auto [w, h, os2, entries, zeroOffset] : {std::tuple{5, 3, true, 256, false},
+                                                  {8, 2, true, 256, false},
+                                                  {1, 1, true, 256, false},
+                                                  {6, 4, false, 16, false},
+                                                  {6, 4, true, 256, true}}) {
+        SCOPED_TRACE(::testing::Message() << w << "x" << h << (os2 ? " short" : " long") << " header");
         std::vector<uint8_t> pal;
-        Bytes b = PaletteBMP(c.w, c.h, c.os2, c.entries, pal);
-        if (c.zeroOffset) Put32(b, 10, 0);
+        Bytes b = PaletteBMP(w, h, os2, entries, pal);
+        if (zeroOffset) Put32(b, 10, 0);
         const LoadResult r = Load("BMPFormat", b);
         ASSERT_TRUE(r.image) << r.error;
-        ASSERT_EQ(r.image->DataWindow(), ImgRectI(0, 0, c.w, c.h));
-        for (int y = 0; y < c.h; ++y)
-            for (int x = 0; x < c.w; ++x) {
-                const uint8_t *e = &pal[(x * 5 + y * 3) % c.entries * 3];
+        ASSERT_EQ(r.image->DataWindow(), ImgRectI(0, 0, w, h));
+        for (int y = 0; y < h; ++y)
+            for (int x = 0; x < w; ++x) {
+                const uint8_t *e = &pal[(x * 5 + y * 3) % entries * 3];
                 ASSERT_EQ(At(*r.image, x, y),
                           (Pixel{uint16_t(e[2] * 257), uint16_t(e[1] * 257), uint16_t(e[0] * 257), 65535}))
                     << x << "," << y;
             }
-        if (!c.zeroOffset) ExpectDamageFailsCleanly("BMPFormat", b, 14 + (c.os2 ? 12 : 40), true);
+        if (!zeroOffset) ExpectDamageFailsCleanly("BMPFormat", b, 14 + (os2 ? 12 : 40), true);
     }
 }
 
 TEST_F(BMPFormatTest, UnsupportedAndAbsurdHeadersAreRefused) {
     const Bytes b = Save("BMPFormat", Image8(6, 5).Get());
-    const struct {
-        size_t at;
-        int bytes;
-        uint32_t value;
-    } cases[] = {
-        {0, 2, 0x4d42 + 1},                                                                        // magic
-        {28, 2, 1},           {28, 2, 4},           {28, 2, 16},          {28, 2, 0}, {28, 2, 64}, // bits
-        {30, 4, 1},           {30, 4, 2},           {30, 4, 4},           {30, 4, 5},              // compression
-        {18, 4, 0},           {22, 4, 0},                                                          // no size
-        {18, 4, 0x7fffffffu}, {22, 4, 0x80000000u}, {10, 4, 0x7ffffff0u}, // absurd width, height, pixel offset
-    };
-    for (const auto &c : cases) {
+    // Field offset, size and value: magic, bits, compression, no size, absurd width, height and pixel offset.
+    for (auto [at, bytes, value] : {std::tuple{0, 2, 0x4d42u + 1},
+                                    {28, 2, 1u},
+                                    {28, 2, 4u},
+                                    {28, 2, 16u},
+                                    {28, 2, 0u},
+                                    {28, 2, 64u},
+                                    {30, 4, 1u},
+                                    {30, 4, 2u},
+                                    {30, 4, 4u},
+                                    {30, 4, 5u},
+                                    {18, 4, 0u},
+                                    {22, 4, 0u},
+                                    {18, 4, 0x7fffffffu},
+                                    {22, 4, 0x80000000u},
+                                    {10, 4, 0x7ffffff0u}}) {
         Bytes bad = b;
-        c.bytes == 2 ? Put16(bad, c.at, c.value) : Put32(bad, c.at, c.value);
-        EXPECT_FALSE(Load("BMPFormat", bad).headerOk) << c.at << " = " << c.value;
+        bytes == 2 ? Put16(bad, at, value) : Put32(bad, at, value);
+        EXPECT_FALSE(Load("BMPFormat", bad).headerOk) << at << " = " << value;
     }
 }
 

@@ -41,10 +41,9 @@ TEST(ClipTiming, ClipSearchFindsTheElementOrTheOneBeforeAGap) {
     std::vector<ClipPlacement> list(2);
     list[0].start = 0, list[0].end = 9, list[1].start = 20, list[1].end = 29;
     EXPECT_FALSE(FindClipAt(list, -1));
-    EXPECT_EQ(FindClipAt(list, 9.5), 0u);
-    EXPECT_EQ(FindClipAt(list, 15), 0u); // in the gap: the clip before it answers
-    EXPECT_EQ(FindClipAt(list, 20), 1u);
-    EXPECT_EQ(FindClipAt(list, 1e8), 1u);
+    // In the gap (15) the clip before it answers.
+    for (auto [t, clip] : {std::pair{9.5, 0u}, {15.0, 0u}, {20.0, 1u}, {1e8, 1u}})
+        EXPECT_EQ(FindClipAt(list, t), clip) << t;
     EXPECT_FALSE(FileFrameAt(list[0], 15)); // ... and gives nothing there without loop
 }
 
@@ -92,22 +91,19 @@ TEST(ClipTiming, PullUpRebuildsFilmFramesAndDoublesAtTheEdges) {
 // ends at video frame 9. Fields: PAL's first field of frame 3 is field 1 ((n - 1) & 1, n = 6), modes 3 and 4 order as 1
 // and 2.
 TEST(ClipTiming, TrimsConvertBetweenFilmAndVideoFramesAndFieldsFollowTheMode) {
-    for (auto [frame, mode, first, want] : {std::tuple{0, ImportPullUp, 0, 0},
-                                            {0, ImportPullDown, 0, 0},
-                                            {7, ImportNormal, 3, 7},
-                                            {9, ImportPullUp, 0, 7},
-                                            {7, ImportPullDown, 0, 9}})
+    // Frame, mode, first frame, converted frame.
+    const int trims[][4] = {{0, ImportPullUp, 0, 0},
+                            {0, ImportPullDown, 0, 0},
+                            {7, ImportNormal, 3, 7},
+                            {9, ImportPullUp, 0, 7},
+                            {7, ImportPullDown, 0, 9}};
+    for (auto [frame, mode, first, want] : trims)
         EXPECT_EQ(ConvertPullFrame(frame, mode, 0, first), want) << frame << " mode " << mode;
-    for (auto [mode, time, field] : {std::tuple{0, 3.5, -1},
-                                     {1, 3.0, 1},
-                                     {1, 3.5, 0},
-                                     {2, 3.0, 0},
-                                     {2, 3.5, 1},
-                                     {3, 3.0, 1},
-                                     {3, 3.5, 0},
-                                     {4, 3.0, 0},
-                                     {4, 3.5, 1}})
-        EXPECT_EQ(FieldForTime(mode, time, 0.5), field) << mode << " at " << time;
+    EXPECT_EQ(FieldForTime(0, 3.5, 0.5), -1);
+    const int fields[4][2] = {{1, 0}, {0, 1}, {1, 0}, {0, 1}}; // modes 1 to 4 at times 3 and 3.5
+    for (int mode = 1; mode <= 4; ++mode)
+        for (int half = 0; half < 2; ++half)
+            EXPECT_EQ(FieldForTime(mode, 3 + half / 2.0, 0.5), fields[mode - 1][half]) << mode << " " << half;
 }
 
 } // namespace

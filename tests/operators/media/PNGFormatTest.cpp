@@ -148,14 +148,8 @@ TEST_F(PNGFormatTest, ColourChunksThroughMetadata) {
     });
     auto expectChunks = [](const Image &img, const char *space, double gamma) {
         const ScriptVal *cs = img.Metadata().Find("ColorSpace"), *g = img.Metadata().Find("Gamma");
-        ASSERT_EQ(cs != nullptr, space != nullptr);
-        if (cs) {
-            EXPECT_EQ(cs->AsText(), space);
-        }
-        ASSERT_EQ(g != nullptr, gamma > 0);
-        if (g) {
-            EXPECT_NEAR(g->AsNumber(), gamma, 1e-4); // gAMA holds 1 / gamma in units of 1e-5
-        }
+        EXPECT_EQ(cs ? cs->AsText() : "(none)", space);
+        EXPECT_NEAR(g ? g->AsNumber() : 0.0, gamma, 1e-4); // gAMA holds 1 / gamma in units of 1e-5
     };
     const Bytes srgb = SavePNG(src.Get(), {{"GammaMode", 2}});
     Ref<Image> a = LoadPNG(srgb);
@@ -167,15 +161,15 @@ TEST_F(PNGFormatTest, ColourChunksThroughMetadata) {
     const Bytes gam = SavePNG(src.Get(), {{"GammaMode", 3}, {"Gamma", 2.2}});
     Ref<Image> b = LoadPNG(gam);
     ASSERT_TRUE(b);
-    expectChunks(*b, nullptr, 2.2);
+    expectChunks(*b, "(none)", 2.2);
     WriteFile(dir / "g.png", gam);
     EXPECT_NEAR(std::atof(CaptureText("identify -format '%[gamma]' " + dir / "g.png").c_str()), 1 / 2.2, 1e-5);
 
     // Mode "None" writes neither; "Gamma" at 0 writes nothing either; "Auto" writes what the image's Metadata says, and
     // nothing for a plain image.
     for (const Options &o : {Options{{"GammaMode", 1}}, Options{{"GammaMode", 3}, {"Gamma", 0}}})
-        expectChunks(*LoadPNG(SavePNG(src.Get(), o)), nullptr, 0);
-    expectChunks(*LoadPNG(SavePNG(b.Get())), nullptr, 2.2);
+        expectChunks(*LoadPNG(SavePNG(src.Get(), o)), "(none)", 0);
+    expectChunks(*LoadPNG(SavePNG(b.Get())), "(none)", 2.2);
     expectChunks(*LoadPNG(SavePNG(a.Get())), "sRGB", 0);
     EXPECT_EQ(LoadPNG(SavePNG(src.Get()))->Metadata().Size(), 0u);
 }

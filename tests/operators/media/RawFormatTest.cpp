@@ -129,10 +129,8 @@ TEST_F(RawFormatTest, HeaderFieldsByteForByte) {
             EXPECT_EQ(U32(b, 704), 712u);                             // canvas colour
             EXPECT_EQ(U32(b, 708), uint32_t(712 + mainPix + auxPix)); // Metadata block
             EXPECT_GT(tagAt, U32(b, 708) + 8);                        // Metadata present
-            EXPECT_GE(tagEnd, tagAt);
-            EXPECT_EQ(dataAt % 512, 0u);
-            EXPECT_GE(dataAt, tagEnd);
-            EXPECT_LT(dataAt, tagEnd + 512);
+            EXPECT_TRUE(tagEnd >= tagAt && dataAt % 512 == 0 && dataAt >= tagEnd && dataAt < tagEnd + 512)
+                << tagAt << " " << tagEnd << " " << dataAt;
             for (uint32_t i = tagEnd; i < dataAt; ++i) ASSERT_EQ(b[i], 0) << "padding " << i;
             // The size field: the plain data's size, or patched to the bytes written.
             EXPECT_EQ(U32(b, 16), compression ? b.size() - dataAt : uint32_t(rows * cols * (mainPix + auxPix)));
@@ -145,23 +143,20 @@ TEST_F(RawFormatTest, HeaderFieldsByteForByte) {
             for (size_t i = 0; i < std::size(offsets); ++i) EXPECT_EQ(S32(b, offsets[i]), want[i]) << offsets[i];
             for (auto [at, v] : {std::pair{72, 1.5}, {80, 0.75}, {96, 0.5}, {128, 3.0}, {136, 1.5}})
                 EXPECT_EQ(F64(b, at), v) << "at " << at;
-            EXPECT_EQ(S16(b, 180), mainPix);
-            EXPECT_EQ(S16(b, 182), auxPix);
-            EXPECT_EQ(S16(b, 184), 64);
+            for (auto [at, v] : {std::pair{180, mainPix}, {182, auxPix}, {184, 64}}) EXPECT_EQ(S16(b, at), v) << at;
             // Slot tables: main, reserved, auxiliary, reserved; byte offsets in the pixel or -1.
             for (int s = 0; s < 64; ++s) {
                 const int main = depth >= 5 && s < 4 ? s * (depth == 5 ? 1 : 4) : depth < 5 && s == 3 ? 0 : -1;
                 const int aux = s == 4 + int(AuxChannelKind::Z) ? 0 : s == 4 + int(AuxChannelKind::VectorY) ? 4 : -1;
-                EXPECT_EQ(S16(b, 186 + 2 * s), main) << "main slot " << s;
-                EXPECT_EQ(S16(b, 314 + 2 * s), -1) << "reserved " << s;
-                EXPECT_EQ(S16(b, 442 + 2 * s), aux) << "aux slot " << s;
-                EXPECT_EQ(S16(b, 570 + 2 * s), -1);
+                EXPECT_EQ(
+                    std::tuple(S16(b, 186 + 2 * s), S16(b, 314 + 2 * s), S16(b, 442 + 2 * s), S16(b, 570 + 2 * s)),
+                    std::tuple(main, -1, aux, -1))
+                    << "slot " << s;
             }
             // Canvas colour: one main pixel as the depth stores it, then a zero auxiliary pixel.
-            uint8_t px[16];
+            uint8_t px[24] = {};
             StoredCanvas(*src, depth, px);
-            EXPECT_EQ(std::memcmp(&b[712], px, size_t(mainPix)), 0);
-            for (int i = 0; i < auxPix; ++i) EXPECT_EQ(b[712 + mainPix + i], 0);
+            EXPECT_EQ(Bytes(&b[712], &b[712 + mainPix + auxPix]), Bytes(px, px + mainPix + auxPix));
             // Plain pixel data: the bottom line of the window first, main plane then auxiliary.
             if (compression == 0) {
                 EXPECT_EQ(std::memcmp(&b[dataAt], src->ScanLine(-2), size_t(cols * mainPix)), 0);
@@ -274,8 +269,7 @@ TEST_F(RawFormatTest, AttributesAreRestoredOnlyWhenAsked) {
     EXPECT_FALSE(r.image->Attrs().Has(kTextAttr) || r.image->Attrs().Has(kIntAttr) || r.image->IsOpaque());
     // A plain frame writes the neutral values and reads back without extra attributes.
     const Bytes p = SaveRaw(Image8(2, 2).Get(), 0);
-    EXPECT_EQ(S32(p, 108), 1);
-    EXPECT_EQ(S32(p, 144), -1);
+    EXPECT_EQ(std::pair(S32(p, 108), S32(p, 144)), std::pair(1, -1));
     const LoadResult q = Load("RawFormat", p, {}, RestoreTags);
     ASSERT_TRUE(q.image) << q.error;
     for (Tag t : {ImgFullWidth, ImgField, ImgProxyScale, kTimeCode, ImgFieldOffset})
@@ -314,19 +308,18 @@ TEST_F(RawFormatTest, DamagedAndTruncatedFilesFailCleanly) {
 
 TEST_F(RawFormatTest, UnsupportedAndAbsurdHeadersAreRefused) {
     const Bytes good = SaveRaw(Rich(5).Get(), 2);
-    const struct {
-        size_t at;
-        uint32_t value;
-        const char *word;
-    } cases[] = {{36, 0, "depth"},       {36, 9, "depth"}, {36, 0xffffffffu, "depth"},
-                 {36, 255, "depth"},     {8, 700, "tag"}, // a tag offset inside the fixed header
-                 {700, 3, "compression"}};
-    for (const auto &c : cases) {
+    // A depth out of range, a tag offset inside the fixed header, an unknown compression.
+    for (auto [at, value, word] : {std::tuple{36, 0u, "depth"},
+                                   {36, 9u, "depth"},
+                                   {36, 0xffffffffu, "depth"},
+                                   {36, 255u, "depth"},
+                                   {8, 700u, "tag"},
+                                   {700, 3u, "compression"}}) {
         Bytes bad = good;
-        Put32(bad, c.at, c.value);
+        Put32(bad, at, value);
         const LoadResult r = Load("RawFormat", bad);
-        EXPECT_FALSE(r.headerOk) << c.at << " = " << c.value;
-        EXPECT_NE(r.error.find(c.word), std::string::npos) << r.error;
+        EXPECT_FALSE(r.headerOk) << at << " = " << value;
+        EXPECT_NE(r.error.find(word), std::string::npos) << r.error;
     }
     // Plain data whose size agrees with neither the size field nor the file.
     Bytes b = SaveRaw(Rich(6).Get(), 0);

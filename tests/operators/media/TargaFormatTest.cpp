@@ -68,8 +68,7 @@ TEST_F(TargaFormatTest, HeadersLinesAndPacketsAsAnIndependentDecoderReadsThem) {
     Ref<Image> img = Image8(5, 5);
     int64_t predicted = 0;
     for (const Bytes &b : {Save("TargaFormat", img.Get()), SaveWith("TargaFormat", img.Get(), {}, &predicted)}) {
-        EXPECT_EQ(b[2], 10);
-        EXPECT_EQ(b[16], 32);
+        EXPECT_EQ(std::pair(b[2], b[16]), std::pair(uint8_t(10), uint8_t(32)));
         EXPECT_GE(predicted, int64_t(b.size()));
     }
 }
@@ -164,10 +163,9 @@ TEST_F(TargaFormatTest, ProxyScaleOnPlainFilesOnly) {
     for (int scale : {2, 3}) {
         const LoadResult r = LoadAt("TargaFormat", plain, scale);
         ASSERT_TRUE(r.image) << r.error;
-        EXPECT_EQ(r.image->Width(), 9 / scale);
-        EXPECT_EQ(r.image->Height(), 7 / scale);
-        EXPECT_EQ(r.image->GetAttrL(ImgFullWidth), 9);
-        EXPECT_EQ(r.image->GetAttrL(ImgFullHeight), 7);
+        EXPECT_EQ(std::tuple(r.image->Width(), r.image->Height(), r.image->GetAttrL(ImgFullWidth),
+                             r.image->GetAttrL(ImgFullHeight)),
+                  std::tuple(9 / scale, 7 / scale, 9LL, 7LL));
         for (int y = 0; y < 7 / scale; ++y)
             for (int x = 0; x < 9 / scale; ++x) ASSERT_EQ(At(*r.image, x, y), At(*src, x * scale, y * scale));
         // Image type 10 ignores the proxy scale.
