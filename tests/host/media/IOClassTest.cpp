@@ -99,8 +99,7 @@ TEST(FileIO, WriteThenReadBackAndSeek) {
         ASSERT_NE(out, nullptr) << error;
         EXPECT_EQ(out->Path(), path);
         ASSERT_TRUE(out->WriteExact(data.data(), 200));
-        EXPECT_EQ(out->Tell(), 200);
-        EXPECT_EQ(out->Size(), 200);
+        EXPECT_EQ(std::pair(out->Tell(), out->Size()), std::pair(int64_t(200), int64_t(200)));
         // Patch a field behind the end, then go on at the end.
         const uint8_t patch[2] = {0xfe, 0xfd};
         ASSERT_TRUE(out->Seek(16, IOClass::SeekAbsolute));

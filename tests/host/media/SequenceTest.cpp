@@ -11,12 +11,8 @@ namespace Orvane::sequencetest {
 namespace {
 
 TEST(SequenceName, ParsesTheLastNumberBeforeTheExtension) {
-    const struct {
-        const char *path, *folder, *prefix, *suffix;
-        int64_t number;
-        int padding;
-        bool hasNumber;
-    } cases[] = {
+    // Path, folder, prefix, suffix, number, padding and whether there is one.
+    const std::tuple<const char *, const char *, const char *, const char *, int64_t, int, bool> cases[] = {
         {"/a/b/shot_v2.0042.exr", "/a/b/", "shot_v2.", ".exr", 42, 4, true},
         {"shot.1.png", "", "shot.", ".png", 1, 1, true},
         {"plate.00000001.dpx", "", "plate.", ".dpx", 1, 8, true},
@@ -29,20 +25,19 @@ TEST(SequenceName, ParsesTheLastNumberBeforeTheExtension) {
         {"dir.0001/still.exr", "dir.0001/", "still.exr", "", 0, 0, false},
         {".hidden12", "", ".hidden", "", 12, 2, true}, // a leading dot is no extension
     };
-    for (const auto &c : cases) {
-        SCOPED_TRACE(c.path);
-        const SequenceName s = ParseSequenceName(c.path);
-        EXPECT_EQ(std::tuple(s.folder, s.prefix, s.suffix, s.hasNumber),
-                  std::tuple(c.folder, c.prefix, c.suffix, c.hasNumber));
-        if (!c.hasNumber) continue;
-        EXPECT_EQ(std::pair(s.number, s.padding), std::pair(c.number, c.padding));
-        EXPECT_EQ(SequencePath(s, s.number), c.path) << "a parsed name writes back as it was";
+    for (const auto &[path, folder, prefix, suffix, number, padding, hasNumber] : cases) {
+        SCOPED_TRACE(path);
+        const SequenceName s = ParseSequenceName(path);
+        EXPECT_EQ(std::tuple(s.folder, s.prefix, s.suffix, s.hasNumber), std::tuple(folder, prefix, suffix, hasNumber));
+        if (!hasNumber) continue;
+        EXPECT_EQ(std::pair(s.number, s.padding), std::pair(number, padding));
+        EXPECT_EQ(SequencePath(s, s.number), path) << "a parsed name writes back as it was";
     }
 }
 
 // Frame names keep the padding and grow when needed; markers give the place and padding of the number.
 TEST(SequenceName, FrameNamesFromNumbersAndMarkers) {
-    const struct {
+    const struct { // the display name only where it differs from the path
         const char *path, *frame7, *frame12345, *display;
     } cases[] = {
         {"out/render.0100.exr", "out/render.0007.exr", "out/render.12345.exr", "out/render.####.exr"},

@@ -1,5 +1,4 @@
-// Time-to-frame arithmetic of clips: holds, trims, loop, reverse, and the 2:3 cadences checked against the film frames
-// each video field shows.
+// Time-to-frame arithmetic of clips: holds, trims, loop, reverse, and the 2:3 cadences.
 #include <gtest/gtest.h>
 
 #include "operators/media/ClipTiming.h"

@@ -1,5 +1,4 @@
-// What every still image format does alike, over a table of formats, and files of netpbm, libjpeg's tools and
-// ImageMagick read exactly, and ours read by them.
+// What every still image format does alike, and files of other programs read exactly, and ours read by them.
 #include "host/media/ImageFormatList.h"
 
 #include "tests/operators/media/FormatTestSupport.h"

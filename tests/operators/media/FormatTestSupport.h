@@ -243,10 +243,9 @@ inline int ExpectDamageFailsCleanly(
     if (!whole.image) return 0;
     auto sane = [&](const LoadResult &r, bool sameSize) {
         if (!r.image) return false;
-        EXPECT_GT(r.image->Width(), 0);
-        EXPECT_GT(r.image->Height(), 0);
-        EXPECT_TRUE(!sameSize ||
-                    (r.image->Width() == whole.image->Width() && r.image->Height() == whole.image->Height()));
+        const int w = r.image->Width(), h = r.image->Height();
+        EXPECT_TRUE(w > 0 && h > 0 && (!sameSize || (w == whole.image->Width() && h == whole.image->Height())))
+            << w << " x " << h;
         return true;
     };
     const size_t dense = std::max<size_t>(header, 256), step = std::max<size_t>(1, good.size() / 64);
@@ -284,16 +283,13 @@ inline void Put32(Bytes &b, size_t at, uint32_t v) {
 inline void Put16(Bytes &b, size_t at, uint32_t v) { b[at] = uint8_t(v), b[at + 1] = uint8_t(v >> 8); }
 
 /// A memory stream that takes only the first `limit` bytes written: a full disk.
-class LimitedIO : public MemoryIO {
-public:
-    explicit LimitedIO(int64_t limit) : limit_(limit) {}
+struct LimitedIO : MemoryIO {
+    explicit LimitedIO(int64_t limit) : limit(limit) {}
     int64_t Write(const void *buffer, int64_t bytes) override {
-        const int64_t room = std::max<int64_t>(0, std::min(bytes, limit_ - Tell()));
+        const int64_t room = std::max<int64_t>(0, std::min(bytes, limit - Tell()));
         return room > 0 ? MemoryIO::Write(buffer, room) : 0;
     }
-
-private:
-    int64_t limit_;
+    const int64_t limit;
 };
 
 inline bool RunShell(const std::string &cmd) { return std::system((cmd + " 2>/dev/null").c_str()) == 0; }

@@ -1,5 +1,4 @@
-// Loader and Saver in a document: which file a time reads, missing frames, the memory limit, the import options, and
-// where the Saver writes.
+// Loader and Saver in a document.
 #include <gtest/gtest.h>
 
 #include <filesystem>

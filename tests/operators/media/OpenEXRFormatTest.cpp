@@ -1,5 +1,4 @@
-// OpenEXRFormat: round trips, auxiliary channels, Metadata, files built byte by byte (and turned tiled, multi-part and
-// multi-view by the OpenEXR tools), the sample images against exrheader, damage, regions, display options.
+// OpenEXRFormat, with files built byte by byte and by the OpenEXR tools, and the sample images against exrheader.
 #include <filesystem>
 #include <map>
 #include <regex>

@@ -1,5 +1,4 @@
-// PNGFormat: exact round trips, alpha division and multiplication against ImageMagick, damaged chunks, the depth
-// option, colour chunks through Metadata.
+// PNGFormat: round trips, alpha division against ImageMagick, damaged chunks, depth and colour chunks.
 #include <zlib.h>
 
 #include "tests/operators/media/FormatTestSupport.h"

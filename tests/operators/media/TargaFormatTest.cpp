@@ -1,5 +1,4 @@
-// TargaFormat: files as an independent decoder reads them, the packet rule, files made by hand, proxy scale, refused
-// headers.
+// TargaFormat: files as an independent decoder reads them, files made by hand, proxy scale, refused headers.
 #include "tests/operators/media/FormatTestSupport.h"
 
 namespace Orvane {
@@ -93,8 +92,7 @@ TEST_F(TargaFormatTest, PacketsFollowTheRule) {
     // 200 different pixels: a literal of 128, then one of 72.
     const Bytes r = data(line(200, 1, [](int x) { return x; }));
     ASSERT_EQ(r.size(), 1 + 128 * 3 + 1 + 72 * 3u);
-    EXPECT_EQ(r[0], 127);
-    EXPECT_EQ(r[1 + 128 * 3], 71);
+    EXPECT_EQ(std::tuple(r[0], r[1 + 128 * 3]), std::tuple(127, 71));
 }
 
 TEST_F(TargaFormatTest, OriginsMapsGreyAndSixteenBitFiles) {
@@ -106,11 +104,7 @@ TEST_F(TargaFormatTest, OriginsMapsGreyAndSixteenBitFiles) {
         return Pixel{uint16_t(r * 257), uint16_t(g * 257), uint16_t(b * 257), uint16_t(a * 257)};
     };
     // Every pixel of each file, bottom row first.
-    const struct {
-        const char *what;
-        Bytes file;
-        std::vector<Pixel> pixels;
-    } cases[] = {
+    const std::tuple<const char *, Bytes, std::vector<Pixel>> cases[] = {
         // Stored rows top first, columns from the right.
         {"top-origin, right to left",
          file(Header(2, 3, 2, 24, 0x30), {0, 0, 0, 1, 0, 0, 2, 0, 0, 10, 0, 0, 11, 0, 0, 12, 0, 0}),
@@ -134,13 +128,13 @@ TEST_F(TargaFormatTest, OriginsMapsGreyAndSixteenBitFiles) {
          file(Header(11, 4, 1, 8, 0), {0x81, 50, 0x01, 7, 9}),
          {bgra(50, 50, 50), bgra(50, 50, 50), bgra(7, 7, 7), bgra(9, 9, 9)}},
     };
-    for (const auto &c : cases) {
-        SCOPED_TRACE(c.what);
-        const LoadResult r = Load("TargaFormat", c.file);
+    for (const auto &[what, bytes, pixels] : cases) {
+        SCOPED_TRACE(what);
+        const LoadResult r = Load("TargaFormat", bytes);
         ASSERT_TRUE(r.image) << r.error;
         const int w = r.image->Width();
-        ASSERT_EQ(size_t(w * r.image->Height()), c.pixels.size());
-        for (int i = 0; i < int(c.pixels.size()); ++i) EXPECT_EQ(At(*r.image, i % w, i / w), c.pixels[i]) << i;
+        ASSERT_EQ(size_t(w * r.image->Height()), pixels.size());
+        for (int i = 0; i < int(pixels.size()); ++i) EXPECT_EQ(At(*r.image, i % w, i / w), pixels[i]) << i;
     }
 
     // A top-origin copy of a plain file reads the same, regions too.
