@@ -38,16 +38,14 @@ TEST(OutputFile, OnlyRegularFilesAreReplacedAndLinksToThemWrittenThrough) {
     fs::create_symlink(d / "fifo", d / "to-fifo");
     fs::create_symlink(d / "none", d / "dangling");
     // The name, then the file written or why not.
-    const std::pair<const char *, const char *> cases[] = {
-        {"absent.png", "absent.png"},
-        {"plain.png", "plain.png"},
-        {"to-plain.png", "plain.png"},
-        {"folder", ": a folder, not a regular file"},
-        {"fifo", ": a FIFO, not a regular file"},
-        {"null", ": a character device, not a regular file"},
-        {"to-fifo", ": a symbolic link to a FIFO"},
-        {"dangling", ": a symbolic link to nothing"},
-    };
+    const std::pair<const char *, const char *> cases[] = {{"absent.png", "absent.png"},
+                                                           {"plain.png", "plain.png"},
+                                                           {"to-plain.png", "plain.png"},
+                                                           {"folder", ": a folder, not a regular file"},
+                                                           {"fifo", ": a FIFO, not a regular file"},
+                                                           {"null", ": a character device, not a regular file"},
+                                                           {"to-fifo", ": a symbolic link to a FIFO"},
+                                                           {"dangling", ": a symbolic link to nothing"}};
     for (const auto &[name, want] : cases) {
         if (std::string(name) == "null" && !device) continue;
         const bool ok = want[0] != ':';

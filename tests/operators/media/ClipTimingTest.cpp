@@ -9,11 +9,8 @@ namespace {
 // A clip at frame 100 using file frames 2..5; each row sets holds, reverse and loop, and gives the file frame at times
 // (-1: none).
 TEST(ClipTiming, HoldsTrimsReverseAndLoop) {
-    const struct {
-        int holdFirst, holdLast;
-        bool reverse, loop;
-        std::vector<std::pair<double, int64_t>> frames;
-    } rows[] = {
+    // Holds first and last, reverse, loop, and (time, file frame) pairs.
+    const std::tuple<int, int, bool, bool, std::vector<std::pair<double, int64_t>>> rows[] = {
         // Holds of 2 and 1 make 7 frames; fields truncate toward the frame they lie in.
         {2, 1, false, false, {{99.5, -1}, {100, 2}, {102, 2}, {103, 3}, {103.5, 3}, {104, 4}, {106, 5}, {107, -1}}},
         // Reversal follows the holds: the head holds the last used frame.
@@ -23,12 +20,12 @@ TEST(ClipTiming, HoldsTrimsReverseAndLoop) {
         {0, 0, false, true, {{99, -1}, {100, 2}, {103, 5}, {104, 2}, {111, 5}, {4000103, 5}, {103.99994, 5}}},
         {0, 0, false, false, {{103.99994, 5}, {103.99996, -1}}},
     };
-    for (const auto &row : rows) {
+    for (const auto &[holdFirst, holdLast, reverse, loop, frames] : rows) {
         ClipPlacement c;
-        c.start = 100, c.trimIn = 2, c.trimOut = 5, c.holdFirst = row.holdFirst, c.holdLast = row.holdLast;
-        c.reverse = row.reverse, c.loop = row.loop;
+        c.start = 100, c.trimIn = 2, c.trimOut = 5, c.holdFirst = holdFirst, c.holdLast = holdLast;
+        c.reverse = reverse, c.loop = loop;
         c.end = c.start + ElementLength(c) - 1;
-        for (auto [t, frame] : row.frames) EXPECT_EQ(FileFrameAt(c, t).value_or(-1), frame) << t;
+        for (auto [t, frame] : frames) EXPECT_EQ(FileFrameAt(c, t).value_or(-1), frame) << t;
     }
     // A one-frame range looping holds that frame everywhere after the start.
     ClipPlacement one;

@@ -28,25 +28,21 @@ std::string Identify(const std::string &format, const std::string &path) {
 // the Adobe marker its check wants.
 TEST_F(JpegFormatTest, WriteReadIsCloseForBothKinds) {
     TempDir dir;
-    const struct {
-        const char *id;
-        Options options;
-        int maxError, minPSNR;
-        const char *identify;
-    } cases[] = {
+    // Format, options, largest error, smallest PSNR, what identify reports.
+    const std::tuple<const char *, Options, int, int, const char *> cases[] = {
         {"JpegFormat", {}, 12, 40, "97 96 64 sRGB"}, // quality 97, no chroma subsampling
         {"JpegFormat", {{"Quality", 90}, {"ChromaSubsampling", 1}}, 24, 34, "90 96 64 sRGB"},
         {"IPLFormat", {}, 6, 0, "93 96 64 CMYK"},
         {"IPLFormat", {{"Quality", 100}}, 2, 0, "100 96 64 CMYK"},
         {"IPLFormat", {{"Quality", 60}}, 20, 0, "60 96 64 CMYK"},
     };
-    for (const auto &c : cases) {
-        SCOPED_TRACE(::testing::Message() << c.id << " " << c.identify);
-        const bool ipl = std::string(c.id) == "IPLFormat";
+    for (const auto &[id, options, maxError, minPSNR, identify] : cases) {
+        SCOPED_TRACE(::testing::Message() << id << " " << identify);
+        const bool ipl = std::string(id) == "IPLFormat";
         Ref<Image> src = SmoothImage(96, 64, ipl);
-        const Bytes bytes = SaveWith(c.id, src.Get(), c.options);
+        const Bytes bytes = SaveWith(id, src.Get(), options);
         EXPECT_TRUE(!ipl || (bytes[3] == 0xEE && std::memcmp(&bytes[6], "Adobe", 5) == 0));
-        LoadResult r = Load(c.id, bytes);
+        LoadResult r = Load(id, bytes);
         ASSERT_TRUE(r.image) << r.error;
         ASSERT_EQ(r.image->DataWindow(), src->DataWindow());
         double sq = 0;
@@ -60,10 +56,10 @@ TEST_F(JpegFormatTest, WriteReadIsCloseForBothKinds) {
                 }
                 worst = std::max(worst, std::abs((a.A >> 8) - (b.A >> 8)));
             }
-        EXPECT_GT(10 * std::log10(255.0 * 255.0 / (sq / (3.0 * 96 * 64) + 1e-12)), c.minPSNR);
-        EXPECT_LE(worst, c.maxError);
+        EXPECT_GT(10 * std::log10(255.0 * 255.0 / (sq / (3.0 * 96 * 64) + 1e-12)), minPSNR);
+        EXPECT_LE(worst, maxError);
         WriteFile(dir / "q.jpg", bytes);
-        EXPECT_EQ(Identify("%Q %w %h %[colorspace]", dir / "q.jpg"), c.identify);
+        EXPECT_EQ(Identify("%Q %w %h %[colorspace]", dir / "q.jpg"), identify);
     }
 }
 

@@ -364,42 +364,35 @@ TEST_F(OpenEXRFormatTest, TiledMultiPartMultiViewAndLayeredFilesReadWhatIsChosen
                                                 {"parts", ReadFile(dir / "p.exr")},
                                                 {"views", ReadFile(dir / "v.exr")},
                                                 {"layers", layered}};
-    struct Row {
-        const char *file;
-        Choices choices;
-        int eye, seed;     ///< the OffsetFile read (layers: the layer's offset)
-        const char *error; ///< the failure expected instead
-    };
-    const Row rows[] = {
-        {"tiled", {}, 0, 0, nullptr},
-        {"parts", {}, 0, 0, nullptr},
-        {"parts", {{"Part", "second"}}, 0, 5, nullptr},
+    // File, choices, eye, the OffsetFile read (layers: the layer's offset), or the failure expected instead.
+    const std::tuple<const char *, Choices, int, int, const char *> rows[] = {
+        {"tiled", {}, 0, 0, ""},
+        {"parts", {}, 0, 0, ""},
+        {"parts", {{"Part", "second"}}, 0, 5, ""},
         {"parts", {{"Part", "third"}}, 0, 0, "the file has no part third"},
-        {"views", {}, 0, 0, nullptr},
-        {"views", {}, 1, 5, nullptr},
-        {"views", {{"View", "right"}}, 0, 5, nullptr},
-        {"views", {{"View", "left"}}, 1, 0, nullptr}, // the choice outranks the eye
+        {"views", {}, 0, 0, ""},
+        {"views", {}, 1, 5, ""},
+        {"views", {{"View", "right"}}, 0, 5, ""},
+        {"views", {{"View", "left"}}, 1, 0, ""}, // the choice outranks the eye
         {"views", {{"View", "centre"}}, 0, 0, "the file has no view centre"},
-        {"layers", {}, 0, 0, nullptr},
-        {"layers", {{"Layer", "diffuse"}}, 0, 10, nullptr},
+        {"layers", {}, 0, 0, ""},
+        {"layers", {{"Layer", "diffuse"}}, 0, 10, ""},
         {"layers", {{"Layer", "specular"}}, 0, 0, "has no layer specular"},
     };
-    for (const Row &row : rows) {
-        SCOPED_TRACE(testing::Message() << row.file << " eye " << row.eye << " "
-                                        << (row.choices.empty() ? "" : row.choices[0].second));
+    for (const auto &[file, choices, eye, seed, failure] : rows) {
+        SCOPED_TRACE(testing::Message() << file << " eye " << eye << " " << (choices.empty() ? "" : choices[0].second));
         std::string error;
-        Ref<Image> img = LoadWith(kId, files.at(row.file), {}, row.choices, row.eye, &error);
-        if (row.error) {
-            EXPECT_FALSE(img);
-            EXPECT_NE(error.find(row.error), std::string::npos) << error;
-        } else if (std::string(row.file) == "layers") {
-            ASSERT_TRUE(img) << error;
-            const float at = row.seed + 2.f;
-            EXPECT_EQ(img->GetFlt(2, 0), (FltPixel{at, at + 0.25f, at + 0.5f, 1.f}));
-        } else {
-            ASSERT_TRUE(img) << error;
-            ExpectOffsetFile(*img, row.seed);
+        Ref<Image> img = LoadWith(kId, files.at(file), {}, choices, eye, &error);
+        if (*failure) {
+            EXPECT_TRUE(!img && error.find(failure) != std::string::npos) << error;
+            continue;
         }
+        ASSERT_TRUE(img) << error;
+        if (std::string(file) != "layers") {
+            ExpectOffsetFile(*img, seed);
+            continue;
+        }
+        EXPECT_EQ(img->GetFlt(2, 0), (FltPixel{seed + 2.f, seed + 2.25f, seed + 2.5f, 1.f}));
     }
 
     // After a header, the lists offer the file's parts and views.
