@@ -107,8 +107,7 @@ TEST_F(Clips, HeaderOnlyAndRegionRequestsReachTheFormat) {
     EXPECT_EQ(clip.Length(), 1);
     Ref<Image> shape = clip.GetFrameTagList(0, {{ClipFrameHeaderOnly, 1}}, error);
     ASSERT_TRUE(shape) << error;
-    EXPECT_TRUE(shape->IsNoData());
-    EXPECT_EQ(shape->Width(), 8);
+    EXPECT_TRUE(shape->IsNoData() && shape->Width() == 8);
     const ImageDomain region(ImgRectI(2, 1, 5, 9));
     Ref<Image> part = clip.GetFrameTagList(0, {{ClipFrameRegion, &region}}, error);
     ASSERT_TRUE(part) << error;

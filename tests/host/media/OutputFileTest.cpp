@@ -66,10 +66,8 @@ TEST(OutputFile, StaleTemporariesOfTheSameOutputAreRemoved) {
     EXPECT_EQ(std::pair(mine.target, long(mine.pid)), std::pair(std::string("f.0001.exr"), long(getpid())));
     const std::string dead = std::to_string(DeadPid()), alive = std::to_string(getpid());
     const auto old = fs::file_time_type::clock::now() - std::chrono::hours(2);
-    const struct {
-        std::string name;
-        bool oldFile, removed;
-    } cases[] = {
+    // The name, whether it is long untouched, and whether it goes.
+    const std::tuple<std::string, bool, bool> cases[] = {
         {".f.0001.exr.orvane-tmp-" + mine.host + "-" + dead, false, true},   // its writer is gone
         {".f.0002.exr.orvane-tmp-" + mine.host + "-" + alive, false, false}, // still writing
         {".f.0003.exr.orvane-tmp-farm-7-" + dead, false, false},             // another host, fresh
@@ -78,12 +76,12 @@ TEST(OutputFile, StaleTemporariesOfTheSameOutputAreRemoved) {
         {".f.001.exr.orvane-tmp-" + mine.host + "-" + dead, false, false},   // not of the four-digit sequence
         {"f.0001.exr", true, false},
     };
-    for (const auto &c : cases) {
-        std::ofstream(dir / c.name) << "partial";
-        if (c.oldFile) fs::last_write_time(dir / c.name, old);
+    for (const auto &[name, oldFile, removed] : cases) {
+        std::ofstream(dir / name) << "partial";
+        if (oldFile) fs::last_write_time(dir / name, old);
     }
     EXPECT_EQ(RemoveStaleTemporaries(ParseSequenceName(dir / "f.####.exr")), 2);
-    for (const auto &c : cases) EXPECT_EQ(fs::exists(dir / c.name), !c.removed) << c.name;
+    for (const auto &[name, oldFile, removed] : cases) EXPECT_EQ(fs::exists(dir / name), !removed) << name;
 
     // A name without a number: the one file's temporaries.
     std::ofstream(dir / (".still.png.orvane-tmp-" + mine.host + "-" + dead)) << "partial";

@@ -82,9 +82,8 @@ TEST_F(EveryFormat, HeaderOnlyAbortAndCheck) {
 
         std::atomic<bool> abort{true};
         const LoadResult stopped = Load(f.id, b, {}, [&](ImageFormat &fmt) { fmt.abortFlag = &abort; });
-        EXPECT_TRUE(stopped.headerOk);
-        EXPECT_FALSE(stopped.image);
-        EXPECT_EQ(stopped.error, "aborted");
+        EXPECT_EQ(std::tuple(stopped.headerOk, stopped.image.Get(), stopped.error),
+                  std::tuple(true, nullptr, std::string("aborted")));
         std::string error;
         MemoryIO out;
         EXPECT_FALSE(SaveTo(&out, f.id, src.Get(), f.options, error, &abort));
@@ -119,12 +118,10 @@ TEST_F(EveryFormat, FullDisksFailAndFilesOnDiskReadBack) {
         }
         const std::string path = dir / f.file;
         std::string error;
-        {
-            auto out = FileIO::Open(path, FileIO::Mode::Write, error);
-            ASSERT_NE(out, nullptr) << error;
-            ASSERT_TRUE(SaveTo(out.get(), f.id, img.Get(), f.options, error)) << error;
-            ASSERT_TRUE(out->Close());
-        }
+        auto out = FileIO::Open(path, FileIO::Mode::Write, error);
+        ASSERT_NE(out, nullptr) << error;
+        ASSERT_TRUE(SaveTo(out.get(), f.id, img.Get(), f.options, error)) << error;
+        ASSERT_TRUE(out->Close());
         EXPECT_EQ(ReadFile(path), whole) << "the file holds what memory holds";
     }
 }

@@ -1,4 +1,6 @@
 // RawFormat: everything an image carries, the header byte for byte, run-length packets, damaged files.
+#include <bit>
+
 #include "host/image/PixelMemory.h"
 #include "tests/operators/media/FormatTestSupport.h"
 
@@ -11,12 +13,7 @@ class RawFormatTest : public FormatSuite {};
 
 int32_t S32(const Bytes &b, size_t at) { return static_cast<int32_t>(U32(b, at)); }
 int16_t S16(const Bytes &b, size_t at) { return static_cast<int16_t>(b[at] | b[at + 1] << 8); }
-double F64(const Bytes &b, size_t at) {
-    uint64_t bits = U32(b, at) | uint64_t(U32(b, at + 4)) << 32;
-    double d;
-    std::memcpy(&d, &bits, 8);
-    return d;
-}
+double F64(const Bytes &b, size_t at) { return std::bit_cast<double>(U32(b, at) | uint64_t(U32(b, at + 4)) << 32); }
 
 constexpr Tag kTimeCode = 0x10020012;
 constexpr Tag kTextAttr = 0x30020100, kIdAttr = 0x80020100, kDoubleAttr = 0x20020100, kIntAttr = 0x10020100;
@@ -247,8 +244,7 @@ TEST_F(RawFormatTest, EmptyDataWindowReadsNoPixels) {
         EXPECT_EQ(b.size(), U32(b, 12)); // nothing after the header
         const LoadResult r = Load("RawFormat", b);
         ASSERT_TRUE(r.image) << r.error;
-        EXPECT_TRUE(r.image->DataWindow().IsNull());
-        EXPECT_FALSE(r.image->HasScanLineData());
+        EXPECT_TRUE(r.image->DataWindow().IsNull() && !r.image->HasScanLineData());
         EXPECT_EQ(r.image->GetCanvasColor(), canvas);
     }
 }
@@ -260,8 +256,7 @@ TEST_F(RawFormatTest, AttributesAreRestoredOnlyWhenAsked) {
     for (auto [tag, v] :
          {std::pair{ImgFullWidth, 74}, {ImgFullHeight, 18}, {ImgField, 1}, {ImgProxyScale, 2}, {kTimeCode, 90125}})
         EXPECT_EQ(r.image->GetAttrL(tag), v) << std::hex << tag;
-    EXPECT_EQ(r.image->GetAttrD(ImgFullXScale), 3.0);
-    EXPECT_EQ(r.image->GetAttrD(ImgFieldOffset), 0.5);
+    EXPECT_EQ(std::pair(r.image->GetAttrD(ImgFullXScale), r.image->GetAttrD(ImgFieldOffset)), std::pair(3.0, 0.5));
     // ...the tag block and the flags only with the format attribute.
     EXPECT_FALSE(r.image->Attrs().Has(kTextAttr) || r.image->Attrs().Has(kIntAttr) || r.image->IsOpaque());
     // A plain frame writes the neutral values and reads back without extra attributes.
