@@ -1,5 +1,4 @@
-// Clips: frames of a sequence read and written through a format, with the
-// format found by extension and check, and frames written atomically.
+// Clips: frames of a sequence read and written through a format found by extension and check, written atomically.
 #include <gtest/gtest.h>
 
 #include <cstring>
@@ -63,18 +62,13 @@ public:
 class Clips : public ::testing::Test {
 protected:
     static void SetUpTestSuite() {
-        static const Registry *row = [] {
-            TagList tags{{RegConstructor,
-                          +[](const Registry *reg, const ScriptVal &args, const TagList &tags) -> Object * {
-                              return new TestFormat(reg, args, tags);
-                          }},
-                         {RegTypeFlags, static_cast<long long>(RegFamilyImageFormat)},
-                         {RegFormatName, "Test Frames"},
-                         {RegFormatExtension, ".tfmt"},
-                         {RegFormatCanLoad, 1},
-                         {RegFormatCanSave, 1}};
-            return Registry::_Init(&ClassRegistry, OvID("TestFrameFormat"), tags);
-        }();
+        static TagList tags{{RegConstructor, &Orvane::Test::MakeTool<TestFormat>},
+                            {RegTypeFlags, static_cast<long long>(RegFamilyImageFormat)},
+                            {RegFormatName, "Test Frames"},
+                            {RegFormatExtension, ".tfmt"},
+                            {RegFormatCanLoad, 1},
+                            {RegFormatCanSave, 1}};
+        static const Registry *row = Registry::_Init(&ClassRegistry, OvID("TestFrameFormat"), tags);
         (void)row;
     }
     TempDir dir;
@@ -90,13 +84,11 @@ TEST_F(Clips, WritesASequenceAndReadsItBackWithItsFramesAndGaps) {
     EXPECT_FALSE(fs::exists(dir / "deep"));
     for (int64_t f : {0, 1, 3})
         ASSERT_TRUE(out.PutFrameTagList(f, img.Get(), {{ClipFrameMakeFolders, 1}}, error)) << error;
-    EXPECT_TRUE(fs::exists(dir / "deep/folder/shot.1001.tfmt"));
-    EXPECT_TRUE(fs::exists(dir / "deep/folder/shot.1004.tfmt"));
+    EXPECT_TRUE(fs::exists(dir / "deep/folder/shot.1001.tfmt") && fs::exists(dir / "deep/folder/shot.1004.tfmt"));
 
     Clip in(dir / "deep/folder/shot.1003.tfmt");
     ASSERT_TRUE(in.Scan(error)) << error;
-    EXPECT_EQ(in.InitialFrame(), 1001);
-    EXPECT_EQ(in.Length(), 4);
+    EXPECT_EQ(std::pair(in.InitialFrame(), in.Length()), std::pair(int64_t(1001), int64_t(4)));
     ASSERT_EQ(in.Found().gaps.size(), 1u);
     EXPECT_EQ(in.Found().gaps[0], (std::pair<int64_t, int64_t>{1003, 1003}));
     Ref<Image> back = in.GetFrameTagList(3, {}, error);
@@ -115,8 +107,7 @@ TEST_F(Clips, HeaderOnlyAndRegionRequestsReachTheFormat) {
     EXPECT_EQ(clip.Length(), 1);
     Ref<Image> shape = clip.GetFrameTagList(0, {{ClipFrameHeaderOnly, 1}}, error);
     ASSERT_TRUE(shape) << error;
-    EXPECT_TRUE(shape->IsNoData());
-    EXPECT_EQ(shape->Width(), 8);
+    EXPECT_TRUE(shape->IsNoData() && shape->Width() == 8);
     const ImageDomain region(ImgRectI(2, 1, 5, 9));
     Ref<Image> part = clip.GetFrameTagList(0, {{ClipFrameRegion, &region}}, error);
     ASSERT_TRUE(part) << error;

@@ -1,5 +1,4 @@
-// Numbered file sequences: parsing names, writing frame names, matching and
-// scanning a folder with gaps.
+// Numbered file sequences: parsing and writing names, matching, scanning a folder with gaps.
 #include <gtest/gtest.h>
 
 #include <filesystem>
@@ -12,12 +11,8 @@ namespace Orvane::sequencetest {
 namespace {
 
 TEST(SequenceName, ParsesTheLastNumberBeforeTheExtension) {
-    const struct {
-        const char *path, *folder, *prefix, *suffix;
-        int64_t number;
-        int padding;
-        bool hasNumber;
-    } cases[] = {
+    // Path, folder, prefix, suffix, number, padding and whether there is one.
+    const std::tuple<const char *, const char *, const char *, const char *, int64_t, int, bool> cases[] = {
         {"/a/b/shot_v2.0042.exr", "/a/b/", "shot_v2.", ".exr", 42, 4, true},
         {"shot.1.png", "", "shot.", ".png", 1, 1, true},
         {"plate.00000001.dpx", "", "plate.", ".dpx", 1, 8, true},
@@ -30,24 +25,19 @@ TEST(SequenceName, ParsesTheLastNumberBeforeTheExtension) {
         {"dir.0001/still.exr", "dir.0001/", "still.exr", "", 0, 0, false},
         {".hidden12", "", ".hidden", "", 12, 2, true}, // a leading dot is no extension
     };
-    for (const auto &c : cases) {
-        SCOPED_TRACE(c.path);
-        const SequenceName s = ParseSequenceName(c.path);
-        EXPECT_EQ(s.folder, c.folder);
-        EXPECT_EQ(s.prefix, c.prefix);
-        EXPECT_EQ(s.suffix, c.suffix);
-        EXPECT_EQ(s.hasNumber, c.hasNumber);
-        if (!c.hasNumber) continue;
-        EXPECT_EQ(s.number, c.number);
-        EXPECT_EQ(s.padding, c.padding);
-        EXPECT_EQ(SequencePath(s, s.number), c.path) << "a parsed name writes back as it was";
+    for (const auto &[path, folder, prefix, suffix, number, padding, hasNumber] : cases) {
+        SCOPED_TRACE(path);
+        const SequenceName s = ParseSequenceName(path);
+        EXPECT_EQ(std::tuple(s.folder, s.prefix, s.suffix, s.hasNumber), std::tuple(folder, prefix, suffix, hasNumber));
+        if (!hasNumber) continue;
+        EXPECT_EQ(std::pair(s.number, s.padding), std::pair(number, padding));
+        EXPECT_EQ(SequencePath(s, s.number), path) << "a parsed name writes back as it was";
     }
 }
 
-// Frame names keep the padding and grow when needed; markers give the place
-// and padding of the number.
+// Frame names keep the padding and grow when needed; markers give the place and padding of the number.
 TEST(SequenceName, FrameNamesFromNumbersAndMarkers) {
-    const struct {
+    const struct { // the display name only where it differs from the path
         const char *path, *frame7, *frame12345, *display;
     } cases[] = {
         {"out/render.0100.exr", "out/render.0007.exr", "out/render.12345.exr", "out/render.####.exr"},
@@ -92,39 +82,34 @@ TEST(SequenceName, FrameNamesFromNumbersAndMarkers) {
 }
 
 TEST(SequenceName, OutputNamesNumberAPlainNameOnlyForSeveralFrames) {
-    const struct {
-        const char *path, *several, *one;
-    } cases[] = {
-        {"o/out.exr", "o/out.0012.exr", "o/out.exr"},
-        {"o/out_.exr", "o/out_0012.exr", "o/out_.exr"},
-        {"o/out.", "o/out.0012.", "o/out."},
-        {"o/out", "o/out.0012", "o/out"},
-        {"o/.hidden", "o/.hidden.0012", "o/.hidden"},
-        {"o/shot.0100.exr", "o/shot.0012.exr", "o/shot.0012.exr"}, // a number gives the padding
-        {"o/shot.$F.exr", "o/shot.12.exr", "o/shot.12.exr"},
-    };
-    for (const auto &c : cases) {
-        SCOPED_TRACE(c.path);
-        EXPECT_EQ(SequencePath(OutputSequenceName(c.path, true), 12), c.several);
-        EXPECT_EQ(SequencePath(OutputSequenceName(c.path, false), 12), c.one);
+    // The name, frame 12 of several frames, and of one frame (a number in the name gives the padding).
+    for (auto [path, several, one] : {std::tuple{"o/out.exr", "o/out.0012.exr", "o/out.exr"},
+                                      {"o/out_.exr", "o/out_0012.exr", "o/out_.exr"},
+                                      {"o/out.", "o/out.0012.", "o/out."},
+                                      {"o/out", "o/out.0012", "o/out"},
+                                      {"o/.hidden", "o/.hidden.0012", "o/.hidden"},
+                                      {"o/shot.0100.exr", "o/shot.0012.exr", "o/shot.0012.exr"},
+                                      {"o/shot.$F.exr", "o/shot.12.exr", "o/shot.12.exr"}}) {
+        EXPECT_EQ(SequencePath(OutputSequenceName(path, true), 12), several) << path;
+        EXPECT_EQ(SequencePath(OutputSequenceName(path, false), 12), one) << path;
     }
 }
 
 TEST(SequenceName, MatchingRespectsPaddingPrefixAndSuffix) {
     const SequenceName four = ParseSequenceName("shot.0001.exr");
     const SequenceName one = ParseSequenceName("shot.1.exr");
-    const struct {
-        const char *file;
-        bool inFour, inOne;
-    } cases[] = {
-        {"shot.0002.exr", true, false},   {"shot.12345.exr", true, true},  {"shot.012345.exr", false, false},
-        {"shot.002.exr", false, false},   {"shot.7.exr", false, true},     {"shot.0002.png", false, false},
-        {"shots.0002.exr", false, false}, {"shot.-0003.exr", true, false}, {"shot.exr", false, false},
-    };
-    for (const auto &c : cases) {
+    for (auto [file, inFour, inOne] : {std::tuple{"shot.0002.exr", true, false},
+                                       {"shot.12345.exr", true, true},
+                                       {"shot.012345.exr", false, false},
+                                       {"shot.002.exr", false, false},
+                                       {"shot.7.exr", false, true},
+                                       {"shot.0002.png", false, false},
+                                       {"shots.0002.exr", false, false},
+                                       {"shot.-0003.exr", true, false},
+                                       {"shot.exr", false, false}}) {
         int64_t n;
-        EXPECT_EQ(MatchesSequence(four, c.file, n), c.inFour) << c.file;
-        EXPECT_EQ(MatchesSequence(one, c.file, n), c.inOne) << c.file;
+        EXPECT_EQ(std::pair(MatchesSequence(four, file, n), MatchesSequence(one, file, n)), std::pair(inFour, inOne))
+            << file;
     }
 }
 

@@ -1,7 +1,4 @@
-// BMPFormat: headers and lines byte for byte at 24 and 32 bits, deeper
-// images, line padding, bottom-up and top-down files, palettes of short and
-// long headers, and refused header values. What every format shares is in
-// EveryFormatTest.cpp.
+// BMPFormat: headers and lines byte for byte, deeper images, top-down files, palettes, refused headers.
 #include "tests/operators/media/FormatTestSupport.h"
 
 namespace Orvane {
@@ -11,19 +8,11 @@ using namespace Orvane::FmtTest;
 
 class BMPFormatTest : public FormatSuite {};
 
-uint32_t U32(const Bytes &b, size_t at) { return b[at] | b[at + 1] << 8 | b[at + 2] << 16 | uint32_t(b[at + 3]) << 24; }
-void Put32(Bytes &b, size_t at, uint32_t v) {
-    for (int i = 0; i < 4; ++i) b[at + i] = static_cast<uint8_t>(v >> (8 * i));
-}
-void Put16(Bytes &b, size_t at, uint32_t v) {
-    b[at] = static_cast<uint8_t>(v), b[at + 1] = static_cast<uint8_t>(v >> 8);
-}
-
 /// The stored line size of 24-bit pixels: whole pixels rounded up to 4 bytes.
 int64_t PaddedStride(int w) { return (int64_t(w) * 3 + 3) / 4 * 4; }
 
-/// An 8-bit palette file made by hand. `os2`: the 12-byte header with 3-byte
-/// entries. Index of pixel (x, y) (y from the bottom) = (x * 5 + y * 3) % entries.
+/// An 8-bit palette file made by hand. `os2`: the 12-byte header with 3-byte entries. Index of pixel (x, y) (y from the
+/// bottom) = (x * 5 + y * 3) % entries.
 Bytes PaletteBMP(int w, int h, bool os2, int entries, std::vector<uint8_t> &bgrPalette) {
     bgrPalette.resize(size_t(entries) * 3);
     for (int i = 0; i < entries * 3; ++i) bgrPalette[i] = static_cast<uint8_t>(i * 37 + 11);
@@ -54,12 +43,14 @@ TEST_F(BMPFormatTest, HeadersAndLinesByteForByteAndBackAt24And32Bits) {
         Ref<Image> src = Image8(w, h, seed);
         for (bool alpha : {true, false}) {
             SCOPED_TRACE(std::to_string(w) + "x" + std::to_string(h) + (alpha ? " alpha" : " no alpha"));
-            const Bytes b = SaveWith("BMPFormat", src.Get(), {{"SaveAlpha", alpha ? 1.0 : 0.0}});
+            int64_t predicted = 0;
+            const Bytes b = SaveWith("BMPFormat", src.Get(), {{"SaveAlpha", alpha ? 1.0 : 0.0}}, &predicted);
+            EXPECT_EQ(predicted, int64_t(b.size()));
             const int at = alpha ? 66 : 54;
             const int64_t stride = alpha ? 4 * w : PaddedStride(w);
             ASSERT_EQ(int64_t(b.size()), at + stride * h);
-            // The header as the format defines it (the file size of 24-bit
-            // files counts no padding); compression stays 0 with the masks.
+            // The header as the format defines it (the file size of 24-bit files counts no padding); compression stays
+            // 0 with the masks.
             Bytes header(at, 0);
             header[0] = 'B', header[1] = 'M';
             Put32(header, 2, alpha ? 4u * w * h + 66 : 3u * (w * h + 18));
@@ -74,14 +65,6 @@ TEST_F(BMPFormatTest, HeadersAndLinesByteForByteAndBackAt24And32Bits) {
                     const uint8_t want = x >= w ? 0 : Value8(x, y, c == 3 ? 3 : 2 - c, seed);
                     ASSERT_EQ(b[at + y * stride + i], want) << i << "," << y;
                 }
-            OrvaneDoc doc;
-            auto *tool = Orvane::Test::AddImageSource(doc, "S", src);
-            Ref<ImageFormat> f = MakeFormat("BMPFormat");
-            f->AddSaveInputs(tool);
-            Request req(tool, nullptr, 0.0, 0, nullptr);
-            req.SetInputData(tool->FindInput("SaveAlpha"), MakeRef<Number>(alpha ? 1.0 : 0.0).Get());
-            f->SetupSave(tool, &req);
-            EXPECT_EQ(f->PredictFileSize(src.Get()), int64_t(b.size()));
             const LoadResult r = Load("BMPFormat", b);
             ASSERT_TRUE(r.image) << r.error;
             EXPECT_EQ(r.image->Depth(), DepthRGBAInt8);
@@ -98,16 +81,15 @@ TEST_F(BMPFormatTest, DeeperImagesKeepTheTopEightBitsAndCanvasFillsOutside) {
     // 16-bit values come out as value >> 8 (no rounding).
     const uint16_t vals[4] = {0x12ff, 0x0080, 0xfffe, 0x7f01};
     auto v = [&](int i) { return vals[i % 4]; };
+    auto top = [](uint16_t u) { return uint16_t((u >> 8) * 257); };
     Ref<Image> src = MakeImage(4, 2, DepthRGBAInt16, [&](int x, int y) {
         return Pixel{v(x), v(x + 1), v(x + 2), v(x + y)};
     });
     const LoadResult r = Load("BMPFormat", Save("BMPFormat", src.Get()));
     ASSERT_TRUE(r.image) << r.error;
     for (int y = 0; y < 2; ++y)
-        for (int x = 0; x < 4; ++x) {
-            auto top = [](uint16_t u) { return uint16_t((u >> 8) * 257); };
+        for (int x = 0; x < 4; ++x)
             EXPECT_EQ(At(*r.image, x, y), (Pixel{top(v(x)), top(v(x + 1)), top(v(x + 2)), top(v(x + y))}));
-        }
     // A data window smaller than the frame: the canvas colour outside.
     ImgRectI dw(1, 1, 3, 2);
     const FltPixel canvas{0.5f, 0.25f, 1.0f, 1.0f};
@@ -117,14 +99,9 @@ TEST_F(BMPFormatTest, DeeperImagesKeepTheTopEightBitsAndCanvasFillsOutside) {
     part->Fill(FltPixel{0, 1, 0, 1});
     const LoadResult q = Load("BMPFormat", Save("BMPFormat", part.Get()));
     ASSERT_TRUE(q.image) << q.error;
+    const Pixel in{0, 65535, 0, 65535}, out{top(FloatToU16(0.5f)), top(FloatToU16(0.25f)), 65535, 65535};
     for (int y = 0; y < 3; ++y)
-        for (int x = 0; x < 4; ++x) {
-            const Pixel p = At(*q.image, x, y);
-            const bool inside = dw.Contains(x, y);
-            EXPECT_EQ(p.R, inside ? 0 : (FloatToU16(0.5f) >> 8) * 257) << x << "," << y;
-            EXPECT_EQ(p.G, inside ? 65535 : (FloatToU16(0.25f) >> 8) * 257);
-            EXPECT_EQ(p.B, inside ? 0 : 65535);
-        }
+        for (int x = 0; x < 4; ++x) EXPECT_EQ(At(*q.image, x, y), dw.Contains(x, y) ? in : out) << x << "," << y;
 }
 
 TEST_F(BMPFormatTest, NegativeHeightMeansTopLineFirst) {
@@ -144,52 +121,52 @@ TEST_F(BMPFormatTest, NegativeHeightMeansTopLineFirst) {
 }
 
 TEST_F(BMPFormatTest, PalettesOfShortAndLongHeaders) {
-    struct Case {
-        int w, h;
-        bool os2;
-        int entries;
-        bool zeroOffset; ///< with a zero pixel offset the pixels follow the palette
-    } cases[] = {{5, 3, true, 256, false},
-                 {8, 2, true, 256, false},
-                 {1, 1, true, 256, false},
-                 {6, 4, false, 16, false}, // 16 colours used: only 16 entries are read
-                 {6, 4, true, 256, true}};
-    for (const Case &c : cases) {
-        SCOPED_TRACE(::testing::Message() << c.w << "x" << c.h << (c.os2 ? " short" : " long") << " header");
+    // Width, height, short header, entries (16 colours used: only 16 are read), and a zero pixel offset (the pixels
+    // follow the palette).
+    for (auto [w, h, os2, entries, zeroOffset] : {std::tuple{5, 3, true, 256, false},
+                                                  {8, 2, true, 256, false},
+                                                  {1, 1, true, 256, false},
+                                                  {6, 4, false, 16, false},
+                                                  {6, 4, true, 256, true}}) {
+        SCOPED_TRACE(::testing::Message() << w << "x" << h << (os2 ? " short" : " long") << " header");
         std::vector<uint8_t> pal;
-        Bytes b = PaletteBMP(c.w, c.h, c.os2, c.entries, pal);
-        if (c.zeroOffset) Put32(b, 10, 0);
+        Bytes b = PaletteBMP(w, h, os2, entries, pal);
+        if (zeroOffset) Put32(b, 10, 0);
         const LoadResult r = Load("BMPFormat", b);
         ASSERT_TRUE(r.image) << r.error;
-        ASSERT_EQ(r.image->DataWindow(), ImgRectI(0, 0, c.w, c.h));
-        for (int y = 0; y < c.h; ++y)
-            for (int x = 0; x < c.w; ++x) {
-                const uint8_t *e = &pal[(x * 5 + y * 3) % c.entries * 3];
+        ASSERT_EQ(r.image->DataWindow(), ImgRectI(0, 0, w, h));
+        for (int y = 0; y < h; ++y)
+            for (int x = 0; x < w; ++x) {
+                const uint8_t *e = &pal[(x * 5 + y * 3) % entries * 3];
                 ASSERT_EQ(At(*r.image, x, y),
                           (Pixel{uint16_t(e[2] * 257), uint16_t(e[1] * 257), uint16_t(e[0] * 257), 65535}))
                     << x << "," << y;
             }
-        if (!c.zeroOffset) ExpectDamageFailsCleanly("BMPFormat", b, 14 + (c.os2 ? 12 : 40), true);
+        if (!zeroOffset) ExpectDamageFailsCleanly("BMPFormat", b, 14 + (os2 ? 12 : 40), true);
     }
 }
 
 TEST_F(BMPFormatTest, UnsupportedAndAbsurdHeadersAreRefused) {
     const Bytes b = Save("BMPFormat", Image8(6, 5).Get());
-    const struct {
-        size_t at;
-        int bytes;
-        uint32_t value;
-    } cases[] = {
-        {0, 2, 0x4d42 + 1},                                                                        // magic
-        {28, 2, 1},           {28, 2, 4},           {28, 2, 16},          {28, 2, 0}, {28, 2, 64}, // bits
-        {30, 4, 1},           {30, 4, 2},           {30, 4, 4},           {30, 4, 5},              // compression
-        {18, 4, 0},           {22, 4, 0},                                                          // no size
-        {18, 4, 0x7fffffffu}, {22, 4, 0x80000000u}, {10, 4, 0x7ffffff0u}, // absurd width, height, pixel offset
-    };
-    for (const auto &c : cases) {
+    // Field offset, size and value: magic, bits, compression, no size, absurd width, height and pixel offset.
+    for (auto [at, bytes, value] : {std::tuple{0, 2, 0x4d42u + 1},
+                                    {28, 2, 1u},
+                                    {28, 2, 4u},
+                                    {28, 2, 16u},
+                                    {28, 2, 0u},
+                                    {28, 2, 64u},
+                                    {30, 4, 1u},
+                                    {30, 4, 2u},
+                                    {30, 4, 4u},
+                                    {30, 4, 5u},
+                                    {18, 4, 0u},
+                                    {22, 4, 0u},
+                                    {18, 4, 0x7fffffffu},
+                                    {22, 4, 0x80000000u},
+                                    {10, 4, 0x7ffffff0u}}) {
         Bytes bad = b;
-        c.bytes == 2 ? Put16(bad, c.at, c.value) : Put32(bad, c.at, c.value);
-        EXPECT_FALSE(Load("BMPFormat", bad).headerOk) << c.at << " = " << c.value;
+        bytes == 2 ? Put16(bad, at, value) : Put32(bad, at, value);
+        EXPECT_FALSE(Load("BMPFormat", bad).headerOk) << at << " = " << value;
     }
 }
 

@@ -1,9 +1,6 @@
 #pragma once
-// Helpers shared by the still image format tests: making a format from its
-// registry row, saving to and loading from memory (through a tool's options
-// when given), test images with known values, comparing images and regions,
-// a temporary folder, and running netpbm and ImageMagick to make and read
-// files independently.
+// Helpers of the still image format tests: saving and loading through a format (and a tool's options), test images,
+// comparisons, damage, little-endian fields, and running other programs.
 #include <gtest/gtest.h>
 
 #include <algorithm>
@@ -53,11 +50,10 @@ inline Bytes Save(const char *id, Image *img) {
     return io.Data();
 }
 
-/// Saves to `io` through a writing tool: the format adds its inputs to a
-/// tool, the options are given to a request for that tool, and SetupSave
-/// reads them. False with the reason in `error` on failure.
+/// Saves to `io` through a writing tool given `options`; false with the reason in `error` on failure. `predicted`:
+/// where the format's size prediction after SetupSave goes.
 inline bool SaveTo(IOClass *io, const char *id, Image *img, const Options &options, std::string &error,
-                   const std::atomic<bool> *abort = nullptr) {
+                   const std::atomic<bool> *abort = nullptr, int64_t *predicted = nullptr) {
     OrvaneDoc doc;
     Operator *tool = Orvane::Test::AddImageSource(doc, "Saver", Ref<Image>(img));
     Ref<ImageFormat> f = MakeFormat(id);
@@ -69,6 +65,7 @@ inline bool SaveTo(IOClass *io, const char *id, Image *img, const Options &optio
         if (in) req.SetInputData(in, MakeRef<Number>(value).Get());
     }
     f->SetupSave(tool, &req);
+    if (predicted) *predicted = f->PredictFileSize(img);
     f->abortFlag = abort;
     const bool ok = f->SaveHeader(io, img) && f->SaveFrame(0, img);
     f->CleanupSave(tool);
@@ -77,10 +74,10 @@ inline bool SaveTo(IOClass *io, const char *id, Image *img, const Options &optio
 }
 
 /// SaveTo memory: the file (empty, and a test failure, when it fails).
-inline Bytes SaveWith(const char *id, Image *img, const Options &options) {
+inline Bytes SaveWith(const char *id, Image *img, const Options &options, int64_t *predicted = nullptr) {
     MemoryIO io;
     std::string error;
-    EXPECT_TRUE(SaveTo(&io, id, img, options, error)) << id << " save: " << error;
+    EXPECT_TRUE(SaveTo(&io, id, img, options, error, nullptr, predicted)) << id << " save: " << error;
     return io.Data();
 }
 
@@ -90,8 +87,7 @@ struct LoadResult {
     bool headerOk = false;
 };
 
-/// Reads one frame of `data`; `prepare` may set the proxy scale, the abort
-/// word or attributes before the header is read. A failure must say why.
+/// Reads one frame of `data`; `prepare` readies the format first. A failure must say why.
 template <class Prepare> LoadResult Load(const char *id, const Bytes &data, const TagList &tags, Prepare prepare) {
     LoadResult r;
     Ref<ImageFormat> f = MakeFormat(id);
@@ -113,8 +109,7 @@ inline LoadResult LoadAt(const char *id, const Bytes &data, int proxy) {
     return Load(id, data, {}, [proxy](ImageFormat &f) { f.proxyScale = proxy; });
 }
 
-/// Loads through a reading tool whose inputs hold `options` and the choices
-/// (Part, View, Layer...), for stereo eye `eye`; null with `error` on failure.
+/// Loads through a reading tool given `options` and choices, for stereo eye `eye`; null with `error` on failure.
 inline Ref<Image> LoadWith(const char *id, const Bytes &data, const Options &options, const Choices &choices = {},
                            int eye = 0, std::string *error = nullptr) {
     OrvaneDoc doc;
@@ -155,8 +150,7 @@ inline Ref<Image> MakeImage(int w, int h, int depth, const std::function<Pixel(i
     return img;
 }
 
-/// 8-bit values that differ from pixel to pixel (a hash of x, y and the
-/// channel), with some equal neighbours so that run-length coders see runs.
+/// 8-bit values hashed from x, y and the channel, with some equal neighbours so that run-length coders see runs.
 inline uint8_t Value8(int x, int y, int c, unsigned seed = 1) {
     if ((x / 3 + y) % 4 == 0) x = 0; // runs
     unsigned h = static_cast<unsigned>(x) * 73856093u ^ static_cast<unsigned>(y) * 19349663u ^
@@ -172,16 +166,14 @@ inline Ref<Image> Image8(int w, int h, unsigned seed = 1, int depth = DepthRGBAI
     });
 }
 
-/// A smooth picture with some detail (what lossy coders are made for), 8-bit
-/// values; opaque unless `alpha`, which gives a smooth ramp.
+/// A smooth picture with some detail (what lossy coders are made for); opaque unless `alpha`.
 inline Pixel Smooth(int x, int y, bool alpha = false) {
     const auto v = [](double t) { return uint16_t(std::lround(127.5 + 120 * std::sin(t)) * 257); };
     return {v(x * 0.05 + y * 0.02), v(y * 0.07 - 1.0), v((x + y) * 0.03 + 2.0),
             alpha ? v(x * 0.04 - y * 0.03) : uint16_t(65535)};
 }
 
-/// `got` has the window of `want` and its pixels within `tolerance` (as
-/// floats; 0: exactly), opaque unless `alpha`; reports the first few others.
+/// `got` has the window of `want` and its pixels within `tolerance` (0: exactly), opaque unless `alpha`.
 inline void ExpectSamePixels(const Image &want, const Image &got, bool alpha = true, float tolerance = 0) {
     ASSERT_EQ(got.DataWindow(), want.DataWindow());
     const ImgRectI w = want.DataWindow();
@@ -213,8 +205,7 @@ inline void ExpectSameRows(const Image &want, const Image &got, const ImgRectI &
     }
 }
 
-/// Regions of a file (all of it, inside, one corner pixel, reaching out of
-/// the data window on either side, wholly outside it) read as exactly the
+/// Regions of a file (all, inside, a corner pixel, reaching out on either side, wholly outside) read as exactly the
 /// crop of the full read; outside the window the image is empty.
 inline void ExpectRegionsMatchFullRead(const char *id, const Bytes &data) {
     const LoadResult full = Load(id, data);
@@ -239,14 +230,10 @@ inline void ExpectRegionsMatchFullRead(const char *id, const Bytes &data) {
     }
 }
 
-/// Damaged copies of a good file fail with a reason or read to a sane image:
-/// every cut short of the file (each within the first `header` or 256
-/// bytes, then 64 spread over the rest; a reader may do without the last
-/// `tail` bytes, an end marker), each of the first `header` bytes
-/// flipped three ways, and 300 scatterings of a few bytes after the header,
-/// a third of them cut short too. `sizeKept`: a damaged read that succeeds
-/// has the stored size. `prepare` readies each format object. Returns how
-/// many of the scattered reads failed.
+/// Damaged copies of a good file fail with a reason or read to a sane image: cuts (every byte in the first
+/// max(`header`, 256), then 64 more; the last `tail` bytes may be missing), each of the first `header` bytes flipped
+/// three ways, and 300 scatterings after the header, a third cut short too. `sizeKept`: a damaged read that succeeds
+/// has the stored size. Returns how many of the scattered reads failed.
 inline int ExpectDamageFailsCleanly(
     const char *id, const Bytes &good, size_t header, bool sizeKept, size_t tail = 0,
     void (*prepare)(ImageFormat &) = [](ImageFormat &) {}) {
@@ -256,10 +243,9 @@ inline int ExpectDamageFailsCleanly(
     if (!whole.image) return 0;
     auto sane = [&](const LoadResult &r, bool sameSize) {
         if (!r.image) return false;
-        EXPECT_GT(r.image->Width(), 0);
-        EXPECT_GT(r.image->Height(), 0);
-        EXPECT_TRUE(!sameSize ||
-                    (r.image->Width() == whole.image->Width() && r.image->Height() == whole.image->Height()));
+        const int w = r.image->Width(), h = r.image->Height();
+        EXPECT_TRUE(w > 0 && h > 0 && (!sameSize || (w == whole.image->Width() && h == whole.image->Height())))
+            << w << " x " << h;
         return true;
     };
     const size_t dense = std::max<size_t>(header, 256), step = std::max<size_t>(1, good.size() / 64);
@@ -287,20 +273,24 @@ inline int ExpectDamageFailsCleanly(
     return failed;
 }
 
+/// Little-endian fields of a file.
+inline uint32_t U32(const Bytes &b, size_t at) {
+    return b[at] | b[at + 1] << 8 | b[at + 2] << 16 | uint32_t(b[at + 3]) << 24;
+}
+inline void Put32(Bytes &b, size_t at, uint32_t v) {
+    for (int i = 0; i < 4; ++i) b[at + i] = uint8_t(v >> (8 * i));
+}
+inline void Put16(Bytes &b, size_t at, uint32_t v) { b[at] = uint8_t(v), b[at + 1] = uint8_t(v >> 8); }
+
 /// A memory stream that takes only the first `limit` bytes written: a full disk.
-class LimitedIO : public MemoryIO {
-public:
-    explicit LimitedIO(int64_t limit) : limit_(limit) {}
+struct LimitedIO : MemoryIO {
+    explicit LimitedIO(int64_t limit) : limit(limit) {}
     int64_t Write(const void *buffer, int64_t bytes) override {
-        const int64_t room = std::max<int64_t>(0, std::min(bytes, limit_ - Tell()));
+        const int64_t room = std::max<int64_t>(0, std::min(bytes, limit - Tell()));
         return room > 0 ? MemoryIO::Write(buffer, room) : 0;
     }
-
-private:
-    int64_t limit_;
+    const int64_t limit;
 };
-
-// ---- files and programs ----
 
 inline bool RunShell(const std::string &cmd) { return std::system((cmd + " 2>/dev/null").c_str()) == 0; }
 inline bool HaveProgram(const char *name) { return RunShell(std::string("command -v ") + name + " >/dev/null"); }
@@ -332,9 +322,8 @@ inline void WriteFile(const std::string &path, const Bytes &data) {
     f.write(reinterpret_cast<const char *>(data.data()), static_cast<std::streamsize>(data.size()));
 }
 
-/// Pixels of `img` (rows from the bottom) that differ from 8-bit RGBA
-/// samples stored top row first; alpha is compared only when `alpha`.
-/// -1 when the sizes differ.
+/// Pixels of `img` that differ from 8-bit RGBA samples stored top row first (alpha only when `alpha`); -1 when the
+/// sizes differ.
 inline int Mismatches(const Image &img, const Bytes &rgba, int w, int h, bool alpha = true) {
     if (img.Width() != w || img.Height() != h || rgba.size() != size_t(w) * h * 4) return -1;
     int bad = 0;

@@ -1,7 +1,4 @@
-// Loader and Saver in a document: which file a time reads, the missing-frame
-// rules and their messages, headers that ask for more memory than the limit,
-// the import options with values computed here, and where the Saver writes
-// (numbering, folders, failures).
+// Loader and Saver in a document.
 #include <gtest/gtest.h>
 
 #include <filesystem>
@@ -36,12 +33,15 @@ protected:
         }
         loader = doc.AddTool(OvID("Loader"), "Plate");
         ASSERT_NE(loader, nullptr);
-        Set(loader, "Clip", ScriptVal(dir / "plate.1001.raw"));
+        Set(loader, {{"Clip", dir / "plate.1001.raw"}});
     }
-    void Set(Operator *op, const char *id, const ScriptVal &v) {
-        Input *in = op->FindInput(id);
-        ASSERT_NE(in, nullptr) << id;
-        ASSERT_EQ(ApplyInputValue(doc, in, v), "") << id;
+    /// Sets inputs by ID, in order, as a document does.
+    void Set(Operator *op, std::initializer_list<std::pair<const char *, ScriptVal>> values) {
+        for (const auto &[id, v] : values) {
+            Input *in = op->FindInput(id);
+            ASSERT_NE(in, nullptr) << id;
+            ASSERT_EQ(ApplyInputValue(doc, in, v), "") << id;
+        }
     }
     /// The file number a time shows (R of pixel 0,0 / 1000), -1 for no image.
     int FileAt(double t) {
@@ -74,8 +74,7 @@ protected:
 TEST_F(LoaderSaver, LoaderPlacesTheSequenceOnTheTimeLine) {
     // The clip's length fills the trims and the out point.
     EXPECT_EQ(Orvane::Test::EvalImage(loader, 0)->Width(), W);
-    Set(loader, "GlobalIn", ScriptVal(10));
-    Set(loader, "HoldFirstFrame", ScriptVal(1));
+    Set(loader, {{"GlobalIn", 10}, {"HoldFirstFrame", 1}});
     EXPECT_EQ(loader->FindInput("GlobalOut")->Constant()->ToScript().AsNumber(), 14);
     const int expected[] = {1, 1, 2, 3, 4};
     for (int i = 0; i < 5; ++i) EXPECT_EQ(FileAt(10 + i), expected[i]) << i;
@@ -83,34 +82,28 @@ TEST_F(LoaderSaver, LoaderPlacesTheSequenceOnTheTimeLine) {
     EXPECT_EQ(LastConsole(), "Plate: no clip at frame 9 (the first starts later)");
     EXPECT_EQ(FileAt(15), -1);
     EXPECT_NE(LastConsole().find("Plate"), std::string::npos);
-    Set(loader, "Reverse", ScriptVal(1));
+    Set(loader, {{"Reverse", 1}});
     for (auto [t, file] : {std::pair{10, 4}, {14, 1}}) EXPECT_EQ(FileAt(t), file) << t;
-    Set(loader, "Loop", ScriptVal(1));
-    Set(loader, "Reverse", ScriptVal(0));
+    Set(loader, {{"Loop", 1}, {"Reverse", 0}});
     for (auto [t, file] : {std::pair{15, 1}, {17, 2}}) EXPECT_EQ(FileAt(t), file) << t;
     // The trims choose the files used (looping the two used frames).
-    Set(loader, "ClipTimeStart", ScriptVal(2));
-    Set(loader, "HoldFirstFrame", ScriptVal(0));
+    Set(loader, {{"ClipTimeStart", 2}, {"HoldFirstFrame", 0}});
     for (auto [t, file] : {std::pair{10, 3}, {11, 4}, {12, 3}}) EXPECT_EQ(FileAt(t), file) << t;
 }
 
 TEST_F(LoaderSaver, MissingFramesFillHoldOrFail) {
     std::filesystem::remove(dir / "plate.1002.raw");
-    // A colour, before anything was read: sized from the header of a frame
-    // that exists, not from the document.
-    Set(loader, "MissingFrames", ScriptVal(2));
-    Set(loader, "Red", ScriptVal(0.25));
-    Set(loader, "Alpha", ScriptVal(1));
+    // A colour, before anything was read: sized from the header of a frame that exists, not from the document.
+    Set(loader, {{"MissingFrames", 2}, {"Red", 0.25}, {"Alpha", 1}});
     ASSERT_NE(doc.GetFrameFormat().width, W);
     Ref<Image> filled = Orvane::Test::EvalImage(loader, 1);
     ASSERT_TRUE(filled);
     EXPECT_EQ(filled->DataWindow(), ImgRectI(0, 0, W, H));
     EXPECT_EQ(filled->GetFlt(2, 2), (FltPixel{0.25f, 0.f, 0.f, 1.f}));
-    Set(loader, "MissingFrames", ScriptVal(1));
-    EXPECT_EQ(FileAt(1), 1);
-    EXPECT_EQ(FileAt(2), 3);
+    Set(loader, {{"MissingFrames", 1}});
+    EXPECT_EQ(std::pair(FileAt(1), FileAt(2)), std::pair(1, 3));
     // Failing names the file once, and the frame by the file's own number.
-    Set(loader, "MissingFrames", ScriptVal(0));
+    Set(loader, {{"MissingFrames", 0}});
     EXPECT_EQ(FileAt(1), -1);
     EXPECT_EQ(LastConsole(), "Plate failed to load file \"" + (dir / "plate.1002.raw") +
                                  "\" (frame 1002) : No such file or directory");
@@ -125,7 +118,7 @@ TEST_F(LoaderSaver, AHeaderAskingForMoreThanTheMemoryLimitIsRefusedBeforeAllocat
     const int32_t x1 = 99999;
     std::memcpy(&*(at + 17 + 4 + 8), &x1, 4); // after the size, x0 and y0
     WriteFile(dir / "huge.exr", exr);
-    Set(loader, "Clip", ScriptVal(dir / "huge.exr"));
+    Set(loader, {{"Clip", dir / "huge.exr"}});
     struct Restore {
         ~Restore() { SetPixelMemoryLimit(0); }
     } restore;
@@ -140,7 +133,7 @@ TEST_F(LoaderSaver, AHeaderAskingForMoreThanTheMemoryLimitIsRefusedBeforeAllocat
 }
 
 TEST_F(LoaderSaver, AlphaOptionsAndDepth) {
-    Set(loader, "PostMultiplyByAlpha", ScriptVal(1));
+    Set(loader, {{"PostMultiplyByAlpha", 1}});
     Ref<Image> post = Orvane::Test::EvalImage(loader, 0);
     ASSERT_TRUE(post);
     for (int y = 0; y < H; ++y)
@@ -148,13 +141,11 @@ TEST_F(LoaderSaver, AlphaOptionsAndDepth) {
             const double r = 1000 + x + 10 * y;
             EXPECT_EQ(At(*post, x, y).R, std::lround(r * 32768 / 65535)) << x << "," << y;
         }
-    Set(loader, "PostMultiplyByAlpha", ScriptVal(0));
-    Set(loader, "InvertAlpha", ScriptVal(1));
+    Set(loader, {{"PostMultiplyByAlpha", 0}, {"InvertAlpha", 1}});
     EXPECT_EQ(Orvane::Test::EvalImage(loader, 0)->GetFlt(0, 0).A * 65535.0f, 32767.0f);
-    Set(loader, "MakeAlphaSolid", ScriptVal(1));
+    Set(loader, {{"MakeAlphaSolid", 1}});
     EXPECT_EQ(Orvane::Test::EvalImage(loader, 0)->GetFlt(0, 0).A, 0.0f); // solid, inverted
-    Set(loader, "InvertAlpha", ScriptVal(0));
-    Set(loader, "Depth", ScriptVal(5)); // float32
+    Set(loader, {{"InvertAlpha", 0}, {"Depth", 5}});                     // float32
     Ref<Image> flt = Orvane::Test::EvalImage(loader, 0);
     ASSERT_TRUE(flt && flt->IsRGBAFlt128());
     EXPECT_FLOAT_EQ(flt->GetFlt(3, 1).R, 1013.0f / 65535.0f);
@@ -167,8 +158,7 @@ TEST_F(LoaderSaver, ProxyRendersAreShrunkByWholeFactors) {
     Ref<Parameter> v = Render(loader, 0, task, ReqFlagProxy);
     auto *img = dynamic_cast<Image *>(v.Get());
     ASSERT_NE(img, nullptr);
-    EXPECT_EQ(img->Width(), W / 2);
-    EXPECT_EQ(img->Height(), H / 2);
+    EXPECT_EQ(std::pair(img->Width(), img->Height()), std::pair(W / 2, H / 2));
     // Each pixel averages a 2 x 2 block: R = 1000 + 2x + 20y + (0 + 1 + 10 + 11) / 4.
     EXPECT_NEAR(img->GetFlt(1, 1).R * 65535.0f, 1000 + 2 + 20 + 5.5, 0.51);
 }
@@ -177,9 +167,8 @@ TEST_F(LoaderSaver, SaverNumbersFilesAndWritesOnlyInRenders) {
     Operator *saver = doc.AddTool(OvID("Saver"), "Out");
     ASSERT_NE(saver, nullptr);
     ASSERT_TRUE(saver->FindInput("Input")->ConnectTo(loader->FindMainOutput()));
-    Set(saver, "Clip", ScriptVal(dir / "out/shot.0000.raw"));
-    Set(saver, "SequenceStartFrame", ScriptVal(1000));
-    Set(loader, "GlobalIn", ScriptVal(3));
+    Set(saver, {{"Clip", dir / "out/shot.0000.raw"}, {"SequenceStartFrame", 1000}});
+    Set(loader, {{"GlobalIn", 3}});
     RenderTask task;
     task.startTime = 3;
     auto render = [&](double t) { return Render(saver, t, task); };
@@ -187,7 +176,7 @@ TEST_F(LoaderSaver, SaverNumbersFilesAndWritesOnlyInRenders) {
     // Without "Create Folder During Render" a missing folder fails the frame.
     EXPECT_FALSE(render(5));
     EXPECT_EQ(LastConsole(), "Out failed to write " + (dir / "out/shot.1005.raw") + ": the folder does not exist");
-    Set(saver, "CreateDir", ScriptVal(1));
+    Set(saver, {{"CreateDir", 1}});
     ASSERT_TRUE(render(5));
     EXPECT_EQ(saver->FrameFileName(5, &task), dir / "out/shot.1005.raw");
     // The file holds the loaded frame exactly.
@@ -196,7 +185,7 @@ TEST_F(LoaderSaver, SaverNumbersFilesAndWritesOnlyInRenders) {
     EXPECT_EQ(At(*read, 4, 2).R, 3000 + 4 + 20);
 
     // Saver-relative numbering counts from the render's first frame.
-    Set(saver, "SetSequenceStart", ScriptVal(1));
+    Set(saver, {{"SetSequenceStart", 1}});
     ASSERT_TRUE(render(5));
     EXPECT_TRUE(std::filesystem::exists(dir / "out/shot.1002.raw"));
     EXPECT_EQ(saver->FrameFileName(5, nullptr), dir / "out/shot.1005.raw"); // from the global start, 0
@@ -215,10 +204,7 @@ TEST_F(LoaderSaver, SaverNumbersFilesAndWritesOnlyInRenders) {
 
 TEST_F(LoaderSaver, TheOutputFormatFollowsTheExtensionUnlessAnotherWasChosen) {
     // Documents set inputs in any order: the result must not depend on it.
-    const struct {
-        std::vector<std::pair<const char *, const char *>> steps;
-        const char *format;
-    } cases[] = {
+    const std::pair<std::vector<std::pair<const char *, const char *>>, const char *> cases[] = {
         {{{"Clip", "a.tga"}}, "TargaFormat"},
         {{{"Clip", "a.tga"}, {"OutputFormat", "PNGFormat"}}, "PNGFormat"},
         {{{"OutputFormat", "PNGFormat"}, {"Clip", "a.tga"}}, "PNGFormat"},
@@ -228,12 +214,12 @@ TEST_F(LoaderSaver, TheOutputFormatFollowsTheExtensionUnlessAnotherWasChosen) {
         {{{"Clip", "a.unknown"}}, "OpenEXRFormat"},
     };
     int n = 0;
-    for (const auto &c : cases) {
+    for (const auto &[steps, format] : cases) {
         Operator *saver = doc.AddTool(OvID("Saver"), "Out" + std::to_string(++n));
-        for (const auto &[id, value] : c.steps) Set(saver, id, ScriptVal(value));
-        EXPECT_EQ(saver->FindInput("OutputFormat")->Constant()->ToScript().AsText(), c.format) << n;
+        for (const auto &[id, value] : steps) Set(saver, {{id, value}});
+        EXPECT_EQ(saver->FindInput("OutputFormat")->Constant()->ToScript().AsText(), format) << n;
         // Resetting the choice hands the format back to the extension at once.
-        Set(saver, "Clip", ScriptVal("z.tga"));
+        Set(saver, {{"Clip", "z.tga"}});
         saver->FindInput("OutputFormat")->ResetValue();
         EXPECT_EQ(saver->FindInput("OutputFormat")->Constant()->ToScript().AsText(), "TargaFormat") << n;
     }
@@ -248,8 +234,7 @@ TEST_F(LoaderSaver, SaverCutsToTheFrameAndCanSaveAlphaAsColor) {
     Orvane::Test::AddImageSource(doc, "Src", src);
     Operator *saver = doc.AddTool(OvID("Saver"), "Out");
     ASSERT_TRUE(saver->FindInput("Input")->ConnectTo(doc.FindTool("Src")->FindMainOutput()));
-    Set(saver, "Clip", ScriptVal(dir / "cut.raw"));
-    Set(saver, "SaveAlphaToColor", ScriptVal(1));
+    Set(saver, {{"Clip", dir / "cut.raw"}, {"SaveAlphaToColor", 1}});
     RenderTask task;
     ASSERT_TRUE(Render(saver, 0, task));
     Ref<Image> read = ReadBack(dir / "cut.raw");

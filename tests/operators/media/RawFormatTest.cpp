@@ -1,8 +1,6 @@
-// RawFormat: every depth under every compression with windows that leave
-// the frame, canvas, aspect, attributes, auxiliary channels and Metadata;
-// the header byte for byte; run-length packets; the Metadata size limit;
-// empty windows; regions; refused, damaged and truncated files. What every
-// format shares is in EveryFormatTest.cpp.
+// RawFormat: everything an image carries, the header byte for byte, run-length packets, damaged files.
+#include <bit>
+
 #include "host/image/PixelMemory.h"
 #include "tests/operators/media/FormatTestSupport.h"
 
@@ -13,18 +11,9 @@ using namespace Orvane::FmtTest;
 
 class RawFormatTest : public FormatSuite {};
 
-uint32_t U32(const Bytes &b, size_t at) { return b[at] | b[at + 1] << 8 | b[at + 2] << 16 | uint32_t(b[at + 3]) << 24; }
 int32_t S32(const Bytes &b, size_t at) { return static_cast<int32_t>(U32(b, at)); }
 int16_t S16(const Bytes &b, size_t at) { return static_cast<int16_t>(b[at] | b[at + 1] << 8); }
-double F64(const Bytes &b, size_t at) {
-    uint64_t bits = U32(b, at) | uint64_t(U32(b, at + 4)) << 32;
-    double d;
-    std::memcpy(&d, &bits, 8);
-    return d;
-}
-void Put32(Bytes &b, size_t at, uint32_t v) {
-    for (int i = 0; i < 4; ++i) b[at + i] = static_cast<uint8_t>(v >> (8 * i));
-}
+double F64(const Bytes &b, size_t at) { return std::bit_cast<double>(U32(b, at) | uint64_t(U32(b, at + 4)) << 32); }
 
 constexpr Tag kTimeCode = 0x10020012;
 constexpr Tag kTextAttr = 0x30020100, kIdAttr = 0x80020100, kDoubleAttr = 0x20020100, kIntAttr = 0x10020100;
@@ -35,28 +24,18 @@ Bytes SaveRaw(Image *img, int compression) {
 
 void RestoreTags(ImageFormat &f) { f.SetAttrsTagList({{FormatRestoreTags, 1}}); }
 
-/// A frame with everything an image can carry: a data window reaching out
-/// of the frame, a smaller valid window, canvas colour, aspect, attributes of
-/// every kind, two auxiliary channels and Metadata. Pixel bytes come from
-/// Value8, so there are runs, and on float depths any bit pattern.
+/// A frame with everything an image can carry: a data window reaching out of the frame, a smaller valid window, canvas
+/// colour, aspect, attributes of every kind, two auxiliary channels and Metadata. Pixel bytes come from Value8, so
+/// there are runs, and on float depths any bit pattern.
 Ref<Image> Rich(int depth, int w = 37, int h = 9, ImgRectI dw = ImgRectI(-3, -2, 30, 11)) {
     const ImgRectI valid(0, 0, 20, 5);
     const FltPixel canvas{0.25f, 0.5f, 0.75f, 1.0f};
-    Ref<Image> img = NewImageTagList({{ImgWidth, w},
-                                      {ImgHeight, h},
-                                      {ImgDepth, depth},
-                                      {ImgXScale, 1.5},
-                                      {ImgYScale, 0.75},
-                                      {ImgDataWindow, &dw},
-                                      {ImgValidWindow, &valid},
-                                      {ImgCanvasColor, &canvas},
-                                      {ImgFullWidth, 74},
-                                      {ImgFullHeight, 18},
-                                      {ImgFullXScale, 3.0},
-                                      {ImgFullYScale, 1.5},
-                                      {ImgField, 1},
-                                      {ImgFieldOffset, 0.5},
-                                      {ImgProxyScale, 2}});
+    const TagList tags = {
+        {ImgWidth, w},      {ImgHeight, h},        {ImgDepth, depth},        {ImgXScale, 1.5},
+        {ImgYScale, 0.75},  {ImgDataWindow, &dw},  {ImgValidWindow, &valid}, {ImgCanvasColor, &canvas},
+        {ImgFullWidth, 74}, {ImgFullHeight, 18},   {ImgFullXScale, 3.0},     {ImgFullYScale, 1.5},
+        {ImgField, 1},      {ImgFieldOffset, 0.5}, {ImgProxyScale, 2}};
+    Ref<Image> img = NewImageTagList(tags);
     EXPECT_TRUE(img);
     img->SetAttrsTagList({{kTimeCode, 90125},
                           {kTextAttr, "a text attribute"},
@@ -77,13 +56,9 @@ Ref<Image> Rich(int depth, int w = 37, int h = 9, ImgRectI dw = ImgRectI(-3, -2,
             img->AuxRow(AuxChannelKind::VectorY, y)[x] = (x % 3) * -1.5f;
         }
     }
-    ScriptVal meta = ScriptVal::Table();
-    meta.Set("ColorSpace", "sRGB");
-    meta.Set("Gamma", 2.2);
     ScriptVal inner = ScriptVal::Table();
-    inner.Append(1.0), inner.Append("two"), inner.Append(true);
-    meta.Set("List", inner);
-    img->Metadata() = meta;
+    inner.Append(1.0).Append("two").Append(true);
+    img->Metadata() = ScriptVal::Table().Set("ColorSpace", "sRGB").Set("Gamma", 2.2).Set("List", inner);
     return img;
 }
 
@@ -106,16 +81,12 @@ TEST_F(RawFormatTest, EveryDepthUnderEveryCompressionRoundTrips) {
             const LoadResult r = Load("RawFormat", b, {}, RestoreTags);
             ASSERT_TRUE(r.image) << r.error;
             const Image &got = *r.image;
-            EXPECT_EQ(got.Width(), 37);
-            EXPECT_EQ(got.Height(), 9);
-            EXPECT_EQ(got.XScale(), 1.5);
-            EXPECT_EQ(got.YScale(), 0.75);
+            EXPECT_EQ(std::tuple(got.Width(), got.Height(), got.XScale(), got.YScale()), std::tuple(37, 9, 1.5, 0.75));
             EXPECT_EQ(got.ValidWindow(), src->ValidWindow());
             uint8_t px[16];
             EXPECT_EQ(got.GetCanvasColor(), StoredCanvas(*src, depth, px));
             EXPECT_EQ(got.Metadata(), src->Metadata());
-            EXPECT_TRUE(got.IsOpaque());
-            EXPECT_FALSE(got.IsSimple());
+            EXPECT_TRUE(got.IsOpaque() && !got.IsSimple());
             for (const TagItem &item : src->Attrs().Items()) {
                 const TagItem *g = got.Attrs().Find(item.tag);
                 ASSERT_NE(g, nullptr) << std::hex << item.tag;
@@ -132,6 +103,11 @@ TEST_F(RawFormatTest, EveryDepthUnderEveryCompressionRoundTrips) {
             EXPECT_EQ(channels, (depth <= 4 ? std::vector<long long>{3} : std::vector<long long>{0, 1, 2, 3}));
             ASSERT_EQ(got.DataWindow(), src->DataWindow());
             ExpectSameRows(*src, got, src->DataWindow());
+            // Regions of it and a header-only read keep the window and the auxiliary planes.
+            ExpectRegionsMatchFullRead("RawFormat", b);
+            const LoadResult pre = Load("RawFormat", b, {{ClipFrameHeaderOnly, 1}});
+            ASSERT_TRUE(pre.image) << pre.error;
+            EXPECT_EQ(pre.image->DataWindow(), src->DataWindow());
         }
     }
 }
@@ -149,39 +125,34 @@ TEST_F(RawFormatTest, HeaderFieldsByteForByte) {
             EXPECT_EQ(U32(b, 704), 712u);                             // canvas colour
             EXPECT_EQ(U32(b, 708), uint32_t(712 + mainPix + auxPix)); // Metadata block
             EXPECT_GT(tagAt, U32(b, 708) + 8);                        // Metadata present
-            EXPECT_GE(tagEnd, tagAt);
-            EXPECT_EQ(dataAt % 512, 0u);
-            EXPECT_GE(dataAt, tagEnd);
-            EXPECT_LT(dataAt, tagEnd + 512);
+            EXPECT_TRUE(tagEnd >= tagAt && dataAt % 512 == 0 && dataAt >= tagEnd && dataAt < tagEnd + 512)
+                << tagAt << " " << tagEnd << " " << dataAt;
             for (uint32_t i = tagEnd; i < dataAt; ++i) ASSERT_EQ(b[i], 0) << "padding " << i;
             // The size field: the plain data's size, or patched to the bytes written.
             EXPECT_EQ(U32(b, 16), compression ? b.size() - dataAt : uint32_t(rows * cols * (mainPix + auxPix)));
             EXPECT_EQ(b.size() - dataAt, U32(b, 16));
-            // Size, line sizes, depth, data and valid windows, then the proxy scale,
-            // time code, full size and field; the scales and field offset are doubles.
+            // Size, line sizes, depth, data and valid windows, then the proxy scale, time code, full size and field;
+            // the scales and field offset are doubles.
             const int offsets[] = {20, 24, 28, 32, 36, 40, 44, 48, 52, 56, 60, 64, 68, 108, 112, 116, 120, 124, 144};
             const int want[] = {
                 37, 9, cols * mainPix, cols * auxPix, depth, -3, -2, 30, 11, 0, 0, 20, 5, 2, 0, 90125, 74, 18, 1};
             for (size_t i = 0; i < std::size(offsets); ++i) EXPECT_EQ(S32(b, offsets[i]), want[i]) << offsets[i];
             for (auto [at, v] : {std::pair{72, 1.5}, {80, 0.75}, {96, 0.5}, {128, 3.0}, {136, 1.5}})
                 EXPECT_EQ(F64(b, at), v) << "at " << at;
-            EXPECT_EQ(S16(b, 180), mainPix);
-            EXPECT_EQ(S16(b, 182), auxPix);
-            EXPECT_EQ(S16(b, 184), 64);
+            for (auto [at, v] : {std::pair{180, mainPix}, {182, auxPix}, {184, 64}}) EXPECT_EQ(S16(b, at), v) << at;
             // Slot tables: main, reserved, auxiliary, reserved; byte offsets in the pixel or -1.
             for (int s = 0; s < 64; ++s) {
                 const int main = depth >= 5 && s < 4 ? s * (depth == 5 ? 1 : 4) : depth < 5 && s == 3 ? 0 : -1;
                 const int aux = s == 4 + int(AuxChannelKind::Z) ? 0 : s == 4 + int(AuxChannelKind::VectorY) ? 4 : -1;
-                EXPECT_EQ(S16(b, 186 + 2 * s), main) << "main slot " << s;
-                EXPECT_EQ(S16(b, 314 + 2 * s), -1) << "reserved " << s;
-                EXPECT_EQ(S16(b, 442 + 2 * s), aux) << "aux slot " << s;
-                EXPECT_EQ(S16(b, 570 + 2 * s), -1);
+                EXPECT_EQ(
+                    std::tuple(S16(b, 186 + 2 * s), S16(b, 314 + 2 * s), S16(b, 442 + 2 * s), S16(b, 570 + 2 * s)),
+                    std::tuple(main, -1, aux, -1))
+                    << "slot " << s;
             }
             // Canvas colour: one main pixel as the depth stores it, then a zero auxiliary pixel.
-            uint8_t px[16];
+            uint8_t px[24] = {};
             StoredCanvas(*src, depth, px);
-            EXPECT_EQ(std::memcmp(&b[712], px, size_t(mainPix)), 0);
-            for (int i = 0; i < auxPix; ++i) EXPECT_EQ(b[712 + mainPix + i], 0);
+            EXPECT_EQ(Bytes(&b[712], &b[712 + mainPix + auxPix]), Bytes(px, px + mainPix + auxPix));
             // Plain pixel data: the bottom line of the window first, main plane then auxiliary.
             if (compression == 0) {
                 EXPECT_EQ(std::memcmp(&b[dataAt], src->ScanLine(-2), size_t(cols * mainPix)), 0);
@@ -232,9 +203,7 @@ TEST_F(RawFormatTest, RunLengthPackets) {
     // 300 different values: literal packets of 128, 128, 44.
     const Bytes dd = data(line(2, 300, [](int x, int k) { return uint8_t(k ? x >> 8 : x); }));
     ASSERT_EQ(dd.size(), 3u + 300 * 2);
-    EXPECT_EQ(dd[0], 127);
-    EXPECT_EQ(dd[1 + 256], 127);
-    EXPECT_EQ(dd[2 + 512], 43);
+    EXPECT_EQ(std::tuple(dd[0], dd[1 + 256], dd[2 + 512]), std::tuple(127, 127, 43));
 }
 
 TEST_F(RawFormatTest, MetadataOf64KiBOrMoreIsDropped) {
@@ -275,8 +244,7 @@ TEST_F(RawFormatTest, EmptyDataWindowReadsNoPixels) {
         EXPECT_EQ(b.size(), U32(b, 12)); // nothing after the header
         const LoadResult r = Load("RawFormat", b);
         ASSERT_TRUE(r.image) << r.error;
-        EXPECT_TRUE(r.image->DataWindow().IsNull());
-        EXPECT_FALSE(r.image->HasScanLineData());
+        EXPECT_TRUE(r.image->DataWindow().IsNull() && !r.image->HasScanLineData());
         EXPECT_EQ(r.image->GetCanvasColor(), canvas);
     }
 }
@@ -288,33 +256,16 @@ TEST_F(RawFormatTest, AttributesAreRestoredOnlyWhenAsked) {
     for (auto [tag, v] :
          {std::pair{ImgFullWidth, 74}, {ImgFullHeight, 18}, {ImgField, 1}, {ImgProxyScale, 2}, {kTimeCode, 90125}})
         EXPECT_EQ(r.image->GetAttrL(tag), v) << std::hex << tag;
-    EXPECT_EQ(r.image->GetAttrD(ImgFullXScale), 3.0);
-    EXPECT_EQ(r.image->GetAttrD(ImgFieldOffset), 0.5);
+    EXPECT_EQ(std::pair(r.image->GetAttrD(ImgFullXScale), r.image->GetAttrD(ImgFieldOffset)), std::pair(3.0, 0.5));
     // ...the tag block and the flags only with the format attribute.
-    EXPECT_FALSE(r.image->Attrs().Has(kTextAttr));
-    EXPECT_FALSE(r.image->Attrs().Has(kIntAttr));
-    EXPECT_FALSE(r.image->IsOpaque());
+    EXPECT_FALSE(r.image->Attrs().Has(kTextAttr) || r.image->Attrs().Has(kIntAttr) || r.image->IsOpaque());
     // A plain frame writes the neutral values and reads back without extra attributes.
     const Bytes p = SaveRaw(Image8(2, 2).Get(), 0);
-    EXPECT_EQ(S32(p, 108), 1);
-    EXPECT_EQ(S32(p, 144), -1);
+    EXPECT_EQ(std::pair(S32(p, 108), S32(p, 144)), std::pair(1, -1));
     const LoadResult q = Load("RawFormat", p, {}, RestoreTags);
     ASSERT_TRUE(q.image) << q.error;
     for (Tag t : {ImgFullWidth, ImgField, ImgProxyScale, kTimeCode, ImgFieldOffset})
         EXPECT_FALSE(q.image->Attrs().Has(t)) << std::hex << t;
-}
-
-TEST_F(RawFormatTest, RegionsAndHeaderOnlyReadsKeepTheWindowAndAuxiliaryPlanes) {
-    for (int depth : {1, 6, 8})
-        for (int compression : {0, 1, 2}) {
-            SCOPED_TRACE("depth " + std::to_string(depth) + " compression " + std::to_string(compression));
-            Ref<Image> src = Rich(depth);
-            const Bytes b = SaveRaw(src.Get(), compression);
-            ExpectRegionsMatchFullRead("RawFormat", b);
-            const LoadResult pre = Load("RawFormat", b, {{ClipFrameHeaderOnly, 1}});
-            ASSERT_TRUE(pre.image) << pre.error;
-            EXPECT_EQ(pre.image->DataWindow(), src->DataWindow());
-        }
 }
 
 TEST_F(RawFormatTest, DamagedAndTruncatedFilesFailCleanly) {
@@ -333,8 +284,8 @@ TEST_F(RawFormatTest, DamagedAndTruncatedFilesFailCleanly) {
     Bytes c = SaveRaw(src.Get(), 0);
     Put32(c, 16, 12345);
     EXPECT_TRUE(Load("RawFormat", c).image);
-    // With the size field at the frame's height (6 lines of 7 stored), only
-    // that many bytes are read: the last auxiliary lines stay zero.
+    // With the size field at the frame's height (6 lines of 7 stored), only that many bytes are read: the last
+    // auxiliary lines stay zero.
     Bytes d = SaveRaw(src.Get(), 0);
     const uint32_t oneRow = 20 * 8 + 20 * 8; // main and auxiliary line of the window
     Put32(d, 16, oneRow * 6);
@@ -349,19 +300,18 @@ TEST_F(RawFormatTest, DamagedAndTruncatedFilesFailCleanly) {
 
 TEST_F(RawFormatTest, UnsupportedAndAbsurdHeadersAreRefused) {
     const Bytes good = SaveRaw(Rich(5).Get(), 2);
-    const struct {
-        size_t at;
-        uint32_t value;
-        const char *word;
-    } cases[] = {{36, 0, "depth"},       {36, 9, "depth"}, {36, 0xffffffffu, "depth"},
-                 {36, 255, "depth"},     {8, 700, "tag"}, // a tag offset inside the fixed header
-                 {700, 3, "compression"}};
-    for (const auto &c : cases) {
+    // A depth out of range, a tag offset inside the fixed header, an unknown compression.
+    for (auto [at, value, word] : {std::tuple{36, 0u, "depth"},
+                                   {36, 9u, "depth"},
+                                   {36, 0xffffffffu, "depth"},
+                                   {36, 255u, "depth"},
+                                   {8, 700u, "tag"},
+                                   {700, 3u, "compression"}}) {
         Bytes bad = good;
-        Put32(bad, c.at, c.value);
+        Put32(bad, at, value);
         const LoadResult r = Load("RawFormat", bad);
-        EXPECT_FALSE(r.headerOk) << c.at << " = " << c.value;
-        EXPECT_NE(r.error.find(c.word), std::string::npos) << r.error;
+        EXPECT_FALSE(r.headerOk) << at << " = " << value;
+        EXPECT_NE(r.error.find(word), std::string::npos) << r.error;
     }
     // Plain data whose size agrees with neither the size field nor the file.
     Bytes b = SaveRaw(Rich(6).Get(), 0);
