@@ -1,9 +1,5 @@
-// The merge's pixel formulas against values computed here, in double, from
-// the definitions in docs/MERGE.md written the other way round (separable
-// modes through straight colours, non-separable ones with sorted channels,
-// operators from their Porter-Duff factors); then whole images at every
-// depth, with canvases, windows and offsets, the copy beyond the foreground,
-// the depth merge, Dissolve's noise.
+// The merge's pixel formulas against docs/MERGE.md written the other way round, in double (straight colours,
+// sorted channels, Porter-Duff factors); whole images at every depth, the depth merge, Dissolve's noise.
 #include "host/image/MergeModes.h"
 
 #include "tests/host/image/ImageTestSupport.h"
@@ -87,10 +83,9 @@ TagList TagsOf(const Controls &c) {
                    {MrgDoBlue, c.on[2]},        {MrgDoAlpha, c.on[3]}};
 }
 
+FltPixel F(const D4 &p) { return {float(p[0]), float(p[1]), float(p[2]), float(p[3])}; }
 FltPixel Merged(const Controls &c, const D4 &f, const D4 &b) {
-    const FltPixel fp{float(f[0]), float(f[1]), float(f[2]), float(f[3])};
-    return MergePixel(MergeSettings::FromTags(TagsOf(c)), fp, {float(b[0]), float(b[1]), float(b[2]), float(b[3])}, 0,
-                      0);
+    return MergePixel(MergeSettings::FromTags(TagsOf(c)), F(f), F(b), 0, 0);
 }
 
 /// The merge of one pixel (not Dissolve), straight from the definitions.
@@ -128,9 +123,7 @@ D4 Reference(const Controls &c, const D4 &f, const D4 &b) {
 }
 
 TEST(MergeModes, EveryModeAndOperatorMatchesItsDefinition) {
-    // Pairs that reach every branch: halves of the light modes on both sides
-    // of 1/2, Soft Light's polynomial below 1/4, dodges at 0 and 1, empty and
-    // opaque alphas, values above 1.
+    // Pairs that reach every branch: both sides of 1/2 and 1/4, dodges at 0 and 1, empty and opaque, above 1.
     const std::pair<D4, D4> pairs[] = {
         {{0.12, 0.30, 0.45, 0.6}, {0.08, 0.56, 0.32, 0.8}}, // Cs .2 .5 .75, Cb .1 .7 .4
         {{0.9, 0.1, 0.5, 1.0}, {0.2, 0.6, 1.0, 1.0}},       // opaque over opaque
@@ -180,7 +173,6 @@ TEST(MergeModes, HandComputedPixels) {
 }
 
 TEST(MergeModes, DissolveKeepsWholePixelsByTheNoise) {
-    // The noise as the page defines it, written out again.
     auto noise = [](int x, int y) {
         uint32_t u = static_cast<uint32_t>(x) * 0x9E3779B1u + static_cast<uint32_t>(y) * 0x85EBCA77u;
         u = (u ^ (u >> 16)) * 0x7FEB352Du;
@@ -210,10 +202,7 @@ TEST(MergeModes, DissolveKeepsWholePixelsByTheNoise) {
 FltPixel FgAt(int x, int y) { return {0.05f * (x % 7), 0.04f * (y % 9), 0.3f, 0.25f + 0.05f * ((x + y) % 10)}; }
 FltPixel BgAt(int x, int y) { return {0.9f - 0.03f * x, 0.1f + 0.02f * y, 0.5f, 0.2f + 0.06f * (x % 12)}; }
 
-/// Whether a stored component is the value computed here, stored at
-/// `depth`: an integer depth must hold the nearest code of the clamped value
-/// (within half a code, so the code beside it fails), a half the nearest
-/// half (within half a step), a float the value within a few ulps.
+/// Whether a stored component is `want` stored at `depth`: within half a code or half step, a float's few ulps.
 ::testing::AssertionResult StoredNear(int depth, double got, double want) {
     if (Kind(depth) < 2) want = std::clamp(want, 0.0, 1.0);
     const double tol = Kind(depth) == 3 ? 2e-6 * std::max(1.0, std::fabs(want))
@@ -223,10 +212,8 @@ FltPixel BgAt(int x, int y) { return {0.9f - 0.03f * x, 0.1f + 0.02f * y, 0.5f, 
 }
 
 TEST(MergeImages, EveryDepthCanvasWindowAndOffsetFollowTheReference) {
-    // The foreground, placed 2 right and 1 down, lies left and the background
-    // right, both with canvases: the result reaches over both, its canvas is
-    // the canvases merged, and each pixel is the reference on what the inputs
-    // hold there, stored at the background's depth.
+    // The foreground, placed 2 right and 1 down, left of the background, both with canvases: the result covers
+    // both, its canvas is the canvases merged, each pixel the reference stored at the background's depth.
     const ImgRectI fw(-2, 1, 4, 13), bw(4, 2, 16, 10);
     const FltPixel fc{0.1f, 0.1f, 0.0f, 0.25f}, bc{0.0f, 0.2f, 0.4f, 0.5f};
     std::vector<std::pair<int, int>> depths = {{DepthRGBAFlt32, DepthRGBAInt16}}; // foreground, background
@@ -276,10 +263,8 @@ TEST(MergeImages, DataWindowsFollowWhatCanDifferFromTheCanvas) {
 }
 
 TEST(MergeImages, CopiedBackgroundEqualsTheComputedMerge) {
-    // Beyond a clear foreground the rows copy the background. The same
-    // foreground padded with clear pixels over the whole frame makes them
-    // compute every pixel: both must give the same bits, integer and half
-    // backgrounds included, and the copy must be the background.
+    // Beyond a clear foreground the rows copy the background; padded with clear pixels over the frame, the
+    // foreground makes them compute every pixel: the same bits, and the copy is the background.
     const ImgRectI fw(3, 2, 9, 7), bw(0, 0, 16, 12);
     auto padded = [&](int x, int y) { return fw.Contains(x, y) ? FgAt(x, y) : FltPixel{}; };
     for (int depth : {DepthRGBAInt8, DepthRGBAFlt16, DepthAInt16, DepthRGBAFlt32})
