@@ -1,8 +1,5 @@
-// Resizing through the separable filters, and shrinking by whole factors.
-// Expected pixels come from a direct convolution written here from the
-// filters' formulas (in double, with its own edge handling), never from the
-// weight tables; hand-computed borders pin the edge policies down. The grid
-// itself is held against other programs in ResizePeerTest.
+// Resizing and whole-factor shrinking against a direct convolution in double written here from the filters'
+// formulas, with its own edge handling; hand-computed borders pin the edge policies down.
 #include <optional>
 #include <tuple>
 
@@ -18,8 +15,7 @@ constexpr int kAllFilters[] = {RszNearest,  RszBox,      RszLinear,  RszQuadrati
 constexpr int kWindows[] = {RszWindowHanning, RszWindowHamming, RszWindowBlackman, RszWindowKaiser};
 constexpr int kEdges[] = {EdgeCanvas, EdgeWrap, EdgeDuplicate, EdgeMirror};
 
-/// Normalised weights of source samples (before any edge policy) for output
-/// sample o: the direct definition of each filter.
+/// Normalised weights of source samples (before any edge policy) for output sample o.
 std::vector<std::pair<int, double>> RefWeights(int filter, int window, double scale, double offset, int o) {
     const double u = (o + 0.5 - offset) / scale, stretch = std::max(1.0, 1.0 / scale);
     std::vector<std::pair<int, double>> w;
@@ -64,8 +60,7 @@ struct Request2D {
     }
 };
 
-/// Whether `got` is the separable convolution in double of `src` by `r`
-/// (clamped to 0..1 for integer outputs) within `tol`.
+/// Whether `got` is the convolution in double of `src` by `r` (clamped for integer outputs) within `tol`.
 ::testing::AssertionResult Matches(const Image &got, const Image &src, const Request2D &r, double tol) {
     const ImgRectI range = r.range.IsNull() ? (src.Frame() | src.DataWindow()) : r.range;
     auto want = [&](int x, int y) {
@@ -86,8 +81,7 @@ struct Request2D {
 double Slack(int depth) { return Kind(depth) == 2 ? 1.5e-3 : HalfCode(depth, 0) + (Kind(depth) == 3 ? 2e-5 : 1e-5); }
 
 TEST(ResizeFilters, SupportsInterpolationAndFallBacks) {
-    // The filters' values are held by the direct convolution below; here
-    // their radius, where they vanish, and the interpolating ones' zeros.
+    // Values are held by the direct convolution; here the radius, and the interpolating filters' zeros.
     for (int filter : kAllFilters)
         for (int window : kWindows) {
             SCOPED_TRACE(testing::Message() << "filter " << filter << " window " << window);
@@ -114,8 +108,7 @@ TEST(ResampleAxis, WeightsSumToOneRunsAreEvenAndAreaFiltersSpreadEvenly) {
                 ASSERT_TRUE(axis.Count() == out && axis.Taps() % 2 == 0);
                 std::vector<double> received(src, 0.0);
                 for (int i = 0; i < out; ++i) {
-                    ASSERT_NE(axis.Weights(i)[0], 0.f) << "runs start on a weight";
-                    ASSERT_TRUE(i == 0 || axis.First(i) >= axis.First(i - 1)) << i;
+                    ASSERT_TRUE(axis.Weights(i)[0] != 0.f && (i == 0 || axis.First(i) >= axis.First(i - 1))) << i;
                     double sum = 0.0;
                     for (int k = 0; k < axis.Taps(); ++k) {
                         const int j = axis.First(i) + k;
@@ -126,8 +119,7 @@ TEST(ResampleAxis, WeightsSumToOneRunsAreEvenAndAreaFiltersSpreadEvenly) {
                     }
                     EXPECT_NEAR(sum, 1.0, 1e-6) << i;
                 }
-                // Whole shrink factors: with the box and the tent every source pixel
-                // away from the ends counts the same, 1 / factor, so averages are kept.
+                // Whole shrink factors with the box and the tent: every source pixel counts 1 / factor.
                 const double factor = 1.0 / scale;
                 if ((filter == RszBox || filter == RszLinear) && scale < 1 &&
                     std::fabs(factor - std::round(factor)) < 1e-9) {
@@ -179,16 +171,11 @@ TEST(ResizeTagList, IdentityIsExactForInterpolatingFiltersAtEveryDepth) {
 }
 
 TEST(ResizeTagList, EdgePoliciesAtTheBorderByHand) {
-    // A row a b c d (0.1, 0.2, 0.4, 0.8) shifted right by 1.5 pixels: output
-    // pixel 0 sits at u = -1, between source pixels -2 and -1 (half each),
-    // and output pixel 5 at u = 4, between 3 and 4; inside, pixel 2 at u = 1
-    // is (a + b) / 2.
+    // A row a b c d shifted right by 1.5 pixels: output pixel 0 sits between source pixels -2 and -1, pixel 5
+    // between 3 and 4, pixel 2 between a and b.
     const float v[4] = {0.1f, 0.2f, 0.4f, 0.8f};
-    Ref<Image> row = Filled(4, 1, DepthAFlt32,
-                            [&](int x, int) {
-                                return FltPixel{0, 0, 0, v[x]};
-                            },
-                            nullptr, {0, 0, 0, 0.05f});
+    auto at = [&](int x, int y) { return FltPixel{v[x + y], v[x + y], v[x + y], v[x + y]}; };
+    Ref<Image> row = Filled(4, 1, DepthAFlt32, at, nullptr, {0, 0, 0, 0.05f});
     const struct {
         int edges;
         double at0, at5; // expected: pixels (-2, -1) and (3, 4)
@@ -208,9 +195,8 @@ TEST(ResizeTagList, EdgePoliciesAtTheBorderByHand) {
         const double want[6] = {c.at0, 0, (0.1 + 0.2) / 2, 0, 0, c.at5};
         for (int x : {0, 2, 5}) EXPECT_NEAR(dst->GetFlt(x, 0).A, want[x], 1e-7) << c.edges << ": " << x;
     }
-    // Vertically the same rules (a column, Mirror), and beyond the frame the
-    // table keeps reading by them.
-    Ref<Image> col = Filled(1, 4, DepthRGBAFlt32, [&](int, int y) { return FltPixel{v[y], v[y], v[y], 1}; });
+    // Vertically the same rules (a column, Mirror), and beyond the frame the table keeps reading by them.
+    Ref<Image> col = Filled(1, 4, DepthRGBAFlt32, at);
     const ImgRectI all(-10, -10, 10, 17);
     Ref<Image> dst = Blank(1, 7, DepthRGBAFlt32, &all);
     ASSERT_TRUE(col->ResizeTagList(
@@ -243,8 +229,7 @@ TEST(ResizeTagList, OffsetsAndTheSourceWindow) {
         ASSERT_TRUE(src->ResizeTagList(dst.Get(), r.Tags()));
         EXPECT_TRUE(Matches(*dst, *src, r, 2e-5)) << filter;
     }
-    // An endless window: no edge policy ever applies, and everything beyond
-    // the data window is canvas, as with the Canvas policy at the frame.
+    // An endless window: no edge policy applies; beyond the data window is canvas, as with the Canvas policy.
     src->SetCanvasColor(FltPixel{0.5f, 0.25f, 0, 1});
     const ImgRectI endless(-DomainEndless, -DomainEndless, DomainEndless, DomainEndless), none;
     const TagList shift{{ResizeFilter, RszCatmullRom}, {ResizeXOffset, -3.0}, {ResizeYOffset, 2.5}};
@@ -275,8 +260,7 @@ TEST(ResizeTagList, DataWindowsCanvasAndDepths) {
                     << "window " << RectText(*sw) << " depth " << sd << " -> " << dd;
             }
     // Pre-calculation: no rows, the canvas taken over.
-    Ref<Image> src = PatternAt(16, 12, DepthRGBAInt16, 3, nullptr, {0.5f, 0, 0, 0.5f}),
-               pre = Blank(40, 30, DepthRGBAFlt32);
+    Ref<Image> src = PatternAt(16, 12, DepthRGBAInt16, 3, nullptr, {0.5f, 0, 0, 0.5f}), pre = Blank(40, 30, 8);
     pre->SetNoData(true);
     EXPECT_TRUE(src->ResizeTagList(pre.Get(), {}));
     EXPECT_TRUE(!pre->HasScanLineData() && pre->GetCanvasColor() == src->GetCanvasColor());
@@ -292,9 +276,7 @@ TEST(ResizeTables, ReusedTablesGiveTheSameBitsAndMismatchedOnesAreNotUsed) {
     ASSERT_TRUE(src->ResizePreCalcTagList(fresh.Get(), tx, ty, request));
     ASSERT_TRUE(src->ResizePreCalcTagList(fresh.Get(), ox, oy, {{ResizeFilter, RszBox}}));
     ASSERT_TRUE(src->ResizePreCalcTagList(Blank(45, 23, DepthRGBAFlt32, &small).Get(), sx, sy, request));
-    // The same tables frame after frame give the same bits. Tables of another
-    // request, of a smaller window, or swapped, must not be used: the result is
-    // what the request itself gives.
+    // The same tables give the same bits; tables of another request, a smaller window, or swapped are not used.
     const std::pair<void *, void *> tables[] = {{tx, ty}, {tx, ty}, {ox, oy}, {sx, sy}, {ty, tx}, {tx, oy}};
     for (auto [x, y] : tables) {
         Ref<Image> again = Blank(45, 23, DepthRGBAFlt32, &part);
@@ -311,11 +293,10 @@ TEST(ResizeTables, ReusedTablesGiveTheSameBitsAndMismatchedOnesAreNotUsed) {
     Image::ResizePostCalc(sx, sy);
     EXPECT_TRUE(!tx && !ty && !ox && !oy && !sx && !sy);
     // Impossible requests give no tables.
-    EXPECT_FALSE(src->ResizePreCalcTagList(fresh.Get(), tx, ty, {{ResizeXScale, 0.0}}));
-    EXPECT_TRUE(tx == nullptr && ty == nullptr);
-    EXPECT_FALSE(src->ResizePreCalcTagList(fresh.Get(), tx, ty, {{ResizeYScale, NAN}}));
-    EXPECT_FALSE(src->ResizePreCalcTagList(nullptr, tx, ty, {}));
-    EXPECT_FALSE(src->ResizeTagList(fresh.Get(), {{ResizeXScale, -1.0}}));
+    EXPECT_FALSE(src->ResizePreCalcTagList(fresh.Get(), tx, ty, {{ResizeXScale, 0.0}}) || tx || ty);
+    EXPECT_FALSE(src->ResizePreCalcTagList(fresh.Get(), tx, ty, {{ResizeYScale, NAN}}) ||
+                 src->ResizePreCalcTagList(nullptr, tx, ty, {}) ||
+                 src->ResizeTagList(fresh.Get(), {{ResizeXScale, -1.0}}));
 }
 
 TEST(ResizeTagList, ThreadsAndAbort) {
@@ -327,11 +308,10 @@ TEST(ResizeTagList, ThreadsAndAbort) {
     AbortedRequest aborted;
     Ref<Image> dst = Blank(100, 100, DepthRGBAFlt32);
     EXPECT_FALSE(src->ResizeTagList(dst.Get(), {{WorkRequest, &aborted.req}}));
+    EXPECT_FALSE(src->ResizeTagList(nullptr, {}) || src->ResizeTagList(src.Get(), {}));
     std::atomic<bool> stop{true};
     src->SetAbortFlag(&stop);
     EXPECT_FALSE(src->ResizeTagList(dst.Get(), {}));
-    EXPECT_FALSE(src->ResizeTagList(nullptr, {}));
-    EXPECT_FALSE(src->ResizeTagList(src.Get(), {}));
 }
 
 TEST(ScaleOfImage, AveragesBlocksAndScalesWindows) {
@@ -340,9 +320,8 @@ TEST(ScaleOfImage, AveragesBlocksAndScalesWindows) {
         Ref<Image> src = PatternAt(w, h, depth);
         src->SetScale(1.0, 2.0);
         Ref<Image> out = src->ScaleOfImage(nullptr, fx, fy);
-        ASSERT_TRUE(out);
         // 11 / 3 and 7 / 2 rounded up; pixels three wide and two tall: the aspect 1:2 becomes 3:4.
-        EXPECT_TRUE(out->Width() == 4 && out->Height() == 4 && out->Depth() == depth) << depth;
+        ASSERT_TRUE(out && out->Width() == 4 && out->Height() == 4 && out->Depth() == depth) << depth;
         EXPECT_DOUBLE_EQ(out->XScale() / out->YScale(), 3.0 / 4.0);
         // The block, cut to the frame: the last column and row of blocks are partial.
         EXPECT_TRUE(AllNear(*out, out->DataWindow(), Slack(depth), [&](int x, int y, int c) {
@@ -358,20 +337,12 @@ TEST(ScaleOfImage, AveragesBlocksAndScalesWindows) {
 TEST(ScaleOfImage, WindowsCanvasAndRefusals) {
     const ImgRectI dw(1, 1, 6, 4);
     const FltPixel canvas{0, 0, 0.5f, 0.5f};
-    Ref<Image> src = Filled(
-        8, 6, DepthRGBAFlt32,
-        [](int, int) {
-            return FltPixel{1, 1, 1, 1};
-        },
-        &dw, canvas);
+    Ref<Image> src = Filled(8, 6, DepthRGBAFlt32, Constant({1, 1, 1, 1}), &dw, canvas);
     src->SetValidWindow(ImgRectI(2, 1, 5, 3));
     Ref<Image> out = src->ScaleOfImage(nullptr, 2, 2);
-    ASSERT_TRUE(out);
-    EXPECT_EQ(out->DataWindow(), ImgRectI(0, 0, 3, 2)); // rounded outward
-    EXPECT_EQ(out->ValidWindow(), ImgRectI(1, 0, 3, 2));
-    EXPECT_EQ(out->GetCanvasColor(), canvas);
-    // Block (0, 0) holds one window pixel and three canvas pixels; block (1, 0)
-    // two and two; block (1, 1), rows 2 and 3, columns 2 and 3, all inside.
+    ASSERT_TRUE(out && out->DataWindow() == ImgRectI(0, 0, 3, 2)); // rounded outward
+    EXPECT_TRUE(out->ValidWindow() == ImgRectI(1, 0, 3, 2) && out->GetCanvasColor() == canvas);
+    // Block (0, 0) holds one window pixel and three canvas pixels; (1, 0) two and two; (1, 1) all inside.
     EXPECT_FLOAT_EQ(out->GetFlt(0, 0).R, 0.25f);
     EXPECT_FLOAT_EQ(out->GetFlt(0, 0).B, (1 + 3 * 0.5f) / 4);
     EXPECT_FLOAT_EQ(out->GetFlt(1, 0).R, 0.5f);
@@ -379,8 +350,7 @@ TEST(ScaleOfImage, WindowsCanvasAndRefusals) {
     EXPECT_EQ(out->GetFlt(3, 0), canvas);
     Ref<Image> same = src->ScaleOfImage(nullptr, 1, 1);
     EXPECT_TRUE(same && MaxDiff(*same, *src, ImgRectI(0, 0, 8, 6)) == 0.0);
-    EXPECT_FALSE(src->ScaleOfImage(nullptr, 0.5, 1));
-    EXPECT_FALSE(src->ScaleOfImage(nullptr, 2, NAN));
+    EXPECT_FALSE(src->ScaleOfImage(nullptr, 0.5, 1) || src->ScaleOfImage(nullptr, 2, NAN));
     RenderTask task;
     Request req(nullptr, nullptr, 0.0, 0, &task);
     EXPECT_TRUE(src->ScaleOfImage(&req, 2, 2));

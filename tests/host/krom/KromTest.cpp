@@ -1,17 +1,9 @@
-// The device service: kernel signatures, the dialect's pixel conversions and
-// sampling against the host's own, device images on Image, the kernel caches,
-// the device thread, and the common library compiling on every back end.
-#include <atomic>
-#include <cmath>
-#include <cstring>
-#include <filesystem>
+// The device service: kernel signatures, the dialect's pixel conversions and sampling against the host's own,
+// device images on Image, the kernel caches, the device thread, the common library on every back end.
 #include <memory>
 #include <thread>
 
-#include <gtest/gtest.h>
-
 #include "host/image/ColorMatrix.h"
-#include "host/image/PixelConvert.h"
 #include "host/krom/CommonKernels.h"
 #include "host/krom/GPUMemory.h"
 #include "host/krom/KROMBuffer.h"
@@ -34,8 +26,7 @@ __KERNEL__ void CopyImage(__CONSTANTREF__ CopyParams *p_pParams, __TEXTURE2D__ i
 }
 )";
 
-/// Runs CopyImage from `src` into a new image of `depth` (same windows) on
-/// the device and brings it back.
+/// Runs CopyImage from `src` into a new image of `depth` (same windows) on the device and brings it back.
 Ref<Image> CopyOnDevice(IDeviceContext *ctx, const Image *src, int depth) {
     const ImgRectI dw = src->DataWindow();
     Ref<Image> dst = NewImageTagList({{ImgLikeImage, src}, {ImgDepth, depth}, {ImgDataWindow, &dw}});
@@ -67,10 +58,7 @@ TEST(KernelSignature, ReadsKindsAndNamesInOrder) {
     using K = KernelParamDecl::Kind;
     const K kinds[] = {K::Block, K::Image, K::WriteImage, K::Sampler, K::Scalar};
     const char *names[] = {"p_pParams", "p_Grad", "output", "RowSampler", "count"};
-    for (size_t i = 0; i < params.size(); ++i) {
-        EXPECT_EQ(params[i].kind, kinds[i]) << i;
-        EXPECT_EQ(params[i].name, names[i]);
-    }
+    for (size_t i = 0; i < params.size(); ++i) EXPECT_TRUE(params[i].kind == kinds[i] && params[i].name == names[i]);
     EXPECT_EQ(params[4].type, "int");
     // A kernel whose name only starts like the one asked for is not it.
     EXPECT_FALSE(ParseKernelSignature(text, "Gra", params, &error));
@@ -96,11 +84,9 @@ TEST(CommonKernels, EveryKernelCompilesOnEveryBackEndAndABrokenOneIsReported) {
         EXPECT_TRUE(node->IsValid()) << k.name << ": " << node->Error();
     }
     auto node = KROMComputeNode::Create(ctx, "Bad", bad, "", true);
-    EXPECT_FALSE(node->IsValid());
-    EXPECT_FALSE(node->RunSession());
+    EXPECT_FALSE(node->IsValid() || node->RunSession());
     auto missing = KROMComputeNode::Create(ctx, "NoSuchCommonKernel", nullptr, "", false);
-    EXPECT_FALSE(missing->IsValid());
-    EXPECT_NE(missing->Error().find("NoSuchCommonKernel"), std::string::npos);
+    EXPECT_TRUE(!missing->IsValid() && missing->Error().find("NoSuchCommonKernel") != std::string::npos);
 }
 
 TEST(Dialect, ReadsAndWritesEveryDepthAsTheHostConvertsIt) {
@@ -115,9 +101,8 @@ TEST(Dialect, ReadsAndWritesEveryDepthAsTheHostConvertsIt) {
                 LoadFlt(depth, at->PixelAddress(x, y), 1, &expect);
                 ASSERT_EQ(std::memcmp(read->PixelAddress(x, y), &expect, sizeof expect), 0) << depth << " " << x;
             }
-        // Write: float into any depth, as StoreFlt stores it. Integers are
-        // rounded in float on the device, in double on the host: a value
-        // within a float step of a half code may land on its neighbour.
+        // Write: float into any depth, as StoreFlt stores it. Integers are rounded in float on the device, in
+        // double on the host: a value within a float step of a half code may land on its neighbour.
         Ref<Image> written = CopyOnDevice(ctx, src.Get(), depth);
         const PixelFormat f = FormatOfDepth(depth);
         int offByOne = 0, wrong = 0;
@@ -182,27 +167,22 @@ TEST(DeviceImages, UploadIsKeptAndDeviceResultsAreStaleUntilDownloaded) {
     Ref<Image> src = PatternImage(16, 9, DepthRGBAFlt32), dst = Blank(16, 9, DepthRGBAFlt32);
     EXPECT_FALSE(src->GetGPUMem());
     {
-        // The upload stays with the image, current with main memory; a second
-        // device image of the same image reuses it.
+        // The upload stays with the image, current with main memory; a second device image reuses it.
         auto in = KROMBuffer::CreateImage(ctx, src.Get(), KROMBufferRead);
         auto again = KROMBuffer::CreateImage(ctx, src.Get(), KROMBufferRead);
         ASSERT_TRUE(in->IsValid() && src->GetGPUMem());
-        EXPECT_EQ(src->GetGPUMem().Get(), in->GetGPUMemory());
-        EXPECT_EQ(again->GetGPUMemory(), in->GetGPUMemory());
-        EXPECT_FALSE(src->IsGPUMemDirty());
-        EXPECT_EQ(in->GetCompOrder(), CompOrderRGBA | (3 << 4));
+        EXPECT_TRUE(src->GetGPUMem().Get() == in->GetGPUMemory() && again->GetGPUMemory() == in->GetGPUMemory());
+        EXPECT_TRUE(!src->IsGPUMemDirty() && in->GetCompOrder() == (CompOrderRGBA | (3 << 4)));
     }
     EXPECT_TRUE(SameBits(*CopyOnDevice(ctx, src.Get(), DepthRGBAFlt32), *src)); // downloads
 
     auto out = KROMBuffer::CreateImage(ctx, dst.Get(), KROMBufferWrite);
     dst->SetGPUMem(out->GetGPUMemory(), true);
-    EXPECT_TRUE(dst->IsGPUMemDirty());
-    EXPECT_FALSE(dst->HasScanLineData()); // nothing in main memory yet
-    EXPECT_GT(dst->SizeOf(), dst->DataBytes());
+    // Nothing in main memory yet.
+    EXPECT_TRUE(dst->IsGPUMemDirty() && !dst->HasScanLineData() && dst->SizeOf() > dst->DataBytes());
     out.reset();
     ASSERT_TRUE(dst->DownloadGPUMem());
-    EXPECT_FALSE(dst->IsGPUMemDirty());
-    EXPECT_TRUE(dst->HasScanLineData());
+    EXPECT_TRUE(!dst->IsGPUMemDirty() && dst->HasScanLineData());
 }
 
 TEST(DeviceImages, ShareLocksKeepAWriterApart) {
@@ -215,8 +195,7 @@ TEST(DeviceImages, ShareLocksKeepAWriterApart) {
     mem->ReleaseShareLock();
     EXPECT_FALSE(mem->ObtainShareLock(GPUShareWrite, false)); // not while a reader holds it
     reader.reset();
-    EXPECT_TRUE(mem->ObtainShareLock(GPUShareWrite, false));
-    EXPECT_FALSE(mem->ObtainShareLock(GPUShareRead, false));
+    EXPECT_TRUE(mem->ObtainShareLock(GPUShareWrite, false) && !mem->ObtainShareLock(GPUShareRead, false));
     mem->ReleaseShareLock();
 }
 
@@ -225,8 +204,7 @@ TEST(KernelCaches, CompileOncePerContextAndReuseBinariesFromDisk) {
     const int before = ctx->CompileCount();
     std::string log;
     const std::string text = std::string(kCopyParams) + kCopyKernel;
-    ASSERT_TRUE(ctx->GetKernel("CopyImage", text, &log)) << log;
-    ASSERT_TRUE(ctx->GetKernel("CopyImage", text, &log));
+    ASSERT_TRUE(ctx->GetKernel("CopyImage", text, &log) && ctx->GetKernel("CopyImage", text, &log)) << log;
     EXPECT_LE(ctx->CompileCount() - before, 1);
 
     const std::filesystem::path folder = std::filesystem::temp_directory_path() / "orvane-kernel-cache-test";
@@ -243,8 +221,7 @@ TEST(KernelCaches, CompileOncePerContextAndReuseBinariesFromDisk) {
         std::unique_ptr<IDeviceContext> fresh = OpenDeviceContext(DeviceBackend::OpenCL, &log);
         ASSERT_TRUE(fresh) << log;
         Ref<Image> src = PatternImage(8, 3);
-        EXPECT_TRUE(SameBits(*CopyOnDevice(fresh.get(), src.Get(), DepthRGBAFlt32), *src)) << "round " << round;
-        EXPECT_EQ(files(), 1u) << "round " << round;
+        EXPECT_TRUE(SameBits(*CopyOnDevice(fresh.get(), src.Get(), DepthRGBAFlt32), *src) && files() == 1) << round;
     }
     unsetenv("ORVANE_KERNEL_CACHE");
     std::filesystem::remove_all(folder);
@@ -265,18 +242,13 @@ TEST(DeviceThread, ExecuteWaitsNestsAndQueuesInOrder) {
         nestedRan = task.Execute("inner", [&](IDeviceContext *) { return std::this_thread::get_id() == ran; });
         return c == ctx;
     }));
-    EXPECT_NE(ran, caller);
-    EXPECT_TRUE(nestedRan);
+    EXPECT_TRUE(ran != caller && nestedRan);
     std::vector<int> order;
     for (int i = 0; i < 5; ++i) task.QueueExecute("queued", [&order, i](IDeviceContext *) { order.push_back(i); });
     ctx->Finish();
     EXPECT_EQ(order, (std::vector<int>{0, 1, 2, 3, 4}));
-    const uint64_t id = task.ID();
-    {
-        RenderTask other;
-        EXPECT_NE(other.ID(), id);
-    }
-    EXPECT_EQ(RenderTask::Find(id), &task);
+    EXPECT_NE(std::make_unique<RenderTask>()->ID(), task.ID());
+    EXPECT_EQ(RenderTask::Find(task.ID()), &task); // after the other is gone
 }
 
 TEST(DeviceMatrix, ApplyMatrixOnTheDeviceGivesTheRowsBits) {

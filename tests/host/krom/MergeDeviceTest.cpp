@@ -1,15 +1,5 @@
-// The "Merge" kernel against the merge's rows: every mode the kernel has,
-// every Normal operator, blend, additive, alpha gain, burn in and channels,
-// windows that overlap unevenly, a placed foreground, all depths. The kernel
-// does the rows' float arithmetic in their order, so float results are the
-// rows' bits. Integer results agree to one code: the device stores v x 255
-// (or 65535) + 1/2 rounded in float, the rows in double, which parts the two
-// on values that fall on a half code (an alpha gain of 0.7 over opaque
-// pixels gives 0.7 x 65535 = 45874.5, for one).
-#include <gtest/gtest.h>
-
-#include <string>
-
+// The merge kernel against the rows. It does the rows' float arithmetic in their order: float results are the
+// rows' bits; integers agree to one code, as the device rounds v x 65535 + 1/2 in float (0.7 x 65535 = 45874.5).
 #include "host/image/MergeModes.h"
 #include "tests/host/image/ImageTestSupport.h"
 #include "tests/host/krom/DeviceTestSupport.h"

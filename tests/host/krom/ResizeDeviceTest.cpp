@@ -1,9 +1,5 @@
-// The resize kernels ("ResizeAcross", "ResizeDown") against the rows: float
-// outputs bit for bit (the kernels sum in the rows' order), integer outputs
-// within the device's own rounding, over filters, edge policies, source and
-// output windows and depths; and the fall-back to the rows.
-#include <gtest/gtest.h>
-
+// The resize kernels against the rows: floats bit for bit (the kernels sum in the rows' order), integers within
+// the device's own rounding; and the fall-back to the rows.
 #include "tests/host/image/ImageTestSupport.h"
 #include "tests/host/krom/DeviceTestSupport.h"
 
