@@ -41,8 +41,7 @@ TEST(ColorSpace, KnownColoursBothWays) {
         std::array<double, 3> want;
         double tol;
     } cases[] = {
-        // HSV: the six hues, orange at half brightness (a quarter of the way to yellow), greys with hue and saturation
-        // 0.
+        // HSV: the six hues, orange at half brightness (a quarter of the way to yellow), greys with hue 0.
         {true, HSV, {1, 0, 0}, {0, 1, 1}, 1e-6},
         {true, HSV, {1, 1, 0}, {1.0 / 6, 1, 1}, 1e-6},
         {true, HSV, {0, 1, 0}, {2.0 / 6, 1, 1}, 1e-6},

@@ -42,7 +42,7 @@ FltPixel ExpectedRead(int depth, const FltPixel &p) {
     return ::testing::AssertionSuccess();
 }
 
-TEST(ImageWindows, DataWindowOnlyBeforeRowsValidWindowInsideIt) {
+TEST(ImageWindows, DataWindowOnlyBeforeRowsValidWindowInsideItRowsOnlyInTheDataWindow) {
     auto img = Blank(10, 6, 7);
     EXPECT_EQ(img->ValidWindow(), ImgRectI(0, 0, 10, 6));
     img->SetDataWindow(ImgRectI(-4, -2, 7, 5));
@@ -57,9 +57,7 @@ TEST(ImageWindows, DataWindowOnlyBeforeRowsValidWindowInsideIt) {
     empty->SetDataWindow(ImgRectI(3, 3, 3, 9)); // a null window: rows of nothing
     EXPECT_TRUE(empty->ValidWindow().IsNull() && empty->AllocScanLineData());
     EXPECT_EQ(empty->ScanLine(3), nullptr);
-}
-
-TEST(ImageRows, AllocatedLateZeroedAndOnlyInTheDataWindow) {
+    // Rows come late, zeroed, and only in the data window.
     const size_t bytesPerPixel[] = {1, 2, 2, 4, 4, 8, 8, 16};
     const ImgRectI dw(-3, -2, 5, 4);
     for (int depth = 1; depth <= 8; ++depth) {
@@ -79,9 +77,8 @@ TEST(ImageRows, AllocatedLateZeroedAndOnlyInTheDataWindow) {
     }
     auto none = Blank(8, 8, 8); // an image for pre-calculation never gets rows
     none->SetNoData(true);
-    EXPECT_FALSE(none->AllocScanLineData());
     none->Fill({1, 1, 1, 1});
-    EXPECT_FALSE(none->HasScanLineData());
+    EXPECT_FALSE(none->AllocScanLineData() || none->HasScanLineData());
 }
 
 TEST(ImageCanvas, OutsideTheDataWindowAndWithoutRows) {
@@ -200,7 +197,7 @@ TEST(PixelRuns, EveryCodeLoadsAsItsValueAndStoresBack) {
     }
 }
 
-TEST(PixelRuns, SixteenBitValuesNarrowAndWidenToTheNearest) {
+TEST(PixelRuns, SixteenBitValuesNarrowAndWidenToTheNearestFloatsKeepTheirBits) {
     for (uint32_t v = 0; v < 65536; ++v) {
         const Pixel px{static_cast<uint16_t>(v), 0, static_cast<uint16_t>(65535 - v), 65535};
         uint8_t b8[4];
@@ -217,9 +214,7 @@ TEST(PixelRuns, SixteenBitValuesNarrowAndWidenToTheNearest) {
             << v;
         ASSERT_EQ(FltToPixel(fp), px) << v;
     }
-}
-
-TEST(PixelRuns, FloatsKeepTheirBitsAndClampIntoIntegers) {
+    // Floats keep their bits and clamp into integers.
     const std::vector<float> data = {0.0f, 1.0f, 0.5f, -0.25f, 1.5f, NaNf, Inff, -Inff, 1e-9f, 0.7f, 65504.f, -0.0f};
     const auto *raw = reinterpret_cast<const uint8_t *>(data.data());
     const int n = static_cast<int>(data.size());
@@ -399,7 +394,7 @@ TEST(NewImage, ImpossibleFormatsGiveNull) {
     EXPECT_TRUE(largest && largest->Width() == MaxImageSide);
 }
 
-TEST(NewImage, LikeImageExplicitTagsAndAttributes) {
+TEST(NewImage, LikeImageExplicitTagsAttributesWindowsNoDataCanvasAndAbort) {
     auto like = Blank(30, 20, 6);
     like->SetScale(2.0, 0.5);
     like->SetDataWindow(ImgRectI(-5, -5, 40, 25));
@@ -432,9 +427,7 @@ TEST(NewImage, LikeImageExplicitTagsAndAttributes) {
     for (auto [tag, value] : doubles) EXPECT_EQ(img->GetAttrD(tag, -1), value) << std::hex << tag;
     EXPECT_FALSE(img->Attrs().Has(ImgWidth) || img->Attrs().Has(ImgDepth));
     EXPECT_TRUE(NewImageTagList({{ImgWidth, 4}, {ImgHeight, 4}})->Attrs().Empty());
-}
-
-TEST(NewImage, WindowsNoDataCanvasAndAbort) {
+    // Data and valid windows given or not.
     const ImgRectI dw(-5, -5, 15, 8), vw(2, 2, 30, 30), frame(0, 0, 10, 6);
     const struct {
         const ImgRectI *data, *valid;
@@ -445,18 +438,17 @@ TEST(NewImage, WindowsNoDataCanvasAndAbort) {
                  {nullptr, &vw, true, frame, ImgRectI(2, 2, 10, 6)},
                  {&dw, nullptr, true, dw, dw}}; // a null valid window: the data window
     for (const auto &w : cases) {
-        TagList tags{{ImgWidth, 10}, {ImgHeight, 6}};
-        if (w.data) tags.Add({ImgDataWindow, w.data});
-        if (w.validTag) tags.Add({ImgValidWindow, w.valid});
-        Ref<Image> img = NewImageTagList(tags);
-        EXPECT_TRUE(img && img->DataWindow() == w.wantData && img->ValidWindow() == w.wantValid);
+        TagList t{{ImgWidth, 10}, {ImgHeight, 6}};
+        if (w.data) t.Add({ImgDataWindow, w.data});
+        if (w.validTag) t.Add({ImgValidWindow, w.valid});
+        Ref<Image> got = NewImageTagList(t);
+        EXPECT_TRUE(got && got->DataWindow() == w.wantData && got->ValidWindow() == w.wantValid);
     }
     const FltPixel canvas{0.25f, 0.5f, 0.75f, 1.0f};
     std::atomic<bool> abort{false};
     Ref<Image> e = NewImageTagList(
         {{ImgWidth, 10}, {ImgHeight, 6}, {ImgNoData, true}, {ImgCanvasColor, &canvas}, {ImgAbortFlag, &abort}});
-    ASSERT_TRUE(e);
-    EXPECT_TRUE(!e->AllocScanLineData() && e->GetCanvasColor() == canvas && !e->CheckAbort());
+    ASSERT_TRUE(e && !e->AllocScanLineData() && e->GetCanvasColor() == canvas && !e->CheckAbort());
     abort = true;
     EXPECT_TRUE(e->CheckAbort());
     Ref<Image> f = NewImageTagList({{ImgWidth, 10}, {ImgHeight, 6}, {ImgNoData, false}, {ImgCanvasColor, nullptr}});

@@ -100,18 +100,6 @@ TEST(RectSetOps, IntersectionAndUnionMatchPixelSets) {
     }
 }
 
-TEST(RectSetOps, EndlessAndTouchingCases) {
-    const struct {
-        ImgRectI a, b, both, either;
-    } cases[] = {
-        {{0, 0, 10, 10}, {10, 0, 20, 10}, {}, {0, 0, 20, 10}},  // touching: no shared pixel
-        {{0, 0, 10, 10}, {50, 50, 40, 60}, {}, {0, 0, 10, 10}}, // the null one adds nothing
-        {{-E, -E, E, E}, {-3, 4, 8, 9}, {-3, 4, 8, 9}, {-E, -E, E, E}},
-    };
-    for (const auto &c : cases)
-        EXPECT_TRUE((c.a & c.b) == c.both && (c.b | c.a) == c.either) << RectText(c.a) << " and " << RectText(c.b);
-}
-
 TEST(RectMove, ScaleRoundsOutwardAndKeepsEndlessSides) {
     const struct {
         ImgRectI in;
