@@ -31,16 +31,13 @@ TEST(Gamut, KnownValuesAndTheCineonCodePoints) {
         double got, want, tol;
     } cases[] = {
         {"sRGB 0.5", SRGBToLinear(0.5), 0.214041, 1e-6},
-        {"sRGB back", LinearToSRGB(0.214041), 0.5, 1e-6},
         {"sRGB linear part", SRGBToLinear(0.04045), 0.04045 / 12.92, 1e-12},
         {"sRGB white", SRGBToLinear(1.0), 1.0, 0},
         // BT.709: 4.5 L near black; above, 1.099 L^0.45 - 0.099 (to the rounding of those constants).
         {"709 near black", LinearToRec709(0.01), 0.045, 1e-12},
         {"709 grey", LinearToRec709(0.18), 1.099 * std::pow(0.18, 0.45) - 0.099, 3e-4},
-        {"709 back", Rec709ToLinear(0.5), std::pow((0.5 + 0.099) / 1.099, 1 / 0.45), 3e-4},
         {"709 white", Rec709ToLinear(1.0), 1.0, 1e-12},
         {"gamma", GammaToLinear(0.5, 2.2), std::pow(0.5, 2.2), 1e-12},
-        {"gamma back", LinearToGamma(0.25, 2.0), 0.5, 1e-12},
         {"Cineon white 685", CineonToLinear(685.0 / 1023, log), 1.0, 1e-12},
         {"Cineon black 95", CineonToLinear(95.0 / 1023, log), 0.0, 1e-12},
         {"Cineon a decade down", CineonToLinear(385.0 / 1023, log), (0.1 - offset) / (1 - offset), 1e-12},
@@ -86,7 +83,7 @@ TEST(Gamut, PiecesMeetAndCurvesRiseAndMirror) {
     EXPECT_EQ(GamutToLinear(soft, 500.0 / 1023), CineonToLinear(500.0 / 1023, log));
 }
 
-TEST(Gamut, PairsRoundTrip) {
+TEST(Gamut, PairsRoundTripAndRowsMatchTheScalars) {
     for (GamutSpace s : kCurves)
         for (double gamma : {0.45, 2.2})
             for (double soft : {0.0, 40.0}) {
@@ -104,9 +101,7 @@ TEST(Gamut, PairsRoundTrip) {
     EXPECT_EQ(GamutToLinear(Curve(GamutSpace::Linear), 0.37), 0.37);
     EXPECT_TRUE(Curve(GamutSpace::Gamma, 1.0).IsIdentity());
     EXPECT_FALSE(Curve(GamutSpace::SRGB).IsIdentity());
-}
-
-TEST(Gamut, RowsMatchTheScalarsAndLeaveAlpha) {
+    // Rows give the scalars and leave alpha.
     for (GamutSpace s : kCurves) {
         const GamutCurve c = Curve(s, 1.8);
         std::vector<float> px;

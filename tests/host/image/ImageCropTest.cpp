@@ -7,7 +7,7 @@ namespace Orvane::imgcroptest {
 namespace {
 using namespace ::Orvane::Test;
 
-TEST(ImageCrop, MovesThePictureAndFillsTheRestWithCanvas) {
+TEST(ImageCrop, MovesCopiesAndSubsamplesWithCanvasBeyondTheSource) {
     const ImgRectI sw(2, 1, 14, 10), dw(-3, -2, 12, 11); // the output reaches beyond the moved source
     for (int sd : {DepthAInt8, DepthRGBAInt16, DepthRGBAFlt16, DepthRGBAFlt32})
         for (int dd : {DepthAFlt32, DepthRGBAInt8, DepthRGBAFlt32}) {
@@ -20,9 +20,7 @@ TEST(ImageCrop, MovesThePictureAndFillsTheRestWithCanvas) {
                 dst->IsMask() ? 3 : 0))
                 << sd << " -> " << dd;
         }
-}
-
-TEST(ImageCrop, SameDepthCopiesBytesStepsSubsampleAndRefusals) {
+    // Same depth: bytes copied; steps subsample; refusals.
     Ref<Image> src = PatternAt(20, 14, DepthRGBAInt16, 5, nullptr, {0, 0, 0, 1}), dst = Blank(8, 6, DepthRGBAInt16);
     ASSERT_TRUE(src->ImageCrop(dst.Get(), 5, 3, {{WorkThreaded, 0}}));
     for (int j = 0; j < 6; ++j)

@@ -26,7 +26,7 @@ std::vector<int> RowsOf(const Image &img) {
     return rows;
 }
 
-TEST(CopyField, FullHeightLinesLandWhereExpected) {
+TEST(CopyField, FullHeightLinesLandWhereExpectedDepthsConvertAndRefusals) {
     // Rows listed bottom (y = 0) to top; field 0 holds the top line.
     enum Into { New, Marked, Self };
     const struct {
@@ -56,9 +56,6 @@ TEST(CopyField, FullHeightLinesLandWhereExpected) {
         EXPECT_EQ(RowsOf(*out), c.rows) << "h " << c.h << " field " << c.field << " dest " << c.dest << " mode "
                                         << c.mode << " into " << c.into;
     }
-}
-
-TEST(CopyField, ConvertsDepthsAndRefusesWhatDoesNotFit) {
     // Into an integer frame: the float rows stored at its depth; lines not written stay zero.
     Ref<Image> into = Blank(4, 6, DepthRGBAInt16);
     Ref<Image> small = Filled(4, 6, DepthRGBAFlt32, [](int, int y) { return FltPixel{y / 8.f, 0.5f, 0.25f, 1.f}; });

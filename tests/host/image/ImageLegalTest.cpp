@@ -56,7 +56,7 @@ Ref<Image> Strip(int depth) {
     return Filled(static_cast<int>(std::size(kColors)), 2, depth, colour);
 }
 
-TEST(ImageLegal, KnownColoursAreJudgedAsTheLimitsSay) {
+TEST(ImageLegal, KnownColoursAreJudgedAsTheLimitsSayAndAdjustedKeepingHueAndLuma) {
     // A few verdicts stated outright, so that the limits cannot drift together with the check.
     // 100% yellow reaches 133 IRE, PAL passes 100% bars, red dips to -33.
     EXPECT_TRUE(!Legal(NTSC, 0, 1, 1, 0) && Legal(PAL, 0, 1, 1, 0) && !Legal(PAL, 1, 1, 1, 0));
@@ -84,9 +84,7 @@ TEST(ImageLegal, KnownColoursAreJudgedAsTheLimitsSay) {
     Ref<Image> mask = Filled(2, 2, DepthAFlt32, [](int, int) { return FltPixel{0, 0, 0, 1.5f}; });
     mask->ImageLegal(NTSC, Black, 0, 0.0);
     EXPECT_EQ(mask->GetFlt(1, 1).A, 1.5f);
-}
-
-TEST(ImageLegal, AdjustKeepsHueAndLumaAndEndsLegal) {
+    // Adjusting keeps hue and luma and ends legal.
     for (int type : {NTSC, NHK, PAL})
         for (int adjust : {0, 1})
             for (double soft : {0.0, 0.1, 0.4}) {

@@ -153,13 +153,10 @@ TEST(MergeModes, HandComputedPixels) {
         // Half-transparent red over opaque blue: red 0.5, blue 1 x (1 - 0.5).
         {{}, {0.5, 0, 0, 0.5}, {0, 0, 1, 1}, {0.5, 0, 0.5, 1}},
         {{.mode = MrgScreen}, grey, warm, {0.75, 0.625, 0.5, 1}}, // 0.5 + 0.5 - 0.25
-        {{.mode = MrgMultiply}, grey, warm, {0.25, 0.125, 0, 1}},
         {{.mode = MrgDifference}, {0.25, 0.75, 0, 1}, {1, 0.25, 0.5, 1}, {0.75, 0.5, 0.5, 1}},
         {{.mode = MrgAdd}, {0.75, 0, 0, 1}, {0.5, 0, 0, 1}, {1.25, 0, 0, 1}}, // no clipping on float
-        {{.mode = MrgSubtract}, {0.25, 0, 0, 1}, {0.5, 0, 0, 1}, {0.25, 0, 0, 1}},
-        // In keeps the foreground where the background has alpha; Held Out where it has none.
+        // In keeps the foreground where the background has alpha.
         {{.op = MrgIn}, {0.5, 0.5, 0, 1}, {0, 0, 1, 0.5}, {0.25, 0.25, 0, 0.5}},
-        {{.op = MrgHeldOut}, {0.5, 0.5, 0, 1}, {0, 0, 1, 0.5}, {0.25, 0.25, 0, 0.5}},
         // Additive 1: colour added, alpha as over; 0.25: the background held out by 0.75 x alpha.
         {{.additive = 1}, f, b, {0.7, 0.8, 0.3, 0.875}},
         {{.additive = 0.25}, f, b, {0.5875, 0.575, 0.225, 0.875}},

@@ -162,7 +162,7 @@ __KERNEL__ void SampleRow(__CONSTANTREF__ SampleParams *p_pParams, __TEXTURE2D__
     for (int x = 0; x < 6; ++x) EXPECT_FLOAT_EQ(out->GetFlt(x, 0).R, expect[x]) << x;
 }
 
-TEST(DeviceImages, UploadIsKeptAndDeviceResultsAreStaleUntilDownloaded) {
+TEST(DeviceImages, UploadIsKeptResultsAreStaleUntilDownloadedAndLocksKeepAWriterApart) {
     ORVANE_NEED_OPENCL(ctx);
     Ref<Image> src = PatternImage(16, 9, DepthRGBAFlt32), dst = Blank(16, 9, DepthRGBAFlt32);
     EXPECT_FALSE(src->GetGPUMem());
@@ -183,10 +183,7 @@ TEST(DeviceImages, UploadIsKeptAndDeviceResultsAreStaleUntilDownloaded) {
     out.reset();
     ASSERT_TRUE(dst->DownloadGPUMem());
     EXPECT_TRUE(!dst->IsGPUMemDirty() && dst->HasScanLineData());
-}
-
-TEST(DeviceImages, ShareLocksKeepAWriterApart) {
-    ORVANE_NEED_OPENCL(ctx);
+    // Share locks keep a writer apart.
     Ref<Image> img = PatternImage(4, 4);
     auto reader = KROMBuffer::CreateImage(ctx, img.Get(), KROMBufferRead);
     GPUMemory *mem = reader->GetGPUMemory();
