@@ -211,7 +211,7 @@ TEST(TransformMatrix, FilteredSamplesFollowTheFilterFormulaAtEveryDepth) {
     });
     Ref<Image> noise = PatternImage(40, 40);
     auto at = [&](int depth) { return noise->CopyOfImageTagList({{ImgDepth, depth}}); };
-    Ref<Image> noise8 = at(DepthRGBAInt8), noise16 = at(DepthRGBAInt16), mask = at(DepthAInt16), half = at(DepthAFlt16);
+    Ref<Image> noise8 = at(DepthRGBAInt8), mask = at(DepthAInt16), half = at(DepthAFlt16);
     const struct {
         Image *src;
         int filter;
@@ -219,12 +219,10 @@ TEST(TransformMatrix, FilteredSamplesFollowTheFilterFormulaAtEveryDepth) {
     } cases[] = {{impulse.Get(), RszCatmullRom, 30, 1.4, 1.4, 0.7, -0.3},
                  {impulse.Get(), RszCubic, -12, 1.1, 2.0, 0, 0},
                  {impulse.Get(), RszLanczos, 75, 1.25, 1.25, 1.5, 0.25},
-                 {impulse.Get(), RszLinear, 200, 1, 1, 0.3, 0.3},
                  {noise.Get(), RszLinear, 17, 0.4, 0.4, 0, 0},
                  {noise.Get(), RszCatmullRom, 0, 0.5, 0.3, 0.25, 0},
                  {noise.Get(), RszLanczos, 41, 0.7, 0.45, -2, 1},
                  {noise8.Get(), RszMitchell, 21, 0.8, 1.3, 0, 0},
-                 {noise16.Get(), RszMitchell, 21, 0.8, 1.3, 0.5, 0},
                  {mask.Get(), RszLanczos, -33, 1.2, 0.9, 0, 0.5},
                  {half.Get(), RszMitchell, 21, 0.8, 1.3, 0, 0}};
     for (const auto &c : cases) {
@@ -234,7 +232,7 @@ TEST(TransformMatrix, FilteredSamplesFollowTheFilterFormulaAtEveryDepth) {
         Ref<Image> out = Transformed(c.src, tags);
         ASSERT_TRUE(out && out->Depth() == c.src->Depth());
         const ImgRectI dw = out->DataWindow();
-        EXPECT_GT(dw.Width() * dw.Height(), 16);
+        ASSERT_GT(dw.Width() * dw.Height(), 16);
         for (int j = dw.y0; j < dw.y1; ++j)
             for (int i = dw.x0; i < dw.x1; ++i) {
                 double want = Reference(*c.src, c.filter, c.angle, c.sx, c.sy, c.dx, c.dy, i, j);
@@ -262,19 +260,6 @@ TEST(TransformMatrix, AnInverseUndoesATransform) {
     // Two interpolations lose a little at the peaks (measured: 1.7e-3); two real resamplings took place.
     const double worst = MaxDiff(*back, *src, ImgRectI(12, 12, 52, 52));
     EXPECT_TRUE(worst < 4e-3 && worst > 0.0) << worst;
-}
-
-TEST(TransformMatrix, ASingularSizeShowsOnlyCanvas) {
-    const FltPixel canvas{0.1f, 0.2f, 0.3f, 0.4f};
-    Ref<Image> src = Filled(8, 8, 7, Constant({1, 1, 1, 1}), nullptr, canvas);
-    for (int edges : {EdgeCanvas, EdgeWrap}) {
-        Ref<TransformMatrix> tm;
-        Ref<Image> out =
-            Transformed(src.Get(), With(Geometry(30, 0, 1), {{XfInvert, 1}, {XfEdges, edges}}), nullptr, &tm);
-        EXPECT_TRUE(tm->SourceToOutput().Determinant() == 0.0 && tm->OutputDataWindow().IsNull());
-        ASSERT_TRUE(out && out->DataWindow().IsNull() && out->GetFlt(3, 3) == out->GetCanvasColor());
-        EXPECT_NEAR(out->GetCanvasColor().B, 0.3f, 1e-3);
-    }
 }
 
 TEST(TransformMatrix, EdgeModesFoldAtTheFrameBorder) {
@@ -336,7 +321,7 @@ TEST(TransformMatrix, DomainsCoverEveryPixelTheSourceReaches) {
     EXPECT_EQ(TransformedWindow(endless, Matrix3::Rotate(10), {RszLinear}), ImgRectI(-E, -E, E, E));
 }
 
-TEST(TransformMatrix, PreCalculationGivesWindowsWithoutPixelsAndAbortsGiveNone) {
+TEST(TransformMatrix, PreCalculationGivesWindowsWithoutPixelsAbortsAndSingularSizesNone) {
     Ref<Image> shape = NewImageTagList({{ImgWidth, 64}, {ImgHeight, 32}, {ImgNoData, 1}});
     const long before = TransformMatrix::ResampleCount();
     auto tm = MakeRef<TransformMatrix>(shape.Get());
@@ -351,8 +336,18 @@ TEST(TransformMatrix, PreCalculationGivesWindowsWithoutPixelsAndAbortsGiveNone) 
     src->SetAbortFlag(&abort);
     auto aborted = MakeRef<TransformMatrix>(src.Get());
     aborted->ImageConcatenateTagList(Geometry(10, 1.5, 1.5));
-    EXPECT_EQ(aborted->ApplyTransformTagList({}), nullptr);
-    EXPECT_FALSE(aborted->ImageConcatenateTagList({{XfFlatten, 1}}));
+    EXPECT_FALSE(aborted->ApplyTransformTagList({}) || aborted->ImageConcatenateTagList({{XfFlatten, 1}}));
+    // A singular size shows only canvas.
+    const FltPixel canvas{0.1f, 0.2f, 0.3f, 0.4f};
+    Ref<Image> white = Filled(8, 8, 7, Constant({1, 1, 1, 1}), nullptr, canvas);
+    for (int edges : {EdgeCanvas, EdgeWrap}) {
+        Ref<TransformMatrix> singular;
+        Ref<Image> out =
+            Transformed(white.Get(), With(Geometry(30, 0, 1), {{XfInvert, 1}, {XfEdges, edges}}), nullptr, &singular);
+        EXPECT_TRUE(singular->SourceToOutput().Determinant() == 0.0 && singular->OutputDataWindow().IsNull());
+        ASSERT_TRUE(out && out->DataWindow().IsNull() && out->GetFlt(3, 3) == out->GetCanvasColor());
+        EXPECT_NEAR(out->GetCanvasColor().B, 0.3f, 1e-3);
+    }
 }
 
 TEST(TransformMatrix, EqualityAndHashFollowSourceMatrixAndSampling) {
