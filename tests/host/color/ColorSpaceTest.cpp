@@ -6,6 +6,7 @@
 #include <algorithm>
 #include <array>
 #include <cmath>
+#include <tuple>
 
 #include <gtest/gtest.h>
 
@@ -34,13 +35,7 @@ Triple Convert(bool toSpace, ColorSpaceType s, const Triple &in) {
 
 TEST(ColorSpace, KnownColoursBothWays) {
     const double cube = 116 * std::cbrt(0.18f) - 16; // L* of 18% grey
-    const struct {
-        bool toSpace;
-        ColorSpaceType space;
-        Triple in;
-        std::array<double, 3> want;
-        double tol;
-    } cases[] = {
+    const std::tuple<bool, ColorSpaceType, Triple, std::array<double, 3>, double> cases[] = {
         // HSV: the six hues, orange at half brightness (a quarter of the way to yellow), greys with hue 0.
         {true, HSV, {1, 0, 0}, {0, 1, 1}, 1e-6},
         {true, HSV, {1, 1, 0}, {1.0 / 6, 1, 1}, 1e-6},
@@ -81,10 +76,10 @@ TEST(ColorSpace, KnownColoursBothWays) {
         {true, static_cast<ColorSpaceType>(3), {0.1f, 0.2f, 0.3f}, {0.1f, 0.2f, 0.3f}, 0},
         {false, static_cast<ColorSpaceType>(42), {0.1f, 0.2f, 0.3f}, {0.1f, 0.2f, 0.3f}, 0},
     };
-    for (const auto &c : cases)
-        EXPECT_TRUE(Near(Convert(c.toSpace, c.space, c.in), c.want, c.tol))
-            << (c.toSpace ? "to" : "from") << " space " << static_cast<int>(c.space) << ": " << c.in[0] << " "
-            << c.in[1] << " " << c.in[2];
+    for (const auto &[toSpace, space, in, want, tol] : cases)
+        EXPECT_TRUE(Near(Convert(toSpace, space, in), want, tol))
+            << (toSpace ? "to" : "from") << " space " << static_cast<int>(space) << ": " << in[0] << " " << in[1] << " "
+            << in[2];
     // Just short of red through magenta the hue is a hair under 1, not 1.
     for (ColorSpaceType s : {HSV, HLS}) {
         const Triple h = Convert(true, s, {1.0f, 0.0f, 1e-9f});

@@ -5,6 +5,7 @@
 #include <gtest/gtest.h>
 
 #include <cmath>
+#include <tuple>
 #include <vector>
 
 namespace Orvane::gamuttest {
@@ -26,10 +27,7 @@ TEST(Gamut, KnownValuesAndTheCineonCodePoints) {
     full.black = 0, full.white = 1023, full.filmGamma = 1.0;
     // Each 0.002 x 300 / 0.6 = 1 decade below white: linear 0.1 plus the black offset's share.
     const double offset = std::pow(10.0, -590 * 0.002 / 0.6);
-    const struct {
-        const char *what;
-        double got, want, tol;
-    } cases[] = {
+    const std::tuple<const char *, double, double, double> cases[] = {
         {"sRGB 0.5", SRGBToLinear(0.5), 0.214041, 1e-6},
         {"sRGB linear part", SRGBToLinear(0.04045), 0.04045 / 12.92, 1e-12},
         {"sRGB white", SRGBToLinear(1.0), 1.0, 0},
@@ -46,7 +44,7 @@ TEST(Gamut, KnownValuesAndTheCineonCodePoints) {
         {"full range white", CineonToLinear(1.0, full), 1.0, 1e-12},
         {"full range black", CineonToLinear(0.0, full), 0.0, 1e-12},
     };
-    for (const auto &c : cases) EXPECT_NEAR(c.got, c.want, c.tol) << c.what;
+    for (const auto &[what, got, want, tol] : cases) EXPECT_NEAR(got, want, tol) << what;
 }
 
 TEST(Gamut, PiecesMeetAndCurvesRiseAndMirror) {

@@ -29,11 +29,7 @@ std::vector<int> RowsOf(const Image &img) {
 TEST(CopyField, FullHeightLinesLandWhereExpectedDepthsConvertAndRefusals) {
     // Rows listed bottom (y = 0) to top; field 0 holds the top line.
     enum Into { New, Marked, Self };
-    const struct {
-        int h, field, dest, mode;
-        Into into;
-        std::vector<int> rows;
-    } cases[] = {
+    const std::tuple<int, int, int, int, Into, std::vector<int>> cases[] = {
         {5, 0, 2, 1, New, {0, -1, 2, -1, 4}},        // field 0 in place
         {5, 1, 2, 1, New, {-1, 1, -1, 3, -1}},       // field 1 in place
         {5, 1, 0, 1, New, {-1, -1, 1, -1, 3}},       // field 1 moved up one line; the bottom line has no source
@@ -46,15 +42,15 @@ TEST(CopyField, FullHeightLinesLandWhereExpectedDepthsConvertAndRefusals) {
         {6, 1, 0, 1, Marked, {-2, 0, -2, 2, -2, 4}}, // into a frame: its other lines stay
         {6, 0, 1, 1, Self, {1, 1, 3, 3, 5, 5}},      // into the same image: read before written
     };
-    for (const auto &c : cases) {
-        Ref<Image> src = RowImage(4, c.h), marked = Filled(4, c.h, DepthRGBAFlt32, [](int, int) {
-                                               return FltPixel{kMarker, 0, 0, 1};
-                                           });
+    for (const auto &[h, field, dest, mode, into, rows] : cases) {
+        Ref<Image> src = RowImage(4, h), marked = Filled(4, h, DepthRGBAFlt32, [](int, int) {
+                                             return FltPixel{kMarker, 0, 0, 1};
+                                         });
         Ref<Image> out =
-            src->CopyField(c.field, c.into == New ? nullptr : (c.into == Marked ? marked : src).Get(), c.dest, c.mode);
-        ASSERT_TRUE(out && (out.Get() == src.Get()) == (c.into == Self)) << &c - cases;
-        EXPECT_EQ(RowsOf(*out), c.rows) << "h " << c.h << " field " << c.field << " dest " << c.dest << " mode "
-                                        << c.mode << " into " << c.into;
+            src->CopyField(field, into == New ? nullptr : (into == Marked ? marked : src).Get(), dest, mode);
+        ASSERT_TRUE(out && (out.Get() == src.Get()) == (into == Self));
+        EXPECT_EQ(RowsOf(*out), rows) << "h " << h << " field " << field << " dest " << dest << " mode " << mode
+                                      << " into " << into;
     }
     // Into an integer frame: the float rows stored at its depth; lines not written stay zero.
     Ref<Image> into = Blank(4, 6, DepthRGBAInt16);
@@ -75,20 +71,18 @@ TEST(CopyField, FullHeightLinesLandWhereExpectedDepthsConvertAndRefusals) {
 }
 
 TEST(CopyField, HalfHeightImagesAreTaggedAndKeepTheWindows) {
-    const struct {
-        int h, field;
-        std::vector<int> rows; // the frame rows of the field's rows, bottom up
-    } cases[] = {{5, 0, {0, 2, 4}}, {5, 1, {1, 3}}, {6, 0, {1, 3, 5}}, {6, 1, {0, 2, 4}}, {1, 0, {0}}};
-    for (const auto &c : cases) {
-        Ref<Image> src = PatternAt(3, c.h, DepthRGBAInt16);
+    const std::tuple<int, int, std::vector<int>> cases[] = {
+        {5, 0, {0, 2, 4}}, {5, 1, {1, 3}}, {6, 0, {1, 3, 5}}, {6, 1, {0, 2, 4}}, {1, 0, {0}}};
+    for (const auto &[h, field, rows] : cases) {
+        Ref<Image> src = PatternAt(3, h, DepthRGBAInt16);
         src->SetScale(1.5, 0.75);
-        Ref<Image> out = src->CopyField(c.field, nullptr, -1, 1);
-        const int n = static_cast<int>(c.rows.size());
-        ASSERT_TRUE(out && out->Height() == n && out->Depth() == DepthRGBAInt16) << "h " << c.h << " field " << c.field;
-        EXPECT_TRUE(out->GetAttrL(ImgField, -1) == c.field && out->GetAttrL(ImgFullHeight) == c.h);
-        EXPECT_DOUBLE_EQ(out->GetAttrD(ImgFieldOffset, -1.0), c.rows[0] * 0.5 / n);
+        Ref<Image> out = src->CopyField(field, nullptr, -1, 1);
+        const int n = static_cast<int>(rows.size());
+        ASSERT_TRUE(out && out->Height() == n && out->Depth() == DepthRGBAInt16) << "h " << h << " field " << field;
+        EXPECT_TRUE(out->GetAttrL(ImgField, -1) == field && out->GetAttrL(ImgFullHeight) == h);
+        EXPECT_DOUBLE_EQ(out->GetAttrD(ImgFieldOffset, -1.0), rows[0] * 0.5 / n);
         EXPECT_DOUBLE_EQ(out->YScale(), 1.5);
-        for (int yh = 0; yh < n; ++yh) EXPECT_EQ(out->GetFlt(1, yh), src->GetFlt(1, c.rows[yh])) << c.h << " " << yh;
+        for (int yh = 0; yh < n; ++yh) EXPECT_EQ(out->GetFlt(1, yh), src->GetFlt(1, rows[yh])) << h << " " << yh;
     }
     // Rows 1..5 of a 6-line frame: field 0 is rows 1, 3, 5 (all inside), field 1 rows 0, 2, 4 (row 0 outside).
     const ImgRectI dw(1, 1, 4, 6);

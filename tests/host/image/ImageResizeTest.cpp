@@ -168,24 +168,21 @@ TEST(ResizeTagList, EdgePoliciesAtTheBorderByHand) {
     const float v[4] = {0.1f, 0.2f, 0.4f, 0.8f};
     auto at = [&](int x, int y) { return FltPixel{v[x + y], v[x + y], v[x + y], v[x + y]}; };
     Ref<Image> row = Filled(4, 1, DepthAFlt32, at, nullptr, {0, 0, 0, 0.05f});
-    const struct {
-        int edges;
-        double at0, at5; // expected: pixels (-2, -1) and (3, 4)
-    } cases[] = {
+    const std::tuple<int, double, double> cases[] = {
         {EdgeCanvas, 0.05, (0.8 + 0.05) / 2},         // beyond the row: the canvas
         {EdgeWrap, (0.4 + 0.8) / 2, (0.8 + 0.1) / 2}, // -2 reads c, -1 reads d; 4 reads a
         {EdgeDuplicate, 0.1, 0.8},                    // the end pixels repeat
         {EdgeMirror, (0.2 + 0.1) / 2, 0.8},           // -1 reads a, -2 reads b; 4 reads d
     };
-    for (const auto &c : cases) {
+    for (const auto &[edges, at0, at5] : cases) {
         Ref<Image> dst = Blank(6, 1, DepthAFlt32);
         ASSERT_TRUE(row->ResizeTagList(dst.Get(), {{ResizeFilter, RszLinear},
                                                    {ResizeXScale, 1.0},
                                                    {ResizeXOffset, 1.5},
-                                                   {ResizeXEdges, c.edges},
+                                                   {ResizeXEdges, edges},
                                                    {ResizeYEdges, EdgeDuplicate}}));
-        const double want[6] = {c.at0, 0, (0.1 + 0.2) / 2, 0, 0, c.at5};
-        for (int x : {0, 2, 5}) EXPECT_NEAR(dst->GetFlt(x, 0).A, want[x], 1e-7) << c.edges << ": " << x;
+        const double want[6] = {at0, 0, (0.1 + 0.2) / 2, 0, 0, at5};
+        for (int x : {0, 2, 5}) EXPECT_NEAR(dst->GetFlt(x, 0).A, want[x], 1e-7) << edges << ": " << x;
     }
     // Vertically the same rules (a column, Mirror), and beyond the frame the table keeps reading by them.
     Ref<Image> col = Filled(1, 4, DepthRGBAFlt32, at);

@@ -429,20 +429,17 @@ TEST(NewImage, LikeImageExplicitTagsAttributesWindowsNoDataCanvasAndAbort) {
     EXPECT_TRUE(NewImageTagList({{ImgWidth, 4}, {ImgHeight, 4}})->Attrs().Empty());
     // Data and valid windows given or not.
     const ImgRectI dw(-5, -5, 15, 8), vw(2, 2, 30, 30), frame(0, 0, 10, 6);
-    const struct {
-        const ImgRectI *data, *valid;
-        bool validTag;
-        ImgRectI wantData, wantValid;
-    } cases[] = {{&dw, nullptr, false, dw, dw},
-                 {&dw, &vw, true, dw, ImgRectI(2, 2, 15, 8)},
-                 {nullptr, &vw, true, frame, ImgRectI(2, 2, 10, 6)},
-                 {&dw, nullptr, true, dw, dw}}; // a null valid window: the data window
-    for (const auto &w : cases) {
+    const std::tuple<const ImgRectI *, const ImgRectI *, bool, ImgRectI, ImgRectI> cases[] = {
+        {&dw, nullptr, false, dw, dw},
+        {&dw, &vw, true, dw, ImgRectI(2, 2, 15, 8)},
+        {nullptr, &vw, true, frame, ImgRectI(2, 2, 10, 6)},
+        {&dw, nullptr, true, dw, dw}}; // a null valid window: the data window
+    for (const auto &[data, valid, validTag, wantData, wantValid] : cases) {
         TagList t{{ImgWidth, 10}, {ImgHeight, 6}};
-        if (w.data) t.Add({ImgDataWindow, w.data});
-        if (w.validTag) t.Add({ImgValidWindow, w.valid});
+        if (data) t.Add({ImgDataWindow, data});
+        if (validTag) t.Add({ImgValidWindow, valid});
         Ref<Image> got = NewImageTagList(t);
-        EXPECT_TRUE(got && got->DataWindow() == w.wantData && got->ValidWindow() == w.wantValid);
+        EXPECT_TRUE(got && got->DataWindow() == wantData && got->ValidWindow() == wantValid);
     }
     const FltPixel canvas{0.25f, 0.5f, 0.75f, 1.0f};
     std::atomic<bool> abort{false};

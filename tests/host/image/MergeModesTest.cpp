@@ -146,10 +146,7 @@ TEST(MergeModes, EveryModeAndOperatorMatchesItsDefinition) {
 
 TEST(MergeModes, HandComputedPixels) {
     const D4 f{0.4, 0.2, 0.1, 0.5}, b{0.3, 0.6, 0.2, 0.75}, grey{0.5, 0.5, 0.5, 1}, warm{0.5, 0.25, 0, 1};
-    const struct {
-        Controls c;
-        D4 f, b, want;
-    } cases[] = {
+    const std::tuple<Controls, D4, D4, D4> cases[] = {
         // Half-transparent red over opaque blue: red 0.5, blue 1 x (1 - 0.5).
         {{}, {0.5, 0, 0, 0.5}, {0, 0, 1, 1}, {0.5, 0, 0.5, 1}},
         {{.mode = MrgScreen}, grey, warm, {0.75, 0.625, 0.5, 1}}, // 0.5 + 0.5 - 0.25
@@ -166,7 +163,7 @@ TEST(MergeModes, HandComputedPixels) {
         {{.burnIn = 1}, f, b, {0.7, 0.8, 0.3, 0.75}},
         {{.mode = MrgMultiply, .blend = 0}, f, b, b},
     };
-    for (const auto &c : cases) EXPECT_TRUE(Near4(Merged(c.c, c.f, c.b), c.want)) << "mode " << c.c.mode;
+    for (const auto &[ctl, fg, bg, want] : cases) EXPECT_TRUE(Near4(Merged(ctl, fg, bg), want)) << "mode " << ctl.mode;
 }
 
 TEST(MergeModes, DissolveKeepsWholePixelsByTheNoise) {
@@ -239,11 +236,7 @@ TEST(MergeImages, EveryDepthCanvasWindowAndOffsetFollowTheReference) {
 TEST(MergeImages, DataWindowsFollowWhatCanDifferFromTheCanvas) {
     const ImgRectI fw(0, 0, 6, 6), bw(4, 4, 10, 10), both(0, 0, 10, 10);
     const FltPixel clear{}, grey{0.5f, 0.5f, 0.5f, 1};
-    const struct {
-        Controls c;
-        FltPixel bgCanvas;
-        ImgRectI want;
-    } cases[] = {
+    const std::tuple<Controls, FltPixel, ImgRectI> cases[] = {
         {{}, clear, both},                               // over: the union
         {{.op = MrgIn}, clear, ImgRectI(4, 4, 6, 6)},    // both sides cut
         {{.op = MrgIn}, grey, fw},                       // the background's canvas shows
@@ -251,8 +244,8 @@ TEST(MergeImages, DataWindowsFollowWhatCanDifferFromTheCanvas) {
         {{.op = MrgHeldOut}, clear, fw},                 //
         {{.op = MrgHeldOut, .blend = 0.5}, clear, both}, // half the background stays everywhere
     };
-    for (const auto &c : cases)
-        EXPECT_EQ(MergeDataWindow(MergeSettings::FromTags(TagsOf(c.c)), fw, clear, bw, c.bgCanvas), c.want) << c.c.op;
+    for (const auto &[ctl, bgCanvas, want] : cases)
+        EXPECT_EQ(MergeDataWindow(MergeSettings::FromTags(TagsOf(ctl)), fw, clear, bw, bgCanvas), want) << ctl.op;
     // What the rule cuts away really is the canvas: In over windows that do not meet leaves nothing.
     EXPECT_TRUE(MergeDataWindow(MergeSettings::FromTags(TagsOf({.op = MrgIn})), ImgRectI(0, 0, 3, 3), clear,
                                 ImgRectI(5, 5, 8, 8), clear)

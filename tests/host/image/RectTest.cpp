@@ -33,22 +33,18 @@ struct Lcg {
 constexpr int E = DomainEndless;
 
 TEST(RectBasics, SizeNullNormaliseAndContains) {
-    const struct {
-        ImgRectI r;
-        int w, h;
-        ImgRectI normalised;
-    } cases[] = {
+    const std::tuple<ImgRectI, int, int, ImgRectI> cases[] = {
         {{0, 0, 4, 3}, 4, 3, {0, 0, 4, 3}},        {{-2, -5, 1, -1}, 3, 4, {-2, -5, 1, -1}},
         {{2, 2, 2, 5}, 0, 3, {2, 2, 2, 5}},        {{2, 2, 5, 2}, 3, 0, {2, 2, 5, 2}},
         {{5, 0, 2, 3}, -3, 3, {2, 0, 5, 3}},       {{}, 0, 0, {}},
         {{5, 7, 1, 2}, -4, -5, {1, 2, 5, 7}},      {{1, 7, 5, 2}, 4, -5, {1, 2, 5, 7}},
         {{-3, 4, -3, -4}, 0, -8, {-3, -4, -3, 4}},
     };
-    for (const auto &c : cases) {
-        ImgRectI r = c.r;
+    for (const auto &[in, w, h, normalised] : cases) {
+        ImgRectI r = in;
         r.Normalise();
-        EXPECT_TRUE(r == c.normalised && c.r.Width() == c.w && c.r.Height() == c.h) << RectText(c.r);
-        EXPECT_EQ(c.r.IsNull(), PixelsOf(c.r).empty()) << RectText(c.r);
+        EXPECT_TRUE(r == normalised && in.Width() == w && in.Height() == h) << RectText(in);
+        EXPECT_EQ(in.IsNull(), PixelsOf(in).empty()) << RectText(in);
     }
     ImgRectI r(1, 2, 3, 4);
     r.SetNull();
@@ -101,11 +97,7 @@ TEST(RectSetOps, IntersectionAndUnionMatchPixelSets) {
 }
 
 TEST(RectMove, ScaleRoundsOutwardAndKeepsEndlessSides) {
-    const struct {
-        ImgRectI in;
-        double sx, sy;
-        ImgRectI out;
-    } cases[] = {
+    const std::tuple<ImgRectI, double, double, ImgRectI> cases[] = {
         {{-3, -3, 3, 3}, 0.5, 0.5, {-2, -2, 2, 2}},
         {{3, -5, 7, 9}, 2.0, 3.0, {6, -15, 14, 27}},
         {{0, 0, 1921, 1081}, 0.5, 0.5, {0, 0, 961, 541}},
@@ -114,12 +106,12 @@ TEST(RectMove, ScaleRoundsOutwardAndKeepsEndlessSides) {
         {{-2 * E, 0, 3, 2 * E}, 0.5, 0.5, {-2 * E, 0, 2, 2 * E}},
         {{1, 1, 999999, 999999}, 0.5, 0.5, {0, 0, 500000, 500000}},
     };
-    for (const auto &c : cases) {
-        ImgRectI r = c.in;
-        r.Scale(c.sx, c.sy);
-        ImageDomain d(c.in);
-        d.Scale(c.sx, c.sy);
-        EXPECT_TRUE(r == c.out && d.rect == c.out) << RectText(c.in) << " x " << c.sx << ", " << c.sy;
+    for (const auto &[in, sx, sy, out] : cases) {
+        ImgRectI r = in;
+        r.Scale(sx, sy);
+        ImageDomain d(in);
+        d.Scale(sx, sy);
+        EXPECT_TRUE(r == out && d.rect == out) << RectText(in) << " x " << sx << ", " << sy;
     }
     // Any finite rectangle: the scaled one holds the exact scaled edges, and no
     // side lies a whole pixel beyond them.
@@ -137,22 +129,18 @@ TEST(RectMove, ScaleRoundsOutwardAndKeepsEndlessSides) {
 }
 
 TEST(RectMove, OffsetAndGrowKeepEndlessSides) {
-    const struct {
-        ImgRectI in;
-        int dx, dy;
-        ImgRectI out;
-    } cases[] = {
+    const std::tuple<ImgRectI, int, int, ImgRectI> cases[] = {
         {{0, 0, 4, 3}, 5, -2, {5, -2, 9, 1}},
         {{-E, 2, 7, E}, 10, 10, {-E, 12, 17, E}},
         {{-E, -E, E, E}, 123, -456, {-E, -E, E, E}},
         {{1, -2 * E, 2 * E, 4}, -1, 1, {0, -2 * E, 2 * E, 5}},
     };
-    for (const auto &c : cases) {
-        ImgRectI r = c.in;
-        r.Offset(c.dx, c.dy);
-        ImageDomain d(c.in);
-        d.Offset(c.dx, c.dy);
-        EXPECT_TRUE(r == c.out && d.rect == c.out) << RectText(c.in);
+    for (const auto &[in, dx, dy, out] : cases) {
+        ImgRectI r = in;
+        r.Offset(dx, dy);
+        ImageDomain d(in);
+        d.Offset(dx, dy);
+        EXPECT_TRUE(r == out && d.rect == out) << RectText(in);
     }
     EXPECT_EQ(ImgRectI(0, 0, 4, 3).Grown(2, 1), ImgRectI(-2, -1, 6, 4));
     EXPECT_TRUE(ImgRectI(0, 0, 4, 3).Grown(-2, 0).IsNull());

@@ -60,16 +60,14 @@ protected:
 };
 
 TEST_F(ResizePeers, LanczosAndLinearShrinkAndStretchAsOiiotoolAndVipsDo) {
-    const struct {
-        int filter;
-        const char *oiio, *vips;
-    } cases[] = {{RszLanczos, "lanczos3", "lanczos3"}, {RszLinear, "triangle", "linear"}};
-    for (const auto &c : cases) {
-        Ref<Image> ours = Ours(c.filter), oiio = Oiio(c.oiio, kW / 2, kH / 2), vips = Vips(c.vips);
+    const std::tuple<int, const char *, const char *> cases[] = {{RszLanczos, "lanczos3", "lanczos3"},
+                                                                 {RszLinear, "triangle", "linear"}};
+    for (const auto &[filter, oiioName, vipsName] : cases) {
+        Ref<Image> ours = Ours(filter), oiio = Oiio(oiioName, kW / 2, kH / 2), vips = Vips(vipsName);
         ASSERT_TRUE(oiio && vips);
-        EXPECT_LT(InteriorDiff(*ours, *oiio), kTolerance) << c.oiio;
-        EXPECT_LT(InteriorDiff(*ours, *vips), kTolerance) << c.vips;
-        EXPECT_GT(InteriorDiff(*Ours(c.filter == RszLinear ? RszLanczos : RszLinear), *vips), 1e-4);
+        EXPECT_LT(InteriorDiff(*ours, *oiio), kTolerance) << oiioName;
+        EXPECT_LT(InteriorDiff(*ours, *vips), kTolerance) << vipsName;
+        EXPECT_GT(InteriorDiff(*Ours(filter == RszLinear ? RszLanczos : RszLinear), *vips), 1e-4);
     }
     Ref<Image> stretched = Oiio("lanczos3", 336, 224);
     ASSERT_TRUE(stretched);

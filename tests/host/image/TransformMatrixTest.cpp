@@ -77,27 +77,22 @@ TEST(TransformTagsMatrix, FollowsTheControlsStepByStep) {
     // the centre's 0.1: (0.85, 0.5); 0.1 above the pivot goes three times as far.
     const TagList pivot{{XfXSize, 2.0},  {XfYSize, 3.0},   {XfPivotX, 0.25},
                         {XfPivotY, 0.5}, {XfCenterX, 0.6}, {XfCenterY, 0.5}};
-    const struct {
-        const char *what;
-        TagList tags;
-        double W, H, ax, ay;
-        bool pixels; // points in pixels, else in units of the frame
-        double x, y, wantX, wantY;
-    } cases[] = {
-        // A quarter turn about the middle of 200 x 100 square pixels: 50 pixels right of the middle go to 50 above it.
-        {"quarter turn", Geometry(90, 1, 1), 200, 100, 1, 1, true, 150, 50, 100, 100},
-        // Pixels twice as wide as high: 10 pixels right (20 units) turn into 20 units = 20 pixels up.
-        {"wide pixels", Geometry(90, 1, 1), 100, 100, 2, 1, true, 60, 50, 50, 70},
-        {"pivot", pivot, 640, 480, 1, 1, false, 0.5, 0.5, 0.85, 0.5},
-        {"pivot", pivot, 640, 480, 1, 1, false, 0.25, 0.6, 0.35, 0.8},
-        // Flips mirror about the frame's middle before anything else.
-        {"flip x", {{XfFlipX, 1}}, 10, 10, 1, 1, false, 0.2, 0.3, 0.8, 0.3},
-        {"flip y, moved", {{XfFlipY, 1}, {XfCenterX, 0.6}}, 10, 10, 1, 1, false, 0.2, 0.3, 0.3, 0.7},
-    };
-    for (const auto &c : cases) {
-        const Matrix3 n = TransformTagsMatrix(c.tags, c.W, c.H, c.ax, c.ay);
-        EXPECT_TRUE(Maps(c.pixels ? NormalisedToPixelMatrix(n, c.W, c.H) : n, c.x, c.y, c.wantX, c.wantY, 1e-12))
-            << c.what;
+    const std::tuple<const char *, TagList, double, double, double, double, bool, double, double, double, double>
+        cases[] = {
+            // A quarter turn about the middle of 200 x 100 square pixels: 50 pixels right of the middle go to 50 above
+            // it.
+            {"quarter turn", Geometry(90, 1, 1), 200, 100, 1, 1, true, 150, 50, 100, 100},
+            // Pixels twice as wide as high: 10 pixels right (20 units) turn into 20 units = 20 pixels up.
+            {"wide pixels", Geometry(90, 1, 1), 100, 100, 2, 1, true, 60, 50, 50, 70},
+            {"pivot", pivot, 640, 480, 1, 1, false, 0.5, 0.5, 0.85, 0.5},
+            {"pivot", pivot, 640, 480, 1, 1, false, 0.25, 0.6, 0.35, 0.8},
+            // Flips mirror about the frame's middle before anything else.
+            {"flip x", {{XfFlipX, 1}}, 10, 10, 1, 1, false, 0.2, 0.3, 0.8, 0.3},
+            {"flip y, moved", {{XfFlipY, 1}, {XfCenterX, 0.6}}, 10, 10, 1, 1, false, 0.2, 0.3, 0.3, 0.7},
+        };
+    for (const auto &[what, tags, W, H, ax, ay, pixels, x, y, wantX, wantY] : cases) {
+        const Matrix3 n = TransformTagsMatrix(tags, W, H, ax, ay);
+        EXPECT_TRUE(Maps(pixels ? NormalisedToPixelMatrix(n, W, H) : n, x, y, wantX, wantY, 1e-12)) << what;
     }
     // Invert gives the inverse; a singular matrix (Size 0) stays as it is.
     const TagList t = With(Geometry(37, 1.3, 0.7, 0.52, 0.46), {{XfPivotX, 0.3}, {XfFlipX, 1}});
@@ -151,11 +146,7 @@ TEST(TransformMatrix, FlipsAndQuarterTurnsMovePixelsExactly) {
     // 3 x 2 and 3 x 3 images numbered 1, 2, 3 along the bottom row, rows top down in the table.
     auto numbered = [](int x, int y) { return FltPixel{1.f + x + 3.f * y, 0, 0, 1}; };
     Ref<Image> small = Filled(3, 2, 8, numbered), square = Filled(3, 3, 8, numbered);
-    const struct {
-        Image *src;
-        TagList tags;
-        std::vector<std::vector<float>> want;
-    } cases[] = {
+    const std::tuple<Image *, TagList, std::vector<std::vector<float>>> cases[] = {
         {small.Get(), {{XfFlipX, 1}}, {{6, 5, 4}, {3, 2, 1}}},
         {small.Get(), {{XfFlipY, 1}}, {{1, 2, 3}, {4, 5, 6}}},
         {small.Get(), {{XfFlipX, 1}, {XfFlipY, 1}}, {{3, 2, 1}, {6, 5, 4}}},
@@ -164,12 +155,12 @@ TEST(TransformMatrix, FlipsAndQuarterTurnsMovePixelsExactly) {
         {square.Get(), Geometry(-90, 1, 1), {{1, 4, 7}, {2, 5, 8}, {3, 6, 9}}},
         {square.Get(), Geometry(180, 1, 1), {{3, 2, 1}, {6, 5, 4}, {9, 8, 7}}},
     };
-    for (const auto &c : cases)
+    for (const auto &[src, tags, want] : cases)
         for (int filter : {RszNearest, RszLinear, RszLanczos}) {
-            Ref<Image> out = Transformed(c.src, With(c.tags, {{XfFilter, filter}}));
-            const int h = static_cast<int>(c.want.size());
-            EXPECT_EQ(out->DataWindow(), c.src->DataWindow());
-            EXPECT_EQ(RowsR(*out, 0, h - 1, 3, h), c.want) << "filter " << filter;
+            Ref<Image> out = Transformed(src, With(tags, {{XfFilter, filter}}));
+            const int h = static_cast<int>(want.size());
+            EXPECT_EQ(out->DataWindow(), src->DataWindow());
+            EXPECT_EQ(RowsR(*out, 0, h - 1, 3, h), want) << "filter " << filter;
         }
     // 4 x 2 about its middle (2, 1), a pixel corner: rows top down 5 6 7 8 /
     // 1 2 3 4 turn into two columns standing out of the frame.
@@ -212,34 +203,30 @@ TEST(TransformMatrix, FilteredSamplesFollowTheFilterFormulaAtEveryDepth) {
     Ref<Image> noise = PatternImage(40, 40);
     auto at = [&](int depth) { return noise->CopyOfImageTagList({{ImgDepth, depth}}); };
     Ref<Image> noise8 = at(DepthRGBAInt8), mask = at(DepthAInt16), half = at(DepthAFlt16);
-    const struct {
-        Image *src;
-        int filter;
-        double angle, sx, sy, dx, dy;
-    } cases[] = {{impulse.Get(), RszCatmullRom, 30, 1.4, 1.4, 0.7, -0.3},
-                 {impulse.Get(), RszCubic, -12, 1.1, 2.0, 0, 0},
-                 {impulse.Get(), RszLanczos, 75, 1.25, 1.25, 1.5, 0.25},
-                 {noise.Get(), RszLinear, 17, 0.4, 0.4, 0, 0},
-                 {noise.Get(), RszCatmullRom, 0, 0.5, 0.3, 0.25, 0},
-                 {noise.Get(), RszLanczos, 41, 0.7, 0.45, -2, 1},
-                 {noise8.Get(), RszMitchell, 21, 0.8, 1.3, 0, 0},
-                 {mask.Get(), RszLanczos, -33, 1.2, 0.9, 0, 0.5},
-                 {half.Get(), RszMitchell, 21, 0.8, 1.3, 0, 0}};
-    for (const auto &c : cases) {
-        const double W = c.src->Width();
-        const TagList tags =
-            With(Geometry(c.angle, c.sx, c.sy, 0.5 + c.dx / W, 0.5 + c.dy / W), {{XfFilter, c.filter}});
-        Ref<Image> out = Transformed(c.src, tags);
-        ASSERT_TRUE(out && out->Depth() == c.src->Depth());
+    const std::tuple<Image *, int, double, double, double, double, double> cases[] = {
+        {impulse.Get(), RszCatmullRom, 30, 1.4, 1.4, 0.7, -0.3},
+        {impulse.Get(), RszCubic, -12, 1.1, 2.0, 0, 0},
+        {impulse.Get(), RszLanczos, 75, 1.25, 1.25, 1.5, 0.25},
+        {noise.Get(), RszLinear, 17, 0.4, 0.4, 0, 0},
+        {noise.Get(), RszCatmullRom, 0, 0.5, 0.3, 0.25, 0},
+        {noise.Get(), RszLanczos, 41, 0.7, 0.45, -2, 1},
+        {noise8.Get(), RszMitchell, 21, 0.8, 1.3, 0, 0},
+        {mask.Get(), RszLanczos, -33, 1.2, 0.9, 0, 0.5},
+        {half.Get(), RszMitchell, 21, 0.8, 1.3, 0, 0}};
+    for (const auto &[src, filter, angle, sx, sy, dx, dy] : cases) {
+        const double W = src->Width();
+        const TagList tags = With(Geometry(angle, sx, sy, 0.5 + dx / W, 0.5 + dy / W), {{XfFilter, filter}});
+        Ref<Image> out = Transformed(src, tags);
+        ASSERT_TRUE(out && out->Depth() == src->Depth());
         const ImgRectI dw = out->DataWindow();
         ASSERT_GT(dw.Width() * dw.Height(), 16);
         for (int j = dw.y0; j < dw.y1; ++j)
             for (int i = dw.x0; i < dw.x1; ++i) {
-                double want = Reference(*c.src, c.filter, c.angle, c.sx, c.sy, c.dx, c.dy, i, j);
-                if (Kind(c.src->Depth()) < 2) want = std::clamp(want, 0.0, 1.0); // integers hold 0..1
-                ASSERT_NEAR(out->GetFlt(i, j).R, want, HalfCode(c.src->Depth(), want) + 5e-6)
-                    << "depth " << c.src->Depth() << " filter " << c.filter << " angle " << c.angle << " at " << i
-                    << "," << j;
+                double want = Reference(*src, filter, angle, sx, sy, dx, dy, i, j);
+                if (Kind(src->Depth()) < 2) want = std::clamp(want, 0.0, 1.0); // integers hold 0..1
+                ASSERT_NEAR(out->GetFlt(i, j).R, want, HalfCode(src->Depth(), want) + 5e-6)
+                    << "depth " << src->Depth() << " filter " << filter << " angle " << angle << " at " << i << ","
+                    << j;
             }
     }
 }

@@ -10,11 +10,7 @@ using namespace ::Orvane::Test;
 
 TEST(DeviceMerge, TheKernelGivesTheRowsBits) {
     ORVANE_NEED_OPENCL(ctx);
-    const struct {
-        int mode, op;
-        double blend, additive, gain, burn;
-        bool red, alpha;
-    } cases[] = {
+    const std::tuple<int, int, double, double, double, double, bool, bool> cases[] = {
         {MrgNormal, MrgOver, 1, 0, 1, 0, true, true},      {MrgNormal, MrgIn, 1, 0, 1, 0, true, true},
         {MrgNormal, MrgHeldOut, 0.6, 0, 1, 0, true, true}, {MrgNormal, MrgAtop, 1, 0.4, 0.5, 0.2, true, true},
         {MrgNormal, MrgXOr, 1, 0, 1, 0, false, true},      {MrgScreen, 0, 1, 0, 1, 0, true, true},
@@ -27,13 +23,12 @@ TEST(DeviceMerge, TheKernelGivesTheRowsBits) {
     for (int depth : {DepthRGBAFlt32, DepthRGBAFlt16, DepthRGBAInt16, DepthRGBAInt8, DepthAFlt32}) {
         Ref<Image> fg = PatternAt(29, 17, depth, 3, &fw), bg = PatternAt(37, 21, depth, 4, &bw);
         bg->SetCanvasColor(FltPixel{0.1f, 0.2f, 0.3f, 0.5f});
-        for (const auto &c : cases) {
-            SCOPED_TRACE("depth " + std::to_string(depth) + " mode " + std::to_string(c.mode) + " op " +
-                         std::to_string(c.op));
-            const TagList tags{{MrgApplyMode, c.mode},    {MrgOperator, c.op},    {MrgBlend, c.blend},
-                               {MrgAdditive, c.additive}, {MrgAlphaGain, c.gain}, {MrgBurnIn, c.burn},
-                               {MrgDoRed, c.red},         {MrgDoAlpha, c.alpha},  {MrgFgOffsetX, 5},
-                               {MrgFgOffsetY, -4}};
+        for (const auto &[mode, op, blend, additive, gain, burn, red, alpha] : cases) {
+            SCOPED_TRACE("depth " + std::to_string(depth) + " mode " + std::to_string(mode) + " op " +
+                         std::to_string(op));
+            const TagList tags{{MrgApplyMode, mode}, {MrgOperator, op}, {MrgBlend, blend}, {MrgAdditive, additive},
+                               {MrgAlphaGain, gain}, {MrgBurnIn, burn}, {MrgDoRed, red},   {MrgDoAlpha, alpha},
+                               {MrgFgOffsetX, 5},    {MrgFgOffsetY, -4}};
             const MergeSettings s = MergeSettings::FromTags(tags);
             ASSERT_TRUE(MergeKernelSupports(s));
             ImgRectI placed = fw;
