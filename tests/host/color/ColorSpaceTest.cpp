@@ -33,7 +33,7 @@ Triple Convert(bool toSpace, ColorSpaceType s, const Triple &in) {
 
 } // namespace
 
-TEST(ColorSpace, KnownColoursBothWays) {
+TEST(ColorSpace, KnownColoursBothWaysAndRoundTripsOverAGridAndInPlace) {
     const double cube = 116 * std::cbrt(0.18f) - 16; // L* of 18% grey
     const std::tuple<bool, ColorSpaceType, Triple, std::array<double, 3>, double> cases[] = {
         // HSV: the six hues, orange at half brightness (a quarter of the way to yellow), greys with hue 0.
@@ -86,9 +86,6 @@ TEST(ColorSpace, KnownColoursBothWays) {
         EXPECT_TRUE(h[0] >= 0.0f && h[0] < 1.0f) << h[0];
         EXPECT_TRUE(Near(Convert(false, s, h), {1, 0, 0}, 1e-6));
     }
-}
-
-TEST(ColorSpace, RoundTripsOverGridAndInPlace) {
     // Greys where all three match, primaries and secondaries at 0 and 1, and
     // negatives and values over 1 for out-of-range pixels.
     const float grid[] = {-0.5f, -0.1f, 0.0f, 0.05f, 0.18f, 0.5f, 0.75f, 1.0f, 1.25f, 2.5f};

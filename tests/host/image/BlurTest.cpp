@@ -85,7 +85,7 @@ double Variance(const std::vector<double> &r) {
     return v / s;
 }
 
-TEST(BlurKernels, FiniteKindsAreTheirDirectConvolutionsWithCanvasBeyondTheSource) {
+TEST(BlurKernels, FiniteKindsAreTheirConvolutionsImpulseResponsesKeepEnergyAndReach) {
     // A partial source window, a canvas, an output grown past the data window: borders, corners, pure canvas.
     const ImgRectI dw(2, 1, 33, 20), source(0, 3, 28, 30);
     Ref<Image> img = PatternAt(40, 24, DepthRGBAFlt32, 3, &dw, {0.1f, 0.2f, 0.3f, 0.4f});
@@ -98,9 +98,7 @@ TEST(BlurKernels, FiniteKindsAreTheirDirectConvolutionsWithCanvasBeyondTheSource
                 EXPECT_TRUE(AllNear(*got, out, 3e-6, [&](int x, int y, int c) { return ref.At(x, y, c); }))
                     << "kind " << kind << " p " << p << " q " << q;
             }
-}
-
-TEST(BlurKernels, ImpulseResponsesKeepEnergyAreSymmetricAndReachWhatTheySay) {
+    // Impulse responses keep energy, are symmetric and reach what they say.
     for (int kind : kAllKinds)
         for (double p : {0.6, 3.0, 9.5, 24.0}) {
             SCOPED_TRACE(testing::Message() << "kind " << kind << " p " << p);
@@ -118,7 +116,7 @@ TEST(BlurKernels, ImpulseResponsesKeepEnergyAreSymmetricAndReachWhatTheySay) {
         }
 }
 
-TEST(BlurKernels, GaussianKindsMeetTheNormalCdfAtAStepEdge) {
+TEST(BlurKernels, GaussianKindsMeetTheNormalCdfAndHaveItsVariance) {
     // A step from 0 to 1 at x = 0: pixel x sums the kernel over k <= x, the normal CDF at z = (x + 1/2) / sigma
     // plus the first Euler-Maclaurin term z phi(z) / (24 sigma^2). Tolerances: the fast kind's five boxes err
     // by 0.6% (docs/BLUR.md); the recursive ones are as good as their pole sets.
@@ -140,9 +138,6 @@ TEST(BlurKernels, GaussianKindsMeetTheNormalCdfAtAStepEdge) {
                                 }))
                 << "kind " << kind << " sigma " << sigma;
         }
-}
-
-TEST(BlurKernels, BoxCascadesAndVYVPolesHaveTheGaussiansVariance) {
     // Extended boxes and the moved poles give sigma^2 exactly (the YvV fit matches the peak, not the variance).
     for (double p : {7.0, 13.0, 40.0}) { // sigma above 3: the fast kind runs its boxes
         const double sigma2 = p * p / 4;

@@ -7,7 +7,7 @@ namespace Orvane::imgcroptest {
 namespace {
 using namespace ::Orvane::Test;
 
-TEST(ImageCrop, MovesCopiesAndSubsamplesWithCanvasBeyondTheSource) {
+TEST(ImageCrop, MovesCopiesAndSubsamplesAndSamplesAreExactAtCentresBilinearBetween) {
     const ImgRectI sw(2, 1, 14, 10), dw(-3, -2, 12, 11); // the output reaches beyond the moved source
     for (int sd : {DepthAInt8, DepthRGBAInt16, DepthRGBAFlt16, DepthRGBAFlt32})
         for (int dd : {DepthAFlt32, DepthRGBAInt8, DepthRGBAFlt32}) {
@@ -37,9 +37,7 @@ TEST(ImageCrop, MovesCopiesAndSubsamplesWithCanvasBeyondTheSource) {
     Ref<Image> pre = Blank(8, 6, DepthRGBAFlt32);
     pre->SetNoData(true);
     EXPECT_TRUE(src->ImageCrop(pre.Get(), 1, 1, {}) && !pre->HasScanLineData());
-}
-
-TEST(SamplePixel, ExactAtCentresBilinearBetweenCanvasOutside) {
+    // The point samplers: exact at centres, bilinear between, canvas outside.
     // Positions in 16.16 fixed point; pixel centres at (i << 16) + 32768.
     auto at = [](double v) { return static_cast<int32_t>(std::lround(v * 65536)); };
     FltPixel p;

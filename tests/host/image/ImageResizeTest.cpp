@@ -80,7 +80,7 @@ struct Request2D {
 /// What one stored component may differ by from an exact value (halves: near 1.5).
 double Slack(int depth) { return Kind(depth) == 2 ? 1.5e-3 : HalfCode(depth, 0) + (Kind(depth) == 3 ? 2e-5 : 1e-5); }
 
-TEST(ResizeFilters, SupportsInterpolationAndFallBacks) {
+TEST(ResizeFilters, SupportsFallBacksAndAxisTablesWhoseWeightsSumToOne) {
     // Values are held by the direct convolution; here the radius, and the interpolating filters' zeros.
     for (int filter : kAllFilters)
         for (int window : kWindows) {
@@ -95,9 +95,7 @@ TEST(ResizeFilters, SupportsInterpolationAndFallBacks) {
     EXPECT_TRUE(ValidResizeFilter(0) == RszLinear && ValidResizeFilter(12) == RszLinear);
     EXPECT_EQ(ValidResizeWindow(99), RszWindowHanning);
     EXPECT_EQ(ResizeFilterValue(RszSinc, 104, 1.3), ResizeFilterValue(RszSinc, RszWindowHanning, 1.3));
-}
-
-TEST(ResampleAxis, WeightsSumToOneRunsAreEvenAndImpossibleAxesAreRefused) {
+    // Axis tables: weights sum to one, runs are even, impossible axes are refused.
     for (int filter : kAllFilters)
         for (double scale : {0.25, 1.0 / 3, 0.5, 1.0, 1.7, 4.0})
             for (int edges : {int(EdgeCanvas), int(EdgeDuplicate), EdgeRenormalise}) {
@@ -149,7 +147,7 @@ TEST(ResizeTagList, EveryFilterMatchesTheDirectConvolution) {
         }
 }
 
-TEST(ResizeTagList, IdentityIsExactForInterpolatingFiltersAtEveryDepth) {
+TEST(ResizeTagList, IdentityIsExactAtEveryDepthAndEdgePoliciesHoldAtTheBorder) {
     for (int depth = 1; depth <= 8; ++depth)
         for (int filter : {RszNearest, RszBox, RszLinear, RszCatmullRom, RszLanczos, RszSinc})
             for (int edges : kEdges) {
@@ -160,9 +158,6 @@ TEST(ResizeTagList, IdentityIsExactForInterpolatingFiltersAtEveryDepth) {
                                                            {ResizeYEdges, edges}}));
                 ASSERT_TRUE(SameBits(*dst, *src)) << "depth " << depth << " filter " << filter << " edges " << edges;
             }
-}
-
-TEST(ResizeTagList, EdgePoliciesAtTheBorderByHand) {
     // A row a b c d shifted right by 1.5 pixels: output pixel 0 sits between source pixels -2 and -1, pixel 5
     // between 3 and 4, pixel 2 between a and b.
     const float v[4] = {0.1f, 0.2f, 0.4f, 0.8f};

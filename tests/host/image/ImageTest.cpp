@@ -102,7 +102,7 @@ TEST(ImageCanvas, OutsideTheDataWindowAndWithoutRows) {
     EXPECT_EQ(p, wide);
 }
 
-TEST(ImagePixels, PutGetRoundTripPerDepth) {
+TEST(ImagePixels, PutGetRoundTripPerDepthFloatsStoreAsTheNearestCode) {
     const float values[] = {0.0f, 1.0f,  0.5f,  1.0f / 255, 0.25f, 0.73f,        1e-3f, 0.999f, 1e-6f, -0.2f,
                             1.7f, -0.0f, 65504, 1e-7f,      0.1f,  100.4f / 255, NaNf,  Inff,   -Inff, 3.0f / 65535};
     const int n = std::size(values);
@@ -116,9 +116,7 @@ TEST(ImagePixels, PutGetRoundTripPerDepth) {
         }
         EXPECT_TRUE(img->GetFlt(0, 0) == FltPixel{} && img->GetFlt(2, 2) == FltPixel{}) << "neighbours, " << depth;
     }
-}
-
-TEST(ImagePixels, FloatsStoreAsTheExactlyNearestCode) {
+    // Floats store as the exactly nearest code: values near every code, floats in 0..1, out of range.
     // Values near every code, floats in 0..1, values out of range: the code nearest to the clamped v x max.
     std::vector<FltPixel> in;
     for (long max : {255L, 65535L})
@@ -155,7 +153,7 @@ TEST(ImagePixels, FloatsStoreAsTheExactlyNearestCode) {
     }
 }
 
-TEST(PixelRuns, EveryCodeLoadsAsItsValueAndStoresBack) {
+TEST(PixelRuns, EveryCodeLoadsAndStoresBackSixteenBitsNarrowToTheNearestFloatsKeepBits) {
     for (int depth : {DepthAInt8, DepthAInt16, DepthAFlt16, DepthRGBAInt8, DepthRGBAInt16, DepthRGBAFlt16}) {
         const PixelFormat fmt = FormatOfDepth(depth);
         const bool half = Kind(depth) == 2, wide = fmt.bytesPerComponent == 2;
@@ -195,9 +193,7 @@ TEST(PixelRuns, EveryCodeLoadsAsItsValueAndStoresBack) {
         StorePixel(depth, p.data(), n, back.data());
         EXPECT_EQ(back, raw);
     }
-}
-
-TEST(PixelRuns, SixteenBitValuesNarrowAndWidenToTheNearestFloatsKeepTheirBits) {
+    // Every 16-bit value narrows and widens to the nearest.
     for (uint32_t v = 0; v < 65536; ++v) {
         const Pixel px{static_cast<uint16_t>(v), 0, static_cast<uint16_t>(65535 - v), 65535};
         uint8_t b8[4];
@@ -254,7 +250,7 @@ TEST(PixelRuns, ReadSpanGivesCanvasLeftAndRight) {
     }
 }
 
-TEST(ImageServices, FillFillWithinAndClear) {
+TEST(ImageServices, FillFillWithinClearAndCopyBetweenEveryPairOfDepths) {
     const ImgRectI dw(-1, -1, 5, 4), within(2, 0, 9, 2); // within: partly outside the data window
     const FltPixel first{0.2f, 1.3f, -0.2f, 0.6f}, second{0.9f, 0.1f, 0.45f, 1.0f};
     for (int depth = 1; depth <= 8; ++depth) {
@@ -281,9 +277,6 @@ TEST(ImageServices, FillFillWithinAndClear) {
                     (big->GetFlt(289, y).R > 0.5f) == in && big->GetFlt(290, y).A == 0)
             << y;
     }
-}
-
-TEST(ImageServices, CopyBetweenEveryPairOfDepths) {
     const ImgRectI sw(-2, -1, 5, 4);
     const FltPixel canvas{0.2f, 0.4f, 0.6f, 0.8f};
     // Destinations partly outside the source on two sides, inside, around it, its columns and more rows, far away.

@@ -122,7 +122,7 @@ D4 Reference(const Controls &c, const D4 &f, const D4 &b) {
     return ::testing::AssertionSuccess();
 }
 
-TEST(MergeModes, EveryModeAndOperatorMatchesItsDefinition) {
+TEST(MergeModes, EveryModeAndOperatorMatchesItsDefinitionAndHandComputedPixels) {
     // Pairs that reach every branch: both sides of 1/2 and 1/4, dodges at 0 and 1, empty and opaque, above 1.
     const std::pair<D4, D4> pairs[] = {
         {{0.12, 0.30, 0.45, 0.6}, {0.08, 0.56, 0.32, 0.8}}, // Cs .2 .5 .75, Cb .1 .7 .4
@@ -142,9 +142,7 @@ TEST(MergeModes, EveryModeAndOperatorMatchesItsDefinition) {
                 for (const auto &[f, b] : pairs)
                     EXPECT_TRUE(Near4(Merged(c, f, b), Reference(c, f, b)))
                         << "mode " << c.mode << " op " << c.op << " blend " << c.blend << " additive " << c.additive;
-}
-
-TEST(MergeModes, HandComputedPixels) {
+    // Pixels computed by hand.
     const D4 f{0.4, 0.2, 0.1, 0.5}, b{0.3, 0.6, 0.2, 0.75}, grey{0.5, 0.5, 0.5, 1}, warm{0.5, 0.25, 0, 1};
     const std::tuple<Controls, D4, D4, D4> cases[] = {
         // Half-transparent red over opaque blue: red 0.5, blue 1 x (1 - 0.5).

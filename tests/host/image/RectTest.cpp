@@ -32,7 +32,7 @@ struct Lcg {
 
 constexpr int E = DomainEndless;
 
-TEST(RectBasics, SizeNullNormaliseAndContains) {
+TEST(RectBasics, SizeNullNormaliseContainsIntersectionAndUnion) {
     const std::tuple<ImgRectI, int, int, ImgRectI> cases[] = {
         {{0, 0, 4, 3}, 4, 3, {0, 0, 4, 3}},        {{-2, -5, 1, -1}, 3, 4, {-2, -5, 1, -1}},
         {{2, 2, 2, 5}, 0, 3, {2, 2, 2, 5}},        {{2, 2, 5, 2}, 3, 0, {2, 2, 5, 2}},
@@ -58,9 +58,6 @@ TEST(RectBasics, SizeNullNormaliseAndContains) {
     EXPECT_FALSE(box.Contains(ImgRectI(-1, 0, 4, 2)) || box.Contains(ImgRectI(-3, -1, 0, 0)));
     EXPECT_TRUE(ImgRectI().Contains(ImgRectI()) && !ImgRectI().Contains(ImgRectI(0, 0, 1, 1)));
     EXPECT_FALSE(ImgRectI().Contains(0, 0));
-}
-
-TEST(RectSetOps, IntersectionAndUnionMatchPixelSets) {
     Lcg rng{7};
     for (int i = 0; i < 4000; ++i) {
         const ImgRectI a = rng.Rect(), b = rng.Rect();

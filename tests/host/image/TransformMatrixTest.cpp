@@ -107,7 +107,7 @@ TEST(TransformTagsMatrix, FollowsTheControlsStepByStep) {
                 TransformTagsMatrix(t, 100, 100, 1, 0).IsIdentity(0));
 }
 
-TEST(TransformMatrix, AnIdentityHandsOnTheSourceItself) {
+TEST(TransformMatrix, AnIdentityHandsOnTheSourceWholePixelMovesCopyPixels) {
     Ref<Image> src = PatternImage(9, 7);
     const long before = TransformMatrix::ResampleCount();
     auto tm = MakeRef<TransformMatrix>(src.Get());
@@ -118,9 +118,6 @@ TEST(TransformMatrix, AnIdentityHandsOnTheSourceItself) {
     ASSERT_TRUE(tm->ImageConcatenateTagList(t) && tm->ImageConcatenateTagList(With(t, {{XfInvert, 1}})));
     EXPECT_TRUE(tm->SourceToOutput().IsIdentity(1e-12) && tm->ApplyTransformTagList({}).Get() == src.Get());
     EXPECT_TRUE(ImageOfValue(src.Get()).Get() == src.Get() && TransformMatrix::ResampleCount() == before);
-}
-
-TEST(TransformMatrix, WholePixelMovesCopyPixelsOnEveryDepth) {
     const ImgRectI dw(1, 0, 6, 5);
     const FltPixel canvas{0.25f, 0.5f, 0.75f, 1.f};
     auto ramps = [](int x, int y) { return FltPixel{0.1f * x, 0.07f * y + 0.01f, 0.3f, 0.05f * (x + y)}; };
