@@ -1,5 +1,4 @@
-// RGB to and from HSV, HLS and CIE L*a*b* (D65): known colours both ways,
-// published Lab values of the primaries, round trips over a grid that holds
+// RGB to and from HSV, HLS and CIE L*a*b* (D65): known and published values, round trips over a grid with
 // out-of-range values, hue wrapping, and the colours a space cannot hold.
 #include "host/color/ColorSpace.h"
 

@@ -5,7 +5,6 @@
 #include <bit>
 #include <cfloat>
 #include <cmath>
-#include <cstdio>
 #include <limits>
 #include <vector>
 
@@ -64,7 +63,6 @@ TEST(FastPow, MatchesDoublePowOverDenseSweepsAndMirrorsNegatives) {
     const std::vector<float> pos = SweepInputs();
     std::vector<float> neg = pos;
     for (float &x : neg) x = -x;
-    double overall = 0.0;
     for (float e : {0.0f, 1e-5f, 0.1f, 0.4545f, 0.5f, 1.0f, 1.3f, 2.2f, 5.0f, 100.0f, 100000.0f, -0.4545f, -2.2f}) {
         const std::vector<float> got = Pow(pos, e), gotNeg = Pow(neg, e);
         double worst = 0.0;
@@ -77,11 +75,8 @@ TEST(FastPow, MatchesDoublePowOverDenseSweepsAndMirrorsNegatives) {
             if (Bits(gotNeg[i]) != (Bits(got[i]) ^ 0x80000000u) && ++unmirrored <= 3)
                 ADD_FAILURE() << "exponent " << e << ": " << neg[i] << " gives " << gotNeg[i];
         }
-        std::printf("[ max ulp  ] exponent %-8g %.4f (at x = %g)\n", e, worst, worstX);
         EXPECT_LE(worst, kBoundUlp) << "exponent " << e << " at x = " << worstX;
-        overall = std::max(overall, worst);
     }
-    RecordProperty("max_ulp", std::to_string(overall));
 }
 
 TEST(FastPow, SpecialValuesFollowStdPowSameBitsWhereverAValueLiesAndInPlace) {

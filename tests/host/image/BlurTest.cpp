@@ -284,7 +284,7 @@ TEST(BlurRequest, EveryDepthRoundsTheFloatResultInPlaceOrNotOnAnyThreads) {
         }
 }
 
-TEST(BlurRequest, AbortsSayNoAndEmptyRequestsOnlySetTheCanvas) {
+TEST(BlurRequest, AbortsEmptyRequestsAndOiiotoolsBlurAsTheSameSampledGaussian) {
     const ImgRectI dw(0, 0, 64, 64);
     Ref<Image> img = PatternAt(64, 64, DepthRGBAFlt32, 3, &dw, {0.5f, 0.5f, 0.5f, 0.5f}), out = Like(img.Get(), dw);
     AbortedRequest aborted;
@@ -303,9 +303,6 @@ TEST(BlurRequest, AbortsSayNoAndEmptyRequestsOnlySetTheCanvas) {
     // BlurOfImageTagList: a new image with this one's windows and depth.
     Ref<Image> copy = img->BlurOfImageTagList({{BlurFilterType, BlurBox}, {BlurXSize, 2.0 / 64}});
     EXPECT_TRUE(copy && SameBits(*copy, *Blurred(img.Get(), dw, BlurBox, 2, 0)));
-}
-
-TEST(BlurPeers, OiiotoolBlurIsTheSameSampledGaussianCutAtTwoSigmas) {
     // `oiiotool --blur WxW` is the sampled Gaussian of sigma W / 4 over |k| < W / 2, normalised; ours (cut at
     // 4 sigma) has the same shape there, so on a line the two differ by the ratio of the kernels' sums.
     if (!HaveProgram("oiiotool")) GTEST_SKIP() << "oiiotool is not installed";

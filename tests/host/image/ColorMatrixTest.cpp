@@ -55,7 +55,7 @@ ColorMatrixFull FromRows(const Mat5 rows) {
     return m;
 }
 
-TEST(ColorMatrixCompose, ThenScaleOffsetApplyInStepOrder) {
+TEST(ColorMatrixFull, ComposesInStepOrderDeterminantsInversesAndTheCut) {
     Rng rng{1};
     for (int trial = 0; trial < 200; ++trial) {
         const ColorMatrixFull a = RandomMatrix(rng), b = RandomMatrix(rng), c = RandomMatrix(rng);
@@ -81,9 +81,6 @@ TEST(ColorMatrixCompose, ThenScaleOffsetApplyInStepOrder) {
     EXPECT_TRUE(id.IsIdentity() && !id.Scale(0, 2.0).IsIdentity());
     id.SetIdentity();
     EXPECT_EQ(id.Apply({0.25f, -1.0f, 3.0f, 0.5f}), (FltPixel{0.25f, -1.0f, 3.0f, 0.5f}));
-}
-
-TEST(ColorMatrixDeterminant, ClosedFormsAndTheProductRule) {
     // Diagonal, triangular, a swap, a three-cycle, a scaled swap, equal rows, a zero column, a 2 x 2 block.
     const struct {
         Mat5 m;
@@ -101,7 +98,7 @@ TEST(ColorMatrixDeterminant, ClosedFormsAndTheProductRule) {
     };
     for (const auto &c : cases) EXPECT_NEAR(FromRows(c.m).Determinant(), c.det, 1e-12) << &c - cases;
     // det(A B) = det(A) det(B), through Then and Scale.
-    Rng rng{5};
+    rng = Rng{5};
     for (int i = 0; i < 100; ++i) {
         const ColorMatrixFull a = RandomMatrix(rng), b = RandomMatrix(rng);
         ColorMatrixFull ab = a, scaled = a;
@@ -110,10 +107,8 @@ TEST(ColorMatrixDeterminant, ClosedFormsAndTheProductRule) {
         EXPECT_NEAR(ab.Determinant(), a.Determinant() * b.Determinant(), 1e-10 * (1 + std::fabs(ab.Determinant())));
         EXPECT_NEAR(scaled.Determinant(), -3.0 * a.Determinant(), 1e-10 * (1 + std::fabs(a.Determinant())));
     }
-}
-
-TEST(ColorMatrixInvert, InverseAndSingular) {
-    Rng rng{9};
+    // Inverses, and singular matrices refused.
+    rng = Rng{9};
     for (int trial = 0; trial < 200; ++trial) {
         const ColorMatrixFull a = RandomMatrix(rng, 0.4);
         ColorMatrixFull inv = a;
@@ -137,10 +132,8 @@ TEST(ColorMatrixInvert, InverseAndSingular) {
     }
     EXPECT_TRUE(tiny.Invert(1e-20)); // a looser threshold accepts it
     EXPECT_NEAR(tiny.m[0][0], 1e4, 1e-6);
-}
-
-TEST(ColorMatrixCut, ColourAsTheFullMatrixWithoutItsAlphaColumnAlphaUnchanged) {
-    Rng rng{4};
+    // The 4 x 4 cut: colour as the full matrix without its alpha column, alpha unchanged.
+    rng = Rng{4};
     const ColorMatrixFull full = RandomMatrix(rng);
     const ColorMatrix cut(full);
     ColorMatrixFull noAlpha = full;

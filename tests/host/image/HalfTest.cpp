@@ -1,6 +1,5 @@
-// Half conversions against the compiler's own binary16 type, whose
-// conversions round to nearest even in the compiler runtime's soft-float
-// routines: every half, every tie between neighbours, floats at a stride.
+// Half conversions against the compiler's binary16 type (round to nearest even in the runtime's soft-float
+// routines): every half, every tie between neighbours, floats at a stride.
 #include "host/image/Half.h"
 
 #include <bit>

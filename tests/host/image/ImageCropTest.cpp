@@ -1,6 +1,5 @@
-// Image::ImageCrop (moved and subsampled copies, canvas beyond the source,
-// depth conversion, aborts) and the point samplers SamplePixelB/W/D
-// (exact at pixel centres, bilinear between them, worked out here by hand).
+// ImageCrop (moved and subsampled copies, canvas beyond, depths, aborts) and the point samplers (exact at
+// centres, bilinear between them, worked out here by hand).
 #include "tests/host/image/ImageTestSupport.h"
 
 namespace Orvane::imgcroptest {

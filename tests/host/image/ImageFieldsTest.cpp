@@ -1,6 +1,5 @@
-// Field copies, field dominance reversal and window cuts. Rows carry their
-// own row number in red (and column in green), so every written line tells
-// where it came from; the expected layouts are worked out by hand per case.
+// Field copies, dominance reversal and window cuts. Rows carry their row number in red (column in green), so
+// every written line tells where it came from; the expected layouts are worked out by hand.
 #include "tests/host/image/ImageTestSupport.h"
 
 namespace Orvane::imgfieldstest {

@@ -153,7 +153,7 @@ TEST(ImagePixels, PutGetRoundTripPerDepthFloatsStoreAsTheNearestCode) {
     }
 }
 
-TEST(PixelRuns, EveryCodeLoadsAndStoresBackSixteenBitsNarrowToTheNearestFloatsKeepBits) {
+TEST(PixelRuns, LoadStoreAndReadSpansAsWorkedOutHere) {
     for (int depth : {DepthAInt8, DepthAInt16, DepthAFlt16, DepthRGBAInt8, DepthRGBAInt16, DepthRGBAFlt16}) {
         const PixelFormat fmt = FormatOfDepth(depth);
         const bool half = Kind(depth) == 2, wide = fmt.bytesPerComponent == 2;
@@ -228,9 +228,7 @@ TEST(PixelRuns, EveryCodeLoadsAndStoresBackSixteenBitsNarrowToTheNearestFloatsKe
         EXPECT_TRUE(p[i].A == NearestCode(data[i], 65535) && p[i].R == p[i].A) << data[i]; // clamped, NaN to 0
     }
     EXPECT_EQ(FltToPixel({-0.5f, 0.25f, 2.0f, NaNf}), (Pixel{0, 16384, 65535, 0}));
-}
-
-TEST(PixelRuns, ReadSpanGivesCanvasLeftAndRight) {
+    // Spans read canvas left and right of the data window.
     const ImgRectI dw(2, 1, 6, 4);
     const FltPixel canvas{0.125f, 0.25f, 0.375f, 0.5f}, unset{-9, -9, -9, -9};
     // Rows {y, x0, x1} through, below and above the window, runs over, inside and either side of it; two empty.

@@ -1,6 +1,5 @@
-// Rectangles and domains: sizes and containment, intersection and union
-// against pixel sets counted one by one, scaling that rounds outward,
-// moving, and endless sides that stay endless.
+// Rectangles and domains: sizes, containment, intersection and union against pixel sets counted one by one,
+// scaling that rounds outward, moving, endless sides that stay endless.
 #include "host/image/Rect.h"
 
 #include <set>
@@ -125,7 +124,7 @@ TEST(RectMove, ScaleRoundsOutwardAndKeepsEndlessSides) {
     }
 }
 
-TEST(RectMove, OffsetAndGrowKeepEndlessSides) {
+TEST(RectMove, OffsetGrowAndDomainOperationsKeepEndlessSides) {
     const std::tuple<ImgRectI, int, int, ImgRectI> cases[] = {
         {{0, 0, 4, 3}, 5, -2, {5, -2, 9, 1}},
         {{-E, 2, 7, E}, 10, 10, {-E, 12, 17, E}},
@@ -141,9 +140,7 @@ TEST(RectMove, OffsetAndGrowKeepEndlessSides) {
     }
     EXPECT_EQ(ImgRectI(0, 0, 4, 3).Grown(2, 1), ImgRectI(-2, -1, 6, 4));
     EXPECT_TRUE(ImgRectI(0, 0, 4, 3).Grown(-2, 0).IsNull());
-}
-
-TEST(RectDomain, Operations) {
+    // Domains.
     const ImageDomain endless = ImageDomain::Endless(), frame(ImgRectI(0, 0, 640, 480));
     EXPECT_EQ(endless.rect, ImgRectI(-E, -E, E, E));
     for (int v : {E, -E, E + 5}) EXPECT_TRUE(IsEndlessSide(v)) << v;

@@ -47,7 +47,7 @@ std::vector<std::vector<float>> RowsR(const Image &img, int x0, int yTop, int w,
     return ::testing::AssertionFailure() << "got (" << gx << ", " << gy << "), want (" << wantX << ", " << wantY << ")";
 }
 
-TEST(Matrix3, ComposesInvertsAndMapsPointsAsWrittenByHand) {
+TEST(Matrix3, ComposesInvertsMapsByHandAndFollowsTheTransformControls) {
     EXPECT_TRUE(Maps(Matrix3::Translate(3, 4) * Matrix3::Scale(2, 5), 1, 1, 5, 9, 0));
     EXPECT_TRUE(Maps(Matrix3::Scale(2, 5) * Matrix3::Translate(3, 4), 1, 1, 8, 25, 0));
     // Quarter turns are exact, in either direction and after whole turns; anticlockwise, y up.
@@ -70,9 +70,6 @@ TEST(Matrix3, ComposesInvertsAndMapsPointsAsWrittenByHand) {
     EXPECT_TRUE(!p.IsAffine() && Maps(p, 2, 2, 1, 1, 0));
     ASSERT_TRUE(p.Invert(inv));
     EXPECT_TRUE(Maps(inv, 1, 1, 2, 2, 1e-15));
-}
-
-TEST(TransformTagsMatrix, FollowsTheControlsStepByStep) {
     // Sizes about a pivot, then the centre's offset: (0.5, 0.5) - (0.25, 0.5) scaled by 2, plus the pivot and
     // the centre's 0.1: (0.85, 0.5); 0.1 above the pivot goes three times as far.
     const TagList pivot{{XfXSize, 2.0},  {XfYSize, 3.0},   {XfPivotX, 0.25},
@@ -228,7 +225,7 @@ TEST(TransformMatrix, FilteredSamplesFollowTheFilterFormulaAtEveryDepth) {
     }
 }
 
-TEST(TransformMatrix, AnInverseUndoesATransform) {
+TEST(TransformMatrix, AnInverseUndoesATransformAndEdgeModesFoldAtTheBorder) {
     // Smooth enough (periods of 12 pixels and more) for two Catmull-Rom passes.
     Ref<Image> src = Filled(64, 64, 8, [](int x, int y) {
         const float v = 0.5f + 0.25f * std::sin(x * 0.45f) * std::cos(y * 0.3f) + 0.1f * std::sin((x + y) * 0.2f);
@@ -244,9 +241,6 @@ TEST(TransformMatrix, AnInverseUndoesATransform) {
     // Two interpolations lose a little at the peaks (measured: 1.7e-3); two real resamplings took place.
     const double worst = MaxDiff(*back, *src, ImgRectI(12, 12, 52, 52));
     EXPECT_TRUE(worst < 4e-3 && worst > 0.0) << worst;
-}
-
-TEST(TransformMatrix, EdgeModesFoldAtTheFrameBorder) {
     // One row 1 2 3 4, canvas 10, moved half a pixel right with the tent: two source pixels per output pixel.
     Ref<Image> row = Filled(4, 1, 8, [](int x, int) { return FltPixel{1.f + x, 0, 0, 1}; }, nullptr, {10, 10, 10, 10});
     const ImgRectI cut(-1, 0, 6, 1);
@@ -272,7 +266,7 @@ TEST(TransformMatrix, EdgeModesFoldAtTheFrameBorder) {
     }
 }
 
-TEST(TransformMatrix, DomainsCoverEveryPixelTheSourceReaches) {
+TEST(TransformMatrix, DomainsCoverWhatTheSourceReachesEqualityAndHashFollowTheSampling) {
     const ImgRectI dw(3, 2, 17, 12);
     Ref<Image> src = Filled(20, 16, 8, Constant({1, 1, 1, 1}), &dw);
     // Half a pixel right with the tent reaches exactly one more column; rows stay.
@@ -332,9 +326,7 @@ TEST(TransformMatrix, PreCalculationGivesWindowsWithoutPixelsAbortsAndSingularSi
         ASSERT_TRUE(out && out->DataWindow().IsNull() && out->GetFlt(3, 3) == out->GetCanvasColor());
         EXPECT_NEAR(out->GetCanvasColor().B, 0.3f, 1e-3);
     }
-}
-
-TEST(TransformMatrix, EqualityAndHashFollowSourceMatrixAndSampling) {
+    // Equality and hash follow the source, matrix and sampling.
     Ref<Image> a = PatternImage(8, 8), b = PatternImage(8, 8);
     auto make = [](Image *src, const TagList &tags) {
         auto tm = MakeRef<TransformMatrix>(src);

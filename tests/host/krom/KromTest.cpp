@@ -87,7 +87,7 @@ TEST(KernelSignature, ReadsKindsAndNamesAndEveryCommonKernelCompilesOnEveryBackE
     EXPECT_TRUE(!missing->IsValid() && missing->Error().find("NoSuchCommonKernel") != std::string::npos);
 }
 
-TEST(Dialect, ReadsAndWritesEveryDepthAsTheHostConvertsIt) {
+TEST(Dialect, ReadsAndWritesEveryDepthAsTheHostAndSamplesLinearlyBetweenTexelCentres) {
     ORVANE_NEED_OPENCL(ctx);
     Ref<Image> src = PatternImage(37, 11, DepthRGBAFlt32);
     for (int depth = 1; depth <= 8; ++depth) {
@@ -122,10 +122,7 @@ TEST(Dialect, ReadsAndWritesEveryDepthAsTheHostConvertsIt) {
         EXPECT_EQ(wrong, 0) << "depth " << depth;
         EXPECT_LE(offByOne, 2) << "depth " << depth;
     }
-}
-
-TEST(Dialect, LinearSamplerInterpolatesTexelCentresAndClamps) {
-    ORVANE_NEED_OPENCL(ctx);
+    // The linear sampler interpolates between texel centres and clamps.
     const char params[] = "typedef struct { float u[6]; int workSize[2]; } SampleParams;\n";
     const char kernel[] = R"(
 __KERNEL__ void SampleRow(__CONSTANTREF__ SampleParams *p_pParams, __TEXTURE2D__ table, __TEXTURE2D_WRITE__ output,
@@ -194,7 +191,7 @@ TEST(DeviceImages, UploadIsKeptResultsAreStaleUntilDownloadedAndLocksKeepAWriter
     mem->ReleaseShareLock();
 }
 
-TEST(KernelCaches, CompileOncePerContextAndReuseBinariesFromDisk) {
+TEST(KernelCaches, CompileOnceAndReuseBinariesFromDiskAndTheDeviceThreadQueuesInOrder) {
     ORVANE_NEED_OPENCL(ctx);
     const int before = ctx->CompileCount();
     std::string log;
@@ -220,10 +217,7 @@ TEST(KernelCaches, CompileOncePerContextAndReuseBinariesFromDisk) {
     }
     unsetenv("ORVANE_KERNEL_CACHE");
     std::filesystem::remove_all(folder);
-}
-
-TEST(DeviceThread, ExecuteWaitsNestsAndQueuesInOrder) {
-    ORVANE_NEED_OPENCL(ctx);
+    // The device thread: Execute waits, nests and queues in order.
     RenderTask task;
     EXPECT_EQ(RenderTask::Find(task.ID()), &task);
     EXPECT_FALSE(task.Execute("no device", [](IDeviceContext *) { return true; }));

@@ -8,7 +8,7 @@ namespace Orvane::mergedevicetest {
 namespace {
 using namespace ::Orvane::Test;
 
-TEST(DeviceMerge, TheKernelGivesTheRowsBits) {
+TEST(DeviceMerge, TheKernelGivesTheRowsBitsAndModesWithoutOneRunTheRows) {
     ORVANE_NEED_OPENCL(ctx);
     const std::tuple<int, int, double, double, double, double, bool, bool> cases[] = {
         {MrgNormal, MrgOver, 1, 0, 1, 0, true, true},      {MrgNormal, MrgIn, 1, 0, 1, 0, true, true},
@@ -48,10 +48,7 @@ TEST(DeviceMerge, TheKernelGivesTheRowsBits) {
                 EXPECT_LE(MaxDiff(*dev, *cpu, out), (depth == DepthRGBAInt8 ? 1 / 255.0 : 1 / 65535.0) + 1e-7);
         }
     }
-}
-
-TEST(DeviceMerge, ModesWithoutAKernelRunTheRows) {
-    ORVANE_NEED_OPENCL(ctx);
+    // Modes without a kernel run the rows.
     Ref<Image> fg = PatternImage(8, 6, DepthRGBAFlt32, 5), bg = PatternImage(8, 6, DepthRGBAFlt32, 6);
     for (int mode : {MrgDissolve, MrgOverlay, MrgSoftLight, MrgColorDodge, MrgHue, MrgLuminosity}) {
         const TagList tags{{MrgApplyMode, mode}};
