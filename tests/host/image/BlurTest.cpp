@@ -154,7 +154,7 @@ TEST(BlurKernels, GaussianKindsMeetTheNormalCdfAndHaveItsVariance) {
     }
 }
 
-TEST(BlurKernels, KindsThatAreAnotherGiveItsBits) {
+TEST(BlurKernels, KindsThatAreAnotherGiveItsBitsConstantsStayAndTheCanvasIsEndless) {
     // The fast Gaussian is the sampled one while that is short (sigma up to 3); unknown kinds are the Soften kernel.
     const ImgRectI dw(0, 0, 30, 20);
     Ref<Image> img = PatternAt(30, 20, DepthRGBAFlt32, 3, nullptr, {0.5f, 0.5f, 0.5f, 0.5f});
@@ -163,22 +163,20 @@ TEST(BlurKernels, KindsThatAreAnotherGiveItsBits) {
     };
     for (double p : {0.5, 2.0, 6.0}) EXPECT_TRUE(same(BlurFastGaussian, BlurGaussian, p)) << p;
     for (int kind : {-1, 6, 8, 14, 99}) EXPECT_TRUE(same(kind, BlurSoften, 3)) << kind;
-}
-
-TEST(BlurEdges, AConstantStaysConstantAndTheCanvasIsAnInfinitePlane) {
     // A constant with the same canvas blurs to itself; with another canvas, the result is that of the image
     // padded with canvas far beyond any reach: an endless canvas, recursions included.
     const FltPixel c{0.37f, -0.2f, 1.25f, 0.5f};
-    const ImgRectI dw(0, 0, 24, 16), out = dw.Grown(20, 20);
-    Ref<Image> flat = Filled(24, 16, DepthRGBAFlt32, Constant(c), &dw, c);
-    Ref<Image> img = PatternAt(24, 16, DepthRGBAFlt32, 3, &dw, {0.9f, 0.1f, 0.4f, 1.0f});
-    const ImgRectI padded = dw.Grown(160, 160);
-    Ref<Image> big = img->CopyOfImageTagList({{ImgDataWindow, &padded}});
+    const ImgRectI whole(0, 0, 24, 16), out = whole.Grown(20, 20);
+    Ref<Image> flat = Filled(24, 16, DepthRGBAFlt32, Constant(c), &whole, c);
+    Ref<Image> pattern = PatternAt(24, 16, DepthRGBAFlt32, 3, &whole, {0.9f, 0.1f, 0.4f, 1.0f});
+    const ImgRectI padded = whole.Grown(160, 160);
+    Ref<Image> big = pattern->CopyOfImageTagList({{ImgDataWindow, &padded}});
     for (int kind : kAllKinds)
         for (double p : {3.0, 11.0}) {
             EXPECT_TRUE(AllNear(*Blurred(flat.Get(), out, kind, p, p), out, 2e-6, Constant(c)))
                 << "kind " << kind << " p " << p;
-            EXPECT_LT(MaxDiff(*Blurred(img.Get(), out, kind, p, p), *Blurred(big.Get(), out, kind, p, p), out), 2e-5)
+            EXPECT_LT(MaxDiff(*Blurred(pattern.Get(), out, kind, p, p), *Blurred(big.Get(), out, kind, p, p), out),
+                      2e-5)
                 << "kind " << kind << " p " << p;
         }
 }

@@ -177,7 +177,7 @@ ColorMatrixFull TestMatrix() {
     return FromRows(rows);
 }
 
-TEST(ApplyMatrix, EveryPairOfDepthsAndInPlace) {
+TEST(ApplyMatrix, EveryPairOfDepthsInPlaceRefusalsNoDataAndAbort) {
     const ColorMatrixFull m = TestMatrix();
     const ImgRectI sw(0, 0, 9, 7), wide(-1, -1, 10, 6);
     const FltPixel canvas{0.3f, 0.1f, 0.7f, 0.5f};
@@ -227,11 +227,8 @@ TEST(ApplyMatrix, ThreadedAndUnthreadedAgreeBitForBit) {
             EXPECT_TRUE(SameBits(*one, *many) && one->GetCanvasColor() == many->GetCanvasColor()) << sd << " to " << dd;
         }
     SetWorkerCount(saved);
-}
-
-TEST(ApplyMatrix, RefusalsNoDataAndAbort) {
+    // Refusals leave the destination alone; no data: the canvas only; an abort stops early.
     Ref<Image> src = PatternAt(4, 4, 8), dst = Blank(4, 4, 8);
-    const ColorMatrixFull m = TestMatrix();
     for (const TagList &t : {TagList{}, TagList{{WorkThreaded, 1}}, TagList{{MtxColorMatrixFull, nullptr}}})
         EXPECT_FALSE(ApplyMatrixTagList(src.Get(), dst.Get(), t));
     EXPECT_TRUE(!dst->HasScanLineData() && dst->IsCanvasColorClear()); // nothing done

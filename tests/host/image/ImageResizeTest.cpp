@@ -250,7 +250,7 @@ TEST(ResizeTagList, DataWindowsCanvasAndDepths) {
     EXPECT_TRUE(!pre->HasScanLineData() && pre->GetCanvasColor() == src->GetCanvasColor());
 }
 
-TEST(ResizeTables, ReusedTablesGiveTheSameBitsAndMismatchedOnesAreNotUsed) {
+TEST(ResizeTables, ReusedTablesGiveTheSameBitsThreadsAgreeAndAbortsRefuse) {
     Ref<Image> src = PatternAt(31, 17, DepthRGBAFlt16, 2);
     const ImgRectI part(3, 2, 40, 20), small(5, 5, 9, 9);
     const TagList request{{ResizeFilter, RszLanczos}, {ResizeXEdges, EdgeMirror}, {ResizeYEdges, EdgeCanvas}};
@@ -281,21 +281,19 @@ TEST(ResizeTables, ReusedTablesGiveTheSameBitsAndMismatchedOnesAreNotUsed) {
     EXPECT_FALSE(src->ResizePreCalcTagList(fresh.Get(), tx, ty, {{ResizeYScale, NAN}}) ||
                  src->ResizePreCalcTagList(nullptr, tx, ty, {}) ||
                  src->ResizeTagList(fresh.Get(), {{ResizeXScale, -1.0}}));
-}
-
-TEST(ResizeTagList, ThreadsAndAbort) {
-    Ref<Image> src = PatternAt(64, 48, DepthRGBAFlt32, 8);
+    // Threads give the same bits; aborts and bad images are refused.
+    Ref<Image> big = PatternAt(64, 48, DepthRGBAFlt32, 8);
     Ref<Image> threaded = Blank(150, 200, DepthRGBAFlt32), single = Blank(150, 200, DepthRGBAFlt32);
-    ASSERT_TRUE(src->ResizeTagList(threaded.Get(), {{ResizeFilter, RszCatmullRom}}));
-    ASSERT_TRUE(src->ResizeTagList(single.Get(), {{ResizeFilter, RszCatmullRom}, {WorkThreaded, 0}}));
+    ASSERT_TRUE(big->ResizeTagList(threaded.Get(), {{ResizeFilter, RszCatmullRom}}));
+    ASSERT_TRUE(big->ResizeTagList(single.Get(), {{ResizeFilter, RszCatmullRom}, {WorkThreaded, 0}}));
     EXPECT_TRUE(SameBits(*threaded, *single));
     AbortedRequest aborted;
-    Ref<Image> dst = Blank(100, 100, DepthRGBAFlt32);
-    EXPECT_FALSE(src->ResizeTagList(dst.Get(), {{WorkRequest, &aborted.req}}));
-    EXPECT_FALSE(src->ResizeTagList(nullptr, {}) || src->ResizeTagList(src.Get(), {}));
+    Ref<Image> square = Blank(100, 100, DepthRGBAFlt32);
+    EXPECT_FALSE(big->ResizeTagList(square.Get(), {{WorkRequest, &aborted.req}}));
+    EXPECT_FALSE(big->ResizeTagList(nullptr, {}) || big->ResizeTagList(big.Get(), {}));
     std::atomic<bool> stop{true};
-    src->SetAbortFlag(&stop);
-    EXPECT_FALSE(src->ResizeTagList(dst.Get(), {}));
+    big->SetAbortFlag(&stop);
+    EXPECT_FALSE(big->ResizeTagList(square.Get(), {}));
 }
 
 TEST(ScaleOfImage, AveragesBlocksScalesWindowsAndRefuses) {

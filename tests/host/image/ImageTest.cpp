@@ -42,7 +42,7 @@ FltPixel ExpectedRead(int depth, const FltPixel &p) {
     return ::testing::AssertionSuccess();
 }
 
-TEST(ImageWindows, DataWindowOnlyBeforeRowsValidWindowInsideItRowsOnlyInTheDataWindow) {
+TEST(ImageWindows, DataWindowOnlyBeforeRowsValidWindowInsideRowsAndCanvasOutside) {
     auto img = Blank(10, 6, 7);
     EXPECT_EQ(img->ValidWindow(), ImgRectI(0, 0, 10, 6));
     img->SetDataWindow(ImgRectI(-4, -2, 7, 5));
@@ -79,26 +79,24 @@ TEST(ImageWindows, DataWindowOnlyBeforeRowsValidWindowInsideItRowsOnlyInTheDataW
     none->SetNoData(true);
     none->Fill({1, 1, 1, 1});
     EXPECT_FALSE(none->AllocScanLineData() || none->HasScanLineData());
-}
-
-TEST(ImageCanvas, OutsideTheDataWindowAndWithoutRows) {
-    const ImgRectI dw(1, 1, 4, 3);
+    // The canvas: outside the data window and without rows.
+    const ImgRectI cw(1, 1, 4, 3);
     const FltPixel canvas{0.1f, 0.2f, 0.3f, 0.4f}, white{1, 1, 1, 1};
-    auto img = Blank(5, 4, 6, &dw);
-    img->SetCanvasColor(canvas);
-    EXPECT_EQ(img->GetFlt(2, 2), canvas); // no rows yet: all canvas
-    ASSERT_TRUE(img->AllocScanLineData());
-    img->PutFlt(2, 2, white);
-    img->PutFlt(0, 0, white); // outside: ignored
-    EXPECT_TRUE(AllNear(*img, ImgRectI(-1, -1, 6, 5), 0.0, [&](int x, int y) {
-        return !dw.Contains(x, y) ? canvas : x == 2 && y == 2 ? white : FltPixel{};
+    auto painted = Blank(5, 4, 6, &cw);
+    painted->SetCanvasColor(canvas);
+    EXPECT_EQ(painted->GetFlt(2, 2), canvas); // no rows yet: all canvas
+    ASSERT_TRUE(painted->AllocScanLineData());
+    painted->PutFlt(2, 2, white);
+    painted->PutFlt(0, 0, white); // outside: ignored
+    EXPECT_TRUE(AllNear(*painted, ImgRectI(-1, -1, 6, 5), 0.0, [&](int x, int y) {
+        return !cw.Contains(x, y) ? canvas : x == 2 && y == 2 ? white : FltPixel{};
     }));
     // The canvas as 16-bit components.
     const Pixel wide{65535, 0, 32768, 257};
-    img->SetCanvasColor(wide);
-    for (int c = 0; c < 4; ++c) EXPECT_NEAR(Channel(img->GetCanvasColor(), c), (&wide.R)[c] / 65535.0, 1e-7) << c;
+    painted->SetCanvasColor(wide);
+    for (int c = 0; c < 4; ++c) EXPECT_NEAR(Channel(painted->GetCanvasColor(), c), (&wide.R)[c] / 65535.0, 1e-7) << c;
     Pixel p;
-    img->GetCanvasColor(p);
+    painted->GetCanvasColor(p);
     EXPECT_EQ(p, wide);
 }
 
@@ -300,7 +298,7 @@ TEST(ImageServices, FillFillWithinClearAndCopyBetweenEveryPairOfDepths) {
     EXPECT_TRUE(AllNear(*dst, dst->DataWindow(), 0.0, Constant(canvas)));
 }
 
-TEST(ImageServices, CopyOfImageIsDeep) {
+TEST(ImageServices, CopyOfImageIsDeepAndAuxiliaryPlanesLieBesideTheColourRows) {
     const ImgRectI dw(-1, -2, 8, 6);
     auto src = WindowedImage(9, 7, dw, {0.1f, 0.2f, 0.3f, 0.4f}, 3, 6);
     src->SetScale(2.0, 0.5);
@@ -333,39 +331,37 @@ TEST(ImageServices, CopyOfImageIsDeep) {
     Ref<Parameter> asParam = copy->Copy();
     auto *paramImage = dynamic_cast<Image *>(asParam.Get());
     EXPECT_TRUE(paramImage && paramImage != copy.Get() && SameBits(*paramImage, *copy));
-}
-
-TEST(ImageAux, PlanesBesideTheColourRows) {
-    const ImgRectI dw(1, 1, 6, 4);
-    auto img = Blank(5, 4, 8, &dw);
-    ASSERT_TRUE(img->AddAuxChannel(AuxChannelKind::Z)); // before rows: no storage yet
-    EXPECT_TRUE(img->HasAuxChannel(AuxChannelKind::Z) && !img->HasAuxChannel(AuxChannelKind::U));
-    EXPECT_EQ(img->AuxRow(AuxChannelKind::Z, 1), nullptr);
-    img->ImageCopy(PatternImage(5, 4, 8, 17).Get());
-    const Ref<Image> colour = CopyOfImage(img.Get());
-    for (int y : {0, 4, -5}) EXPECT_EQ(img->AuxRow(AuxChannelKind::Z, y), nullptr) << y;
-    for (int y = dw.y0; y < dw.y1; ++y) std::fill_n(img->AuxRow(AuxChannelKind::Z, y), dw.Width(), -7.0f);
-    EXPECT_EQ(img->AuxRow(AuxChannelKind::U, 1), nullptr);
+    // Auxiliary planes beside the colour rows.
+    const ImgRectI aw(1, 1, 6, 4);
+    auto planes = Blank(5, 4, 8, &aw);
+    ASSERT_TRUE(planes->AddAuxChannel(AuxChannelKind::Z)); // before rows: no storage yet
+    EXPECT_TRUE(planes->HasAuxChannel(AuxChannelKind::Z) && !planes->HasAuxChannel(AuxChannelKind::U));
+    EXPECT_EQ(planes->AuxRow(AuxChannelKind::Z, 1), nullptr);
+    planes->ImageCopy(PatternImage(5, 4, 8, 17).Get());
+    const Ref<Image> colour = CopyOfImage(planes.Get());
+    for (int y : {0, 4, -5}) EXPECT_EQ(planes->AuxRow(AuxChannelKind::Z, y), nullptr) << y;
+    for (int y = aw.y0; y < aw.y1; ++y) std::fill_n(planes->AuxRow(AuxChannelKind::Z, y), aw.Width(), -7.0f);
+    EXPECT_EQ(planes->AuxRow(AuxChannelKind::U, 1), nullptr);
     // Every kind has a plane of its own (Z again: the same plane, the others
     // zeroed, added after the rows); the colour rows stay as they were.
     const int kinds = static_cast<int>(AuxChannelKind::Count);
     for (int k = 0; k < kinds; ++k) {
         const auto kind = static_cast<AuxChannelKind>(k);
-        ASSERT_TRUE(img->AddAuxChannel(kind));
-        for (int y = dw.y0; y < dw.y1; ++y)
-            for (int i = 0; i < dw.Width(); ++i) {
-                ASSERT_EQ(img->AuxRow(kind, y)[i], k == 0 ? -7.0f : 0.0f) << k;
-                img->AuxRow(kind, y)[i] = k * 1000.0f + y;
+        ASSERT_TRUE(planes->AddAuxChannel(kind));
+        for (int y = aw.y0; y < aw.y1; ++y)
+            for (int i = 0; i < aw.Width(); ++i) {
+                ASSERT_EQ(planes->AuxRow(kind, y)[i], k == 0 ? -7.0f : 0.0f) << k;
+                planes->AuxRow(kind, y)[i] = k * 1000.0f + y;
             }
     }
     for (int k = 0; k < kinds; ++k)
-        for (int y = dw.y0; y < dw.y1; ++y)
-            for (int i = 0; i < dw.Width(); ++i)
-                ASSERT_EQ(img->AuxRow(static_cast<AuxChannelKind>(k), y)[i], k * 1000.0f + y) << k;
-    EXPECT_TRUE(SameBits(*img, *colour));
+        for (int y = aw.y0; y < aw.y1; ++y)
+            for (int i = 0; i < aw.Width(); ++i)
+                ASSERT_EQ(planes->AuxRow(static_cast<AuxChannelKind>(k), y)[i], k * 1000.0f + y) << k;
+    EXPECT_TRUE(SameBits(*planes, *colour));
 }
 
-TEST(NewImage, ImpossibleFormatsGiveNull) {
+TEST(NewImage, ImpossibleFormatsGiveNullLikeImagesExplicitTagsWindowsAndNoData) {
     // Sizes: none, no height, zero, negative, too large, beyond 32 bits.
     EXPECT_TRUE(!NewImageTagList({}) && !NewImageTagList({{ImgWidth, 4}}));
     const long long sizes[][2] = {
@@ -383,10 +379,6 @@ TEST(NewImage, ImpossibleFormatsGiveNull) {
     EXPECT_FALSE(NewImageTagList({{ImgLikeImage, like.Get()}, {ImgHeight, 0}}));
     Ref<Image> largest = NewImageTagList({{ImgWidth, MaxImageSide}, {ImgHeight, MaxImageSide}, {ImgNoData, 1}});
     EXPECT_TRUE(largest && largest->Width() == MaxImageSide);
-}
-
-TEST(NewImage, LikeImageExplicitTagsAttributesWindowsNoDataCanvasAndAbort) {
-    auto like = Blank(30, 20, 6);
     like->SetScale(2.0, 0.5);
     like->SetDataWindow(ImgRectI(-5, -5, 40, 25));
     like->SetCanvasColor(FltPixel{1, 0, 0, 1});

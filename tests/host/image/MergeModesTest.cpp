@@ -231,7 +231,7 @@ TEST(MergeImages, EveryDepthCanvasWindowAndOffsetFollowTheReference) {
         }
 }
 
-TEST(MergeImages, DataWindowsFollowWhatCanDifferFromTheCanvas) {
+TEST(MergeImages, DataWindowsFollowWhatCanDifferAndTheCopiedBackgroundIsTheMerge) {
     const ImgRectI fw(0, 0, 6, 6), bw(4, 4, 10, 10), both(0, 0, 10, 10);
     const FltPixel clear{}, grey{0.5f, 0.5f, 0.5f, 1};
     const std::tuple<Controls, FltPixel, ImgRectI> cases[] = {
@@ -248,28 +248,26 @@ TEST(MergeImages, DataWindowsFollowWhatCanDifferFromTheCanvas) {
     EXPECT_TRUE(MergeDataWindow(MergeSettings::FromTags(TagsOf({.op = MrgIn})), ImgRectI(0, 0, 3, 3), clear,
                                 ImgRectI(5, 5, 8, 8), clear)
                     .IsNull());
-}
-
-TEST(MergeImages, CopiedBackgroundEqualsTheComputedMerge) {
     // Beyond a clear foreground the rows copy the background; padded with clear pixels over the frame, the
     // foreground makes them compute every pixel: the same bits, and the copy is the background.
-    const ImgRectI fw(3, 2, 9, 7), bw(0, 0, 16, 12);
-    auto padded = [&](int x, int y) { return fw.Contains(x, y) ? FgAt(x, y) : FltPixel{}; };
+    const ImgRectI fgWindow(3, 2, 9, 7), bgWindow(0, 0, 16, 12);
+    auto padded = [&](int x, int y) { return fgWindow.Contains(x, y) ? FgAt(x, y) : FltPixel{}; };
     for (int depth : {DepthRGBAInt8, DepthRGBAFlt16, DepthAInt16, DepthRGBAFlt32})
         for (int mode : {MrgNormal, MrgScreen, MrgColorBurn}) {
             SCOPED_TRACE("depth " + std::to_string(depth) + " mode " + std::to_string(mode));
-            Ref<Image> fg = Filled(16, 12, DepthRGBAFlt32, FgAt, &fw), bg = Filled(16, 12, depth, BgAt, &bw);
-            Ref<Image> whole = Filled(16, 12, DepthRGBAFlt32, padded, &bw);
-            Ref<Image> copied = Blank(16, 12, depth, &bw), computed = Blank(16, 12, depth, &bw);
+            Ref<Image> fg = Filled(16, 12, DepthRGBAFlt32, FgAt, &fgWindow),
+                       bg = Filled(16, 12, depth, BgAt, &bgWindow);
+            Ref<Image> whole = Filled(16, 12, DepthRGBAFlt32, padded, &bgWindow);
+            Ref<Image> copied = Blank(16, 12, depth, &bgWindow), computed = Blank(16, 12, depth, &bgWindow);
             ASSERT_TRUE(MergeImagesTagList(fg.Get(), bg.Get(), copied.Get(), TagsOf({.mode = mode})));
             ASSERT_TRUE(MergeImagesTagList(whole.Get(), bg.Get(), computed.Get(), TagsOf({.mode = mode})));
             EXPECT_TRUE(SameBits(*copied, *computed));
-            EXPECT_TRUE(
-                AllNear(*copied, bw, 0, [&](int x, int y) { return (fw.Contains(x, y) ? copied : bg)->GetFlt(x, y); }));
+            EXPECT_TRUE(AllNear(*copied, bgWindow, 0,
+                                [&](int x, int y) { return (fgWindow.Contains(x, y) ? copied : bg)->GetFlt(x, y); }));
         }
 }
 
-TEST(MergeImages, DepthMergeLetsTheNearerWin) {
+TEST(MergeImages, DepthMergeLetsTheNearerWinPreCalculationGetsTheCanvasAbortsStop) {
     const ImgRectI win(0, 0, 4, 1);
     auto zImage = [&](const std::vector<FltPixel> &px, const std::vector<float> &z) {
         Ref<Image> img = Filled(
@@ -297,20 +295,18 @@ TEST(MergeImages, DepthMergeLetsTheNearerWin) {
         }
         EXPECT_TRUE(dst->GetFlt(3, 0) == bp && z[3] == 2.f) << zMerge; // an empty foreground never wins
     }
-}
-
-TEST(MergeImages, PreCalculationGetsTheCanvasOnlyAndAnAbortStopsTheRows) {
-    const ImgRectI win(0, 0, 8, 8);
+    const ImgRectI square(0, 0, 8, 8);
     const FltPixel grey{0.2f, 0.2f, 0.2f, 1};
-    Ref<Image> fg = Filled(16, 12, DepthRGBAFlt32, FgAt, &win), bg = Filled(16, 12, DepthRGBAFlt32, BgAt, &win, grey);
-    Ref<Image> shape = Blank(16, 12, DepthRGBAFlt32, &win), dst = Blank(16, 12, DepthRGBAFlt32, &win);
+    Ref<Image> fgImage = Filled(16, 12, DepthRGBAFlt32, FgAt, &square),
+               bgImage = Filled(16, 12, DepthRGBAFlt32, BgAt, &square, grey);
+    Ref<Image> shape = Blank(16, 12, DepthRGBAFlt32, &square), out = Blank(16, 12, DepthRGBAFlt32, &square);
     shape->SetNoData(true);
-    ASSERT_TRUE(MergeImagesTagList(fg.Get(), bg.Get(), shape.Get(), TagsOf({})));
+    ASSERT_TRUE(MergeImagesTagList(fgImage.Get(), bgImage.Get(), shape.Get(), TagsOf({})));
     EXPECT_TRUE(!shape->HasScanLineData() && shape->GetCanvasColor() == grey);
-    EXPECT_FALSE(MergeImagesTagList(nullptr, bg.Get(), dst.Get(), {}));
+    EXPECT_FALSE(MergeImagesTagList(nullptr, bgImage.Get(), out.Get(), {}));
     std::atomic<bool> abort{true};
-    dst->SetAbortFlag(&abort);
-    EXPECT_FALSE(MergeImagesTagList(fg.Get(), bg.Get(), dst.Get(), TagsOf({})));
+    out->SetAbortFlag(&abort);
+    EXPECT_FALSE(MergeImagesTagList(fgImage.Get(), bgImage.Get(), out.Get(), TagsOf({})));
 }
 
 } // namespace

@@ -92,7 +92,7 @@ TEST(RectBasics, SizeNullNormaliseContainsIntersectionAndUnion) {
     }
 }
 
-TEST(RectMove, ScaleRoundsOutwardAndKeepsEndlessSides) {
+TEST(RectMove, ScaleOffsetGrowAndDomainOperationsKeepEndlessSides) {
     const std::tuple<ImgRectI, double, double, ImgRectI> cases[] = {
         {{-3, -3, 3, 3}, 0.5, 0.5, {-2, -2, 2, 2}},
         {{3, -5, 7, 9}, 2.0, 3.0, {6, -15, 14, 27}},
@@ -122,21 +122,18 @@ TEST(RectMove, ScaleRoundsOutwardAndKeepsEndlessSides) {
                     r.x1 >= in.x1 * sx && r.x1 < in.x1 * sx + 1 && r.y1 >= in.y1 * sy && r.y1 < in.y1 * sy + 1)
             << RectText(in) << " x " << sx << ", " << sy << " gave " << RectText(r);
     }
-}
-
-TEST(RectMove, OffsetGrowAndDomainOperationsKeepEndlessSides) {
-    const std::tuple<ImgRectI, int, int, ImgRectI> cases[] = {
+    const std::tuple<ImgRectI, int, int, ImgRectI> moves[] = {
         {{0, 0, 4, 3}, 5, -2, {5, -2, 9, 1}},
         {{-E, 2, 7, E}, 10, 10, {-E, 12, 17, E}},
         {{-E, -E, E, E}, 123, -456, {-E, -E, E, E}},
         {{1, -2 * E, 2 * E, 4}, -1, 1, {0, -2 * E, 2 * E, 5}},
     };
-    for (const auto &[in, dx, dy, out] : cases) {
-        ImgRectI r = in;
-        r.Offset(dx, dy);
-        ImageDomain d(in);
-        d.Offset(dx, dy);
-        EXPECT_TRUE(r == out && d.rect == out) << RectText(in);
+    for (const auto &[in, dx, dy, out] : moves) {
+        ImgRectI moved = in;
+        moved.Offset(dx, dy);
+        ImageDomain movedDomain(in);
+        movedDomain.Offset(dx, dy);
+        EXPECT_TRUE(moved == out && movedDomain.rect == out) << RectText(in);
     }
     EXPECT_EQ(ImgRectI(0, 0, 4, 3).Grown(2, 1), ImgRectI(-2, -1, 6, 4));
     EXPECT_TRUE(ImgRectI(0, 0, 4, 3).Grown(-2, 0).IsNull());
@@ -147,15 +144,15 @@ TEST(RectMove, OffsetGrowAndDomainOperationsKeepEndlessSides) {
     for (int v : {E - 1, -E + 1}) EXPECT_FALSE(IsEndlessSide(v)) << v;
     EXPECT_TRUE((endless & frame) == frame && (endless | frame) == endless && (frame | ImageDomain()) == frame);
     EXPECT_TRUE((frame & ImageDomain(ImgRectI(700, 0, 800, 10))).IsNull());
-    ImageDomain d = endless;
-    d &= ImageDomain(ImgRectI(-10, -E, 10, E));
-    d.Scale(2.0, 2.0); // the endless sides stay, the finite ones scale
-    d.Offset(5, 5);
-    EXPECT_EQ(d.rect, ImgRectI(-15, -E, 25, E));
-    d.ClipTo(ImgRectI(0, 0, 100, 50));
-    EXPECT_EQ(d.rect, ImgRectI(0, 0, 25, 50));
-    d.ClipTo(ImgRectI(30, 0, 40, 10));
-    EXPECT_EQ(d, ImageDomain());
+    ImageDomain movedDomain = endless;
+    movedDomain &= ImageDomain(ImgRectI(-10, -E, 10, E));
+    movedDomain.Scale(2.0, 2.0); // the endless sides stay, the finite ones scale
+    movedDomain.Offset(5, 5);
+    EXPECT_EQ(movedDomain.rect, ImgRectI(-15, -E, 25, E));
+    movedDomain.ClipTo(ImgRectI(0, 0, 100, 50));
+    EXPECT_EQ(movedDomain.rect, ImgRectI(0, 0, 25, 50));
+    movedDomain.ClipTo(ImgRectI(30, 0, 40, 10));
+    EXPECT_EQ(movedDomain, ImageDomain());
 }
 
 } // namespace
