@@ -181,7 +181,7 @@ TEST(BlurKernels, KindsThatAreAnotherGiveItsBitsConstantsStayAndTheCanvasIsEndle
         }
 }
 
-TEST(BlurEdges, SupportOfEachKindFollowsTheFrameWidthAndThePixelAspect) {
+TEST(BlurEdges, SupportFollowsTheFrameAndAspectChannelsBlendScalesAndSourceWindows) {
     // Lengths of p pixels on a 1000-pixel frame: sizes round up; passes count for Sharpen and Multi-box.
     ImageDomain domain(ImgRectI(0, 0, 1000, 500));
     domain.frame = ImgRectI(0, 0, 1000, 500);
@@ -215,24 +215,22 @@ TEST(BlurEdges, SupportOfEachKindFollowsTheFrameWidthAndThePixelAspect) {
     const ImageDomain frame = DomainOfImage(*imp, imp->DataWindow());
     ASSERT_TRUE(Image::GetBlurSupport(BlurBox, &frame, dx, dy, 0));
     EXPECT_TRUE(dx == x && dy == y);
-}
-
-TEST(BlurRequest, ChannelsBlendScalesAndTheSourceWindow) {
+    // Channels, blend, scales and the source window.
     const ImgRectI dw(0, 0, 26, 18), out = dw.Grown(4, 4);
     Ref<Image> img = PatternAt(26, 18, DepthRGBAFlt32, 3, &dw, {0.05f, 0.1f, 0.15f, 0.2f});
     Ref<Image> plain = Blurred(img.Get(), out, BlurGaussian, 4, 3);
     const float blend = 0.3f, scale = 1.5f, scales[4] = {2.0f, 0.5f, 1.0f, -1.0f};
     const TagList mixed{{BlurDoGreen, 0},          {BlurBlend, blend},          {BlurScale, scale},
                         {BlurRedScale, scales[0]}, {BlurGreenScale, scales[1]}, {BlurAlphaScale, scales[3]}};
-    Ref<Image> got = Blurred(img.Get(), out, BlurGaussian, 4, 3, mixed);
+    Ref<Image> blended = Blurred(img.Get(), out, BlurGaussian, 4, 3, mixed);
     // The mix, and the canvas through it (its blur is itself).
     auto mix = [&](const FltPixel &s, const FltPixel &b, int c) {
         return c == 1 ? Channel(s, c) : Channel(s, c) + (Channel(b, c) * scale * scales[c] - Channel(s, c)) * blend;
     };
-    EXPECT_TRUE(
-        AllNear(*got, out, 2e-6, [&](int x, int y, int c) { return mix(img->GetFlt(x, y), plain->GetFlt(x, y), c); }));
+    EXPECT_TRUE(AllNear(*blended, out, 2e-6,
+                        [&](int x, int y, int c) { return mix(img->GetFlt(x, y), plain->GetFlt(x, y), c); }));
     for (int c = 0; c < 4; ++c)
-        EXPECT_FLOAT_EQ(Channel(got->GetCanvasColor(), c), mix(img->GetCanvasColor(), img->GetCanvasColor(), c));
+        EXPECT_FLOAT_EQ(Channel(blended->GetCanvasColor(), c), mix(img->GetCanvasColor(), img->GetCanvasColor(), c));
     // Blend 0 is the source itself, and every channel off likewise.
     Ref<Image> none = Blurred(img.Get(), out, BlurGaussian, 4, 3, {{BlurBlend, 0.0}});
     Ref<Image> off = Blurred(img.Get(), out, BlurGaussian, 4, 3,

@@ -177,7 +177,7 @@ ColorMatrixFull TestMatrix() {
     return FromRows(rows);
 }
 
-TEST(ApplyMatrix, EveryPairOfDepthsInPlaceRefusalsNoDataAndAbort) {
+TEST(ApplyMatrix, EveryPairOfDepthsAndInPlace) {
     const ColorMatrixFull m = TestMatrix();
     const ImgRectI sw(0, 0, 9, 7), wide(-1, -1, 10, 6);
     const FltPixel canvas{0.3f, 0.1f, 0.7f, 0.5f};
@@ -212,7 +212,7 @@ TEST(ApplyMatrix, EveryPairOfDepthsInPlaceRefusalsNoDataAndAbort) {
     }
 }
 
-TEST(ApplyMatrix, ThreadedAndUnthreadedAgreeBitForBit) {
+TEST(ApplyMatrix, ThreadedAndUnthreadedAgreeBitForBitRefusalsNoDataAndAbort) {
     const int saved = WorkerCount();
     SetWorkerCount(4);
     Rng rng{3};

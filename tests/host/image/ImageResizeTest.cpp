@@ -124,7 +124,7 @@ TEST(ResizeFilters, SupportsFallBacksAndAxisTablesWhoseWeightsSumToOne) {
     EXPECT_FALSE(bad.IsValid());
 }
 
-TEST(ResizeTagList, EveryFilterMatchesTheDirectConvolution) {
+TEST(ResizeTagList, EveryFilterMatchesTheDirectConvolutionIdentityIsExactEdgesHold) {
     // Up, down, a whole shrink, unequal axes, and pure shifts: {sx, sy, ox, oy, width, height}.
     const double geometries[][6] = {{2.5, 0.4, 0, 0, 33, 4},
                                     {0.5, 0.5, 0, 0, 7, 5},
@@ -145,9 +145,6 @@ TEST(ResizeTagList, EveryFilterMatchesTheDirectConvolution) {
                     << "filter " << filter << " window " << window << " scale " << sx << "x" << sy;
             }
         }
-}
-
-TEST(ResizeTagList, IdentityIsExactAtEveryDepthAndEdgePoliciesHoldAtTheBorder) {
     for (int depth = 1; depth <= 8; ++depth)
         for (int filter : {RszNearest, RszBox, RszLinear, RszCatmullRom, RszLanczos, RszSinc})
             for (int edges : kEdges) {
@@ -191,7 +188,7 @@ TEST(ResizeTagList, IdentityIsExactAtEveryDepthAndEdgePoliciesHoldAtTheBorder) {
     EXPECT_FLOAT_EQ(dst->GetFlt(5, 3).R, want[4]); // columns repeat (Duplicate by default)
 }
 
-TEST(ResizeTagList, OffsetsAndTheSourceWindow) {
+TEST(ResizeTagList, OffsetsSourceWindowsDataWindowsCanvasAndDepths) {
     Ref<Image> src = PatternAt(16, 12, DepthRGBAFlt32, 9);
     // Whole offsets at scale 1 move the pixels exactly.
     Ref<Image> moved = Blank(16, 12, DepthRGBAFlt32);
@@ -226,28 +223,26 @@ TEST(ResizeTagList, OffsetsAndTheSourceWindow) {
     ASSERT_TRUE(src->ResizeTagList(viaCanvas.Get(), viaCanvasTags));
     EXPECT_TRUE(SameBits(*viaWindow, *viaCanvas));
     EXPECT_FALSE(src->ResizeTagList(viaWindow.Get(), {{ResizeSourceWindow, &none}})); // an empty window is refused
-}
-
-TEST(ResizeTagList, DataWindowsCanvasAndDepths) {
     // A source whose data window is part of the frame and one reaching past it,
     // read at every depth into outputs of other depths and windows.
     const ImgRectI inside(2, 1, 12, 8), beyond(-3, -2, 15, 11), part(-4, 3, 25, 14);
-    const Request2D r{RszMitchell, RszWindowHanning, 21.0 / 13, 14.0 / 9, 0, 0, EdgeCanvas, EdgeMirror, {}};
+    const Request2D mitchell{RszMitchell, RszWindowHanning, 21.0 / 13, 14.0 / 9, 0, 0, EdgeCanvas, EdgeMirror, {}};
     for (const ImgRectI *sw : {&inside, &beyond})
         for (int sd : {DepthAInt8, DepthAFlt16, DepthRGBAInt8, DepthRGBAInt16, DepthRGBAFlt16, DepthRGBAFlt32})
             for (int dd : {DepthAFlt32, DepthRGBAInt16, DepthRGBAFlt32}) {
-                Ref<Image> src = PatternAt(13, 9, sd, 4, sw, {0.3f, 0.3f, 0.3f, 0.5f}), dst = Blank(21, 14, dd, &part);
-                ASSERT_TRUE(src->ResizeTagList(dst.Get(), r.Tags()));
-                EXPECT_EQ(dst->GetCanvasColor(), src->GetCanvasColor());
+                Ref<Image> source = PatternAt(13, 9, sd, 4, sw, {0.3f, 0.3f, 0.3f, 0.5f}),
+                           dst = Blank(21, 14, dd, &part);
+                ASSERT_TRUE(source->ResizeTagList(dst.Get(), mitchell.Tags()));
+                EXPECT_EQ(dst->GetCanvasColor(), source->GetCanvasColor());
                 // A mask output holds the alpha of what an RGBA output would.
-                EXPECT_TRUE(Matches(*dst, *src, r, Slack(dd) + 1e-6))
+                EXPECT_TRUE(Matches(*dst, *source, mitchell, Slack(dd) + 1e-6))
                     << "window " << RectText(*sw) << " depth " << sd << " -> " << dd;
             }
     // Pre-calculation: no rows, the canvas taken over.
-    Ref<Image> src = PatternAt(16, 12, DepthRGBAInt16, 3, nullptr, {0.5f, 0, 0, 0.5f}), pre = Blank(40, 30, 8);
+    Ref<Image> source = PatternAt(16, 12, DepthRGBAInt16, 3, nullptr, {0.5f, 0, 0, 0.5f}), pre = Blank(40, 30, 8);
     pre->SetNoData(true);
-    EXPECT_TRUE(src->ResizeTagList(pre.Get(), {}));
-    EXPECT_TRUE(!pre->HasScanLineData() && pre->GetCanvasColor() == src->GetCanvasColor());
+    EXPECT_TRUE(source->ResizeTagList(pre.Get(), {}));
+    EXPECT_TRUE(!pre->HasScanLineData() && pre->GetCanvasColor() == source->GetCanvasColor());
 }
 
 TEST(ResizeTables, ReusedTablesGiveTheSameBitsThreadsAgreeAndAbortsRefuse) {

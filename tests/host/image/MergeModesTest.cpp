@@ -122,7 +122,7 @@ D4 Reference(const Controls &c, const D4 &f, const D4 &b) {
     return ::testing::AssertionSuccess();
 }
 
-TEST(MergeModes, EveryModeAndOperatorMatchesItsDefinitionAndHandComputedPixels) {
+TEST(MergeModes, EveryModeAndOperatorMatchesItsDefinitionHandComputedPixelsAndDissolve) {
     // Pairs that reach every branch: both sides of 1/2 and 1/4, dodges at 0 and 1, empty and opaque, above 1.
     const std::pair<D4, D4> pairs[] = {
         {{0.12, 0.30, 0.45, 0.6}, {0.08, 0.56, 0.32, 0.8}}, // Cs .2 .5 .75, Cb .1 .7 .4
@@ -162,9 +162,7 @@ TEST(MergeModes, EveryModeAndOperatorMatchesItsDefinitionAndHandComputedPixels) 
         {{.mode = MrgMultiply, .blend = 0}, f, b, b},
     };
     for (const auto &[ctl, fg, bg, want] : cases) EXPECT_TRUE(Near4(Merged(ctl, fg, bg), want)) << "mode " << ctl.mode;
-}
-
-TEST(MergeModes, DissolveKeepsWholePixelsByTheNoise) {
+    // Dissolve keeps whole pixels by the noise.
     auto noise = [](int x, int y) {
         uint32_t u = static_cast<uint32_t>(x) * 0x9E3779B1u + static_cast<uint32_t>(y) * 0x85EBCA77u;
         u = (u ^ (u >> 16)) * 0x7FEB352Du;
@@ -174,21 +172,22 @@ TEST(MergeModes, DissolveKeepsWholePixelsByTheNoise) {
     MergeSettings s;
     s.mode = MrgDissolve;
     s.blend = 0.8f;
-    const FltPixel f{0.3f, 0.15f, 0.6f, 0.75f}, b{0.1f, 0.2f, 0.3f, 1.f};
+    const FltPixel fgPixel{0.3f, 0.15f, 0.6f, 0.75f}, bgPixel{0.1f, 0.2f, 0.3f, 1.f};
     const double p = static_cast<double>(0.8f * 0.75f);
     int kept = 0, n = 0;
     for (int y = -40; y < 40; ++y)
         for (int x = -60; x < 60; ++x, ++n) {
             ASSERT_EQ(DissolveNoise(x, y), static_cast<float>(noise(x, y)));
-            const FltPixel o = MergePixel(s, f, b, x, y);
+            const FltPixel o = MergePixel(s, fgPixel, bgPixel, x, y);
             const bool keep = noise(x, y) < p;
             kept += keep;
-            ASSERT_TRUE(keep ? Near4(o, {0.4, 0.2, 0.8, 1}) : ::testing::AssertionResult(o == b)) // straight, opaque
+            ASSERT_TRUE(keep ? Near4(o, {0.4, 0.2, 0.8, 1})
+                             : ::testing::AssertionResult(o == bgPixel)) // straight, opaque
                 << x << "," << y;
         }
     // The share kept is the chance, within a few standard deviations; the canvas is the mean.
     EXPECT_NEAR(kept / double(n), p, 4 * std::sqrt(p * (1 - p) / n));
-    EXPECT_TRUE(Near4(MergeCanvasColor(s, f, b), {0.1 + p * 0.3, 0.2, 0.3 + p * 0.5, 1}));
+    EXPECT_TRUE(Near4(MergeCanvasColor(s, fgPixel, bgPixel), {0.1 + p * 0.3, 0.2, 0.3 + p * 0.5, 1}));
 }
 
 FltPixel FgAt(int x, int y) { return {0.05f * (x % 7), 0.04f * (y % 9), 0.3f, 0.25f + 0.05f * ((x + y) % 10)}; }

@@ -136,7 +136,29 @@ TEST(TransformMatrix, AnIdentityHandsOnTheSourceWholePixelMovesCopyPixels) {
     }
 }
 
-TEST(TransformMatrix, FlipsAndQuarterTurnsMovePixelsExactly) {
+/// A filtered transform at output pixel (i, j) from the geometry: o = R S (p - c) + c + d in square pixels of a
+/// W x W frame, so p = S^-1 R^-1 (o - c - d) + c.
+double Reference(const Image &src, int filter, double angle, double sx, double sy, double dx, double dy, int i, int j) {
+    const double c = src.Width() / 2.0, a = angle * std::numbers::pi / 180;
+    const double ox = i + 0.5 - c - dx, oy = j + 0.5 - c - dy;
+    const double u = (std::cos(a) * ox + std::sin(a) * oy) / sx + c;
+    const double v = (-std::sin(a) * ox + std::cos(a) * oy) / sy + c;
+    // The footprint widens along a source axis where an output step moves more than a source pixel.
+    const double stx = std::max(1.0, std::hypot(std::cos(a) / sx, std::sin(a) / sx));
+    const double sty = std::max(1.0, std::hypot(std::sin(a) / sy, std::cos(a) / sy));
+    const double rx = RefRadius(filter) * stx, ry = RefRadius(filter) * sty;
+    double sum = 0, wsum = 0;
+    for (int l = static_cast<int>(std::floor(v - ry)) - 1; l <= v + ry + 1; ++l)
+        for (int k = static_cast<int>(std::floor(u - rx)) - 1; k <= u + rx + 1; ++k) {
+            const double w = RefFilter(filter, RszWindowHanning, (k + 0.5 - u) / stx) *
+                             RefFilter(filter, RszWindowHanning, (l + 0.5 - v) / sty);
+            wsum += w;
+            sum += w * src.GetFlt(k, l).R; // canvas outside the data window; a mask reads alpha
+        }
+    return sum / wsum;
+}
+
+TEST(TransformMatrix, FlipsAndQuarterTurnsMovePixelsExactlyFilteredSamplesFollowTheFormula) {
     // 3 x 2 and 3 x 3 images numbered 1, 2, 3 along the bottom row, rows top down in the table.
     auto numbered = [](int x, int y) { return FltPixel{1.f + x + 3.f * y, 0, 0, 1}; };
     Ref<Image> small = Filled(3, 2, 8, numbered), square = Filled(3, 3, 8, numbered);
@@ -164,31 +186,6 @@ TEST(TransformMatrix, FlipsAndQuarterTurnsMovePixelsExactly) {
     const int expect[4][2] = {{8, 4}, {7, 3}, {6, 2}, {5, 1}}; // top down, x = 1, 2
     for (int r = 0; r < 4; ++r)
         for (int c = 0; c < 2; ++c) EXPECT_EQ(*turned->PixelAddress(1 + c, 2 - r), expect[r][c]) << r << "," << c;
-}
-
-/// A filtered transform at output pixel (i, j) from the geometry: o = R S (p - c) + c + d in square pixels of a
-/// W x W frame, so p = S^-1 R^-1 (o - c - d) + c.
-double Reference(const Image &src, int filter, double angle, double sx, double sy, double dx, double dy, int i, int j) {
-    const double c = src.Width() / 2.0, a = angle * std::numbers::pi / 180;
-    const double ox = i + 0.5 - c - dx, oy = j + 0.5 - c - dy;
-    const double u = (std::cos(a) * ox + std::sin(a) * oy) / sx + c;
-    const double v = (-std::sin(a) * ox + std::cos(a) * oy) / sy + c;
-    // The footprint widens along a source axis where an output step moves more than a source pixel.
-    const double stx = std::max(1.0, std::hypot(std::cos(a) / sx, std::sin(a) / sx));
-    const double sty = std::max(1.0, std::hypot(std::sin(a) / sy, std::cos(a) / sy));
-    const double rx = RefRadius(filter) * stx, ry = RefRadius(filter) * sty;
-    double sum = 0, wsum = 0;
-    for (int l = static_cast<int>(std::floor(v - ry)) - 1; l <= v + ry + 1; ++l)
-        for (int k = static_cast<int>(std::floor(u - rx)) - 1; k <= u + rx + 1; ++k) {
-            const double w = RefFilter(filter, RszWindowHanning, (k + 0.5 - u) / stx) *
-                             RefFilter(filter, RszWindowHanning, (l + 0.5 - v) / sty);
-            wsum += w;
-            sum += w * src.GetFlt(k, l).R; // canvas outside the data window; a mask reads alpha
-        }
-    return sum / wsum;
-}
-
-TEST(TransformMatrix, FilteredSamplesFollowTheFilterFormulaAtEveryDepth) {
     // An impulse turned and enlarged, a noisy image turned and shrunk, also at other depths (the reference reads
     // what the source holds, the output is within half a step of its grid).
     Ref<Image> impulse = Filled(24, 24, 8, [](int x, int y) {
@@ -197,7 +194,7 @@ TEST(TransformMatrix, FilteredSamplesFollowTheFilterFormulaAtEveryDepth) {
     Ref<Image> noise = PatternImage(40, 40);
     auto at = [&](int depth) { return noise->CopyOfImageTagList({{ImgDepth, depth}}); };
     Ref<Image> noise8 = at(DepthRGBAInt8), mask = at(DepthAInt16), half = at(DepthAFlt16);
-    const std::tuple<Image *, int, double, double, double, double, double> cases[] = {
+    const std::tuple<Image *, int, double, double, double, double, double> samples[] = {
         {impulse.Get(), RszCatmullRom, 30, 1.4, 1.4, 0.7, -0.3},
         {impulse.Get(), RszCubic, -12, 1.1, 2.0, 0, 0},
         {impulse.Get(), RszLanczos, 75, 1.25, 1.25, 1.5, 0.25},
@@ -207,7 +204,7 @@ TEST(TransformMatrix, FilteredSamplesFollowTheFilterFormulaAtEveryDepth) {
         {noise8.Get(), RszMitchell, 21, 0.8, 1.3, 0, 0},
         {mask.Get(), RszLanczos, -33, 1.2, 0.9, 0, 0.5},
         {half.Get(), RszMitchell, 21, 0.8, 1.3, 0, 0}};
-    for (const auto &[src, filter, angle, sx, sy, dx, dy] : cases) {
+    for (const auto &[src, filter, angle, sx, sy, dx, dy] : samples) {
         const double W = src->Width();
         const TagList tags = With(Geometry(angle, sx, sy, 0.5 + dx / W, 0.5 + dy / W), {{XfFilter, filter}});
         Ref<Image> out = Transformed(src, tags);
@@ -266,7 +263,7 @@ TEST(TransformMatrix, AnInverseUndoesATransformAndEdgeModesFoldAtTheBorder) {
     }
 }
 
-TEST(TransformMatrix, DomainsCoverWhatTheSourceReachesEqualityAndHashFollowTheSampling) {
+TEST(TransformMatrix, DomainsCoverEveryPixelTheSourceReaches) {
     const ImgRectI dw(3, 2, 17, 12);
     Ref<Image> src = Filled(20, 16, 8, Constant({1, 1, 1, 1}), &dw);
     // Half a pixel right with the tent reaches exactly one more column; rows stay.
@@ -299,7 +296,7 @@ TEST(TransformMatrix, DomainsCoverWhatTheSourceReachesEqualityAndHashFollowTheSa
     EXPECT_EQ(TransformedWindow(endless, Matrix3::Rotate(10), {RszLinear}), ImgRectI(-E, -E, E, E));
 }
 
-TEST(TransformMatrix, PreCalculationGivesWindowsWithoutPixelsAbortsAndSingularSizesNone) {
+TEST(TransformMatrix, PreCalculationAbortsAndSingularSizesGiveNoPixelsEqualityAndHashFollowTheSampling) {
     Ref<Image> shape = NewImageTagList({{ImgWidth, 64}, {ImgHeight, 32}, {ImgNoData, 1}});
     const long before = TransformMatrix::ResampleCount();
     auto tm = MakeRef<TransformMatrix>(shape.Get());

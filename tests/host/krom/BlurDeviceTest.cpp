@@ -57,7 +57,7 @@ TEST(DeviceBlur, EveryFiniteKindAndDepthMatchesTheRows) {
     }
 }
 
-TEST(DeviceBlur, RecursiveKindsInPlaceWorkAndNoDeviceStayOnTheRows) {
+TEST(DeviceBlur, RecursiveKindsInPlaceWorkAndNoDeviceStayOnTheRowsDeviceImagesStayThere) {
     ORVANE_NEED_OPENCL(ctx);
     Ref<Image> src = Source(DepthRGBAFlt32, ImgRectI(0, 0, 57, 41));
     DeviceRender render(ctx), bare(nullptr);
@@ -79,21 +79,17 @@ TEST(DeviceBlur, RecursiveKindsInPlaceWorkAndNoDeviceStayOnTheRows) {
     EXPECT_FALSE(fallback->IsGPUMemDirty());
     EXPECT_TRUE(SameBits(*fallback, *expected));
     EXPECT_EQ(ctx->LaunchCount(), launches);
-}
-
-TEST(DeviceBlur, AnImageMadeOnTheDeviceIsBlurredThere) {
     // The source's pixels live on the device only: the kernels read them there, and match the rows' blur.
-    ORVANE_NEED_OPENCL(ctx);
-    const ImgRectI window(0, 0, 57, 41);
-    Ref<Image> src = Source(DepthRGBAFlt32, window);
-    DeviceRender render(ctx);
+    const ImgRectI frame(0, 0, 57, 41);
+    Ref<Image> made = Source(DepthRGBAFlt32, frame);
+    DeviceRender onCtx(ctx);
     const TagList second{{BlurFilterType, BlurGaussian}, {BlurYSize, 5.0 / 57}};
-    Ref<Image> onDevice = src->BlurOfImageTagList(render.On({{BlurFilterType, BlurBox}, {BlurXSize, 2.0 / 57}}));
+    Ref<Image> onDevice = made->BlurOfImageTagList(onCtx.On({{BlurFilterType, BlurBox}, {BlurXSize, 2.0 / 57}}));
     ASSERT_TRUE(onDevice && onDevice->IsGPUMemDirty());
-    Ref<Image> twice = onDevice->BlurOfImageTagList(render.On(second));
+    Ref<Image> twice = onDevice->BlurOfImageTagList(onCtx.On(second));
     ASSERT_TRUE(twice && twice->IsGPUMemDirty());
     ASSERT_TRUE(twice->DownloadGPUMem() && onDevice->DownloadGPUMem());
-    EXPECT_LT(MaxDiff(*twice, *onDevice->BlurOfImageTagList(second), window), 1e-5);
+    EXPECT_LT(MaxDiff(*twice, *onDevice->BlurOfImageTagList(second), frame), 1e-5);
 }
 
 } // namespace

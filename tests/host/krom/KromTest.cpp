@@ -191,7 +191,7 @@ TEST(DeviceImages, UploadIsKeptResultsAreStaleUntilDownloadedAndLocksKeepAWriter
     mem->ReleaseShareLock();
 }
 
-TEST(KernelCaches, CompileOnceAndReuseBinariesFromDiskAndTheDeviceThreadQueuesInOrder) {
+TEST(KernelCaches, CompileOnceReuseBinariesTheDeviceThreadQueuesInOrderAndTheMatrixKernelGivesTheRowsBits) {
     ORVANE_NEED_OPENCL(ctx);
     const int before = ctx->CompileCount();
     std::string log;
@@ -238,22 +238,19 @@ TEST(KernelCaches, CompileOnceAndReuseBinariesFromDiskAndTheDeviceThreadQueuesIn
     EXPECT_EQ(order, (std::vector<int>{0, 1, 2, 3, 4}));
     EXPECT_NE(std::make_unique<RenderTask>()->ID(), task.ID());
     EXPECT_EQ(RenderTask::Find(task.ID()), &task); // after the other is gone
-}
-
-TEST(DeviceMatrix, ApplyMatrixOnTheDeviceGivesTheRowsBits) {
-    ORVANE_NEED_OPENCL(ctx);
-    Ref<Image> src = PatternImage(41, 23, DepthRGBAFlt32, 7);
-    src->SetCanvasColor(FltPixel{0.1f, 0.2f, 0.3f, 0.5f});
+    // The matrix kernel gives the rows' bits.
+    Ref<Image> pattern = PatternImage(41, 23, DepthRGBAFlt32, 7);
+    pattern->SetCanvasColor(FltPixel{0.1f, 0.2f, 0.3f, 0.5f});
     ColorMatrixFull m;
     m.Scale(0, 1.3).Offset(1, -0.07).Scale(2, 0.6).Offset(3, 0.02);
     m.m[0][1] = 0.25, m.m[2][0] = -0.125, m.m[3][2] = 0.3;
     const ImgRectI wider(-5, -3, 47, 30); // beyond the source on every side: canvas there
     for (int depth : {DepthRGBAFlt32, DepthRGBAInt16, DepthAFlt32}) {
         Ref<Image> cpu = Blank(41, 23, depth, &wider), dev = Blank(41, 23, depth, &wider);
-        ASSERT_TRUE(ApplyMatrixTagList(src.Get(), cpu.Get(), {{MtxColorMatrixFull, &m}}));
+        ASSERT_TRUE(ApplyMatrixTagList(pattern.Get(), cpu.Get(), {{MtxColorMatrixFull, &m}}));
         DeviceRender render(ctx);
         const int launches = ctx->LaunchCount();
-        ASSERT_TRUE(ApplyMatrixTagList(src.Get(), dev.Get(), render.On({{MtxColorMatrixFull, &m}})));
+        ASSERT_TRUE(ApplyMatrixTagList(pattern.Get(), dev.Get(), render.On({{MtxColorMatrixFull, &m}})));
         EXPECT_EQ(ctx->LaunchCount(), launches + 1) << "the device ran it";
         ASSERT_TRUE(dev->IsGPUMemDirty() && dev->DownloadGPUMem());
         EXPECT_EQ(dev->GetCanvasColor(), cpu->GetCanvasColor());
