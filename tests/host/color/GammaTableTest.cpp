@@ -57,7 +57,7 @@ TEST(GammaTable, FloatCurveMatchesPowOverDenseSweepAndRises) {
     }
 }
 
-TEST(GammaTable, FloatCurveOutsideZeroToOne) {
+TEST(GammaTable, FloatCurveOutsideZeroToOneAndExponentOneIsExactIdentity) {
     GammaTable t, neg;
     t.InitTableFlt(nullptr, 1.0, 2.2);
     neg.InitTableFlt(nullptr, -2.0, 2.0);
@@ -73,18 +73,17 @@ TEST(GammaTable, FloatCurveOutsideZeroToOne) {
     }
     EXPECT_NEAR(neg.LookupFlt(0.25f), -0.125, 1e-6);
     EXPECT_NEAR(neg.LookupFlt(3.0f), -18.0, 1e-5);
-}
-
-TEST(GammaTable, ExponentOneIsExactIdentity) {
-    GammaTable t, t16;
-    t.InitTableFlt(nullptr, 1.0, 1.0);
+    // Exponent one is the exact identity.
+    GammaTable identity, t16;
+    identity.InitTableFlt(nullptr, 1.0, 1.0);
     t16.InitTable(nullptr, 1.0);
-    for (int k = 0; k <= 1 << 24; ++k) ASSERT_EQ(t.LookupFlt(static_cast<float>(k) / (1 << 24)), k / 16777216.0f);
+    for (int k = 0; k <= 1 << 24; ++k)
+        ASSERT_EQ(identity.LookupFlt(static_cast<float>(k) / (1 << 24)), k / 16777216.0f);
     for (uint32_t bits = 0; bits < 0x7f800000u; bits += 8191) { // every float magnitude, 0 to FLT_MAX
         const float x = std::bit_cast<float>(bits);
-        ASSERT_EQ(t.LookupFlt(x), x) << bits;
+        ASSERT_EQ(identity.LookupFlt(x), x) << bits;
     }
-    EXPECT_EQ(t.LookupFlt(FLT_MAX), FLT_MAX);
+    EXPECT_EQ(identity.LookupFlt(FLT_MAX), FLT_MAX);
     for (int v = 0; v < 65536; ++v) ASSERT_EQ(t16.Lookup(static_cast<uint16_t>(v)), v);
 }
 

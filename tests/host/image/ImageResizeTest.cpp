@@ -245,7 +245,7 @@ TEST(ResizeTagList, OffsetsSourceWindowsDataWindowsCanvasAndDepths) {
     EXPECT_TRUE(!pre->HasScanLineData() && pre->GetCanvasColor() == source->GetCanvasColor());
 }
 
-TEST(ResizeTables, ReusedTablesGiveTheSameBitsThreadsAgreeAndAbortsRefuse) {
+TEST(ResizeTables, ReusedTablesGiveTheSameBitsThreadsAgreeAbortsRefuseAndScaleOfImageAverages) {
     Ref<Image> src = PatternAt(31, 17, DepthRGBAFlt16, 2);
     const ImgRectI part(3, 2, 40, 20), small(5, 5, 9, 9);
     const TagList request{{ResizeFilter, RszLanczos}, {ResizeXEdges, EdgeMirror}, {ResizeYEdges, EdgeCanvas}};
@@ -289,48 +289,47 @@ TEST(ResizeTables, ReusedTablesGiveTheSameBitsThreadsAgreeAndAbortsRefuse) {
     std::atomic<bool> stop{true};
     big->SetAbortFlag(&stop);
     EXPECT_FALSE(big->ResizeTagList(square.Get(), {}));
-}
-
-TEST(ScaleOfImage, AveragesBlocksScalesWindowsAndRefuses) {
+    // ScaleOfImage averages blocks and scales windows.
     const int w = 11, h = 7, fx = 3, fy = 2;
     for (int depth : {DepthAInt8, DepthRGBAInt8, DepthRGBAInt16, DepthRGBAFlt16, DepthRGBAFlt32}) {
-        Ref<Image> src = PatternAt(w, h, depth);
-        src->SetScale(1.0, 2.0);
-        Ref<Image> out = src->ScaleOfImage(nullptr, fx, fy);
+        Ref<Image> blocks = PatternAt(w, h, depth);
+        blocks->SetScale(1.0, 2.0);
+        Ref<Image> shrunk = blocks->ScaleOfImage(nullptr, fx, fy);
         // 11 / 3 and 7 / 2 rounded up; pixels three wide and two tall: the aspect 1:2 becomes 3:4.
-        ASSERT_TRUE(out && out->Width() == 4 && out->Height() == 4 && out->Depth() == depth) << depth;
-        EXPECT_DOUBLE_EQ(out->XScale() / out->YScale(), 3.0 / 4.0);
+        ASSERT_TRUE(shrunk && shrunk->Width() == 4 && shrunk->Height() == 4 && shrunk->Depth() == depth) << depth;
+        EXPECT_DOUBLE_EQ(shrunk->XScale() / shrunk->YScale(), 3.0 / 4.0);
         // The block, cut to the frame: the last column and row of blocks are partial.
-        EXPECT_TRUE(AllNear(*out, out->DataWindow(), Slack(depth), [&](int x, int y, int c) {
+        EXPECT_TRUE(AllNear(*shrunk, shrunk->DataWindow(), Slack(depth), [&](int x, int y, int c) {
             double sum = 0;
             int n = 0;
             for (int sy = y * fy; sy < std::min(h, (y + 1) * fy); ++sy)
-                for (int sx = x * fx; sx < std::min(w, (x + 1) * fx); ++sx, ++n) sum += Channel(src->GetFlt(sx, sy), c);
+                for (int sx = x * fx; sx < std::min(w, (x + 1) * fx); ++sx, ++n)
+                    sum += Channel(blocks->GetFlt(sx, sy), c);
             return sum / n;
         })) << depth;
     }
     // Windows round outward, canvas within the blocks, refusals.
     const ImgRectI dw(1, 1, 6, 4);
     const FltPixel canvas{0, 0, 0.5f, 0.5f};
-    Ref<Image> src = Filled(8, 6, DepthRGBAFlt32, Constant({1, 1, 1, 1}), &dw, canvas);
-    src->SetValidWindow(ImgRectI(2, 1, 5, 3));
-    Ref<Image> out = src->ScaleOfImage(nullptr, 2, 2);
-    ASSERT_TRUE(out && out->DataWindow() == ImgRectI(0, 0, 3, 2)); // rounded outward
-    EXPECT_TRUE(out->ValidWindow() == ImgRectI(1, 0, 3, 2) && out->GetCanvasColor() == canvas);
+    Ref<Image> blocks = Filled(8, 6, DepthRGBAFlt32, Constant({1, 1, 1, 1}), &dw, canvas);
+    blocks->SetValidWindow(ImgRectI(2, 1, 5, 3));
+    Ref<Image> shrunk = blocks->ScaleOfImage(nullptr, 2, 2);
+    ASSERT_TRUE(shrunk && shrunk->DataWindow() == ImgRectI(0, 0, 3, 2)); // rounded outward
+    EXPECT_TRUE(shrunk->ValidWindow() == ImgRectI(1, 0, 3, 2) && shrunk->GetCanvasColor() == canvas);
     // Block (0, 0) holds one window pixel and three canvas pixels; (1, 0) two and two; (1, 1) all inside.
-    EXPECT_FLOAT_EQ(out->GetFlt(0, 0).R, 0.25f);
-    EXPECT_FLOAT_EQ(out->GetFlt(0, 0).B, (1 + 3 * 0.5f) / 4);
-    EXPECT_FLOAT_EQ(out->GetFlt(1, 0).R, 0.5f);
-    EXPECT_FLOAT_EQ(out->GetFlt(1, 1).R, 1.f);
-    EXPECT_EQ(out->GetFlt(3, 0), canvas);
-    Ref<Image> same = src->ScaleOfImage(nullptr, 1, 1);
-    EXPECT_TRUE(same && MaxDiff(*same, *src, ImgRectI(0, 0, 8, 6)) == 0.0);
-    EXPECT_FALSE(src->ScaleOfImage(nullptr, 0.5, 1) || src->ScaleOfImage(nullptr, 2, NAN));
+    EXPECT_FLOAT_EQ(shrunk->GetFlt(0, 0).R, 0.25f);
+    EXPECT_FLOAT_EQ(shrunk->GetFlt(0, 0).B, (1 + 3 * 0.5f) / 4);
+    EXPECT_FLOAT_EQ(shrunk->GetFlt(1, 0).R, 0.5f);
+    EXPECT_FLOAT_EQ(shrunk->GetFlt(1, 1).R, 1.f);
+    EXPECT_EQ(shrunk->GetFlt(3, 0), canvas);
+    Ref<Image> unscaled = blocks->ScaleOfImage(nullptr, 1, 1);
+    EXPECT_TRUE(unscaled && MaxDiff(*unscaled, *blocks, ImgRectI(0, 0, 8, 6)) == 0.0);
+    EXPECT_FALSE(blocks->ScaleOfImage(nullptr, 0.5, 1) || blocks->ScaleOfImage(nullptr, 2, NAN));
     RenderTask task;
     Request req(nullptr, nullptr, 0.0, 0, &task);
-    EXPECT_TRUE(src->ScaleOfImage(&req, 2, 2));
+    EXPECT_TRUE(blocks->ScaleOfImage(&req, 2, 2));
     task.Abort();
-    EXPECT_FALSE(src->ScaleOfImage(&req, 2, 2));
+    EXPECT_FALSE(blocks->ScaleOfImage(&req, 2, 2));
 }
 
 } // namespace
