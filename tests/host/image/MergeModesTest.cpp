@@ -202,7 +202,7 @@ FltPixel BgAt(int x, int y) { return {0.9f - 0.03f * x, 0.1f + 0.02f * y, 0.5f, 
     return ::testing::AssertionFailure() << "got " << got << ", want " << want << " (depth " << depth << ")";
 }
 
-TEST(MergeImages, EveryDepthCanvasWindowAndOffsetFollowTheReference) {
+TEST(MergeImages, EveryDepthCanvasWindowAndOffsetFollowTheReferenceAndDataWindowsWhatCanDiffer) {
     // The foreground, placed 2 right and 1 down, left of the background, both with canvases: the result covers
     // both, its canvas is the canvases merged, each pixel the reference stored at the background's depth.
     const ImgRectI fw(-2, 1, 4, 13), bw(4, 2, 16, 10);
@@ -228,21 +228,19 @@ TEST(MergeImages, EveryDepthCanvasWindowAndOffsetFollowTheReference) {
                             << x << "," << y << " ch " << i;
                 }
         }
-}
-
-TEST(MergeImages, DataWindowsFollowWhatCanDifferAndTheCopiedBackgroundIsTheMerge) {
-    const ImgRectI fw(0, 0, 6, 6), bw(4, 4, 10, 10), both(0, 0, 10, 10);
+    // Data windows follow what can differ from the canvas.
+    const ImgRectI fgWin(0, 0, 6, 6), bgWin(4, 4, 10, 10), both(0, 0, 10, 10);
     const FltPixel clear{}, grey{0.5f, 0.5f, 0.5f, 1};
     const std::tuple<Controls, FltPixel, ImgRectI> cases[] = {
         {{}, clear, both},                               // over: the union
         {{.op = MrgIn}, clear, ImgRectI(4, 4, 6, 6)},    // both sides cut
-        {{.op = MrgIn}, grey, fw},                       // the background's canvas shows
-        {{.op = MrgAtop}, clear, bw},                    //
-        {{.op = MrgHeldOut}, clear, fw},                 //
+        {{.op = MrgIn}, grey, fgWin},                    // the background's canvas shows
+        {{.op = MrgAtop}, clear, bgWin},                 //
+        {{.op = MrgHeldOut}, clear, fgWin},              //
         {{.op = MrgHeldOut, .blend = 0.5}, clear, both}, // half the background stays everywhere
     };
     for (const auto &[ctl, bgCanvas, want] : cases)
-        EXPECT_EQ(MergeDataWindow(MergeSettings::FromTags(TagsOf(ctl)), fw, clear, bw, bgCanvas), want) << ctl.op;
+        EXPECT_EQ(MergeDataWindow(MergeSettings::FromTags(TagsOf(ctl)), fgWin, clear, bgWin, bgCanvas), want) << ctl.op;
     // What the rule cuts away really is the canvas: In over windows that do not meet leaves nothing.
     EXPECT_TRUE(MergeDataWindow(MergeSettings::FromTags(TagsOf({.op = MrgIn})), ImgRectI(0, 0, 3, 3), clear,
                                 ImgRectI(5, 5, 8, 8), clear)
