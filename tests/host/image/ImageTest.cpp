@@ -12,7 +12,6 @@ using namespace ::Orvane::Test;
 
 constexpr float NaNf = std::numeric_limits<float>::quiet_NaN(), Inff = std::numeric_limits<float>::infinity();
 
-// The spacing of halves around v.
 double HalfStep(double v) { return 2 * HalfCode(DepthRGBAFlt16, v); }
 
 bool AllZero(const uint8_t *p, size_t n) {
