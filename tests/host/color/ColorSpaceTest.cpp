@@ -1,11 +1,11 @@
-// RGB to and from HSV, HLS and CIE L*a*b* (D65): known colours both ways,
-// published Lab values of the primaries, round trips over a grid that holds
+// RGB to and from HSV, HLS and CIE L*a*b* (D65): known and published values, round trips over a grid with
 // out-of-range values, hue wrapping, and the colours a space cannot hold.
 #include "host/color/ColorSpace.h"
 
 #include <algorithm>
 #include <array>
 #include <cmath>
+#include <tuple>
 
 #include <gtest/gtest.h>
 
@@ -32,17 +32,10 @@ Triple Convert(bool toSpace, ColorSpaceType s, const Triple &in) {
 
 } // namespace
 
-TEST(ColorSpace, KnownColoursBothWays) {
+TEST(ColorSpace, KnownColoursBothWaysAndRoundTripsOverAGridAndInPlace) {
     const double cube = 116 * std::cbrt(0.18f) - 16; // L* of 18% grey
-    const struct {
-        bool toSpace;
-        ColorSpaceType space;
-        Triple in;
-        std::array<double, 3> want;
-        double tol;
-    } cases[] = {
-        // HSV: the six hues, orange at half brightness (a quarter of the way to yellow), greys with hue and saturation
-        // 0.
+    const std::tuple<bool, ColorSpaceType, Triple, std::array<double, 3>, double> cases[] = {
+        // HSV: the six hues, orange at half brightness (a quarter of the way to yellow), greys with hue 0.
         {true, HSV, {1, 0, 0}, {0, 1, 1}, 1e-6},
         {true, HSV, {1, 1, 0}, {1.0 / 6, 1, 1}, 1e-6},
         {true, HSV, {0, 1, 0}, {2.0 / 6, 1, 1}, 1e-6},
@@ -70,37 +63,28 @@ TEST(ColorSpace, KnownColoursBothWays) {
         {true, LAB, {0.18f, 0.18f, 0.18f}, {cube, 0, 0}, 1e-4},
         {true, LAB, {0.001f, 0.001f, 0.001f}, {24389.0 / 27 * 0.001f, 0, 0}, 1e-4},
         {true, LAB, {8, 8, 8}, {116 * 2 - 16, 0, 0}, 1e-3},
-        // Back to RGB; hues outside one turn wrap; RGB and unknown spaces copy.
-        {false, HSV, {1.0f / 6, 1, 1}, {1, 1, 0}, 1e-6},
-        {false, HSV, {0.5f, 0.5f, 0.8f}, {0.4, 0.8, 0.8}, 1e-6},
+        // Back to RGB (the round trips below hold the rest): hues outside one turn wrap; RGB and unknown spaces copy.
         {false, HSV, {1.0f, 1, 1}, {1, 0, 0}, 1e-6},
         {false, HSV, {1.25f, 1, 1}, {0.5, 1, 0}, 1e-6},
         {false, HSV, {-0.75f, 1, 1}, {0.5, 1, 0}, 1e-6},
-        {false, HLS, {2.0f / 3, 0.5f, 1}, {0, 0, 1}, 1e-6},
-        {false, HLS, {0, 0.75f, 1}, {1, 0.5, 0.5}, 1e-6},
         {false, HLS, {-2.0f / 3, 0.5f, 1}, {0, 1, 0}, 1e-6},
         {false, HLS, {1.0f, 0.5f, 1}, {1, 0, 0}, 1e-6},
         {false, HLS, {0, 1, 0}, {1, 1, 1}, 0},
-        {false, LAB, {100, 0, 0}, {1, 1, 1}, 1e-5},
-        {false, LAB, {0, 0, 0}, {0, 0, 0}, 1e-6},
         {true, RGB, {-1.5f, 0.25f, 7}, {-1.5, 0.25, 7}, 0},
         {false, RGB, {-1.5f, 0.25f, 7}, {-1.5, 0.25, 7}, 0},
         {true, static_cast<ColorSpaceType>(3), {0.1f, 0.2f, 0.3f}, {0.1f, 0.2f, 0.3f}, 0},
         {false, static_cast<ColorSpaceType>(42), {0.1f, 0.2f, 0.3f}, {0.1f, 0.2f, 0.3f}, 0},
     };
-    for (const auto &c : cases)
-        EXPECT_TRUE(Near(Convert(c.toSpace, c.space, c.in), c.want, c.tol))
-            << (c.toSpace ? "to" : "from") << " space " << static_cast<int>(c.space) << ": " << c.in[0] << " "
-            << c.in[1] << " " << c.in[2];
+    for (const auto &[toSpace, space, in, want, tol] : cases)
+        EXPECT_TRUE(Near(Convert(toSpace, space, in), want, tol))
+            << (toSpace ? "to" : "from") << " space " << static_cast<int>(space) << ": " << in[0] << " " << in[1] << " "
+            << in[2];
     // Just short of red through magenta the hue is a hair under 1, not 1.
     for (ColorSpaceType s : {HSV, HLS}) {
         const Triple h = Convert(true, s, {1.0f, 0.0f, 1e-9f});
         EXPECT_TRUE(h[0] >= 0.0f && h[0] < 1.0f) << h[0];
         EXPECT_TRUE(Near(Convert(false, s, h), {1, 0, 0}, 1e-6));
     }
-}
-
-TEST(ColorSpace, RoundTripsOverGridAndInPlace) {
     // Greys where all three match, primaries and secondaries at 0 and 1, and
     // negatives and values over 1 for out-of-range pixels.
     const float grid[] = {-0.5f, -0.1f, 0.0f, 0.05f, 0.18f, 0.5f, 0.75f, 1.0f, 1.25f, 2.5f};

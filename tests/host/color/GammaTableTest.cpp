@@ -1,10 +1,11 @@
+// Gamma tables against std::pow in double over dense sweeps, integer closed forms, degenerate exponents.
 #include "host/color/GammaTable.h"
 
 #include <bit>
 #include <cfloat>
 #include <cmath>
-#include <cstdint>
 #include <limits>
+#include <tuple>
 #include <vector>
 
 #include <gtest/gtest.h>
@@ -13,9 +14,7 @@ using namespace Orvane;
 
 namespace {
 
-// Inputs in [0, 1] for the sweeps: a uniform grid 64 points to a table step,
-// and float bit patterns from the smallest subnormal up to 1 at a stride, so
-// tiny values, where the curve is computed directly, are covered too.
+// Inputs in [0, 1]: a grid of 64 points to a table step, and floats from the smallest subnormal to 1 at a stride.
 std::vector<float> GammaSweepInputs() {
     std::vector<float> xs;
     const int n = 1 << 18;
@@ -25,15 +24,14 @@ std::vector<float> GammaSweepInputs() {
     return xs;
 }
 
-// Stated accuracy on [0, 1]: the table tolerance times |scale|, plus a few
-// float roundings of the result.
+// Stated accuracy on [0, 1]: the table tolerance times |scale|, plus a few float roundings.
 double GammaTolerance(double scale, double expected) {
     return GammaTable::kFloatTolerance * std::fabs(scale) + 4 * FLT_EPSILON * std::fabs(expected);
 }
 
 } // namespace
 
-TEST(GammaTable, FloatCurveMatchesPowOverDenseSweep) {
+TEST(GammaTable, FloatCurveMatchesPowOverDenseSweepAndRises) {
     const std::vector<float> xs = GammaSweepInputs();
     for (double scale : {1.0, 2.5}) {
         for (double e : {0.1, 1 / 2.4, 1 / 2.2, 0.5, 1 / 1.8, 0.9, 1.5, 1.8, 2.2, 2.4, 3.0, 10.0, 100.0}) {
@@ -49,9 +47,6 @@ TEST(GammaTable, FloatCurveMatchesPowOverDenseSweep) {
             EXPECT_LE(worst, 0.0) << "exponent " << e << " scale " << scale << " at x = " << worstX;
         }
     }
-}
-
-TEST(GammaTable, FloatCurveIsMonotoneForIncreasingPowers) {
     for (double e : {0.1, 1 / 2.2, 2.2, 100.0, 1e5}) {
         GammaTable t;
         t.InitTableFlt(nullptr, 1.0, e);
@@ -62,16 +57,15 @@ TEST(GammaTable, FloatCurveIsMonotoneForIncreasingPowers) {
     }
 }
 
-TEST(GammaTable, FloatCurveOutsideZeroToOne) {
+TEST(GammaTable, FloatCurveOutsideZeroToOneAndExponentOneIsExactIdentity) {
     GammaTable t, neg;
     t.InitTableFlt(nullptr, 1.0, 2.2);
     neg.InitTableFlt(nullptr, -2.0, 2.0);
     // Below 0 and NaN read as 0; past the float range the result is held at the largest float.
     for (float x : {-0.5f, -1e30f, -std::numeric_limits<float>::infinity(), std::numeric_limits<float>::quiet_NaN()})
         EXPECT_EQ(t.LookupFlt(x), 0.0f) << x;
-    EXPECT_EQ(t.LookupFlt(1e30f), FLT_MAX);
-    EXPECT_EQ(t.LookupFlt(std::numeric_limits<float>::infinity()), FLT_MAX);
-    EXPECT_EQ(neg.LookupFlt(1e30f), -FLT_MAX);
+    EXPECT_TRUE(t.LookupFlt(1e30f) == FLT_MAX && t.LookupFlt(std::numeric_limits<float>::infinity()) == FLT_MAX &&
+                neg.LookupFlt(1e30f) == -FLT_MAX);
     // Above 1 the true power, scale included.
     for (float x : {1.0000001f, 1.5f, 2.0f, 16.0f, 1000.0f}) {
         const double expected = std::pow(static_cast<double>(x), 2.2);
@@ -79,44 +73,37 @@ TEST(GammaTable, FloatCurveOutsideZeroToOne) {
     }
     EXPECT_NEAR(neg.LookupFlt(0.25f), -0.125, 1e-6);
     EXPECT_NEAR(neg.LookupFlt(3.0f), -18.0, 1e-5);
-}
-
-TEST(GammaTable, ExponentOneIsExactIdentity) {
-    GammaTable t, t16;
-    t.InitTableFlt(nullptr, 1.0, 1.0);
+    // Exponent one is the exact identity.
+    GammaTable identity, t16;
+    identity.InitTableFlt(nullptr, 1.0, 1.0);
     t16.InitTable(nullptr, 1.0);
-    for (int k = 0; k <= 1 << 24; ++k) ASSERT_EQ(t.LookupFlt(static_cast<float>(k) / (1 << 24)), k / 16777216.0f);
+    for (int k = 0; k <= 1 << 24; ++k)
+        ASSERT_EQ(identity.LookupFlt(static_cast<float>(k) / (1 << 24)), k / 16777216.0f);
     for (uint32_t bits = 0; bits < 0x7f800000u; bits += 8191) { // every float magnitude, 0 to FLT_MAX
         const float x = std::bit_cast<float>(bits);
-        ASSERT_EQ(t.LookupFlt(x), x) << bits;
+        ASSERT_EQ(identity.LookupFlt(x), x) << bits;
     }
-    EXPECT_EQ(t.LookupFlt(FLT_MAX), FLT_MAX);
+    EXPECT_EQ(identity.LookupFlt(FLT_MAX), FLT_MAX);
     for (int v = 0; v < 65536; ++v) ASSERT_EQ(t16.Lookup(static_cast<uint16_t>(v)), v);
 }
 
-TEST(GammaTable, DegenerateExponentsAndTablesNotYetBuilt) {
+TEST(GammaTable, DegenerateExponentsTablesNotYetBuiltSixteenBitClosedFormsAndRebuilding) {
     const double inf = std::numeric_limits<double>::infinity(), nan = std::nan("");
-    // Exponent 0 is 1 everywhere (0^0 = 1, below 0 read as 0); a negative
-    // one is taken as 0, NaN as 1; a huge one is 0 below 1 and 1 at 1.
-    const struct {
-        double scale, exponent;
-        float x, want;
-    } floats[] = {{3, 0, 0, 3},   {3, 0, 1e-30f, 3}, {3, 0, 7, 3},         {3, 0, -1, 3},
-                  {1, -2, 0, 1},  {1, -2, 0.5f, 1},  {1, nan, 0.3f, 0.3f}, {1, nan, 5, 5},
-                  {1, 1e5, 1, 1}, {1, 1e5, 0, 0},    {1, inf, 1, 1},       {1, inf, 0.5f, 0}};
-    for (const auto &c : floats) {
+    // Exponent 0 is 1 everywhere (0^0 = 1); a negative one is taken as 0, NaN as 1; a huge one is 0 below 1.
+    const std::tuple<double, double, float, float> floats[] = {
+        {3, 0, 0, 3},         {3, 0, 1e-30f, 3}, {3, 0, 7, 3},   {3, 0, -1, 3},  {1, -2, 0, 1},  {1, -2, 0.5f, 1},
+        {1, nan, 0.3f, 0.3f}, {1, nan, 5, 5},    {1, 1e5, 1, 1}, {1, 1e5, 0, 0}, {1, inf, 1, 1}, {1, inf, 0.5f, 0}};
+    for (const auto &[scale, exponent, x, want] : floats) {
         GammaTable t;
-        t.InitTableFlt(nullptr, c.scale, c.exponent);
-        EXPECT_EQ(t.LookupFlt(c.x), c.want) << "exponent " << c.exponent << " at " << c.x;
+        t.InitTableFlt(nullptr, scale, exponent);
+        EXPECT_EQ(t.LookupFlt(x), want) << "exponent " << exponent << " at " << x;
     }
-    const struct {
-        double exponent;
-        uint16_t v, want;
-    } shorts[] = {{0, 0, 65535}, {0, 32768, 65535}, {-2, 0, 65535}, {nan, 12345, 12345}, {1e5, 65535, 65535}};
-    for (const auto &c : shorts) {
+    const std::tuple<double, uint16_t, uint16_t> shorts[] = {
+        {0, 0, 65535}, {0, 32768, 65535}, {-2, 0, 65535}, {nan, 12345, 12345}, {1e5, 65535, 65535}};
+    for (const auto &[exponent, v, want] : shorts) {
         GammaTable t;
-        t.InitTable(nullptr, c.exponent);
-        EXPECT_EQ(t.Lookup(c.v), c.want) << "exponent " << c.exponent << " at " << c.v;
+        t.InitTable(nullptr, exponent);
+        EXPECT_EQ(t.Lookup(v), want) << "exponent " << exponent << " at " << v;
     }
     for (double e : {1e5, inf}) {
         GammaTable t, t16;
@@ -136,16 +123,10 @@ TEST(GammaTable, DegenerateExponentsAndTablesNotYetBuilt) {
     EXPECT_EQ(t.LookupFlt(std::nextafter(1.0f, 2.0f)), static_cast<float>(std::pow(1.0 + 1.0 / (1 << 23), 1e5)));
     // Lookups before the matching Init are the identity (floats still read below 0 as 0).
     GammaTable fresh;
-    EXPECT_EQ(fresh.LookupFlt(0.375f), 0.375f);
-    EXPECT_EQ(fresh.LookupFlt(4.0f), 4.0f);
-    EXPECT_EQ(fresh.LookupFlt(-1.0f), 0.0f);
-    EXPECT_EQ(fresh.Lookup(4321), 4321);
-}
-
-TEST(GammaTable, SixteenBitMatchesIntegerClosedForms) {
-    // Exponent 2: round(v^2 / 65535), in integers (no ties: 65535 is odd).
-    // Exponent 1/2: round(sqrt(v * 65535)): r = floor(sqrt(n)), plus one when
-    // (r + 1/2)^2 <= n, i.e. 4r^2 + 4r + 1 <= 4n.
+    EXPECT_TRUE(fresh.LookupFlt(0.375f) == 0.375f && fresh.LookupFlt(4.0f) == 4.0f && fresh.LookupFlt(-1.0f) == 0.0f &&
+                fresh.Lookup(4321) == 4321);
+    // Exponent 2: round(v^2 / 65535) (no ties: 65535 is odd). Exponent 1/2: round(sqrt(v * 65535)), that is
+    // r = floor(sqrt(n)), plus one when (r + 1/2)^2 <= n, i.e. 4r^2 + 4r + 1 <= 4n.
     GammaTable sq, rt;
     sq.InitTable(nullptr, 2.0);
     rt.InitTable(nullptr, 0.5);
@@ -157,14 +138,11 @@ TEST(GammaTable, SixteenBitMatchesIntegerClosedForms) {
         while ((r + 1) * (r + 1) <= n) ++r;
         ASSERT_EQ(rt.Lookup(static_cast<uint16_t>(v)), r + (4 * r * r + 4 * r + 1 <= 4 * n ? 1 : 0)) << v;
     }
-}
-
-TEST(GammaTable, RebuildingReplacesTheCurve) {
-    GammaTable t;
-    t.InitTableFlt(nullptr, 1.0, 1e5); // table serves only part of [0, 1]
-    t.InitTableFlt(nullptr, 1.0, 0.5); // a different part
-    for (float x : {1e-6f, 0.001f, 0.3f, 0.999f, 1.0f}) EXPECT_NEAR(t.LookupFlt(x), std::sqrt(x), 2e-6) << x;
-    t.InitTable(nullptr, 2.0);
-    t.InitTable(nullptr, 1.0);
-    EXPECT_EQ(t.Lookup(30000), 30000);
+    GammaTable rebuilt;
+    rebuilt.InitTableFlt(nullptr, 1.0, 1e5); // table serves only part of [0, 1]
+    rebuilt.InitTableFlt(nullptr, 1.0, 0.5); // a different part
+    for (float x : {1e-6f, 0.001f, 0.3f, 0.999f, 1.0f}) EXPECT_NEAR(rebuilt.LookupFlt(x), std::sqrt(x), 2e-6) << x;
+    rebuilt.InitTable(nullptr, 2.0);
+    rebuilt.InitTable(nullptr, 1.0);
+    EXPECT_EQ(rebuilt.Lookup(30000), 30000);
 }

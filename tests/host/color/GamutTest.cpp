@@ -5,6 +5,7 @@
 #include <gtest/gtest.h>
 
 #include <cmath>
+#include <tuple>
 #include <vector>
 
 namespace Orvane::gamuttest {
@@ -20,27 +21,21 @@ GamutCurve Curve(GamutSpace s, double gamma = 2.2, double soft = 0.0) {
     return c;
 }
 
-TEST(Gamut, KnownValuesAndTheCineonCodePoints) {
+TEST(Gamut, KnownValuesPiecesMeetCurvesRiseMirrorAndRoundTripAndRowsMatchTheScalars) {
     const CineonLogParams log;
     CineonLogParams full;
     full.black = 0, full.white = 1023, full.filmGamma = 1.0;
     // Each 0.002 x 300 / 0.6 = 1 decade below white: linear 0.1 plus the black offset's share.
     const double offset = std::pow(10.0, -590 * 0.002 / 0.6);
-    const struct {
-        const char *what;
-        double got, want, tol;
-    } cases[] = {
+    const std::tuple<const char *, double, double, double> cases[] = {
         {"sRGB 0.5", SRGBToLinear(0.5), 0.214041, 1e-6},
-        {"sRGB back", LinearToSRGB(0.214041), 0.5, 1e-6},
         {"sRGB linear part", SRGBToLinear(0.04045), 0.04045 / 12.92, 1e-12},
         {"sRGB white", SRGBToLinear(1.0), 1.0, 0},
         // BT.709: 4.5 L near black; above, 1.099 L^0.45 - 0.099 (to the rounding of those constants).
         {"709 near black", LinearToRec709(0.01), 0.045, 1e-12},
         {"709 grey", LinearToRec709(0.18), 1.099 * std::pow(0.18, 0.45) - 0.099, 3e-4},
-        {"709 back", Rec709ToLinear(0.5), std::pow((0.5 + 0.099) / 1.099, 1 / 0.45), 3e-4},
         {"709 white", Rec709ToLinear(1.0), 1.0, 1e-12},
         {"gamma", GammaToLinear(0.5, 2.2), std::pow(0.5, 2.2), 1e-12},
-        {"gamma back", LinearToGamma(0.25, 2.0), 0.5, 1e-12},
         {"Cineon white 685", CineonToLinear(685.0 / 1023, log), 1.0, 1e-12},
         {"Cineon black 95", CineonToLinear(95.0 / 1023, log), 0.0, 1e-12},
         {"Cineon a decade down", CineonToLinear(385.0 / 1023, log), (0.1 - offset) / (1 - offset), 1e-12},
@@ -49,12 +44,8 @@ TEST(Gamut, KnownValuesAndTheCineonCodePoints) {
         {"full range white", CineonToLinear(1.0, full), 1.0, 1e-12},
         {"full range black", CineonToLinear(0.0, full), 0.0, 1e-12},
     };
-    for (const auto &c : cases) EXPECT_NEAR(c.got, c.want, c.tol) << c.what;
-}
-
-TEST(Gamut, PiecesMeetAndCurvesRiseAndMirror) {
+    for (const auto &[what, got, want, tol] : cases) EXPECT_NEAR(got, want, tol) << what;
     const double eps = 1e-9, h = 1e-5, black = 95.0 / 1023;
-    const CineonLogParams log;
     // Where the pieces meet, the two sides agree, and so do their slopes at the Cineon black.
     EXPECT_NEAR(LinearToRec709(0.018053968510807 - eps), LinearToRec709(0.018053968510807 + eps), 1e-7);
     EXPECT_NEAR(LinearToSRGB(0.0031308 - eps), LinearToSRGB(0.0031308 + eps), 1e-6);
@@ -84,9 +75,7 @@ TEST(Gamut, PiecesMeetAndCurvesRiseAndMirror) {
     EXPECT_LT(GamutToLinear(soft, 1.0), 1.0);
     EXPECT_LT(GamutToLinear(soft, 650.0 / 1023), CineonToLinear(650.0 / 1023, log));
     EXPECT_EQ(GamutToLinear(soft, 500.0 / 1023), CineonToLinear(500.0 / 1023, log));
-}
-
-TEST(Gamut, PairsRoundTrip) {
+    // Pairs round trip.
     for (GamutSpace s : kCurves)
         for (double gamma : {0.45, 2.2})
             for (double soft : {0.0, 40.0}) {
@@ -99,14 +88,10 @@ TEST(Gamut, PairsRoundTrip) {
                     ASSERT_NEAR(GamutFromLinear(c, GamutToLinear(c, v)), v, tol) << static_cast<int>(s) << " " << soft;
                 }
             }
-    EXPECT_TRUE(Curve(GamutSpace::NoChange).IsIdentity());
-    EXPECT_TRUE(Curve(GamutSpace::Linear).IsIdentity());
+    EXPECT_TRUE(Curve(GamutSpace::NoChange).IsIdentity() && Curve(GamutSpace::Linear).IsIdentity() &&
+                Curve(GamutSpace::Gamma, 1.0).IsIdentity() && !Curve(GamutSpace::SRGB).IsIdentity());
     EXPECT_EQ(GamutToLinear(Curve(GamutSpace::Linear), 0.37), 0.37);
-    EXPECT_TRUE(Curve(GamutSpace::Gamma, 1.0).IsIdentity());
-    EXPECT_FALSE(Curve(GamutSpace::SRGB).IsIdentity());
-}
-
-TEST(Gamut, RowsMatchTheScalarsAndLeaveAlpha) {
+    // Rows give the scalars and leave alpha.
     for (GamutSpace s : kCurves) {
         const GamutCurve c = Curve(s, 1.8);
         std::vector<float> px;

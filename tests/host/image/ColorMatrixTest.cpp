@@ -1,7 +1,5 @@
-// Colour matrices against the arithmetic written out here in double: steps
-// composed in order, determinants of closed forms and the product rule,
-// inverses and singular matrices, the 4 x 4 cut; then ApplyMatrixTagList over
-// every pair of depths, windows and canvases, in place, on threads or not.
+// Colour matrices against arithmetic written out here in double; ApplyMatrixTagList over every pair of depths,
+// windows and canvases, in place, on threads or not.
 #include "host/image/ColorMatrix.h"
 
 #include "host/core/Parallel.h"
@@ -57,7 +55,7 @@ ColorMatrixFull FromRows(const Mat5 rows) {
     return m;
 }
 
-TEST(ColorMatrixCompose, ThenScaleOffsetApplyInStepOrder) {
+TEST(ColorMatrixFull, ComposesInStepOrderDeterminantsInversesAndTheCut) {
     Rng rng{1};
     for (int trial = 0; trial < 200; ++trial) {
         const ColorMatrixFull a = RandomMatrix(rng), b = RandomMatrix(rng), c = RandomMatrix(rng);
@@ -80,15 +78,10 @@ TEST(ColorMatrixCompose, ThenScaleOffsetApplyInStepOrder) {
         for (int j = 0; j < 5; ++j) ASSERT_EQ(composed.m[4][j], j == 4 ? 1.0 : 0.0); // still affine
     }
     ColorMatrixFull id;
-    EXPECT_TRUE(id.IsIdentity());
-    EXPECT_FALSE(id.Scale(0, 2.0).IsIdentity());
+    EXPECT_TRUE(id.IsIdentity() && !id.Scale(0, 2.0).IsIdentity());
     id.SetIdentity();
     EXPECT_EQ(id.Apply({0.25f, -1.0f, 3.0f, 0.5f}), (FltPixel{0.25f, -1.0f, 3.0f, 0.5f}));
-}
-
-TEST(ColorMatrixDeterminant, ClosedFormsAndTheProductRule) {
-    // Diagonal, upper triangular, a swap of red and green, a three-cycle, a
-    // scaled swap, equal rows, a zero column, a 2 x 2 block.
+    // Diagonal, triangular, a swap, a three-cycle, a scaled swap, equal rows, a zero column, a 2 x 2 block.
     const struct {
         Mat5 m;
         double det;
@@ -105,7 +98,7 @@ TEST(ColorMatrixDeterminant, ClosedFormsAndTheProductRule) {
     };
     for (const auto &c : cases) EXPECT_NEAR(FromRows(c.m).Determinant(), c.det, 1e-12) << &c - cases;
     // det(A B) = det(A) det(B), through Then and Scale.
-    Rng rng{5};
+    rng = Rng{5};
     for (int i = 0; i < 100; ++i) {
         const ColorMatrixFull a = RandomMatrix(rng), b = RandomMatrix(rng);
         ColorMatrixFull ab = a, scaled = a;
@@ -114,10 +107,8 @@ TEST(ColorMatrixDeterminant, ClosedFormsAndTheProductRule) {
         EXPECT_NEAR(ab.Determinant(), a.Determinant() * b.Determinant(), 1e-10 * (1 + std::fabs(ab.Determinant())));
         EXPECT_NEAR(scaled.Determinant(), -3.0 * a.Determinant(), 1e-10 * (1 + std::fabs(a.Determinant())));
     }
-}
-
-TEST(ColorMatrixInvert, InverseAndSingular) {
-    Rng rng{9};
+    // Inverses, and singular matrices refused.
+    rng = Rng{9};
     for (int trial = 0; trial < 200; ++trial) {
         const ColorMatrixFull a = RandomMatrix(rng, 0.4);
         ColorMatrixFull inv = a;
@@ -141,29 +132,20 @@ TEST(ColorMatrixInvert, InverseAndSingular) {
     }
     EXPECT_TRUE(tiny.Invert(1e-20)); // a looser threshold accepts it
     EXPECT_NEAR(tiny.m[0][0], 1e4, 1e-6);
-}
-
-TEST(ColorMatrixCut, KeepsAlpha) {
-    Rng rng{4};
+    // The 4 x 4 cut: colour as the full matrix without its alpha column, alpha unchanged.
+    rng = Rng{4};
     const ColorMatrixFull full = RandomMatrix(rng);
-    const int pick[4] = {0, 1, 2, 4};
     const ColorMatrix cut(full);
-    for (int i = 0; i < 4; ++i)
-        for (int j = 0; j < 4; ++j) EXPECT_EQ(cut.m[i][j], full.m[pick[i]][pick[j]]) << i << ", " << j;
-    // Colour as the full matrix with its alpha column taken out; alpha unchanged.
     ColorMatrixFull noAlpha = full;
     for (int i = 0; i < 4; ++i) noAlpha.m[i][3] = 0.0;
     const FltPixel p{0.3f, -0.2f, 1.25f, 0.6f}, out = cut.Apply(p);
     const D4 want = ApplyD(noAlpha, p);
     for (int i = 0; i < 3; ++i) EXPECT_NEAR(Channel(out, i), want[i], 1e-6) << i;
-    EXPECT_EQ(out.A, p.A);
-    EXPECT_EQ(ColorMatrix().Apply(p), p);
+    EXPECT_TRUE(out.A == p.A && ColorMatrix().Apply(p) == p);
 }
 
-// Checks dst against the matrix applied in double to what src holds (its
-// canvas outside its data window), and dst's canvas against src's canvas's.
-// The host works in float, so a value within float error of a rounding
-// boundary of dst's depth may land on either side.
+// Checks dst and its canvas against the matrix applied in double to what src holds. The host works in float:
+// a value within float error of a rounding boundary of dst's depth may land on either side.
 void CheckApplied(const ColorMatrixFull &m, const Image &src, const Image &dst) {
     const ImgRectI dw = dst.DataWindow();
     int bad = 0;
@@ -230,7 +212,7 @@ TEST(ApplyMatrix, EveryPairOfDepthsAndInPlace) {
     }
 }
 
-TEST(ApplyMatrix, ThreadedAndUnthreadedAgreeBitForBit) {
+TEST(ApplyMatrix, ThreadedAndUnthreadedAgreeBitForBitRefusalsNoDataAndAbort) {
     const int saved = WorkerCount();
     SetWorkerCount(4);
     Rng rng{3};
@@ -245,23 +227,18 @@ TEST(ApplyMatrix, ThreadedAndUnthreadedAgreeBitForBit) {
             EXPECT_TRUE(SameBits(*one, *many) && one->GetCanvasColor() == many->GetCanvasColor()) << sd << " to " << dd;
         }
     SetWorkerCount(saved);
-}
-
-TEST(ApplyMatrix, RefusalsNoDataAndAbort) {
+    // Refusals leave the destination alone; no data: the canvas only; an abort stops early.
     Ref<Image> src = PatternAt(4, 4, 8), dst = Blank(4, 4, 8);
-    const ColorMatrixFull m = TestMatrix();
-    EXPECT_FALSE(ApplyMatrixTagList(src.Get(), dst.Get(), {}));
-    EXPECT_FALSE(ApplyMatrixTagList(src.Get(), dst.Get(), {{WorkThreaded, 1}}));
-    EXPECT_FALSE(ApplyMatrixTagList(src.Get(), dst.Get(), {{MtxColorMatrixFull, nullptr}}));
+    for (const TagList &t : {TagList{}, TagList{{WorkThreaded, 1}}, TagList{{MtxColorMatrixFull, nullptr}}})
+        EXPECT_FALSE(ApplyMatrixTagList(src.Get(), dst.Get(), t));
     EXPECT_TRUE(!dst->HasScanLineData() && dst->IsCanvasColorClear()); // nothing done
-    EXPECT_FALSE(ApplyMatrixTagList(nullptr, dst.Get(), {{MtxColorMatrixFull, &m}}));
-    EXPECT_FALSE(ApplyMatrixTagList(src.Get(), nullptr, {{MtxColorMatrixFull, &m}}));
+    EXPECT_FALSE(ApplyMatrixTagList(nullptr, dst.Get(), {{MtxColorMatrixFull, &m}}) ||
+                 ApplyMatrixTagList(src.Get(), nullptr, {{MtxColorMatrixFull, &m}}));
     // A destination without pixels gets only the canvas.
     src->SetCanvasColor(FltPixel{1, 1, 1, 1});
     Ref<Image> noData = Blank(4, 4, 8);
     noData->SetNoData(true);
-    ASSERT_TRUE(ApplyMatrixTagList(src.Get(), noData.Get(), {{MtxColorMatrixFull, &m}}));
-    EXPECT_FALSE(noData->HasScanLineData());
+    ASSERT_TRUE(ApplyMatrixTagList(src.Get(), noData.Get(), {{MtxColorMatrixFull, &m}}) && !noData->HasScanLineData());
     EXPECT_NEAR(noData->GetCanvasColor().R, ApplyD(m, FltPixel{1, 1, 1, 1})[0], 1e-6);
     // An aborted render stops early but the call still succeeds.
     std::atomic<bool> abort{true};

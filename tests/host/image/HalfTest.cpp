@@ -1,6 +1,5 @@
-// Half conversions against the compiler's own binary16 type, whose
-// conversions round to nearest even in the compiler runtime's soft-float
-// routines: every half, every tie between neighbours, floats at a stride.
+// Half conversions against the compiler's binary16 type (round to nearest even in the runtime's soft-float
+// routines): every half, every tie between neighbours, floats at a stride.
 #include "host/image/Half.h"
 
 #include <bit>
@@ -27,7 +26,7 @@ bool IsHalfNaN(uint16_t h) { return (h & 0x7c00u) == 0x7c00u && (h & 0x3ffu) != 
                                          << ") gave 0x" << got << ", expected 0x" << want;
 }
 
-TEST(HalfConvert, EveryHalfWidensExactlyAndRoundTrips) {
+TEST(HalfConvert, EveryHalfRoundTripsEveryTieAndFloatsAtAStrideRoundAsTheCompiler) {
     int nanCount = 0;
     for (uint32_t i = 0; i < 0x10000u; ++i) {
         const uint16_t h = static_cast<uint16_t>(i);
@@ -42,35 +41,6 @@ TEST(HalfConvert, EveryHalfWidensExactlyAndRoundTrips) {
         ASSERT_EQ(FloatToHalf(f), h) << std::hex << "half 0x" << i;
     }
     EXPECT_EQ(nanCount, 2 * 1023);
-}
-
-TEST(HalfConvert, BoundaryCases) {
-    // The table holds the reference to account as well.
-    const float min = std::ldexp(1.0f, -24); // the smallest subnormal half
-    const struct {
-        const char *what;
-        float in;
-        uint16_t out;
-    } cases[] = {
-        {"negative zero", -0.0f, 0x8000},
-        {"minus smallest subnormal", -min, 0x8001},
-        {"half the smallest subnormal: tie to zero", min / 2, 0x0000},
-        {"just above half the smallest", std::nextafter(min / 2, 1.0f), 0x0001},
-        {"two and a half units: tie to two", 2.5f * min, 0x0002},
-        {"between largest subnormal and smallest normal", std::ldexp(1.0f, -14) - min / 2, 0x0400},
-        {"float min normal", std::numeric_limits<float>::min(), 0x0000},
-        {"1 + 2^-11: tie to even (down)", 1.0f + std::ldexp(1.0f, -11), 0x3c00},
-        {"1 + 3 * 2^-11: tie to even (up)", 1.0f + 3 * std::ldexp(1.0f, -11), 0x3c02},
-        {"1/3", 1.0f / 3.0f, 0x3555},
-        {"65519.99 rounds down to the max", 65519.99f, 0x7bff},
-        {"65520 rounds to infinity", 65520.0f, 0x7c00},
-        {"float max", std::numeric_limits<float>::max(), 0x7c00},
-        {"minus infinity", -std::numeric_limits<float>::infinity(), 0xfc00},
-    };
-    for (const auto &c : cases) EXPECT_TRUE(FloatToHalf(c.in) == c.out && RefToHalf(c.in) == c.out) << c.what;
-}
-
-TEST(HalfConvert, EveryTieBetweenNeighboursAndFloatsAtAStride) {
     // For every pair of neighbouring finite halves: the midpoint (a tie) and
     // the floats just beside it, both signs.
     for (uint32_t h = 0; h < 0x7c00u; ++h) {

@@ -1,13 +1,12 @@
-// Image::ImageCrop (moved and subsampled copies, canvas beyond the source,
-// depth conversion, aborts) and the point samplers SamplePixelB/W/D
-// (exact at pixel centres, bilinear between them, worked out here by hand).
+// ImageCrop (moved and subsampled copies, canvas beyond, depths, aborts) and the point samplers (exact at
+// centres, bilinear between them, worked out here by hand).
 #include "tests/host/image/ImageTestSupport.h"
 
 namespace Orvane::imgcroptest {
 namespace {
 using namespace ::Orvane::Test;
 
-TEST(ImageCrop, MovesThePictureAndFillsTheRestWithCanvas) {
+TEST(ImageCrop, MovesCopiesAndSubsamplesAndSamplesAreExactAtCentresBilinearBetween) {
     const ImgRectI sw(2, 1, 14, 10), dw(-3, -2, 12, 11); // the output reaches beyond the moved source
     for (int sd : {DepthAInt8, DepthRGBAInt16, DepthRGBAFlt16, DepthRGBAFlt32})
         for (int dd : {DepthAFlt32, DepthRGBAInt8, DepthRGBAFlt32}) {
@@ -20,9 +19,7 @@ TEST(ImageCrop, MovesThePictureAndFillsTheRestWithCanvas) {
                 dst->IsMask() ? 3 : 0))
                 << sd << " -> " << dd;
         }
-}
-
-TEST(ImageCrop, SameDepthCopiesBytesStepsSubsampleAndRefusals) {
+    // Same depth: bytes copied; steps subsample; refusals.
     Ref<Image> src = PatternAt(20, 14, DepthRGBAInt16, 5, nullptr, {0, 0, 0, 1}), dst = Blank(8, 6, DepthRGBAInt16);
     ASSERT_TRUE(src->ImageCrop(dst.Get(), 5, 3, {{WorkThreaded, 0}}));
     for (int j = 0; j < 6; ++j)
@@ -39,9 +36,7 @@ TEST(ImageCrop, SameDepthCopiesBytesStepsSubsampleAndRefusals) {
     Ref<Image> pre = Blank(8, 6, DepthRGBAFlt32);
     pre->SetNoData(true);
     EXPECT_TRUE(src->ImageCrop(pre.Get(), 1, 1, {}) && !pre->HasScanLineData());
-}
-
-TEST(SamplePixel, ExactAtCentresBilinearBetweenCanvasOutside) {
+    // The point samplers: exact at centres, bilinear between, canvas outside.
     // Positions in 16.16 fixed point; pixel centres at (i << 16) + 32768.
     auto at = [](double v) { return static_cast<int32_t>(std::lround(v * 65536)); };
     FltPixel p;

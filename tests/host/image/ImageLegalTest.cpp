@@ -1,7 +1,5 @@
-// The broadcast-legal pass: colours whose luma or composite swing leave the
-// limits are found, painted or brought back; legal colours are left alone.
-// Luma, chroma amplitude and the limits are worked out here from the signal
-// definitions (IRE levels, setup), not taken from the code.
+// The broadcast-legal pass against luma, chroma amplitude and limits worked out here from the signal
+// definitions (IRE levels, setup): illegal colours found, painted or brought back, legal ones left alone.
 #include "tests/host/image/ImageTestSupport.h"
 
 namespace Orvane::imglegaltest {
@@ -21,8 +19,7 @@ Swing SwingOf(double r, double g, double b) {
     return {y, std::hypot(u, v)};
 }
 
-/// Whether the colour stays within the composite limits, in units of the
-/// picture (0 black, 1 white) before setup, and its luma within 0..1.
+/// Whether the colour's composite swing stays within the limits (0 black, 1 white, before setup), luma in 0..1.
 bool Legal(int type, int adjust, double r, double g, double b, double tol = 1e-4) {
     const double setup = type == NTSC ? 0.075 : 0.0;
     const double sigLo = type == PAL ? -1.0 / 3 : -0.20, sigHi = type == PAL ? 4.0 / 3 : 1.20; // IRE / 100
@@ -56,7 +53,7 @@ Ref<Image> Strip(int depth) {
     return Filled(static_cast<int>(std::size(kColors)), 2, depth, colour);
 }
 
-TEST(ImageLegal, KnownColoursAreJudgedAsTheLimitsSay) {
+TEST(ImageLegal, KnownColoursAreJudgedAsTheLimitsSayAndAdjustedKeepingHueAndLuma) {
     // A few verdicts stated outright, so that the limits cannot drift together with the check.
     // 100% yellow reaches 133 IRE, PAL passes 100% bars, red dips to -33.
     EXPECT_TRUE(!Legal(NTSC, 0, 1, 1, 0) && Legal(PAL, 0, 1, 1, 0) && !Legal(PAL, 1, 1, 1, 0));
@@ -84,9 +81,7 @@ TEST(ImageLegal, KnownColoursAreJudgedAsTheLimitsSay) {
     Ref<Image> mask = Filled(2, 2, DepthAFlt32, [](int, int) { return FltPixel{0, 0, 0, 1.5f}; });
     mask->ImageLegal(NTSC, Black, 0, 0.0);
     EXPECT_EQ(mask->GetFlt(1, 1).A, 1.5f);
-}
-
-TEST(ImageLegal, AdjustKeepsHueAndLumaAndEndsLegal) {
+    // Adjusting keeps hue and luma and ends legal.
     for (int type : {NTSC, NHK, PAL})
         for (int adjust : {0, 1})
             for (double soft : {0.0, 0.1, 0.4}) {

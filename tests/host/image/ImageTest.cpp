@@ -1,7 +1,5 @@
-// The image object: windows, rows and canvas, pixel access and runs of stored
-// pixels against values worked out here (nearest codes in double, halves by
-// the compiler's binary16), whole-image services, auxiliary planes and
-// NewImageTagList.
+// The image object: windows, rows, canvas, pixel access and runs against values worked out here (nearest codes
+// in double, halves by the compiler's binary16), whole-image services, auxiliary planes, NewImageTagList.
 #include "host/image/Image.h"
 
 #include <bit>
@@ -14,11 +12,7 @@ using namespace ::Orvane::Test;
 
 constexpr float NaNf = std::numeric_limits<float>::quiet_NaN(), Inff = std::numeric_limits<float>::infinity();
 
-// The spacing of halves around v (subnormal spacing at and near zero).
-double HalfStep(double v) {
-    if (std::fabs(v) < std::ldexp(1.0, -14)) return std::ldexp(1.0, -24);
-    return std::ldexp(1.0, std::ilogb(v) - 10);
-}
+double HalfStep(double v) { return 2 * HalfCode(DepthRGBAFlt16, v); }
 
 bool AllZero(const uint8_t *p, size_t n) {
     return p && std::all_of(p, p + n, [](uint8_t b) { return b == 0; });
@@ -31,9 +25,7 @@ FltPixel ExpectedRead(int depth, const FltPixel &p) {
     return {s(p.R), s(p.G), s(p.B), s(p.A)};
 }
 
-// Integer depths: well under one code, so that a wrong code fails. Half and
-// float: exact when the input was exact at the source depth, else within a
-// step of the half grid or a few float ulps.
+// Integers: well under a code. Half and float: exact when the input was exact, else a half step or float ulps.
 ::testing::AssertionResult PixelNear(int depth, const FltPixel &got, const FltPixel &want, bool inputExact) {
     for (int c = 0; c < 4; ++c) {
         const double g = Channel(got, c), w = Channel(want, c);
@@ -49,7 +41,7 @@ FltPixel ExpectedRead(int depth, const FltPixel &p) {
     return ::testing::AssertionSuccess();
 }
 
-TEST(ImageWindows, DataWindowOnlyBeforeRowsValidWindowInsideIt) {
+TEST(ImageWindows, DataWindowOnlyBeforeRowsValidWindowInsideRowsAndCanvasOutside) {
     auto img = Blank(10, 6, 7);
     EXPECT_EQ(img->ValidWindow(), ImgRectI(0, 0, 10, 6));
     img->SetDataWindow(ImgRectI(-4, -2, 7, 5));
@@ -64,9 +56,7 @@ TEST(ImageWindows, DataWindowOnlyBeforeRowsValidWindowInsideIt) {
     empty->SetDataWindow(ImgRectI(3, 3, 3, 9)); // a null window: rows of nothing
     EXPECT_TRUE(empty->ValidWindow().IsNull() && empty->AllocScanLineData());
     EXPECT_EQ(empty->ScanLine(3), nullptr);
-}
-
-TEST(ImageRows, AllocatedLateZeroedAndOnlyInTheDataWindow) {
+    // Rows come late, zeroed, and only in the data window.
     const size_t bytesPerPixel[] = {1, 2, 2, 4, 4, 8, 8, 16};
     const ImgRectI dw(-3, -2, 5, 4);
     for (int depth = 1; depth <= 8; ++depth) {
@@ -86,33 +76,30 @@ TEST(ImageRows, AllocatedLateZeroedAndOnlyInTheDataWindow) {
     }
     auto none = Blank(8, 8, 8); // an image for pre-calculation never gets rows
     none->SetNoData(true);
-    EXPECT_FALSE(none->AllocScanLineData());
     none->Fill({1, 1, 1, 1});
-    EXPECT_FALSE(none->HasScanLineData());
-}
-
-TEST(ImageCanvas, OutsideTheDataWindowAndWithoutRows) {
-    const ImgRectI dw(1, 1, 4, 3);
+    EXPECT_FALSE(none->AllocScanLineData() || none->HasScanLineData());
+    // The canvas: outside the data window and without rows.
+    const ImgRectI cw(1, 1, 4, 3);
     const FltPixel canvas{0.1f, 0.2f, 0.3f, 0.4f}, white{1, 1, 1, 1};
-    auto img = Blank(5, 4, 6, &dw);
-    img->SetCanvasColor(canvas);
-    EXPECT_EQ(img->GetFlt(2, 2), canvas); // no rows yet: all canvas
-    ASSERT_TRUE(img->AllocScanLineData());
-    img->PutFlt(2, 2, white);
-    img->PutFlt(0, 0, white); // outside: ignored
-    EXPECT_TRUE(AllNear(*img, ImgRectI(-1, -1, 6, 5), 0.0, [&](int x, int y) {
-        return !dw.Contains(x, y) ? canvas : x == 2 && y == 2 ? white : FltPixel{};
+    auto painted = Blank(5, 4, 6, &cw);
+    painted->SetCanvasColor(canvas);
+    EXPECT_EQ(painted->GetFlt(2, 2), canvas); // no rows yet: all canvas
+    ASSERT_TRUE(painted->AllocScanLineData());
+    painted->PutFlt(2, 2, white);
+    painted->PutFlt(0, 0, white); // outside: ignored
+    EXPECT_TRUE(AllNear(*painted, ImgRectI(-1, -1, 6, 5), 0.0, [&](int x, int y) {
+        return !cw.Contains(x, y) ? canvas : x == 2 && y == 2 ? white : FltPixel{};
     }));
     // The canvas as 16-bit components.
     const Pixel wide{65535, 0, 32768, 257};
-    img->SetCanvasColor(wide);
-    for (int c = 0; c < 4; ++c) EXPECT_NEAR(Channel(img->GetCanvasColor(), c), (&wide.R)[c] / 65535.0, 1e-7) << c;
+    painted->SetCanvasColor(wide);
+    for (int c = 0; c < 4; ++c) EXPECT_NEAR(Channel(painted->GetCanvasColor(), c), (&wide.R)[c] / 65535.0, 1e-7) << c;
     Pixel p;
-    img->GetCanvasColor(p);
+    painted->GetCanvasColor(p);
     EXPECT_EQ(p, wide);
 }
 
-TEST(ImagePixels, PutGetRoundTripPerDepth) {
+TEST(ImagePixels, PutGetRoundTripPerDepthFloatsStoreAsTheNearestCode) {
     const float values[] = {0.0f, 1.0f,  0.5f,  1.0f / 255, 0.25f, 0.73f,        1e-3f, 0.999f, 1e-6f, -0.2f,
                             1.7f, -0.0f, 65504, 1e-7f,      0.1f,  100.4f / 255, NaNf,  Inff,   -Inff, 3.0f / 65535};
     const int n = std::size(values);
@@ -126,12 +113,8 @@ TEST(ImagePixels, PutGetRoundTripPerDepth) {
         }
         EXPECT_TRUE(img->GetFlt(0, 0) == FltPixel{} && img->GetFlt(2, 2) == FltPixel{}) << "neighbours, " << depth;
     }
-}
-
-TEST(ImagePixels, FloatsStoreAsTheExactlyNearestCode) {
-    // Values within half a code of every code, any floats in 0..1, and values
-    // out of range: each component stored as the code nearest to v x max of
-    // the clamped value (NaN: 0), computed exactly.
+    // Floats store as the exactly nearest code: values near every code, floats in 0..1, out of range.
+    // Values near every code, floats in 0..1, values out of range: the code nearest to the clamped v x max.
     std::vector<FltPixel> in;
     for (long max : {255L, 65535L})
         for (long k = 0; k <= max; ++k)
@@ -167,7 +150,7 @@ TEST(ImagePixels, FloatsStoreAsTheExactlyNearestCode) {
     }
 }
 
-TEST(PixelRuns, EveryCodeLoadsAsItsValueAndStoresBack) {
+TEST(PixelRuns, LoadStoreAndReadSpansAsWorkedOutHere) {
     for (int depth : {DepthAInt8, DepthAInt16, DepthAFlt16, DepthRGBAInt8, DepthRGBAInt16, DepthRGBAFlt16}) {
         const PixelFormat fmt = FormatOfDepth(depth);
         const bool half = Kind(depth) == 2, wide = fmt.bytesPerComponent == 2;
@@ -207,9 +190,7 @@ TEST(PixelRuns, EveryCodeLoadsAsItsValueAndStoresBack) {
         StorePixel(depth, p.data(), n, back.data());
         EXPECT_EQ(back, raw);
     }
-}
-
-TEST(PixelRuns, SixteenBitValuesNarrowAndWidenToTheNearest) {
+    // Every 16-bit value narrows and widens to the nearest.
     for (uint32_t v = 0; v < 65536; ++v) {
         const Pixel px{static_cast<uint16_t>(v), 0, static_cast<uint16_t>(65535 - v), 65535};
         uint8_t b8[4];
@@ -226,9 +207,7 @@ TEST(PixelRuns, SixteenBitValuesNarrowAndWidenToTheNearest) {
             << v;
         ASSERT_EQ(FltToPixel(fp), px) << v;
     }
-}
-
-TEST(PixelRuns, FloatsKeepTheirBitsAndClampIntoIntegers) {
+    // Floats keep their bits and clamp into integers.
     const std::vector<float> data = {0.0f, 1.0f, 0.5f, -0.25f, 1.5f, NaNf, Inff, -Inff, 1e-9f, 0.7f, 65504.f, -0.0f};
     const auto *raw = reinterpret_cast<const uint8_t *>(data.data());
     const int n = static_cast<int>(data.size());
@@ -246,9 +225,7 @@ TEST(PixelRuns, FloatsKeepTheirBitsAndClampIntoIntegers) {
         EXPECT_TRUE(p[i].A == NearestCode(data[i], 65535) && p[i].R == p[i].A) << data[i]; // clamped, NaN to 0
     }
     EXPECT_EQ(FltToPixel({-0.5f, 0.25f, 2.0f, NaNf}), (Pixel{0, 16384, 65535, 0}));
-}
-
-TEST(PixelRuns, ReadSpanGivesCanvasLeftAndRight) {
+    // Spans read canvas left and right of the data window.
     const ImgRectI dw(2, 1, 6, 4);
     const FltPixel canvas{0.125f, 0.25f, 0.375f, 0.5f}, unset{-9, -9, -9, -9};
     // Rows {y, x0, x1} through, below and above the window, runs over, inside and either side of it; two empty.
@@ -268,7 +245,7 @@ TEST(PixelRuns, ReadSpanGivesCanvasLeftAndRight) {
     }
 }
 
-TEST(ImageServices, FillFillWithinAndClear) {
+TEST(ImageServices, FillFillWithinClearAndCopyBetweenEveryPairOfDepths) {
     const ImgRectI dw(-1, -1, 5, 4), within(2, 0, 9, 2); // within: partly outside the data window
     const FltPixel first{0.2f, 1.3f, -0.2f, 0.6f}, second{0.9f, 0.1f, 0.45f, 1.0f};
     for (int depth = 1; depth <= 8; ++depth) {
@@ -295,9 +272,6 @@ TEST(ImageServices, FillFillWithinAndClear) {
                     (big->GetFlt(289, y).R > 0.5f) == in && big->GetFlt(290, y).A == 0)
             << y;
     }
-}
-
-TEST(ImageServices, CopyBetweenEveryPairOfDepths) {
     const ImgRectI sw(-2, -1, 5, 4);
     const FltPixel canvas{0.2f, 0.4f, 0.6f, 0.8f};
     // Destinations partly outside the source on two sides, inside, around it, its columns and more rows, far away.
@@ -320,10 +294,10 @@ TEST(ImageServices, CopyBetweenEveryPairOfDepths) {
     bare->SetNoData(true);
     bare->SetCanvasColor(canvas);
     dst->ImageCopy(bare.Get());
-    EXPECT_TRUE(AllNear(*dst, dst->DataWindow(), 0.0, [&](int, int) { return canvas; }));
+    EXPECT_TRUE(AllNear(*dst, dst->DataWindow(), 0.0, Constant(canvas)));
 }
 
-TEST(ImageServices, CopyOfImageIsDeep) {
+TEST(ImageServices, CopyOfImageIsDeepAndAuxiliaryPlanesLieBesideTheColourRows) {
     const ImgRectI dw(-1, -2, 8, 6);
     auto src = WindowedImage(9, 7, dw, {0.1f, 0.2f, 0.3f, 0.4f}, 3, 6);
     src->SetScale(2.0, 0.5);
@@ -336,17 +310,13 @@ TEST(ImageServices, CopyOfImageIsDeep) {
         for (int i = 0; i < dw.Width(); ++i) src->AuxRow(AuxChannelKind::Z, y)[i] = y * 100.0f + i;
     auto bare = Blank(4, 3, 3); // without rows: a copy without rows, with the same channels listed
     bare->AddAuxChannel(AuxChannelKind::VectorX);
-
     Ref<Image> copy = CopyOfImage(src.Get()), bareCopy = CopyOfImage(bare.Get());
     ASSERT_TRUE(copy && bareCopy);
-    EXPECT_TRUE(copy->XScale() == 2.0 && copy->YScale() == 0.5 && copy->ValidWindow() == ImgRectI(0, 0, 5, 5));
-    EXPECT_TRUE(copy->GetCanvasColor() == src->GetCanvasColor() && copy->GetAttrL(ImgFullWidth) == 100);
-    EXPECT_TRUE(SameBits(*copy, *src));
-    for (int y = dw.y0; y < dw.y1; ++y) {
-        const float *row = copy->AuxRow(AuxChannelKind::Z, y);
-        ASSERT_TRUE(row && !std::memcmp(row, src->AuxRow(AuxChannelKind::Z, y), dw.Width() * sizeof(float))) << y;
-    }
-    EXPECT_FALSE(copy->HasAuxChannel(AuxChannelKind::U));
+    EXPECT_TRUE(copy->XScale() == 2.0 && copy->YScale() == 0.5 && copy->ValidWindow() == ImgRectI(0, 0, 5, 5) &&
+                copy->GetCanvasColor() == src->GetCanvasColor() && copy->GetAttrL(ImgFullWidth) == 100);
+    EXPECT_TRUE(SameBits(*copy, *src) && !copy->HasAuxChannel(AuxChannelKind::U));
+    for (int y = dw.y0; y < dw.y1; ++y)
+        ASSERT_EQ(std::memcmp(copy->AuxRow(AuxChannelKind::Z, y), src->AuxRow(AuxChannelKind::Z, y), 9 * 4), 0);
     EXPECT_TRUE(!bareCopy->HasScanLineData() && bareCopy->HasAuxChannel(AuxChannelKind::VectorX));
     EXPECT_FALSE(CopyOfImage(nullptr));
     // Writing to the copy leaves the source alone; the attributes' text belongs to the copy.
@@ -359,51 +329,43 @@ TEST(ImageServices, CopyOfImageIsDeep) {
     // Copy() of the parameter is the same deep copy.
     Ref<Parameter> asParam = copy->Copy();
     auto *paramImage = dynamic_cast<Image *>(asParam.Get());
-    ASSERT_TRUE(paramImage && paramImage != copy.Get());
-    EXPECT_TRUE(SameBits(*paramImage, *copy));
-}
-
-TEST(ImageAux, PlanesBesideTheColourRows) {
-    const ImgRectI dw(1, 1, 6, 4);
-    auto img = Blank(5, 4, 8, &dw);
-    ASSERT_TRUE(img->AddAuxChannel(AuxChannelKind::Z)); // before rows: no storage yet
-    EXPECT_TRUE(img->HasAuxChannel(AuxChannelKind::Z) && !img->HasAuxChannel(AuxChannelKind::U));
-    EXPECT_EQ(img->AuxRow(AuxChannelKind::Z, 1), nullptr);
-    img->ImageCopy(PatternImage(5, 4, 8, 17).Get());
-    const Ref<Image> colour = CopyOfImage(img.Get());
-    for (int y : {0, 4, -5}) EXPECT_EQ(img->AuxRow(AuxChannelKind::Z, y), nullptr) << y;
-    for (int y = dw.y0; y < dw.y1; ++y) std::fill_n(img->AuxRow(AuxChannelKind::Z, y), dw.Width(), -7.0f);
-    EXPECT_EQ(img->AuxRow(AuxChannelKind::U, 1), nullptr);
+    EXPECT_TRUE(paramImage && paramImage != copy.Get() && SameBits(*paramImage, *copy));
+    // Auxiliary planes beside the colour rows.
+    const ImgRectI aw(1, 1, 6, 4);
+    auto planes = Blank(5, 4, 8, &aw);
+    ASSERT_TRUE(planes->AddAuxChannel(AuxChannelKind::Z)); // before rows: no storage yet
+    EXPECT_TRUE(planes->HasAuxChannel(AuxChannelKind::Z) && !planes->HasAuxChannel(AuxChannelKind::U));
+    EXPECT_EQ(planes->AuxRow(AuxChannelKind::Z, 1), nullptr);
+    planes->ImageCopy(PatternImage(5, 4, 8, 17).Get());
+    const Ref<Image> colour = CopyOfImage(planes.Get());
+    for (int y : {0, 4, -5}) EXPECT_EQ(planes->AuxRow(AuxChannelKind::Z, y), nullptr) << y;
+    for (int y = aw.y0; y < aw.y1; ++y) std::fill_n(planes->AuxRow(AuxChannelKind::Z, y), aw.Width(), -7.0f);
+    EXPECT_EQ(planes->AuxRow(AuxChannelKind::U, 1), nullptr);
     // Every kind has a plane of its own (Z again: the same plane, the others
     // zeroed, added after the rows); the colour rows stay as they were.
     const int kinds = static_cast<int>(AuxChannelKind::Count);
     for (int k = 0; k < kinds; ++k) {
         const auto kind = static_cast<AuxChannelKind>(k);
-        ASSERT_TRUE(img->AddAuxChannel(kind));
-        for (int y = dw.y0; y < dw.y1; ++y)
-            for (int i = 0; i < dw.Width(); ++i) {
-                ASSERT_EQ(img->AuxRow(kind, y)[i], k == 0 ? -7.0f : 0.0f) << k;
-                img->AuxRow(kind, y)[i] = k * 1000.0f + y;
+        ASSERT_TRUE(planes->AddAuxChannel(kind));
+        for (int y = aw.y0; y < aw.y1; ++y)
+            for (int i = 0; i < aw.Width(); ++i) {
+                ASSERT_EQ(planes->AuxRow(kind, y)[i], k == 0 ? -7.0f : 0.0f) << k;
+                planes->AuxRow(kind, y)[i] = k * 1000.0f + y;
             }
     }
     for (int k = 0; k < kinds; ++k)
-        for (int y = dw.y0; y < dw.y1; ++y)
-            for (int i = 0; i < dw.Width(); ++i)
-                ASSERT_EQ(img->AuxRow(static_cast<AuxChannelKind>(k), y)[i], k * 1000.0f + y) << k;
-    EXPECT_TRUE(SameBits(*img, *colour));
+        for (int y = aw.y0; y < aw.y1; ++y)
+            for (int i = 0; i < aw.Width(); ++i)
+                ASSERT_EQ(planes->AuxRow(static_cast<AuxChannelKind>(k), y)[i], k * 1000.0f + y) << k;
+    EXPECT_TRUE(SameBits(*planes, *colour));
 }
 
-TEST(NewImage, ImpossibleFormatsGiveNull) {
+TEST(NewImage, ImpossibleFormatsGiveNullLikeImagesExplicitTagsWindowsAndNoData) {
     // Sizes: none, no height, zero, negative, too large, beyond 32 bits.
-    const TagList sizes[] = {{},
-                             {{ImgWidth, 4}},
-                             {{ImgWidth, 0}, {ImgHeight, 4}},
-                             {{ImgWidth, 4}, {ImgHeight, -1}},
-                             {{ImgWidth, MaxImageSide + 1}, {ImgHeight, 4}},
-                             {{ImgWidth, 4}, {ImgHeight, MaxImageSide + 1}},
-                             {{ImgWidth, (1LL << 32) + 16}, {ImgHeight, 4}},
-                             {{ImgWidth, 4}, {ImgHeight, -(1LL << 32) + 8}}};
-    for (const TagList &t : sizes) EXPECT_FALSE(NewImageTagList(t)) << &t - sizes;
+    EXPECT_TRUE(!NewImageTagList({}) && !NewImageTagList({{ImgWidth, 4}}));
+    const long long sizes[][2] = {
+        {0, 4}, {4, -1}, {MaxImageSide + 1, 4}, {4, MaxImageSide + 1}, {(1LL << 32) + 16, 4}, {4, -(1LL << 32) + 8}};
+    for (auto [w, h] : sizes) EXPECT_FALSE(NewImageTagList({{ImgWidth, w}, {ImgHeight, h}})) << w << " x " << h;
     // Depths beyond 1..8 and aspects not above 0, given outright or over a like-image.
     auto like = Blank(30, 20, 6);
     const double nan = std::numeric_limits<double>::quiet_NaN();
@@ -416,10 +378,6 @@ TEST(NewImage, ImpossibleFormatsGiveNull) {
     EXPECT_FALSE(NewImageTagList({{ImgLikeImage, like.Get()}, {ImgHeight, 0}}));
     Ref<Image> largest = NewImageTagList({{ImgWidth, MaxImageSide}, {ImgHeight, MaxImageSide}, {ImgNoData, 1}});
     EXPECT_TRUE(largest && largest->Width() == MaxImageSide);
-}
-
-TEST(NewImage, LikeImageExplicitTagsAndAttributes) {
-    auto like = Blank(30, 20, 6);
     like->SetScale(2.0, 0.5);
     like->SetDataWindow(ImgRectI(-5, -5, 40, 25));
     like->SetCanvasColor(FltPixel{1, 0, 0, 1});
@@ -427,14 +385,14 @@ TEST(NewImage, LikeImageExplicitTagsAndAttributes) {
     Ref<Image> same = NewImageTagList({{ImgLikeImage, like.Get()}});
     ASSERT_TRUE(same);
     EXPECT_TRUE(same->Depth() == 6 && same->YScale() == 0.5 && same->GetAttrD(ImgFieldOffset) == 0.5);
-    EXPECT_EQ(same->DataWindow(), ImgRectI(0, 0, 30, 20)); // the image rectangle, not the like-image's window
-    EXPECT_TRUE(same->IsCanvasColorClear());
+    // The image rectangle, not the like-image's window, and a clear canvas.
+    EXPECT_TRUE(same->DataWindow() == ImgRectI(0, 0, 30, 20) && same->IsCanvasColorClear());
     // Explicit tags win over the like-image, which keeps its own.
     TagList tags{{ImgLikeImage, like.Get()}, {ImgWidth, 7}, {ImgDepth, 1}};
     tags.Add({ImgXScale, 3.0}), tags.Add({ImgField, 2}), tags.Add({ImgFullHeight, 99});
     Ref<Image> changed = NewImageTagList(tags);
-    ASSERT_TRUE(changed);
-    EXPECT_TRUE(changed->Width() == 7 && changed->Height() == 20 && changed->Depth() == 1 && changed->XScale() == 3.0);
+    ASSERT_TRUE(changed && changed->Width() == 7 && changed->Height() == 20 && changed->Depth() == 1 &&
+                changed->XScale() == 3.0);
     EXPECT_TRUE(changed->GetAttrL(ImgField) == 2 && changed->GetAttrL(ImgFullHeight) == 99 &&
                 changed->GetAttrL(ImgFullWidth) == 60);
     EXPECT_TRUE(like->GetAttrL(ImgField) == 1 && !like->Attrs().Has(ImgFullHeight));
@@ -451,31 +409,25 @@ TEST(NewImage, LikeImageExplicitTagsAndAttributes) {
     for (auto [tag, value] : doubles) EXPECT_EQ(img->GetAttrD(tag, -1), value) << std::hex << tag;
     EXPECT_FALSE(img->Attrs().Has(ImgWidth) || img->Attrs().Has(ImgDepth));
     EXPECT_TRUE(NewImageTagList({{ImgWidth, 4}, {ImgHeight, 4}})->Attrs().Empty());
-}
-
-TEST(NewImage, WindowsNoDataCanvasAndAbort) {
+    // Data and valid windows given or not.
     const ImgRectI dw(-5, -5, 15, 8), vw(2, 2, 30, 30), frame(0, 0, 10, 6);
-    const struct {
-        const ImgRectI *data, *valid;
-        bool validTag;
-        ImgRectI wantData, wantValid;
-    } cases[] = {{&dw, nullptr, false, dw, dw},
-                 {&dw, &vw, true, dw, ImgRectI(2, 2, 15, 8)},
-                 {nullptr, &vw, true, frame, ImgRectI(2, 2, 10, 6)},
-                 {&dw, nullptr, true, dw, dw}}; // a null valid window: the data window
-    for (const auto &w : cases) {
-        TagList tags{{ImgWidth, 10}, {ImgHeight, 6}};
-        if (w.data) tags.Add({ImgDataWindow, w.data});
-        if (w.validTag) tags.Add({ImgValidWindow, w.valid});
-        Ref<Image> img = NewImageTagList(tags);
-        EXPECT_TRUE(img && img->DataWindow() == w.wantData && img->ValidWindow() == w.wantValid);
+    const std::tuple<const ImgRectI *, const ImgRectI *, bool, ImgRectI, ImgRectI> cases[] = {
+        {&dw, nullptr, false, dw, dw},
+        {&dw, &vw, true, dw, ImgRectI(2, 2, 15, 8)},
+        {nullptr, &vw, true, frame, ImgRectI(2, 2, 10, 6)},
+        {&dw, nullptr, true, dw, dw}}; // a null valid window: the data window
+    for (const auto &[data, valid, validTag, wantData, wantValid] : cases) {
+        TagList t{{ImgWidth, 10}, {ImgHeight, 6}};
+        if (data) t.Add({ImgDataWindow, data});
+        if (validTag) t.Add({ImgValidWindow, valid});
+        Ref<Image> got = NewImageTagList(t);
+        EXPECT_TRUE(got && got->DataWindow() == wantData && got->ValidWindow() == wantValid);
     }
     const FltPixel canvas{0.25f, 0.5f, 0.75f, 1.0f};
     std::atomic<bool> abort{false};
     Ref<Image> e = NewImageTagList(
         {{ImgWidth, 10}, {ImgHeight, 6}, {ImgNoData, true}, {ImgCanvasColor, &canvas}, {ImgAbortFlag, &abort}});
-    ASSERT_TRUE(e);
-    EXPECT_TRUE(!e->AllocScanLineData() && e->GetCanvasColor() == canvas && !e->CheckAbort());
+    ASSERT_TRUE(e && !e->AllocScanLineData() && e->GetCanvasColor() == canvas && !e->CheckAbort());
     abort = true;
     EXPECT_TRUE(e->CheckAbort());
     Ref<Image> f = NewImageTagList({{ImgWidth, 10}, {ImgHeight, 6}, {ImgNoData, false}, {ImgCanvasColor, nullptr}});

@@ -1,9 +1,6 @@
 #pragma once
-// Helpers the image, colour and device tests share: blank, filled and pattern
-// images at any depth, what a depth stores of a value (worked out here, not
-// by the host's converters), the resize filters written out from their
-// definitions, image comparisons, and the files and commands of the other
-// programs results are held against. Includes what these tests commonly use.
+// Helpers the image, colour and device tests share: test images, what a depth stores of a value (worked out
+// here, not by the host's converters), the resize filters from their definitions, comparisons, other programs.
 #include <gtest/gtest.h>
 
 #include <algorithm>
@@ -65,6 +62,11 @@ inline Ref<Image> Filled(int w, int h, int depth, const std::function<FltPixel(i
     for (int y = r.y0; y < r.y1; ++y)
         for (int x = r.x0; x < r.x1; ++x) img->PutFlt(x, y, f(x, y));
     return img;
+}
+
+/// A picture of one colour everywhere, for Filled.
+inline std::function<FltPixel(int, int)> Constant(FltPixel p) {
+    return [p](int, int) { return p; };
 }
 
 /// The kind of component a depth stores: 0 8-bit, 1 16-bit, 2 half, 3 float.

@@ -1,9 +1,5 @@
-// The merge's pixel formulas against values computed here, in double, from
-// the definitions in docs/MERGE.md written the other way round (separable
-// modes through straight colours, non-separable ones with sorted channels,
-// operators from their Porter-Duff factors); then whole images at every
-// depth, with canvases, windows and offsets, the copy beyond the foreground,
-// the depth merge, Dissolve's noise.
+// The merge's pixel formulas against docs/MERGE.md written the other way round, in double (straight colours,
+// sorted channels, Porter-Duff factors); whole images at every depth, the depth merge, Dissolve's noise.
 #include "host/image/MergeModes.h"
 
 #include "tests/host/image/ImageTestSupport.h"
@@ -87,10 +83,9 @@ TagList TagsOf(const Controls &c) {
                    {MrgDoBlue, c.on[2]},        {MrgDoAlpha, c.on[3]}};
 }
 
+FltPixel F(const D4 &p) { return {float(p[0]), float(p[1]), float(p[2]), float(p[3])}; }
 FltPixel Merged(const Controls &c, const D4 &f, const D4 &b) {
-    const FltPixel fp{float(f[0]), float(f[1]), float(f[2]), float(f[3])};
-    return MergePixel(MergeSettings::FromTags(TagsOf(c)), fp, {float(b[0]), float(b[1]), float(b[2]), float(b[3])}, 0,
-                      0);
+    return MergePixel(MergeSettings::FromTags(TagsOf(c)), F(f), F(b), 0, 0);
 }
 
 /// The merge of one pixel (not Dissolve), straight from the definitions.
@@ -127,10 +122,8 @@ D4 Reference(const Controls &c, const D4 &f, const D4 &b) {
     return ::testing::AssertionSuccess();
 }
 
-TEST(MergeModes, EveryModeAndOperatorMatchesItsDefinition) {
-    // Pairs that reach every branch: halves of the light modes on both sides
-    // of 1/2, Soft Light's polynomial below 1/4, dodges at 0 and 1, empty and
-    // opaque alphas, values above 1.
+TEST(MergeModes, EveryModeAndOperatorMatchesItsDefinitionHandComputedPixelsAndDissolve) {
+    // Pairs that reach every branch: both sides of 1/2 and 1/4, dodges at 0 and 1, empty and opaque, above 1.
     const std::pair<D4, D4> pairs[] = {
         {{0.12, 0.30, 0.45, 0.6}, {0.08, 0.56, 0.32, 0.8}}, // Cs .2 .5 .75, Cb .1 .7 .4
         {{0.9, 0.1, 0.5, 1.0}, {0.2, 0.6, 1.0, 1.0}},       // opaque over opaque
@@ -149,24 +142,16 @@ TEST(MergeModes, EveryModeAndOperatorMatchesItsDefinition) {
                 for (const auto &[f, b] : pairs)
                     EXPECT_TRUE(Near4(Merged(c, f, b), Reference(c, f, b)))
                         << "mode " << c.mode << " op " << c.op << " blend " << c.blend << " additive " << c.additive;
-}
-
-TEST(MergeModes, HandComputedPixels) {
+    // Pixels computed by hand.
     const D4 f{0.4, 0.2, 0.1, 0.5}, b{0.3, 0.6, 0.2, 0.75}, grey{0.5, 0.5, 0.5, 1}, warm{0.5, 0.25, 0, 1};
-    const struct {
-        Controls c;
-        D4 f, b, want;
-    } cases[] = {
+    const std::tuple<Controls, D4, D4, D4> cases[] = {
         // Half-transparent red over opaque blue: red 0.5, blue 1 x (1 - 0.5).
         {{}, {0.5, 0, 0, 0.5}, {0, 0, 1, 1}, {0.5, 0, 0.5, 1}},
         {{.mode = MrgScreen}, grey, warm, {0.75, 0.625, 0.5, 1}}, // 0.5 + 0.5 - 0.25
-        {{.mode = MrgMultiply}, grey, warm, {0.25, 0.125, 0, 1}},
         {{.mode = MrgDifference}, {0.25, 0.75, 0, 1}, {1, 0.25, 0.5, 1}, {0.75, 0.5, 0.5, 1}},
         {{.mode = MrgAdd}, {0.75, 0, 0, 1}, {0.5, 0, 0, 1}, {1.25, 0, 0, 1}}, // no clipping on float
-        {{.mode = MrgSubtract}, {0.25, 0, 0, 1}, {0.5, 0, 0, 1}, {0.25, 0, 0, 1}},
-        // In keeps the foreground where the background has alpha; Held Out where it has none.
+        // In keeps the foreground where the background has alpha.
         {{.op = MrgIn}, {0.5, 0.5, 0, 1}, {0, 0, 1, 0.5}, {0.25, 0.25, 0, 0.5}},
-        {{.op = MrgHeldOut}, {0.5, 0.5, 0, 1}, {0, 0, 1, 0.5}, {0.25, 0.25, 0, 0.5}},
         // Additive 1: colour added, alpha as over; 0.25: the background held out by 0.75 x alpha.
         {{.additive = 1}, f, b, {0.7, 0.8, 0.3, 0.875}},
         {{.additive = 0.25}, f, b, {0.5875, 0.575, 0.225, 0.875}},
@@ -176,11 +161,8 @@ TEST(MergeModes, HandComputedPixels) {
         {{.burnIn = 1}, f, b, {0.7, 0.8, 0.3, 0.75}},
         {{.mode = MrgMultiply, .blend = 0}, f, b, b},
     };
-    for (const auto &c : cases) EXPECT_TRUE(Near4(Merged(c.c, c.f, c.b), c.want)) << "mode " << c.c.mode;
-}
-
-TEST(MergeModes, DissolveKeepsWholePixelsByTheNoise) {
-    // The noise as the page defines it, written out again.
+    for (const auto &[ctl, fg, bg, want] : cases) EXPECT_TRUE(Near4(Merged(ctl, fg, bg), want)) << "mode " << ctl.mode;
+    // Dissolve keeps whole pixels by the noise.
     auto noise = [](int x, int y) {
         uint32_t u = static_cast<uint32_t>(x) * 0x9E3779B1u + static_cast<uint32_t>(y) * 0x85EBCA77u;
         u = (u ^ (u >> 16)) * 0x7FEB352Du;
@@ -190,30 +172,28 @@ TEST(MergeModes, DissolveKeepsWholePixelsByTheNoise) {
     MergeSettings s;
     s.mode = MrgDissolve;
     s.blend = 0.8f;
-    const FltPixel f{0.3f, 0.15f, 0.6f, 0.75f}, b{0.1f, 0.2f, 0.3f, 1.f};
+    const FltPixel fgPixel{0.3f, 0.15f, 0.6f, 0.75f}, bgPixel{0.1f, 0.2f, 0.3f, 1.f};
     const double p = static_cast<double>(0.8f * 0.75f);
     int kept = 0, n = 0;
     for (int y = -40; y < 40; ++y)
         for (int x = -60; x < 60; ++x, ++n) {
             ASSERT_EQ(DissolveNoise(x, y), static_cast<float>(noise(x, y)));
-            const FltPixel o = MergePixel(s, f, b, x, y);
+            const FltPixel o = MergePixel(s, fgPixel, bgPixel, x, y);
             const bool keep = noise(x, y) < p;
             kept += keep;
-            ASSERT_TRUE(keep ? Near4(o, {0.4, 0.2, 0.8, 1}) : ::testing::AssertionResult(o == b)) // straight, opaque
+            ASSERT_TRUE(keep ? Near4(o, {0.4, 0.2, 0.8, 1})
+                             : ::testing::AssertionResult(o == bgPixel)) // straight, opaque
                 << x << "," << y;
         }
     // The share kept is the chance, within a few standard deviations; the canvas is the mean.
     EXPECT_NEAR(kept / double(n), p, 4 * std::sqrt(p * (1 - p) / n));
-    EXPECT_TRUE(Near4(MergeCanvasColor(s, f, b), {0.1 + p * 0.3, 0.2, 0.3 + p * 0.5, 1}));
+    EXPECT_TRUE(Near4(MergeCanvasColor(s, fgPixel, bgPixel), {0.1 + p * 0.3, 0.2, 0.3 + p * 0.5, 1}));
 }
 
 FltPixel FgAt(int x, int y) { return {0.05f * (x % 7), 0.04f * (y % 9), 0.3f, 0.25f + 0.05f * ((x + y) % 10)}; }
 FltPixel BgAt(int x, int y) { return {0.9f - 0.03f * x, 0.1f + 0.02f * y, 0.5f, 0.2f + 0.06f * (x % 12)}; }
 
-/// Whether a stored component is the value computed here, stored at
-/// `depth`: an integer depth must hold the nearest code of the clamped value
-/// (within half a code, so the code beside it fails), a half the nearest
-/// half (within half a step), a float the value within a few ulps.
+/// Whether a stored component is `want` stored at `depth`: within half a code or half step, a float's few ulps.
 ::testing::AssertionResult StoredNear(int depth, double got, double want) {
     if (Kind(depth) < 2) want = std::clamp(want, 0.0, 1.0);
     const double tol = Kind(depth) == 3 ? 2e-6 * std::max(1.0, std::fabs(want))
@@ -222,11 +202,9 @@ FltPixel BgAt(int x, int y) { return {0.9f - 0.03f * x, 0.1f + 0.02f * y, 0.5f, 
     return ::testing::AssertionFailure() << "got " << got << ", want " << want << " (depth " << depth << ")";
 }
 
-TEST(MergeImages, EveryDepthCanvasWindowAndOffsetFollowTheReference) {
-    // The foreground, placed 2 right and 1 down, lies left and the background
-    // right, both with canvases: the result reaches over both, its canvas is
-    // the canvases merged, and each pixel is the reference on what the inputs
-    // hold there, stored at the background's depth.
+TEST(MergeImages, EveryDepthCanvasWindowAndOffsetFollowTheReferenceAndDataWindowsWhatCanDiffer) {
+    // The foreground, placed 2 right and 1 down, left of the background, both with canvases: the result covers
+    // both, its canvas is the canvases merged, each pixel the reference stored at the background's depth.
     const ImgRectI fw(-2, 1, 4, 13), bw(4, 2, 16, 10);
     const FltPixel fc{0.1f, 0.1f, 0.0f, 0.25f}, bc{0.0f, 0.2f, 0.4f, 0.5f};
     std::vector<std::pair<int, int>> depths = {{DepthRGBAFlt32, DepthRGBAInt16}}; // foreground, background
@@ -250,53 +228,43 @@ TEST(MergeImages, EveryDepthCanvasWindowAndOffsetFollowTheReference) {
                             << x << "," << y << " ch " << i;
                 }
         }
-}
-
-TEST(MergeImages, DataWindowsFollowWhatCanDifferFromTheCanvas) {
-    const ImgRectI fw(0, 0, 6, 6), bw(4, 4, 10, 10), both(0, 0, 10, 10);
+    // Data windows follow what can differ from the canvas.
+    const ImgRectI fgWin(0, 0, 6, 6), bgWin(4, 4, 10, 10), both(0, 0, 10, 10);
     const FltPixel clear{}, grey{0.5f, 0.5f, 0.5f, 1};
-    const struct {
-        Controls c;
-        FltPixel bgCanvas;
-        ImgRectI want;
-    } cases[] = {
+    const std::tuple<Controls, FltPixel, ImgRectI> cases[] = {
         {{}, clear, both},                               // over: the union
         {{.op = MrgIn}, clear, ImgRectI(4, 4, 6, 6)},    // both sides cut
-        {{.op = MrgIn}, grey, fw},                       // the background's canvas shows
-        {{.op = MrgAtop}, clear, bw},                    //
-        {{.op = MrgHeldOut}, clear, fw},                 //
+        {{.op = MrgIn}, grey, fgWin},                    // the background's canvas shows
+        {{.op = MrgAtop}, clear, bgWin},                 //
+        {{.op = MrgHeldOut}, clear, fgWin},              //
         {{.op = MrgHeldOut, .blend = 0.5}, clear, both}, // half the background stays everywhere
     };
-    for (const auto &c : cases)
-        EXPECT_EQ(MergeDataWindow(MergeSettings::FromTags(TagsOf(c.c)), fw, clear, bw, c.bgCanvas), c.want) << c.c.op;
+    for (const auto &[ctl, bgCanvas, want] : cases)
+        EXPECT_EQ(MergeDataWindow(MergeSettings::FromTags(TagsOf(ctl)), fgWin, clear, bgWin, bgCanvas), want) << ctl.op;
     // What the rule cuts away really is the canvas: In over windows that do not meet leaves nothing.
     EXPECT_TRUE(MergeDataWindow(MergeSettings::FromTags(TagsOf({.op = MrgIn})), ImgRectI(0, 0, 3, 3), clear,
                                 ImgRectI(5, 5, 8, 8), clear)
                     .IsNull());
-}
-
-TEST(MergeImages, CopiedBackgroundEqualsTheComputedMerge) {
-    // Beyond a clear foreground the rows copy the background. The same
-    // foreground padded with clear pixels over the whole frame makes them
-    // compute every pixel: both must give the same bits, integer and half
-    // backgrounds included, and the copy must be the background.
-    const ImgRectI fw(3, 2, 9, 7), bw(0, 0, 16, 12);
-    auto padded = [&](int x, int y) { return fw.Contains(x, y) ? FgAt(x, y) : FltPixel{}; };
+    // Beyond a clear foreground the rows copy the background; padded with clear pixels over the frame, the
+    // foreground makes them compute every pixel: the same bits, and the copy is the background.
+    const ImgRectI fgWindow(3, 2, 9, 7), bgWindow(0, 0, 16, 12);
+    auto padded = [&](int x, int y) { return fgWindow.Contains(x, y) ? FgAt(x, y) : FltPixel{}; };
     for (int depth : {DepthRGBAInt8, DepthRGBAFlt16, DepthAInt16, DepthRGBAFlt32})
         for (int mode : {MrgNormal, MrgScreen, MrgColorBurn}) {
             SCOPED_TRACE("depth " + std::to_string(depth) + " mode " + std::to_string(mode));
-            Ref<Image> fg = Filled(16, 12, DepthRGBAFlt32, FgAt, &fw), bg = Filled(16, 12, depth, BgAt, &bw);
-            Ref<Image> whole = Filled(16, 12, DepthRGBAFlt32, padded, &bw);
-            Ref<Image> copied = Blank(16, 12, depth, &bw), computed = Blank(16, 12, depth, &bw);
+            Ref<Image> fg = Filled(16, 12, DepthRGBAFlt32, FgAt, &fgWindow),
+                       bg = Filled(16, 12, depth, BgAt, &bgWindow);
+            Ref<Image> whole = Filled(16, 12, DepthRGBAFlt32, padded, &bgWindow);
+            Ref<Image> copied = Blank(16, 12, depth, &bgWindow), computed = Blank(16, 12, depth, &bgWindow);
             ASSERT_TRUE(MergeImagesTagList(fg.Get(), bg.Get(), copied.Get(), TagsOf({.mode = mode})));
             ASSERT_TRUE(MergeImagesTagList(whole.Get(), bg.Get(), computed.Get(), TagsOf({.mode = mode})));
             EXPECT_TRUE(SameBits(*copied, *computed));
-            EXPECT_TRUE(
-                AllNear(*copied, bw, 0, [&](int x, int y) { return (fw.Contains(x, y) ? copied : bg)->GetFlt(x, y); }));
+            EXPECT_TRUE(AllNear(*copied, bgWindow, 0,
+                                [&](int x, int y) { return (fgWindow.Contains(x, y) ? copied : bg)->GetFlt(x, y); }));
         }
 }
 
-TEST(MergeImages, DepthMergeLetsTheNearerWin) {
+TEST(MergeImages, DepthMergeLetsTheNearerWinPreCalculationGetsTheCanvasAbortsStop) {
     const ImgRectI win(0, 0, 4, 1);
     auto zImage = [&](const std::vector<FltPixel> &px, const std::vector<float> &z) {
         Ref<Image> img = Filled(
@@ -324,20 +292,18 @@ TEST(MergeImages, DepthMergeLetsTheNearerWin) {
         }
         EXPECT_TRUE(dst->GetFlt(3, 0) == bp && z[3] == 2.f) << zMerge; // an empty foreground never wins
     }
-}
-
-TEST(MergeImages, PreCalculationGetsTheCanvasOnlyAndAnAbortStopsTheRows) {
-    const ImgRectI win(0, 0, 8, 8);
+    const ImgRectI square(0, 0, 8, 8);
     const FltPixel grey{0.2f, 0.2f, 0.2f, 1};
-    Ref<Image> fg = Filled(16, 12, DepthRGBAFlt32, FgAt, &win), bg = Filled(16, 12, DepthRGBAFlt32, BgAt, &win, grey);
-    Ref<Image> shape = Blank(16, 12, DepthRGBAFlt32, &win), dst = Blank(16, 12, DepthRGBAFlt32, &win);
+    Ref<Image> fgImage = Filled(16, 12, DepthRGBAFlt32, FgAt, &square),
+               bgImage = Filled(16, 12, DepthRGBAFlt32, BgAt, &square, grey);
+    Ref<Image> shape = Blank(16, 12, DepthRGBAFlt32, &square), out = Blank(16, 12, DepthRGBAFlt32, &square);
     shape->SetNoData(true);
-    ASSERT_TRUE(MergeImagesTagList(fg.Get(), bg.Get(), shape.Get(), TagsOf({})));
+    ASSERT_TRUE(MergeImagesTagList(fgImage.Get(), bgImage.Get(), shape.Get(), TagsOf({})));
     EXPECT_TRUE(!shape->HasScanLineData() && shape->GetCanvasColor() == grey);
-    EXPECT_FALSE(MergeImagesTagList(nullptr, bg.Get(), dst.Get(), {}));
+    EXPECT_FALSE(MergeImagesTagList(nullptr, bgImage.Get(), out.Get(), {}));
     std::atomic<bool> abort{true};
-    dst->SetAbortFlag(&abort);
-    EXPECT_FALSE(MergeImagesTagList(fg.Get(), bg.Get(), dst.Get(), TagsOf({})));
+    out->SetAbortFlag(&abort);
+    EXPECT_FALSE(MergeImagesTagList(fgImage.Get(), bgImage.Get(), out.Get(), TagsOf({})));
 }
 
 } // namespace

@@ -1,6 +1,5 @@
-// Pixel memory: blocks come back zeroed, frame-sized blocks are reused, the
-// pool keeps no more than its limit, and the process limit empties the pool,
-// asks the reclaimers and only then refuses, saying what was needed.
+// Pixel memory: zeroed blocks, reuse by size, the pool's limit, and the process limit: the pool emptied, the
+// reclaimers asked, and only then a refusal saying what was needed.
 #include "host/image/PixelMemory.h"
 
 #include <gtest/gtest.h>
@@ -22,7 +21,7 @@ struct LimitGuard {
     }
 };
 
-TEST(PixelMemory, BlocksOfEverySizeComeBackZeroedEvenWhenReused) {
+TEST(PixelMemory, BlocksComeBackZeroedAndFrameSizedOnesAreReusedBySize) {
     LimitGuard guard;
     SetPixelPoolLimit(size_t(64) << 20);
     for (size_t bytes : {size_t(1), size_t(4096), size_t(3) << 20})
@@ -33,13 +32,9 @@ TEST(PixelMemory, BlocksOfEverySizeComeBackZeroedEvenWhenReused) {
             std::memset(a, 0xab, bytes);
             FreePixels(a, bytes);
         }
-}
-
-TEST(PixelMemory, FrameSizedBlocksAreReusedBySize) {
 #if defined(__SANITIZE_ADDRESS__)
     GTEST_SKIP() << "the pool is off under AddressSanitizer";
 #endif
-    LimitGuard guard;
     SetPixelPoolLimit(0); // empty the pool
     SetPixelPoolLimit(size_t(64) << 20);
     const size_t frame = size_t(8) << 20, other = size_t(5) << 20;
@@ -49,14 +44,13 @@ TEST(PixelMemory, FrameSizedBlocksAreReusedBySize) {
     uint8_t *b = AllocPixels(other); // another size does not take it
     EXPECT_EQ(PixelPoolBytes(), frame);
     uint8_t *c = AllocPixels(frame);
-    EXPECT_EQ(c, a);
-    EXPECT_EQ(PixelPoolBytes(), 0u);
+    EXPECT_TRUE(c == a && PixelPoolBytes() == 0u);
     FreePixels(b, other);
     FreePixels(c, frame);
     EXPECT_EQ(PixelPoolBytes(), frame + other);
 }
 
-TEST(PixelMemory, ThePoolKeepsNoMoreThanItsLimitAndRefusesImpossibleBlocks) {
+TEST(PixelMemory, ThePoolKeepsToItsLimitAndTheProcessLimitEmptiesItAsksReclaimersThenRefuses) {
     LimitGuard guard;
     SetPixelPoolLimit(0);
     const size_t block = size_t(4) << 20;
@@ -73,48 +67,41 @@ TEST(PixelMemory, ThePoolKeepsNoMoreThanItsLimitAndRefusesImpossibleBlocks) {
     EXPECT_LE(PixelPoolBytes(), block + 8192);
     SetPixelPoolLimit(0);
     EXPECT_EQ(PixelPoolBytes(), 0u);
-}
-
-TEST(PixelMemory, TheLimitEmptiesThePoolThenAsksReclaimersThenRefuses) {
-    LimitGuard guard;
+    // The process limit empties the pool, then asks the reclaimers, then refuses.
     SetPixelPoolLimit(0);
     SetPixelPoolLimit(size_t(64) << 20);
-    const size_t block = size_t(4) << 20, other = block - 4096;
-    const size_t base = PixelMemoryInUse(), limit = base + 3 * block;
+    const size_t chunk = size_t(4) << 20, other = chunk - 4096;
+    const size_t base = PixelMemoryInUse(), limit = base + 3 * chunk;
     SetPixelMemoryLimit(limit, "--memory-limit");
     ResetPixelMemoryPeak();
-    uint8_t *a = AllocPixels(block), *b = AllocPixels(block), *c = AllocPixels(block);
+    uint8_t *a = AllocPixels(chunk), *b = AllocPixels(chunk), *c = AllocPixels(chunk);
     ASSERT_TRUE(a && b && c);
-    FreePixels(c, block);
-    EXPECT_EQ(PixelPoolBytes(), block);
-    // The pooled block does not fit the new size: it leaves to make room.
+    FreePixels(c, chunk);
+    EXPECT_EQ(PixelPoolBytes(), chunk);
+    // The pooled chunk does not fit the new size: it leaves to make room.
     uint8_t *d = AllocPixels(other);
-    ASSERT_NE(d, nullptr);
-    EXPECT_EQ(PixelPoolBytes(), 0u);
+    ASSERT_TRUE(d && PixelPoolBytes() == 0u);
     // Full: the reclaimer lets `b` go, which is then reused.
     std::vector<size_t> asked;
     const int id = AddPixelReclaimer([&](size_t wanted) -> size_t {
         asked.push_back(wanted);
         if (!b) return 0;
-        FreePixels(b, block);
+        FreePixels(b, chunk);
         b = nullptr;
-        return block;
+        return chunk;
     });
-    uint8_t *e = AllocPixels(block);
-    ASSERT_NE(e, nullptr);
-    EXPECT_EQ(asked, std::vector<size_t>{other}); // what passes the limit
+    uint8_t *e = AllocPixels(chunk);
+    ASSERT_TRUE(e && asked == std::vector<size_t>{other}); // what passes the limit
     // Nothing more to let go: refused, saying what and the limit, once.
-    EXPECT_EQ(AllocPixels(block), nullptr);
-    EXPECT_EQ(asked.size(), 2u);
+    EXPECT_TRUE(!AllocPixels(chunk) && asked.size() == 2u);
     EXPECT_EQ(TakePixelRefusal(), "needs 4 MiB; --memory-limit is " + FormatBytes(limit) + ", " +
                                       FormatBytes(PixelMemoryInUse()) + " of it in use");
-    EXPECT_EQ(TakePixelRefusal(), "");
-    EXPECT_LE(PixelMemoryPeak(), limit);
+    EXPECT_TRUE(TakePixelRefusal().empty() && PixelMemoryPeak() <= limit);
     RemovePixelReclaimer(id);
-    for (auto [p, n] : {std::pair{a, block}, {d, other}, {e, block}}) FreePixels(p, n);
+    for (auto [p, n] : {std::pair{a, chunk}, {d, other}, {e, chunk}}) FreePixels(p, n);
     EXPECT_EQ(PixelMemoryInUse(), base + PixelPoolBytes());
     // More than the whole limit (a damaged header's size): refused, no reclaimer asked.
-    for (size_t huge : {4 * block, size_t(1) << 62, ~size_t(0)}) EXPECT_EQ(AllocPixels(huge), nullptr);
+    for (size_t huge : {4 * chunk, size_t(1) << 62, ~size_t(0)}) EXPECT_EQ(AllocPixels(huge), nullptr);
     EXPECT_EQ(TakePixelRefusal(), "needs 17179869184 GiB; --memory-limit is " + FormatBytes(limit));
     EXPECT_EQ(asked.size(), 2u);
 }

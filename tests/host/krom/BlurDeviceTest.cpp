@@ -1,16 +1,6 @@
-// The host blur on the device (the common kernels "BlurRows" and
-// "BlurColumns") against its rows, on OpenCL (PoCL on machines without a GPU).
-//
-// Tolerance: both sum the same weights over the same samples, but the rows
-// run boxes as running sums in double and let the compiler fuse
-// multiply-adds, while the kernels sum each tap in order without fusing; over
-// the up to ~120 taps here that moves a float result by a few 1e-7 of the
-// values' size (which reach 1.5), so 1e-5; integer outputs may round the
-// other way at a half code (one code), half floats by one unit in 11 bits.
-#include <cmath>
-
-#include <gtest/gtest.h>
-
+// The blur kernels against the rows. Both sum the same weights over the same samples, but the rows run boxes as
+// running sums in double and fuse multiply-adds, the kernels sum each tap in order: over ~120 taps a float moves
+// by a few 1e-7 of values up to 1.5, so 1e-5; integers may round the other way at a half code, halves by a unit.
 #include "host/image/BlurFilters.h"
 #include "tests/host/image/ImageTestSupport.h"
 #include "tests/host/krom/DeviceTestSupport.h"
@@ -19,7 +9,7 @@ namespace Orvane {
 namespace {
 using namespace ::Orvane::Test;
 
-/// Largest tolerated difference for a depth (see the head of the file).
+/// Largest tolerated difference for a depth.
 double Tolerance(int depth, float value) {
     switch ((depth - 1) % 4) {
     case 0: return 1.0 / 255 + 1e-6;
@@ -67,7 +57,7 @@ TEST(DeviceBlur, EveryFiniteKindAndDepthMatchesTheRows) {
     }
 }
 
-TEST(DeviceBlur, RecursiveKindsInPlaceWorkAndNoDeviceStayOnTheRows) {
+TEST(DeviceBlur, RecursiveKindsInPlaceWorkAndNoDeviceStayOnTheRowsDeviceImagesStayThere) {
     ORVANE_NEED_OPENCL(ctx);
     Ref<Image> src = Source(DepthRGBAFlt32, ImgRectI(0, 0, 57, 41));
     DeviceRender render(ctx), bare(nullptr);
@@ -89,23 +79,17 @@ TEST(DeviceBlur, RecursiveKindsInPlaceWorkAndNoDeviceStayOnTheRows) {
     EXPECT_FALSE(fallback->IsGPUMemDirty());
     EXPECT_TRUE(SameBits(*fallback, *expected));
     EXPECT_EQ(ctx->LaunchCount(), launches);
-}
-
-TEST(DeviceBlur, AnImageMadeOnTheDeviceIsBlurredThere) {
-    // The source's pixels live on the device only (stale main memory): the
-    // kernels read them there, and the result matches the rows' blur of the
-    // downloaded source.
-    ORVANE_NEED_OPENCL(ctx);
-    const ImgRectI window(0, 0, 57, 41);
-    Ref<Image> src = Source(DepthRGBAFlt32, window);
-    DeviceRender render(ctx);
+    // The source's pixels live on the device only: the kernels read them there, and match the rows' blur.
+    const ImgRectI frame(0, 0, 57, 41);
+    Ref<Image> made = Source(DepthRGBAFlt32, frame);
+    DeviceRender onCtx(ctx);
     const TagList second{{BlurFilterType, BlurGaussian}, {BlurYSize, 5.0 / 57}};
-    Ref<Image> onDevice = src->BlurOfImageTagList(render.On({{BlurFilterType, BlurBox}, {BlurXSize, 2.0 / 57}}));
+    Ref<Image> onDevice = made->BlurOfImageTagList(onCtx.On({{BlurFilterType, BlurBox}, {BlurXSize, 2.0 / 57}}));
     ASSERT_TRUE(onDevice && onDevice->IsGPUMemDirty());
-    Ref<Image> twice = onDevice->BlurOfImageTagList(render.On(second));
+    Ref<Image> twice = onDevice->BlurOfImageTagList(onCtx.On(second));
     ASSERT_TRUE(twice && twice->IsGPUMemDirty());
     ASSERT_TRUE(twice->DownloadGPUMem() && onDevice->DownloadGPUMem());
-    EXPECT_LT(MaxDiff(*twice, *onDevice->BlurOfImageTagList(second), window), 1e-5);
+    EXPECT_LT(MaxDiff(*twice, *onDevice->BlurOfImageTagList(second), frame), 1e-5);
 }
 
 } // namespace

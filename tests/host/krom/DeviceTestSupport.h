@@ -1,7 +1,6 @@
 #pragma once
-// The OpenCL device the device tests run on (PoCL on machines without a
-// GPU). Without one the tests skip, unless ORVANE_REQUIRE_DEVICE=opencl says
-// the machine must have it (the test script sets it), when they fail.
+// The OpenCL device the device tests run on (PoCL without a GPU). Without one the tests skip, unless
+// ORVANE_REQUIRE_DEVICE=opencl says the machine must have it, when they fail.
 #include <cstdlib>
 #include <string>
 
@@ -29,8 +28,7 @@ inline IDeviceContext *OpenCLDevice() {
     IDeviceContext *ctx = Orvane::Test::OpenCLDevice();                                                                \
     if (!ctx) GTEST_SKIP() << "no OpenCL device"
 
-/// A render on `ctx` (none when null): the request a host service is handed,
-/// and the tags that ask it to use the device.
+/// A render on `ctx` (none when null): the request a host service is handed, and the tags asking for the device.
 struct DeviceRender {
     RenderTask task;
     Request req{nullptr, nullptr, 0.0, 0, &task};

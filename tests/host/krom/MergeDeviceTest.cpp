@@ -1,15 +1,5 @@
-// The "Merge" kernel against the merge's rows: every mode the kernel has,
-// every Normal operator, blend, additive, alpha gain, burn in and channels,
-// windows that overlap unevenly, a placed foreground, all depths. The kernel
-// does the rows' float arithmetic in their order, so float results are the
-// rows' bits. Integer results agree to one code: the device stores v x 255
-// (or 65535) + 1/2 rounded in float, the rows in double, which parts the two
-// on values that fall on a half code (an alpha gain of 0.7 over opaque
-// pixels gives 0.7 x 65535 = 45874.5, for one).
-#include <gtest/gtest.h>
-
-#include <string>
-
+// The merge kernel against the rows. It does the rows' float arithmetic in their order: float results are the
+// rows' bits; integers agree to one code, as the device rounds v x 65535 + 1/2 in float (0.7 x 65535 = 45874.5).
 #include "host/image/MergeModes.h"
 #include "tests/host/image/ImageTestSupport.h"
 #include "tests/host/krom/DeviceTestSupport.h"
@@ -18,13 +8,9 @@ namespace Orvane::mergedevicetest {
 namespace {
 using namespace ::Orvane::Test;
 
-TEST(DeviceMerge, TheKernelGivesTheRowsBits) {
+TEST(DeviceMerge, TheKernelGivesTheRowsBitsAndModesWithoutOneRunTheRows) {
     ORVANE_NEED_OPENCL(ctx);
-    const struct {
-        int mode, op;
-        double blend, additive, gain, burn;
-        bool red, alpha;
-    } cases[] = {
+    const std::tuple<int, int, double, double, double, double, bool, bool> cases[] = {
         {MrgNormal, MrgOver, 1, 0, 1, 0, true, true},      {MrgNormal, MrgIn, 1, 0, 1, 0, true, true},
         {MrgNormal, MrgHeldOut, 0.6, 0, 1, 0, true, true}, {MrgNormal, MrgAtop, 1, 0.4, 0.5, 0.2, true, true},
         {MrgNormal, MrgXOr, 1, 0, 1, 0, false, true},      {MrgScreen, 0, 1, 0, 1, 0, true, true},
@@ -37,13 +23,12 @@ TEST(DeviceMerge, TheKernelGivesTheRowsBits) {
     for (int depth : {DepthRGBAFlt32, DepthRGBAFlt16, DepthRGBAInt16, DepthRGBAInt8, DepthAFlt32}) {
         Ref<Image> fg = PatternAt(29, 17, depth, 3, &fw), bg = PatternAt(37, 21, depth, 4, &bw);
         bg->SetCanvasColor(FltPixel{0.1f, 0.2f, 0.3f, 0.5f});
-        for (const auto &c : cases) {
-            SCOPED_TRACE("depth " + std::to_string(depth) + " mode " + std::to_string(c.mode) + " op " +
-                         std::to_string(c.op));
-            const TagList tags{{MrgApplyMode, c.mode},    {MrgOperator, c.op},    {MrgBlend, c.blend},
-                               {MrgAdditive, c.additive}, {MrgAlphaGain, c.gain}, {MrgBurnIn, c.burn},
-                               {MrgDoRed, c.red},         {MrgDoAlpha, c.alpha},  {MrgFgOffsetX, 5},
-                               {MrgFgOffsetY, -4}};
+        for (const auto &[mode, op, blend, additive, gain, burn, red, alpha] : cases) {
+            SCOPED_TRACE("depth " + std::to_string(depth) + " mode " + std::to_string(mode) + " op " +
+                         std::to_string(op));
+            const TagList tags{{MrgApplyMode, mode}, {MrgOperator, op}, {MrgBlend, blend}, {MrgAdditive, additive},
+                               {MrgAlphaGain, gain}, {MrgBurnIn, burn}, {MrgDoRed, red},   {MrgDoAlpha, alpha},
+                               {MrgFgOffsetX, 5},    {MrgFgOffsetY, -4}};
             const MergeSettings s = MergeSettings::FromTags(tags);
             ASSERT_TRUE(MergeKernelSupports(s));
             ImgRectI placed = fw;
@@ -63,10 +48,7 @@ TEST(DeviceMerge, TheKernelGivesTheRowsBits) {
                 EXPECT_LE(MaxDiff(*dev, *cpu, out), (depth == DepthRGBAInt8 ? 1 / 255.0 : 1 / 65535.0) + 1e-7);
         }
     }
-}
-
-TEST(DeviceMerge, ModesWithoutAKernelRunTheRows) {
-    ORVANE_NEED_OPENCL(ctx);
+    // Modes without a kernel run the rows.
     Ref<Image> fg = PatternImage(8, 6, DepthRGBAFlt32, 5), bg = PatternImage(8, 6, DepthRGBAFlt32, 6);
     for (int mode : {MrgDissolve, MrgOverlay, MrgSoftLight, MrgColorDodge, MrgHue, MrgLuminosity}) {
         const TagList tags{{MrgApplyMode, mode}};
