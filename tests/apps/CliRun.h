@@ -1,6 +1,8 @@
 #pragma once
 // Running the orvane command line as a separate process, the way scripts
 // and render farms run it, for the command-line tests.
+#include <gtest/gtest.h>
+
 #include <cstdlib>
 #include <filesystem>
 #include <fstream>
@@ -53,11 +55,12 @@ private:
     static inline int counter_ = 0;
 };
 
-/// Runs `orvane ARGS` (shell words) with no input; its exit code and output.
+/// Runs `orvane ARGS` (shell words) with no input, for 30 s at most (exit code 124: it was still running); its
+/// exit code and output.
 inline CliRun Orvane(const std::string &args) {
     TempDir dir;
     const auto outFile = dir.Path() / "out", errFile = dir.Path() / "err";
-    const std::string cmd = Quote(std::string(ORVANE_BINARY_DIR) + "/orvane") + " " + args + " >" +
+    const std::string cmd = "timeout 30 " + Quote(std::string(ORVANE_BINARY_DIR) + "/orvane") + " " + args + " >" +
                             Quote(outFile.string()) + " 2>" + Quote(errFile.string()) + " </dev/null";
     const int status = std::system(cmd.c_str());
     CliRun r;
@@ -68,5 +71,11 @@ inline CliRun Orvane(const std::string &args) {
 }
 
 inline bool Contains(const std::string &text, const std::string &part) { return text.find(part) != std::string::npos; }
+
+/// Contains, showing the whole text when the part is missing.
+inline ::testing::AssertionResult Has(const std::string &text, const std::string &part) {
+    if (Contains(text, part)) return ::testing::AssertionSuccess();
+    return ::testing::AssertionFailure() << "no \"" << part << "\" in:\n" << text;
+}
 
 } // namespace Orvane::clitest

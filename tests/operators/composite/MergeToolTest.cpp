@@ -1,18 +1,11 @@
-// Merge and MultiMerge: the background's transform handed on, foreground
-// placement on known images against hand-computed pixel positions, the
-// background's pending transform surviving with one resampling per source,
-// the reference size and frame format, pre-calculation windows, MultiMerge's
-// layer order, enabled switches, a LayerOrder that is no table, Blend's two
-// ways, and an over against oiiotool.
+// Merge and MultiMerge: placement against hand-computed pixel positions, pending transforms resampled once per
+// source, windows, layer order and switches, blends, and an over against oiiotool.
 #include <gtest/gtest.h>
 
 #include <algorithm>
 #include <cmath>
-#include <cstdlib>
 #include <cstring>
-#include <fstream>
 #include <functional>
-#include <iterator>
 #include <string>
 #include <vector>
 
@@ -61,10 +54,11 @@ Ref<Image> Solid(int w, int h, FltPixel c) {
     return img;
 }
 
-Ref<Image> Render(Operator *op, RenderTask *task = nullptr) {
+Ref<Image> Render(Operator *op, RenderTask *task = nullptr, uint32_t flags = 0) {
     EvalOptions opt;
     opt.useCache = false;
     opt.task = task;
+    opt.flags = flags;
     Ref<Parameter> p = Evaluate(op->FindMainOutput(), 0.0, opt);
     return Ref<Image>(dynamic_cast<Image *>(p.Get()));
 }
@@ -133,43 +127,28 @@ TEST_F(MergeTool, PlacesTheForegroundByItsControlsAndItsPixelAspect) {
     // at (8 + i, 4 + j). Twice the size with the nearest pixel: every pixel
     // becomes 2 x 2, the block still centred: (6 + 2i, 3 + 2j).
     struct Case {
-        const char *what;
         std::vector<std::pair<const char *, double>> controls;
         double cx, cy, fgAspect;
         int x0, y0, sx, sy; ///< pixel (i, j) covers (x0 + sx i, y0 + sy j), sx x sy pixels
-        bool flipX, flipY, turn;
+        char how;           ///< 'x', 'y': flipped that way; 't': turned
     };
     const Case cases[] = {
-        {"defaults", {}, 0.5, 0.5, 1, 8, 4, 1, 1, false, false, false},
-        {"centre (5, 7)", {}, 0.25, 0.7, 1, 3, 6, 1, 1, false, false, false},
-        {"flip horizontal", {{"FlipHoriz", 1}}, 0.5, 0.5, 1, 8, 4, 1, 1, true, false, false},
-        {"flip vertical", {{"FlipVert", 1}}, 0.5, 0.5, 1, 8, 4, 1, 1, false, true, false},
-        // A quarter turn anticlockwise about the centre: the centre of pixel
-        // (i, j), (i - 1.5, j - 0.5) from the middle, goes to (0.5 - j, i - 1.5),
-        // so pixel (i, j) lands on (10 - j, 3 + i).
-        {"quarter turn", {{"Angle", 90}}, 0.5, 0.5, 1, 0, 0, 1, 1, false, false, true},
-        {"size 2", {{"Size", 2}, {"FilterMethod", 0}}, 0.5, 0.5, 1, 6, 3, 2, 2, false, false, false},
-        {"x size 2", {{"XSize", 2}, {"FilterMethod", 0}}, 0.5, 0.5, 1, 6, 4, 2, 1, false, false, false},
-        // Pixels twice as wide as high on square-pixel ones cover two across.
-        {"pixel aspect 2", {{"FilterMethod", 0}}, 0.5, 0.5, 2, 6, 4, 2, 1, false, false, false},
-        // Made for a frame half the background's size: twice the size, but
-        // only when the reference size is used.
-        {"reference size unused", {{"Width", 10}, {"Height", 5}}, 0.5, 0.5, 1, 8, 4, 1, 1, false, false, false},
-        {"reference size",
-         {{"Width", 10}, {"Height", 5}, {"UseReferenceSize", 1}, {"FilterMethod", 0}},
-         0.5,
-         0.5,
-         1,
-         6,
-         3,
-         2,
-         2,
-         false,
-         false,
-         false},
+        {{}, 0.5, 0.5, 1, 8, 4, 1, 1, ' '},
+        {{}, 0.25, 0.7, 1, 3, 6, 1, 1, ' '}, // centred on (5, 7)
+        {{{"FlipHoriz", 1}}, 0.5, 0.5, 1, 8, 4, 1, 1, 'x'},
+        {{{"FlipVert", 1}}, 0.5, 0.5, 1, 8, 4, 1, 1, 'y'},
+        // A quarter turn anticlockwise about the centre: the centre of pixel (i, j), (i - 1.5, j - 0.5) from
+        // the middle, goes to (0.5 - j, i - 1.5), so pixel (i, j) lands on (10 - j, 3 + i).
+        {{{"Angle", 90}}, 0.5, 0.5, 1, 0, 0, 1, 1, 't'},
+        {{{"Size", 2}, {"FilterMethod", 0}}, 0.5, 0.5, 1, 6, 3, 2, 2, ' '},
+        {{{"XSize", 2}, {"FilterMethod", 0}}, 0.5, 0.5, 1, 6, 4, 2, 1, ' '},
+        {{{"FilterMethod", 0}}, 0.5, 0.5, 2, 6, 4, 2, 1, ' '}, // pixels twice as wide cover two across
+        // Made for a frame half the background's size: twice the size, only when the reference size is used.
+        {{{"Width", 10}, {"Height", 5}}, 0.5, 0.5, 1, 8, 4, 1, 1, ' '},
+        {{{"Width", 10}, {"Height", 5}, {"UseReferenceSize", 1}, {"FilterMethod", 0}}, 0.5, 0.5, 1, 6, 3, 2, 2, ' '},
     };
     for (const Case &c : cases) {
-        SCOPED_TRACE(c.what);
+        SCOPED_TRACE(&c - cases);
         Ref<Image> fgImage = Numbered(4, 2, 0.5f, c.fgAspect);
         MergeFlow f(Solid(20, 10, kGrey), fgImage);
         SetNumbers(f.merge, c.controls);
@@ -178,10 +157,10 @@ TEST_F(MergeTool, PlacesTheForegroundByItsControlsAndItsPixelAspect) {
         ASSERT_TRUE(out);
         EXPECT_EQ(out->Width(), 20);
         EXPECT_TRUE(Pixels(*out, [&](int x, int y) {
-            int i = c.turn ? y - 3 : (x - c.x0) / c.sx, j = c.turn ? 10 - x : (y - c.y0) / c.sy;
-            if (!c.turn && (x < c.x0 || y < c.y0)) return kGrey;
-            if (i < 0 || i >= 4 || j < 0 || j >= 2) return kGrey;
-            return fgImage->GetFlt(c.flipX ? 3 - i : i, c.flipY ? 1 - j : j);
+            const bool turn = c.how == 't';
+            int i = turn ? y - 3 : (x - c.x0) / c.sx, j = turn ? 10 - x : (y - c.y0) / c.sy;
+            if ((!turn && (x < c.x0 || y < c.y0)) || i < 0 || i >= 4 || j < 0 || j >= 2) return kGrey;
+            return fgImage->GetFlt(c.how == 'x' ? 3 - i : i, c.how == 'y' ? 1 - j : j);
         }));
     }
 }
@@ -219,12 +198,9 @@ TEST_F(MergeTool, TheDomainIsTheUnionOfBothWindows) {
     Ref<Image> fgImage = Numbered(4, 2, 0.5f);
     MergeFlow f(Solid(20, 10, kGrey), fgImage);
     SetPoint(f.merge, "Center", 1.0, 1.0); // centre at (20, 10): pixels (18..21, 9..10)
-    EvalOptions pre;
-    pre.flags = ReqFlagPreCalc;
-    Ref<Parameter> shape = Evaluate(f.merge->FindMainOutput(), 0.0, pre);
-    auto *img = dynamic_cast<Image *>(shape.Get());
-    ASSERT_TRUE(img && img->IsNoData());
-    EXPECT_EQ(img->DataWindow(), ImgRectI(0, 0, 22, 11));
+    Ref<Image> shape = Render(f.merge, nullptr, ReqFlagPreCalc);
+    ASSERT_TRUE(shape && shape->IsNoData());
+    EXPECT_EQ(shape->DataWindow(), ImgRectI(0, 0, 22, 11));
     Ref<Image> out = Render(f.merge);
     ASSERT_TRUE(out);
     EXPECT_EQ(out->DataWindow(), ImgRectI(0, 0, 22, 11));
@@ -408,10 +384,7 @@ TEST_F(MergeTool, MultiMergeLaysTheLayersInTheListsOrderAndSkipsDisabledOnes) {
     EXPECT_EQ(LayerOrderOf(f.mm), (std::vector<int>{2, 1, 0, -3})) << "it stays in the list";
     SetNumber(f.mm, "LayerEnabled2", 0.5); // rounds to 1
     EXPECT_EQ(Render(f.mm)->GetFlt(12, 4), f.b->GetFlt(2, 0));
-}
-
-TEST_F(MergeTool, MultiMergeWithoutATableOrderHandsOnTheBackground) {
-    MultiFlow f;
+    // A LayerOrder that is no table, or an empty one, hands on the Background itself.
     ASSERT_TRUE(f.mm->FindInput("LayerOrder")->SetValue(MakeRef<ScriptValue>(ScriptVal(2.0))));
     EXPECT_EQ(Render(f.mm).Get(), f.bgImage.Get()) << "the Background itself, not a copy";
     f.Order({});
@@ -445,19 +418,9 @@ TEST_F(MergeTool, MultiMergeBlendMixesTheStackBackOverTheBackground) {
 
 TEST_F(MergeTool, MultiMergeLayersComeBackWithTheDocument) {
     // Values of layer inputs in a document, whatever order they come in.
-    const char *text = R"(Orvane.Document {
-	Tools = {
-		Back = Background { Inputs = { Width = 20, Height = 10 } },
-		MM = MultiMerge {
-			Inputs = {
-				["Layer3.Size"] = 2,
-				LayerName3 = "Third",
-				LayerOrder = { 3 },
-				Background = Back.Output,
-			},
-		},
-	},
-})";
+    const char *text = R"(Orvane.Document { Tools = { Back = Background { Inputs = { Width = 20, Height = 10 } },
+        MM = MultiMerge { Inputs = { ["Layer3.Size"] = 2, LayerName3 = "Third", LayerOrder = { 3 },
+                                     Background = Back.Output } } } })";
     OrvaneDoc doc;
     DocumentLoadResult r = LoadDocument(text, doc);
     ASSERT_TRUE(r.ok) << r.error;
@@ -470,7 +433,7 @@ TEST_F(MergeTool, MultiMergeLayersComeBackWithTheDocument) {
 }
 
 TEST_F(MergeTool, OverAgreesWithOiiotool) {
-    if (std::system("command -v oiiotool > /dev/null 2>&1") != 0) GTEST_SKIP() << "oiiotool is not installed";
+    if (!FmtTest::HaveProgram("oiiotool")) GTEST_SKIP() << "oiiotool is not installed";
     // Both full frame, the foreground with alphas across 0..1 and colours
     // above 1, so that the hold-out and the add both show.
     Ref<Image> fgImage = Orvane::Test::PatternImage(33, 17, DepthRGBAFlt32, 11);
@@ -481,20 +444,12 @@ TEST_F(MergeTool, OverAgreesWithOiiotool) {
             p.A = std::clamp(p.A, 0.f, 1.f); // premultiplied data in the usual range of alpha
             fgImage->PutFlt(x, y, p);
         }
-    const std::string dir = ::testing::TempDir() + "merge_oiio_" + std::to_string(::getpid());
-    std::system(("mkdir -p " + dir).c_str());
-    auto save = [&](Image *img, const std::string &path) {
-        const FmtTest::Bytes bytes = FmtTest::Save("OpenEXRFormat", img);
-        std::ofstream(path, std::ios::binary).write(reinterpret_cast<const char *>(bytes.data()), bytes.size());
-    };
-    save(fgImage.Get(), dir + "/fg.exr");
-    save(bgImage.Get(), dir + "/bg.exr");
-    const std::string cmd =
-        "oiiotool " + dir + "/fg.exr " + dir + "/bg.exr --over -d float -o " + dir + "/over.exr > /dev/null 2>&1";
-    ASSERT_EQ(std::system(cmd.c_str()), 0) << cmd;
-    std::ifstream file(dir + "/over.exr", std::ios::binary);
-    const FmtTest::Bytes bytes((std::istreambuf_iterator<char>(file)), std::istreambuf_iterator<char>());
-    FmtTest::LoadResult theirs = FmtTest::Load("OpenEXRFormat", bytes);
+    const Orvane::Test::TempDir dir;
+    FmtTest::WriteFile(dir / "fg.exr", FmtTest::Save("OpenEXRFormat", fgImage.Get()));
+    FmtTest::WriteFile(dir / "bg.exr", FmtTest::Save("OpenEXRFormat", bgImage.Get()));
+    ASSERT_TRUE(FmtTest::RunShell("oiiotool " + (dir / "fg.exr") + " " + (dir / "bg.exr") + " --over -d float -o " +
+                                  (dir / "over.exr") + " >/dev/null"));
+    FmtTest::LoadResult theirs = FmtTest::Load("OpenEXRFormat", FmtTest::ReadFile(dir / "over.exr"));
     ASSERT_TRUE(theirs.image) << theirs.error;
 
     MergeFlow f(bgImage, fgImage);
@@ -505,7 +460,6 @@ TEST_F(MergeTool, OverAgreesWithOiiotool) {
     // on their side): one rounding step of values up to 2, well below 1e-6.
     EXPECT_TRUE(Pixels(
         *ours, [&](int x, int y) { return theirs.image->GetFlt(x, y); }, 1e-6f));
-    std::system(("rm -rf " + dir).c_str());
 }
 
 } // namespace

@@ -1,7 +1,5 @@
-// The switches: which input is handed on (the very object, for images, 3D
-// values and pending transforms alike), that the others are not rendered,
-// the failures with their console lines, and how positions grow and survive
-// a document round trip.
+// The switches: the very object of the chosen input handed on (images, 3D values, pending transforms), the
+// others not rendered, failures with their console lines, positions growing and surviving a document.
 #include <gtest/gtest.h>
 
 #include <string>
@@ -168,41 +166,31 @@ TEST_F(SwitchTest, PreCalculationRegionsAndSkipRoIFollowTheChosenInput) {
 TEST_F(SwitchTest, ASourceOutsideTheInputsOrUnconnectedFailsWithOneLine) {
     Operator *sw = MakeSwitch(3);
     ASSERT_NE(sw, nullptr);
+    // Fewer inputs than positions made: the range follows NumberOfInputs. A chosen position without a link
+    // fails in pre-calculation too.
+    const std::string to = " - the switch tool tried to switch to a non-existant input ",
+                      only = " (currently inputs only exist for the range [0, ";
     const struct {
-        double source, time;
-        const char *line;
+        double inputs, source, time;
+        uint32_t flags;
+        std::string line;
     } cases[] = {
-        {3, 0,
-         "Switch1 failed at time 0.0 - the switch tool tried to switch to a non-existant input 3 (currently "
-         "inputs only exist for the range [0, 2])"},
-        {-1, 12.3,
-         "Switch1 failed at time 12.3 - the switch tool tried to switch to a non-existant input -1 "
-         "(currently inputs only exist for the range [0, 2])"},
+        {3, 3, 0, 0, "Switch1 failed at time 0.0" + to + "3" + only + "2])"},
+        {3, -1, 12.3, 0, "Switch1 failed at time 12.3" + to + "-1" + only + "2])"},
+        {2, 2, 0, 0, "Switch1 failed at time 0.0" + to + "2" + only + "1])"},
+        {4, 3, 7, 0, "Switch1.Input3 failed at time 7.0 - unconnected input"},
+        {4, 3, 7, ReqFlagPreCalc, "Switch1.Input3 failed at time 7.0 - unconnected input"},
     };
     for (const auto &c : cases) {
-        SCOPED_TRACE(c.source);
-        ts::SetNumber(sw, "Source", c.source);
+        SCOPED_TRACE(c.line);
+        ts::SetNumbers(sw, {{"NumberOfInputs", c.inputs}, {"Source", c.source}});
         doc->ClearConsole();
         const std::vector<int> before = Counts();
-        EXPECT_EQ(Eval(sw, c.time), nullptr);
+        EXPECT_EQ(Eval(sw, c.time, c.flags), nullptr);
         EXPECT_EQ(Lines(), std::vector<std::string>{c.line});
         EXPECT_EQ(Counts(), before) << "a failing switch renders none of its inputs";
     }
-    // Fewer inputs than positions made: the range follows NumberOfInputs.
-    ts::SetNumbers(sw, {{"NumberOfInputs", 2}, {"Source", 2}});
-    doc->ClearConsole();
-    EXPECT_EQ(Eval(sw), nullptr);
-    EXPECT_EQ(Lines(), std::vector<std::string>{"Switch1 failed at time 0.0 - the switch tool tried to switch to a "
-                                                "non-existant input 2 (currently inputs only exist for the range "
-                                                "[0, 1])"});
-    // A chosen position without a link fails in pre-calculation too; one
-    // that is not chosen is no failure.
-    ts::SetNumbers(sw, {{"NumberOfInputs", 4}, {"Source", 3}});
-    for (uint32_t flags : {0u, ReqFlagPreCalc}) {
-        doc->ClearConsole();
-        EXPECT_EQ(Eval(sw, 7.0, flags), nullptr);
-        EXPECT_EQ(Lines(), std::vector<std::string>{"Switch1.Input3 failed at time 7.0 - unconnected input"});
-    }
+    // A position without a link that is not chosen is no failure.
     ts::SetNumber(sw, "Source", 1);
     doc->ClearConsole();
     EXPECT_NE(Eval(sw, 7.0), nullptr);

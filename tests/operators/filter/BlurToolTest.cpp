@@ -1,8 +1,6 @@
-// The Blur tool in the processing frame: its controls, the filter table, the
-// windows it makes and asks for under each clipping mode, the pass-through,
-// Lock X/Y, passes and blend. Expected pixels come from the host call made
-// here with the request the tool is meant to send (the host blur itself is
-// tested against direct convolutions in BlurTest.cpp).
+// The Blur tool: controls, filter table, windows under each clipping mode, pass-through, Lock X/Y, passes and
+// blend. Expected pixels come from the host blur called with the request the tool should send (BlurTest.cpp
+// checks that against direct convolutions).
 #include <optional>
 #include <string>
 #include <tuple>
@@ -134,7 +132,7 @@ TEST_F(BlurTool, NothingToDoHandsTheInputOn) {
     EXPECT_EQ(Render(blur).Get(), empty.Get());
 }
 
-TEST_F(BlurTool, WindowsUnderEachClippingMode) {
+TEST_F(BlurTool, WindowsUnderEachClippingModeAndForUnboundedKinds) {
     // A data window reaching past the frame on the left and bottom, inside it
     // elsewhere: frame 64 x 32, Box of 5 pixels across and 3 down (unlocked).
     const ImgRectI frame(0, 0, 64, 32), dw(-8, -4, 50, 26), roi(30, 10, 70, 20);
@@ -172,14 +170,9 @@ TEST_F(BlurTool, WindowsUnderEachClippingMode) {
         EXPECT_EQ(probe->asked[0]->rect, c.asked);
         EXPECT_TRUE(IsHostBlur(part, img.Get(), BlurBox, Sent(5, 64), Sent(3, 64), c.source));
     }
-}
-
-TEST_F(BlurTool, UnboundedKindsKeepTheFrameAndAskForTheWholeInput) {
-    const ImgRectI frame(0, 0, 64, 32), dw(-8, -4, 50, 26);
-    Ref<Image> img = Source(64, 32, dw);
-    Operator *blur = Make(img);
+    // Unbounded kinds keep the frame and ask for the whole input.
     ts::SetID(blur, "Filter", "VYV N=5 Gau");
-    ts::SetNumber(blur, "XBlurSize", Control(4, 64));
+    ts::SetNumbers(blur, {{"LockXY", 1}, {"XBlurSize", Control(4, 64)}});
     for (const char *mode : {"ClippingMode_Frame", "ClippingMode_Domain", "ClippingMode_None"}) {
         SCOPED_TRACE(mode);
         ts::SetID(blur, "ClippingMode", mode);
@@ -195,7 +188,7 @@ TEST_F(BlurTool, UnboundedKindsKeepTheFrameAndAskForTheWholeInput) {
     }
 }
 
-TEST_F(BlurTool, PassesLockAndChannelsReachTheHost) {
+TEST_F(BlurTool, PassesLockChannelsAndBlendReachThePixels) {
     const ImgRectI frame(0, 0, 50, 40);
     Ref<Image> img = Source(50, 40, frame);
     Operator *blur = Make(img);
@@ -209,16 +202,8 @@ TEST_F(BlurTool, PassesLockAndChannelsReachTheHost) {
     EXPECT_FALSE(IsHostBlur(got, img.Get(), BlurMultiBox, Sent(6, 50), Sent(6, 50), frame, four));
     EXPECT_EQ(got->GetFlt(20, 20).G, img->GetFlt(20, 20).G) << "green is off";
     ts::SetNumber(blur, "LockXY", 0);
-    EXPECT_TRUE(IsHostBlur(Render(blur), img.Get(), BlurMultiBox, Sent(6, 50), Sent(2, 50), frame, two));
-}
-
-TEST_F(BlurTool, BlendCountsOnce) {
-    // Blend b gives source + (blur - source) b, whether it is set on the
-    // common page or on the tool's own; both together multiply.
-    Ref<Image> img = Source(40, 30, ImgRectI(0, 0, 40, 30));
-    Operator *blur = Make(img);
-    ts::SetID(blur, "Filter", "Gaussian");
-    ts::SetNumber(blur, "XBlurSize", Control(4, 40));
+    // Blend b gives source + (blur - source) b, whether it is set on the common page or on the tool's own; both
+    // together multiply.
     Ref<Image> full = Render(blur);
     for (auto [blend, clone, b] : {std::tuple{0.5, 1.0, 0.5}, {1.0, 0.25, 0.25}, {0.5, 0.25, 0.125}}) {
         ts::SetNumbers(blur, {{"Blend", blend}, {"BlendClone", clone}});
