@@ -29,6 +29,15 @@ std::string GradientFlow(const fs::path &dir, const std::string &extra = {}) {
     return SaverFlow({{"Out", (dir / "out/f.####.png").string(), ", CreateDir = 1" + extra}});
 }
 
+/// A flow (of these document settings) copying `dir`/out/f.0001.png through a Loader (with more inputs) to
+/// numbered TGA files in `dir`/copy.
+std::string CopyFlow(const fs::path &dir, const std::string &settings, const std::string &more) {
+    return "Orvane.Document { Version = 1" + settings + ", Tools = {\n  In = Loader { Inputs = { Clip = \"" +
+           (dir / "out/f.0001.png").string() + "\", GlobalIn = 1" + more +
+           " } },\n  Out = Saver { Inputs = { Clip = \"" + (dir / "copy/c.####.tga").string() +
+           "\", CreateDir = 1, Input = In.Output } },\n} }\n";
+}
+
 /// `orvane render FLOW ARGS`.
 CliRun Render(const fs::path &flow, const std::string &args = "") {
     return Orvane("render " + Quote(flow.string()) + args);
@@ -45,8 +54,19 @@ std::vector<std::string> Temporaries(const fs::path &dir) {
 
 TEST(CliRender, WritesEveryFrameAndReportsIt) {
     TempDir dir;
+    fs::create_directories(dir.Path() / "out");
+    // Temporaries left by a killed render on another machine, untouched for two hours: the render's own go,
+    // another output's stay.
+    const fs::path stale = dir.Path() / "out/.f.0002.png.orvane-tmp-farm7-4242";
+    const fs::path other = dir.Path() / "out/.g.0002.png.orvane-tmp-farm7-4242";
+    for (const fs::path &p : {stale, other}) {
+        std::ofstream(p) << "half a frame";
+        fs::last_write_time(p, fs::file_time_type::clock::now() - std::chrono::hours(2));
+    }
     const auto flow = dir.File("a.flow", GradientFlow(dir.Path()));
     const CliRun r = Render(flow, " --frames 3,1-2");
+    EXPECT_FALSE(fs::exists(stale));
+    EXPECT_TRUE(fs::exists(other));
     EXPECT_EQ(r.exitCode, 0) << r.err;
     EXPECT_EQ(r.out.rfind("RENDER saver=Out files=" + (dir.Path() / "out/f.####.png").string() +
                               " frames=1-3 format=PNGFormat\n",
@@ -127,18 +147,6 @@ TEST(CliRender, RefusesBeforeTheFirstFrameToWriteOneFileTwice) {
         << json.out;
 }
 
-TEST(CliRender, ReplacesOnlyRegularFiles) {
-    TempDir dir;
-    const fs::path pipe = dir.Path() / "pipe.png";
-    ASSERT_EQ(mkfifo(pipe.c_str(), 0600), 0);
-    const auto flow = dir.File("a.flow", SaverFlow({{"Out", pipe.string(), ""}}));
-    const CliRun r = Render(flow, " --frames 1");
-    EXPECT_EQ(r.exitCode, 2) << r.err;
-    EXPECT_TRUE(Has(r.err, "ERROR: Saver Out, frame 1: " + pipe.string() +
-                               ": a FIFO, not a regular file; refusing to write over it; nothing was written"));
-    EXPECT_TRUE(fs::is_fifo(pipe));
-}
-
 TEST(CliRender, EventsCarryTheirFactsInFields) {
     TempDir dir;
     // An Output Format that is not the extension's writes, with a warning naming both.
@@ -216,28 +224,41 @@ TEST(CliRender, TheOpenCLDeviceWritesTheSameFilesAsTheCPU) {
 TEST(CliRender, BadRequestsAndFailedFramesHaveTheirExitCodes) {
     TempDir dir;
     const auto flow = dir.File("a.flow", GradientFlow(dir.Path()));
-    EXPECT_EQ(Render(flow, " --frames 1-x").exitCode, 2);
-    EXPECT_EQ(Render(flow, " --saver Bg").exitCode, 2);
-    EXPECT_EQ(Render(flow, " --memory-limit lots").exitCode, 2);
-    EXPECT_EQ(Render(flow, " --chunk 3/2").exitCode, 2);
-    const auto none = dir.File("none.flow", "Orvane.Document { Version = 1, Tools = { Bg = Background {} } }\n");
-    const CliRun noSaver = Render(none);
-    EXPECT_EQ(noSaver.exitCode, 2);
-    EXPECT_TRUE(Has(noSaver.err, "has no Saver"));
-    const auto nameless = dir.File("nameless.flow", SaverFlow({{"Out", "", ""}}));
-    const CliRun noName = Render(nameless);
-    EXPECT_EQ(noName.exitCode, 2);
-    EXPECT_TRUE(Has(noName.err, "ERROR: Saver Out has no file name to write to"));
+    const fs::path pipe = dir.Path() / "pipe.png";
+    ASSERT_EQ(mkfifo(pipe.c_str(), 0600), 0);
+    const struct {
+        fs::path flow;
+        const char *args;
+        int exitCode;
+        std::string message;
+    } bad[] = {
+        {flow, " --frames 1-x", 2, ""},
+        {flow, " --saver Bg", 2, ""},
+        {flow, " --memory-limit lots", 2, ""},
+        {flow, " --chunk 3/2", 2, ""},
+        {dir.File("none.flow", "Orvane.Document { Version = 1, Tools = { Bg = Background {} } }\n"), "", 2,
+         "has no Saver"},
+        {dir.File("nameless.flow", SaverFlow({{"Out", "", ""}})), "", 2,
+         "ERROR: Saver Out has no file name to write to"},
+        // Only regular files are replaced.
+        {dir.File("pipe.flow", SaverFlow({{"Out", pipe.string(), ""}})), " --frames 1", 2,
+         "ERROR: Saver Out, frame 1: " + pipe.string() +
+             ": a FIFO, not a regular file; refusing to write over it; nothing was written"},
+        // A folder that does not exist fails each frame, naming the file once.
+        {dir.File("c.flow", SaverFlow({{"Out", (dir.Path() / "none/x.####.png").string(), ""}})), " --frames 4", 3,
+         "ERROR: frame 4 saver=Out: Out failed to write " + (dir.Path() / "none/x.0004.png").string() +
+             ": the folder does not exist\n"},
+    };
+    for (const auto &b : bad) {
+        const CliRun r = Render(b.flow, b.args);
+        EXPECT_EQ(r.exitCode, b.exitCode) << b.flow << b.args;
+        EXPECT_TRUE(Has(r.err, b.message));
+    }
+    EXPECT_TRUE(fs::is_fifo(pipe));
 
     // A Loader whose frame 2 is missing: that frame fails, the others are written.
     ASSERT_EQ(Render(flow, " --frames 1,3").exitCode, 0);
-    const auto chain = dir.File("b.flow", "Orvane.Document { Version = 1, RenderRange = { 1, 3 }, Tools = {\n"
-                                          "  In = Loader { Inputs = { Clip = \"" +
-                                              (dir.Path() / "out/f.0001.png").string() +
-                                              "\", GlobalIn = 1 } },\n"
-                                              "  Out = Saver { Inputs = { Clip = \"" +
-                                              (dir.Path() / "copy/c.####.tga").string() +
-                                              "\", CreateDir = 1, Input = In.Output } },\n} }\n");
+    const auto chain = dir.File("b.flow", CopyFlow(dir.Path(), ", RenderRange = { 1, 3 }", ""));
     const CliRun failed = Render(chain);
     EXPECT_EQ(failed.exitCode, 3) << failed.out << failed.err;
     EXPECT_TRUE(Has(failed.err, "ERROR: frame 2 saver=Out: In failed to load file"));
@@ -251,28 +272,6 @@ TEST(CliRender, BadRequestsAndFailedFramesHaveTheirExitCodes) {
                               "\"Out\", \"tool\": \"In\", \"file\": \"" +
                                   (dir.Path() / "copy/c.0002.tga").string() +
                                   "\", \"error\": \"frame 2 saver=Out: In failed to load file"));
-    // A folder that does not exist fails each frame, naming the file once.
-    const auto noFolder = dir.File("c.flow", SaverFlow({{"Out", (dir.Path() / "none/x.####.png").string(), ""}}));
-    const CliRun missing = Render(noFolder, " --frames 4");
-    EXPECT_EQ(missing.exitCode, 3);
-    EXPECT_TRUE(Has(missing.err, "ERROR: frame 4 saver=Out: Out failed to write " +
-                                     (dir.Path() / "none/x.0004.png").string() + ": the folder does not exist\n"));
-}
-
-TEST(CliRender, TemporariesOfAKilledRenderGoAtTheNextRender) {
-    TempDir dir;
-    fs::create_directories(dir.Path() / "out");
-    // Left by a render on another machine, untouched for two hours, and one of another output.
-    const fs::path stale = dir.Path() / "out/.f.0002.png.orvane-tmp-farm7-4242";
-    const fs::path other = dir.Path() / "out/.g.0002.png.orvane-tmp-farm7-4242";
-    for (const fs::path &p : {stale, other}) {
-        std::ofstream(p) << "half a frame";
-        fs::last_write_time(p, fs::file_time_type::clock::now() - std::chrono::hours(2));
-    }
-    const auto flow = dir.File("a.flow", GradientFlow(dir.Path()));
-    ASSERT_EQ(Render(flow, " --frames 1").exitCode, 0);
-    EXPECT_FALSE(fs::exists(stale));
-    EXPECT_TRUE(fs::exists(other));
 }
 
 TEST(CliRender, ASecondSignalStillListsTheFilesWritten) {
@@ -280,13 +279,8 @@ TEST(CliRender, ASecondSignalStillListsTheFilesWritten) {
     const auto flow = dir.File("a.flow", GradientFlow(dir.Path()));
     ASSERT_EQ(Render(flow, " --frames 1").exitCode, 0);
     // Frame 2 of the Loader's clip never arrives: "Wait" holds the render there.
-    const auto chain = dir.File(
-        "b.flow", "Orvane.Document { Version = 1, Tools = {\n"
-                  "  In = Loader { Inputs = { Clip = \"" +
-                      (dir.Path() / "out/f.0001.png").string() +
-                      "\", GlobalIn = 1, GlobalOut = 3, ClipTimeEnd = 2, MissingFrames = 3 } },\n"
-                      "  Out = Saver { Inputs = { Clip = \"" +
-                      (dir.Path() / "copy/c.####.tga").string() + "\", CreateDir = 1, Input = In.Output } },\n} }\n");
+    const auto chain =
+        dir.File("b.flow", CopyFlow(dir.Path(), "", ", GlobalOut = 3, ClipTimeEnd = 2, MissingFrames = 3"));
     const std::string file = (dir.Path() / "copy/c.0001.tga").string();
     const struct {
         int signal;

@@ -1,7 +1,5 @@
-// Resize: sizes and windows worked out by hand from the rules (kept aspect,
-// proxy, field, endless sides), pixels against the
-// host's resizer called directly, regions of interest against whole frames,
-// the draft filter, and the controls following one another.
+// Resize: sizes and windows worked out by hand (kept aspect, proxy, field, endless sides), pixels against the
+// host's resizer, regions of interest against whole frames, the draft filter, and controls following each other.
 #include <array>
 
 #include "tests/operators/warp/WarpTestSupport.h"

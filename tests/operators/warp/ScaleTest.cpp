@@ -1,6 +1,5 @@
-// Scale: the parity rule, fields, proxies, the window's reach and the lock
-// worked out by hand, a size of zero, pixels against the host's resizer
-// called directly, and regions of interest against whole frames.
+// Scale: the parity rule, fields, proxies, the window's reach and the lock worked out by hand, a size of zero,
+// pixels against the host's resizer, and regions of interest against whole frames.
 #include <tuple>
 
 #include "tests/operators/warp/WarpTestSupport.h"
@@ -103,15 +102,8 @@ TEST_F(ScaleTool, PixelsAreTheHostResizersAtTheExactFactors) {
                     {{"LockXY", 0}, {"XSize", x}, {"YSize", y}, {"Edges", duplicate}, {"FilterMethod", method}}));
         ASSERT_NE(out, nullptr);
         const int edges = duplicate ? EdgeDuplicate : EdgeCanvas;
-        Ref<Image> ref = DirectResize(*src, out->Width(), out->Height(), out->DataWindow(),
-                                      {{ResizeFilter, method + 1},
-                                       {ResizeWindow, RszWindowHanning},
-                                       {ResizeXScale, x},
-                                       {ResizeYScale, y},
-                                       {ResizeXOffset, 0.0},
-                                       {ResizeYOffset, 0.0},
-                                       {ResizeXEdges, edges},
-                                       {ResizeYEdges, edges}});
+        Ref<Image> ref = PlacedResize(*src, out->Width(), out->Height(), out->DataWindow(), method + 1,
+                                      {x, y, 0.0, 0.0, edges, edges});
         ExpectSamePixels(*out, *ref, out->DataWindow().Grown(1, 1));
     }
 }

@@ -1,9 +1,6 @@
-// The Transform tool in the flow: its controls, what travels on its output
-// (a pending transform for probes that take one, pixels for the others),
-// chains that resample once, flattening, regions of interest, domains, the
-// common controls and caching. Pixels are compared with a single transform
-// made directly on the image (TransformMatrixTest checks those against the
-// filters' formulas) or with hand-computed values.
+// The Transform tool in the flow: controls, what travels on its output (a pending transform or pixels), chains
+// resampling once, flattening, regions, domains, blend and caching. Pixels are compared with one transform made
+// directly on the image (TransformMatrixTest checks those against the filters' formulas) or hand-computed values.
 #include <gtest/gtest.h>
 
 #include <cmath>
@@ -87,12 +84,9 @@ TEST_F(TransformTool, AChainResamplesOnceAndEqualsOneTransform) {
     EXPECT_EQ(TransformMatrix::ResampleCount() - before, 1);
     // One transform with the combined controls (about the same pivot, the
     // second's move added after).
-    Ref<Image> once = Direct(pic.Get(), {{XfAngle, 35.0},
-                                         {XfXSize, 1.32},
-                                         {XfYSize, 1.32},
-                                         {XfCenterX, 0.55},
-                                         {XfCenterY, 0.45},
-                                         {XfFilter, RszCatmullRom}});
+    const TagList combined{{XfAngle, 35.0},   {XfXSize, 1.32},   {XfYSize, 1.32},
+                           {XfCenterX, 0.55}, {XfCenterY, 0.45}, {XfFilter, RszCatmullRom}};
+    Ref<Image> once = Direct(pic.Get(), combined);
     ASSERT_EQ(chained->DataWindow(), once->DataWindow());
     double worst = 0;
     for (int y = once->DataWindow().y0; y < once->DataWindow().y1; ++y)
