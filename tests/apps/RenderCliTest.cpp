@@ -184,9 +184,8 @@ TEST(CliRender, ChunksOfARangeWriteTheSameBytesAsTheWholeRange) {
 }
 
 TEST(CliRender, TheOpenCLDeviceWritesTheSameFilesAsTheCPU) {
-    // Four-corner ramps graded by a gamma and a linear chain: kernels that do
-    // the rows' float arithmetic (the gamma rounds to 16 bits, hiding the
-    // powers' last bits) must give byte-identical files.
+    // Four-corner ramps graded by a gamma and a linear chain: kernels that do the rows' float arithmetic (the gamma
+    // rounds to 16 bits, hiding the powers' last bits) must give byte-identical files.
     TempDir cpuDir, devDir;
     auto flow = [](const fs::path &dir) {
         return "Orvane.Document { Version = 1, RenderRange = { 1, 2 }, Tools = {\n"

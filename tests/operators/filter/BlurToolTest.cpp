@@ -160,9 +160,8 @@ TEST_F(BlurTool, WindowsUnderEachClippingModeAndForUnboundedKinds) {
         Ref<Image> shape = Render(blur, std::nullopt, ReqFlagPreCalc);
         ASSERT_TRUE(shape && shape->IsNoData());
         EXPECT_EQ(shape->DataWindow(), c.out);
-        // A region of interest narrows the output; the input is asked for
-        // that region grown by the reach, clipped as the mode says. The
-        // source window is never narrowed by the region.
+        // A region of interest narrows the output; the input is asked for that region grown by the reach, clipped as
+        // the mode says. The source window is never narrowed by the region.
         probe->asked.clear();
         Ref<Image> part = Render(blur, roi);
         ASSERT_TRUE(part && probe->asked.size() == 1 && probe->asked[0].has_value());

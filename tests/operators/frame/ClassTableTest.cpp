@@ -1,7 +1,5 @@
-// Checks the table of planned class identities for consistency between its
-// rows: unique IDs, old IDs that shadow nothing, bases that resolve,
-// extensions claimed once, and places and attributes only on the kinds they
-// mean something for.
+// The table of planned classes is consistent: unique IDs, old IDs shadowing nothing, bases that resolve,
+// extensions claimed once, places and attributes only on the kinds they mean something for.
 #include <gtest/gtest.h>
 
 #include <cstring>
@@ -92,8 +90,7 @@ TEST(ClassTable, CommonControlAndImageAttributesSitWhereTheyMeanSomething) {
             expectedNoObject.insert(row.id);
             EXPECT_EQ(noBlend.count(row.id), std::strcmp(row.id, "sRender") != 0 ? 1u : 0u) << row.id;
         }
-        // Motion blur is switched off only on tools (and the tracker
-        // modifier); masks place things in time and keep it.
+        // Motion blur is switched off only on tools (and the tracker modifier); masks place things in time and keep it.
         EXPECT_TRUE(!noMotionBlur.count(row.id) ||
                     ((OffersTool(row.kind) || std::string(row.id) == "TrackerModifier") && !(row.kind & RegKindMask)))
             << row.id;

@@ -1,5 +1,4 @@
-// The tool library as the host sees it after loading: every row of the class
-// table, built or planned, in ClassRegistry.
+// The tool library as the host sees it after loading: every row of the class table, built or planned.
 #include <gtest/gtest.h>
 
 #include <string>
@@ -40,7 +39,7 @@ TEST_F(LibraryRegistry, EveryCreatableRowCarriesTheVocabularyVersionAndHooks) {
     }
 }
 
-TEST_F(LibraryRegistry, OldClassIdsCreateTheClassThatReplacedThem) {
+TEST_F(LibraryRegistry, OldIdsCreateTheirReplacementPlannedToolsFailAndNonToolsAreNotAdded) {
     OrvaneDoc doc;
     for (const auto &[old, now] : {std::pair{"SetBgColor", "SetCanvasColor"},
                                    {"PeturbNumber", "PerturbNumber"},
@@ -53,10 +52,7 @@ TEST_F(LibraryRegistry, OldClassIdsCreateTheClassThatReplacedThem) {
         EXPECT_EQ(row->ID(), OvID(now)) << old;
         EXPECT_EQ(op->ClassID(), OvID(now)) << old;
     }
-}
-
-TEST_F(LibraryRegistry, APlannedToolConstructsButEveryRequestFailsWithOneLine) {
-    OrvaneDoc doc;
+    // A planned tool constructs, but every request fails with one line.
     Operator *glow = doc.AddTool(OvID("Glow"));
     ASSERT_TRUE(glow && glow->IsPlaceholder());
     EXPECT_EQ(Evaluate(glow->FindMainOutput(), 0.0), nullptr);
@@ -64,16 +60,11 @@ TEST_F(LibraryRegistry, APlannedToolConstructsButEveryRequestFailsWithOneLine) {
     ASSERT_EQ(lines.size(), 1u);
     EXPECT_EQ(lines[0].code, ConsoleError);
     EXPECT_EQ(lines[0].text, glow->Name() + ": the Glow tool is not available yet in this version of Orvane");
-}
-
-TEST_F(LibraryRegistry, NonToolClassesAreNotAddedToFlows) {
-    OrvaneDoc doc;
     for (const char *id : {"PNGFormat", "SwitchBase", "VolumeFogLighting", "NoSuchClass"})
         EXPECT_EQ(doc.AddTool(OvID(id)), nullptr) << id;
 }
 
-/// Every planned class stands in the registry with the identity the
-/// catalogue gives it: kind, texts, aliases and attributes.
+/// Every planned class stands in the registry with its table identity: kind, texts, aliases and attributes.
 TEST_F(LibraryRegistry, PlannedClassesCarryTheirCatalogueIdentity) {
     for (const ClassDesc &d : PlannedClasses()) {
         SCOPED_TRACE(d.id);

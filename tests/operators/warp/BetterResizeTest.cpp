@@ -26,8 +26,7 @@ TEST_F(ResizeTool, SizesKeptAspectAndTheHeightControl) {
     Ref<Image> out;
     ASSERT_TRUE(Sized(out = Render(rsz), 32, 20));
     EXPECT_EQ(out->DataWindow(), ImgRectI(0, 0, 32, 20));
-    // Keep Frame Aspect: 32 x 1 / ((64 x 1) / (36 x 1) x 1) + 0.5 = 18.5, cut to 18; the
-    // height follows the width.
+    // Keep Frame Aspect: 32 x 1 / ((64 x 1) / (36 x 1) x 1) + 0.5 = 18.5, cut to 18; the height follows the width.
     SetNumber(rsz, "KeepAspect", 1);
     EXPECT_TRUE(Sized(Render(rsz), 32, 18));
     EXPECT_EQ(Control(rsz, "Height"), 18.0);

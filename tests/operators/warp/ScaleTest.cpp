@@ -33,9 +33,8 @@ TEST_F(ScaleTool, FieldsProxiesReachAndLockWorkedOutByHand) {
         int proxy, w, h;
         ImgRectI window; ///< checked when not empty
     };
-    // A field of a 40 x 30 frame: 30 at 0.5 gives 7.5, up to 8: 16 lines, 8 per field. A
-    // half-size proxy of a 45 x 30 frame at 1.2: 45 x 0.6 = 27 (odd), ceil(26.5) + 0.5 = 27.5
-    // -> 55; 30 x 0.6 = 18 -> 36; halved: 27 x 18.
+    // A field of a 40 x 30 frame: 30 at 0.5 gives 7.5, up to 8: 16 lines, 8 per field. A half-size proxy of a 45 x 30
+    // frame at 1.2: 45 x 0.6 = 27 (odd), ceil(26.5) + 0.5 = 27.5 -> 55; 30 x 0.6 = 18 -> 36; halved: 27 x 18.
     const Ref<Image> frame = NewImageTagList({{ImgWidth, 40}, {ImgHeight, 30}});
     const Ref<Image> field = NewImageTagList({{ImgWidth, 40}, {ImgHeight, 15}, {ImgYScale, 2.0}, {ImgField, 0}});
     const Ref<Image> proxy =

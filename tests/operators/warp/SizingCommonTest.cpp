@@ -1,6 +1,5 @@
-// The shared sizing vocabulary on its own: window arithmetic against
-// hand-worked corners, the aspect keeping sizes, the attributes written back,
-// and the coefficient tables kept while their key holds.
+// The shared sizing vocabulary on its own: window arithmetic against hand-worked corners, the aspect keeping sizes, the
+// attributes written back, and the coefficient tables kept while their key holds.
 #include <gtest/gtest.h>
 
 #include "operators/warp/SizingCommon.h"
@@ -51,16 +50,10 @@ TEST(SizingFormat, AspectKeepingSizesAndListChoices) {
 }
 
 TEST(SizingFormat, AttributesFollowTheResultAndKeepTheProxyRatio) {
-    Ref<Image> proxy = NewImageTagList({{ImgWidth, 960},
-                                        {ImgHeight, 270},
-                                        {ImgXScale, 2.0},
-                                        {ImgYScale, 4.0},
-                                        {ImgFullWidth, 1920},
-                                        {ImgFullHeight, 540},
-                                        {ImgField, 0},
-                                        {ImgFieldOffset, 0.5 / 270},
-                                        {ImgFullXScale, 1.0},
-                                        {ImgFullYScale, 2.0}});
+    const TagList field{{ImgWidth, 960},      {ImgHeight, 270},     {ImgXScale, 2.0}, {ImgYScale, 4.0},
+                        {ImgFullWidth, 1920}, {ImgFullHeight, 540}, {ImgField, 0},    {ImgFieldOffset, 0.5 / 270},
+                        {ImgFullXScale, 1.0}, {ImgFullYScale, 2.0}};
+    Ref<Image> proxy = NewImageTagList(field);
     Ref<Image> out = NewImageTagList({{ImgLikeImage, proxy.Get()}, {ImgWidth, 640}, {ImgHeight, 180}});
     WriteFormatAttrs(*out, ReadSourceFormat(*proxy), 1280, 720, std::pair{0.9, 1.1});
     EXPECT_EQ(out->GetAttrL(ImgFullWidth), 1280);

@@ -78,8 +78,7 @@ inline Ref<Image> Shape(Operator *op, RenderOptions o = {}) {
     return Render(op, o);
 }
 
-/// The host's resizer called directly: `src` into a new w x h image over
-/// `window` with the resize request `tags`.
+/// The host's resizer called directly: `src` into a new w x h image over `window` with the resize request `tags`.
 inline Ref<Image> DirectResize(const Image &src, int w, int h, const ImgRectI &window, const TagList &tags) {
     Ref<Image> out = NewImageTagList(
         {{ImgLikeImage, &src}, {ImgWidth, w}, {ImgHeight, h}, {ImgDataWindow, &window}, {ImgValidWindow, &window}});
