@@ -11,6 +11,8 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include "tests/support/TestSupport.h"
+
 namespace Orvane::clitest {
 
 struct CliRun {
@@ -33,26 +35,12 @@ inline std::string ReadFile(const std::filesystem::path &p) {
 }
 
 /// A folder of its own, removed with everything in it.
-class TempDir {
-public:
-    TempDir() {
-        path_ = std::filesystem::temp_directory_path() /
-                ("orvane-cli-" + std::to_string(getpid()) + "-" + std::to_string(counter_++));
-        std::filesystem::create_directories(path_);
-    }
-    ~TempDir() {
-        std::error_code ec;
-        std::filesystem::remove_all(path_, ec);
-    }
+struct TempDir : Orvane::Test::TempDir {
+    std::filesystem::path Path() const { return path; }
     std::filesystem::path File(const std::string &name, const std::string &text) const {
-        std::ofstream(path_ / name, std::ios::binary) << text;
-        return path_ / name;
+        std::ofstream(Path() / name, std::ios::binary) << text;
+        return Path() / name;
     }
-    const std::filesystem::path &Path() const { return path_; }
-
-private:
-    std::filesystem::path path_;
-    static inline int counter_ = 0;
 };
 
 /// Runs `orvane ARGS` (shell words) with no input, for 30 s at most (exit code 124: it was still running); its
@@ -71,6 +59,12 @@ inline CliRun Orvane(const std::string &args) {
 }
 
 inline bool Contains(const std::string &text, const std::string &part) { return text.find(part) != std::string::npos; }
+
+/// Whether `text` starts with `prefix`, showing the whole text when not.
+inline ::testing::AssertionResult Starts(const std::string &text, const std::string &prefix) {
+    if (text.rfind(prefix, 0) == 0) return ::testing::AssertionSuccess();
+    return ::testing::AssertionFailure() << "no \"" << prefix << "\" first in:\n" << text;
+}
 
 /// Contains, showing the whole text when the part is missing.
 inline ::testing::AssertionResult Has(const std::string &text, const std::string &part) {

@@ -86,7 +86,7 @@ TEST(CliHelp, EveryCommandHasHelpAndTheProgramAVersion) {
         SCOPED_TRACE(command);
         const CliRun help = Orvane(std::string(command) + " --help");
         EXPECT_EQ(help.exitCode, 0) << help.err;
-        EXPECT_EQ(help.out.rfind(std::string("orvane ") + command, 0), 0u) << help.out;
+        EXPECT_TRUE(Starts(help.out, std::string("orvane ") + command));
         EXPECT_TRUE(help.err.empty()) << help.err;
     }
     const CliRun version = Orvane("--version");
@@ -146,18 +146,17 @@ TEST(CliEdit, AFlowIsBuiltAndChangedFromTheCommandLine) {
     for (const auto &b : bad) {
         const CliRun r = Orvane(b.command);
         EXPECT_EQ(r.exitCode, 2) << b.command;
-        EXPECT_TRUE(Contains(r.err, b.says)) << b.command << "\n" << r.err;
+        EXPECT_TRUE(Has(r.err, b.says)) << b.command;
         EXPECT_EQ(ReadFile(path), before) << b.command;
     }
 
     // Removing a tool takes its links with it; a comment written by hand survives the edits.
-    const std::string commented = "-- made for the test\n" + before;
-    dir.File("comp.flow", commented);
+    dir.File("comp.flow", "-- made for the test\n" + before);
     const CliRun removed = Orvane("remove " + flow + " Small");
     EXPECT_EQ(removed.exitCode, 0) << removed.err;
-    EXPECT_TRUE(Contains(removed.out, "unlinked M1.Background")) << removed.out;
+    EXPECT_TRUE(Has(removed.out, "unlinked M1.Background"));
     EXPECT_EQ(InputsIn(path, "M1").Find("Background"), nullptr);
-    EXPECT_EQ(ReadFile(path).rfind("-- made for the test\nOrvane.Document {", 0), 0u) << ReadFile(path);
+    EXPECT_TRUE(Starts(ReadFile(path), "-- made for the test\nOrvane.Document {"));
 }
 
 TEST(CliCheck, ListsEveryProblemWithItsPlaceAndTheExamplesPass) {
@@ -171,11 +170,11 @@ TEST(CliCheck, ListsEveryProblemWithItsPlaceAndTheExamplesPass) {
          {":2:16: RenderRange is reversed", ":4:35: B1.Filter: no choice 'Gausian' (did you mean 'Gaussian'?)",
           ":4:58: B1.XBlurSize: -1 is below the least allowed value 0",
           ":5:42: M1.FilterMethod: 42 is not a choice (0 Nearest Neighbor"})
-        EXPECT_TRUE(Contains(r.err, "ERROR: " + flow.string() + line)) << line << "\n" << r.err;
-    EXPECT_TRUE(Contains(r.err, "4 problems")) << r.err;
+        EXPECT_TRUE(Has(r.err, "ERROR: " + flow.string() + line));
+    EXPECT_TRUE(Has(r.err, "4 problems"));
     const CliRun lenient = Orvane("check --lenient " + Quote(flow.string()));
     EXPECT_EQ(lenient.exitCode, 0) << lenient.err;
-    EXPECT_TRUE(Contains(lenient.err, "WARNING: " + flow.string() + ":4:35:")) << lenient.err;
+    EXPECT_TRUE(Has(lenient.err, "WARNING: " + flow.string() + ":4:35:"));
     const CliRun render = Orvane("render " + Quote(flow.string()));
     EXPECT_EQ(render.exitCode, 2);
     EXPECT_FALSE(Contains(render.out, "FRAME")) << "nothing is rendered";

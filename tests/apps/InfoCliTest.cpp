@@ -129,19 +129,15 @@ TEST(CliInfo, OpenEXRPartsAgreeWithExrheader) {
         GTEST_SKIP() << "the OpenEXR sample images or tools are absent";
     TempDir dir;
     const std::string tiled = (dir.Path() / "tiled.exr").string();
-    ASSERT_EQ(std::system(("exrmaketiled -t 16 32 -m -z zip " + Quote(Samples() + "/DisplayWindow/t08.exr") + " " +
-                           Quote(tiled) + " >/dev/null")
-                              .c_str()),
-              0);
-    // Multi-part views, single-part views, a luminance / chroma file with
-    // sub-sampled channels, pxr24, piz, zip and tiled mip-maps.
-    const std::string files[] = {Samples() + "/Beachball/multipart.0001.exr",
-                                 Samples() + "/Beachball/singlepart.0001.exr",
-                                 Samples() + "/Chromaticities/Rec709_YC.exr",
-                                 Samples() + "/TestImages/GrayRampsHorizontal.exr",
-                                 Samples() + "/DisplayWindow/t08.exr",
-                                 Samples() + "/TestImages/WideColorGamut.exr",
-                                 tiled};
+    ASSERT_TRUE(FmtTest::RunShell("exrmaketiled -t 16 32 -m -z zip " + Quote(Samples() + "/DisplayWindow/t08.exr") +
+                                  " " + Quote(tiled) + " >/dev/null"));
+    // Multi-part views, single-part views, a luminance / chroma file with sub-sampled channels, pxr24, piz, zip
+    // and tiled mip-maps.
+    std::vector<std::string> files{tiled};
+    for (const char *name :
+         {"Beachball/multipart.0001.exr", "Beachball/singlepart.0001.exr", "Chromaticities/Rec709_YC.exr",
+          "TestImages/GrayRampsHorizontal.exr", "DisplayWindow/t08.exr", "TestImages/WideColorGamut.exr"})
+        files.push_back(Samples() + "/" + name);
     const bool python = HaveProgram("python3");
     for (const std::string &file : files) {
         SCOPED_TRACE(file);
@@ -153,8 +149,7 @@ TEST(CliInfo, OpenEXRPartsAgreeWithExrheader) {
         if (!python) continue;
         // The JSON document parses and holds the same parts and windows.
         const std::string json = Capture(
-            "orvane() { " + Quote(std::string(ORVANE_BINARY_DIR) + "/orvane") + " \"$@\"; }; orvane info --json " +
-            Quote(file) +
+            Quote(std::string(ORVANE_BINARY_DIR) + "/orvane") + " info --json " + Quote(file) +
             " | python3 -c 'import json,sys; d=json.load(sys.stdin)[0]; "
             "print(\" \".join(\"%d,%d-%d,%d\" % tuple(p[\"dataWindow\"]) for p in d[\"openexr\"][\"parts\"]))'");
         std::string windows;
@@ -183,7 +178,7 @@ TEST(CliInfo, OtherFormatsGiveTheChannelsAndDepthTheFileHas) {
     for (const auto &[name, how] : made) {
         SCOPED_TRACE(name);
         const std::string path = (dir.Path() / name).string();
-        ASSERT_EQ(std::system(("convert " + std::string(how) + " " + Quote(path)).c_str()), 0);
+        ASSERT_TRUE(FmtTest::RunShell("convert " + std::string(how) + " " + Quote(path)));
         std::istringstream id(Capture("identify -format '%[channels] %z' " + Quote(path)));
         std::string channels;
         int bits = 0;

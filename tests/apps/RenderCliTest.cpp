@@ -68,11 +68,8 @@ TEST(CliRender, WritesEveryFrameAndReportsIt) {
     EXPECT_FALSE(fs::exists(stale));
     EXPECT_TRUE(fs::exists(other));
     EXPECT_EQ(r.exitCode, 0) << r.err;
-    EXPECT_EQ(r.out.rfind("RENDER saver=Out files=" + (dir.Path() / "out/f.####.png").string() +
-                              " frames=1-3 format=PNGFormat\n",
-                          0),
-              0u)
-        << r.out;
+    EXPECT_TRUE(Starts(r.out, "RENDER saver=Out files=" + (dir.Path() / "out/f.####.png").string() +
+                                  " frames=1-3 format=PNGFormat\n"));
     EXPECT_TRUE(Has(r.out, "FRAME 3 done 1/3 saver=Out file=" + (dir.Path() / "out/f.0003.png").string() + " "));
     EXPECT_TRUE(Has(r.out, "FRAME 2 done 3/3 saver=Out"));
     EXPECT_TRUE(Has(r.out, "SUMMARY written=3 failed=0 skipped=0"));
@@ -138,13 +135,9 @@ TEST(CliRender, RefusesBeforeTheFirstFrameToWriteOneFileTwice) {
     const auto flow = dir.File("a.flow", SaverFlow({{"A", cases[1].a, ""}, {"B", cases[1].b, ""}}));
     const CliRun json = Render(flow, " --frames 2 --log-format json");
     EXPECT_EQ(json.exitCode, 2);
-    EXPECT_EQ(json.out.rfind("{\"event\": \"error\", \"code\": \"same_file\", \"saver\": \"A\", \"frame\": 2, "
-                             "\"file\": \"" +
-                                 cases[1].a +
-                                 "\", \"count\": 1, \"other_saver\": \"B\", \"other_frame\": 2, \"error\": ",
-                             0),
-              0u)
-        << json.out;
+    EXPECT_TRUE(Starts(json.out,
+                       "{\"event\": \"error\", \"code\": \"same_file\", \"saver\": \"A\", \"frame\": 2, \"file\": \"" +
+                           cases[1].a + "\", \"count\": 1, \"other_saver\": \"B\", \"other_frame\": 2, \"error\": "));
 }
 
 TEST(CliRender, EventsCarryTheirFactsInFields) {
@@ -178,8 +171,7 @@ TEST(CliRender, ChunksOfARangeWriteTheSameBytesAsTheWholeRange) {
     for (int n = 1001; n <= 1005; ++n) {
         const std::string name = "out/f." + std::to_string(n) + ".png";
         const std::string a = ReadFile(whole.Path() / name), b = ReadFile(parts.Path() / name);
-        EXPECT_FALSE(a.empty()) << name;
-        EXPECT_EQ(a, b) << name;
+        EXPECT_TRUE(!a.empty() && a == b) << name;
     }
 }
 
@@ -212,8 +204,7 @@ TEST(CliRender, TheOpenCLDeviceWritesTheSameFilesAsTheCPU) {
     EXPECT_FALSE(Contains(dev.out + dev.err, "device:")) << "a device run failed: " << dev.out << dev.err;
     for (const char *name : {"out/f.0001.png", "out/f.0002.png"}) {
         const std::string a = ReadFile(cpuDir.Path() / name), b = ReadFile(devDir.Path() / name);
-        EXPECT_FALSE(a.empty()) << name;
-        EXPECT_EQ(a, b) << name;
+        EXPECT_TRUE(!a.empty() && a == b) << name;
     }
     const CliRun bad = Orvane("eval " + Quote(cpuFlow.string()) + " BC --device quantum");
     EXPECT_EQ(bad.exitCode, 2);

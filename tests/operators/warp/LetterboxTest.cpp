@@ -104,8 +104,7 @@ TEST_F(LetterboxTool, ProxyFieldsAndTheFrameFormat) {
     Ref<Image> out = Render(lbx, {.proxy = 2});
     ASSERT_TRUE(Sized(out, 50, 50));
     EXPECT_EQ(out->DataWindow(), ImgRectI(0, 12, 50, 38)); // 12.5 .. 37.5 outward
-    EXPECT_EQ(out->GetAttrL(ImgFullWidth), 100);
-    EXPECT_EQ(out->GetAttrL(ImgFullHeight), 100);
+    EXPECT_TRUE(out->GetAttrL(ImgFullWidth) == 100 && out->GetAttrL(ImgFullHeight) == 100);
 
     // A field of a 200 x 100 frame (50 lines of double height) into 100 x 100:
     // 50 lines, pixel aspect Y doubled; sh = 50 x 2 x (100 x 1 / 2) / 200 = 25.

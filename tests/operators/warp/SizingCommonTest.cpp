@@ -56,8 +56,8 @@ TEST(SizingFormat, AttributesFollowTheResultAndKeepTheProxyRatio) {
     Ref<Image> proxy = NewImageTagList(field);
     Ref<Image> out = NewImageTagList({{ImgLikeImage, proxy.Get()}, {ImgWidth, 640}, {ImgHeight, 180}});
     WriteFormatAttrs(*out, ReadSourceFormat(*proxy), 1280, 720, std::pair{0.9, 1.1});
-    EXPECT_EQ(out->GetAttrL(ImgFullWidth), 1280);
-    EXPECT_EQ(out->GetAttrL(ImgFullHeight), 360); // a field holds half the frame's lines
+    EXPECT_TRUE(out->GetAttrL(ImgFullWidth) == 1280 &&
+                out->GetAttrL(ImgFullHeight) == 360); // a field holds half the frame's lines
     EXPECT_DOUBLE_EQ(out->GetAttrD(ImgFieldOffset), 0.5 / 180);
     // The new aspect (Y doubled for a field) in the attributes; the scale keeps the proxy's factor 2 over them.
     EXPECT_DOUBLE_EQ(out->GetAttrD(ImgFullXScale), 0.9);
