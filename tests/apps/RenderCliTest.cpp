@@ -1,5 +1,5 @@
-// orvane render as a separate process: the files it writes and refuses to
-// write, its report lines and JSON events, exit codes and signals.
+// orvane render as a separate process: the files it writes and refuses to write, its report lines and JSON
+// events, exit codes and signals, and input that could stall or exhaust it.
 #include <gtest/gtest.h>
 
 #include <array>
@@ -29,11 +29,11 @@ std::string GradientFlow(const fs::path &dir, const std::string &extra = {}) {
     return SaverFlow({{"Out", (dir / "out/f.####.png").string(), ", CreateDir = 1" + extra}});
 }
 
-/// A flow (of these document settings) copying `dir`/out/f.0001.png through a Loader (with more inputs) to
-/// numbered TGA files in `dir`/copy.
-std::string CopyFlow(const fs::path &dir, const std::string &settings, const std::string &more) {
+/// A flow (of these document settings) copying `clip` (`dir`/out/f.0001.png) through a Loader (with more inputs)
+/// to numbered TGA files in `dir`/copy.
+std::string CopyFlow(const fs::path &dir, const std::string &settings, const std::string &more, fs::path clip = {}) {
     return "Orvane.Document { Version = 1" + settings + ", Tools = {\n  In = Loader { Inputs = { Clip = \"" +
-           (dir / "out/f.0001.png").string() + "\", GlobalIn = 1" + more +
+           (clip.empty() ? dir / "out/f.0001.png" : clip).string() + "\", GlobalIn = 1" + more +
            " } },\n  Out = Saver { Inputs = { Clip = \"" + (dir / "copy/c.####.tga").string() +
            "\", CreateDir = 1, Input = In.Output } },\n} }\n";
 }
@@ -216,6 +216,11 @@ TEST(CliRender, BadRequestsAndFailedFramesHaveTheirExitCodes) {
     const auto flow = dir.File("a.flow", GradientFlow(dir.Path()));
     const fs::path pipe = dir.Path() / "pipe.png";
     ASSERT_EQ(mkfifo(pipe.c_str(), 0600), 0);
+    const auto big = dir.File("big.flow", "Orvane.Document { Version = 1, RenderRange = { 0, 0 }, Tools = {\n"
+                                          "Bg = Background { Inputs = { Width = 1024, Height = 1024, Depth = 4 } },\n"
+                                          "Blur1 = Blur { Inputs = { XBlurSize = 4, Input = Bg.Output } },\n"
+                                          "Out = Saver { Inputs = { Clip = \"" +
+                                              (dir.Path() / "big.raw").string() + "\", Input = Blur1.Output } } } }");
     const struct {
         fs::path flow;
         const char *args;
@@ -238,6 +243,13 @@ TEST(CliRender, BadRequestsAndFailedFramesHaveTheirExitCodes) {
         {dir.File("c.flow", SaverFlow({{"Out", (dir.Path() / "none/x.####.png").string(), ""}})), " --frames 4", 3,
          "ERROR: frame 4 saver=Out: Out failed to write " + (dir.Path() / "none/x.0004.png").string() +
              ": the folder does not exist\n"},
+        // A FIFO in place of a file fails its frame at once; --memory-limit bounds a render's images (a 1024 x
+        // 1024 frame and its blur need 16 MiB each) and says what a tool needed.
+        {dir.File("fifo.flow", CopyFlow(dir.Path(), "", "", pipe)), " --frames 1", 3,
+         "In failed to load file \"" + pipe.string() + "\" : is not a regular file (a FIFO)"},
+        {big, " --memory-limit 8M", 3,
+         "ERROR: frame 0 saver=Out: Bg: needs 16 MiB for a 1024x1024 RGBA float32 image; --memory-limit is 8 MiB"},
+        {big, " --memory-limit 40M", 0, ""},
     };
     for (const auto &b : bad) {
         const CliRun r = Render(b.flow, b.args);
@@ -245,6 +257,9 @@ TEST(CliRender, BadRequestsAndFailedFramesHaveTheirExitCodes) {
         EXPECT_TRUE(Has(r.err, b.message));
     }
     EXPECT_TRUE(fs::is_fifo(pipe));
+    const CliRun info = Orvane("info " + Quote(pipe.string()));
+    EXPECT_EQ(info.exitCode, 3);
+    EXPECT_EQ(info.err, "ERROR: " + pipe.string() + " is not a regular file (a FIFO)\n");
 
     // A Loader whose frame 2 is missing: that frame fails, the others are written.
     ASSERT_EQ(Render(flow, " --frames 1,3").exitCode, 0);

@@ -347,7 +347,7 @@ struct MultiFlow {
     }
 };
 
-TEST_F(MergeTool, MultiMergeLaysTheLayersInTheListsOrderAndSkipsDisabledOnes) {
+TEST_F(MergeTool, MultiMergeLaysTheLayersInTheListsOrderSkipsDisabledOnesAndBlends) {
     MultiFlow f;
     EXPECT_EQ(LayerOrderOf(f.mm), (std::vector<int>{1, 2})) << "connecting adds to the order";
     EXPECT_EQ(dynamic_cast<const Text *>(f.mm->FindInput("LayerName1")->Constant().Get())->value, "A Layer");
@@ -372,10 +372,9 @@ TEST_F(MergeTool, MultiMergeLaysTheLayersInTheListsOrderAndSkipsDisabledOnes) {
     EXPECT_EQ(Render(f.mm).Get(), f.bgImage.Get()) << "the Background itself, not a copy";
     f.Order({});
     EXPECT_EQ(Render(f.mm).Get(), f.bgImage.Get());
-}
 
-TEST_F(MergeTool, MultiMergeBlendMixesTheStackBackOverTheBackground) {
-    MultiFlow f;
+    // Blend mixes the stack back over the Background.
+    f.Order({1, 2});
     Ref<Image> full = Render(f.mm);
     SetNumber(f.mm, "Blend", 0.25);
     const long before = TransformMatrix::ResampleCount();

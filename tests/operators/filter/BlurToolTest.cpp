@@ -73,28 +73,7 @@ protected:
     ts::ImageSourceTool *probe = nullptr;
 };
 
-TEST_F(BlurTool, LockXYAndFilterShowAndNameTheirControls) {
-    Operator *blur = doc.AddTool(OvID("Blur"));
-    Input *x = blur->FindInput("XBlurSize"), *y = blur->FindInput("YBlurSize"), *passes = blur->FindInput("Passes");
-    // As constructed: locked, Fast Gaussian.
-    EXPECT_STREQ(x->Label(), "Blur Size");
-    EXPECT_FALSE(y->IsVisible() || passes->IsVisible());
-    ts::SetNumber(blur, "LockXY", 0);
-    EXPECT_STREQ(x->Label(), "X Blur Size");
-    EXPECT_TRUE(y->IsVisible());
-    ts::SetID(blur, "Filter", "Multi-box");
-    EXPECT_TRUE(passes->IsVisible());
-    EXPECT_STREQ(x->Label(), "X Blur Size") << "the filter leaves the sizes alone";
-    ts::SetID(blur, "Filter", "Gaussian");
-    EXPECT_FALSE(passes->IsVisible());
-    ts::SetNumber(blur, "LockXY", 1);
-    EXPECT_FALSE(y->IsVisible());
-    // Passes stay within 1..64.
-    ts::SetNumber(blur, "Passes", 100);
-    EXPECT_EQ(dynamic_cast<const Number &>(*passes->Constant()).value, 64.0);
-}
-
-TEST_F(BlurTool, FilterTableWithItsFallback) {
+TEST_F(BlurTool, FilterTableControlsAndNothingToDo) {
     // nullptr: the default, Fast Gaussian.
     const std::pair<const char *, int> table[] = {{nullptr, 5},        {"Box", 0},          {"Bartlett", 2},
                                                   {"Multi-box", 9},    {"Gaussian", 4},     {"Fast Gaussian", 5},
@@ -110,11 +89,25 @@ TEST_F(BlurTool, FilterTableWithItsFallback) {
         EXPECT_TRUE(IsHostBlur(Render(blur), img.Get(), type, Sent(20, 48), Sent(20, 48), frame))
             << (id ? id : "default");
     }
-}
-
-TEST_F(BlurTool, NothingToDoHandsTheInputOn) {
-    Ref<Image> img = Source(40, 30, ImgRectI(0, 0, 40, 30));
-    Operator *blur = Make(img);
+    Input *x = blur->FindInput("XBlurSize"), *y = blur->FindInput("YBlurSize"), *passes = blur->FindInput("Passes");
+    // Still locked, and not Multi-box.
+    EXPECT_STREQ(x->Label(), "Blur Size");
+    EXPECT_FALSE(y->IsVisible() || passes->IsVisible());
+    ts::SetNumber(blur, "LockXY", 0);
+    EXPECT_STREQ(x->Label(), "X Blur Size");
+    EXPECT_TRUE(y->IsVisible());
+    ts::SetID(blur, "Filter", "Multi-box");
+    EXPECT_TRUE(passes->IsVisible());
+    EXPECT_STREQ(x->Label(), "X Blur Size") << "the filter leaves the sizes alone";
+    ts::SetID(blur, "Filter", "Gaussian");
+    EXPECT_FALSE(passes->IsVisible());
+    ts::SetNumber(blur, "LockXY", 1);
+    EXPECT_FALSE(y->IsVisible());
+    // Passes stay within 1..64.
+    ts::SetNumber(blur, "Passes", 100);
+    EXPECT_EQ(dynamic_cast<const Number &>(*passes->Constant()).value, 64.0);
+    // Nothing to do hands the input on.
+    ts::SetID(blur, "Filter", "Fast Gaussian");
     ts::SetNumbers(blur, {{"XBlurSize", 0}, {"YBlurSize", 5}}); // Y ignored while locked
     EXPECT_EQ(Render(blur).Get(), img.Get());
     // Unlocked, a size on either axis blurs, however small.
