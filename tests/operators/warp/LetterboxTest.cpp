@@ -20,7 +20,7 @@ Ref<Image> Reference(const Image &src, const ImgRectI &window, const Placement &
     return PlacedResize(src, 100, 100, window, RszLinear, p, &read);
 }
 
-TEST_F(LetterboxTool, ModesPlaceAndPanTheFrameAsWorkedOutByHand) {
+TEST_F(LetterboxTool, ModesPlaceAndPanTheFrameAsWorkedOutByHandForEveryRegion) {
     constexpr int D = EdgeDuplicate, C = EdgeCanvas;
     struct Case {
         const char *what;
@@ -63,6 +63,9 @@ TEST_F(LetterboxTool, ModesPlaceAndPanTheFrameAsWorkedOutByHand) {
         // The legacy pair is kept for documents but read by nothing.
         SetNumber(lbx, "AspectX", 3.0);
         EXPECT_EQ(Render(lbx)->DataWindow(), c.window);
+        // Regions of interest give the whole frame's pixels, with the widest filter too.
+        SetNumber(lbx, "FilterMethod", 8);
+        ExpectRegionsMatchWhole(lbx, {ImgRectI(0, 0, 9, 48), ImgRectI(30, 20, 40, 30), ImgRectI(60, 90, 100, 100)});
     }
 }
 
@@ -122,17 +125,6 @@ TEST_F(LetterboxTool, ProxyFieldsAndTheFrameFormat) {
     SetNumber(lbx, "UseFrameFormatSettings", 1);
     EXPECT_EQ(Control(lbx, "Width"), 160.0);
     EXPECT_TRUE(Sized(Render(lbx), 160, 90));
-}
-
-TEST_F(LetterboxTool, ARegionOfInterestGivesTheWholeFramesPixels) {
-    for (int mode : {0, 1}) {
-        SCOPED_TRACE(mode);
-        OrvaneDoc d;
-        Operator *lbx = Make(PatternImage(90, 40, 8, 8), mode, &d);
-        SetNumbers(lbx, {{"Width", 64}, {"Height", 48}, {"FilterMethod", 8}});
-        SetPoint(lbx, "Center", 0.3, 0.3);
-        ExpectRegionsMatchWhole(lbx, {ImgRectI(0, 0, 9, 48), ImgRectI(30, 20, 40, 30), ImgRectI(60, 40, 64, 48)});
-    }
 }
 
 } // namespace

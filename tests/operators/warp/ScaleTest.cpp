@@ -85,7 +85,7 @@ TEST_F(ScaleTool, ASizeOfZeroGivesZerosAndAsksForNothing) {
     EXPECT_TRUE(out->DataWindow().IsNull());
 }
 
-TEST_F(ScaleTool, PixelsAreTheHostResizersAtTheExactFactors) {
+TEST_F(ScaleTool, PixelsAreTheHostResizersAtTheExactFactorsForEveryRegion) {
     // x and y factors, Duplicate edges (or Canvas), filter method, depth.
     const std::tuple<double, double, bool, int, int> cases[] = {{0.5, 0.5, false, 2, 8}, {1.7, 1.7, false, 5, 8},
                                                                 {0.8, 1.3, true, 8, 8},  {0.37, 0.6, false, 1, 6},
@@ -94,26 +94,21 @@ TEST_F(ScaleTool, PixelsAreTheHostResizersAtTheExactFactors) {
         SCOPED_TRACE(testing::Message() << x << " x " << y << " edges " << duplicate << " method " << method);
         OrvaneDoc d;
         Ref<Image> src = PatternImage(37, 29, depth, 11);
-        Ref<Image> out = Render(
+        Operator *scl =
             AddTool(d, "Scale", AddProbe(d, src),
-                    {{"LockXY", 0}, {"XSize", x}, {"YSize", y}, {"Edges", duplicate}, {"FilterMethod", method}}));
+                    {{"LockXY", 0}, {"XSize", x}, {"YSize", y}, {"Edges", duplicate}, {"FilterMethod", method}});
+        Ref<Image> out = Render(scl);
         ASSERT_NE(out, nullptr);
         const int edges = duplicate ? EdgeDuplicate : EdgeCanvas;
         Ref<Image> ref = PlacedResize(*src, out->Width(), out->Height(), out->DataWindow(), method + 1,
                                       {x, y, 0.0, 0.0, edges, edges});
         ExpectSamePixels(*out, *ref, out->DataWindow().Grown(1, 1));
-    }
-}
-
-TEST_F(ScaleTool, ARegionOfInterestGivesTheWholeFramesPixels) {
-    for (double s : {0.45, 1.0, 2.3}) {
-        SCOPED_TRACE(s);
-        OrvaneDoc d;
-        Operator *scl =
-            AddTool(d, "Scale", AddProbe(d, PatternImage(50, 40, 8, 3)), {{"XSize", s}, {"FilterMethod", 8}});
-        const ImgRectI dw = Shape(scl)->DataWindow();
-        ExpectRegionsMatchWhole(scl, {ImgRectI(dw.x0, dw.y0, dw.x0 + 5, dw.y0 + 4), ImgRectI(7, 9, 13, 30),
-                                      ImgRectI(dw.x1 - 3, dw.y1 - 8, dw.x1, dw.y1)});
+        // Regions of interest give the whole frame's pixels; duplicated edges are left out, as Scale asks for too
+        // small a region with them (a known fault, reported).
+        const ImgRectI dw = out->DataWindow();
+        if (!duplicate)
+            ExpectRegionsMatchWhole(scl, {ImgRectI(dw.x0, dw.y0, dw.x0 + 5, dw.y0 + 4), ImgRectI(7, 9, 13, 30),
+                                          ImgRectI(dw.x1 - 3, dw.y1 - 8, dw.x1, dw.y1)});
     }
 }
 
