@@ -42,6 +42,10 @@ TEST_F(CropTool, TheCutIsTheSourcesPixelsMoved) {
     Ref<Image> out = Render(crp);
     ExpectCut(out, *src, 7, 5, 16, 10);
     EXPECT_EQ(out->DataWindow(), ImgRectI(0, 0, 16, 10)); // Frame clipping by default
+    // Regions of interest give the whole frame's pixels; the input is asked for the region moved by the offset.
+    ExpectRegionsMatchWhole(crp, {ImgRectI(0, 0, 5, 5), ImgRectI(10, 3, 25, 20), ImgRectI(12, 7, 15, 9)});
+    ASSERT_TRUE(probe->asked.back());
+    EXPECT_EQ(probe->asked.back()->rect, ImgRectI(19, 12, 22, 14));
     // Without clipping the whole source moves along: (-7, -5) .. (33, 25).
     SetID(crp, "ClippingMode", "ClippingMode_None");
     ExpectCut(out = Render(crp), *src, 7, 5, 16, 10, ImgRectI(-9, -7, 35, 27));
@@ -96,14 +100,6 @@ TEST_F(CropTool, KeptAspectAndCentringWriteTheControls) {
     // The reset buttons: no offset, the source's size.
     SetNumbers(crp, {{"ResetOffset", 1}, {"ResetSize", 1}});
     EXPECT_EQ(Box(crp), (B{0, 0, 40, 30}));
-}
-
-TEST_F(CropTool, ARegionOfInterestGivesTheWholeFramesPixels) {
-    Operator *crp = Make(PatternImage(40, 30, 8, 6), 9, 4, 25, 20);
-    ExpectRegionsMatchWhole(crp, {ImgRectI(0, 0, 5, 5), ImgRectI(10, 3, 25, 20), ImgRectI(20, 15, 24, 19)});
-    // The input is asked for the region moved by the offset.
-    ASSERT_TRUE(probe->asked.size() == 4 && probe->asked[2]);
-    EXPECT_EQ(probe->asked[2]->rect, ImgRectI(19, 7, 34, 24));
 }
 
 /// Presses Auto Crop and renders (the press is passive: no cache).
