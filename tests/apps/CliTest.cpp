@@ -78,9 +78,7 @@ TEST(Cli, CommandsAnswerWithTheirExitCodesAndMessages) {
     EXPECT_FALSE(Contains(offered.out, "SwitchBase") || Contains(offered.out, "TeapotMask"));
     for (const char *id : {"Part", "View", "Layer", "ChannelR", "ChannelA", "ChannelZ", "ChannelYDisp"})
         EXPECT_TRUE(Has(loader.out, std::string("  Clip1.OpenEXRFormat.") + id + " "));
-}
-
-TEST(CliHelp, EveryCommandHasHelpAndTheProgramAVersion) {
+    // Every command has help, and the program a version.
     for (const char *command : {"render", "eval", "check", "new", "add", "set", "connect", "remove", "tools",
                                 "describe", "info", "version"}) {
         SCOPED_TRACE(command);

@@ -36,7 +36,7 @@ std::array<double, 4> Box(Operator *crp) {
 }
 using B = std::array<double, 4>;
 
-TEST_F(CropTool, TheCutIsTheSourcesPixelsMoved) {
+TEST_F(CropTool, TheCutIsTheSourcesPixelsMovedAndKeptAspectAndCentringWriteTheControls) {
     Ref<Image> src = PatternImage(40, 30, 8, 2);
     Operator *crp = Make(src, 7, 5, 16, 10);
     Ref<Image> out = Render(crp);
@@ -57,6 +57,25 @@ TEST_F(CropTool, TheCutIsTheSourcesPixelsMoved) {
     EXPECT_EQ(out->DataWindow(), ImgRectI(4, 0, 16, 4));
     // A pass-through render hands on the input itself.
     EXPECT_EQ(Render(crp, {.passThrough = true}).Get(), src.Get());
+
+    // Kept centred: floor((40 - 16) / 2 + 0.5) = 12, floor((30 - 10) / 2 + 0.5) = 10, written to the controls.
+    SetNumber(crp, "KeepCentered", 1);
+    ExpectCut(Render(crp), *src, 12, 10, 16, 10);
+    EXPECT_EQ(Box(crp), (B{12, 10, 16, 10}));
+    // Keep Aspect: 16 / (40 / 30) + 0.5 = 12.5, cut to 12; centred again: y = 9.
+    SetNumber(crp, "KeepAspect", 1);
+    ExpectCut(Render(crp), *src, 12, 9, 16, 12);
+    EXPECT_EQ(Box(crp), (B{12, 9, 16, 12}));
+    // Write-protected: the same frame, the controls as they were.
+    OrvaneDoc d;
+    d.SetWriteProtected(true);
+    Operator *locked = Make(src, 0, 0, 16, 10, &d);
+    SetNumbers(locked, {{"KeepCentered", 1}, {"KeepAspect", 1}});
+    ExpectCut(Render(locked), *src, 12, 9, 16, 12);
+    EXPECT_EQ(Box(locked), (B{0, 0, 16, 10}));
+    // The reset buttons: no offset, the source's size.
+    SetNumbers(crp, {{"ResetOffset", 1}, {"ResetSize", 1}});
+    EXPECT_EQ(Box(crp), (B{0, 0, 40, 30}));
 }
 
 TEST_F(CropTool, EveryDepthCutsTheSame) {
@@ -77,29 +96,6 @@ TEST_F(CropTool, ControlsAreFullResolutionPixelsOfAProxy) {
     Ref<Image> out = Render(Make(src, 7, 5, 16, 10), {.proxy = 2});
     ExpectCut(out, *src, 4, 3, 8, 5);
     EXPECT_TRUE(out->GetAttrL(ImgFullWidth) == 16 && out->GetAttrL(ImgFullHeight) == 10);
-}
-
-TEST_F(CropTool, KeptAspectAndCentringWriteTheControls) {
-    Ref<Image> src = PatternImage(40, 30, 8, 3);
-    Operator *crp = Make(src, 1, 2, 16, 10);
-    SetNumber(crp, "KeepCentered", 1);
-    // floor((40 - 16) / 2 + 0.5) = 12, floor((30 - 10) / 2 + 0.5) = 10.
-    ExpectCut(Render(crp), *src, 12, 10, 16, 10);
-    EXPECT_EQ(Box(crp), (B{12, 10, 16, 10}));
-    // Keep Aspect: 16 / (40 / 30) + 0.5 = 12.5, cut to 12; centred again: y = 9.
-    SetNumber(crp, "KeepAspect", 1);
-    ExpectCut(Render(crp), *src, 12, 9, 16, 12);
-    EXPECT_EQ(Box(crp), (B{12, 9, 16, 12}));
-    // Write-protected: the same frame, the controls as they were.
-    OrvaneDoc d;
-    d.SetWriteProtected(true);
-    Operator *locked = Make(src, 0, 0, 16, 10, &d);
-    SetNumbers(locked, {{"KeepCentered", 1}, {"KeepAspect", 1}});
-    ExpectCut(Render(locked), *src, 12, 9, 16, 12);
-    EXPECT_EQ(Box(locked), (B{0, 0, 16, 10}));
-    // The reset buttons: no offset, the source's size.
-    SetNumbers(crp, {{"ResetOffset", 1}, {"ResetSize", 1}});
-    EXPECT_EQ(Box(crp), (B{0, 0, 40, 30}));
 }
 
 /// Presses Auto Crop and renders (the press is passive: no cache).

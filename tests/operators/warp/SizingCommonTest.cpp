@@ -31,7 +31,7 @@ TEST(SizingWindows, CornersRoundOutwardEndlessSidesStayAndPlacingInverts) {
                 << s << " " << o;
 }
 
-TEST(SizingFormat, AspectKeepingSizesAndListChoices) {
+TEST(SizingFormat, AspectKeepingSizesListChoicesAndAttributes) {
     SourceFormat hd;
     hd.width = hd.fullWidth = 1920;
     hd.height = hd.fullHeight = 1080;
@@ -47,9 +47,8 @@ TEST(SizingFormat, AspectKeepingSizesAndListChoices) {
     EXPECT_EQ(FilterValue(4.6), RszCatmullRom);
     EXPECT_EQ(FilterValue(14), RszBessel);
     EXPECT_EQ(WindowValue(3), RszWindowKaiser);
-}
 
-TEST(SizingFormat, AttributesFollowTheResultAndKeepTheProxyRatio) {
+    // Attributes follow the result and keep the proxy ratio.
     const TagList field{{ImgWidth, 960},      {ImgHeight, 270},     {ImgXScale, 2.0}, {ImgYScale, 4.0},
                         {ImgFullWidth, 1920}, {ImgFullHeight, 540}, {ImgField, 0},    {ImgFieldOffset, 0.5 / 270},
                         {ImgFullXScale, 1.0}, {ImgFullYScale, 2.0}};
