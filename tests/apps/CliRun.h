@@ -6,6 +6,7 @@
 #include <cstdlib>
 #include <filesystem>
 #include <fstream>
+#include <iterator>
 #include <sstream>
 #include <string>
 #include <sys/wait.h>
@@ -29,9 +30,7 @@ inline std::string Quote(const std::string &s) {
 
 inline std::string ReadFile(const std::filesystem::path &p) {
     std::ifstream f(p, std::ios::binary);
-    std::ostringstream s;
-    s << f.rdbuf();
-    return s.str();
+    return {std::istreambuf_iterator<char>(f), {}};
 }
 
 /// A folder of its own, removed with everything in it.

@@ -99,7 +99,7 @@ ScriptVal InputsIn(const std::filesystem::path &flow, const char *tool) {
     return inputs ? *inputs : ScriptVal();
 }
 
-TEST(CliEdit, AFlowIsBuiltAndChangedFromTheCommandLine) {
+TEST(CliEdit, AFlowIsBuiltChangedAndChecked) {
     TempDir dir;
     const std::string flow = Quote((dir.Path() / "comp.flow").string());
     const std::filesystem::path path = dir.Path() / "comp.flow";
@@ -155,25 +155,22 @@ TEST(CliEdit, AFlowIsBuiltAndChangedFromTheCommandLine) {
     EXPECT_TRUE(Has(removed.out, "unlinked M1.Background"));
     EXPECT_EQ(InputsIn(path, "M1").Find("Background"), nullptr);
     EXPECT_TRUE(Starts(ReadFile(path), "-- made for the test\nOrvane.Document {"));
-}
-
-TEST(CliCheck, ListsEveryProblemWithItsPlaceAndTheExamplesPass) {
-    TempDir dir;
-    const auto flow = dir.File("bad.flow", "Orvane.Document {\n\tRenderRange = { 10, 1 },\n\tTools = {\n"
-                                           "\t\tB1 = Blur { Inputs = { Filter = \"Gausian\", XBlurSize = -1 } },\n"
-                                           "\t\tM1 = Merge { Inputs = { FilterMethod = 42 } },\n\t},\n}\n");
-    const CliRun r = Orvane("check " + Quote(flow.string()));
+    // Checking lists every problem with its place, and the examples pass.
+    const auto checked = dir.File("bad.flow", "Orvane.Document {\n\tRenderRange = { 10, 1 },\n\tTools = {\n"
+                                              "\t\tB1 = Blur { Inputs = { Filter = \"Gausian\", XBlurSize = -1 } },\n"
+                                              "\t\tM1 = Merge { Inputs = { FilterMethod = 42 } },\n\t},\n}\n");
+    const CliRun r = Orvane("check " + Quote(checked.string()));
     EXPECT_EQ(r.exitCode, 2);
     for (const char *line :
          {":2:16: RenderRange is reversed", ":4:35: B1.Filter: no choice 'Gausian' (did you mean 'Gaussian'?)",
           ":4:58: B1.XBlurSize: -1 is below the least allowed value 0",
           ":5:42: M1.FilterMethod: 42 is not a choice (0 Nearest Neighbor"})
-        EXPECT_TRUE(Has(r.err, "ERROR: " + flow.string() + line));
+        EXPECT_TRUE(Has(r.err, "ERROR: " + checked.string() + line));
     EXPECT_TRUE(Has(r.err, "4 problems"));
-    const CliRun lenient = Orvane("check --lenient " + Quote(flow.string()));
+    const CliRun lenient = Orvane("check --lenient " + Quote(checked.string()));
     EXPECT_EQ(lenient.exitCode, 0) << lenient.err;
-    EXPECT_TRUE(Has(lenient.err, "WARNING: " + flow.string() + ":4:35:"));
-    const CliRun render = Orvane("render " + Quote(flow.string()));
+    EXPECT_TRUE(Has(lenient.err, "WARNING: " + checked.string() + ":4:35:"));
+    const CliRun render = Orvane("render " + Quote(checked.string()));
     EXPECT_EQ(render.exitCode, 2);
     EXPECT_FALSE(Contains(render.out, "FRAME")) << "nothing is rendered";
 

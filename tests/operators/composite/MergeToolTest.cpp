@@ -118,7 +118,7 @@ TEST_F(MergeTool, WithoutAForegroundTheBackgroundsTransformGoesOnUnchanged) {
     EXPECT_EQ(out->Width(), 16);
 }
 
-TEST_F(MergeTool, PlacesTheForegroundByItsControlsAndItsPixelAspect) {
+TEST_F(MergeTool, PlacesTheForegroundByItsControlsAndItsPixelAspectInTheUnionOfBothWindows) {
     // A 4 x 2 foreground on a 20 x 10 grey background. At the defaults its centre (2, 1) lands on the background's
     // centre (10, 5): pixel (i, j) at (8 + i, 4 + j). Twice the size with the nearest pixel: every pixel becomes 2 x 2,
     // the block still centred: (6 + 2i, 3 + 2j).
@@ -159,6 +159,15 @@ TEST_F(MergeTool, PlacesTheForegroundByItsControlsAndItsPixelAspect) {
             return fgImage->GetFlt(c.how == 'x' ? 3 - i : i, c.how == 'y' ? 1 - j : j);
         }));
     }
+    // The domain is the union of both windows. The foreground hangs off the background's top right corner.
+    Ref<Image> fgImage = Numbered(4, 2, 0.5f);
+    MergeFlow f(Solid(20, 10, kGrey), fgImage);
+    SetPoint(f.merge, "Center", 1.0, 1.0); // centre at (20, 10): pixels (18..21, 9..10)
+    Ref<Image> shape = Render(f.merge, nullptr, ReqFlagPreCalc), out = Render(f.merge);
+    ASSERT_TRUE(shape && shape->IsNoData() && out);
+    EXPECT_EQ(shape->DataWindow(), ImgRectI(0, 0, 22, 11));
+    EXPECT_EQ(out->DataWindow(), ImgRectI(0, 0, 22, 11));
+    EXPECT_EQ(out->GetFlt(21, 10), fgImage->GetFlt(3, 1)); // foreground pixel (i, j) at (18 + i, 9 + j)
 }
 
 TEST_F(MergeTool, ControlsFollowTheModeAndTheDocumentsFrameFormat) {
@@ -184,18 +193,6 @@ TEST_F(MergeTool, ControlsFollowTheModeAndTheDocumentsFrameFormat) {
     EXPECT_FALSE(w->IsVisible() || h->IsVisible());
     SetNumber(merge, "UseFrameFormatSettings", 0);
     EXPECT_TRUE(w->IsVisible());
-}
-
-TEST_F(MergeTool, TheDomainIsTheUnionOfBothWindows) {
-    // The foreground hangs off the background's top right corner.
-    Ref<Image> fgImage = Numbered(4, 2, 0.5f);
-    MergeFlow f(Solid(20, 10, kGrey), fgImage);
-    SetPoint(f.merge, "Center", 1.0, 1.0); // centre at (20, 10): pixels (18..21, 9..10)
-    Ref<Image> shape = Render(f.merge, nullptr, ReqFlagPreCalc), out = Render(f.merge);
-    ASSERT_TRUE(shape && shape->IsNoData() && out);
-    EXPECT_EQ(shape->DataWindow(), ImgRectI(0, 0, 22, 11));
-    EXPECT_EQ(out->DataWindow(), ImgRectI(0, 0, 22, 11));
-    EXPECT_EQ(out->GetFlt(21, 10), fgImage->GetFlt(3, 1)); // foreground pixel (i, j) at (18 + i, 9 + j)
 }
 
 TEST_F(MergeTool, ThePendingTransformSurvivesAndEachSourceIsResampledOnce) {

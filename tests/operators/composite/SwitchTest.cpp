@@ -236,7 +236,7 @@ TEST_F(SwitchTest, PositionsGrowHideAndSurviveADocument) {
     EXPECT_EQ(after->GetFlt(2, 3), before->GetFlt(2, 3));
 }
 
-TEST_F(SwitchTest, TheThreeDSwitchesHandOnTheirValues) {
+TEST_F(SwitchTest, ThreeDValuesAndPendingTransformsAreHandedOnAsTheyAre) {
     const struct {
         const char *cls;
         OvID source;
@@ -270,9 +270,7 @@ TEST_F(SwitchTest, TheThreeDSwitchesHandOnTheirValues) {
         EXPECT_EQ(Eval(sw, 3.0), nullptr);
         EXPECT_EQ(Lines(), std::vector<std::string>{sw->Name() + ".Input1 failed at time 3.0 - unconnected input"});
     }
-}
-
-TEST_F(SwitchTest, APendingTransformPassesThroughUnflattened) {
+    // A pending transform passes through a Switch unflattened.
     Operator *sw = doc->AddTool(OvID("Switch"), "Switch1");
     auto *xf = dynamic_cast<ValueSource *>(doc->AddTool(C().transform));
     ASSERT_TRUE(sw && xf);

@@ -57,7 +57,6 @@ TEST_F(CropTool, TheCutIsTheSourcesPixelsMovedAndKeptAspectAndCentringWriteTheCo
     EXPECT_EQ(out->DataWindow(), ImgRectI(4, 0, 16, 4));
     // A pass-through render hands on the input itself.
     EXPECT_EQ(Render(crp, {.passThrough = true}).Get(), src.Get());
-
     // Kept centred: floor((40 - 16) / 2 + 0.5) = 12, floor((30 - 10) / 2 + 0.5) = 10, written to the controls.
     SetNumber(crp, "KeepCentered", 1);
     ExpectCut(Render(crp), *src, 12, 10, 16, 10);
@@ -78,7 +77,7 @@ TEST_F(CropTool, TheCutIsTheSourcesPixelsMovedAndKeptAspectAndCentringWriteTheCo
     EXPECT_EQ(Box(crp), (B{0, 0, 40, 30}));
 }
 
-TEST_F(CropTool, EveryDepthCutsTheSame) {
+TEST_F(CropTool, EveryDepthCutsTheSameAndControlsAreFullResolutionPixelsOfAProxy) {
     for (int depth = 1; depth <= 8; ++depth) {
         SCOPED_TRACE(depth);
         OrvaneDoc d;
@@ -86,9 +85,6 @@ TEST_F(CropTool, EveryDepthCutsTheSame) {
         ExpectCut(out, *src, 3, 2, 11, 9);
         EXPECT_EQ(out->Depth(), depth);
     }
-}
-
-TEST_F(CropTool, ControlsAreFullResolutionPixelsOfAProxy) {
     // A half-size proxy of a 40 x 30 frame: offsets 7, 5 -> floor(3.5 + 0.5) = 4,
     // floor(2.5 + 0.5) = 3; size 16 x 10 -> 8 x 5.
     Ref<Image> src = PatternImage(20, 15, 8, 9);

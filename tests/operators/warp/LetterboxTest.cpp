@@ -76,8 +76,7 @@ TEST_F(LetterboxTool, FramingMakesACanvasRealAndClearsWhatLiesBeyond) {
     Ref<Image> src = full->CopyOfImageTagList({{ImgDataWindow, &dw}, {ImgCanvasColor, &red}});
     Operator *lbx = Make(src);
     Ref<Image> out = Render(lbx);
-    ASSERT_NE(out, nullptr);
-    EXPECT_TRUE(out->IsCanvasColorClear());
+    ASSERT_TRUE(out && out->IsCanvasColorClear());
     EXPECT_EQ(out->DataWindow(), ImgRectI(0, 25, 100, 75)); // the whole frame, red where the source had canvas
     // Made by hand: the frame with red outside the window, clear beyond.
     const ImgRectI frame = src->Frame();
@@ -87,11 +86,9 @@ TEST_F(LetterboxTool, FramingMakesACanvasRealAndClearsWhatLiesBeyond) {
     const Placement p{0.5, 0.5, 0.0, 25.0, EdgeDuplicate, EdgeCanvas};
     ExpectSamePixels(*out, *Reference(*real, out->DataWindow(), p, frame), ImgRectI(-2, -2, 102, 102));
 
-    // Without clipping the canvas stays the source's. The tool takes whole
-    // frames, so the host hands it the source made real over its frame.
+    // Without clipping the canvas stays the source's; the tool takes whole frames, so it gets the source made real.
     SetID(lbx, "ClippingMode", "ClippingMode_None");
-    out = Render(lbx);
-    ASSERT_NE(out, nullptr);
+    ASSERT_TRUE(out = Render(lbx));
     EXPECT_EQ(out->GetCanvasColor(), red);
     EXPECT_EQ(out->DataWindow(), ImgRectI(0, 25, 100, 75));
     real->SetCanvasColor(red);

@@ -25,7 +25,7 @@ TEST_F(ScaleTool, TheSizeKeepsItsParity) {
     }
 }
 
-TEST_F(ScaleTool, FieldsProxiesReachAndLockWorkedOutByHand) {
+TEST_F(ScaleTool, FieldsProxiesReachLockAndZeroWorkedOutByHand) {
     struct Case {
         const char *what;
         Ref<Image> src;
@@ -63,25 +63,20 @@ TEST_F(ScaleTool, FieldsProxiesReachAndLockWorkedOutByHand) {
             EXPECT_TRUE(shape->GetAttrL(ImgFullWidth) == 55 && shape->GetAttrL(ImgFullHeight) == 36);
         }
     }
-}
-
-TEST_F(ScaleTool, ASizeOfZeroGivesZerosAndAsksForNothing) {
+    // A size of zero gives zeros and asks for nothing.
     OrvaneDoc doc;
     Ref<Image> src = PatternImage(40, 30);
     src->SetCanvasColor(FltPixel{0.5f, 0.5f, 0.5f, 1.f});
     ProbeSource *probe = AddProbe(doc, src);
     Operator *scl = AddTool(doc, "Scale", probe, {{"LockXY", 0}, {"XSize", 0.0}, {"YSize", 1.0}});
     Ref<Image> out = Render(scl, {.roi = ImgRectI(0, 0, 1, 30)});
-    ASSERT_NE(out, nullptr);
-    EXPECT_TRUE(out->DataWindow().IsNull());
-    EXPECT_TRUE(out->IsCanvasColorClear());
+    ASSERT_TRUE(out && out->DataWindow().IsNull() && out->IsCanvasColorClear());
     for (int y = -2; y < 32; y += 3) EXPECT_EQ(out->GetFlt(0, y), FltPixel{});
     ASSERT_TRUE(probe->asked.size() == 1 && probe->asked[0]);
     EXPECT_TRUE(probe->asked[0]->rect.IsNull()); // collapsed on the middle of the region
     // Negative sizes count as not above zero.
     SetNumbers(scl, {{"YSize", -2.0}, {"XSize", 1.0}});
-    out = Render(scl);
-    ASSERT_NE(out, nullptr);
+    ASSERT_TRUE(out = Render(scl));
     EXPECT_TRUE(out->DataWindow().IsNull());
 }
 

@@ -157,8 +157,7 @@ TEST_F(TransformTool, EdgesFillTheFrameAndInvertUndoes) {
     EXPECT_EQ(tiled->DataWindow(), ImgRectI(0, 0, 32, 32));
     for (int y = 0; y < 16; ++y)
         for (int x = 0; x < 16; ++x) {
-            // Nearest at half size about the middle: the centre of output
-            // pixel x lands on source 2x - 15, folded into 0..31.
+            // Nearest at half size about the middle: output pixel x's centre is on source 2x - 15, folded into 0..31.
             const FltPixel p = tiled->GetFlt(x, y);
             EXPECT_EQ(p, tiled->GetFlt(x + 16, y));
             EXPECT_EQ(p, tiled->GetFlt(x, y + 16));
@@ -178,8 +177,7 @@ TEST_F(TransformTool, EdgesFillTheFrameAndInvertUndoes) {
     // Size 0 is singular: inverting leaves it, and nothing of the picture shows.
     SetNumbers(xf, {{"Size", 0}, {"InvertTransform", 1}});
     Ref<Image> none = Render(xf);
-    ASSERT_TRUE(none);
-    EXPECT_TRUE(none->DataWindow().IsNull());
+    ASSERT_TRUE(none && none->DataWindow().IsNull());
 }
 
 TEST_F(TransformTool, ControlsShowByChoiceAndAMissingInputFailsWithOneLine) {
