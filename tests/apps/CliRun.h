@@ -1,13 +1,18 @@
 #pragma once
 // Running the orvane command line as a separate process, the way scripts
 // and render farms run it, for the command-line tests.
+#include <gtest/gtest.h>
+
 #include <cstdlib>
 #include <filesystem>
 #include <fstream>
+#include <iterator>
 #include <sstream>
 #include <string>
 #include <sys/wait.h>
 #include <unistd.h>
+
+#include "tests/support/TestSupport.h"
 
 namespace Orvane::clitest {
 
@@ -25,39 +30,24 @@ inline std::string Quote(const std::string &s) {
 
 inline std::string ReadFile(const std::filesystem::path &p) {
     std::ifstream f(p, std::ios::binary);
-    std::ostringstream s;
-    s << f.rdbuf();
-    return s.str();
+    return {std::istreambuf_iterator<char>(f), {}};
 }
 
 /// A folder of its own, removed with everything in it.
-class TempDir {
-public:
-    TempDir() {
-        path_ = std::filesystem::temp_directory_path() /
-                ("orvane-cli-" + std::to_string(getpid()) + "-" + std::to_string(counter_++));
-        std::filesystem::create_directories(path_);
-    }
-    ~TempDir() {
-        std::error_code ec;
-        std::filesystem::remove_all(path_, ec);
-    }
+struct TempDir : Orvane::Test::TempDir {
+    std::filesystem::path Path() const { return path; }
     std::filesystem::path File(const std::string &name, const std::string &text) const {
-        std::ofstream(path_ / name, std::ios::binary) << text;
-        return path_ / name;
+        std::ofstream(Path() / name, std::ios::binary) << text;
+        return Path() / name;
     }
-    const std::filesystem::path &Path() const { return path_; }
-
-private:
-    std::filesystem::path path_;
-    static inline int counter_ = 0;
 };
 
-/// Runs `orvane ARGS` (shell words) with no input; its exit code and output.
+/// Runs `orvane ARGS` (shell words) with no input, for 30 s at most (exit code 124: it was still running); its
+/// exit code and output.
 inline CliRun Orvane(const std::string &args) {
     TempDir dir;
     const auto outFile = dir.Path() / "out", errFile = dir.Path() / "err";
-    const std::string cmd = Quote(std::string(ORVANE_BINARY_DIR) + "/orvane") + " " + args + " >" +
+    const std::string cmd = "timeout 30 " + Quote(std::string(ORVANE_BINARY_DIR) + "/orvane") + " " + args + " >" +
                             Quote(outFile.string()) + " 2>" + Quote(errFile.string()) + " </dev/null";
     const int status = std::system(cmd.c_str());
     CliRun r;
@@ -68,5 +58,17 @@ inline CliRun Orvane(const std::string &args) {
 }
 
 inline bool Contains(const std::string &text, const std::string &part) { return text.find(part) != std::string::npos; }
+
+/// Whether `text` starts with `prefix`, showing the whole text when not.
+inline ::testing::AssertionResult Starts(const std::string &text, const std::string &prefix) {
+    if (text.rfind(prefix, 0) == 0) return ::testing::AssertionSuccess();
+    return ::testing::AssertionFailure() << "no \"" << prefix << "\" first in:\n" << text;
+}
+
+/// Contains, showing the whole text when the part is missing.
+inline ::testing::AssertionResult Has(const std::string &text, const std::string &part) {
+    if (Contains(text, part)) return ::testing::AssertionSuccess();
+    return ::testing::AssertionFailure() << "no \"" << part << "\" in:\n" << text;
+}
 
 } // namespace Orvane::clitest

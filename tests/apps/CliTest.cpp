@@ -1,12 +1,12 @@
-// The orvane command line, run as a separate process the way scripts and
-// render farms run it: help, tools and describe, checking and editing flow
-// documents, eval; output, JSON, and exit codes.
+// The orvane command line as a separate process: help, tools and describe, checking and editing flow documents,
+// eval; output, JSON, and exit codes.
 #include <gtest/gtest.h>
 
 #include <algorithm>
 #include <regex>
 #include <sstream>
 #include <string>
+#include <vector>
 
 #include "host/core/ScriptVal.h"
 #include "tests/apps/CliRun.h"
@@ -14,121 +14,82 @@
 namespace Orvane::clitest {
 namespace {
 
-TEST(CliTools, SearchFindsClassesByAliasAndMarksUnbuiltOnes) {
-    const CliRun dither = Orvane("tools --search dither");
-    EXPECT_EQ(dither.exitCode, 0) << dither.err;
-    EXPECT_TRUE(Contains(dither.out, "ChangeDepth")) << dither.out;
-    EXPECT_TRUE(Contains(dither.out, "not yet")) << dither.out;
-    EXPECT_TRUE(Contains(dither.out, "1 classes")) << dither.out;
-
-    const CliRun shuffle = Orvane("tools --search shuffle");
-    EXPECT_TRUE(Contains(shuffle.out, "ChannelBoolean")) << shuffle.out;
-
-    // Abstract bases and hidden classes show only with --all.
-    const CliRun all = Orvane("tools --all");
-    EXPECT_EQ(all.exitCode, 0);
-    EXPECT_TRUE(Contains(all.out, "201 classes")) << all.out.substr(all.out.size() > 200 ? all.out.size() - 200 : 0);
-    EXPECT_TRUE(Contains(all.out, "SwitchBase"));
-    const CliRun offered = Orvane("tools");
-    EXPECT_TRUE(Contains(offered.out, "194 classes"));
-    EXPECT_FALSE(Contains(offered.out, "SwitchBase"));
-    EXPECT_FALSE(Contains(offered.out, "TeapotMask"));
-}
-
-TEST(CliTools, BadArgumentsExitWithUsageCode) {
-    EXPECT_EQ(Orvane("tools --bogus").exitCode, 2);
-    EXPECT_EQ(Orvane("frobnicate").exitCode, 2);
-    EXPECT_EQ(Orvane("").exitCode, 2);
-    const CliRun unknown = Orvane("describe NoSuchClass");
-    EXPECT_EQ(unknown.exitCode, 2);
-    EXPECT_TRUE(Contains(unknown.err, "ERROR: unknown class 'NoSuchClass'")) << unknown.err;
-}
-
-TEST(CliDescribe, ShowsIdentityInputsAndState) {
-    const CliRun blur = Orvane("describe Glow");
-    EXPECT_EQ(blur.exitCode, 0) << blur.err;
-    EXPECT_TRUE(Contains(blur.out, "path:          Tools/Effect/Glow")) << blur.out;
-    EXPECT_TRUE(Contains(blur.out, "built:         not yet")) << blur.out;
-    EXPECT_TRUE(Contains(blur.out, "EffectMask")) << blur.out;
-    // An old class ID names the class that replaced it.
-    const CliRun old = Orvane("describe SetBgColor");
-    EXPECT_EQ(old.exitCode, 0) << old.err;
-    EXPECT_TRUE(Contains(old.out, "SetCanvasColor")) << old.out;
-}
-
-TEST(CliEval, DocumentErrorsAreOneLineWithExitTwo) {
+TEST(Cli, CommandsAnswerWithTheirExitCodesAndMessages) {
     TempDir dir;
-    const auto syntax = dir.File("syntax.flow", "Orvane.Document {\n\tTools = {\n\t\tA = Blur { Inputs = { x = } },\n");
-    const CliRun r = Orvane("eval " + Quote(syntax.string()) + " A");
-    EXPECT_EQ(r.exitCode, 2);
-    EXPECT_TRUE(Contains(r.err, "ERROR: " + syntax.string() + ":3:")) << r.err;
-
-    const CliRun missing = Orvane("eval " + Quote((dir.Path() / "none.flow").string()) + " A");
-    EXPECT_EQ(missing.exitCode, 2);
-    EXPECT_TRUE(Contains(missing.err, "cannot open")) << missing.err;
-
-    const auto ok = dir.File("ok.flow", "Orvane.Document { Tools = { Blur1 = Blur {} } }\n");
-    const CliRun noTool = Orvane("eval " + Quote(ok.string()) + " Nope");
-    EXPECT_EQ(noTool.exitCode, 2);
-    EXPECT_TRUE(Contains(noTool.err, "no tool 'Nope'")) << noTool.err;
-
-    const CliRun badSet = Orvane("eval " + Quote(ok.string()) + " Blur1 --set Blur1.NoSuchInput=1");
-    EXPECT_EQ(badSet.exitCode, 2);
-    EXPECT_TRUE(Contains(badSet.err, "has no input 'NoSuchInput'")) << badSet.err;
-
-    const CliRun badType = Orvane("eval " + Quote(ok.string()) + " Blur1 --set 'Blur1.Blend=\"high\"'");
-    EXPECT_EQ(badType.exitCode, 2);
-    EXPECT_TRUE(Contains(badType.err, "expects a number")) << badType.err;
-
-    const auto wrong =
-        dir.File("wrong.flow", "Orvane.Document { Tools = { Blur1 = Blur { Inputs = { Blend = {} } } } }");
-    const CliRun wrongType = Orvane("eval " + Quote(wrong.string()) + " Blur1");
-    EXPECT_EQ(wrongType.exitCode, 2);
-    EXPECT_TRUE(Contains(wrongType.err, "Blur1.Blend: expects a number")) << wrongType.err;
-}
-
-TEST(CliEval, UnknownClassIsKeptWithAWarningAndFailsOnlyWhenAsked) {
-    TempDir dir;
-    const auto flow = dir.File(
-        "unknown.flow", "Orvane.Document { Tools = { X1 = FutureTool { Inputs = { Q = 3 } }, Blur1 = Blur {} } }");
-    const CliRun strict = Orvane("eval " + Quote(flow.string()) + " Blur1");
-    EXPECT_EQ(strict.exitCode, 2);
-    EXPECT_TRUE(Contains(strict.err, "ERROR: " + flow.string() + ":1:34: X1: unknown class 'FutureTool'"))
-        << strict.err;
-    const CliRun r = Orvane("eval --lenient " + Quote(flow.string()) + " X1");
-    EXPECT_EQ(r.exitCode, 2);
-    EXPECT_TRUE(Contains(r.err, "WARNING: " + flow.string() + ":1:34: X1: unknown class 'FutureTool'")) << r.err;
-    EXPECT_TRUE(Contains(r.err, "ERROR: tool 'X1' is of a class this program does not know")) << r.err;
-}
-
-TEST(CliEval, AToolThatIsNotBuiltFailsWithExitThree) {
-    TempDir dir;
-    const auto flow = dir.File("planned.flow", "Orvane.Document { Tools = { Glow1 = Glow {} } }");
-    const CliRun r = Orvane("eval " + Quote(flow.string()) + " Glow1 --json");
-    EXPECT_EQ(r.exitCode, 3);
-    EXPECT_TRUE(Contains(r.out, "\"ok\": false")) << r.out;
-    EXPECT_TRUE(Contains(r.out, "Glow1: the Glow tool is not available yet")) << r.out;
-    EXPECT_TRUE(Contains(r.err, "ERROR: Glow1: the Glow tool is not available yet")) << r.err;
-}
-
-TEST(CliHelp, EveryCommandHasHelpAndTheProgramAVersion) {
+    auto flow = [&](const char *name, const std::string &tools) {
+        return Quote(dir.File(name, "Orvane.Document { Tools = { " + tools + " } }\n").string());
+    };
+    const std::string syntax =
+        Quote(dir.File("syntax.flow", "Orvane.Document {\n\tTools = {\n\t\tA = Blur { Inputs = { x = } },\n").string());
+    const std::string ok = flow("ok.flow", "Blur1 = Blur {}");
+    const std::string wrong = flow("wrong.flow", "Blur1 = Blur { Inputs = { Blend = {} } }");
+    const std::string unknown = flow("unknown.flow", "X1 = FutureTool { Inputs = { Q = 3 } }, Blur1 = Blur {}");
+    const std::string glow = "eval " + flow("planned.flow", "Glow1 = Glow {}") + " Glow1 --json";
+    const std::string sw =
+        flow("switch.flow", "Red = Background { Inputs = { Width = 8, Height = 8, TopLeftRed = 1 } },"
+                            "Blue = Background { Inputs = { Width = 8, Height = 8, TopLeftBlue = 1 } },"
+                            "Sw = Switch { Inputs = { Input0 = Red.Output, Input1 = Blue.Output } }");
+    const std::string blue = "eval " + sw + " Sw --set Sw.Source=Blue --pixel 1,1 --json";
+    const std::string d = dir.Path().string(), lenient = "eval --lenient " + unknown + " X1";
+    const std::string future = d + "/unknown.flow:1:34: X1: unknown class 'FutureTool'";
+    const struct {
+        std::string args;
+        int exitCode;
+        std::vector<std::string> out, err;
+    } cases[] = {
+        // Search finds classes by alias and marks unbuilt ones; abstract and hidden classes only with --all.
+        {"tools --search dither", 0, {"ChangeDepth", "not yet", "1 classes"}, {}},
+        {"tools --search shuffle", 0, {"ChannelBoolean"}, {}},
+        {"tools --all", 0, {"201 classes", "SwitchBase"}, {}},
+        {"tools", 0, {"194 classes"}, {}},
+        {"tools --bogus", 2, {}, {}},
+        {"frobnicate", 2, {}, {}},
+        {"", 2, {"usage: orvane COMMAND"}, {}}, // usage goes to standard output
+        {"rendr x.flow", 2, {}, {"unknown command 'rendr' (did you mean 'render'?)"}},
+        {"describe NoSuchClass", 2, {}, {"ERROR: unknown class 'NoSuchClass'"}},
+        {"describe Glow", 0, {"path:          Tools/Effect/Glow", "built:         not yet", "EffectMask"}, {}},
+        {"describe SetBgColor", 0, {"SetCanvasColor"}, {}}, // an old class ID names the class that replaced it
+        {"describe Switch", 0, {"choices: \"Input 0\" (0), \"Input 1\" (1)"}, {}},
+        // Document errors are one line with exit code 2.
+        {"eval " + syntax + " A", 2, {}, {"ERROR: " + d + "/syntax.flow:3:"}},
+        {"eval " + Quote(d + "/none.flow") + " A", 2, {}, {"cannot open"}},
+        {"eval " + ok + " Nope", 2, {}, {"no tool 'Nope'"}},
+        {"eval " + ok + " Blur1 --set Blur1.NoSuchInput=1", 2, {}, {"has no input 'NoSuchInput'"}},
+        {"eval " + ok + " Blur1 --set 'Blur1.Blend=\"high\"'", 2, {}, {"expects a number"}},
+        {"eval " + wrong + " Blur1", 2, {}, {"Blur1.Blend: expects a number"}},
+        // An unknown class is kept with a warning when lenient, and fails only when asked for.
+        {"eval " + unknown + " Blur1", 2, {}, {"ERROR: " + future}},
+        {lenient, 2, {}, {"WARNING: " + future, "ERROR: tool 'X1' is of a class this program does not know"}},
+        // A tool that is not built fails with exit code 3.
+        {glow, 3, {"\"ok\": false", "Glow1: the Glow tool is not available yet"}, {}},
+        {glow, 3, {}, {"ERROR: Glow1: the Glow tool is not available yet"}},
+        // Choices take names, and a switch's sources are named by the flow.
+        {blue, 0, {"\"values\": [0, 0, 1, 1]", "\"depth\": \"RGBA float32\""}, {}},
+        {"eval " + sw + " Sw --set Sw.Source=Green", 2, {}, {"no choice 'Green' (choices: 0 Red, 1 Blue)"}},
+    };
+    for (const auto &c : cases) {
+        SCOPED_TRACE("orvane " + c.args);
+        const CliRun r = Orvane(c.args);
+        EXPECT_EQ(r.exitCode, c.exitCode) << r.err;
+        for (const std::string &part : c.out) EXPECT_TRUE(Has(r.out, part));
+        for (const std::string &part : c.err) EXPECT_TRUE(Has(r.err, part));
+    }
+    const CliRun offered = Orvane("tools"), loader = Orvane("describe Loader");
+    EXPECT_FALSE(Contains(offered.out, "SwitchBase") || Contains(offered.out, "TeapotMask"));
+    for (const char *id : {"Part", "View", "Layer", "ChannelR", "ChannelA", "ChannelZ", "ChannelYDisp"})
+        EXPECT_TRUE(Has(loader.out, std::string("  Clip1.OpenEXRFormat.") + id + " "));
+    // Every command has help, and the program a version.
     for (const char *command : {"render", "eval", "check", "new", "add", "set", "connect", "remove", "tools",
                                 "describe", "info", "version"}) {
         SCOPED_TRACE(command);
         const CliRun help = Orvane(std::string(command) + " --help");
         EXPECT_EQ(help.exitCode, 0) << help.err;
-        EXPECT_EQ(help.out.rfind(std::string("orvane ") + command, 0), 0u) << help.out;
+        EXPECT_TRUE(Starts(help.out, std::string("orvane ") + command));
         EXPECT_TRUE(help.err.empty()) << help.err;
     }
     const CliRun version = Orvane("--version");
     EXPECT_EQ(version.exitCode, 0);
     EXPECT_TRUE(std::regex_match(version.out, std::regex("orvane [0-9]+\\.[0-9]+\\.[0-9]+\n"))) << version.out;
-    const CliRun bare = Orvane("");
-    EXPECT_EQ(bare.exitCode, 2);
-    EXPECT_TRUE(Contains(bare.out, "usage: orvane COMMAND")) << "usage goes to standard output";
-    const CliRun typo = Orvane("rendr x.flow");
-    EXPECT_EQ(typo.exitCode, 2);
-    EXPECT_TRUE(Contains(typo.err, "unknown command 'rendr' (did you mean 'render'?)")) << typo.err;
 }
 
 /// The input table of a tool in a saved flow.
@@ -138,7 +99,7 @@ ScriptVal InputsIn(const std::filesystem::path &flow, const char *tool) {
     return inputs ? *inputs : ScriptVal();
 }
 
-TEST(CliEdit, AFlowIsBuiltAndChangedFromTheCommandLine) {
+TEST(CliEdit, AFlowIsBuiltChangedAndChecked) {
     TempDir dir;
     const std::string flow = Quote((dir.Path() / "comp.flow").string());
     const std::filesystem::path path = dir.Path() / "comp.flow";
@@ -183,37 +144,33 @@ TEST(CliEdit, AFlowIsBuiltAndChangedFromTheCommandLine) {
     for (const auto &b : bad) {
         const CliRun r = Orvane(b.command);
         EXPECT_EQ(r.exitCode, 2) << b.command;
-        EXPECT_TRUE(Contains(r.err, b.says)) << b.command << "\n" << r.err;
+        EXPECT_TRUE(Has(r.err, b.says)) << b.command;
         EXPECT_EQ(ReadFile(path), before) << b.command;
     }
 
     // Removing a tool takes its links with it; a comment written by hand survives the edits.
-    const std::string commented = "-- made for the test\n" + before;
-    dir.File("comp.flow", commented);
+    dir.File("comp.flow", "-- made for the test\n" + before);
     const CliRun removed = Orvane("remove " + flow + " Small");
     EXPECT_EQ(removed.exitCode, 0) << removed.err;
-    EXPECT_TRUE(Contains(removed.out, "unlinked M1.Background")) << removed.out;
+    EXPECT_TRUE(Has(removed.out, "unlinked M1.Background"));
     EXPECT_EQ(InputsIn(path, "M1").Find("Background"), nullptr);
-    EXPECT_EQ(ReadFile(path).rfind("-- made for the test\nOrvane.Document {", 0), 0u) << ReadFile(path);
-}
-
-TEST(CliCheck, ListsEveryProblemWithItsPlaceAndTheExamplesPass) {
-    TempDir dir;
-    const auto flow = dir.File("bad.flow", "Orvane.Document {\n\tRenderRange = { 10, 1 },\n\tTools = {\n"
-                                           "\t\tB1 = Blur { Inputs = { Filter = \"Gausian\", XBlurSize = -1 } },\n"
-                                           "\t\tM1 = Merge { Inputs = { FilterMethod = 42 } },\n\t},\n}\n");
-    const CliRun r = Orvane("check " + Quote(flow.string()));
+    EXPECT_TRUE(Starts(ReadFile(path), "-- made for the test\nOrvane.Document {"));
+    // Checking lists every problem with its place, and the examples pass.
+    const auto checked = dir.File("bad.flow", "Orvane.Document {\n\tRenderRange = { 10, 1 },\n\tTools = {\n"
+                                              "\t\tB1 = Blur { Inputs = { Filter = \"Gausian\", XBlurSize = -1 } },\n"
+                                              "\t\tM1 = Merge { Inputs = { FilterMethod = 42 } },\n\t},\n}\n");
+    const CliRun r = Orvane("check " + Quote(checked.string()));
     EXPECT_EQ(r.exitCode, 2);
     for (const char *line :
          {":2:16: RenderRange is reversed", ":4:35: B1.Filter: no choice 'Gausian' (did you mean 'Gaussian'?)",
           ":4:58: B1.XBlurSize: -1 is below the least allowed value 0",
           ":5:42: M1.FilterMethod: 42 is not a choice (0 Nearest Neighbor"})
-        EXPECT_TRUE(Contains(r.err, "ERROR: " + flow.string() + line)) << line << "\n" << r.err;
-    EXPECT_TRUE(Contains(r.err, "4 problems")) << r.err;
-    const CliRun lenient = Orvane("check --lenient " + Quote(flow.string()));
+        EXPECT_TRUE(Has(r.err, "ERROR: " + checked.string() + line));
+    EXPECT_TRUE(Has(r.err, "4 problems"));
+    const CliRun lenient = Orvane("check --lenient " + Quote(checked.string()));
     EXPECT_EQ(lenient.exitCode, 0) << lenient.err;
-    EXPECT_TRUE(Contains(lenient.err, "WARNING: " + flow.string() + ":4:35:")) << lenient.err;
-    const CliRun render = Orvane("render " + Quote(flow.string()));
+    EXPECT_TRUE(Has(lenient.err, "WARNING: " + checked.string() + ":4:35:"));
+    const CliRun render = Orvane("render " + Quote(checked.string()));
     EXPECT_EQ(render.exitCode, 2);
     EXPECT_FALSE(Contains(render.out, "FRAME")) << "nothing is rendered";
 
@@ -241,24 +198,6 @@ TEST(CliDescribe, TheToolReferenceIsWhatTheProgramSays) {
     for (std::string line; std::getline(lines, line);)
         built += line.size() > 3 && line.compare(line.size() - 3, 3, "yes") == 0 && !Contains(line, " format ");
     EXPECT_EQ(pages, built) << "one page per built tool";
-}
-
-TEST(CliEval, ChoicesTakeNamesAndSwitchSourcesAreNamedByTheFlow) {
-    TempDir dir;
-    const auto flow =
-        dir.File("switch.flow", "Orvane.Document { Tools = {\n"
-                                " Red = Background { Inputs = { Width = 8, Height = 8, TopLeftRed = 1 } },\n"
-                                " Blue = Background { Inputs = { Width = 8, Height = 8, TopLeftBlue = 1 } },\n"
-                                " Sw = Switch { Inputs = { Input0 = Red.Output, Input1 = Blue.Output } },\n} }\n");
-    const CliRun blue = Orvane("eval " + Quote(flow.string()) + " Sw --set Sw.Source=Blue --pixel 1,1 --json");
-    EXPECT_EQ(blue.exitCode, 0) << blue.err;
-    EXPECT_TRUE(Contains(blue.out, "\"values\": [0, 0, 1, 1]")) << blue.out;
-    EXPECT_TRUE(Contains(blue.out, "\"depth\": \"RGBA float32\"")) << blue.out;
-    const CliRun none = Orvane("eval " + Quote(flow.string()) + " Sw --set Sw.Source=Green");
-    EXPECT_EQ(none.exitCode, 2);
-    EXPECT_TRUE(Contains(none.err, "no choice 'Green' (choices: 0 Red, 1 Blue)")) << none.err;
-    const CliRun described = Orvane("describe Switch");
-    EXPECT_TRUE(Contains(described.out, "choices: \"Input 0\" (0), \"Input 1\" (1)")) << described.out;
 }
 
 } // namespace

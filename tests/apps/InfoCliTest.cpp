@@ -1,9 +1,8 @@
-// orvane info, run as a separate process: a file is reported as itself and a
-// sequence only when asked or named so; OpenEXR headers as exrheader reads
-// them; other formats' channels and depths as ImageMagick reads them; the
-// Loader's OpenEXR choices in orvane describe.
+// orvane info as a separate process: a file is itself, a sequence only when asked or named so; OpenEXR headers
+// as exrheader reads them, other formats' channels and depths as ImageMagick reads them.
 #include <gtest/gtest.h>
 
+#include <functional>
 #include <map>
 #include <regex>
 #include <vector>
@@ -74,67 +73,55 @@ TEST(CliInfo, AFileIsItselfAndASequenceIsAskedForOrNamed) {
 
 /// Per part: the windows, compression, tiles and channels, in one notation.
 using Parts = std::vector<std::vector<std::string>>;
+using Rule = std::pair<std::regex, std::function<std::string(const std::smatch &)>>;
 
-Parts FromExrheader(const std::string &text) {
-    static const std::map<std::string, std::string> compression = {{"none", "none"},
-                                                                   {"run-length encoding", "rle"},
-                                                                   {"zip, individual scanlines", "zips"},
-                                                                   {"zip, multi-scanline blocks", "zip"},
-                                                                   {"piz", "piz"},
-                                                                   {"pxr24", "pxr24"},
-                                                                   {"b44", "b44"},
-                                                                   {"b44a", "b44a"},
-                                                                   {"dwa, small scanline blocks", "dwaa"},
-                                                                   {"dwa, medium scanline blocks", "dwab"}};
-    static const std::map<std::string, std::string> types = {
-        {"16-bit floating-point", "half"}, {"32-bit floating-point", "float"}, {"32-bit unsigned integer", "uint32"}};
-    const std::regex part(R"(^ part \d+:$)"),
-        box(R"(^(data|display)Window \(type box2i\): \((-?\d+) (-?\d+)\) - \((-?\d+) (-?\d+)\)$)"),
-        comp(R"(^compression \(type compression\): (.*)$)"),
-        channel(R"(^    (.+), (\d+-bit [a-z -]+), sampling (\d+ \d+(, plinear)?)$)"),
-        tile(R"(^    tile size (\d+) by (\d+) pixels$)");
+/// The facts `rules` make of the lines of `text`, per part: a part starts at a line matching `part`, or at the
+/// first line starting with `single` in a file of one part.
+Parts Facts(const std::string &text, const std::regex &part, const std::vector<Rule> &rules, const char *single) {
     Parts parts;
     std::istringstream in(text);
     std::smatch m;
     for (std::string line; std::getline(in, line);) {
-        if (std::regex_match(line, part) || (parts.empty() && line.rfind("channels (type", 0) == 0))
+        if (std::regex_match(line, part) || (parts.empty() && *single && line.rfind(single, 0) == 0))
             parts.emplace_back();
-        if (parts.empty()) continue;
-        if (std::regex_match(line, m, box))
-            parts.back().push_back(m[1].str() + " " + m[2].str() + "," + m[3].str() + " - " + m[4].str() + "," +
-                                   m[5].str());
-        else if (std::regex_match(line, m, comp))
-            parts.back().push_back("compression " + compression.at(m[1]));
-        else if (std::regex_match(line, m, channel))
-            parts.back().push_back("channel " + m[1].str() + " " + types.at(m[2]) + " " + m[3].str());
-        else if (std::regex_match(line, m, tile))
-            parts.back().push_back("tiles " + m[1].str() + " x " + m[2].str());
+        for (const auto &[re, fact] : rules)
+            if (!parts.empty() && std::regex_match(line, m, re)) parts.back().push_back(fact(m));
     }
     for (auto &p : parts) std::sort(p.begin(), p.end());
     return parts;
 }
 
+Parts FromExrheader(const std::string &text) {
+    static const std::map<std::string, std::string> renamed = {{"run-length encoding", "rle"},
+                                                               {"zip, individual scanlines", "zips"},
+                                                               {"zip, multi-scanline blocks", "zip"},
+                                                               {"dwa, small scanline blocks", "dwaa"},
+                                                               {"dwa, medium scanline blocks", "dwab"}};
+    static const std::map<std::string, std::string> types = {
+        {"16-bit floating-point", "half"}, {"32-bit floating-point", "float"}, {"32-bit unsigned integer", "uint32"}};
+    static const std::vector<Rule> rules = {
+        {std::regex(R"(^(data|display)Window \(type box2i\): \((-?\d+) (-?\d+)\) - \((-?\d+) (-?\d+)\)$)"),
+         [](const std::smatch &m) {
+             return m[1].str() + " " + m[2].str() + "," + m[3].str() + " - " + m[4].str() + "," + m[5].str();
+         }},
+        {std::regex(R"(^compression \(type compression\): (.*)$)"),
+         [](const std::smatch &m) { return "compression " + (renamed.count(m[1]) ? renamed.at(m[1]) : m[1].str()); }},
+        {std::regex(R"(^    (.+), (\d+-bit [a-z -]+), sampling (\d+ \d+(, plinear)?)$)"),
+         [](const std::smatch &m) { return "channel " + m[1].str() + " " + types.at(m[2]) + " " + m[3].str(); }},
+        {std::regex(R"(^    tile size (\d+) by (\d+) pixels$)"),
+         [](const std::smatch &m) { return "tiles " + m[1].str() + " x " + m[2].str(); }}};
+    return Facts(text, std::regex(R"(^ part \d+:$)"), rules, "channels (type");
+}
+
 Parts FromInfo(const std::string &text) {
-    const std::regex part(R"(^  part \d+ .*$)"), field(R"(^    (data|display) window \(file, y down\) +(.*)$)"),
-        comp(R"(^    compression +(\S+)$)"), channel(R"(^    channel +(.+) (\S+), sampling (\d+ \d+(, plinear)?)$)"),
-        tile(R"(^    tiles +(\d+ x \d+),.*$)");
-    Parts parts;
-    std::istringstream in(text);
-    std::smatch m;
-    for (std::string line; std::getline(in, line);) {
-        if (std::regex_match(line, part)) parts.emplace_back();
-        if (parts.empty()) continue;
-        if (std::regex_match(line, m, field))
-            parts.back().push_back(m[1].str() + " " + m[2].str());
-        else if (std::regex_match(line, m, comp))
-            parts.back().push_back("compression " + m[1].str());
-        else if (std::regex_match(line, m, channel))
-            parts.back().push_back("channel " + m[1].str() + " " + m[2].str() + " " + m[3].str());
-        else if (std::regex_match(line, m, tile))
-            parts.back().push_back("tiles " + m[1].str());
-    }
-    for (auto &p : parts) std::sort(p.begin(), p.end());
-    return parts;
+    static const std::vector<Rule> rules = {
+        {std::regex(R"(^    (data|display) window \(file, y down\) +(.*)$)"),
+         [](const std::smatch &m) { return m[1].str() + " " + m[2].str(); }},
+        {std::regex(R"(^    compression +(\S+)$)"), [](const std::smatch &m) { return "compression " + m[1].str(); }},
+        {std::regex(R"(^    channel +(.+) (\S+), sampling (\d+ \d+(, plinear)?)$)"),
+         [](const std::smatch &m) { return "channel " + m[1].str() + " " + m[2].str() + " " + m[3].str(); }},
+        {std::regex(R"(^    tiles +(\d+ x \d+),.*$)"), [](const std::smatch &m) { return "tiles " + m[1].str(); }}};
+    return Facts(text, std::regex(R"(^  part \d+ .*$)"), rules, "");
 }
 
 TEST(CliInfo, OpenEXRPartsAgreeWithExrheader) {
@@ -142,19 +129,15 @@ TEST(CliInfo, OpenEXRPartsAgreeWithExrheader) {
         GTEST_SKIP() << "the OpenEXR sample images or tools are absent";
     TempDir dir;
     const std::string tiled = (dir.Path() / "tiled.exr").string();
-    ASSERT_EQ(std::system(("exrmaketiled -t 16 32 -m -z zip " + Quote(Samples() + "/DisplayWindow/t08.exr") + " " +
-                           Quote(tiled) + " >/dev/null")
-                              .c_str()),
-              0);
-    // Multi-part views, single-part views, a luminance / chroma file with
-    // sub-sampled channels, pxr24, piz, zip and tiled mip-maps.
-    const std::string files[] = {Samples() + "/Beachball/multipart.0001.exr",
-                                 Samples() + "/Beachball/singlepart.0001.exr",
-                                 Samples() + "/Chromaticities/Rec709_YC.exr",
-                                 Samples() + "/TestImages/GrayRampsHorizontal.exr",
-                                 Samples() + "/DisplayWindow/t08.exr",
-                                 Samples() + "/TestImages/WideColorGamut.exr",
-                                 tiled};
+    ASSERT_TRUE(FmtTest::RunShell("exrmaketiled -t 16 32 -m -z zip " + Quote(Samples() + "/DisplayWindow/t08.exr") +
+                                  " " + Quote(tiled) + " >/dev/null"));
+    // Multi-part views, single-part views, a luminance / chroma file with sub-sampled channels, pxr24, piz, zip
+    // and tiled mip-maps.
+    std::vector<std::string> files{tiled};
+    for (const char *name :
+         {"Beachball/multipart.0001.exr", "Beachball/singlepart.0001.exr", "Chromaticities/Rec709_YC.exr",
+          "TestImages/GrayRampsHorizontal.exr", "DisplayWindow/t08.exr", "TestImages/WideColorGamut.exr"})
+        files.push_back(Samples() + "/" + name);
     const bool python = HaveProgram("python3");
     for (const std::string &file : files) {
         SCOPED_TRACE(file);
@@ -166,8 +149,7 @@ TEST(CliInfo, OpenEXRPartsAgreeWithExrheader) {
         if (!python) continue;
         // The JSON document parses and holds the same parts and windows.
         const std::string json = Capture(
-            "orvane() { " + Quote(std::string(ORVANE_BINARY_DIR) + "/orvane") + " \"$@\"; }; orvane info --json " +
-            Quote(file) +
+            Quote(std::string(ORVANE_BINARY_DIR) + "/orvane") + " info --json " + Quote(file) +
             " | python3 -c 'import json,sys; d=json.load(sys.stdin)[0]; "
             "print(\" \".join(\"%d,%d-%d,%d\" % tuple(p[\"dataWindow\"]) for p in d[\"openexr\"][\"parts\"]))'");
         std::string windows;
@@ -196,7 +178,7 @@ TEST(CliInfo, OtherFormatsGiveTheChannelsAndDepthTheFileHas) {
     for (const auto &[name, how] : made) {
         SCOPED_TRACE(name);
         const std::string path = (dir.Path() / name).string();
-        ASSERT_EQ(std::system(("convert " + std::string(how) + " " + Quote(path)).c_str()), 0);
+        ASSERT_TRUE(FmtTest::RunShell("convert " + std::string(how) + " " + Quote(path)));
         std::istringstream id(Capture("identify -format '%[channels] %z' " + Quote(path)));
         std::string channels;
         int bits = 0;
@@ -212,13 +194,6 @@ TEST(CliInfo, OtherFormatsGiveTheChannelsAndDepthTheFileHas) {
         EXPECT_EQ(m[1].str(), want);
         EXPECT_EQ(Contains(r.out, "image                            RGBA int16"), bits == 16) << r.out;
     }
-}
-
-TEST(CliDescribe, TheLoaderShowsTheOpenEXRChoices) {
-    const CliRun r = Orvane("describe Loader");
-    ASSERT_EQ(r.exitCode, 0) << r.err;
-    for (const char *id : {"Part", "View", "Layer", "ChannelR", "ChannelA", "ChannelZ", "ChannelYDisp"})
-        EXPECT_TRUE(Contains(r.out, std::string("  Clip1.OpenEXRFormat.") + id + " ")) << id << "\n" << r.out;
 }
 
 } // namespace

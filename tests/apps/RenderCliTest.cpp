@@ -1,5 +1,5 @@
-// orvane render as a separate process: the files it writes and refuses to
-// write, its report lines and JSON events, exit codes and signals.
+// orvane render as a separate process: the files it writes and refuses to write, its report lines and JSON
+// events, exit codes and signals, and input that could stall or exhaust it.
 #include <gtest/gtest.h>
 
 #include <array>
@@ -29,6 +29,20 @@ std::string GradientFlow(const fs::path &dir, const std::string &extra = {}) {
     return SaverFlow({{"Out", (dir / "out/f.####.png").string(), ", CreateDir = 1" + extra}});
 }
 
+/// A flow (of these document settings) copying `clip` (`dir`/out/f.0001.png) through a Loader (with more inputs)
+/// to numbered TGA files in `dir`/copy.
+std::string CopyFlow(const fs::path &dir, const std::string &settings, const std::string &more, fs::path clip = {}) {
+    return "Orvane.Document { Version = 1" + settings + ", Tools = {\n  In = Loader { Inputs = { Clip = \"" +
+           (clip.empty() ? dir / "out/f.0001.png" : clip).string() + "\", GlobalIn = 1" + more +
+           " } },\n  Out = Saver { Inputs = { Clip = \"" + (dir / "copy/c.####.tga").string() +
+           "\", CreateDir = 1, Input = In.Output } },\n} }\n";
+}
+
+/// `orvane render FLOW ARGS`.
+CliRun Render(const fs::path &flow, const std::string &args = "") {
+    return Orvane("render " + Quote(flow.string()) + args);
+}
+
 /// Names in `dir` that are temporary files of a write.
 std::vector<std::string> Temporaries(const fs::path &dir) {
     std::vector<std::string> found;
@@ -40,35 +54,40 @@ std::vector<std::string> Temporaries(const fs::path &dir) {
 
 TEST(CliRender, WritesEveryFrameAndReportsIt) {
     TempDir dir;
+    fs::create_directories(dir.Path() / "out");
+    // Temporaries left by a killed render on another machine, untouched for two hours: the render's own go,
+    // another output's stay.
+    const fs::path stale = dir.Path() / "out/.f.0002.png.orvane-tmp-farm7-4242";
+    const fs::path other = dir.Path() / "out/.g.0002.png.orvane-tmp-farm7-4242";
+    for (const fs::path &p : {stale, other}) {
+        std::ofstream(p) << "half a frame";
+        fs::last_write_time(p, fs::file_time_type::clock::now() - std::chrono::hours(2));
+    }
     const auto flow = dir.File("a.flow", GradientFlow(dir.Path()));
-    const CliRun r = Orvane("render " + Quote(flow.string()) + " --frames 3,1-2");
+    const CliRun r = Render(flow, " --frames 3,1-2");
+    EXPECT_FALSE(fs::exists(stale));
+    EXPECT_TRUE(fs::exists(other));
     EXPECT_EQ(r.exitCode, 0) << r.err;
-    EXPECT_EQ(r.out.rfind("RENDER saver=Out files=" + (dir.Path() / "out/f.####.png").string() +
-                              " frames=1-3 format=PNGFormat\n",
-                          0),
-              0u)
-        << r.out;
-    EXPECT_TRUE(Contains(r.out, "FRAME 3 done 1/3 saver=Out file=" + (dir.Path() / "out/f.0003.png").string() + " "))
-        << r.out;
-    EXPECT_TRUE(Contains(r.out, "FRAME 2 done 3/3 saver=Out")) << r.out;
-    EXPECT_TRUE(Contains(r.out, "SUMMARY written=3 failed=0 skipped=0")) << r.out;
+    EXPECT_TRUE(Starts(r.out, "RENDER saver=Out files=" + (dir.Path() / "out/f.####.png").string() +
+                                  " frames=1-3 format=PNGFormat\n"));
+    EXPECT_TRUE(Has(r.out, "FRAME 3 done 1/3 saver=Out file=" + (dir.Path() / "out/f.0003.png").string() + " "));
+    EXPECT_TRUE(Has(r.out, "FRAME 2 done 3/3 saver=Out"));
+    EXPECT_TRUE(Has(r.out, "SUMMARY written=3 failed=0 skipped=0"));
     for (const char *f : {"f.0001.png", "f.0002.png", "f.0003.png"}) EXPECT_TRUE(fs::exists(dir.Path() / "out" / f));
 
     // Existing files are left alone with --skip-existing; JSON lines say so.
     const auto before = fs::last_write_time(dir.Path() / "out/f.0001.png");
-    const CliRun again = Orvane("render " + Quote(flow.string()) + " --skip-existing --log-format json");
+    const CliRun again = Render(flow, " --skip-existing --log-format json");
     EXPECT_EQ(again.exitCode, 0) << again.err;
-    EXPECT_TRUE(Contains(again.out, "{\"event\": \"render\", \"saver\": \"Out\", \"files\": \"" +
-                                        (dir.Path() / "out/f.####.png").string() +
-                                        "\", \"frames\": \"1-3\", \"format\": \"PNGFormat\"}\n"))
-        << again.out;
-    EXPECT_TRUE(Contains(again.out, "{\"event\": \"frame\", \"frame\": 1, \"status\": \"skipped\"")) << again.out;
-    EXPECT_TRUE(Contains(again.out, "\"event\": \"summary\", \"written\": 0, \"failed\": 0, \"skipped\": 3"))
-        << again.out;
+    EXPECT_TRUE(Has(again.out, "{\"event\": \"render\", \"saver\": \"Out\", \"files\": \"" +
+                                   (dir.Path() / "out/f.####.png").string() +
+                                   "\", \"frames\": \"1-3\", \"format\": \"PNGFormat\"}\n"));
+    EXPECT_TRUE(Has(again.out, "{\"event\": \"frame\", \"frame\": 1, \"status\": \"skipped\""));
+    EXPECT_TRUE(Has(again.out, "\"event\": \"summary\", \"written\": 0, \"failed\": 0, \"skipped\": 3"));
     EXPECT_EQ(fs::last_write_time(dir.Path() / "out/f.0001.png"), before);
 }
 
-TEST(CliRender, NamesWithoutANumberAreNumberedForSeveralFrames) {
+TEST(CliRender, NamesAreNumberedForSeveralFramesAndEventsCarryTheirFactsInFields) {
     TempDir dir;
     const auto flow = dir.File("a.flow", SaverFlow({{"Out", (dir.Path() / "still.png").string(), ""}}));
     const struct {
@@ -79,11 +98,28 @@ TEST(CliRender, NamesWithoutANumberAreNumberedForSeveralFrames) {
         {"1-2 --chunk 2/2", "still.####.png", "still.0002.png"}, // a chunk numbers as its whole range
     };
     for (const auto &c : cases) {
-        const CliRun r = Orvane("render " + Quote(flow.string()) + " --frames " + c.frames);
+        const CliRun r = Render(flow, std::string(" --frames ") + c.frames);
         EXPECT_EQ(r.exitCode, 0) << r.err;
-        EXPECT_TRUE(Contains(r.out, "files=" + (dir.Path() / c.files).string() + " ")) << r.out;
+        EXPECT_TRUE(Has(r.out, "files=" + (dir.Path() / c.files).string() + " "));
         EXPECT_TRUE(fs::exists(dir.Path() / c.lastFile)) << c.frames;
     }
+    // Events carry their facts in fields: an Output Format not the extension's writes, with a warning naming both.
+    const auto formats =
+        dir.File("b.flow", SaverFlow({{"Out", (dir.Path() / "f.####.png").string(),
+                                       ", OutputFormat = \"TargaFormat\", SoundFilename = \"a.wav\""}}));
+    const CliRun text = Render(formats, " --frames 1");
+    EXPECT_EQ(text.exitCode, 0) << text.err;
+    const std::string warning = "WARNING: saver=Out format=TargaFormat extension=.png: ";
+    EXPECT_TRUE(Has(text.err, warning) && text.err.find(warning) == text.err.rfind(warning));
+    EXPECT_NE(ReadFile(dir.Path() / "f.0001.png").substr(1, 3), "PNG");
+    const CliRun json = Render(formats, " --frames 1 --log-format json");
+    EXPECT_TRUE(Has(json.out, "{\"event\": \"warning\", \"code\": \"format_mismatch\", \"saver\": \"Out\", "
+                              "\"format\": \"TargaFormat\", \"extension\": \"png\", \"extension_format\": "
+                              "\"PNGFormat\", \"warning\": "));
+    // A tool's console line says which tool it came from.
+    EXPECT_TRUE(Has(json.out, "{\"event\": \"warning\", \"code\": \"tool\", \"frame\": 1, \"saver\": \"Out\", "
+                              "\"tool\": \"Out\", \"warning\": \"Warning: Out: No supported audio found in a.wav\"}"));
+    EXPECT_TRUE(json.err.empty()) << json.err;
 }
 
 TEST(CliRender, RefusesBeforeTheFirstFrameToWriteOneFileTwice) {
@@ -106,59 +142,19 @@ TEST(CliRender, RefusesBeforeTheFirstFrameToWriteOneFileTwice) {
     for (const auto &c : cases) {
         SCOPED_TRACE(c.b);
         const auto flow = dir.File("a.flow", SaverFlow({{"A", c.a, ""}, {"B", c.b, ""}}));
-        const CliRun r = Orvane("render " + Quote(flow.string()) + c.args);
+        const CliRun r = Render(flow, c.args);
         EXPECT_EQ(r.exitCode, 2);
-        EXPECT_TRUE(Contains(r.err, c.message)) << r.err;
+        EXPECT_TRUE(Has(r.err, c.message));
         EXPECT_FALSE(Contains(r.out, "FRAME")) << r.out;
         EXPECT_TRUE(fs::is_empty(out)) << "nothing is written";
     }
     // In JSON the Savers, frames and the file are fields.
     const auto flow = dir.File("a.flow", SaverFlow({{"A", cases[1].a, ""}, {"B", cases[1].b, ""}}));
-    const CliRun json = Orvane("render " + Quote(flow.string()) + " --frames 2 --log-format json");
+    const CliRun json = Render(flow, " --frames 2 --log-format json");
     EXPECT_EQ(json.exitCode, 2);
-    EXPECT_EQ(json.out.rfind("{\"event\": \"error\", \"code\": \"same_file\", \"saver\": \"A\", \"frame\": 2, "
-                             "\"file\": \"" +
-                                 cases[1].a +
-                                 "\", \"count\": 1, \"other_saver\": \"B\", \"other_frame\": 2, \"error\": ",
-                             0),
-              0u)
-        << json.out;
-}
-
-TEST(CliRender, ReplacesOnlyRegularFiles) {
-    TempDir dir;
-    const fs::path pipe = dir.Path() / "pipe.png";
-    ASSERT_EQ(mkfifo(pipe.c_str(), 0600), 0);
-    const auto flow = dir.File("a.flow", SaverFlow({{"Out", pipe.string(), ""}}));
-    const CliRun r = Orvane("render " + Quote(flow.string()) + " --frames 1");
-    EXPECT_EQ(r.exitCode, 2) << r.err;
-    EXPECT_TRUE(Contains(r.err, "ERROR: Saver Out, frame 1: " + pipe.string() +
-                                    ": a FIFO, not a regular file; refusing to write over it; nothing was written"))
-        << r.err;
-    EXPECT_TRUE(fs::is_fifo(pipe));
-}
-
-TEST(CliRender, EventsCarryTheirFactsInFields) {
-    TempDir dir;
-    // An Output Format that is not the extension's writes, with a warning naming both.
-    const auto flow = dir.File("a.flow", SaverFlow({{"Out", (dir.Path() / "f.####.png").string(),
-                                                     ", OutputFormat = \"TargaFormat\", SoundFilename = \"a.wav\""}}));
-    const CliRun text = Orvane("render " + Quote(flow.string()) + " --frames 1");
-    EXPECT_EQ(text.exitCode, 0) << text.err;
-    const std::string warning = "WARNING: saver=Out format=TargaFormat extension=.png: ";
-    EXPECT_TRUE(Contains(text.err, warning) && text.err.find(warning) == text.err.rfind(warning)) << text.err;
-    EXPECT_NE(ReadFile(dir.Path() / "f.0001.png").substr(1, 3), "PNG");
-    const CliRun json = Orvane("render " + Quote(flow.string()) + " --frames 1 --log-format json");
-    EXPECT_TRUE(Contains(json.out, "{\"event\": \"warning\", \"code\": \"format_mismatch\", \"saver\": \"Out\", "
-                                   "\"format\": \"TargaFormat\", \"extension\": \"png\", \"extension_format\": "
-                                   "\"PNGFormat\", \"warning\": "))
-        << json.out;
-    // A tool's console line says which tool it came from.
-    EXPECT_TRUE(Contains(json.out,
-                         "{\"event\": \"warning\", \"code\": \"tool\", \"frame\": 1, \"saver\": \"Out\", "
-                         "\"tool\": \"Out\", \"warning\": \"Warning: Out: No supported audio found in a.wav\"}"))
-        << json.out;
-    EXPECT_TRUE(json.err.empty()) << json.err;
+    EXPECT_TRUE(Starts(json.out,
+                       "{\"event\": \"error\", \"code\": \"same_file\", \"saver\": \"A\", \"frame\": 2, \"file\": \"" +
+                           cases[1].a + "\", \"count\": 1, \"other_saver\": \"B\", \"other_frame\": 2, \"error\": "));
 }
 
 TEST(CliRender, ChunksOfARangeWriteTheSameBytesAsTheWholeRange) {
@@ -166,21 +162,19 @@ TEST(CliRender, ChunksOfARangeWriteTheSameBytesAsTheWholeRange) {
     const std::string relative = ", SetSequenceStart = 1, SequenceStartFrame = 1001";
     const auto flowWhole = whole.File("a.flow", GradientFlow(whole.Path(), relative));
     const auto flowParts = parts.File("a.flow", GradientFlow(parts.Path(), relative));
-    ASSERT_EQ(Orvane("render " + Quote(flowWhole.string()) + " --frames 10-14").exitCode, 0);
+    ASSERT_EQ(Render(flowWhole, " --frames 10-14").exitCode, 0);
     for (const char *chunk : {"1/2", "2/2"})
-        ASSERT_EQ(Orvane("render " + Quote(flowParts.string()) + " --frames 10-14 --chunk " + chunk).exitCode, 0);
+        ASSERT_EQ(Render(flowParts, std::string(" --frames 10-14 --chunk ") + chunk).exitCode, 0);
     for (int n = 1001; n <= 1005; ++n) {
         const std::string name = "out/f." + std::to_string(n) + ".png";
         const std::string a = ReadFile(whole.Path() / name), b = ReadFile(parts.Path() / name);
-        EXPECT_FALSE(a.empty()) << name;
-        EXPECT_EQ(a, b) << name;
+        EXPECT_TRUE(!a.empty() && a == b) << name;
     }
 }
 
 TEST(CliRender, TheOpenCLDeviceWritesTheSameFilesAsTheCPU) {
-    // Four-corner ramps graded by a gamma and a linear chain: kernels that do
-    // the rows' float arithmetic (the gamma rounds to 16 bits, hiding the
-    // powers' last bits) must give byte-identical files.
+    // Four-corner ramps graded by a gamma and a linear chain: kernels that do the rows' float arithmetic (the gamma
+    // rounds to 16 bits, hiding the powers' last bits) must give byte-identical files.
     TempDir cpuDir, devDir;
     auto flow = [](const fs::path &dir) {
         return "Orvane.Document { Version = 1, RenderRange = { 1, 2 }, Tools = {\n"
@@ -195,9 +189,9 @@ TEST(CliRender, TheOpenCLDeviceWritesTheSameFilesAsTheCPU) {
     };
     const auto cpuFlow = cpuDir.File("a.flow", flow(cpuDir.Path())),
                devFlow = devDir.File("a.flow", flow(devDir.Path()));
-    const CliRun cpu = Orvane("render " + Quote(cpuFlow.string()) + " --device cpu");
+    const CliRun cpu = Render(cpuFlow, " --device cpu");
     ASSERT_EQ(cpu.exitCode, 0) << cpu.err;
-    const CliRun dev = Orvane("render " + Quote(devFlow.string()) + " --device opencl");
+    const CliRun dev = Render(devFlow, " --device opencl");
     if (dev.exitCode == 2 && Contains(dev.err, "--device opencl")) {
         const char *required = std::getenv("ORVANE_REQUIRE_DEVICE");
         if (required && std::string(required) == "opencl") FAIL() << dev.err;
@@ -207,90 +201,88 @@ TEST(CliRender, TheOpenCLDeviceWritesTheSameFilesAsTheCPU) {
     EXPECT_FALSE(Contains(dev.out + dev.err, "device:")) << "a device run failed: " << dev.out << dev.err;
     for (const char *name : {"out/f.0001.png", "out/f.0002.png"}) {
         const std::string a = ReadFile(cpuDir.Path() / name), b = ReadFile(devDir.Path() / name);
-        EXPECT_FALSE(a.empty()) << name;
-        EXPECT_EQ(a, b) << name;
+        EXPECT_TRUE(!a.empty() && a == b) << name;
     }
     const CliRun bad = Orvane("eval " + Quote(cpuFlow.string()) + " BC --device quantum");
     EXPECT_EQ(bad.exitCode, 2);
-    EXPECT_TRUE(Contains(bad.err, "--device is cpu, auto, opencl or cuda")) << bad.err;
+    EXPECT_TRUE(Has(bad.err, "--device is cpu, auto, opencl or cuda"));
 }
 
 TEST(CliRender, BadRequestsAndFailedFramesHaveTheirExitCodes) {
     TempDir dir;
     const auto flow = dir.File("a.flow", GradientFlow(dir.Path()));
-    EXPECT_EQ(Orvane("render " + Quote(flow.string()) + " --frames 1-x").exitCode, 2);
-    EXPECT_EQ(Orvane("render " + Quote(flow.string()) + " --saver Bg").exitCode, 2);
-    EXPECT_EQ(Orvane("render " + Quote(flow.string()) + " --memory-limit lots").exitCode, 2);
-    EXPECT_EQ(Orvane("render " + Quote(flow.string()) + " --chunk 3/2").exitCode, 2);
-    const auto none = dir.File("none.flow", "Orvane.Document { Version = 1, Tools = { Bg = Background {} } }\n");
-    const CliRun noSaver = Orvane("render " + Quote(none.string()));
-    EXPECT_EQ(noSaver.exitCode, 2);
-    EXPECT_TRUE(Contains(noSaver.err, "has no Saver")) << noSaver.err;
-    const auto nameless = dir.File("nameless.flow", SaverFlow({{"Out", "", ""}}));
-    const CliRun noName = Orvane("render " + Quote(nameless.string()));
-    EXPECT_EQ(noName.exitCode, 2);
-    EXPECT_TRUE(Contains(noName.err, "ERROR: Saver Out has no file name to write to")) << noName.err;
+    const fs::path pipe = dir.Path() / "pipe.png";
+    ASSERT_EQ(mkfifo(pipe.c_str(), 0600), 0);
+    const auto big = dir.File("big.flow", "Orvane.Document { Version = 1, RenderRange = { 0, 0 }, Tools = {\n"
+                                          "Bg = Background { Inputs = { Width = 1024, Height = 1024, Depth = 4 } },\n"
+                                          "Blur1 = Blur { Inputs = { XBlurSize = 4, Input = Bg.Output } },\n"
+                                          "Out = Saver { Inputs = { Clip = \"" +
+                                              (dir.Path() / "big.raw").string() + "\", Input = Blur1.Output } } } }");
+    const struct {
+        fs::path flow;
+        const char *args;
+        int exitCode;
+        std::string message;
+    } bad[] = {
+        {flow, " --frames 1-x", 2, ""},
+        {flow, " --saver Bg", 2, ""},
+        {flow, " --memory-limit lots", 2, ""},
+        {flow, " --chunk 3/2", 2, ""},
+        {dir.File("none.flow", "Orvane.Document { Version = 1, Tools = { Bg = Background {} } }\n"), "", 2,
+         "has no Saver"},
+        {dir.File("nameless.flow", SaverFlow({{"Out", "", ""}})), "", 2,
+         "ERROR: Saver Out has no file name to write to"},
+        // Only regular files are replaced.
+        {dir.File("pipe.flow", SaverFlow({{"Out", pipe.string(), ""}})), " --frames 1", 2,
+         "ERROR: Saver Out, frame 1: " + pipe.string() +
+             ": a FIFO, not a regular file; refusing to write over it; nothing was written"},
+        // A folder that does not exist fails each frame, naming the file once.
+        {dir.File("c.flow", SaverFlow({{"Out", (dir.Path() / "none/x.####.png").string(), ""}})), " --frames 4", 3,
+         "ERROR: frame 4 saver=Out: Out failed to write " + (dir.Path() / "none/x.0004.png").string() +
+             ": the folder does not exist\n"},
+        // A FIFO in place of a file fails its frame at once; --memory-limit bounds a render's images (a 1024 x
+        // 1024 frame and its blur need 16 MiB each) and says what a tool needed.
+        {dir.File("fifo.flow", CopyFlow(dir.Path(), "", "", pipe)), " --frames 1", 3,
+         "In failed to load file \"" + pipe.string() + "\" : is not a regular file (a FIFO)"},
+        {big, " --memory-limit 8M", 3,
+         "ERROR: frame 0 saver=Out: Bg: needs 16 MiB for a 1024x1024 RGBA float32 image; --memory-limit is 8 MiB"},
+        {big, " --memory-limit 40M", 0, ""},
+    };
+    for (const auto &b : bad) {
+        const CliRun r = Render(b.flow, b.args);
+        EXPECT_EQ(r.exitCode, b.exitCode) << b.flow << b.args;
+        EXPECT_TRUE(Has(r.err, b.message));
+    }
+    EXPECT_TRUE(fs::is_fifo(pipe));
+    const CliRun info = Orvane("info " + Quote(pipe.string()));
+    EXPECT_EQ(info.exitCode, 3);
+    EXPECT_EQ(info.out + info.err, "ERROR: " + pipe.string() + " is not a regular file (a FIFO)\n");
 
     // A Loader whose frame 2 is missing: that frame fails, the others are written.
-    ASSERT_EQ(Orvane("render " + Quote(flow.string()) + " --frames 1,3").exitCode, 0);
-    const auto chain = dir.File("b.flow", "Orvane.Document { Version = 1, RenderRange = { 1, 3 }, Tools = {\n"
-                                          "  In = Loader { Inputs = { Clip = \"" +
-                                              (dir.Path() / "out/f.0001.png").string() +
-                                              "\", GlobalIn = 1 } },\n"
-                                              "  Out = Saver { Inputs = { Clip = \"" +
-                                              (dir.Path() / "copy/c.####.tga").string() +
-                                              "\", CreateDir = 1, Input = In.Output } },\n} }\n");
-    const CliRun failed = Orvane("render " + Quote(chain.string()));
+    ASSERT_EQ(Render(flow, " --frames 1,3").exitCode, 0);
+    const auto chain = dir.File("b.flow", CopyFlow(dir.Path(), ", RenderRange = { 1, 3 }", ""));
+    const CliRun failed = Render(chain);
     EXPECT_EQ(failed.exitCode, 3) << failed.out << failed.err;
-    EXPECT_TRUE(Contains(failed.err, "ERROR: frame 2 saver=Out: In failed to load file")) << failed.err;
-    EXPECT_TRUE(Contains(failed.out, "SUMMARY written=2 failed=1")) << failed.out;
-    EXPECT_TRUE(Contains(failed.out, "FAILED saver=Out frames=2")) << failed.out;
+    EXPECT_TRUE(Has(failed.err, "ERROR: frame 2 saver=Out: In failed to load file"));
+    EXPECT_TRUE(Has(failed.out, "SUMMARY written=2 failed=1"));
+    EXPECT_TRUE(Has(failed.out, "FAILED saver=Out frames=2"));
     EXPECT_TRUE(fs::exists(dir.Path() / "copy/c.0003.tga"));
     EXPECT_FALSE(fs::exists(dir.Path() / "copy/c.0002.tga"));
     // In JSON the failed frame names the tool that failed and the file it was for.
-    const CliRun json = Orvane("render " + Quote(chain.string()) + " --frames 2 --log-format json");
-    EXPECT_TRUE(Contains(json.out, "{\"event\": \"error\", \"code\": \"frame_failed\", \"frame\": 2, \"saver\": "
-                                   "\"Out\", \"tool\": \"In\", \"file\": \"" +
-                                       (dir.Path() / "copy/c.0002.tga").string() +
-                                       "\", \"error\": \"frame 2 saver=Out: In failed to load file"))
-        << json.out;
-    // A folder that does not exist fails each frame, naming the file once.
-    const auto noFolder = dir.File("c.flow", SaverFlow({{"Out", (dir.Path() / "none/x.####.png").string(), ""}}));
-    const CliRun missing = Orvane("render " + Quote(noFolder.string()) + " --frames 4");
-    EXPECT_EQ(missing.exitCode, 3);
-    EXPECT_TRUE(Contains(missing.err, "ERROR: frame 4 saver=Out: Out failed to write " +
-                                          (dir.Path() / "none/x.0004.png").string() + ": the folder does not exist\n"))
-        << missing.err;
-}
-
-TEST(CliRender, TemporariesOfAKilledRenderGoAtTheNextRender) {
-    TempDir dir;
-    fs::create_directories(dir.Path() / "out");
-    // Left by a render on another machine, untouched for two hours, and one of another output.
-    const fs::path stale = dir.Path() / "out/.f.0002.png.orvane-tmp-farm7-4242";
-    const fs::path other = dir.Path() / "out/.g.0002.png.orvane-tmp-farm7-4242";
-    for (const fs::path &p : {stale, other}) {
-        std::ofstream(p) << "half a frame";
-        fs::last_write_time(p, fs::file_time_type::clock::now() - std::chrono::hours(2));
-    }
-    const auto flow = dir.File("a.flow", GradientFlow(dir.Path()));
-    ASSERT_EQ(Orvane("render " + Quote(flow.string()) + " --frames 1").exitCode, 0);
-    EXPECT_FALSE(fs::exists(stale));
-    EXPECT_TRUE(fs::exists(other));
+    const CliRun json = Render(chain, " --frames 2 --log-format json");
+    EXPECT_TRUE(Has(json.out, "{\"event\": \"error\", \"code\": \"frame_failed\", \"frame\": 2, \"saver\": "
+                              "\"Out\", \"tool\": \"In\", \"file\": \"" +
+                                  (dir.Path() / "copy/c.0002.tga").string() +
+                                  "\", \"error\": \"frame 2 saver=Out: In failed to load file"));
 }
 
 TEST(CliRender, ASecondSignalStillListsTheFilesWritten) {
     TempDir dir;
     const auto flow = dir.File("a.flow", GradientFlow(dir.Path()));
-    ASSERT_EQ(Orvane("render " + Quote(flow.string()) + " --frames 1").exitCode, 0);
+    ASSERT_EQ(Render(flow, " --frames 1").exitCode, 0);
     // Frame 2 of the Loader's clip never arrives: "Wait" holds the render there.
-    const auto chain = dir.File(
-        "b.flow", "Orvane.Document { Version = 1, Tools = {\n"
-                  "  In = Loader { Inputs = { Clip = \"" +
-                      (dir.Path() / "out/f.0001.png").string() +
-                      "\", GlobalIn = 1, GlobalOut = 3, ClipTimeEnd = 2, MissingFrames = 3 } },\n"
-                      "  Out = Saver { Inputs = { Clip = \"" +
-                      (dir.Path() / "copy/c.####.tga").string() + "\", CreateDir = 1, Input = In.Output } },\n} }\n");
+    const auto chain =
+        dir.File("b.flow", CopyFlow(dir.Path(), "", ", GlobalOut = 3, ClipTimeEnd = 2, MissingFrames = 3"));
     const std::string file = (dir.Path() / "copy/c.0001.tga").string();
     const struct {
         int signal;

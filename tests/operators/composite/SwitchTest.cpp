@@ -1,7 +1,5 @@
-// The switches: which input is handed on (the very object, for images, 3D
-// values and pending transforms alike), that the others are not rendered,
-// the failures with their console lines, and how positions grow and survive
-// a document round trip.
+// The switches: the very object of the chosen input handed on (images, 3D values, pending transforms), the
+// others not rendered, failures with their console lines, positions growing and surviving a document.
 #include <gtest/gtest.h>
 
 #include <string>
@@ -112,7 +110,7 @@ protected:
     std::vector<Ref<Image>> images; ///< what each source outputs
 };
 
-TEST_F(SwitchTest, HandsOnTheChosenImageItselfAndRendersNothingElse) {
+TEST_F(SwitchTest, HandsOnTheChosenImageItselfAndRendersNothingElseOrFailsWithOneLine) {
     Operator *sw = MakeSwitch(3);
     ASSERT_NE(sw, nullptr);
     EXPECT_FALSE(sw->IsPlaceholder());
@@ -132,11 +130,7 @@ TEST_F(SwitchTest, HandsOnTheChosenImageItselfAndRendersNothingElse) {
         for (int i = 0; i < 3; ++i) EXPECT_EQ(after[i] - before[i], i == c.chosen ? 1 : 0) << "source " << i;
         EXPECT_TRUE(Lines().empty());
     }
-}
-
-TEST_F(SwitchTest, PreCalculationRegionsAndSkipRoIFollowTheChosenInput) {
-    Operator *sw = MakeSwitch(3);
-    ASSERT_NE(sw, nullptr);
+    // Pre-calculation regions and SkipRoI follow the chosen input.
     for (int i = 0; i < 3; ++i) {
         ts::SetNumber(sw, "Source", i);
         Ref<Parameter> shape = Eval(sw, 0.0, ReqFlagPreCalc);
@@ -144,65 +138,49 @@ TEST_F(SwitchTest, PreCalculationRegionsAndSkipRoIFollowTheChosenInput) {
         ASSERT_TRUE(img && img->IsNoData());
         EXPECT_EQ(img->DataWindow(), ImgRectI(i, 0, 8 + i, 6)) << i;
     }
-    // A region of interest reaches the chosen input unchanged: its pixels
-    // come back for exactly that region.
+    // A region of interest reaches the chosen input unchanged: its pixels come back for exactly that region.
     ts::SetNumber(sw, "Source", 2);
     const ImgRectI roi(3, 1, 6, 4);
+    const size_t asked = sources[2]->asked.size();
     Ref<Image> part = ts::EvalImage(sw, 0.0, &roi);
-    ASSERT_NE(part, nullptr);
+    ASSERT_TRUE(part && sources[2]->asked.size() == asked + 1);
     for (int y = roi.y0; y < roi.y1; ++y)
         for (int x = roi.x0; x < roi.x1; ++x) EXPECT_EQ(part->GetFlt(x, y), images[2]->GetFlt(x, y)) << x << "," << y;
-    ASSERT_EQ(sources[2]->asked.size(), 1u);
-    ASSERT_TRUE(sources[2]->asked[0].has_value());
-    EXPECT_EQ(sources[2]->asked[0]->rect, roi);
+    ASSERT_TRUE(sources[2]->asked.back());
+    EXPECT_EQ(sources[2]->asked.back()->rect, roi);
 
-    // With SkipRoI the request is left alone: all inputs render, and the
-    // result is still the chosen one.
+    // With SkipRoI the request is left alone: all inputs render, and the result is still the chosen one.
     ts::SetNumber(sw, "Source", 1);
     const std::vector<int> before = Counts();
     Ref<Parameter> out = Eval(sw, 0.0, ReqFlagSkipRoI);
     EXPECT_EQ(out.Get(), images[1].Get());
     for (int i = 0; i < 3; ++i) EXPECT_EQ(Counts()[i], before[i] + 1) << i;
-}
 
-TEST_F(SwitchTest, ASourceOutsideTheInputsOrUnconnectedFailsWithOneLine) {
-    Operator *sw = MakeSwitch(3);
-    ASSERT_NE(sw, nullptr);
+    // Fewer inputs than positions made: the range follows NumberOfInputs. A chosen position without a link
+    // fails in pre-calculation too.
+    const std::string to = " - the switch tool tried to switch to a non-existant input ",
+                      only = " (currently inputs only exist for the range [0, ";
     const struct {
-        double source, time;
-        const char *line;
-    } cases[] = {
-        {3, 0,
-         "Switch1 failed at time 0.0 - the switch tool tried to switch to a non-existant input 3 (currently "
-         "inputs only exist for the range [0, 2])"},
-        {-1, 12.3,
-         "Switch1 failed at time 12.3 - the switch tool tried to switch to a non-existant input -1 "
-         "(currently inputs only exist for the range [0, 2])"},
+        double inputs, source, time;
+        uint32_t flags;
+        std::string line;
+    } failures[] = {
+        {3, 3, 0, 0, "Switch1 failed at time 0.0" + to + "3" + only + "2])"},
+        {3, -1, 12.3, 0, "Switch1 failed at time 12.3" + to + "-1" + only + "2])"},
+        {2, 2, 0, 0, "Switch1 failed at time 0.0" + to + "2" + only + "1])"},
+        {4, 3, 7, 0, "Switch1.Input3 failed at time 7.0 - unconnected input"},
+        {4, 3, 7, ReqFlagPreCalc, "Switch1.Input3 failed at time 7.0 - unconnected input"},
     };
-    for (const auto &c : cases) {
-        SCOPED_TRACE(c.source);
-        ts::SetNumber(sw, "Source", c.source);
+    for (const auto &c : failures) {
+        SCOPED_TRACE(c.line);
+        ts::SetNumbers(sw, {{"NumberOfInputs", c.inputs}, {"Source", c.source}});
         doc->ClearConsole();
         const std::vector<int> before = Counts();
-        EXPECT_EQ(Eval(sw, c.time), nullptr);
+        EXPECT_EQ(Eval(sw, c.time, c.flags), nullptr);
         EXPECT_EQ(Lines(), std::vector<std::string>{c.line});
         EXPECT_EQ(Counts(), before) << "a failing switch renders none of its inputs";
     }
-    // Fewer inputs than positions made: the range follows NumberOfInputs.
-    ts::SetNumbers(sw, {{"NumberOfInputs", 2}, {"Source", 2}});
-    doc->ClearConsole();
-    EXPECT_EQ(Eval(sw), nullptr);
-    EXPECT_EQ(Lines(), std::vector<std::string>{"Switch1 failed at time 0.0 - the switch tool tried to switch to a "
-                                                "non-existant input 2 (currently inputs only exist for the range "
-                                                "[0, 1])"});
-    // A chosen position without a link fails in pre-calculation too; one
-    // that is not chosen is no failure.
-    ts::SetNumbers(sw, {{"NumberOfInputs", 4}, {"Source", 3}});
-    for (uint32_t flags : {0u, ReqFlagPreCalc}) {
-        doc->ClearConsole();
-        EXPECT_EQ(Eval(sw, 7.0, flags), nullptr);
-        EXPECT_EQ(Lines(), std::vector<std::string>{"Switch1.Input3 failed at time 7.0 - unconnected input"});
-    }
+    // A position without a link that is not chosen is no failure.
     ts::SetNumber(sw, "Source", 1);
     doc->ClearConsole();
     EXPECT_NE(Eval(sw, 7.0), nullptr);
@@ -218,9 +196,8 @@ TEST_F(SwitchTest, PositionsGrowHideAndSurviveADocument) {
         return n;
     };
     EXPECT_EQ(positions(sw), 2);
-    Input *source = sw->FindInput("Source");
-    ASSERT_NE(source, nullptr);
-    EXPECT_EQ(source->Priority(), sw->FindInput("Input0")->Priority() - 1) << "Source is known when inputs are chosen";
+    EXPECT_EQ(sw->FindInput("Source")->Priority(), sw->FindInput("Input0")->Priority() - 1)
+        << "Source is known when inputs are chosen";
 
     ts::SetNumber(sw, "NumberOfInputs", 5);
     EXPECT_EQ(positions(sw), 5);
@@ -229,7 +206,6 @@ TEST_F(SwitchTest, PositionsGrowHideAndSurviveADocument) {
     ASSERT_TRUE(sw->FindInput("Name4")->SetValue(MakeRef<Text>("late one")));
     ts::SetNumber(sw, "Source", 4);
     Ref<Image> before = ts::EvalImage(sw);
-    ASSERT_NE(before, nullptr);
 
     // Lowering the count hides positions; they keep their links.
     ts::SetNumber(sw, "NumberOfInputs", 3);
@@ -238,8 +214,7 @@ TEST_F(SwitchTest, PositionsGrowHideAndSurviveADocument) {
     EXPECT_FALSE(sw->FindInput("Input3")->IsVisible() || sw->FindInput("Name4")->IsVisible());
     EXPECT_EQ(sw->FindInput("Input4")->Link(), src->Out());
     ts::SetNumber(sw, "NumberOfInputs", 5);
-    EXPECT_TRUE(sw->FindInput("Input4")->IsVisible());
-    EXPECT_EQ(positions(sw), 5);
+    EXPECT_TRUE(sw->FindInput("Input4")->IsVisible() && positions(sw) == 5);
 
     // Saved and read back: the positions come back before their links.
     const std::string text = SaveDocument(*doc);
@@ -248,22 +223,20 @@ TEST_F(SwitchTest, PositionsGrowHideAndSurviveADocument) {
     ASSERT_TRUE(loaded.ok) << loaded.error;
     EXPECT_TRUE(loaded.warnings.empty()) << loaded.warnings.front();
     auto *late = dynamic_cast<ts::ImageSourceTool *>(again->FindTool("Late"));
-    ASSERT_NE(late, nullptr);
-    late->SetImage(ts::PatternImage(4, 4));
     Operator *sw2 = again->FindTool("Switch1");
-    ASSERT_NE(sw2, nullptr);
+    ASSERT_TRUE(late && sw2 && sw2->FindInput("Input4")->Link());
+    late->SetImage(ts::PatternImage(4, 4));
     EXPECT_EQ(positions(sw2), 5);
-    ASSERT_NE(sw2->FindInput("Input4")->Link(), nullptr);
     EXPECT_EQ(sw2->FindInput("Input4")->Link()->Owner()->Name(), "Late");
     EXPECT_EQ(dynamic_cast<const Text &>(*sw2->FindInput("Name4")->Constant()).value, "late one");
     EXPECT_EQ(SaveDocument(*again), text);
     Ref<Image> after = ts::EvalImage(sw2);
-    ASSERT_NE(after, nullptr);
+    ASSERT_TRUE(before && after);
     EXPECT_EQ(after->DataWindow(), before->DataWindow());
     EXPECT_EQ(after->GetFlt(2, 3), before->GetFlt(2, 3));
 }
 
-TEST_F(SwitchTest, TheThreeDSwitchesHandOnTheirValues) {
+TEST_F(SwitchTest, ThreeDValuesAndPendingTransformsAreHandedOnAsTheyAre) {
     const struct {
         const char *cls;
         OvID source;
@@ -272,14 +245,12 @@ TEST_F(SwitchTest, TheThreeDSwitchesHandOnTheirValues) {
     for (const auto &c : cases) {
         SCOPED_TRACE(c.cls);
         Operator *sw = doc->AddTool(OvID(c.cls));
-        ASSERT_NE(sw, nullptr);
-        EXPECT_EQ(sw->FindMainOutput()->DataType(), c.type);
+        ASSERT_TRUE(sw && sw->FindMainOutput()->DataType() == c.type);
         std::vector<ValueSource *> values;
         for (int i = 0; i < 2; ++i) {
-            auto *v = dynamic_cast<ValueSource *>(doc->AddTool(c.source));
-            ASSERT_NE(v, nullptr);
-            values.push_back(v);
-            ASSERT_TRUE(sw->FindInput(("Input" + std::to_string(i)).c_str())->ConnectTo(v->output));
+            values.push_back(dynamic_cast<ValueSource *>(doc->AddTool(c.source)));
+            ASSERT_TRUE(values[i] &&
+                        sw->FindInput(("Input" + std::to_string(i)).c_str())->ConnectTo(values[i]->output));
         }
         // An image cannot be linked where a 3D value is expected.
         ts::ImageSourceTool *img = ts::AddImageSource(*doc, std::string("Img") + c.cls, ts::PatternImage(2, 2));
@@ -288,28 +259,21 @@ TEST_F(SwitchTest, TheThreeDSwitchesHandOnTheirValues) {
         for (int chosen : {1, 0}) {
             ts::SetNumber(sw, "Source", chosen);
             const int counts[2] = {values[0]->processCount, values[1]->processCount};
-            Ref<Parameter> out = Eval(sw);
-            ASSERT_NE(out, nullptr);
-            EXPECT_EQ(out.Get(), values[chosen]->value.Get());
+            EXPECT_EQ(Eval(sw).Get(), values[chosen]->value.Get());
             EXPECT_EQ(values[chosen]->processCount, counts[chosen] + 1);
             EXPECT_EQ(values[1 - chosen]->processCount, counts[1 - chosen]) << "the other value is not asked for";
         }
-        // Without pre-calculation the 3D switches report an unlinked choice
-        // in their one pass.
+        // Without pre-calculation the 3D switches report an unlinked choice in their one pass.
         sw->FindInput("Input1")->Disconnect();
         ts::SetNumber(sw, "Source", 1);
         doc->ClearConsole();
         EXPECT_EQ(Eval(sw, 3.0), nullptr);
         EXPECT_EQ(Lines(), std::vector<std::string>{sw->Name() + ".Input1 failed at time 3.0 - unconnected input"});
-        doc->ClearConsole();
     }
-}
-
-TEST_F(SwitchTest, APendingTransformPassesThroughUnflattened) {
+    // A pending transform passes through a Switch unflattened.
     Operator *sw = doc->AddTool(OvID("Switch"), "Switch1");
-    ASSERT_NE(sw, nullptr);
     auto *xf = dynamic_cast<ValueSource *>(doc->AddTool(C().transform));
-    ASSERT_NE(xf, nullptr);
+    ASSERT_TRUE(sw && xf);
     ts::ImageSourceTool *img = ts::AddImageSource(*doc, "Plain", ts::PatternImage(4, 3));
     ASSERT_TRUE(sw->FindInput("Input0")->ConnectTo(xf->output));
     ASSERT_TRUE(sw->FindInput("Input1")->ConnectTo(img->Out()));

@@ -1,8 +1,6 @@
-// The Blur tool in the processing frame: its controls, the filter table, the
-// windows it makes and asks for under each clipping mode, the pass-through,
-// Lock X/Y, passes and blend. Expected pixels come from the host call made
-// here with the request the tool is meant to send (the host blur itself is
-// tested against direct convolutions in BlurTest.cpp).
+// The Blur tool: controls, filter table, windows under each clipping mode, pass-through, Lock X/Y, passes and
+// blend. Expected pixels come from the host blur called with the request the tool should send (BlurTest.cpp
+// checks that against direct convolutions).
 #include <optional>
 #include <string>
 #include <tuple>
@@ -75,28 +73,7 @@ protected:
     ts::ImageSourceTool *probe = nullptr;
 };
 
-TEST_F(BlurTool, LockXYAndFilterShowAndNameTheirControls) {
-    Operator *blur = doc.AddTool(OvID("Blur"));
-    Input *x = blur->FindInput("XBlurSize"), *y = blur->FindInput("YBlurSize"), *passes = blur->FindInput("Passes");
-    // As constructed: locked, Fast Gaussian.
-    EXPECT_STREQ(x->Label(), "Blur Size");
-    EXPECT_FALSE(y->IsVisible() || passes->IsVisible());
-    ts::SetNumber(blur, "LockXY", 0);
-    EXPECT_STREQ(x->Label(), "X Blur Size");
-    EXPECT_TRUE(y->IsVisible());
-    ts::SetID(blur, "Filter", "Multi-box");
-    EXPECT_TRUE(passes->IsVisible());
-    EXPECT_STREQ(x->Label(), "X Blur Size") << "the filter leaves the sizes alone";
-    ts::SetID(blur, "Filter", "Gaussian");
-    EXPECT_FALSE(passes->IsVisible());
-    ts::SetNumber(blur, "LockXY", 1);
-    EXPECT_FALSE(y->IsVisible());
-    // Passes stay within 1..64.
-    ts::SetNumber(blur, "Passes", 100);
-    EXPECT_EQ(dynamic_cast<const Number &>(*passes->Constant()).value, 64.0);
-}
-
-TEST_F(BlurTool, FilterTableWithItsFallback) {
+TEST_F(BlurTool, FilterTableControlsAndNothingToDo) {
     // nullptr: the default, Fast Gaussian.
     const std::pair<const char *, int> table[] = {{nullptr, 5},        {"Box", 0},          {"Bartlett", 2},
                                                   {"Multi-box", 9},    {"Gaussian", 4},     {"Fast Gaussian", 5},
@@ -112,11 +89,25 @@ TEST_F(BlurTool, FilterTableWithItsFallback) {
         EXPECT_TRUE(IsHostBlur(Render(blur), img.Get(), type, Sent(20, 48), Sent(20, 48), frame))
             << (id ? id : "default");
     }
-}
-
-TEST_F(BlurTool, NothingToDoHandsTheInputOn) {
-    Ref<Image> img = Source(40, 30, ImgRectI(0, 0, 40, 30));
-    Operator *blur = Make(img);
+    Input *x = blur->FindInput("XBlurSize"), *y = blur->FindInput("YBlurSize"), *passes = blur->FindInput("Passes");
+    // Still locked, and not Multi-box.
+    EXPECT_STREQ(x->Label(), "Blur Size");
+    EXPECT_FALSE(y->IsVisible() || passes->IsVisible());
+    ts::SetNumber(blur, "LockXY", 0);
+    EXPECT_STREQ(x->Label(), "X Blur Size");
+    EXPECT_TRUE(y->IsVisible());
+    ts::SetID(blur, "Filter", "Multi-box");
+    EXPECT_TRUE(passes->IsVisible());
+    EXPECT_STREQ(x->Label(), "X Blur Size") << "the filter leaves the sizes alone";
+    ts::SetID(blur, "Filter", "Gaussian");
+    EXPECT_FALSE(passes->IsVisible());
+    ts::SetNumber(blur, "LockXY", 1);
+    EXPECT_FALSE(y->IsVisible());
+    // Passes stay within 1..64.
+    ts::SetNumber(blur, "Passes", 100);
+    EXPECT_EQ(dynamic_cast<const Number &>(*passes->Constant()).value, 64.0);
+    // Nothing to do hands the input on.
+    ts::SetID(blur, "Filter", "Fast Gaussian");
     ts::SetNumbers(blur, {{"XBlurSize", 0}, {"YBlurSize", 5}}); // Y ignored while locked
     EXPECT_EQ(Render(blur).Get(), img.Get());
     // Unlocked, a size on either axis blurs, however small.
@@ -134,7 +125,7 @@ TEST_F(BlurTool, NothingToDoHandsTheInputOn) {
     EXPECT_EQ(Render(blur).Get(), empty.Get());
 }
 
-TEST_F(BlurTool, WindowsUnderEachClippingMode) {
+TEST_F(BlurTool, WindowsUnderEachClippingModeAndForUnboundedKinds) {
     // A data window reaching past the frame on the left and bottom, inside it
     // elsewhere: frame 64 x 32, Box of 5 pixels across and 3 down (unlocked).
     const ImgRectI frame(0, 0, 64, 32), dw(-8, -4, 50, 26), roi(30, 10, 70, 20);
@@ -162,9 +153,8 @@ TEST_F(BlurTool, WindowsUnderEachClippingMode) {
         Ref<Image> shape = Render(blur, std::nullopt, ReqFlagPreCalc);
         ASSERT_TRUE(shape && shape->IsNoData());
         EXPECT_EQ(shape->DataWindow(), c.out);
-        // A region of interest narrows the output; the input is asked for
-        // that region grown by the reach, clipped as the mode says. The
-        // source window is never narrowed by the region.
+        // A region of interest narrows the output; the input is asked for that region grown by the reach, clipped as
+        // the mode says. The source window is never narrowed by the region.
         probe->asked.clear();
         Ref<Image> part = Render(blur, roi);
         ASSERT_TRUE(part && probe->asked.size() == 1 && probe->asked[0].has_value());
@@ -172,14 +162,9 @@ TEST_F(BlurTool, WindowsUnderEachClippingMode) {
         EXPECT_EQ(probe->asked[0]->rect, c.asked);
         EXPECT_TRUE(IsHostBlur(part, img.Get(), BlurBox, Sent(5, 64), Sent(3, 64), c.source));
     }
-}
-
-TEST_F(BlurTool, UnboundedKindsKeepTheFrameAndAskForTheWholeInput) {
-    const ImgRectI frame(0, 0, 64, 32), dw(-8, -4, 50, 26);
-    Ref<Image> img = Source(64, 32, dw);
-    Operator *blur = Make(img);
+    // Unbounded kinds keep the frame and ask for the whole input.
     ts::SetID(blur, "Filter", "VYV N=5 Gau");
-    ts::SetNumber(blur, "XBlurSize", Control(4, 64));
+    ts::SetNumbers(blur, {{"LockXY", 1}, {"XBlurSize", Control(4, 64)}});
     for (const char *mode : {"ClippingMode_Frame", "ClippingMode_Domain", "ClippingMode_None"}) {
         SCOPED_TRACE(mode);
         ts::SetID(blur, "ClippingMode", mode);
@@ -195,7 +180,7 @@ TEST_F(BlurTool, UnboundedKindsKeepTheFrameAndAskForTheWholeInput) {
     }
 }
 
-TEST_F(BlurTool, PassesLockAndChannelsReachTheHost) {
+TEST_F(BlurTool, PassesLockChannelsAndBlendReachThePixels) {
     const ImgRectI frame(0, 0, 50, 40);
     Ref<Image> img = Source(50, 40, frame);
     Operator *blur = Make(img);
@@ -209,16 +194,8 @@ TEST_F(BlurTool, PassesLockAndChannelsReachTheHost) {
     EXPECT_FALSE(IsHostBlur(got, img.Get(), BlurMultiBox, Sent(6, 50), Sent(6, 50), frame, four));
     EXPECT_EQ(got->GetFlt(20, 20).G, img->GetFlt(20, 20).G) << "green is off";
     ts::SetNumber(blur, "LockXY", 0);
-    EXPECT_TRUE(IsHostBlur(Render(blur), img.Get(), BlurMultiBox, Sent(6, 50), Sent(2, 50), frame, two));
-}
-
-TEST_F(BlurTool, BlendCountsOnce) {
-    // Blend b gives source + (blur - source) b, whether it is set on the
-    // common page or on the tool's own; both together multiply.
-    Ref<Image> img = Source(40, 30, ImgRectI(0, 0, 40, 30));
-    Operator *blur = Make(img);
-    ts::SetID(blur, "Filter", "Gaussian");
-    ts::SetNumber(blur, "XBlurSize", Control(4, 40));
+    // Blend b gives source + (blur - source) b, whether it is set on the common page or on the tool's own; both
+    // together multiply.
     Ref<Image> full = Render(blur);
     for (auto [blend, clone, b] : {std::tuple{0.5, 1.0, 0.5}, {1.0, 0.25, 0.25}, {0.5, 0.25, 0.125}}) {
         ts::SetNumbers(blur, {{"Blend", blend}, {"BlendClone", clone}});

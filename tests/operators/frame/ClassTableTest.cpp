@@ -1,7 +1,5 @@
-// Checks the table of planned class identities for consistency between its
-// rows: unique IDs, old IDs that shadow nothing, bases that resolve,
-// extensions claimed once, and places and attributes only on the kinds they
-// mean something for.
+// The table of planned classes is consistent: unique IDs, old IDs shadowing nothing, bases that resolve,
+// extensions claimed once, places and attributes only on the kinds they mean something for.
 #include <gtest/gtest.h>
 
 #include <cstring>
@@ -76,7 +74,7 @@ TEST(ClassTable, BasesResolveAndOnlyAbstractRowsLackAConstructor) {
     }
 }
 
-TEST(ClassTable, CommonControlAndImageAttributesSitWhereTheyMeanSomething) {
+TEST(ClassTable, AttributesPlacesAndTypesSitWhereTheirKindsMeanSomething) {
     Names noEffectMask, noObject, noBlend, noMotionBlur;
     for (const ClassDesc &row : PlannedClasses())
         for (auto [tag, names] : {std::pair{RegNoEffectMask, &noEffectMask},
@@ -87,27 +85,21 @@ TEST(ClassTable, CommonControlAndImageAttributesSitWhereTheyMeanSomething) {
     // No object controls: every no-effect-mask row, every shape tool, and two more.
     Names expectedNoObject = noEffectMask;
     expectedNoObject.insert({"KeyStretcher", "RunCommand"});
-    for (const ClassDesc &row : PlannedClasses()) {
-        if (IsShapeFamily(row.kind) && OffersTool(row.kind)) {
-            expectedNoObject.insert(row.id);
-            EXPECT_EQ(noBlend.count(row.id), std::strcmp(row.id, "sRender") != 0 ? 1u : 0u) << row.id;
-        }
-        // Motion blur is switched off only on tools (and the tracker
-        // modifier); masks place things in time and keep it.
-        EXPECT_TRUE(!noMotionBlur.count(row.id) ||
-                    ((OffersTool(row.kind) || std::string(row.id) == "TrackerModifier") && !(row.kind & RegKindMask)))
-            << row.id;
-        // Regions, domains and device images only for tools that make images.
-        for (Tag tag : {RegSupportsRoI, RegSupportsDoD, RegSupportsGPUImages})
-            EXPECT_TRUE(!row.attrs.Has(tag) || IsImageTool(row)) << row.id << std::hex << " " << tag;
-    }
-    EXPECT_EQ(noObject, expectedNoObject);
-}
-
-TEST(ClassTable, KindsDecideWhereRowsShowAndWhatTheyReadAndMake) {
     Names extensions;
     for (const ClassDesc &row : PlannedClasses()) {
         SCOPED_TRACE(row.id);
+        if (IsShapeFamily(row.kind) && OffersTool(row.kind)) {
+            expectedNoObject.insert(row.id);
+            EXPECT_EQ(noBlend.count(row.id), std::strcmp(row.id, "sRender") != 0 ? 1u : 0u);
+            EXPECT_STREQ(row.category, "Shape"); // shape tools sit in their own category
+            EXPECT_EQ(std::string(row.path), std::string("Tools/Shape/") + row.id);
+        }
+        // Motion blur is switched off only on tools (and the tracker modifier); masks place things in time and keep it.
+        EXPECT_TRUE(!noMotionBlur.count(row.id) ||
+                    ((OffersTool(row.kind) || std::string(row.id) == "TrackerModifier") && !(row.kind & RegKindMask)));
+        // Regions, domains and device images only for tools that make images.
+        for (Tag tag : {RegSupportsRoI, RegSupportsDoD, RegSupportsGPUImages})
+            EXPECT_TRUE(!row.attrs.Has(tag) || IsImageTool(row)) << std::hex << tag;
         if (row.kind == 1572864) {
             EXPECT_STREQ(row.base, "ImageFormat");
             const auto claimed = row.attrs.FindAll(RegFormatExtension);
@@ -115,23 +107,18 @@ TEST(ClassTable, KindsDecideWhereRowsShowAndWhatTheyReadAndMake) {
             for (const TagItem *item : claimed)
                 EXPECT_TRUE(extensions.insert(item->AsText()).second) << "extension claimed twice";
         }
-        // Formats and transitions are classes, never offered as tools; shape tools sit in their own category.
+        // Formats and transitions are classes, never offered as tools.
         EXPECT_TRUE((row.kind != 1572864 && row.kind != 983040) ||
                     (row.path == nullptr && row.category == nullptr && row.creatable));
-        if (IsShapeFamily(row.kind) && OffersTool(row.kind)) {
-            EXPECT_STREQ(row.category, "Shape");
-            EXPECT_EQ(std::string(row.path), std::string("Tools/Shape/") + row.id);
-        }
-        // A mask yields a mask; a modifier either names the one data type it
-        // takes (Publish, Perturb) or yields one of these.
-        if (row.kind & RegKindMask) {
-            EXPECT_STREQ(row.attrs.GetText(RegOutputType), "Mask");
-        }
+        // A mask yields a mask; a modifier either names the one data type it takes (Publish, Perturb) or yields one
+        // of these.
+        EXPECT_STREQ(row.kind & RegKindMask ? row.attrs.GetText(RegOutputType) : "Mask", "Mask");
         if (row.kind != 5) continue;
         EXPECT_NE(row.attrs.Has(RegInputType), row.attrs.Has(RegOutputType));
         EXPECT_TRUE(!row.attrs.Has(RegOutputType) ||
                     Names({"Mask", "Text", "Number", "Gradient", "Point"}).count(row.attrs.GetText(RegOutputType)));
     }
+    EXPECT_EQ(noObject, expectedNoObject);
 }
 
 } // namespace

@@ -1,5 +1,4 @@
-// The tool library as the host sees it after loading: every row of the class
-// table, built or planned, in ClassRegistry.
+// The tool library as the host sees it after loading: every row of the class table, built or planned.
 #include <gtest/gtest.h>
 
 #include <string>
@@ -21,7 +20,7 @@ protected:
     void SetUp() override { Orvane::Test::LoadOperators(); }
 };
 
-TEST_F(LibraryRegistry, EveryCreatableRowCarriesTheVocabularyVersionAndHooks) {
+TEST_F(LibraryRegistry, EveryRowCarriesTheVocabularyVersionHooksAndItsTableIdentity) {
     for (const Registry *r : ClassRegistry->Rows()) {
         if (std::string(r->ID().Text()).rfind("Test", 0) == 0) continue; // registered by the tests
         SCOPED_TRACE(r->ID().Text());
@@ -38,43 +37,7 @@ TEST_F(LibraryRegistry, EveryCreatableRowCarriesTheVocabularyVersionAndHooks) {
         EXPECT_TRUE(r->Tags().Has(RegScriptInfo));
         EXPECT_EQ(r->CanCreate(), r->TypeFlags() != 0) << "only the abstract bases have no factory";
     }
-}
-
-TEST_F(LibraryRegistry, OldClassIdsCreateTheClassThatReplacedThem) {
-    OrvaneDoc doc;
-    for (const auto &[old, now] : {std::pair{"SetBgColor", "SetCanvasColor"},
-                                   {"PeturbNumber", "PerturbNumber"},
-                                   {"PeturbPolyLine", "PerturbPolyLine"},
-                                   {"Brazel.FastNoiseBrazel", "FastNoise"},
-                                   {"sOffset", "FastNoise"}}) {
-        const Registry *row = ClassRegistry->Find(OvID(old));
-        Operator *op = doc.AddTool(OvID(old));
-        ASSERT_TRUE(row && op) << old;
-        EXPECT_EQ(row->ID(), OvID(now)) << old;
-        EXPECT_EQ(op->ClassID(), OvID(now)) << old;
-    }
-}
-
-TEST_F(LibraryRegistry, APlannedToolConstructsButEveryRequestFailsWithOneLine) {
-    OrvaneDoc doc;
-    Operator *glow = doc.AddTool(OvID("Glow"));
-    ASSERT_TRUE(glow && glow->IsPlaceholder());
-    EXPECT_EQ(Evaluate(glow->FindMainOutput(), 0.0), nullptr);
-    const auto lines = doc.ConsoleLines();
-    ASSERT_EQ(lines.size(), 1u);
-    EXPECT_EQ(lines[0].code, ConsoleError);
-    EXPECT_EQ(lines[0].text, glow->Name() + ": the Glow tool is not available yet in this version of Orvane");
-}
-
-TEST_F(LibraryRegistry, NonToolClassesAreNotAddedToFlows) {
-    OrvaneDoc doc;
-    for (const char *id : {"PNGFormat", "SwitchBase", "VolumeFogLighting", "NoSuchClass"})
-        EXPECT_EQ(doc.AddTool(OvID(id)), nullptr) << id;
-}
-
-/// Every planned class stands in the registry with the identity the
-/// catalogue gives it: kind, texts, aliases and attributes.
-TEST_F(LibraryRegistry, PlannedClassesCarryTheirCatalogueIdentity) {
+    // Every planned class stands in the registry with its table identity: kind, texts, aliases and attributes.
     for (const ClassDesc &d : PlannedClasses()) {
         SCOPED_TRACE(d.id);
         const Registry *row = ClassRegistry->Find(OvID(d.id));
@@ -101,6 +64,31 @@ TEST_F(LibraryRegistry, PlannedClassesCarryTheirCatalogueIdentity) {
             }
         }
     }
+}
+
+TEST_F(LibraryRegistry, OldIdsCreateTheirReplacementPlannedToolsFailAndNonToolsAreNotAdded) {
+    OrvaneDoc doc;
+    for (const auto &[old, now] : {std::pair{"SetBgColor", "SetCanvasColor"},
+                                   {"PeturbNumber", "PerturbNumber"},
+                                   {"PeturbPolyLine", "PerturbPolyLine"},
+                                   {"Brazel.FastNoiseBrazel", "FastNoise"},
+                                   {"sOffset", "FastNoise"}}) {
+        const Registry *row = ClassRegistry->Find(OvID(old));
+        Operator *op = doc.AddTool(OvID(old));
+        ASSERT_TRUE(row && op) << old;
+        EXPECT_EQ(row->ID(), OvID(now)) << old;
+        EXPECT_EQ(op->ClassID(), OvID(now)) << old;
+    }
+    // A planned tool constructs, but every request fails with one line.
+    Operator *glow = doc.AddTool(OvID("Glow"));
+    ASSERT_TRUE(glow && glow->IsPlaceholder());
+    EXPECT_EQ(Evaluate(glow->FindMainOutput(), 0.0), nullptr);
+    const auto lines = doc.ConsoleLines();
+    ASSERT_EQ(lines.size(), 1u);
+    EXPECT_EQ(lines[0].code, ConsoleError);
+    EXPECT_EQ(lines[0].text, glow->Name() + ": the Glow tool is not available yet in this version of Orvane");
+    for (const char *id : {"PNGFormat", "SwitchBase", "VolumeFogLighting", "NoSuchClass"})
+        EXPECT_EQ(doc.AddTool(OvID(id)), nullptr) << id;
 }
 
 } // namespace

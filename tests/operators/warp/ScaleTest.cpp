@@ -1,6 +1,5 @@
-// Scale: the parity rule, fields, proxies, the window's reach and the lock
-// worked out by hand, a size of zero, pixels against the host's resizer
-// called directly, and regions of interest against whole frames.
+// Scale: the parity rule, fields, proxies, the window's reach and the lock worked out by hand, a size of zero,
+// pixels against the host's resizer, and regions of interest against whole frames.
 #include <tuple>
 
 #include "tests/operators/warp/WarpTestSupport.h"
@@ -26,7 +25,7 @@ TEST_F(ScaleTool, TheSizeKeepsItsParity) {
     }
 }
 
-TEST_F(ScaleTool, FieldsProxiesReachAndLockWorkedOutByHand) {
+TEST_F(ScaleTool, FieldsProxiesReachLockAndZeroWorkedOutByHand) {
     struct Case {
         const char *what;
         Ref<Image> src;
@@ -34,9 +33,8 @@ TEST_F(ScaleTool, FieldsProxiesReachAndLockWorkedOutByHand) {
         int proxy, w, h;
         ImgRectI window; ///< checked when not empty
     };
-    // A field of a 40 x 30 frame: 30 at 0.5 gives 7.5, up to 8: 16 lines, 8 per field. A
-    // half-size proxy of a 45 x 30 frame at 1.2: 45 x 0.6 = 27 (odd), ceil(26.5) + 0.5 = 27.5
-    // -> 55; 30 x 0.6 = 18 -> 36; halved: 27 x 18.
+    // A field of a 40 x 30 frame: 30 at 0.5 gives 7.5, up to 8: 16 lines, 8 per field. A half-size proxy of a 45 x 30
+    // frame at 1.2: 45 x 0.6 = 27 (odd), ceil(26.5) + 0.5 = 27.5 -> 55; 30 x 0.6 = 18 -> 36; halved: 27 x 18.
     const Ref<Image> frame = NewImageTagList({{ImgWidth, 40}, {ImgHeight, 30}});
     const Ref<Image> field = NewImageTagList({{ImgWidth, 40}, {ImgHeight, 15}, {ImgYScale, 2.0}, {ImgField, 0}});
     const Ref<Image> proxy =
@@ -62,34 +60,27 @@ TEST_F(ScaleTool, FieldsProxiesReachAndLockWorkedOutByHand) {
         ASSERT_TRUE(Sized(shape, c.w, c.h));
         EXPECT_TRUE(c.window.IsNull() || shape->DataWindow() == c.window);
         if (c.proxy > 1) {
-            EXPECT_EQ(shape->GetAttrL(ImgFullWidth), 55);
-            EXPECT_EQ(shape->GetAttrL(ImgFullHeight), 36);
+            EXPECT_TRUE(shape->GetAttrL(ImgFullWidth) == 55 && shape->GetAttrL(ImgFullHeight) == 36);
         }
     }
-}
-
-TEST_F(ScaleTool, ASizeOfZeroGivesZerosAndAsksForNothing) {
+    // A size of zero gives zeros and asks for nothing.
     OrvaneDoc doc;
     Ref<Image> src = PatternImage(40, 30);
     src->SetCanvasColor(FltPixel{0.5f, 0.5f, 0.5f, 1.f});
     ProbeSource *probe = AddProbe(doc, src);
     Operator *scl = AddTool(doc, "Scale", probe, {{"LockXY", 0}, {"XSize", 0.0}, {"YSize", 1.0}});
     Ref<Image> out = Render(scl, {.roi = ImgRectI(0, 0, 1, 30)});
-    ASSERT_NE(out, nullptr);
-    EXPECT_TRUE(out->DataWindow().IsNull());
-    EXPECT_TRUE(out->IsCanvasColorClear());
+    ASSERT_TRUE(out && out->DataWindow().IsNull() && out->IsCanvasColorClear());
     for (int y = -2; y < 32; y += 3) EXPECT_EQ(out->GetFlt(0, y), FltPixel{});
-    ASSERT_EQ(probe->asked.size(), 1u);
-    ASSERT_TRUE(probe->asked[0].has_value());
+    ASSERT_TRUE(probe->asked.size() == 1 && probe->asked[0]);
     EXPECT_TRUE(probe->asked[0]->rect.IsNull()); // collapsed on the middle of the region
     // Negative sizes count as not above zero.
     SetNumbers(scl, {{"YSize", -2.0}, {"XSize", 1.0}});
-    out = Render(scl);
-    ASSERT_NE(out, nullptr);
+    ASSERT_TRUE(out = Render(scl));
     EXPECT_TRUE(out->DataWindow().IsNull());
 }
 
-TEST_F(ScaleTool, PixelsAreTheHostResizersAtTheExactFactors) {
+TEST_F(ScaleTool, PixelsAreTheHostResizersAtTheExactFactorsForEveryRegion) {
     // x and y factors, Duplicate edges (or Canvas), filter method, depth.
     const std::tuple<double, double, bool, int, int> cases[] = {{0.5, 0.5, false, 2, 8}, {1.7, 1.7, false, 5, 8},
                                                                 {0.8, 1.3, true, 8, 8},  {0.37, 0.6, false, 1, 6},
@@ -98,33 +89,21 @@ TEST_F(ScaleTool, PixelsAreTheHostResizersAtTheExactFactors) {
         SCOPED_TRACE(testing::Message() << x << " x " << y << " edges " << duplicate << " method " << method);
         OrvaneDoc d;
         Ref<Image> src = PatternImage(37, 29, depth, 11);
-        Ref<Image> out = Render(
+        Operator *scl =
             AddTool(d, "Scale", AddProbe(d, src),
-                    {{"LockXY", 0}, {"XSize", x}, {"YSize", y}, {"Edges", duplicate}, {"FilterMethod", method}}));
+                    {{"LockXY", 0}, {"XSize", x}, {"YSize", y}, {"Edges", duplicate}, {"FilterMethod", method}});
+        Ref<Image> out = Render(scl);
         ASSERT_NE(out, nullptr);
         const int edges = duplicate ? EdgeDuplicate : EdgeCanvas;
-        Ref<Image> ref = DirectResize(*src, out->Width(), out->Height(), out->DataWindow(),
-                                      {{ResizeFilter, method + 1},
-                                       {ResizeWindow, RszWindowHanning},
-                                       {ResizeXScale, x},
-                                       {ResizeYScale, y},
-                                       {ResizeXOffset, 0.0},
-                                       {ResizeYOffset, 0.0},
-                                       {ResizeXEdges, edges},
-                                       {ResizeYEdges, edges}});
+        Ref<Image> ref = PlacedResize(*src, out->Width(), out->Height(), out->DataWindow(), method + 1,
+                                      {x, y, 0.0, 0.0, edges, edges});
         ExpectSamePixels(*out, *ref, out->DataWindow().Grown(1, 1));
-    }
-}
-
-TEST_F(ScaleTool, ARegionOfInterestGivesTheWholeFramesPixels) {
-    for (double s : {0.45, 1.0, 2.3}) {
-        SCOPED_TRACE(s);
-        OrvaneDoc d;
-        Operator *scl =
-            AddTool(d, "Scale", AddProbe(d, PatternImage(50, 40, 8, 3)), {{"XSize", s}, {"FilterMethod", 8}});
-        const ImgRectI dw = Shape(scl)->DataWindow();
-        ExpectRegionsMatchWhole(scl, {ImgRectI(dw.x0, dw.y0, dw.x0 + 5, dw.y0 + 4), ImgRectI(7, 9, 13, 30),
-                                      ImgRectI(dw.x1 - 3, dw.y1 - 8, dw.x1, dw.y1)});
+        // Regions of interest give the whole frame's pixels; duplicated edges are left out, as Scale asks for too
+        // small a region with them (a known fault, reported).
+        const ImgRectI dw = out->DataWindow();
+        if (!duplicate)
+            ExpectRegionsMatchWhole(scl, {ImgRectI(dw.x0, dw.y0, dw.x0 + 5, dw.y0 + 4), ImgRectI(7, 9, 13, 30),
+                                          ImgRectI(dw.x1 - 3, dw.y1 - 8, dw.x1, dw.y1)});
     }
 }
 

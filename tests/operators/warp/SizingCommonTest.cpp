@@ -1,6 +1,5 @@
-// The shared sizing vocabulary on its own: window arithmetic against
-// hand-worked corners, the aspect keeping sizes, the attributes written back,
-// and the coefficient tables kept while their key holds.
+// The shared sizing vocabulary on its own: window arithmetic against hand-worked corners, the aspect keeping sizes, the
+// attributes written back, and the coefficient tables kept while their key holds.
 #include <gtest/gtest.h>
 
 #include "operators/warp/SizingCommon.h"
@@ -32,7 +31,7 @@ TEST(SizingWindows, CornersRoundOutwardEndlessSidesStayAndPlacingInverts) {
                 << s << " " << o;
 }
 
-TEST(SizingFormat, AspectKeepingSizesAndListChoices) {
+TEST(SizingFormat, AspectKeepingSizesListChoicesAndAttributes) {
     SourceFormat hd;
     hd.width = hd.fullWidth = 1920;
     hd.height = hd.fullHeight = 1080;
@@ -48,23 +47,16 @@ TEST(SizingFormat, AspectKeepingSizesAndListChoices) {
     EXPECT_EQ(FilterValue(4.6), RszCatmullRom);
     EXPECT_EQ(FilterValue(14), RszBessel);
     EXPECT_EQ(WindowValue(3), RszWindowKaiser);
-}
 
-TEST(SizingFormat, AttributesFollowTheResultAndKeepTheProxyRatio) {
-    Ref<Image> proxy = NewImageTagList({{ImgWidth, 960},
-                                        {ImgHeight, 270},
-                                        {ImgXScale, 2.0},
-                                        {ImgYScale, 4.0},
-                                        {ImgFullWidth, 1920},
-                                        {ImgFullHeight, 540},
-                                        {ImgField, 0},
-                                        {ImgFieldOffset, 0.5 / 270},
-                                        {ImgFullXScale, 1.0},
-                                        {ImgFullYScale, 2.0}});
+    // Attributes follow the result and keep the proxy ratio.
+    const TagList field{{ImgWidth, 960},      {ImgHeight, 270},     {ImgXScale, 2.0}, {ImgYScale, 4.0},
+                        {ImgFullWidth, 1920}, {ImgFullHeight, 540}, {ImgField, 0},    {ImgFieldOffset, 0.5 / 270},
+                        {ImgFullXScale, 1.0}, {ImgFullYScale, 2.0}};
+    Ref<Image> proxy = NewImageTagList(field);
     Ref<Image> out = NewImageTagList({{ImgLikeImage, proxy.Get()}, {ImgWidth, 640}, {ImgHeight, 180}});
     WriteFormatAttrs(*out, ReadSourceFormat(*proxy), 1280, 720, std::pair{0.9, 1.1});
-    EXPECT_EQ(out->GetAttrL(ImgFullWidth), 1280);
-    EXPECT_EQ(out->GetAttrL(ImgFullHeight), 360); // a field holds half the frame's lines
+    EXPECT_TRUE(out->GetAttrL(ImgFullWidth) == 1280 &&
+                out->GetAttrL(ImgFullHeight) == 360); // a field holds half the frame's lines
     EXPECT_DOUBLE_EQ(out->GetAttrD(ImgFieldOffset), 0.5 / 180);
     // The new aspect (Y doubled for a field) in the attributes; the scale keeps the proxy's factor 2 over them.
     EXPECT_DOUBLE_EQ(out->GetAttrD(ImgFullXScale), 0.9);

@@ -1,9 +1,6 @@
-// The Transform tool in the flow: its controls, what travels on its output
-// (a pending transform for probes that take one, pixels for the others),
-// chains that resample once, flattening, regions of interest, domains, the
-// common controls and caching. Pixels are compared with a single transform
-// made directly on the image (TransformMatrixTest checks those against the
-// filters' formulas) or with hand-computed values.
+// The Transform tool in the flow: controls, what travels on its output (a pending transform or pixels), chains
+// resampling once, flattening, regions, domains, blend and caching. Pixels are compared with one transform made
+// directly on the image (TransformMatrixTest checks those against the filters' formulas) or hand-computed values.
 #include <gtest/gtest.h>
 
 #include <cmath>
@@ -52,7 +49,7 @@ Ref<Image> Direct(Image *src, const TagList &tags, const ImgRectI *cut = nullptr
     return tm->ApplyTransformTagList(apply);
 }
 
-TEST_F(TransformTool, ConsumersGetATransformOrPixelsAsTheyDeclare) {
+TEST_F(TransformTool, ConsumersGetATransformOrPixelsCachedAndBlended) {
     Operator *xf = Make({{"Angle", 30}});
     auto *takes = AddValueProbe(doc, xf, true);
     auto *images = AddValueProbe(doc, xf, false);
@@ -71,8 +68,26 @@ TEST_F(TransformTool, ConsumersGetATransformOrPixelsAsTheyDeclare) {
     Ref<Image> outside = Render(xf);
     ASSERT_TRUE(outside);
     ExpectSamePixels(*outside, *img, ImgRectI(-5, -5, 53, 45));
+    // A cached result is not resampled again; a new angle is a new result.
+    const long before = TransformMatrix::ResampleCount();
+    const size_t asked = src->asked.size();
+    ASSERT_TRUE(Render(images, {.useCache = true}) && Render(images, {.useCache = true}));
+    EXPECT_EQ(TransformMatrix::ResampleCount(), before + 1);
+    EXPECT_EQ(src->asked.size(), asked + 1);
+    SetNumber(xf, "Angle", 46);
+    ASSERT_TRUE(Render(images, {.useCache = true}));
+    EXPECT_EQ(TransformMatrix::ResampleCount(), before + 2);
+    // Blend mixes the pixels of the transform.
+    SetNumbers(xf, {{"Angle", 12}, {"Blend", 0.25}});
+    Ref<Image> mixed = Render(xf), full = Direct(pic.Get(), {{XfAngle, 12.0}, {XfFilter, RszLinear}});
+    ASSERT_TRUE(mixed && full);
+    for (int y = 0; y < 40; y += 3)
+        for (int x = 0; x < 48; x += 3) {
+            const float expect = pic->GetFlt(x, y).R + (full->GetFlt(x, y).R - pic->GetFlt(x, y).R) * 0.25f;
+            EXPECT_NEAR(mixed->GetFlt(x, y).R, expect, 1e-6) << x << "," << y;
+        }
     // With nothing to do the input image itself is handed on.
-    SetNumber(xf, "Angle", 0);
+    SetNumbers(xf, {{"Angle", 0}, {"Blend", 1}});
     EXPECT_EQ(Render(xf).Get(), pic.Get());
 }
 
@@ -85,14 +100,10 @@ TEST_F(TransformTool, AChainResamplesOnceAndEqualsOneTransform) {
     Ref<Image> chained = Render(second);
     ASSERT_TRUE(chained);
     EXPECT_EQ(TransformMatrix::ResampleCount() - before, 1);
-    // One transform with the combined controls (about the same pivot, the
-    // second's move added after).
-    Ref<Image> once = Direct(pic.Get(), {{XfAngle, 35.0},
-                                         {XfXSize, 1.32},
-                                         {XfYSize, 1.32},
-                                         {XfCenterX, 0.55},
-                                         {XfCenterY, 0.45},
-                                         {XfFilter, RszCatmullRom}});
+    // One transform with the combined controls (about the same pivot, the second's move added after).
+    const TagList combined{{XfAngle, 35.0},   {XfXSize, 1.32},   {XfYSize, 1.32},
+                           {XfCenterX, 0.55}, {XfCenterY, 0.45}, {XfFilter, RszCatmullRom}};
+    Ref<Image> once = Direct(pic.Get(), combined);
     ASSERT_EQ(chained->DataWindow(), once->DataWindow());
     double worst = 0;
     for (int y = once->DataWindow().y0; y < once->DataWindow().y1; ++y)
@@ -146,16 +157,14 @@ TEST_F(TransformTool, EdgesFillTheFrameAndInvertUndoes) {
     EXPECT_EQ(tiled->DataWindow(), ImgRectI(0, 0, 32, 32));
     for (int y = 0; y < 16; ++y)
         for (int x = 0; x < 16; ++x) {
-            // Nearest at half size about the middle: the centre of output
-            // pixel x lands on source 2x - 15, folded into 0..31.
+            // Nearest at half size about the middle: output pixel x's centre is on source 2x - 15, folded into 0..31.
             const FltPixel p = tiled->GetFlt(x, y);
             EXPECT_EQ(p, tiled->GetFlt(x + 16, y));
             EXPECT_EQ(p, tiled->GetFlt(x, y + 16));
             EXPECT_EQ(p, pic->GetFlt((2 * x + 17) % 32, (2 * y + 17) % 32)) << x << "," << y;
         }
 
-    // A Transform with the same controls inverted after it gives the
-    // identity: the source comes through untouched.
+    // A Transform with the same controls inverted after it gives the identity: the source comes through untouched.
     SetNumbers(xf, {{"Edges", 0}, {"Angle", 33}});
     SetPoint(xf, "Pivot", 0.3, 0.6);
     Operator *undo = AddTool(doc, "Transform", xf, {{"Size", 0.5}, {"Angle", 33}, {"InvertTransform", 1}});
@@ -168,37 +177,7 @@ TEST_F(TransformTool, EdgesFillTheFrameAndInvertUndoes) {
     // Size 0 is singular: inverting leaves it, and nothing of the picture shows.
     SetNumbers(xf, {{"Size", 0}, {"InvertTransform", 1}});
     Ref<Image> none = Render(xf);
-    ASSERT_TRUE(none);
-    EXPECT_TRUE(none->DataWindow().IsNull());
-}
-
-TEST_F(TransformTool, BlendMixesThePixelsOfTheTransform) {
-    Operator *xf = Make({{"Angle", 12}, {"Blend", 0.25}});
-    Ref<Image> mixed = Render(xf);
-    Ref<Image> full = Direct(pic.Get(), {{XfAngle, 12.0}, {XfFilter, RszLinear}});
-    ASSERT_TRUE(mixed && full);
-    for (int y = 0; y < 40; y += 3)
-        for (int x = 0; x < 48; x += 3) {
-            const float expect = pic->GetFlt(x, y).R + (full->GetFlt(x, y).R - pic->GetFlt(x, y).R) * 0.25f;
-            EXPECT_NEAR(mixed->GetFlt(x, y).R, expect, 1e-6) << x << "," << y;
-        }
-}
-
-TEST_F(TransformTool, CachedResultsAreNotResampledAgain) {
-    Operator *xf = Make({{"Angle", 45}});
-    auto *consumer = AddValueProbe(doc, xf, false);
-    RenderOptions cached;
-    cached.useCache = true;
-    ASSERT_TRUE(Render(consumer, cached));
-    const long before = TransformMatrix::ResampleCount();
-    const size_t asked = src->asked.size();
-    ASSERT_TRUE(Render(consumer, cached));
-    EXPECT_EQ(TransformMatrix::ResampleCount(), before);
-    EXPECT_EQ(src->asked.size(), asked);
-    // A new angle is a new result.
-    SetNumber(xf, "Angle", 46);
-    ASSERT_TRUE(Render(consumer, cached));
-    EXPECT_EQ(TransformMatrix::ResampleCount(), before + 1);
+    ASSERT_TRUE(none && none->DataWindow().IsNull());
 }
 
 TEST_F(TransformTool, ControlsShowByChoiceAndAMissingInputFailsWithOneLine) {

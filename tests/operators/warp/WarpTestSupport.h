@@ -1,8 +1,6 @@
 #pragma once
-// Helpers shared by the sizing tool tests: a source that hands on only the
-// region it is asked for and notes it, rendering with request options, the
-// host's resizer called directly (the reference the tools must match), and
-// pixel comparisons.
+// Helpers shared by the sizing tool tests: a source noting the regions asked of it, rendering with request
+// options, the host's resizer called directly (the reference the tools must match), and pixel comparisons.
 #include <gtest/gtest.h>
 
 #include <initializer_list>
@@ -80,13 +78,29 @@ inline Ref<Image> Shape(Operator *op, RenderOptions o = {}) {
     return Render(op, o);
 }
 
-/// The host's resizer called directly: `src` into a new w x h image over
-/// `window` with the resize request `tags`.
+/// The host's resizer called directly: `src` into a new w x h image over `window` with the resize request `tags`.
 inline Ref<Image> DirectResize(const Image &src, int w, int h, const ImgRectI &window, const TagList &tags) {
     Ref<Image> out = NewImageTagList(
         {{ImgLikeImage, &src}, {ImgWidth, w}, {ImgHeight, h}, {ImgDataWindow, &window}, {ImgValidWindow, &window}});
     EXPECT_TRUE(out && out->AllocScanLineData() && src.ResizeTagList(out.Get(), tags));
     return out;
+}
+
+/// Where the host's resizer lays the source: scales, offsets and edge modes.
+struct Placement {
+    double xs, ys, ox, oy;
+    int xEdges, yEdges;
+};
+
+/// DirectResize with `filter` (Hanning window) and a placement, reading `read` when given.
+inline Ref<Image> PlacedResize(const Image &src, int w, int h, const ImgRectI &window, int filter, const Placement &p,
+                               const ImgRectI *read = nullptr) {
+    TagList tags{{ResizeFilter, filter},   {ResizeWindow, RszWindowHanning},
+                 {ResizeXScale, p.xs},     {ResizeYScale, p.ys},
+                 {ResizeXOffset, p.ox},    {ResizeYOffset, p.oy},
+                 {ResizeXEdges, p.xEdges}, {ResizeYEdges, p.yEdges}};
+    if (read) tags.Set({ResizeSourceWindow, read});
+    return DirectResize(src, w, h, window, tags);
 }
 
 /// Every pixel of `r` equal in both images (canvas colours outside their windows).
