@@ -1,8 +1,5 @@
-// BrightnessContrast: the tool against an independent model of its steps
-// (in double precision for float, in whole numbers for 16-bit) on every depth
-// and row function, both directions; edge settings; pass-through, canvas,
-// windows, regions and workers in the processing frame; and the device
-// against the rows, with the device path's rules.
+// BrightnessContrast against an independent model of its steps (double for float, whole numbers for 16-bit),
+// edge settings, the processing frame, and the device against the rows.
 #include <algorithm>
 #include <array>
 #include <cmath>
