@@ -298,8 +298,6 @@ void ExpectModel(const Model &model, const Image &in, const Image &out, const st
     // Integer rows take the 16-bit steps themselves. The matrix route scales in float and rounds once where the
     // steps cut: within a few units.
     const bool rows = model.doGamma || model.s.prePost;
-    int failures = 0;
-    double worst = 0.0;
     for (int y = dw.y0; y < dw.y1; ++y)
         for (int x = dw.x0; x < dw.x1; ++x)
             for (int c = out.IsMask() ? 3 : 0; c < 4; ++c) {
@@ -316,13 +314,8 @@ void ExpectModel(const Model &model, const Image &in, const Image &out, const st
                     got = eight ? Stored16(out, x, y, c) / 257.0 : Stored16(out, x, y, c);
                     tol = rows ? 0.0 : eight ? 1.0 : 4.0;
                 }
-                const double err = std::fabs(got - expected);
-                worst = std::max(worst, err / tol);
-                if (!(err <= tol) && ++failures <= 3)
-                    ADD_FAILURE() << what << " at (" << x << ", " << y << ") channel " << c << ": got " << got
-                                  << ", expected " << expected;
+                ASSERT_NEAR(got, expected, tol) << what << " at " << x << "," << y << " channel " << c;
             }
-    EXPECT_EQ(failures, 0) << what << " (worst error " << worst << " of the tolerance)";
 }
 
 TEST_F(BrightnessContrast, MatchesModelOnEveryDepthAndRowFunction) {
@@ -639,13 +632,10 @@ TEST_F(BrightnessContrastDevice, AChainStaysOnTheDeviceAndResultsStayStaleUntilD
     Operator *second = rig.AddAfter(rig.bc);
     Apply(rig.bc, {.gamma = 1.5});
     Apply(second, {.gamma = 1.5, .reverse = true});
-    // A pre-calculation never reaches the device.
     const int launches = ctx->LaunchCount();
     Ref<Image> shape = Render(rig.bc, nullptr, ReqFlagPreCalc, ctx);
-    ASSERT_TRUE(shape && shape->IsNoData());
-    EXPECT_FALSE(shape->GetGPUMem());
-    EXPECT_EQ(ctx->LaunchCount(), launches);
-    EXPECT_FALSE(src->GetGPUMem());
+    ASSERT_TRUE(shape && shape->IsNoData() && !shape->GetGPUMem() && !src->GetGPUMem());
+    EXPECT_EQ(ctx->LaunchCount(), launches) << "a pre-calculation reached the device";
     RenderTask task;
     task.SetDevice(ctx);
     EvalOptions opt;
@@ -654,26 +644,20 @@ TEST_F(BrightnessContrastDevice, AChainStaysOnTheDeviceAndResultsStayStaleUntilD
     auto *mid = dynamic_cast<Image *>(middle.Get());
     ASSERT_TRUE(mid);
     EXPECT_EQ(ctx->LaunchCount(), launches + 1);
-    // The CPU-made input was uploaded when its device image was made, and keeps it; the result lives on the
-    // device, main memory has nothing yet.
-    ASSERT_TRUE(src->GetGPUMem());
-    EXPECT_FALSE(src->IsGPUMemDirty());
-    EXPECT_TRUE(mid->IsGPUMemDirty());
-    Ref<Parameter> last = Evaluate(second->FindMainOutput(), 0.0, opt);
-    ASSERT_TRUE(last);
-    // The second tool read the first one's image on the device: it never came back.
-    EXPECT_FALSE(mid->HasScanLineData());
-    // Forward then reverse with the same settings: the input again.
+    // The input was uploaded and keeps its pixels; the result lives on the device only.
+    ASSERT_TRUE(src->GetGPUMem() && !src->IsGPUMemDirty() && mid->IsGPUMemDirty());
+    const Ref<Parameter> last = Evaluate(second->FindMainOutput(), 0.0, opt);
+    // The second tool read the first one's image on the device: it never came back. Forward then reverse: the input.
+    ASSERT_TRUE(last && !mid->HasScanLineData());
     EXPECT_LE(MaxDifference(*dynamic_cast<Image *>(last.Get()), *src), 1e-4);
     ASSERT_TRUE(mid->DownloadGPUMem());
     EXPECT_LE(MaxDifference(*mid, *Render(rig.bc)), 2e-5);
 }
 
-/// A device that refuses to compile anything.
+/// A device that takes data but refuses to compile anything.
 class RefusingDevice final : public IDeviceContext {
     struct Memory final : IDeviceMemory {
-        Memory(IDeviceContext *c, size_t n) : IDeviceMemory(c, n), bytes(n) {}
-        std::vector<uint8_t> bytes;
+        Memory(IDeviceContext *c, size_t n) : IDeviceMemory(c, n) {}
     };
 
 public:
@@ -683,14 +667,8 @@ public:
     std::shared_ptr<IDeviceMemory> Allocate(size_t n, std::string *) override {
         return std::make_shared<Memory>(this, n);
     }
-    bool Write(IDeviceMemory &m, size_t at, const void *data, size_t n, std::string *) override {
-        std::memcpy(static_cast<Memory &>(m).bytes.data() + at, data, n);
-        return true;
-    }
-    bool Read(const IDeviceMemory &m, size_t at, void *data, size_t n, std::string *) override {
-        std::memcpy(data, static_cast<const Memory &>(m).bytes.data() + at, n);
-        return true;
-    }
+    bool Write(IDeviceMemory &, size_t, const void *, size_t, std::string *) override { return true; }
+    bool Read(const IDeviceMemory &, size_t, void *, size_t, std::string *) override { return false; }
 
 protected:
     std::shared_ptr<IDeviceKernel> Build(const std::string &, const std::string &, std::vector<KernelParamDecl>,
