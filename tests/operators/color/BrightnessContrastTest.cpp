@@ -82,11 +82,9 @@ Ref<Image> Render(Operator *op, const ImgRectI *roi = nullptr, uint32_t flags = 
     RenderTask &t = task ? *task : own;
     t.SetDevice(device);
     EvalOptions opt;
-    opt.task = &t;
-    opt.flags = flags;
-    opt.useCache = false;
+    opt.task = &t, opt.flags = flags, opt.useCache = false;
     if (roi) opt.roi = ImageDomain(*roi);
-    return Ref<Image>(dynamic_cast<Image *>(Evaluate(op->FindMainOutput(), 0.0, opt).Get()));
+    return Test::EvalImage(op, 0.0, opt);
 }
 
 Px ToPx(const FltPixel &p) { return {p.R, p.G, p.B, p.A}; }
