@@ -95,7 +95,7 @@ Scale::Settings Scale::ReadSettings(const Request *req) const {
     s.filter = FilterOf(req, filter_);
     s.window = WindowOf(req, filter_);
     s.draftNearest = DraftDropsFilter(req, req->GetInputNumber(hiQOnly_) >= 0.5);
-    if (s.edges != EdgeDuplicate && !s.draftNearest && s.filter >= RszLinear) {
+    if (!s.draftNearest && s.filter >= RszLinear) {
         const double support = Image::GetResizeFilterSupport(s.filter);
         s.reachX = ReachOf(support, s.xSize);
         s.reachY = ReachOf(support, s.ySize);
@@ -164,9 +164,13 @@ void Scale::Process(Request *req) {
         window.SetNull();
     else if (clipping == ClippingMode_Frame)
         window = ImgRectI(0, 0, w, h);
-    else
-        window = ScaleWindow(window, static_cast<float>(s.xSize), static_cast<float>(s.ySize),
-                             static_cast<float>(s.reachX), static_cast<float>(s.reachY));
+    else {
+        // Duplicate edges repeat the border instead of spreading past it.
+        const bool spreads = s.edges != EdgeDuplicate;
+        window =
+            ScaleWindow(window, static_cast<float>(s.xSize), static_cast<float>(s.ySize),
+                        spreads ? static_cast<float>(s.reachX) : 0.f, spreads ? static_cast<float>(s.reachY) : 0.f);
+    }
     if (const AutoImageRoI roi(req); roi) window &= roi->rect;
     Ref<Image> dst = NewSizedImage(*src, w, h, window, req);
     if (!dst) return FailSizing(this, req, output_, "cannot make an image of that size");

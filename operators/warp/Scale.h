@@ -19,7 +19,8 @@
 // Duplicate repeats its border pixels, on both axes.
 //
 // CheckRequest asks the input for the output region divided by the sizes
-// and widened by the reach; a size that is not above 0 asks for an empty
+// and widened by the reach (at every edge mode: Duplicate reads the border
+// pixels the filter reaches); a size that is not above 0 asks for an empty
 // region in the middle of it.
 //
 // Thread safety: as every tool: Process and CheckRequest on the render
@@ -50,7 +51,7 @@ private:
         int edges = 0; ///< EdgeMode
         int filter = 0, window = 0;
         bool draftNearest = false;
-        double reachX = 0.0, reachY = 0.0; ///< in source pixels
+        double reachX = 0.0, reachY = 0.0; ///< of the filter, in source pixels; 0 when no filter reads around
     };
     Settings ReadSettings(const Request *req) const;
 
