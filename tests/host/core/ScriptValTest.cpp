@@ -9,6 +9,7 @@
 #include <limits>
 #include <random>
 #include <string>
+#include <tuple>
 #include <vector>
 
 namespace Orvane::scriptval_test {
@@ -51,10 +52,7 @@ void ExpectPlacesInText(const ScriptVal &v, const std::string &text) {
 }
 
 TEST(ScriptValValue, Equality) {
-    const struct {
-        ScriptVal a, b;
-        bool equal;
-    } cases[] = {
+    const std::tuple<ScriptVal, ScriptVal, bool> cases[] = {
         {ScriptVal(static_cast<const char *>(nullptr)), ScriptVal(), true},
         {ScriptVal(kNaN), ScriptVal(-kNaN), true},
         {ScriptVal(0.0), ScriptVal(-0.0), true},
@@ -66,10 +64,8 @@ TEST(ScriptValValue, Equality) {
         {Make({{"t", Make({{1, "a"}})}}), Make({{"t", Make({{1, "b"}})}}), false},
         {Parse("-- c\n{ 1, 2 }"), Make({{1, 1}, {2, 2}}), true}, // places and comments do not count
     };
-    for (const auto &c : cases) {
-        EXPECT_EQ(c.a == c.b, c.equal) << c.a.ToText() << " and " << c.b.ToText();
-        EXPECT_EQ(c.b != c.a, !c.equal) << c.a.ToText() << " and " << c.b.ToText();
-    }
+    for (const auto &[a, b, equal] : cases)
+        EXPECT_EQ(std::pair(a == b, b != a), std::pair(equal, !equal)) << a.ToText() << " and " << b.ToText();
 }
 
 TEST(ScriptValTable, MisuseIsReported) {
@@ -224,10 +220,7 @@ TEST(ScriptValWrite, ScalarsSmallTablesAndTheOneLineLimit) {
     ScriptVal mixed = ScriptVal::Table();
     mixed.Append(1).Append(2).Set("x", 3);
     const ScriptVal keys = Make({{"not id", 1}, {"end", 2}, {1.5, 3}, {true, 4}, {kInf, 5}, {"_ok9", 7}});
-    const struct {
-        ScriptVal value;
-        std::string text;
-    } cases[] = {
+    const std::pair<ScriptVal, std::string> cases[] = {
         {ScriptVal(), "nil"},
         {ScriptVal(false), "false"},
         {ScriptVal::Table("Orvane.Document"), "Orvane.Document {}"},
@@ -237,9 +230,9 @@ TEST(ScriptValWrite, ScalarsSmallTablesAndTheOneLineLimit) {
         {Make({{"Pos", ScriptVal::Ref("A.B")}}, "Point"), "Point { Pos = A.B }"},
         {keys, "{ [\"not id\"] = 1, [\"end\"] = 2, [1.5] = 3, [true] = 4, [1/0] = 5, _ok9 = 7 }"},
     };
-    for (const auto &c : cases) {
-        EXPECT_EQ(c.value.ToText(), c.text);
-        EXPECT_EQ(Parse(c.text), c.value) << c.text;
+    for (const auto &[value, text] : cases) {
+        EXPECT_EQ(value.ToText(), text);
+        EXPECT_EQ(Parse(text), value) << text;
     }
     // `{ "..." }` is the text length plus 6.
     ScriptVal fits = ScriptVal::Table(), tooLong = ScriptVal::Table();
@@ -315,10 +308,7 @@ TEST(ScriptValParse, Structure) {
 TEST(ScriptValParse, RepeatedKeysAreNotedWithBothPlaces) {
     std::string many = "{ ";
     for (int i = 1; i <= 20; ++i) many += "k" + std::to_string(i) + " = 1, "; // past the size where keys are indexed
-    const struct {
-        std::string text;
-        std::vector<std::string> notes;
-    } cases[] = {
+    const std::pair<std::string, std::vector<std::string>> cases[] = {
         {"{ a = 1,\n  a = 2 }", {"line 2, column 3: 'a' is given twice (first at line 1)"}},
         {"{ ['a b'] = 1, [2.5] = 2,\n[\"a b\"] = 3, [true] = 0, [2.5] = 4, [true] = 1 }",
          {"line 2, column 2: [\"a b\"] is given twice (first at line 1)",
@@ -329,12 +319,12 @@ TEST(ScriptValParse, RepeatedKeysAreNotedWithBothPlaces) {
         {"{ [1] = 'a',\n 'b' }", {"line 2, column 2: [1] is given twice (first at line 1)"}},
         {many + "\n\n k7 = 2 }", {"line 3, column 2: 'k7' is given twice (first at line 1)"}},
     };
-    for (const auto &c : cases) {
+    for (const auto &[text, want] : cases) {
         std::vector<ScriptParseError> notes;
-        EXPECT_EQ(ScriptVal::FromText(c.text, &notes), Parse(c.text));
+        EXPECT_EQ(ScriptVal::FromText(text, &notes), Parse(text));
         std::vector<std::string> got;
         for (const ScriptParseError &n : notes) got.push_back(n.what());
-        EXPECT_EQ(got, c.notes) << c.text;
+        EXPECT_EQ(got, want) << text;
     }
 }
 
@@ -367,13 +357,9 @@ TEST(ScriptValParse, LargeTablesFollowSetSemantics) {
 
 TEST(ScriptValParse, ErrorPositions) {
     const std::string deep = std::string(256, '{') + std::string(256, '}');
-    const struct {
-        std::string text;
-        int line, column;
-        std::string message;
-    } cases[] = {
+    const std::tuple<std::string, int, int, std::string> cases[] = {
         {"{" + deep + "}", 1, 257, "nesting too deep"},
-        {"A{" + deep + "}", 1, 258, "nesting too deep"}, // typed tables count
+        {"A{" + deep + "}", 1, 258, "nesting too deep"},
         {std::string(1000000, '{'), 1, 257, "nesting too deep"},
         {"{\n" + deep, 2, 256, "nesting too deep"},
         {"{ a = \"abc", 1, 7, "unfinished string"},
@@ -418,16 +404,14 @@ TEST(ScriptValParse, ErrorPositions) {
         {std::string("{ \0 }", 5), 1, 3, "unexpected byte 0x00"},
         {"{ \"\xc3\xbc\xe2\x9c\x93\" + }", 1, 8, "unexpected symbol '+'"},
         {"{\r\n a = 1\r\n +", 3, 2, "unexpected symbol '+'"},
-        {"{\r\r+", 3, 1, "unexpected symbol '+'"},
-    };
-    for (const auto &c : cases) {
+        {"{\r\r+", 3, 1, "unexpected symbol '+'"}};
+    for (const auto &[text, line, column, message] : cases) {
         try {
-            ADD_FAILURE() << "parsed without error as: " << Parse(c.text).ToText();
+            ADD_FAILURE() << "parsed without error as: " << Parse(text).ToText();
         } catch (const ScriptParseError &e) {
-            EXPECT_EQ(std::make_tuple(e.Line(), e.Column(), e.Message()), std::make_tuple(c.line, c.column, c.message))
-                << c.text;
-            EXPECT_EQ(e.what(),
-                      "line " + std::to_string(c.line) + ", column " + std::to_string(c.column) + ": " + c.message);
+            EXPECT_EQ(std::make_tuple(e.Line(), e.Column(), e.Message()), std::make_tuple(line, column, message))
+                << text;
+            EXPECT_EQ(e.what(), "line " + std::to_string(line) + ", column " + std::to_string(column) + ": " + message);
         }
     }
 }

@@ -1,7 +1,5 @@
-// The common controls the host adds to tools (Blend, the channel switches,
-// the effect mask) and what PostProcess makes of them, checked pixel by pixel
-// against the mixing rule worked out here, over an area reaching beyond
-// every data window so that windows and canvas colours are checked too.
+// The common controls and what PostProcess makes of them, checked pixel by pixel against the mixing rule worked out
+// here, over an area reaching beyond every data window so that windows and canvas colours are checked too.
 #include <algorithm>
 #include <optional>
 #include <string>
@@ -127,6 +125,8 @@ FltPixel Mixed(const MixCase &c, const FltPixel &in, const FltPixel &res, const 
     return {o[0], o[1], o[2], o[3]};
 }
 
+const std::string Channels[] = {"Red", "Green", "Blue", "Alpha"};
+
 void RunMix(const MixCase &c) {
     SCOPED_TRACE(c.name);
     Ref<OrvaneDoc> doc = MakeRef<OrvaneDoc>();
@@ -148,14 +148,9 @@ void RunMix(const MixCase &c) {
     tool->result = res;
     ASSERT_TRUE(c.generator || tool->input->ConnectTo(ts::AddImageSource(*doc, "Src", src)->Out()));
     ASSERT_TRUE(!mask || tool->Common().effectMask->ConnectTo(ts::AddImageSource(*doc, "MaskSrc", mask)->Out()));
-    ts::SetNumbers(tool, {{"ProcessRed", c.process[0]},
-                          {"ProcessGreen", c.process[1]},
-                          {"ProcessBlue", c.process[2]},
-                          {"ProcessAlpha", c.process[3]}});
-    ts::SetNumbers(tool, {{"Blend", c.blend},
-                          {"EffectMaskChannel", c.channel},
-                          {"EffectMaskInvert", c.invert},
-                          {"MultiplyByMask", c.multiply}});
+    for (int ch = 0; ch < 4; ++ch) ts::SetNumber(tool, ("Process" + Channels[ch]).c_str(), c.process[ch]);
+    ts::SetNumbers(tool, {{"Blend", c.blend}, {"EffectMaskChannel", c.channel}});
+    ts::SetNumbers(tool, {{"EffectMaskInvert", c.invert}, {"MultiplyByMask", c.multiply}});
 
     Ref<Image> out = ts::EvalImage(tool, 0.0, c.roi ? &*c.roi : nullptr);
     ASSERT_TRUE(out);
@@ -178,14 +173,11 @@ void RunMix(const MixCase &c) {
 }
 
 TEST(CommonControls, BlendChannelSwitchesAndTheEffectMaskMixResultAndInput) {
+    const FltPixel opaque{0.5f, 0.25f, 0.f, 1.f};
     const MixCase cases[] = {
         {.name = "blend 0.25", .blend = 0.25},
         {.name = "blend 0", .blend = 0.0},
-        {.name = "result window larger than the input's, blend 0.25",
-         .blend = 0.25,
-         .srcWindow = {4, 4, 8, 8},
-         .resWindow = {0, 0, 16, 12},
-         .srcCanvas = {0.5f, 0.25f, 0.f, 1.f}},
+        {.name = "wider", .blend = 0.25, .srcWindow = {4, 4, 8, 8}, .resWindow = {0, 0, 16, 12}, .srcCanvas = opaque},
         {.name = "red and alpha off", .process = {false, true, true, false}},
         {.name = "green off, blend 0.6", .blend = 0.6, .process = {true, false, true, true}},
         {.name = "all off", .blend = 0.6, .process = {false, false, false, false}},
@@ -194,17 +186,12 @@ TEST(CommonControls, BlendChannelSwitchesAndTheEffectMaskMixResultAndInput) {
         {.name = "green mask, inverted", .mask = RGBAMask, .channel = 2, .invert = true},
         {.name = "blue mask", .mask = RGBAMask, .channel = 3},
         {.name = "luminance of a grey mask", .mask = GreyRGBAMask, .channel = 4},
-        {.name = "luminance, inverted, blend 0.4", .blend = 0.4, .mask = GreyRGBAMask, .channel = 4, .invert = true},
+        {.name = "luminance, inverted", .blend = 0.4, .mask = GreyRGBAMask, .channel = 4, .invert = true},
         {.name = "single-channel mask, green", .mask = SingleChannelMask, .channel = 2},
         {.name = "multiply by mask", .mask = RGBAMask, .multiply = true},
-        {.name = "multiply by inverted red, blend 0.5",
-         .blend = 0.5,
-         .mask = RGBAMask,
-         .channel = 1,
-         .invert = true,
-         .multiply = true},
+        {.name = "times inverted red", .blend = 0.5, .mask = RGBAMask, .channel = 1, .invert = true, .multiply = true},
         {.name = "generator, masked", .mask = RGBAMask, .channel = 1, .generator = true},
-        {.name = "generator, blend 0.25: mixed with transparent black", .blend = 0.25, .generator = true},
+        {.name = "generator: mixed with transparent black", .blend = 0.25, .generator = true},
         {.name = "region", .blend = 0.5, .mask = RGBAMask, .roi = ImgRectI(2, 3, 9, 8)},
     };
     for (const MixCase &c : cases) RunMix(c);

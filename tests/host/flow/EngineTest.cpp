@@ -1,7 +1,4 @@
-// The request walk of the flow engine, seen from inside small tools: the
-// order of priority levels, what has arrived at each CheckRequest, regions of
-// interest and domains, pre-calculation, skipped inputs, failures, aborts and
-// determinism over thread counts.
+// The request walk of the flow engine, seen from inside small tools.
 #include <algorithm>
 #include <cmath>
 #include <functional>
@@ -154,8 +151,6 @@ struct Fed : Doc {
     Fed() { EXPECT_TRUE(probe->late->ConnectTo(late->Out()) && probe->matte->ConnectTo(matte->Out())); }
 };
 
-// ---------------------------------------------------------------------------
-
 TEST(Engine, InputsArriveLevelByLevelLowestFirst) {
     Fed f;
     std::vector<double> amountAtLast;
@@ -164,7 +159,7 @@ TEST(Engine, InputsArriveLevelByLevelLowestFirst) {
             amountAtLast.push_back(dynamic_cast<const Number &>(*req->GetInputData(p.amount)).value);
     };
     ts::SetNumber(f.probe, "Amount", 0.75);
-    ASSERT_TRUE(ts::EvalImage(f.probe));
+    ASSERT_TRUE(ts::EvalImage(f.probe) && f.probe->PixelCalls() == 1);
     const std::vector<int> levels{PriorityMask, PriorityImage, PriorityDefault, 5, PriorityLast};
     for (const bool precalc : {true, false}) {
         const std::vector<Seen> checks = f.probe->checks[precalc];
@@ -183,7 +178,6 @@ TEST(Engine, InputsArriveLevelByLevelLowestFirst) {
     // Constants arrive with their values before the higher levels, in both walks.
     EXPECT_EQ(amountAtLast, (std::vector<double>{0.75, 0.75}));
     // Process sees everything; every source rendered once.
-    ASSERT_EQ(f.probe->PixelCalls(), 1);
     EXPECT_EQ(f.probe->calls.back().hasData, std::vector<bool>(WCount, true));
     for (const ts::ImageSourceTool *s : {f.src, f.late, f.matte}) EXPECT_EQ(s->processCount, 1) << s->Name();
 }
@@ -211,9 +205,7 @@ TEST(Engine, SettingInputDataStopsTheFetch) {
         for (const auto &[s, w] : {std::pair{f.src, WInput}, {f.late, WLate}, {f.matte, WMatte}})
             EXPECT_EQ(s->processCount, input == w ? 0 : 1) << s->Name();
         EXPECT_TRUE(ts::ConsoleText(*f.doc).empty());
-        if (!value) continue;
-        EXPECT_EQ(f.probe->seenInput.Get(), value);
-        EXPECT_EQ(out->GetFlt(3, 4), Probe::Color(value->GetFlt(3, 4), 0.5f));
+        EXPECT_TRUE(!value || out->GetFlt(3, 4) == Probe::Color(value->GetFlt(3, 4), 0.5f));
     }
 }
 
@@ -239,11 +231,9 @@ TEST(Engine, RegionsOfInterestReachUpstream) {
             req->SetInputRoI(self.input, &roi);
         };
         Ref<Image> out = ts::EvalImage(p, 0.0, Region(requested));
-        ASSERT_TRUE(out);
+        ASSERT_TRUE(out && p->checks[false].size() == 5u);
         const Rect seen = supportsRoI ? requested : std::nullopt;
-        const std::vector<Seen> checks = p->checks[false];
-        ASSERT_EQ(checks.size(), 5u);
-        EXPECT_EQ(D(checks[1].roi[WInput]), D(seen)) << "the default region of an input is the request's";
+        EXPECT_EQ(D(p->checks[false][1].roi[WInput]), D(seen)) << "the default region of an input is the request's";
         EXPECT_EQ(D(p->calls.back().reqRoI), D(seen));
         EXPECT_EQ(D(p->calls.back().roi[WInput]), D(upstream));
         EXPECT_EQ(D(up->calls.back().reqRoI), D(upstream));
@@ -268,8 +258,7 @@ TEST(Engine, EveryPixelRequestFollowsAPreCalculation) {
             req->SetOutputData(p.output, img.Get());
         };
         Ref<Image> out = ts::EvalImage(f.probe, 0.0, Region(roi));
-        ASSERT_TRUE(out);
-        ASSERT_EQ(f.probe->calls.size(), 2u);
+        ASSERT_TRUE(out && f.probe->calls.size() == 2u);
         EXPECT_TRUE(f.probe->calls[0].precalc);
         EXPECT_EQ(D(f.probe->calls[0].reqRoI), "none") << "pre-calculation covers the whole domain";
         EXPECT_EQ(D(f.probe->calls[1].outDoD), R(own));
@@ -292,15 +281,13 @@ TEST(Engine, AToolWithoutDoDSupportGetsWholeFrames) {
         Ref<Image> srcImg = ts::WindowedImage(10, 8, sourceWindow, canvas, 3);
         d.src->SetImage(srcImg);
         Probe *p = d.Add("Probe1", d.src->Out(), cls);
-        ASSERT_TRUE(ts::EvalImage(p));
-        ASSERT_EQ(p->calls.size(), 2u);
+        ASSERT_TRUE(ts::EvalImage(p) && p->calls.size() == 2u && p->seenInput);
         for (const Seen &s : p->calls) {
             EXPECT_EQ(R(s.inputWindow), R(seenWindow)) << (s.precalc ? "pre-calculation" : "pixels");
             EXPECT_EQ(D(s.dod[WInput]), R(seenWindow));
             EXPECT_EQ(s.inputNoData, s.precalc);
         }
         // The canvas made real: the source's pixels inside its window, its canvas colour elsewhere.
-        ASSERT_TRUE(p->seenInput);
         for (int y = seenWindow.y0; y < seenWindow.y1; ++y)
             for (int x = seenWindow.x0; x < seenWindow.x1; ++x)
                 ASSERT_EQ(p->seenInput->GetFlt(x, y), sourceWindow.Contains(x, y) ? srcImg->GetFlt(x, y) : canvas)
@@ -359,21 +346,16 @@ TEST(Engine, AToolThatGivesNothingOrLacksARequiredImageFailsWithOneHostLine) {
 }
 
 TEST(Engine, AnAbortedRenderReturnsNullSilently) {
+    // Before the render, in an upstream tool's Process, in CheckRequest, in Process after the output was set.
     enum Where { Before, UpstreamProcess, OwnCheck, OwnProcess };
-    const std::pair<const char *, Where> cases[] = {
-        {"before the render", Before},
-        {"in an upstream tool", UpstreamProcess},
-        {"in CheckRequest", OwnCheck},
-        {"in Process, after the output was set", OwnProcess},
-    };
-    for (const auto &[name, where] : cases) {
-        SCOPED_TRACE(name);
+    for (const Where where : {Before, UpstreamProcess, OwnCheck, OwnProcess}) {
+        SCOPED_TRACE(where);
         Doc d;
         Probe *up = d.Add("Up", d.src->Out());
         Probe *p = d.Add("Own", up->output);
         RenderTask task;
         if (where == Before) task.Abort();
-        auto abortIn = [&, where = where](Where here, Request *req) {
+        auto abortIn = [&](Where here, Request *req) {
             if (where == here && !req->IsPreCalc() && req->GetTask()) req->GetTask()->Abort();
         };
         up->onProcess = [&](Probe &self, Request *req) { abortIn(UpstreamProcess, req), self.MakeOutput(req); };
@@ -381,11 +363,9 @@ TEST(Engine, AnAbortedRenderReturnsNullSilently) {
         p->onProcess = [&](Probe &self, Request *req) { self.MakeOutput(req), abortIn(OwnProcess, req); };
         EXPECT_FALSE(ts::EvalImage(p, 0.0, EvalOptions{.roi = std::nullopt, .task = &task}));
         EXPECT_TRUE(task.IsAborted());
-        EXPECT_TRUE(ts::ConsoleText(*d.doc).empty());
         // Nothing half-made was kept: a render without the task works.
         Ref<Image> out = ts::EvalImage(p);
-        ASSERT_TRUE(out);
-        EXPECT_FALSE(out->IsNoData());
+        EXPECT_TRUE(out && !out->IsNoData());
         EXPECT_TRUE(ts::ConsoleText(*d.doc).empty());
     }
 }
@@ -410,8 +390,7 @@ TEST(Engine, ResultsAreBitIdenticalForAnyWorkerCount) {
             runs.back().insert(runs.back().end(), out->ScanLine(y), out->ScanLine(y) + out->RowBytes());
     }
     SetWorkerCount(before);
-    ASSERT_FALSE(runs[0].empty());
-    for (size_t i = 1; i < runs.size(); ++i) EXPECT_TRUE(runs[i] == runs[0]) << "run " << i;
+    for (size_t i = 1; i < runs.size(); ++i) EXPECT_TRUE(!runs[0].empty() && runs[i] == runs[0]) << "run " << i;
 }
 
 } // namespace
