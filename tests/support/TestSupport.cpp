@@ -6,8 +6,13 @@
 #include <filesystem>
 
 #include "host/app/Application.h"
+#include "host/core/Registry.h"
 #include "host/core/Tags.h"
+#include "host/flow/DataTypes.h"
+#include "host/flow/Engine.h"
+#include "host/flow/Request.h"
 #include "host/image/NewImage.h"
+#include "host/image/TransformMatrix.h"
 
 namespace Orvane::Test {
 
@@ -79,15 +84,6 @@ void ExpectPixelNear(const FltPixel &got, const FltPixel &want, double tol, cons
     EXPECT_NEAR(got.A, want.A, tol) << where << " alpha";
 }
 
-} // namespace Orvane::Test
-
-#include "host/core/Registry.h"
-#include "host/flow/DataTypes.h"
-#include "host/flow/Engine.h"
-#include "host/flow/Request.h"
-#include "host/image/TransformMatrix.h"
-
-namespace Orvane::Test {
 namespace {
 
 OvID RegisterToolWith(const char *id, ClassFactory make, const TagList &attrs) {
@@ -137,24 +133,20 @@ ImageSourceTool::ImageSourceTool(const Registry *reg, const ScriptVal &args, con
     : ThreadedOperator(reg, args, tags), output_(AddImageOut(this)) {}
 
 void ImageSourceTool::Process(Request *req) {
-    if (!image_) {
-        req->SetOutputData(output_, nullptr);
-        return;
-    }
+    if (!image_) return req->SetOutputData(output_, nullptr);
     if (req->IsPreCalc()) {
         const ImgRectI dw = image_->DataWindow();
         const FltPixel canvas = image_->GetCanvasColor();
-        Ref<Image> shape = NewImageTagList(
-            {{ImgLikeImage, image_.Get()}, {ImgDataWindow, &dw}, {ImgNoData, 1}, {ImgCanvasColor, &canvas}});
-        req->SetOutputData(output_, shape.Get());
-        return;
+        return req->SetOutputData(
+            output_,
+            NewImageTagList(
+                {{ImgLikeImage, image_.Get()}, {ImgDataWindow, &dw}, {ImgNoData, 1}, {ImgCanvasColor, &canvas}}));
     }
     ++processCount;
     asked.push_back(req->RoI());
     if (cutToRegion && req->RoI() && !req->RoI()->rect.Contains(image_->DataWindow())) {
         const ImgRectI cut = image_->DataWindow() & req->RoI()->rect;
-        req->SetOutputData(output_, image_->CopyOfImageTagList({{ImgDataWindow, &cut}}).Get());
-        return;
+        return req->SetOutputData(output_, image_->CopyOfImageTagList({{ImgDataWindow, &cut}}).Get());
     }
     req->SetOutputData(output_, image_.Get());
 }
@@ -186,24 +178,20 @@ void ValueProbe::Process(Request *req) {
     req->SetOutputData(output_, pixels ? pixels.Get() : v);
 }
 
+template <bool TakesTransforms> Object *MakeValueProbe(const Registry *r, const ScriptVal &a, const TagList &t) {
+    return new ValueProbe(r, a, t, TakesTransforms);
+}
+
 ValueProbe *AddValueProbe(OrvaneDoc &doc, Operator *src, bool takesTransforms) {
-    static const OvID takes = RegisterTestTool("TestTakesTransforms",
-                                               [](const Registry *r, const ScriptVal &a, const TagList &t) -> Object * {
-                                                   return new ValueProbe(r, a, t, true);
-                                               });
-    static const OvID images =
-        RegisterTestTool("TestTakesImages", [](const Registry *r, const ScriptVal &a, const TagList &t) -> Object * {
-            return new ValueProbe(r, a, t, false);
-        });
+    static const OvID takes = RegisterTestTool("TestTakesTransforms", &MakeValueProbe<true>);
+    static const OvID images = RegisterTestTool("TestTakesImages", &MakeValueProbe<false>);
     auto *probe = dynamic_cast<ValueProbe *>(doc.AddTool(takesTransforms ? takes : images));
     EXPECT_TRUE(probe && probe->FindInput("Input")->ConnectTo(src->FindMainOutput()));
     return probe;
 }
 
 Ref<Image> EvalImage(Operator *op, double time, const ImgRectI *roi) {
-    EvalOptions opt;
-    if (roi) opt.roi = ImageDomain(*roi);
-    return EvalImage(op, time, opt);
+    return EvalImage(op, time, EvalOptions{.roi = roi ? std::optional(ImageDomain(*roi)) : std::nullopt});
 }
 
 Ref<Image> EvalImage(Operator *op, double time, const EvalOptions &options) {
