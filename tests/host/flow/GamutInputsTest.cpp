@@ -1,6 +1,3 @@
-// GamutInputs on a small tool: the inputs it adds and their visibility, and
-// ProcessOf on float and integer images, in place and into new images, with
-// the clipping modes; No Change hands the very same image back.
 #include "host/flow/GamutInputs.h"
 
 #include <gtest/gtest.h>
@@ -62,27 +59,25 @@ TEST(GamutInputs, AddsItsInputsAndShowsWhatTheSpaceNeeds) {
     Fixture f(true);
     Input *space = f.tool->FindInput("GamutSpace");
     ASSERT_NE(space, nullptr);
-    EXPECT_STREQ(space->Label(), "Source Space");
-    EXPECT_EQ(space->Page(), 0); // the tool's current page
+    EXPECT_EQ(std::pair(std::string(space->Label()), space->Page()), std::pair(std::string("Source Space"), 0));
     EXPECT_EQ(f.gamut->CurveOf(nullptr).space, GamutSpace::NoChange);
     EXPECT_EQ(f.tool->FindInput("GamutAddGamma"), nullptr);
-    const struct {
-        const char *space, *shown;
-    } cases[] = {
-        {nullptr, ""}, // No Change, the default
+    // The space chosen (none: No Change, the default) and the inputs shown.
+    const std::pair<const char *, const char *> cases[] = {
+        {nullptr, ""},
         {"Gamma", "GamutGamma GamutRemoveGamma GamutPreDivide"},
         {"CineonLog", "GamutLogBlack GamutLogWhite GamutLogFilmGamma GamutLogSoftClip GamutRemoveGamma GamutPreDivide"},
         {"sRGB", "GamutRemoveGamma GamutPreDivide"},
         {"Linear", ""},
     };
-    for (const auto &c : cases) {
-        SCOPED_TRACE(c.space ? c.space : "NoChange");
-        if (c.space) ts::SetID(f.tool, "GamutSpace", c.space);
+    for (const auto &[chosen, shown] : cases) {
+        SCOPED_TRACE(chosen ? chosen : "NoChange");
+        if (chosen) ts::SetID(f.tool, "GamutSpace", chosen);
         for (const char *id : {"GamutGamma", "GamutLogBlack", "GamutLogWhite", "GamutLogFilmGamma", "GamutLogSoftClip",
                                "GamutRemoveGamma", "GamutPreDivide"}) {
             Input *in = f.tool->FindInput(id);
             ASSERT_NE(in, nullptr) << id;
-            EXPECT_EQ(in->IsVisible(), std::string(c.shown).find(id) != std::string::npos) << id;
+            EXPECT_EQ(in->IsVisible(), std::string(shown).find(id) != std::string::npos) << id;
         }
     }
     Fixture saver(false);
@@ -115,9 +110,7 @@ TEST(GamutInputs, ConvertsFloatAndIntegerImages) {
             for (int x = 0; x < 8; ++x) src->PutFlt(x, y, {x / 7.f, y / 2.f, 0.5f, 0.25f + x / 16.f});
         src->SetCanvasColor(FltPixel{0.5f, 0, 0, 0});
         Ref<Image> out = f.Process(src.Get(), nullptr);
-        ASSERT_TRUE(out);
-        ASSERT_NE(out.Get(), src.Get());
-        EXPECT_EQ(out->Depth(), depth);
+        ASSERT_TRUE(out && out.Get() != src.Get() && out->Depth() == depth);
         const double tol = depth == DepthRGBAInt8 ? 0.5 / 255 + 1e-6 : depth == DepthRGBAInt16 ? 1e-5 : 2e-3;
         auto decode = [](float v) {
             return static_cast<float>(v <= 0.04045 ? v / 12.92 : std::pow((v + 0.055) / 1.055, 2.4));
@@ -153,8 +146,7 @@ TEST(GamutInputs, ClippingModesInPlaceAndTheSaverDirection) {
          {std::pair{ClippingMode_Frame, frame}, {ClippingMode_Domain, dw}, {ClippingMode_None, dw}}) {
         SCOPED_TRACE(mode.Text());
         Ref<Image> out = f.Process(image().Get(), nullptr, mode);
-        ASSERT_TRUE(out);
-        EXPECT_EQ(out->DataWindow(), window);
+        ASSERT_TRUE(out && out->DataWindow() == window);
         ts::ExpectPixelNear(out->GetFlt(window.x0, 1), {code(1), code(0.18), code(0), 1}, 1e-6);
         EXPECT_NEAR(out->GetCanvasColor().R, mode == ClippingMode_None ? code(0.25) : 0.25f, 1e-6);
     }
@@ -174,8 +166,7 @@ TEST(GamutInputs, ClippingModesInPlaceAndTheSaverDirection) {
     half->AllocScanLineData();
     half->Fill({0.09f, 0.09f, 0.09f, 0.5f});
     Ref<Image> pre = f.Process(half.Get(), nullptr);
-    ASSERT_TRUE(pre);
-    EXPECT_NEAR(pre->GetFlt(0, 0).R, 0.5 * code(0.18), 1e-6);
+    EXPECT_NEAR(pre ? pre->GetFlt(0, 0).R : -1, 0.5 * code(0.18), 1e-6);
 }
 
 } // namespace

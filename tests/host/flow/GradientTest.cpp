@@ -3,6 +3,7 @@
 #include <cmath>
 #include <limits>
 #include <string_view>
+#include <tuple>
 #include <vector>
 
 #include <gtest/gtest.h>
@@ -29,14 +30,8 @@ FltPixel Sample(const Gradient &grad, double pos, int space = RGB) {
 FltPixel Color(const GradientStop &s) { return {s.r, s.g, s.b, s.a}; }
 
 TEST(Gradient, BlendsAsItsColourSpaceDoes) {
-    const struct {
-        const char *name;
-        Stops stops;
-        std::vector<int> spaces;
-        std::vector<double> positions;
-        FltPixel want;
-        double tol;
-    } cases[] = {
+    // Name, stops, colour spaces, positions, the colour expected there and its tolerance.
+    const std::tuple<const char *, Stops, std::vector<int>, std::vector<double>, FltPixel, double> cases[] = {
         {"RGB", {{0.2, 1, 0, 0, 1}, {0.6, 0, 0.5, 1, 0}}, {RGB}, {0.3}, {0.75, 0.125, 0.25, 0.75}, 1e-6},
         {"RGB", {{0.2, 1, 0, 0, 1}, {0.6, 0, 0.5, 1, 0}}, {RGB}, {0.5}, {0.25, 0.375, 0.75, 0.25}, 1e-6},
         {"RGB, clear colour counts", {{0, 1, 0, 0, 0}, {1, 0, 0, 1, 1}}, {RGB}, {0.5}, {0.5, 0, 0.5, 0.5}, 1e-7},
@@ -60,11 +55,11 @@ TEST(Gradient, BlendsAsItsColourSpaceDoes) {
         {"no stops: clear", {}, {RGB, LAB}, {0.5}, {0, 0, 0, 0}, 0},
         {"one stop everywhere", {{0.3, 0.2, 0.4, 0.6, 0.8}}, {RGB, LAB}, {-1, 0.31, 5}, {0.2, 0.4, 0.6, 0.8}, 0},
     };
-    for (const auto &c : cases)
-        for (int space : c.spaces)
-            for (double pos : c.positions)
-                ts::ExpectPixelNear(Sample(Gradient(c.stops), pos, space), c.want, c.tol,
-                                    testing::PrintToString(c.name) + ", space " + std::to_string(space) + ", at " +
+    for (const auto &[name, stops, spaces, positions, want, tol] : cases)
+        for (int space : spaces)
+            for (double pos : positions)
+                ts::ExpectPixelNear(Sample(Gradient(stops), pos, space), want, tol,
+                                    std::string(name) + ", space " + std::to_string(space) + ", at " +
                                         std::to_string(pos));
     // Black to white in L*a*b*: L* 50 at the middle, luminance ((50 + 16) / 116)^3.
     const float y = static_cast<float>(std::pow(66.0 / 116.0, 3.0));
@@ -116,12 +111,7 @@ TEST(Gradient, StopsAreSortedStablyAndRepeatedPositionsMakeHardEdges) {
     const Gradient edge({{1, 1, 1, 1}, {0.5, 1, 0, 0}, {0, 0, 0, 0}, {0.5, 0, 0, 1}});
     const Gradient ends({{0, 1, 0, 0}, {0, 0, 1, 0}, {1, 0, 0, 1}, {1, 1, 1, 1}});
     const Gradient triple({{0.5, 1, 0, 0}, {0.5, 0, 1, 0}, {0.5, 0, 0, 1}});
-    const struct {
-        const Gradient &grad;
-        double pos;
-        FltPixel want;
-        double tol;
-    } cases[] = {
+    const std::tuple<const Gradient &, double, FltPixel, double> cases[] = {
         {edge, 0.25, {0.5, 0, 0, 1}, 1e-7},  {edge, 0.4999999, {1, 0, 0, 1}, 1e-6},
         {edge, 0.5, {0, 0, 1, 1}, 0},        {edge, 0.75, {0.5, 0.5, 1, 1}, 1e-7},
         {ends, -1, {1, 0, 0, 1}, 0},         {ends, 0, {0, 1, 0, 1}, 0},
@@ -129,38 +119,31 @@ TEST(Gradient, StopsAreSortedStablyAndRepeatedPositionsMakeHardEdges) {
         {ends, 2, {1, 1, 1, 1}, 0},          {triple, 0.4, {1, 0, 0, 1}, 0},
         {triple, 0.5, {0, 0, 1, 1}, 0},
     };
-    for (const auto &c : cases) ts::ExpectPixelNear(Sample(c.grad, c.pos), c.want, c.tol, std::to_string(c.pos));
+    for (const auto &[grad, pos, want, tol] : cases)
+        ts::ExpectPixelNear(Sample(grad, pos), want, tol, std::to_string(pos));
     for (int space : AllSpaces) EXPECT_EQ(Sample(edge, 0.5, space), (FltPixel{0, 0, 1, 1})) << space;
 }
 
 TEST(Gradient, OpaqueEqualsHashAndCopy) {
-    EXPECT_TRUE(Gradient().IsOpaque());
-    EXPECT_TRUE(Gradient({{0, 0, 0, 0, 1}, {1, 1, 1, 1, 2}}).IsOpaque());
-    EXPECT_FALSE(Gradient({{0, 0, 0, 0, 1}, {1, 1, 1, 1, 0.999}}).IsOpaque());
-    EXPECT_FALSE(Gradient({{0, 0, 0, 0, 0}, {1, 1, 1, 1, 1}}).IsOpaque());
-    EXPECT_FALSE(Gradient(Stops{}).IsOpaque());
+    EXPECT_TRUE(Gradient().IsOpaque() && Gradient({{0, 0, 0, 0, 1}, {1, 1, 1, 1, 2}}).IsOpaque());
+    for (const Stops &clear :
+         {Stops{{0, 0, 0, 0, 1}, {1, 1, 1, 1, 0.999}}, Stops{{0, 0, 0, 0, 0}, {1, 1, 1, 1, 1}}, Stops{}})
+        EXPECT_FALSE(Gradient(clear).IsOpaque());
 
-    const Gradient a({{0, 0.1, 0.2, 0.3}, {0.5, 1, 0, 0}, {0.5, 0, 0, 1}});
-    EXPECT_TRUE(a.Equals(Gradient({{0, 0.1, 0.2, 0.3}, {0.5, 1, 0, 0}, {0.5, 0, 0, 1}})));
-    EXPECT_EQ(a.Hash(), Gradient({{0, 0.1, 0.2, 0.3}, {0.5, 1, 0, 0}, {0.5, 0, 0, 1}}).Hash());
+    const Stops stops{{0, 0.1, 0.2, 0.3}, {0.5, 1, 0, 0}, {0.5, 0, 0, 1}};
+    const Gradient a(stops);
+    EXPECT_TRUE(a.Equals(Gradient(stops)) && a.Hash() == Gradient(stops).Hash());
     const Stops others[] = {
         {{0, 0.1, 0.2, 0.3}, {0.5, 0, 0, 1}, {0.5, 1, 0, 0}}, // order at a shared position matters
         {{0, 0.1, 0.2, 0.3}, {0.5, 1, 0, 0}, {0.6, 0, 0, 1}},
         {{0, 0.1, 0.2, 0.3}, {0.5, 1, 0, 0}},
         {{0, 0.1, 0.2, 0.3}, {0.5, 1, 0, 0}, {0.5, 0, 0, 1, 0.5}},
     };
-    for (const Stops &s : others) {
-        EXPECT_FALSE(a.Equals(Gradient(s)));
-        EXPECT_FALSE(Gradient(s).Equals(a));
-        EXPECT_NE(a.Hash(), Gradient(s).Hash());
-    }
+    for (const Stops &s : others)
+        EXPECT_FALSE(a.Equals(Gradient(s)) || Gradient(s).Equals(a) || a.Hash() == Gradient(s).Hash());
     EXPECT_FALSE(a.Equals(Number(0.5)));
-
     Ref<Parameter> copy = a.Copy();
-    ASSERT_TRUE(copy);
-    EXPECT_NE(copy.Get(), static_cast<const Parameter *>(&a));
-    EXPECT_TRUE(copy->Equals(a));
-    EXPECT_EQ(copy->DataType(), CLSID_DataType_Gradient);
+    EXPECT_TRUE(copy && copy.Get() != &a && copy->Equals(a) && copy->DataType() == CLSID_DataType_Gradient);
 }
 
 TEST(Gradient, InterpolateBlendsMatchingStopsOrTakesTheNearer) {
@@ -168,12 +151,10 @@ TEST(Gradient, InterpolateBlendsMatchingStopsOrTakesTheNearer) {
     Ref<Gradient> to = MakeRef<Gradient>(Stops{{0, 1, 0, 0, 0}, {1, 0, 0, 1, 1}});
     Ref<Parameter> blend = from->Interpolate(*to, 0.25);
     auto *mid = dynamic_cast<Gradient *>(blend.Get());
-    ASSERT_NE(mid, nullptr);
-    ASSERT_EQ(mid->Stops().size(), 2u);
+    ASSERT_TRUE(mid && mid->Stops().size() == 2u);
     ts::ExpectPixelNear(Color(mid->Stops()[0]), {0.25, 0, 0, 0.75}, 1e-7);
     ts::ExpectPixelNear(Color(mid->Stops()[1]), {0.75, 0.75, 1, 1}, 1e-7);
-    EXPECT_TRUE(from->Interpolate(*to, 0.0)->Equals(*from));
-    EXPECT_TRUE(from->Interpolate(*to, 1.0)->Equals(*to));
+    EXPECT_TRUE(from->Interpolate(*to, 0.0)->Equals(*from) && from->Interpolate(*to, 1.0)->Equals(*to));
 
     // Stops that do not match: the nearer gradient, whole.
     Ref<Gradient> moved = MakeRef<Gradient>(Stops{{0, 1, 0, 0}, {0.5, 0, 0, 1}});
@@ -188,8 +169,7 @@ TEST(Gradient, ScriptFormRoundTrips) {
     const char *defaultText = "Gradient { Colors = { [0] = { 0, 0, 0, 1 }, [1] = { 1, 1, 1, 1 } } }";
     EXPECT_EQ(Gradient().ToScript(), ScriptVal::FromText(defaultText));
     Ref<Gradient> read = Gradient::FromScript(ScriptVal::FromText(defaultText));
-    ASSERT_TRUE(read);
-    EXPECT_TRUE(read->Equals(Gradient()));
+    EXPECT_TRUE(read && read->Equals(Gradient()));
 
     const Gradient grad({{-0.25, 0.1, 0.2, 0.3, 0.4},
                          {0.5, 1, 0, 0},
@@ -200,17 +180,13 @@ TEST(Gradient, ScriptFormRoundTrips) {
     EXPECT_EQ(doc.ClassName(), "Gradient");
     // The shared position is one key holding both colours in order.
     const ScriptVal *edge = doc.Find(std::string_view("Colors"))->Find(ScriptVal(0.5));
-    ASSERT_NE(edge, nullptr);
-    EXPECT_EQ(edge->ArrayLength(), 2u);
+    EXPECT_TRUE(edge && edge->ArrayLength() == 2u);
     // Float colours are written as their shortest decimal.
     const ScriptVal *first = doc.Find(std::string_view("Colors"))->Find(ScriptVal(-0.25));
-    ASSERT_NE(first, nullptr);
-    EXPECT_EQ(first->At(1)->AsNumber(), 0.1);
+    EXPECT_TRUE(first && first->At(1)->AsNumber() == 0.1);
     for (const ScriptVal &form : {doc, ScriptVal::FromText(doc.ToText())}) {
         Ref<Gradient> back = Gradient::FromScript(form);
-        ASSERT_TRUE(back);
-        EXPECT_TRUE(back->Equals(grad));
-        EXPECT_EQ(back->Hash(), grad.Hash());
+        EXPECT_TRUE(back && back->Equals(grad) && back->Hash() == grad.Hash());
     }
 }
 
@@ -218,32 +194,22 @@ TEST(Gradient, ScriptReadingIsLenientWhereHarmlessAndRefusesTheMalformed) {
     // Three components mean opaque; a plain table and extra entries are fine.
     Ref<Gradient> g = Gradient::FromScript(
         ScriptVal::FromText("{ Version = 2, Colors = { [1] = { 1, 0, 0 }, [0] = { 0, 1, 0, 0.5 } } }"));
-    ASSERT_TRUE(g);
-    EXPECT_TRUE(g->Equals(Gradient({{0, 0, 1, 0, 0.5}, {1, 1, 0, 0, 1}})));
+    EXPECT_TRUE(g && g->Equals(Gradient({{0, 0, 1, 0, 0.5}, {1, 1, 0, 0, 1}})));
     Ref<Gradient> empty = Gradient::FromScript(ScriptVal::FromText("Gradient { Colors = {} }"));
-    ASSERT_TRUE(empty);
-    EXPECT_TRUE(empty->Stops().empty());
+    EXPECT_TRUE(empty && empty->Stops().empty());
 
-    const char *bad[] = {
-        "1",
-        "\"Gradient\"",
-        "Gradient {}",
-        "Gradient { Colors = 3 }",
-        "Curve { Colors = { [0] = { 0, 0, 0, 1 } } }",
-        "Gradient { Colors = Table { [0] = { 0, 0, 0, 1 } } }",
-        "Gradient { Colors = { Red = { 1, 0, 0, 1 } } }",
-        "Gradient { Colors = { [1/0] = { 1, 0, 0, 1 } } }",
-        "Gradient { Colors = { [-1/0] = { 1, 0, 0, 1 } } }",
-        "Gradient { Colors = { [0] = 1 } }",
-        "Gradient { Colors = { [0] = { 1, 0 } } }",
-        "Gradient { Colors = { [0] = { 1, 0, 0, 1, 1 } } }",
-        "Gradient { Colors = { [0] = { 1, 0, \"blue\", 1 } } }",
-        "Gradient { Colors = { [0] = { r = 1, g = 0, b = 0 } } }",
-        "Gradient { Colors = { [0] = { 1, 0, 0, 1, x = 2 } } }",
-        "Gradient { Colors = { [0] = { { 1, 0, 0, 1 }, 5 } } }",
-        "Gradient { Colors = { [0] = { { 1, 0, 0, 1 }, { 1, 0 } } } }",
-    };
-    for (const char *text : bad) EXPECT_FALSE(Gradient::FromScript(ScriptVal::FromText(text))) << text;
+    // Not a table; no colours or no table of them; another class; keys that are no finite position; colours of the
+    // wrong size, type or shape.
+    for (const char *text :
+         {"1", "\"Gradient\"", "Gradient {}", "Gradient { Colors = 3 }", "Curve { Colors = { [0] = { 0, 0, 0, 1 } } }",
+          "Gradient { Colors = Table { [0] = { 0, 0, 0, 1 } } }"})
+        EXPECT_FALSE(Gradient::FromScript(ScriptVal::FromText(text))) << text;
+    for (const char *colors :
+         {"Red = { 1, 0, 0, 1 }", "[1/0] = { 1, 0, 0, 1 }", "[-1/0] = { 1, 0, 0, 1 }", "[0] = 1", "[0] = { 1, 0 }",
+          "[0] = { 1, 0, 0, 1, 1 }", "[0] = { 1, 0, \"blue\", 1 }", "[0] = { r = 1, g = 0, b = 0 }",
+          "[0] = { 1, 0, 0, 1, x = 2 }", "[0] = { { 1, 0, 0, 1 }, 5 }", "[0] = { { 1, 0, 0, 1 }, { 1, 0 } }"})
+        EXPECT_FALSE(Gradient::FromScript(ScriptVal::FromText("Gradient { Colors = { " + std::string(colors) + " } }")))
+            << colors;
     EXPECT_FALSE(Gradient::FromScript(ScriptVal()));
 }
 
