@@ -24,8 +24,8 @@ namespace {
 
 using Names = std::vector<std::string>;
 
-/// A tool with one input of each kind a document stores, declared in the
-/// order Size, Center, Caption, Mode, Colors, Width, Histo, Choice, Input.
+/// A tool with one input of each kind a document stores, in the order Size, Center, Caption, Mode, Colors, Width,
+/// Histo, Choice, Input.
 class DocTool : public ThreadedOperator {
 public:
     DocTool(const Registry *reg, const ScriptVal &args, const TagList &tags) : ThreadedOperator(reg, args, tags) {
@@ -65,11 +65,7 @@ OvID DocToolID() {
                              {RegNoEffectMask, 1}});
 }
 
-Operator *AddDocTool(OrvaneDoc &doc, const std::string &name) {
-    Operator *op = doc.AddTool(DocToolID(), name);
-    EXPECT_NE(op, nullptr) << name;
-    return op;
-}
+Operator *AddDocTool(OrvaneDoc &doc, const std::string &name) { return doc.AddTool(DocToolID(), name); }
 
 DocumentLoadResult Load(const std::string &text, OrvaneDoc &doc, bool lenient = false) {
     DocToolID();
@@ -95,15 +91,13 @@ std::string Joined(const Names &lines) {
     return all;
 }
 
-/// Saves, loads into a fresh document, saves again: both texts must match, and so must a third generation.
+/// Saves, loads into a fresh document without a warning, saves again: both texts must match.
 void ExpectStableRoundTrip(const OrvaneDoc &doc) {
     const std::string first = SaveDocument(doc);
-    Ref<OrvaneDoc> again = MakeRef<OrvaneDoc>(), third = MakeRef<OrvaneDoc>();
+    Ref<OrvaneDoc> again = MakeRef<OrvaneDoc>();
     const DocumentLoadResult r = Load(first, *again);
     ASSERT_TRUE(r.ok && r.warnings.empty()) << r.error << Joined(r.warnings) << "\n" << first;
     EXPECT_EQ(SaveDocument(*again), first);
-    ASSERT_TRUE(Load(first, *third).ok);
-    EXPECT_EQ(SaveDocument(*third), first);
 }
 
 Ref<Gradient> TwoStops() {
@@ -151,8 +145,7 @@ TEST(DocumentIO, SaveLoadSaveGivesTheSameBytesAndRestoresWhatWasSaved) {
     EXPECT_EQ(back->FindTool("Blur_2")->FindInput("Input")->Link(), src2->FindOutput("Output"));
     EXPECT_EQ(back->FindTool("after")->FindInput("Size")->Link(), src2->FindOutput("Value"));
     EXPECT_EQ(a2->FindInput("Center")->Curve()->ToScript(), center.ToScript());
-    EXPECT_EQ(back->GetPrefLong(PREF_FFWidth), 1280);
-    EXPECT_FALSE(back->PrefIsSet(PREF_FFHeight));
+    EXPECT_TRUE(back->GetPrefLong(PREF_FFWidth) == 1280 && !back->PrefIsSet(PREF_FFHeight));
     EXPECT_EQ(std::vector<double>({back->GlobalStart(), back->GlobalEnd(), back->RenderStart(), back->RenderEnd()}),
               std::vector<double>({-10, 250.5, 12, 48}));
 }
@@ -176,7 +169,7 @@ return Orvane.Document{
   RenderRange = {5, 50}, Version = 1, GlobalRange={0,200},
 }
 )";
-    Ref<OrvaneDoc> doc = MakeRef<OrvaneDoc>(), again = MakeRef<OrvaneDoc>();
+    Ref<OrvaneDoc> doc = MakeRef<OrvaneDoc>();
     const DocumentLoadResult r = Load(hand, *doc);
     ASSERT_TRUE(r.ok && r.warnings.empty()) << r.error << Joined(r.warnings);
     const std::string canonical = SaveDocument(*doc);
@@ -185,22 +178,22 @@ return Orvane.Document{
     EXPECT_EQ(Keys(root.Find("Tools")), (Names{"Alpha", "Mid", "Zed"}));
     // Declaration order; defaults are not added (Width's neither, though it asks to be saved), but one the
     // document gave stays.
-    EXPECT_EQ(InputKeys(canonical, "Zed"), (Names{"Size", "Width", "Input"}));
-    EXPECT_EQ(InputKeys(canonical, "Alpha"), (Names{"Size", "Center", "Mode", "Choice"}));
-    EXPECT_EQ(InputKeys(canonical, "Mid"), Names{"Width"});
+    for (const auto &[tool, keys] : {std::pair<const char *, Names>{"Zed", {"Size", "Width", "Input"}},
+                                     {"Alpha", {"Size", "Center", "Mode", "Choice"}},
+                                     {"Mid", {"Width"}}})
+        EXPECT_EQ(InputKeys(canonical, tool), keys) << tool;
     EXPECT_EQ(ToolIn(canonical, "Mid").ClassName(), DocToolClass) << "an alias is saved as the class's ID";
+    // A choice by its number, keys in time order.
     const ScriptVal alpha = *ToolIn(canonical, "Alpha").Find("Inputs");
-    EXPECT_EQ(alpha.Find("Choice")->AsNumber(), 1);
-    ASSERT_EQ(alpha.Find("Size")->ArrayLength(), 2u);
-    EXPECT_EQ(alpha.Find("Size")->At(1)->At(1)->AsNumber(), 0) << "keys in time order";
+    EXPECT_EQ(alpha.Find("Choice")->ToText() + " " + alpha.Find("Size")->ToText(),
+              "1 Curve {\n\t{ 0, 1, Interp = \"Hold\" },\n\t{ 10, 2 },\n}");
     // The leading block, a comment before a tool and one after an input's value stay where they were.
     for (const char *kept :
          {"-- written by hand, in an order of its own\n-- orvane-render: --frames 5-50\n"
           "Orvane.Document {\n",
           "\t\t-- the last step\n\t\tZed = DocIOTestTool {", "\"ModeB\", -- a bare word for an ID\n"})
         EXPECT_NE(canonical.find(kept), std::string::npos) << kept << "\n" << canonical;
-    ASSERT_TRUE(Load(canonical, *again).ok);
-    EXPECT_EQ(SaveDocument(*again), canonical);
+    ExpectStableRoundTrip(*doc);
     // Editing keeps them; removing a tool drops its own.
     ts::SetNumber(doc->FindTool("Alpha"), "Size", 5);
     EXPECT_NE(SaveDocument(*doc).find("-- a bare word for an ID"), std::string::npos);
@@ -375,9 +368,8 @@ TEST(DocumentIO, LenientLoadingKeepsWhatItDoesNotKnowAndWritesItBack) {
     const DocumentLoadResult r = Load(text, *doc, true);
     ASSERT_TRUE(r.ok) << r.error;
     EXPECT_EQ(r.warnings.size(), 6u) << Joined(r.warnings); // Layout, FuturePref, FancyThing, Bogus, two links
-    EXPECT_EQ(doc->FindTool("Mystery1"), nullptr);
+    EXPECT_TRUE(!doc->FindTool("Mystery1") && doc->GetPrefLong(PREF_FFWidth) == 1280);
     EXPECT_EQ(doc->FindTool("A1")->FindInput("Input")->UnresolvedLink(), "Mystery1.Output");
-    EXPECT_EQ(doc->GetPrefLong(PREF_FFWidth), 1280);
 
     const std::string saved = SaveDocument(*doc);
     const ScriptVal source = ScriptVal::FromText(text), root = ScriptVal::FromText(saved), a1 = ToolIn(saved, "A1");
@@ -405,8 +397,7 @@ TEST(DocumentIO, APlannedToolKeepsItsSettingsWithOneWarning) {
 )";
     Ref<OrvaneDoc> doc = MakeRef<OrvaneDoc>();
     const DocumentLoadResult r = Load(text, *doc);
-    ASSERT_TRUE(r.ok) << r.error;
-    ASSERT_EQ(r.warnings.size(), 1u) << Joined(r.warnings);
+    ASSERT_TRUE(r.ok && r.warnings.size() == 1u) << r.error << Joined(r.warnings);
     EXPECT_NE(r.warnings[0].find("Glow1: the Glow tool is not available yet"), std::string::npos) << r.warnings[0];
     const ScriptVal was = *ScriptVal::FromText(text).Find("Tools")->Find("Glow1")->Find("Inputs");
     const ScriptVal now = *ToolIn(SaveDocument(*doc), "Glow1").Find("Inputs");
@@ -423,9 +414,7 @@ TEST(DocumentIO, AnyNameOfAClassMakesItAndItIsSavedByItsID) {
     for (const auto &[written, saved] :
          {std::pair{"SetBgColor", "SetCanvasColor"}, {"Resize", "BetterResize"}, {"DocAlias", DocToolClass}}) {
         Ref<OrvaneDoc> doc = MakeRef<OrvaneDoc>();
-        const DocumentLoadResult r =
-            Load(std::string("Orvane.Document { Tools = { T1 = ") + written + " { } } }", *doc);
-        ASSERT_TRUE(r.ok) << r.error;
+        ASSERT_TRUE(Load(std::string("Orvane.Document { Tools = { T1 = ") + written + " { } } }", *doc).ok);
         EXPECT_EQ(doc->FindTool("T1")->ClassID(), OvID(saved));
         EXPECT_EQ(ToolIn(SaveDocument(*doc), "T1").ClassName(), saved);
     }
@@ -473,9 +462,9 @@ TEST(DocumentIO, SavingReplacesAFileWholeOrLeavesWhatWasThereAndOnlyFilesAreRead
     for (const auto &[name, says] : {std::pair{"absent.orv", "cannot open"}, std::pair{"taken", "not a regular file"},
                                      std::pair{"pipe", "not a regular file"}}) {
         const DocumentLoadResult failed = LoadDocumentFile(dir / name, *MakeRef<OrvaneDoc>());
-        EXPECT_FALSE(failed.ok);
-        EXPECT_NE(failed.error.find(says), std::string::npos) << failed.error;
-        EXPECT_NE(failed.error.find(name), std::string::npos) << failed.error;
+        EXPECT_FALSE(failed.ok || failed.error.find(says) == std::string::npos ||
+                     failed.error.find(name) == std::string::npos)
+            << failed.error;
     }
 
     // Into a read-only folder (folder permissions do not bind the superuser).
