@@ -33,8 +33,6 @@ TempDir::~TempDir() {
     std::filesystem::remove_all(path, ignored);
 }
 
-std::string SourcePath(const std::string &relative) { return std::string(ORVANE_SOURCE_DIR) + "/" + relative; }
-
 Ref<Image> PatternImage(int w, int h, int depth, unsigned seed) {
     Ref<Image> img = NewImageTagList({{ImgWidth, w}, {ImgHeight, h}, {ImgDepth, depth}});
     img->AllocScanLineData();

@@ -18,11 +18,7 @@ namespace Orvane::Test {
 /// Loads liborvaneoperators from the build folder (fails the test if it cannot).
 void LoadOperators();
 
-/// A path under the source tree.
-std::string SourcePath(const std::string &relative);
-
-/// A fresh folder under the system's temporary folder, removed with all it
-/// holds when the object goes.
+/// A fresh folder under the system's temporary folder, removed with all it holds when the object goes.
 struct TempDir {
     std::string path;
     TempDir();
@@ -65,8 +61,8 @@ private:
     Output *output_;
 };
 
-/// Registers a test tool class `id` made by `make` (an operator tool with regions and domains, no blend or effect
-/// mask controls, `extra` on top); returns its ID.
+/// Registers a test tool class `id` made by `make` (an operator tool with regions and domains, no blend or effect mask
+/// controls, `extra` on top); returns its ID.
 OvID RegisterTestTool(const char *id, ClassFactory make, std::initializer_list<TagItem> extra = {});
 
 /// One T for the whole test program, made on first use (classes of test tools are registered this way).

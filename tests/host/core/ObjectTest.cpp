@@ -62,12 +62,10 @@ TEST(RefHandle, CountsEveryHandleAndDeletesWithTheLast) {
         d = same;                     // self assignment keeps the count
         EXPECT_EQ(p->RefCount(), 3);
         d = std::move(c);
-        EXPECT_FALSE(c);
-        EXPECT_EQ(p->RefCount(), 2);
+        EXPECT_TRUE(!c && p->RefCount() == 2);
     }
     EXPECT_EQ(p->RefCount(), 1);
-    EXPECT_EQ(a.Release(), p);
-    EXPECT_FALSE(a);
+    EXPECT_TRUE(a.Release() == p && !a);
     a = Ref<Counted>::Adopt(p);
     EXPECT_EQ(p->RefCount(), 1);
     a = MakeRef<Counted>(2); // assigning over the last reference deletes the old object
@@ -80,8 +78,7 @@ TEST(RefHandle, CountsEveryHandleAndDeletesWithTheLast) {
         EXPECT_EQ(derived->RefCount(), 3);
     }
     Ref<Counted> moved = std::move(derived); // converting move: takes the reference over
-    EXPECT_FALSE(derived);
-    EXPECT_EQ(moved->RefCount(), 1);
+    EXPECT_TRUE(!derived && moved->RefCount() == 1);
     for (Ref<Counted> *r : {&a, &shared, &moved}) r->Reset();
     EXPECT_EQ(aliveCount, 0);
     Ref<Counted> empty;
@@ -94,10 +91,9 @@ TEST(RefHandle, CountsEveryHandleAndDeletesWithTheLast) {
     obj->SetAttrsTagList({{0x10000f10, 3}, {0x20000f10, 0.5}, {0x30000f10, label.c_str()}});
     obj->SetAttrsTagList({{0x10000f10, 4}, {0x10000f11, 1}});
     label.assign(label.size(), '#');
-    EXPECT_EQ(std::tuple(obj->GetAttrL(0x10000f10), obj->GetAttrD(0x20000f10), obj->GetAttrB(0x10000f11)),
-              std::tuple(4LL, 0.5, true));
-    EXPECT_EQ(obj->GetAttrL(0x10000f12, -2), -2);
-    EXPECT_STREQ(obj->Attrs().GetText(0x30000f10), "label text");
+    EXPECT_EQ(std::tuple(obj->GetAttrL(0x10000f10), obj->GetAttrD(0x20000f10), obj->GetAttrB(0x10000f11),
+                         obj->GetAttrL(0x10000f12, -2), std::string(obj->Attrs().GetText(0x30000f10))),
+              std::tuple(4LL, 0.5, true, -2LL, "label text"));
 }
 
 template <size_t N> struct Blob : Reuser { unsigned char bytes[N]; };
@@ -149,8 +145,8 @@ TEST(OvIDIntern, EqualTextSharesOnePointer) {
         for (const char *y : ordered) EXPECT_EQ(OvID(x) < OvID(y), std::string(x) < y) << x << " < " << y;
 }
 
-// Threads share one object, take blocks of two size classes stamped with their owner, round and place (checked
-// after the other threads have had the chance to take them), and intern names, each in an order of its own.
+// Threads share one object, take blocks of two size classes stamped with their owner, round and place (checked after
+// the other threads have had the chance to take them), and intern names, each in an order of its own.
 TEST(Concurrency, ReferencesBlocksAndInternedNamesStayConsistent) {
     struct Large : Reuser {
         uint64_t stamp[6];
@@ -272,9 +268,7 @@ TEST(ParallelJobs, RangeCoveredExactlyOnce) {
                 ParallelRange(first, last, count, grain);
                 ParallelFor(
                     n, [&](int i) { ++each[i]; }, grain);
-                EXPECT_EQ(badPieces.load(), 0);
-                EXPECT_EQ(Wrong(hits), 0);
-                EXPECT_EQ(Wrong(each), 0);
+                EXPECT_EQ(std::tuple(badPieces.load(), Wrong(hits), Wrong(each)), std::tuple(0, 0, 0));
             }
     }
     int calls = 0;
@@ -317,8 +311,7 @@ TEST(ParallelJobs, NestedJobsAndJobsFromManyThreadsCompleteAndOneWorkerIsTheCall
         covered += e - b;
     };
     ParallelRange(0, 100000, count, 1);
-    EXPECT_EQ(elsewhere.load(), 0);
-    EXPECT_EQ(covered.load(), 100000);
+    EXPECT_EQ(std::pair(elsewhere.load(), covered.load()), std::pair(0, 100000));
     for (int zeroOrLess : {0, -5}) { // one per core
         SetWorkerCount(zeroOrLess);
         EXPECT_EQ(WorkerCount(), tbb::info::default_concurrency());

@@ -198,9 +198,8 @@ TEST(RegistryInit, StartUpHooksMayLookUpTheList) {
     l.Add("RegTestHookBase", {});
     l.Add("RegTestHookEarly", {{RegBaseClass, &baseId}, {RegInitFunc, &LookupInit}});
     l.list->InitAll();
-    // The same hook on a row entered after InitAll. Run on a thread of its own
-    // so that a hook blocked on the list's lock fails the test instead of
-    // hanging it.
+    // The same hook on a row entered after InitAll. Run on a thread of its own so that a hook blocked on the list's
+    // lock fails the test instead of hanging it.
     auto done = std::make_shared<std::promise<void>>();
     std::future<void> finished = done->get_future();
     std::thread([listRef = &l.list, done] {

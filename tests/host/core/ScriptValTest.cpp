@@ -328,8 +328,8 @@ TEST(ScriptValParse, RepeatedKeysAreNotedWithBothPlaces) {
     }
 }
 
-// Many fields with repeats and removals: the parsed table matches the same fields applied through Set, and every
-// key given again is noted once.
+// Many fields with repeats and removals: the parsed table matches the same fields applied through Set, and every key
+// given again is noted once.
 TEST(ScriptValParse, LargeTablesFollowSetSemantics) {
     std::mt19937 rng(7);
     for (int round = 0; round < 10; ++round) {

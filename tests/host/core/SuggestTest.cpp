@@ -8,8 +8,8 @@
 namespace Orvane::suggest_test {
 namespace {
 
-// Distances worked out by hand: each counts the fewest inserted, deleted, replaced or swapped neighbouring
-// characters, case aside, where no character is edited twice ("ca" to "abc" takes three, not two).
+// Distances worked out by hand: each counts the fewest inserted, deleted, replaced or swapped neighbouring characters,
+// case aside, where no character is edited twice ("ca" to "abc" takes three, not two).
 TEST(Suggest, NameDistanceCountsEditsIgnoringCase) {
     const struct {
         const char *a, *b;

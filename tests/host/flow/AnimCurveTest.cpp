@@ -124,8 +124,8 @@ TEST(AnimCurve, TheDocumentFormRoundTripsAndMalformedFormsAreRefused) {
     ASSERT_TRUE(ReadCurve(points.ToScript().ToText(), CLSID_DataType_Point, pointsBack));
     EXPECT_EQ(pointsBack.ToScript(), points.ToScript());
 
-    // No key, a key without value, a time that is no number, a value of the
-    // wrong type, unknown interpolations, another class, no class, no table.
+    // No key, a key without value, a time that is no number, a value of the wrong type, unknown interpolations, another
+    // class, no class, no table.
     for (const char *text : {"Curve { }", "Curve { { 0 } }", "Curve { { \"a\", 1 } }", "Curve { { 0, \"x\" } }",
                              "Curve { { 0, 1, Interp = \"Wobbly\" } }", "Curve { { 0, 1, Interp = 3 } }",
                              "NotACurve { { 0, 1 } }", "{ { 0, 1 } }", "Curve { 5 }"}) {

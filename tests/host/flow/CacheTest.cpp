@@ -354,8 +354,8 @@ TEST(EngineCache, AChainOfPerPixelToolsHoldsTwoFramesUnderTheMemoryLimit) {
     ASSERT_TRUE(out);
     EXPECT_LE(PixelMemoryPeak(), limit);
     EXPECT_FLOAT_EQ(out->GetFlt(7, 9).G, image->GetFlt(7, 9).G * 0.5f * 1.0f * 1.5f * 2.0f);
-    // Room for one frame more only: the second tool, which does not check its
-    // allocation, fails with the line saying what it needed.
+    // Room for one frame more only: the second tool, which does not check its allocation, fails with the line saying
+    // what it needed.
     out.Reset();
     doc->Cache().Clear();
     SetPixelMemoryLimit(PixelMemoryInUse() - PixelPoolBytes() + frame * 3 / 2);

@@ -16,8 +16,8 @@ namespace Orvane::commoncontrolstest {
 namespace ts = ::Orvane::Test;
 namespace {
 
-/// Outputs a fixed image given by the test, or passes its input on when it
-/// has none. Pre-calculation gives the same windows without pixels.
+/// Outputs a fixed image given by the test, or passes its input on when it has none. Pre-calculation gives the same
+/// windows without pixels.
 class Tool : public ThreadedOperator {
 public:
     Tool(const Registry *reg, const ScriptVal &args, const TagList &tags, bool withInput = true)

@@ -40,8 +40,8 @@ struct Seen {
     ImgRectI inputWindow{};   ///< data window of the main input image
 };
 
-/// A tool with inputs on five priority levels, declared out of order:
-/// Last (1999), Input (image, -1), Amount (0), Late (image, 5), Matte (mask, -1000).
+/// A tool with inputs on five priority levels, declared out of order: Last (1999), Input (image, -1), Amount (0), Late
+/// (image, 5), Matte (mask, -1000).
 class Probe : public ThreadedOperator {
 public:
     using ThreadedOperator::ThreadedOperator;
@@ -73,8 +73,8 @@ public:
         MakeOutput(req);
     }
 
-    /// The tool's own work: a fixed colour function of the main input (or of
-    /// Late when Input was dropped) over the input's data window and region.
+    /// The tool's own work: a fixed colour function of the main input (or of Late when Input was dropped) over the
+    /// input's data window and region.
     void MakeOutput(Request *req) {
         auto *src = dynamic_cast<Image *>(req->GetInputData(input));
         if (!src) src = dynamic_cast<Image *>(req->GetInputData(late));
@@ -243,8 +243,8 @@ TEST(Engine, RegionsOfInterestReachUpstream) {
 }
 
 TEST(Engine, EveryPixelRequestFollowsAPreCalculation) {
-    // The tool chooses a data window of its own; the pixel pass must know it
-    // as the output's domain before Process runs.
+    // The tool chooses a data window of its own; the pixel pass must know it as the output's domain before Process
+    // runs.
     const ImgRectI own(1, 2, 5, 7);
     for (const std::optional<ImgRectI> &roi : {std::optional<ImgRectI>(), std::optional(ImgRectI(0, 0, 3, 3))}) {
         SCOPED_TRACE(roi ? "region request" : "whole frame");

@@ -35,8 +35,8 @@ TEST(Gradient, BlendsAsItsColourSpaceDoes) {
         {"RGB", {{0.2, 1, 0, 0, 1}, {0.6, 0, 0.5, 1, 0}}, {RGB}, {0.3}, {0.75, 0.125, 0.25, 0.75}, 1e-6},
         {"RGB", {{0.2, 1, 0, 0, 1}, {0.6, 0, 0.5, 1, 0}}, {RGB}, {0.5}, {0.25, 0.375, 0.75, 0.25}, 1e-6},
         {"RGB, clear colour counts", {{0, 1, 0, 0, 0}, {1, 0, 0, 1, 1}}, {RGB}, {0.5}, {0.5, 0, 0.5, 0.5}, 1e-7},
-        // Full colours at hue 0.95 and 0.05: the short way passes through red
-        // at hue 0; the long way would pass through cyan.
+        // Full colours at hue 0.95 and 0.05: the short way passes through red at hue 0; the long way would pass through
+        // cyan.
         {"hue: the short way", {{0, 1, 0, 0.3}, {1, 1, 0.3, 0}}, {HSV, HLS}, {0.5}, {1, 0, 0, 1}, 1e-5},
         {"hue 0.975: last sector", {{0, 1, 0, 0.3}, {1, 1, 0.3, 0}}, {HSV, HLS}, {0.25}, {1, 0, 0.15, 1}, 1e-5},
         {"hue 0.025: first sector", {{0, 1, 0, 0.3}, {1, 1, 0.3, 0}}, {HSV, HLS}, {0.75}, {1, 0.15, 0, 1}, 1e-5},
@@ -46,9 +46,8 @@ TEST(Gradient, BlendsAsItsColourSpaceDoes) {
         {"half a turn on: red", {{0, 0.5, 0, 1}, {1, 0.5, 1, 0}}, {HSV, HLS}, {0.5}, {1, 0, 0, 1}, 1e-5},
         {"red to green: yellow", {{0, 1, 0, 0}, {1, 0, 1, 0}}, {HSV, HLS}, {0.5}, {1, 1, 0, 1}, 1e-5},
         {"RGB: olive", {{0, 1, 0, 0}, {1, 0, 1, 0}}, {RGB, 3, -1}, {0.5}, {0.5, 0.5, 0, 1}, 1e-6},
-        // A grey end has no hue: the blend keeps the other's. White to blue:
-        // HSV (2/3, 0.5, 1); HLS L 0.75, S 0.5, chroma 0.25. Black to red in
-        // HLS: L 0.25, S 0.5.
+        // A grey end has no hue: the blend keeps the other's. White to blue: HSV (2/3, 0.5, 1); HLS L 0.75, S 0.5,
+        // chroma 0.25. Black to red in HLS: L 0.25, S 0.5.
         {"HSV: white to blue", {{0, 1, 1, 1}, {1, 0, 0, 1}}, {HSV}, {0.5}, {0.5, 0.5, 1, 1}, 1e-5},
         {"HLS: white to blue", {{0, 1, 1, 1}, {1, 0, 0, 1}}, {HLS}, {0.5}, {0.625, 0.625, 0.875, 1}, 1e-5},
         {"HLS: black to red", {{0, 0, 0, 0}, {1, 1, 0, 0}}, {HLS}, {0.5}, {0.375, 0.125, 0.125, 1}, 1e-5},
@@ -95,8 +94,8 @@ TEST(Gradient, StopsAreSortedStablyAndRepeatedPositionsMakeHardEdges) {
     ts::ExpectPixelNear(Sample(sorted, 0.25), {0, 0.5, 0, 1}, 1e-7);
     ts::ExpectPixelNear(Sample(sorted, 0.75), {0.5, 1, 0.5, 1}, 1e-7);
 
-    // Enough stops that a sort which is not stable would reorder them: stop k
-    // sits at position k % 3 and carries k in its red channel.
+    // Enough stops that a sort which is not stable would reorder them: stop k sits at position k % 3 and carries k in
+    // its red channel.
     Stops stops;
     for (int k = 0; k < 60; ++k) stops.push_back({static_cast<double>((59 - k) % 3), static_cast<float>(k), 0, 0});
     const Gradient stable(stops);

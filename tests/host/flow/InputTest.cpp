@@ -16,8 +16,8 @@ namespace {
 
 using Names = std::vector<std::string>;
 
-/// A tool with one input of each kind the tests need. Its "Value" output is
-/// the number that reached Process through the input named by `watch`.
+/// A tool with one input of each kind the tests need. Its "Value" output is the number that reached Process through the
+/// input named by `watch`.
 class KnobsTool : public ThreadedOperator {
 public:
     KnobsTool(const Registry *reg, const ScriptVal &args, const TagList &tags) : ThreadedOperator(reg, args, tags) {
@@ -217,8 +217,8 @@ TEST_F(InputTest, NotifyChangedHearsFirstValuesAndChangesOfNotifyingInputsButNev
     EXPECT_TRUE(b->processCount == 3 && a->heard.empty() && b->heard.empty());
 }
 
-// Text as typed on a command line: script syntax where it parses, text as it stands for inputs that take text,
-// a link only to a tool that exists.
+// Text as typed on a command line: script syntax where it parses, text as it stands for inputs that take text, a link
+// only to a tool that exists.
 TEST_F(InputTest, TextBecomesTheValueTheInputTakes) {
     std::string read;
     for (const std::string set :

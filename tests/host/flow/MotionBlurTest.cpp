@@ -17,10 +17,9 @@ namespace Orvane::motionblurtest {
 namespace ts = ::Orvane::Test;
 namespace {
 
-/// A 16 x 4 float frame with a bar two pixels wide and two high whose left
-/// edge is at x = floor(4 t): pixels (t, 1, 0.5, 1) inside, canvas colour
-/// (0, 0, 0, t / 10) outside. With an input it passes that on instead. It
-/// records the times of its pixel requests, and fails after `failAfter`.
+/// A 16 x 4 float frame with a bar two pixels wide and two high whose left edge is at x = floor(4 t): pixels (t, 1,
+/// 0.5, 1) inside, canvas colour (0, 0, 0, t / 10) outside. With an input it passes that on instead. It records the
+/// times of its pixel requests, and fails after `failAfter`.
 class MovingBar : public ThreadedOperator {
 public:
     MovingBar(const Registry *reg, const ScriptVal &args, const TagList &tags, bool withInput = false)
@@ -207,8 +206,8 @@ TEST_F(MotionBlur, OffOneSampleOrAClosedShutterIsTheFrameItself) {
 }
 
 TEST_F(MotionBlur, EveryDepthAveragesAnAnimatedBackground) {
-    // Red rises to 1 at frame 10 and falls to 0.25 at 20 (a kink at the
-    // frame asked); green falls steadily; alpha rises from 0.5 to 1.
+    // Red rises to 1 at frame 10 and falls to 0.25 at 20 (a kink at the frame asked); green falls steadily; alpha rises
+    // from 0.5 to 1.
     Operator *bg = doc->AddTool(OvID("Background"), "BG");
     ASSERT_NE(bg, nullptr);
     ts::SetNumbers(bg, {{"Width", 5}, {"Height", 3}});
@@ -247,8 +246,8 @@ TEST_F(MotionBlur, EveryDepthAveragesAnAnimatedBackground) {
 }
 
 TEST_F(MotionBlur, APendingTransformIsMadeIntoPixelsBeforeAveraging) {
-    // A Transform whose centre moves hands on a pending transform; blurred,
-    // it gives the mean of its own sharp frames at the sample times.
+    // A Transform whose centre moves hands on a pending transform; blurred, it gives the mean of its own sharp frames
+    // at the sample times.
     ts::ImageSourceTool *src = ts::AddImageSource(*doc, "Src", ts::PatternImage(24, 10, DepthRGBAFlt32, 7));
     Operator *xf = doc->AddTool(OvID("Transform"), "Xf");
     ASSERT_TRUE(xf && !xf->IsPlaceholder() && xf->FindMainInput(1)->ConnectTo(src->Out()));
@@ -297,10 +296,9 @@ TEST_F(MotionBlur, TheOutermostShutterDecidesAndTheCostStaysLinear) {
 TEST_F(MotionBlur, CachedResultsOfSamplesAndFramesStayApart) {
     MovingBar *bar = AddBar(C().bar, "Bar");
     SetBlur(bar, 2, 360, 0, 1); // samples at t - 0.25 and t + 0.25
-    // Frame 0.75 renders a sharp sample at 1.0, frame 1.0 a blurred frame at
-    // the same time: neither may stand in for the other, in either order.
-    // At x = 4: the bar of 0.5 ends at 4, the bars of 0.75, 1.0 and 1.25
-    // start at 3, 4 and 5.
+    // Frame 0.75 renders a sharp sample at 1.0, frame 1.0 a blurred frame at the same time: neither may stand in for
+    // the other, in either order. At x = 4: the bar of 0.5 ends at 4, the bars of 0.75, 1.0 and 1.25 start at 3, 4 and
+    // 5.
     for (int pass = 0; pass < 2; ++pass) {
         for (const auto &[t, red, dw] : {std::tuple{0.75, (0.0 + 1.0) / 2, ImgRectI(2, 1, 6, 3)},
                                          std::tuple{1.0, (0.75 + 0.0) / 2, ImgRectI(3, 1, 7, 3)}}) {
