@@ -49,7 +49,6 @@ TEST(RefHandle, CountsEveryHandleAndDeletesWithTheLast) {
     Ref<Counted> shared(raw);      // shares: adds one
     raw->Recycle();                // the maker lets go of its own
     EXPECT_EQ(raw->RefCount(), 1);
-
     Ref<Counted> a = MakeRef<Counted>(1); // the maker's reference, adopted
     Counted *p = a.Get();
     {
@@ -70,7 +69,6 @@ TEST(RefHandle, CountsEveryHandleAndDeletesWithTheLast) {
     EXPECT_EQ(p->RefCount(), 1);
     a = MakeRef<Counted>(2); // assigning over the last reference deletes the old object
     EXPECT_EQ(aliveCount, 2);
-
     Ref<DerivedCounted> derived = MakeRef<DerivedCounted>(9);
     {
         Ref<Counted> base = derived; // converting copy: shares
@@ -84,7 +82,6 @@ TEST(RefHandle, CountsEveryHandleAndDeletesWithTheLast) {
     Ref<Counted> empty;
     empty.Reset(); // no-op on an empty handle
     EXPECT_TRUE(empty == Ref<Counted>(static_cast<Counted *>(nullptr)));
-
     // Attributes: later values win, earlier ones stay, and text is the object's own.
     Ref<Counted> obj = MakeRef<Counted>();
     std::string label = "label text";
@@ -225,7 +222,6 @@ TEST(ScriptInfoTypes, DerivationFollowsTheRecordedLinks) {
     EXPECT_EQ(derives(), "1000 0100 0110 0001 ");
     ClearTypeInfo(typeid(TypeLeaf));
     EXPECT_EQ(derives(), "1000 0100 0010 0001 ");
-
     // A loop in the records ends the search instead of spinning.
     SetTypeInfo(typeid(TypeCycleA), typeid(TypeCycleB));
     SetTypeInfo(typeid(TypeCycleB), typeid(TypeCycleA));
@@ -301,7 +297,6 @@ TEST(ParallelJobs, NestedJobsAndJobsFromManyThreadsCompleteAndOneWorkerIsTheCall
         for (int rep = 0; rep < 10; ++rep) ParallelRange(0, N, count, 16);
     });
     for (const auto &row : hits) EXPECT_EQ(Wrong(row, 10), 0) << "from many threads";
-
     // One worker runs in the calling thread.
     SetWorkerCount(1);
     const std::thread::id caller = std::this_thread::get_id();

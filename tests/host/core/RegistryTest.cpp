@@ -141,7 +141,6 @@ TEST(RegistryNew, FactoriesMakeObjects) {
     const Registry *failing = l.Add("RegTestFailing", {{RegConstructor, &MakeNothing}});
     const Registry *abstract = l.Add("RegTestAbstract", {});
     EXPECT_TRUE(made->CanCreate() && failing->CanCreate() && !abstract->CanCreate());
-
     std::unique_ptr<Object> obj(made->New(ScriptVal(42.0), TagList()));
     auto *w = dynamic_cast<Widget *>(obj.get());
     ASSERT_NE(w, nullptr);
@@ -150,7 +149,6 @@ TEST(RegistryNew, FactoriesMakeObjects) {
     ASSERT_NE(dynamic_cast<Widget *>(viaNewObj.get()), nullptr);
     EXPECT_EQ(dynamic_cast<Widget *>(viaNewObj.get())->arg, 7.0);
     EXPECT_FALSE(failing->New(ScriptVal(), TagList()) || abstract->New(ScriptVal(), TagList()));
-
     // The list's New finds the class and passes the document on.
     int marker = 0;
     auto *doc = reinterpret_cast<OrvaneDoc *>(&marker); // only carried, never used
@@ -179,7 +177,6 @@ TEST(RegistryInit, RefusedRowsAreDisabled) {
     EXPECT_TRUE(!l.Find("RegTestNo") && !l.Find("RegTestOldNo") && l.Find("RegTestYes") == yes);
     EXPECT_FALSE(no->New(ScriptVal(), TagList()) || l.list->New(OvID("RegTestNo"), 0, nullptr));
     EXPECT_EQ(l.list->Size(), 2u);
-
     // Rows entered after InitAll start at once.
     hookLog.clear();
     EXPECT_TRUE(l.Add("RegTestLate", {{RegInitFunc, &AcceptInit}})->IsEnabled());
@@ -224,13 +221,11 @@ TEST(RegistryRemove, TakesRowsOut) {
     for (const char *gone : {"RegTestRemB", "RegTestRemOldB", "RegTestRemOldB2"})
         EXPECT_EQ(l.Find(gone), nullptr) << gone;
     EXPECT_TRUE(l.Find("RegTestRemOldA") == a && l.Find("RegTestRemOldC") == c);
-
     // A row that is not in this list is ignored.
     LocalList other;
     const Registry *foreign = other.Add("RegTestRemForeign", {});
     l.list->Remove(foreign);
     EXPECT_TRUE(l.list->Size() == 2u && other.Find("RegTestRemForeign") == foreign);
-
     // A second row with the same ID hides the first until it is removed.
     const Registry *shadow = l.Add("RegTestRemA", {});
     EXPECT_EQ(l.Find("RegTestRemA"), shadow);

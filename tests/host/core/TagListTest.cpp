@@ -130,7 +130,6 @@ TEST(TagListSet, ReplacesOrAppendsAndRepeatedTagsAddUp) {
     l.Add({IntTag, 20});
     l.Set({IntTag, 30});
     EXPECT_EQ(Texts(l.FindAll(IntTag)), (std::vector<std::string>{"30", "20"}));
-
     TagList r;
     for (const char *s : {"a", "b", "a", "c"}) r.Set({RepTextTag, s});
     r.Add({IntTag, 5}); // other tags between keep nothing from FindAll
@@ -155,7 +154,6 @@ TEST(TagListMerge, SetsEveryPairOfTheOtherAndRemoveTakesEveryEntry) {
               std::tuple(3, 4.0, "keep"));
     EXPECT_EQ(Texts(base.FindAll(RepTextTag)), (std::vector<std::string>{"x", "y", "z"}));
     EXPECT_EQ(other.Size(), 5u); // the source is left as it was
-
     base.Add({IntTag, 8});
     EXPECT_TRUE(base.Remove(IntTag) && base.Remove(RepTextTag) && !base.Remove(RepTextTag));
     const std::vector<Tag> left = {TextTag, DblTag, IntTag2};
@@ -182,7 +180,6 @@ TEST(TagListArray, ZeroEndedPairsAreCopied) {
               std::tuple(-12, 0.25, label)); // text borrowed without copyText
     EXPECT_EQ(Texts(l.FindAll(RepTextTag)), (std::vector<std::string>{"r1", "r2"}));
     EXPECT_TRUE(TagList(static_cast<const uint64_t *>(nullptr)).Empty());
-
     // With copyText, the text is the list's own.
     char buffer[] = "temporary";
     const uint64_t withText[] = {TextTag, reinterpret_cast<uint64_t>(buffer), 0};
@@ -209,7 +206,6 @@ TEST(TagListPersist, TextSurvivesTheSourceAndCopiesOutliveTheOriginal) {
     for (char *s : {text, icon, rep1, rep2}) std::memset(s, '#', std::strlen(s));
     idText.assign(40, '#');
     original.reset(); // storage now held by the copies alone
-
     for (TagList *l : {&copy, &assigned, &merged}) {
         EXPECT_EQ(Texts(l->FindAll(RepTextTag)), (std::vector<std::string>{"rep-one", "rep-two"}));
         EXPECT_EQ(std::tuple(std::string(l->GetText(TextTag)), std::string(l->GetText(IconTag)), l->GetID(IdTag)),

@@ -123,7 +123,6 @@ TEST(AnimCurve, TheDocumentFormRoundTripsAndMalformedFormsAreRefused) {
     points.SetKey(2, MakeRef<Point>(1e6, 0.1));
     ASSERT_TRUE(ReadCurve(points.ToScript().ToText(), CLSID_DataType_Point, pointsBack));
     EXPECT_EQ(pointsBack.ToScript(), points.ToScript());
-
     // No key, a key without value, a time that is no number, a value of the wrong type, unknown interpolations, another
     // class, no class, no table.
     for (const char *text : {"Curve { }", "Curve { { 0 } }", "Curve { { \"a\", 1 } }", "Curve { { 0, \"x\" } }",

@@ -43,7 +43,6 @@ TEST(ResultCache, FindsOnlyWhatWasStoredUnderTheSameKeyAndRegionsOnlyWhatTheyCov
         EXPECT_FALSE(cache.Find(k, Whole));
     EXPECT_EQ(cache.Entries(), 1u);
     EXPECT_EQ(std::pair(cache.GetStats().hits, cache.GetStats().misses), std::pair(size_t(1), size_t(4)));
-
     // The same region, one inside, one reaching out, a disjoint one, the whole frame.
     cache.Store(Key(o.a, 2.0), Region(2, 2, 10, 8), img);
     for (const auto &[region, served] : {std::pair{Region(2, 2, 10, 8), true},
@@ -64,13 +63,11 @@ TEST(ResultCache, AWholeFrameResultServesAllAndReplacesRegionResults) {
     EXPECT_EQ(cache.Find(Key(o.a), Region(1, 1, 3, 3)).Get(), left.Get());
     EXPECT_EQ(cache.Find(Key(o.a), Region(5, 1, 7, 3)).Get(), right.Get());
     EXPECT_FALSE(cache.Find(Key(o.a), Region(3, 1, 5, 3))) << "no one region covers this";
-
     cache.Store(Key(o.a), Whole, whole);
     EXPECT_EQ(std::pair(cache.Entries(), cache.Bytes()), std::pair(size_t(2), whole->SizeOf() + left->SizeOf()));
     for (const auto &asked : {Whole, Region(1, 1, 3, 3), Region(5, 1, 7, 3), Region(-50, -50, 50, 50)})
         EXPECT_EQ(cache.Find(Key(o.a), asked).Get(), whole.Get());
     EXPECT_EQ(cache.Find(Key(o.b), Region(0, 0, 4, 8)).Get(), left.Get());
-
     // A larger region replaces the regions it holds, not the others.
     ResultCache regions;
     Ref<Parameter> big = Img(6, 6);
@@ -95,7 +92,6 @@ TEST(ResultCache, EvictsLeastRecentlyUsedBeyondTheBudget) {
     EXPECT_EQ(std::pair(cache.Entries(), cache.Bytes()), std::pair(size_t(2), 2 * one));
     for (int t = 0; t < 3; ++t) EXPECT_EQ(bool(cache.Find(Key(o.a, t), Whole)), t != 1) << t;
     EXPECT_EQ(cache.GetStats().evictions, 1u);
-
     // A smaller budget evicts at once, oldest first; a value larger than the whole budget is not kept.
     cache.SetBudget(one + one / 2);
     EXPECT_EQ(std::pair(cache.Entries(), cache.Bytes()), std::pair(size_t(1), one));
@@ -119,7 +115,6 @@ TEST(ResultCache, StoringTheSameKeyAgainReplacesAndForgetDropsOneOutputsEntries)
     cache.Store(Key(o.a), Whole, second);
     cache.Store(Key(o.a, 1), Whole, nullptr); // nothing to keep
     EXPECT_EQ(std::pair(cache.Entries(), cache.Bytes()), std::pair(size_t(1), second->SizeOf()));
-
     cache.Store(Key(o.a, 1), Region(0, 0, 2, 2), first);
     cache.Store(Key(o.a, 1), Region(5, 5, 6, 6), first);
     cache.Store(Key(o.b, 0), Whole, y);

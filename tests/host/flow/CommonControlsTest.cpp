@@ -151,7 +151,6 @@ void RunMix(const MixCase &c) {
     for (int ch = 0; ch < 4; ++ch) ts::SetNumber(tool, ("Process" + Channels[ch]).c_str(), c.process[ch]);
     ts::SetNumbers(tool, {{"Blend", c.blend}, {"EffectMaskChannel", c.channel}});
     ts::SetNumbers(tool, {{"EffectMaskInvert", c.invert}, {"MultiplyByMask", c.multiply}});
-
     Ref<Image> out = ts::EvalImage(tool, 0.0, c.roi ? &*c.roi : nullptr);
     ASSERT_TRUE(out);
     EXPECT_EQ(ts::ConsoleText(*doc), "");

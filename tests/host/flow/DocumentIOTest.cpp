@@ -135,7 +135,6 @@ TEST(DocumentIO, SaveLoadSaveGivesTheSameBytesAndRestoresWhatWasSaved) {
     doc->SetGlobalRange(-10, 250.5);
     doc->SetRenderRange(12, 48);
     ExpectStableRoundTrip(*doc);
-
     Ref<OrvaneDoc> back = MakeRef<OrvaneDoc>();
     ASSERT_TRUE(Load(SaveDocument(*doc), *back).ok);
     Operator *c2 = back->FindTool("Const1"), *a2 = back->FindTool("Anim1"), *src2 = back->FindTool("Src");
@@ -370,7 +369,6 @@ TEST(DocumentIO, LenientLoadingKeepsWhatItDoesNotKnowAndWritesItBack) {
     EXPECT_EQ(r.warnings.size(), 6u) << Joined(r.warnings); // Layout, FuturePref, FancyThing, Bogus, two links
     EXPECT_TRUE(!doc->FindTool("Mystery1") && doc->GetPrefLong(PREF_FFWidth) == 1280);
     EXPECT_EQ(doc->FindTool("A1")->FindInput("Input")->UnresolvedLink(), "Mystery1.Output");
-
     const std::string saved = SaveDocument(*doc);
     const ScriptVal source = ScriptVal::FromText(text), root = ScriptVal::FromText(saved), a1 = ToolIn(saved, "A1");
     EXPECT_EQ(root.Find("Layout")->ToText(), source.Find("Layout")->ToText());
@@ -443,7 +441,6 @@ TEST(DocumentIO, SavingReplacesAFileWholeOrLeavesWhatWasThereAndOnlyFilesAreRead
     const DocumentLoadResult r = LoadDocumentFile(target, *back);
     ASSERT_TRUE(r.ok) << r.error;
     EXPECT_EQ(SaveDocument(*back), SaveDocument(*doc));
-
     // Failed saves, under a plain file and onto a folder, leave both as they were.
     fs::remove(target);
     WriteFile(dir / "plain", "not a folder");
@@ -453,7 +450,6 @@ TEST(DocumentIO, SavingReplacesAFileWholeOrLeavesWhatWasThereAndOnlyFilesAreRead
     EXPECT_FALSE(SaveDocumentFile(*doc, dir / "taken", error));
     EXPECT_EQ(ReadFile(dir / "plain") + ReadFile(dir / "taken/inside"), "not a folderkeep");
     EXPECT_EQ(entries(), (std::set<std::string>{"plain", "taken"})) << "no temporary file remains";
-
     // Reading: a missing file, a folder, and a FIFO with no writer (which must not wait for one).
     ASSERT_EQ(mkfifo((dir / "pipe").c_str(), 0600), 0);
     for (const auto &[name, says] : {std::pair{"absent.orv", "cannot open"}, std::pair{"taken", "not a regular file"},
@@ -463,7 +459,6 @@ TEST(DocumentIO, SavingReplacesAFileWholeOrLeavesWhatWasThereAndOnlyFilesAreRead
                      failed.error.find(name) == std::string::npos)
             << failed.error;
     }
-
     // Into a read-only folder (folder permissions do not bind the superuser).
     if (geteuid() == 0) return;
     WriteFile(target, "the old document");

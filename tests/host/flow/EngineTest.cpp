@@ -45,7 +45,6 @@ struct Seen {
 class Probe : public ThreadedOperator {
 public:
     using ThreadedOperator::ThreadedOperator;
-
     Seen Snapshot(const Request *req) const {
         Seen s{.pri = req->GetPri(), .precalc = req->IsPreCalc()};
         for (const Input *in : watched) {
@@ -59,20 +58,17 @@ public:
             std::tie(s.inputNoData, s.inputWindow) = std::pair(img->IsNoData(), img->DataWindow());
         return s;
     }
-
     void CheckRequest(Request *req) override {
         ThreadedOperator::CheckRequest(req);
         checks[req->IsPreCalc()].push_back(Snapshot(req));
         if (onCheck) onCheck(*this, req);
     }
-
     void Process(Request *req) override {
         calls.push_back(Snapshot(req));
         if (!req->IsPreCalc()) seenInput = Ref<Image>(dynamic_cast<Image *>(req->GetInputData(input)));
         if (onProcess) return onProcess(*this, req);
         MakeOutput(req);
     }
-
     /// The tool's own work: a fixed colour function of the main input (or of Late when Input was dropped) over the
     /// input's data window and region.
     void MakeOutput(Request *req) {
@@ -97,14 +93,12 @@ public:
         }
         req->SetOutputData(output, img.Get());
     }
-
     static FltPixel Color(const FltPixel &p, float gain) {
         return {p.R * gain + 0.125f, std::sqrt(std::fabs(p.G)), p.B * p.A, p.A};
     }
     long PixelCalls() const {
         return std::count_if(calls.begin(), calls.end(), [](auto &s) { return !s.precalc; });
     }
-
     Input *last = ts::AddIn(this, "Last", CLSID_DataType_Number, {{InputPriority, PriorityLast}});
     Input *input = ts::AddImageIn(this);
     Input *amount = ts::AddIn(this, "Amount", CLSID_DataType_Number, {{InputDefault, 0.5}});

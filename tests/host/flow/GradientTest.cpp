@@ -93,7 +93,6 @@ TEST(Gradient, StopsAreSortedStablyAndRepeatedPositionsMakeHardEdges) {
     for (int i = 0; i < 3; ++i) EXPECT_EQ(sorted.Stops()[i].position, 0.5 * i);
     ts::ExpectPixelNear(Sample(sorted, 0.25), {0, 0.5, 0, 1}, 1e-7);
     ts::ExpectPixelNear(Sample(sorted, 0.75), {0.5, 1, 0.5, 1}, 1e-7);
-
     // Enough stops that a sort which is not stable would reorder them: stop k sits at position k % 3 and carries k in
     // its red channel.
     Stops stops;
@@ -105,7 +104,6 @@ TEST(Gradient, StopsAreSortedStablyAndRepeatedPositionsMakeHardEdges) {
         ASSERT_TRUE(prev.position < cur.position || (prev.position == cur.position && prev.r < cur.r)) << i;
     }
     EXPECT_EQ(Sample(stable, 1.0).R, 58.0f) << "the last stop given at a position wins there";
-
     // Given out of order, the two stops at 0.5 keep their order: red, then blue.
     const Gradient edge({{1, 1, 1, 1}, {0.5, 1, 0, 0}, {0, 0, 0, 0}, {0.5, 0, 0, 1}});
     const Gradient ends({{0, 1, 0, 0}, {0, 0, 1, 0}, {1, 0, 0, 1}, {1, 1, 1, 1}});
@@ -128,7 +126,6 @@ TEST(Gradient, OpaqueEqualsHashAndCopy) {
     for (const Stops &clear :
          {Stops{{0, 0, 0, 0, 1}, {1, 1, 1, 1, 0.999}}, Stops{{0, 0, 0, 0, 0}, {1, 1, 1, 1, 1}}, Stops{}})
         EXPECT_FALSE(Gradient(clear).IsOpaque());
-
     const Stops stops{{0, 0.1, 0.2, 0.3}, {0.5, 1, 0, 0}, {0.5, 0, 0, 1}};
     const Gradient a(stops);
     EXPECT_TRUE(a.Equals(Gradient(stops)) && a.Hash() == Gradient(stops).Hash());
@@ -154,7 +151,6 @@ TEST(Gradient, InterpolateBlendsMatchingStopsOrTakesTheNearer) {
     ts::ExpectPixelNear(Color(mid->Stops()[0]), {0.25, 0, 0, 0.75}, 1e-7);
     ts::ExpectPixelNear(Color(mid->Stops()[1]), {0.75, 0.75, 1, 1}, 1e-7);
     EXPECT_TRUE(from->Interpolate(*to, 0.0)->Equals(*from) && from->Interpolate(*to, 1.0)->Equals(*to));
-
     // Stops that do not match: the nearer gradient, whole.
     Ref<Gradient> moved = MakeRef<Gradient>(Stops{{0, 1, 0, 0}, {0.5, 0, 0, 1}});
     Ref<Gradient> more = MakeRef<Gradient>(Stops{{0, 1, 0, 0}, {0.5, 0, 1, 0}, {1, 0, 0, 1}});
@@ -169,7 +165,6 @@ TEST(Gradient, ScriptFormRoundTrips) {
     EXPECT_EQ(Gradient().ToScript(), ScriptVal::FromText(defaultText));
     Ref<Gradient> read = Gradient::FromScript(ScriptVal::FromText(defaultText));
     EXPECT_TRUE(read && read->Equals(Gradient()));
-
     const Gradient grad({{-0.25, 0.1, 0.2, 0.3, 0.4},
                          {0.5, 1, 0, 0},
                          {0.5, 0, 0, 1, 0.75},
@@ -196,7 +191,6 @@ TEST(Gradient, ScriptReadingIsLenientWhereHarmlessAndRefusesTheMalformed) {
     EXPECT_TRUE(g && g->Equals(Gradient({{0, 0, 1, 0, 0.5}, {1, 1, 0, 0, 1}})));
     Ref<Gradient> empty = Gradient::FromScript(ScriptVal::FromText("Gradient { Colors = {} }"));
     EXPECT_TRUE(empty && empty->Stops().empty());
-
     // Not a table; no colours or no table of them; another class; keys that are no finite position; colours of the
     // wrong size, type or shape.
     for (const char *text :

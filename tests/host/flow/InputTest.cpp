@@ -122,7 +122,6 @@ TEST_F(InputTest, DefaultsComeFromTheTagsAndIsDefaultTracksThem) {
         defaults += a->FindInput(id)->Constant()->ToScript().ToText() + " ";
     }
     EXPECT_EQ(defaults, "0 { 0.5, 0.25 } \"hello\" \"ModeB\" 3 ");
-
     Input *hidden = a->FindInput("Hidden");
     ASSERT_TRUE(hidden->SetValue(MakeRef<Number>(2.0)));
     EXPECT_FALSE(hidden->IsDefault());
@@ -162,7 +161,6 @@ TEST_F(InputTest, LinksCheckTypesRefuseLoopsAndGoWithANewValue) {
     EXPECT_EQ(a->FindOutput("Output")->Consumers(),
               (std::vector<Input *>{b->FindInput("Input"), c->FindInput("Input")}));
     EXPECT_TRUE(b->FindOutput("Output")->Consumers().empty()) << "C's Input moved on to A";
-
     // Disconnect and SetValue drop a link.
     Input *hard = b->FindInput("Hard");
     ASSERT_TRUE(hard->ConnectTo(c->FindOutput("Value")));
@@ -170,7 +168,6 @@ TEST_F(InputTest, LinksCheckTypesRefuseLoopsAndGoWithANewValue) {
     hard->Disconnect();
     EXPECT_TRUE(hard->Link() == nullptr && c->FindOutput("Value")->Consumers().empty() && hard->IsDefault());
     hard->Disconnect(); // again: nothing happens
-
     ASSERT_TRUE(hard->ConnectTo(c->FindOutput("Value")));
     ASSERT_TRUE(hard->SetValue(MakeRef<Number>(6.0)));
     EXPECT_TRUE(hard->Link() == nullptr && c->FindOutput("Value")->Consumers().empty());
@@ -209,7 +206,6 @@ TEST_F(InputTest, NotifyChangedHearsFirstValuesAndChangesOfNotifyingInputsButNev
     notified->ResetValue();                                              // heard with the default
     EXPECT_FALSE(notified->SetValue(MakeRef<Text>("x"))) << "a value refused changes nothing and is not heard";
     EXPECT_EQ(a->heard, (Names{"Notified 2.5", "Quiet -1", "Notified 4", "Notified 1"}));
-
     ASSERT_TRUE(b->FindInput("Notified")->ConnectTo(a->FindOutput("Value")));
     b->watch = "Notified";
     a->heard.clear(), b->heard.clear();

@@ -32,7 +32,6 @@ public:
     static FltPixel Inside(double t) { return {static_cast<float>(t), 1.f, 0.5f, 1.f}; }
     static FltPixel Canvas(double t) { return {0.f, 0.f, 0.f, static_cast<float>(t / 10)}; }
     static FltPixel At(double t, int x, int y) { return Window(t).Contains(x, y) ? Inside(t) : Canvas(t); }
-
     void Process(Request *req) override {
         const double t = req->Time();
         if (!req->IsPreCalc()) {
@@ -285,7 +284,6 @@ TEST_F(MotionBlur, TheOutermostShutterDecidesAndTheCostStaysLinear) {
     // The tool above renders sharp at the outer sample times, once each.
     ExpectTimes(bar->times, outer);
     for (uint32_t f : bar->flags) EXPECT_NE(f & (1u << 20), 0u);
-
     // With the downstream tool's blur off, the upstream blurs by itself.
     ts::SetNumber(pass, "MotionBlur", 0);
     bar->times.clear();
