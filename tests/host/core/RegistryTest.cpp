@@ -60,13 +60,9 @@ TEST(RegistryFind, ByIdAndByOldIdsInRegistrationOrder) {
     Registry *b = l.Add("RegTestB", {{RegOldClassId, "RegTestA2"}});
     Registry *c = l.Add("RegTestA2", {});
     const std::pair<const char *, const Registry *> cases[] = {
-        {"RegTestA", a},
-        {"RegTestOldA", a},
-        {"RegTestOlderA", a},
-        {"RegTestB", b},
-        {"RegTestA2", c}, // a class ID comes before another's old ID
-        {"RegTestMissing", nullptr},
-    };
+        {"RegTestA", a}, {"RegTestOldA", a}, {"RegTestOlderA", a},
+        {"RegTestB", b}, {"RegTestA2", c},   {"RegTestMissing", nullptr},
+    }; // RegTestA2: a class ID comes before another's old ID
     for (const auto &[id, row] : cases) EXPECT_EQ(l.Find(id), row) << id;
     EXPECT_EQ(l.list->Find(OvID()), nullptr);
     // Rows list in registration order, whatever their names and hashes.
