@@ -26,6 +26,12 @@ std::vector<std::string> Texts(const std::vector<const TagItem *> &items) {
     return v;
 }
 
+std::vector<Tag> TagsOf(const TagList &l) {
+    std::vector<Tag> tags;
+    for (const TagItem &i : l.Items()) tags.push_back(i.tag);
+    return tags;
+}
+
 int Triple(int v) { return 3 * v; }
 
 TEST(TagKinds, TopNibbleAndBytesGiveTheKindAndDomain) {
@@ -116,49 +122,31 @@ TEST(TagListGet, TypedGettersReadTheFirstEntryOrTheDefault) {
     EXPECT_FALSE(zeroes.GetBool(IntTag, true) || zeroes.GetBool(DblTag, true));
 }
 
-TEST(TagListSet, ReplacesOrAppendsAndRepeatedTagsAddUp) {
-    TagList l{{IntTag, 1}, {TextTag, "one"}, {IntTag2, 2}};
-    l.Set({TextTag, "two"}); // replaced in place
-    l.Set({DblTag, 0.5});    // absent: appended
-    l.Set({IntTag, 10});
-    const std::vector<Tag> order{IntTag, TextTag, IntTag2, DblTag};
-    ASSERT_EQ(l.Size(), order.size());
-    for (size_t i = 0; i < order.size(); ++i) EXPECT_EQ(l.Items()[i].tag, order[i]) << i;
-    EXPECT_EQ(l.GetLong(IntTag), 10);
-    EXPECT_STREQ(l.GetText(TextTag), "two");
-    // With two entries of one tag (added with Add), Set replaces only the first.
-    l.Add({IntTag, 20});
-    l.Set({IntTag, 30});
-    EXPECT_EQ(Texts(l.FindAll(IntTag)), (std::vector<std::string>{"30", "20"}));
-    TagList r;
-    for (const char *s : {"a", "b", "a", "c"}) r.Set({RepTextTag, s});
-    r.Add({IntTag, 5}); // other tags between keep nothing from FindAll
-    r.Set({RepIdTag, OvID("TagTestR1")});
-    r.Set({RepIdTag, OvID("TagTestR2")});
-    r.Set({IconTag, "icon1"});
-    r.Set({IconTag, "icon2"});
-    EXPECT_EQ(Texts(r.FindAll(RepTextTag)), (std::vector<std::string>{"a", "b", "a", "c"}));
-    EXPECT_EQ(Texts(r.FindAll(RepIdTag)), (std::vector<std::string>{"TagTestR1", "TagTestR2"}));
-    EXPECT_EQ(Texts(r.FindAll(IconTag)), (std::vector<std::string>{"icon1", "icon2"}));
-    EXPECT_TRUE(r.FindAll(TextTag).empty());
-}
-
-TEST(TagListMerge, SetsEveryPairOfTheOtherAndRemoveTakesEveryEntry) {
+// Merge sets every pair of the other list: in place, appended when absent, repeated tags adding up.
+TEST(TagListSet, MergeSetsEveryPairAndRemoveTakesEveryEntry) {
     TagList base{{IntTag, 1}, {TextTag, "keep"}, {RepTextTag, "x"}, {DblTag, 1.5}};
-    const TagList other{{DblTag, 4.0}, {IntTag2, 5}, {RepTextTag, "y"}, {RepTextTag, "z"}, {IntTag, 3}};
+    const TagList other{{DblTag, 4.0},
+                        {IntTag2, 5},
+                        {RepTextTag, "x"},
+                        {RepTextTag, "z"},
+                        {IntTag, 3},
+                        {IconTag, "i"},
+                        {RepIdTag, OvID("TagTestR")},
+                        {IconTag, "i"}};
     base.Merge(other);
-    const std::vector<Tag> order = {IntTag, TextTag, RepTextTag, DblTag, IntTag2, RepTextTag, RepTextTag};
-    ASSERT_EQ(base.Size(), order.size());
-    for (size_t i = 0; i < order.size(); ++i) EXPECT_EQ(base.Items()[i].tag, order[i]) << i;
+    EXPECT_EQ(TagsOf(base), (std::vector<Tag>{IntTag, TextTag, RepTextTag, DblTag, IntTag2, RepTextTag, RepTextTag,
+                                              IconTag, RepIdTag, IconTag}));
     EXPECT_EQ(std::tuple(base.GetLong(IntTag), base.GetDouble(DblTag), std::string(base.GetText(TextTag))),
               std::tuple(3, 4.0, "keep"));
-    EXPECT_EQ(Texts(base.FindAll(RepTextTag)), (std::vector<std::string>{"x", "y", "z"}));
-    EXPECT_EQ(other.Size(), 5u); // the source is left as it was
-    base.Add({IntTag, 8});
+    EXPECT_EQ(Texts(base.FindAll(RepTextTag)), (std::vector<std::string>{"x", "x", "z"}));
+    EXPECT_EQ(Texts(base.FindAll(RepIdTag)), std::vector<std::string>{"TagTestR"});
+    EXPECT_EQ(other.Size(), 8u); // the source is left as it was
+    // With two entries of one tag (added with Add), Set replaces only the first.
+    base.Add({IntTag, 20});
+    base.Set({IntTag, 30});
+    EXPECT_EQ(Texts(base.FindAll(IntTag)), (std::vector<std::string>{"30", "20"}));
     EXPECT_TRUE(base.Remove(IntTag) && base.Remove(RepTextTag) && !base.Remove(RepTextTag));
-    const std::vector<Tag> left = {TextTag, DblTag, IntTag2};
-    ASSERT_EQ(base.Size(), left.size());
-    for (size_t i = 0; i < left.size(); ++i) EXPECT_EQ(base.Items()[i].tag, left[i]) << i;
+    EXPECT_EQ(TagsOf(base), (std::vector<Tag>{TextTag, DblTag, IntTag2, IconTag, RepIdTag, IconTag}));
 }
 
 TEST(TagListArray, ZeroEndedPairsAreCopied) {
