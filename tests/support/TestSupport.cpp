@@ -39,14 +39,10 @@ Ref<Image> PatternImage(int w, int h, int depth, unsigned seed) {
     uint32_t state = seed * 2654435761u + 12345u;
     auto next = [&state] {
         state = state * 1664525u + 1013904223u;
-        return (state >> 8) * (1.0f / 16777216.0f);
+        return -0.25f + 1.75f * ((state >> 8) * (1.0f / 16777216.0f));
     };
-    for (int y = 0; y < h; ++y)
-        for (int x = 0; x < w; ++x) {
-            const float r = -0.25f + 1.75f * next(), g = -0.25f + 1.75f * next();
-            const float b = -0.25f + 1.75f * next(), a = -0.25f + 1.75f * next();
-            img->PutFlt(x, y, {r, g, b, a});
-        }
+    for (int y = 0; y < h; ++y) // a braced list evaluates its elements in order: R, G, B, A
+        for (int x = 0; x < w; ++x) img->PutFlt(x, y, {next(), next(), next(), next()});
     return img;
 }
 
@@ -67,11 +63,10 @@ std::string RectText(const ImgRectI &r) {
 
 std::string ConsoleText(const OrvaneDoc &doc) {
     std::string text;
-    for (const ConsoleLine &line : doc.ConsoleLines())
-        text += (line.code == ConsoleError     ? "error: "
-                 : line.code == ConsoleWarning ? "warning: "
-                                               : "") +
-                line.text + "\n";
+    for (const ConsoleLine &line : doc.ConsoleLines()) {
+        const char *kind = line.code == ConsoleError ? "error: " : line.code == ConsoleWarning ? "warning: " : "";
+        text += kind + line.text + "\n";
+    }
     return text;
 }
 
@@ -87,7 +82,7 @@ namespace {
 OvID RegisterToolWith(const char *id, ClassFactory make, const TagList &attrs) {
     if (ClassRegistry && ClassRegistry->Find(OvID(id))) return OvID(id);
     TagList tags{{RegConstructor, make}, {RegTypeFlags, static_cast<long long>(RegKindOperator | RegKindTool)}};
-    for (const TagItem &a : attrs.Items()) tags.Set(a);
+    tags.Merge(attrs);
     Registry::_Init(&ClassRegistry, OvID(id), tags);
     return OvID(id);
 }

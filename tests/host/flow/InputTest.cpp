@@ -76,7 +76,7 @@ protected:
     KnobsTool *a = Add("A"), *b = Add("B"), *c = Add("C");
 };
 
-// Constants and curve keys alike: the hard limits hold, the slider limits do not, whole inputs round.
+// Constants and curve keys alike; the slider limits do not bind.
 TEST_F(InputTest, HardLimitsClampAndWholeInputsRound) {
     auto stored = [&](const char *id, std::initializer_list<double> values) {
         std::string out;
@@ -175,7 +175,6 @@ TEST_F(InputTest, LinksCheckTypesRefuseLoopsAndGoWithANewValue) {
     EXPECT_TRUE(c->FindInput("Hard")->ConnectTo(b->FindOutput("Value")));
 }
 
-// Hidden inputs, inputs changed to hidden and internal inputs all deliver their values to renders.
 TEST_F(InputTest, AttributesChangeAtRunTimeAndHiddenAndInternalInputsStillDeliver) {
     Input *hidden = a->FindInput("Hidden"), *hard = a->FindInput("Hard"), *internal = a->FindInput("Internal");
     EXPECT_FALSE(hidden->IsVisible() || internal->IsExternal());
