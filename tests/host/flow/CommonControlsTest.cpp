@@ -67,22 +67,17 @@ TEST(CommonControls, ExistAsTheClassAsksFor) {
         Ref<OrvaneDoc> doc = MakeRef<OrvaneDoc>();
         Operator *op = doc->AddTool(cls, "T1");
         ASSERT_NE(op, nullptr);
-        for (int i = 0; i < 10; ++i)
-            EXPECT_EQ(op->FindInput(ids[i]) != nullptr, (has & (i < 5   ? HasBlend
-                                                                : i < 9 ? HasMask
-                                                                        : HasClipping)) != 0)
-                << ids[i];
-        EXPECT_EQ(op->Common().blend != nullptr, (has & HasBlend) != 0);
-        EXPECT_EQ(op->Common().effectMask != nullptr, (has & HasMask) != 0);
-        EXPECT_EQ(op->Common().clippingMode != nullptr, (has & HasClipping) != 0);
+        for (int i = 0; i < 10; ++i) // the first five are blend controls, the next four the mask's
+            EXPECT_EQ(!op->FindInput(ids[i]), !(has & (i < 5 ? HasBlend : i < 9 ? HasMask : HasClipping))) << ids[i];
+        const Operator::CommonInputs &common = op->Common();
+        EXPECT_EQ(std::tuple(!common.blend, !common.effectMask, !common.clippingMode),
+                  std::tuple(!(has & HasBlend), !(has & HasMask), !(has & HasClipping)));
         const Input *mask = op->FindInput("EffectMask"), *clip = op->FindInput("ClippingMode");
         EXPECT_TRUE(!mask || (mask->Priority() == PriorityMask && !mask->IsRequired() &&
                               mask->DataType() == CLSID_DataType_Mask));
         EXPECT_TRUE(!clip || dynamic_cast<const IDValue &>(*clip->Default()).value == ClippingMode_None);
     }
 }
-
-// ---- PostProcess -----------------------------------------------------------
 
 enum MaskKind { NoMask, RGBAMask, GreyRGBAMask, SingleChannelMask };
 

@@ -1,6 +1,7 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <cstring>
 #include <filesystem>
 #include <fstream>
 #include <set>
@@ -267,17 +268,14 @@ TEST(DocumentIO, ValuesAreCheckedAndChoicesTakenByName) {
             const DocumentLoadResult r = Load(text, *doc, lenient);
             EXPECT_EQ(r.ok, lenient || !*problem) << r.error;
             ASSERT_EQ(r.problems.size(), *problem ? 1u : 0u) << r.error << Joined(r.warnings);
-            if (*problem) {
-                const DocumentProblem &p = r.problems[0];
-                EXPECT_EQ(p.error, !lenient);
-                EXPECT_EQ(p.message.rfind(problem, 0), 0u) << p.message;
-                const size_t valueAt = text.find(value) + std::string(value).find('=') + 2;
-                EXPECT_EQ(std::pair(p.line, p.column), std::pair(2, static_cast<int>(valueAt - text.find('\n'))));
-            }
+            // A problem is an error only when loading strictly, and stands where the value starts.
+            const int column = static_cast<int>(text.find(value) + std::string(value).find('=') + 2 - text.find('\n'));
+            for (const DocumentProblem &p : r.problems)
+                EXPECT_EQ(std::tuple(p.error, p.message.substr(0, strlen(problem)), p.line, p.column),
+                          std::tuple(!lenient, std::string(problem), 2, column));
             if (!lenient || !*leniently) continue;
             const Input *in = doc->FindTool("A1")->FindInput(std::string(value, std::string(value).find(' ')).c_str());
-            ASSERT_TRUE(in->Constant());
-            EXPECT_EQ(in->Constant()->ToScript().ToText(), leniently);
+            EXPECT_EQ(in->Constant() ? in->Constant()->ToScript().ToText() : "none", leniently);
         }
     }
 }

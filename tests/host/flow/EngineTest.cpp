@@ -74,10 +74,7 @@ public:
     void MakeOutput(Request *req) {
         auto *src = dynamic_cast<Image *>(req->GetInputData(input));
         if (!src) src = dynamic_cast<Image *>(req->GetInputData(late));
-        if (!src) {
-            Fail(req, "%s: nothing to work on\n", Name().c_str());
-            return req->SetOutputData(output, nullptr);
-        }
+        if (!src) return req->SetOutputData(output, nullptr);
         const float gain = static_cast<float>(dynamic_cast<const Number &>(*req->GetInputData(amount)).value);
         ImgRectI dw = src->DataWindow();
         if (const AutoImageRoI roi(req); roi) dw &= roi->rect;
@@ -131,8 +128,7 @@ struct Doc {
     ts::ImageSourceTool *src = ts::AddImageSource(*doc, "Src", ts::PatternImage(12, 8));
     Probe *Add(const std::string &name, Output *from, OvID cls = C().probe) {
         auto *p = dynamic_cast<Probe *>(doc->AddTool(cls, name));
-        EXPECT_NE(p, nullptr);
-        EXPECT_TRUE(!p || !from || p->input->ConnectTo(from));
+        EXPECT_TRUE(p && (!from || p->input->ConnectTo(from)));
         return p;
     }
 };
