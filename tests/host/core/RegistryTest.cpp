@@ -54,7 +54,7 @@ bool LookupInit(Registry *reg) {
     return true;
 }
 
-TEST(RegistryFind, ByIdAndByOldIdsInRegistrationOrder) {
+TEST(RegistryFind, ByIdAndByOldIdsInRegistrationOrderAndEachRowKeepsItsOwnTags) {
     LocalList l;
     Registry *a = l.Add("RegTestA", {{RegOldClassId, "RegTestOldA"}, {RegOldClassId, "RegTestOlderA"}});
     Registry *b = l.Add("RegTestB", {{RegOldClassId, "RegTestA2"}});
@@ -71,10 +71,6 @@ TEST(RegistryFind, ByIdAndByOldIdsInRegistrationOrder) {
         expected.push_back(l.Add(("RegTestOrder" + std::to_string((i * 17) % 40)).c_str(), {})->ID().Text());
     EXPECT_EQ(l.Ids(), expected);
     EXPECT_EQ(l.list->Size(), 43u);
-}
-
-TEST(RegistryFind, RowKeepsItsOwnCopyOfTheTags) {
-    LocalList l;
     char name[] = "Display Name", word[] = "ClassWord";
     Registry *row = l.Add("RegTestCopy", {{RegName, name}, {RegClassName, word}, {RegTypeFlags, 5}});
     std::memset(name, '!', std::strlen(name));
@@ -87,7 +83,7 @@ TEST(RegistryFind, RowKeepsItsOwnCopyOfTheTags) {
     EXPECT_STREQ(l.Add("RegTestWorded", {{RegClassName, "Worded"}})->DisplayName(), "Worded");
 }
 
-TEST(RegistryTypes, LowBitsAndFamily) {
+TEST(RegistryTypes, LowBitsAndFamilyAndClassTypesFollowTheBaseChain) {
     LocalList l;
     const Registry *data = l.Add("RegTestData", {{RegTypeFlags, RegKindOperator | RegKindTool | RegFamilyDataType}});
     const Registry *plain = l.Add("RegTestPlain", {{RegTypeFlags, RegKindOperator | RegKindSource}});
@@ -109,11 +105,7 @@ TEST(RegistryTypes, LowBitsAndFamily) {
                 EXPECT_EQ(row->IsRegClassType(type), is);
                 EXPECT_EQ(l.list->Find(row->ID(), type), is ? row : nullptr);
             }
-}
-
-TEST(RegistryTypes, ClassTypeFollowsTheBaseChain) {
     static const OvID baseId("RegTestBase"), midId("RegTestMid"), foreignId("RegTestForeign");
-    LocalList l;
     const Registry *base = l.Add("RegTestBase", {});
     const Registry *mid = l.Add("RegTestMid", {{RegBaseClass, &baseId}});
     const Registry *leaf = l.Add("RegTestLeaf", {{RegBaseClass, &midId}});
@@ -121,13 +113,13 @@ TEST(RegistryTypes, ClassTypeFollowsTheBaseChain) {
     EXPECT_EQ(std::vector({base->Base(), mid->Base(), leaf->Base(), other->Base()}),
               std::vector<const Registry *>({nullptr, base, mid, nullptr}));
     EXPECT_TRUE(other->BaseID() == foreignId && base->BaseID().IsNull());
-    const std::tuple<const Registry *, const char *, bool> cases[] = {
+    const std::tuple<const Registry *, const char *, bool> chain[] = {
         {leaf, "RegTestLeaf", true},       {leaf, "RegTestMid", true},      {leaf, "RegTestBase", true},
         {leaf, "RegTestOtherLeaf", false}, {mid, "RegTestBase", true},      {mid, "RegTestLeaf", false},
         {base, "RegTestBase", true},       {base, "RegTestMid", false},     {other, "RegTestForeign", true},
         {other, "RegTestBase", false},     {leaf, "RegTestUnknown", false},
     };
-    for (const auto &[row, id, is] : cases)
+    for (const auto &[row, id, is] : chain)
         EXPECT_EQ(row->IsClassType(OvID(id)), is) << row->ID().Text() << " is " << id;
 }
 

@@ -68,7 +68,7 @@ TEST(ScriptValValue, Equality) {
         EXPECT_EQ(std::pair(a == b, b != a), std::pair(equal, !equal)) << a.ToText() << " and " << b.ToText();
 }
 
-TEST(ScriptValTable, MisuseIsReported) {
+TEST(ScriptValTable, MisuseIsReportedAndTableOfMakesWhatSetMakesButRefusesRepeatedKeys) {
     for (const char *bad : {"", "1abc", "a..b", "a.", ".a", "a b", "end", "a.nil", "Tool-1", "\xc3\xbc"}) {
         EXPECT_THROW(ScriptVal::Ref(bad), std::invalid_argument) << bad;
         EXPECT_THROW(ScriptVal::Table(*bad ? bad : "-"), std::invalid_argument) << bad;
@@ -88,6 +88,23 @@ TEST(ScriptValTable, MisuseIsReported) {
     // Setting into nil makes a plain table.
     EXPECT_EQ(ScriptVal().Set("k", 1), Make({{"k", 1}}));
     EXPECT_EQ(ScriptVal().Append("x"), Make({{1, "x"}}));
+    const ScriptVal of = ScriptVal::TableOf("Point", {{1, "a"}, {2, "b"}, {"x", 2}, {"1", 3}, {false, 0}});
+    EXPECT_EQ(of, Make({{1, "a"}, {2, "b"}, {"x", 2}, {"1", 3}, {false, 0}}, "Point"));
+    EXPECT_TRUE(*of.At(2) == ScriptVal("b") && !of.At(3));
+    EXPECT_EQ(ScriptVal::TableOf({}, {{"x", 1}, {2, 2}, {1, 1}}).ArrayLength(), 2u);
+    for (const auto &[entries, message] : std::vector<std::pair<std::vector<ScriptVal::Entry>, std::string>>{
+             {{{"a", 1}, {"b", 2}, {"a", 3}}, "key \"a\" given twice"},
+             {{{0.0, 1}, {-0.0, 2}}, "key -0 given twice"},
+             {{{kNaN, 1}}, "invalid key or nil value"},
+             {{{ScriptVal::Table(), 1}}, "invalid key or nil value"},
+             {{{"a", ScriptVal()}}, "invalid key or nil value"}}) {
+        try {
+            ADD_FAILURE() << "accepted " << ScriptVal::TableOf({}, entries).ToText();
+        } catch (const std::invalid_argument &e) {
+            EXPECT_EQ(e.what(), "ScriptVal::TableOf: " + message);
+        }
+    }
+    EXPECT_THROW(ScriptVal::TableOf("not a name", {}), std::invalid_argument);
 }
 
 // Random edits checked against a plain list of entries kept by the test; copies taken on the way never change.
@@ -131,26 +148,6 @@ TEST(ScriptValTable, RandomEditsMatchAPlainModel) {
             ASSERT_EQ(snapshot.Entries(), snapshotModel) << "a copy changed with the original";
         }
     }
-}
-
-TEST(ScriptValTable, TableOfMakesWhatSetMakesAndRefusesRepeatedKeys) {
-    const ScriptVal t = ScriptVal::TableOf("Point", {{1, "a"}, {2, "b"}, {"x", 2}, {"1", 3}, {false, 0}});
-    EXPECT_EQ(t, Make({{1, "a"}, {2, "b"}, {"x", 2}, {"1", 3}, {false, 0}}, "Point"));
-    EXPECT_TRUE(*t.At(2) == ScriptVal("b") && !t.At(3));
-    EXPECT_EQ(ScriptVal::TableOf({}, {{"x", 1}, {2, 2}, {1, 1}}).ArrayLength(), 2u);
-    for (const auto &[entries, message] : std::vector<std::pair<std::vector<ScriptVal::Entry>, std::string>>{
-             {{{"a", 1}, {"b", 2}, {"a", 3}}, "key \"a\" given twice"},
-             {{{0.0, 1}, {-0.0, 2}}, "key -0 given twice"},
-             {{{kNaN, 1}}, "invalid key or nil value"},
-             {{{ScriptVal::Table(), 1}}, "invalid key or nil value"},
-             {{{"a", ScriptVal()}}, "invalid key or nil value"}}) {
-        try {
-            ADD_FAILURE() << "accepted " << ScriptVal::TableOf({}, entries).ToText();
-        } catch (const std::invalid_argument &e) {
-            EXPECT_EQ(e.what(), "ScriptVal::TableOf: " + message);
-        }
-    }
-    EXPECT_THROW(ScriptVal::TableOf("not a name", {}), std::invalid_argument);
 }
 
 TEST(ScriptValNumbers, WrittenShortestReadBackBitExactAndReadInEveryForm) {

@@ -50,7 +50,7 @@ TEST(TagKinds, TopNibbleAndBytesGiveTheKindAndDomain) {
     EXPECT_EQ(std::pair(TagDomain(0x12ab3456), TagDomain(0xffffffff)), std::pair(0xabu, 0xffu));
 }
 
-TEST(TagItemConvert, NumbersTakeTheTagsKind) {
+TEST(TagItemConvert, NumbersTakeTheTagsKindAndTextIdsAndPointersAreStored) {
     // An integer given to a double tag becomes the double.
     EXPECT_EQ(std::vector({TagItem(DblTag, 3).AsDouble(), TagItem(DblTag, 4000000000u).AsDouble(),
                            TagItem(DblTag, true).AsDouble(), TagItem(DblTag, 0.1f).AsDouble()}),
@@ -66,9 +66,6 @@ TEST(TagItemConvert, NumbersTakeTheTagsKind) {
     EXPECT_EQ(std::tuple(TagItem(IntTag, 4294967295u).AsInt(), TagItem(IntTag, 9000000000000LL).AsInt(),
                          TagItem(IntTag, -5).AsInt()),
               std::tuple(4294967295LL, 9000000000000LL, -5LL));
-}
-
-TEST(TagItemConvert, TextIdsAndPointersAreStored) {
     char buffer[] = "borrowed";
     EXPECT_EQ(TagItem(TextTag, buffer).AsText(), buffer); // borrowed, not copied
     EXPECT_EQ(TagItem(IconTag, buffer).AsText(), buffer);

@@ -24,7 +24,7 @@ bool ReadCurve(const std::string &text, OvID type, AnimCurve &out) {
         ScriptVal::FromText(text), [type](const ScriptVal &v) { return ParameterFromScript(type, v); }, out);
 }
 
-TEST(AnimCurve, LinearAndHoldMeetTheirKeysAndHoldAtTheEnds) {
+TEST(AnimCurve, LinearAndHoldMeetTheirKeysHoldAtTheEndsAndKeysAreReplacedAndRemoved) {
     const AnimCurve linear = Orvane::Test::NumberCurve({{0, 1}, {10, 3}, {14, -5}, {20, -5}}, KeyInterp::Linear);
     const std::pair<double, double> onLinear[] = {
         {0, 1},    {10, 3},     {14, -5},     {20, -5},            // keys
@@ -40,6 +40,14 @@ TEST(AnimCurve, LinearAndHoldMeetTheirKeysAndHoldAtTheEnds) {
     hold.SetKey(10, MakeRef<Number>(3.0), KeyInterp::Linear);
     EXPECT_EQ(At(hold, 5), 1.0);
     EXPECT_DOUBLE_EQ(At(hold, 15), 5.0);
+    // Setting a key at an existing time replaces it; removing takes it out.
+    AnimCurve c = Orvane::Test::NumberCurve({{10, 1}, {0, 5}, {5, 2}}, KeyInterp::Linear);
+    c.SetKey(5, MakeRef<Number>(9.0), KeyInterp::Hold);
+    EXPECT_EQ(c.Keys().size(), 3u);
+    EXPECT_EQ(At(c, 7), 9.0) << "the replacing key's value and interpolation";
+    EXPECT_TRUE(c.RemoveKey(5) && !c.RemoveKey(5));
+    EXPECT_DOUBLE_EQ(At(c, 5), 3.0) << "between the keys at 0 and 10";
+    EXPECT_FALSE(AnimCurve().ValueAt(0));
 }
 
 TEST(AnimCurve, SmoothPassesThroughKeysWithMatchingSlopes) {
@@ -65,16 +73,6 @@ TEST(AnimCurve, SmoothPassesThroughKeysWithMatchingSlopes) {
     // A smooth span of two keys alone is the smoothstep between them.
     const AnimCurve two = Orvane::Test::NumberCurve({{0, 2}, {10, 6}}, KeyInterp::Smooth);
     for (double u : {0.1, 0.25, 0.5, 0.8}) EXPECT_NEAR(At(two, 10 * u), 2 + 4 * (3 * u * u - 2 * u * u * u), 1e-12);
-}
-
-TEST(AnimCurve, SettingAKeyAtAnExistingTimeReplacesItAndRemovingTakesItOut) {
-    AnimCurve c = Orvane::Test::NumberCurve({{10, 1}, {0, 5}, {5, 2}}, KeyInterp::Linear);
-    c.SetKey(5, MakeRef<Number>(9.0), KeyInterp::Hold);
-    EXPECT_EQ(c.Keys().size(), 3u);
-    EXPECT_EQ(At(c, 7), 9.0) << "the replacing key's value and interpolation";
-    EXPECT_TRUE(c.RemoveKey(5) && !c.RemoveKey(5));
-    EXPECT_DOUBLE_EQ(At(c, 5), 3.0) << "between the keys at 0 and 10";
-    EXPECT_FALSE(AnimCurve().ValueAt(0));
 }
 
 TEST(AnimCurve, PointsInterpolatePerComponentAndOtherValuesHold) {

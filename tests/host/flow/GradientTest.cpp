@@ -121,7 +121,7 @@ TEST(Gradient, StopsAreSortedStablyAndRepeatedPositionsMakeHardEdges) {
     for (int space : AllSpaces) EXPECT_EQ(Sample(edge, 0.5, space), (FltPixel{0, 0, 1, 1})) << space;
 }
 
-TEST(Gradient, OpaqueEqualsHashAndCopy) {
+TEST(Gradient, OpaqueEqualsHashCopyAndInterpolate) {
     EXPECT_TRUE(Gradient().IsOpaque() && Gradient({{0, 0, 0, 0, 1}, {1, 1, 1, 1, 2}}).IsOpaque());
     for (const Stops &clear :
          {Stops{{0, 0, 0, 0, 1}, {1, 1, 1, 1, 0.999}}, Stops{{0, 0, 0, 0, 0}, {1, 1, 1, 1, 1}}, Stops{}})
@@ -140,9 +140,6 @@ TEST(Gradient, OpaqueEqualsHashAndCopy) {
     EXPECT_FALSE(a.Equals(Number(0.5)));
     Ref<Parameter> copy = a.Copy();
     EXPECT_TRUE(copy && copy.Get() != &a && copy->Equals(a) && copy->DataType() == CLSID_DataType_Gradient);
-}
-
-TEST(Gradient, InterpolateBlendsMatchingStopsOrTakesTheNearer) {
     Ref<Gradient> from = MakeRef<Gradient>(Stops{{0, 0, 0, 0, 1}, {1, 1, 1, 1, 1}});
     Ref<Gradient> to = MakeRef<Gradient>(Stops{{0, 1, 0, 0, 0}, {1, 0, 0, 1, 1}});
     Ref<Parameter> blend = from->Interpolate(*to, 0.25);
@@ -160,7 +157,7 @@ TEST(Gradient, InterpolateBlendsMatchingStopsOrTakesTheNearer) {
     EXPECT_EQ(from->Interpolate(Number(3.0), 0.2).Get(), static_cast<Parameter *>(from.Get()));
 }
 
-TEST(Gradient, ScriptFormRoundTrips) {
+TEST(Gradient, ScriptFormRoundTripsAndReadingIsLenientWhereHarmlessAndRefusesTheMalformed) {
     const char *defaultText = "Gradient { Colors = { [0] = { 0, 0, 0, 1 }, [1] = { 1, 1, 1, 1 } } }";
     EXPECT_EQ(Gradient().ToScript(), ScriptVal::FromText(defaultText));
     Ref<Gradient> read = Gradient::FromScript(ScriptVal::FromText(defaultText));
@@ -182,9 +179,6 @@ TEST(Gradient, ScriptFormRoundTrips) {
         Ref<Gradient> back = Gradient::FromScript(form);
         EXPECT_TRUE(back && back->Equals(grad) && back->Hash() == grad.Hash());
     }
-}
-
-TEST(Gradient, ScriptReadingIsLenientWhereHarmlessAndRefusesTheMalformed) {
     // Three components mean opaque; a plain table and extra entries are fine.
     Ref<Gradient> g = Gradient::FromScript(
         ScriptVal::FromText("{ Version = 2, Colors = { [1] = { 1, 0, 0 }, [0] = { 0, 1, 0, 0.5 } } }"));
