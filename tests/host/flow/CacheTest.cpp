@@ -33,7 +33,7 @@ CacheKey Key(const Output &out, double time = 0.0, uint32_t traits = 0, uint64_t
     return CacheKey{&out, time, traits, state};
 }
 
-TEST(ResultCache, FindsOnlyWhatWasStoredUnderTheSameKeyAndRegionsOnlyWhatTheyCover) {
+TEST(ResultCache, FindsOnlyWhatWasStoredUnderTheSameKeyAndAWholeFrameResultServesAllAndReplacesRegionResults) {
     Outputs o;
     ResultCache cache;
     Ref<Parameter> v = MakeRef<Number>(1.0), img = Img(4, 4);
@@ -49,11 +49,7 @@ TEST(ResultCache, FindsOnlyWhatWasStoredUnderTheSameKeyAndRegionsOnlyWhatTheyCov
         EXPECT_EQ(cache.Find(Key(o.a, 2.0), served).Get(), img.Get());
     for (const auto &missed : {Region(1, 2, 10, 8), Region(20, 20, 30, 30), Whole})
         EXPECT_FALSE(cache.Find(Key(o.a, 2.0), missed));
-}
-
-TEST(ResultCache, AWholeFrameResultServesAllAndReplacesRegionResults) {
-    Outputs o;
-    ResultCache cache;
+    cache.Clear();
     Ref<Parameter> left = Img(4, 4), right = Img(5, 5), whole = Img(8, 8);
     cache.Store(Key(o.a), Region(0, 0, 4, 8), left);
     cache.Store(Key(o.a), Region(4, 0, 8, 8), right);
@@ -101,7 +97,7 @@ TEST(ResultCache, EvictsLeastRecentlyUsedBeyondTheBudget) {
     EXPECT_EQ(std::pair(cache.Entries(), cache.Bytes()), std::pair(size_t(0), size_t(0)));
 }
 
-TEST(ResultCache, StoringTheSameKeyAgainReplacesAndForgetDropsOneOutputsEntries) {
+TEST(ResultCache, StoringTheSameKeyAgainReplacesForgetDropsOneOutputsEntriesAndReclaimOnlyWhatNobodyHolds) {
     Outputs o;
     ResultCache cache;
     Ref<Parameter> first = Img(8, 8), second = Img(4, 4), y = Img(6, 6);
@@ -121,11 +117,7 @@ TEST(ResultCache, StoringTheSameKeyAgainReplacesAndForgetDropsOneOutputsEntries)
     EXPECT_FALSE(cache.Find(Key(o.a, 0), Whole));
     EXPECT_FALSE(cache.Find(Key(o.a, 1), Region(0, 0, 1, 1)));
     EXPECT_EQ(cache.Find(Key(o.b, 0), Whole).Get(), y.Get());
-}
-
-TEST(ResultCache, ReclaimDropsOnlyResultsNobodyElseHoldsOldestFirst) {
-    Outputs o;
-    ResultCache cache;
+    cache.Clear();
     Ref<Parameter> held = Img(16, 16);
     const size_t one = held->SizeOf();
     for (int t = 0; t < 4; ++t) cache.Store(Key(o.a, t), Whole, t ? Img(16, 16) : held);

@@ -55,7 +55,7 @@ struct Fixture {
     }
 };
 
-TEST(GamutInputs, AddsItsInputsAndShowsWhatTheSpaceNeeds) {
+TEST(GamutInputs, AddsItsInputsShowsWhatTheSpaceNeedsAndPassesTheImageWhenOff) {
     Fixture f(true);
     ASSERT_NE(f.tool->FindInput("GamutSpace"), nullptr);
     EXPECT_EQ(f.gamut->CurveOf(nullptr).space, GamutSpace::NoChange);
@@ -82,10 +82,8 @@ TEST(GamutInputs, AddsItsInputsAndShowsWhatTheSpaceNeeds) {
     ASSERT_NE(saver.tool->FindInput("GamutAddGamma"), nullptr);
     for (GamutSpace s : {GamutSpace::NoChange, GamutSpace::SRGB, GamutSpace::Rec709, GamutSpace::CineonLog})
         EXPECT_EQ(GamutInputs::SpaceOf(GamutInputs::SpaceID(s)), s);
-}
-
-TEST(GamutInputs, NoChangeAndSwitchedOffPassTheImageThrough) {
-    Fixture f(true);
+    // No Change, and sRGB switched off, pass the image through.
+    ts::SetID(f.tool, "GamutSpace", "NoChange");
     Ref<Image> img = ts::PatternImage(6, 4);
     const FltPixel before = img->GetFlt(2, 2);
     EXPECT_EQ(f.Process(img.Get(), nullptr).Get(), img.Get());

@@ -281,7 +281,7 @@ TEST_F(MotionBlur, TheOutermostShutterDecidesAndTheCostStaysLinear) {
     ExpectTimes(bar->times, SampleTimes(1.0, 4, 360, 0, 1));
 }
 
-TEST_F(MotionBlur, CachedResultsOfSamplesAndFramesStayApart) {
+TEST_F(MotionBlur, CachedResultsOfSamplesAndFramesStayApartAndAFailingSampleFailsTheFrame) {
     MovingBar *bar = AddBar(C().bar, "Bar");
     SetBlur(bar, 2, 360, 0, 1); // samples at t - 0.25 and t + 0.25
     // Frame 0.75 renders a sharp sample at 1.0, frame 1.0 a blurred frame at the same time: neither may stand in for
@@ -297,10 +297,6 @@ TEST_F(MotionBlur, CachedResultsOfSamplesAndFramesStayApart) {
         }
         EXPECT_EQ(bar->times.size(), 4u) << "the second pass came from the cache";
     }
-}
-
-TEST_F(MotionBlur, AFailingSampleFailsTheFrame) {
-    MovingBar *bar = AddBar(C().bar, "Bar");
     SetBlur(bar, 4, 180, 0, 1);
     bar->failAfter = 2.0;
     EXPECT_TRUE(Eval(bar, 1.5) && !Eval(bar, 2.0));
