@@ -96,7 +96,7 @@ TEST(TagItemConvertDeathTest, WrongKindsAbort) {
     EXPECT_DEATH(TagItem(IntTag, OvID("x")), "tag 0x10000f01 given a ID value");
 }
 
-TEST(TagListGet, TypedGettersReadTheFirstEntryOrTheDefault) {
+TEST(TagList, GettersReadTheFirstEntryOrTheDefaultMergeSetsEveryPairAndRemoveTakesEveryEntry) {
     int target = 0;
     TagList l{{IntTag, 7}, {DblTag, 2.75}, {TextTag, "abc"}, {IdTag, OvID("TagTestGetter")}, {PtrTag, &target}};
     l.Add({IntTag, 99}); // a second entry of a non-repeating tag is shadowed
@@ -112,10 +112,7 @@ TEST(TagListGet, TypedGettersReadTheFirstEntryOrTheDefault) {
     EXPECT_TRUE(l.GetPtr(0x60000f02, &target) == &target && l.GetPtr(0x60000f02) == nullptr);
     const TagList zeroes{{IntTag, 0}, {DblTag, 0.0}};
     EXPECT_FALSE(zeroes.GetBool(IntTag, true) || zeroes.GetBool(DblTag, true));
-}
-
-// Merge sets every pair of the other list: in place, appended when absent, repeated tags adding up.
-TEST(TagListSet, MergeSetsEveryPairAndRemoveTakesEveryEntry) {
+    // Merge sets every pair of the other list: in place, appended when absent, repeated tags adding up.
     TagList base{{IntTag, 1}, {TextTag, "keep"}, {RepTextTag, "x"}, {DblTag, 1.5}};
     const TagList other{{DblTag, 4.0},
                         {IntTag2, 5},
@@ -141,7 +138,7 @@ TEST(TagListSet, MergeSetsEveryPairAndRemoveTakesEveryEntry) {
     EXPECT_EQ(TagsOf(base), (std::vector<Tag>{TextTag, DblTag, IntTag2, IconTag, RepIdTag, IconTag}));
 }
 
-TEST(TagListArray, ZeroEndedPairsAreCopied) {
+TEST(TagListCopies, ZeroEndedPairsAreCopiedAndPersistedTextOutlivesItsSource) {
     static const char label[] = "label";
     double quarter = 0.25;
     uint64_t quarterBits;
@@ -166,9 +163,6 @@ TEST(TagListArray, ZeroEndedPairsAreCopied) {
     const TagList copied(withText, true);
     std::memset(buffer, 'X', sizeof buffer - 1);
     EXPECT_STREQ(copied.GetText(TextTag), "temporary");
-}
-
-TEST(TagListPersist, TextSurvivesTheSourceAndCopiesOutliveTheOriginal) {
     char text[] = "first", icon[] = "icon", rep1[] = "rep-one", rep2[] = "rep-two";
     int target = 0;
     std::string idText = "TagTestPersistId";

@@ -159,7 +159,7 @@ void RunMix(const MixCase &c) {
     EXPECT_TRUE(!c.roi || c.roi->Contains(out->DataWindow())) << ts::RectText(out->DataWindow());
 }
 
-TEST(CommonControls, BlendChannelSwitchesAndTheEffectMaskMixResultAndInput) {
+TEST(CommonControls, BlendChannelSwitchesAndTheEffectMaskMixResultAndInputAndWindowsGrowWhereNeeded) {
     const FltPixel opaque{0.5f, 0.25f, 0.f, 1.f};
     const MixCase cases[] = {
         {.name = "blend 0.25", .blend = 0.25},
@@ -182,9 +182,6 @@ TEST(CommonControls, BlendChannelSwitchesAndTheEffectMaskMixResultAndInput) {
         {.name = "region", .blend = 0.5, .mask = RGBAMask, .roi = ImgRectI(2, 3, 9, 8)},
     };
     for (const MixCase &c : cases) RunMix(c);
-}
-
-TEST(CommonControls, DataWindowsGrowWhereTheMixNeedsThem) {
     const FltPixel clear{}, grey{0.3f, 0.2f, 0.1f, 0.5f};
     for (const bool multiply : {false, true})
         for (const FltPixel &srcCanvas : {clear, grey}) {

@@ -319,7 +319,7 @@ TEST(DocumentIO, EveryProblemOfADocumentIsReportedInTextOrder) {
     EXPECT_EQ(doc->FindTool("B1")->FindInput("Input")->Link(), nullptr);
 }
 
-TEST(DocumentIO, SyntaxErrorsAndNonDocumentsFailAtOnce) {
+TEST(DocumentIO, SyntaxErrorsFailAtOnceAndLenientLoadingKeepsWhatItDoesNotKnow) {
     for (const auto &[text, problem] : {
              std::pair<std::string, std::string>{
                  "Orvane.Document {\n\tTools = {\n\t\tA = DocIOTestTool { Inputs = { Size = @ } },\n\t},\n}\n",
@@ -338,9 +338,6 @@ TEST(DocumentIO, SyntaxErrorsAndNonDocumentsFailAtOnce) {
             EXPECT_NE(r.error.find(problem), std::string::npos) << r.error;
             EXPECT_TRUE(doc->Tools().empty());
         }
-}
-
-TEST(DocumentIO, LenientLoadingKeepsWhatItDoesNotKnowAndWritesItBack) {
     const std::string text = R"(Orvane.Document {
 	Layout = { Zoom = 2, Views = { "A", "B" } },
 	Prefs = { FrameWidth = 1280, FuturePref = { Mode = "fast" } },

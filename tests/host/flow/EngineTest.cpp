@@ -231,7 +231,7 @@ TEST(Engine, RegionsOfInterestReachUpstream) {
     }
 }
 
-TEST(Engine, EveryPixelRequestFollowsAPreCalculation) {
+TEST(Engine, EveryPixelRequestFollowsAPreCalculationAndAToolWithoutDoDSupportGetsWholeFrames) {
     // The tool chooses a data window of its own; the pixel pass must know it as the output's domain before Process
     // runs.
     const ImgRectI own(1, 2, 5, 7);
@@ -254,9 +254,6 @@ TEST(Engine, EveryPixelRequestFollowsAPreCalculation) {
         EXPECT_EQ(D(f.probe->calls[1].outDoD), R(own));
         EXPECT_EQ(R(out->DataWindow()), R(roi ? own & *roi : own));
     }
-}
-
-TEST(Engine, AToolWithoutDoDSupportGetsWholeFrames) {
     const FltPixel canvas{0.1f, 0.2f, 0.3f, 0.4f};
     // The class, the source's data window and the window the tool sees.
     const std::tuple<const char *, OvID, ImgRectI, ImgRectI> cases[] = {

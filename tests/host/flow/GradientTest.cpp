@@ -29,7 +29,7 @@ FltPixel Sample(const Gradient &grad, double pos, int space = RGB) {
 }
 FltPixel Color(const GradientStop &s) { return {s.r, s.g, s.b, s.a}; }
 
-TEST(Gradient, BlendsAsItsColourSpaceDoes) {
+TEST(Gradient, BlendsAsItsColourSpaceDoesAndGivesTheStopColoursExactlyAtStopsAndEnds) {
     // Name, stops, colour spaces, positions, the colour expected there and its tolerance.
     const std::tuple<const char *, Stops, std::vector<int>, std::vector<double>, FltPixel, double> cases[] = {
         {"RGB", {{0.2, 1, 0, 0, 1}, {0.6, 0, 0.5, 1, 0}}, {RGB}, {0.3}, {0.75, 0.125, 0.25, 0.75}, 1e-6},
@@ -67,9 +67,6 @@ TEST(Gradient, BlendsAsItsColourSpaceDoes) {
     // Alpha stays linear whatever the colour space.
     for (int space : AllSpaces)
         EXPECT_NEAR(Sample(Gradient(Stops{{0, 1, 0, 0, 0}, {1, 0, 0, 1, 1}}), 0.3, space).A, 0.3, 1e-6) << space;
-}
-
-TEST(Gradient, StopsAndEndsGiveTheStopColoursExactly) {
     const Gradient grad({{0.2, 1, 0, 0, 0.5}, {0.6, 0, 0, 1, 1}});
     const Gradient many(
         {{0, 0.1, 0.2, 0.3, 0.4}, {0.3, 0.9, 0.05, 0.6, 1}, {0.8, 0.33, 0.77, 0.11, 0.5}, {1, 1.5, -0.2, 0.4, 1}});
