@@ -243,7 +243,7 @@ int Wrong(const std::vector<std::atomic<int>> &hits, int times = 1) {
     return wrong;
 }
 
-TEST(ParallelJobs, RangeCoveredExactlyOnce) {
+TEST(ParallelJobs, RangesAreCoveredOnceNestedOrFromManyThreadsAndOneWorkerIsTheCallingThread) {
     WorkerCountGuard guard;
     const std::pair<int, int> ranges[] = {{0, 0}, {5, 5}, {9, 3}, {3, 4}, {-17, 250}, {0, 1000}, {100, 2101}};
     for (int workers : {1, 2, 3, 8}) {
@@ -269,10 +269,6 @@ TEST(ParallelJobs, RangeCoveredExactlyOnce) {
     int calls = 0;
     ParallelFor(-4, [&](int) { ++calls; });
     EXPECT_EQ(calls, 0);
-}
-
-TEST(ParallelJobs, NestedJobsAndJobsFromManyThreadsCompleteAndOneWorkerIsTheCallingThread) {
-    WorkerCountGuard guard;
     for (int workers : {1, 4}) {
         SetWorkerCount(workers);
         constexpr int Outer = 12, Inner = 300;

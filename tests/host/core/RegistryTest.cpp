@@ -146,7 +146,7 @@ TEST(RegistryNew, FactoriesMakeObjects) {
     EXPECT_EQ(l.list->New(OvID("RegTestMade"), RegKindTool, nullptr), nullptr) << "the wrong type";
 }
 
-TEST(RegistryInit, RefusedRowsAreDisabled) {
+TEST(RegistryInit, RefusedRowsAreDisabledAndStartUpHooksMayLookUpTheList) {
     hookLog.clear();
     LocalList l;
     Registry *yes =
@@ -171,26 +171,23 @@ TEST(RegistryInit, RefusedRowsAreDisabled) {
     l.list->CleanupAll();
     EXPECT_EQ(hookLog, (std::vector<std::string>{"accept RegTestLate", "refuse RegTestLateNo", "cleanup RegTestYes",
                                                  "cleanup RegTestNoHook"}));
-}
-
-TEST(RegistryInit, StartUpHooksMayLookUpTheList) {
     static const OvID baseId("RegTestHookBase");
     hookLog.clear();
-    LocalList l;
-    l.Add("RegTestHookBase", {});
-    l.Add("RegTestHookEarly", {{RegBaseClass, &baseId}, {RegInitFunc, &LookupInit}});
-    l.list->InitAll();
+    LocalList hooked;
+    hooked.Add("RegTestHookBase", {});
+    hooked.Add("RegTestHookEarly", {{RegBaseClass, &baseId}, {RegInitFunc, &LookupInit}});
+    hooked.list->InitAll();
     // The same hook on a row entered after InitAll. Run on a thread of its own so that a hook blocked on the list's
     // lock fails the test instead of hanging it.
     auto done = std::make_shared<std::promise<void>>();
     std::future<void> finished = done->get_future();
-    std::thread([listRef = &l.list, done] {
+    std::thread([listRef = &hooked.list, done] {
         TagList tags{{RegBaseClass, &baseId}, {RegInitFunc, &LookupInit}};
         Registry::_Init(listRef, OvID("RegTestHookLate"), tags);
         done->set_value();
     }).detach();
     if (finished.wait_for(std::chrono::seconds(20)) != std::future_status::ready) {
-        l.list = nullptr; // the blocked thread still uses it: leave it alive
+        hooked.list = nullptr; // the blocked thread still uses it: leave it alive
         FAIL() << "a start-up hook of a late row blocked on the registry lock";
     }
     EXPECT_EQ(hookLog, (std::vector<std::string>{"base RegTestHookBase, self", "base RegTestHookBase, self"}));

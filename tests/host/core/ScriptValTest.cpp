@@ -150,7 +150,7 @@ TEST(ScriptValTable, RandomEditsMatchAPlainModel) {
     }
 }
 
-TEST(ScriptValNumbers, WrittenShortestReadBackBitExactAndReadInEveryForm) {
+TEST(ScriptValScalars, NumbersAndTextsAreWrittenShortestOrEscapedAndReadInEveryForm) {
     std::string written;
     for (double d : {0.0, -0.0, -42.0, 0.1, 1e5, 1e300, 5e-324, kInf, -kInf, kNaN, -kNaN, 1.0 / 3, 0x1p53 + 2})
         written += ScriptVal(d).ToText() + " ";
@@ -175,35 +175,32 @@ TEST(ScriptValNumbers, WrittenShortestReadBackBitExactAndReadInEveryForm) {
     read += Parse("0." + std::string(400, '0') + "1").ToText();
     // 0x7fff... rounds to 2^63, 3e-324 to the smallest denormal; an underflow reads as zero with its sign.
     EXPECT_EQ(read, "16 255 16 0.5 21 9223372036854775808 0.01 2500 0.5 5 -3 -16 -1/0 1/0 0/0 5e-324 0 -0 -0 0");
-}
-
-TEST(ScriptValText, WrittenWithEscapesAndReadInEveryForm) {
-    std::string written;
+    std::string writtenText;
     for (const std::string &text :
          {std::string(), std::string("say \"hi\" it's"), std::string("back\\slash"), std::string("a\nb\rc\td"),
           std::string("\0x", 2), std::string("\0001", 2), std::string("\x01\x1f\x7f"), std::string("\0339"),
           std::string("\xc3\xa9 \xff\x80")}) {
-        written += ScriptVal(text).ToText() + " ";
+        writtenText += ScriptVal(text).ToText() + " ";
         EXPECT_EQ(Parse(ScriptVal(text).ToText()).AsText(), text);
     }
     // A decimal escape is padded to three digits where a digit follows; bytes from 0x80 stay as they are.
-    EXPECT_EQ(written, R"("" "say \"hi\" it's" "back\\slash" "a\nb\rc\td" "\0x" "\0001" "\1\31\127" "\0279" )"
-                       "\"\xc3\xa9 \xff\x80\" ");
+    EXPECT_EQ(writtenText, R"("" "say \"hi\" it's" "back\\slash" "a\nb\rc\td" "\0x" "\0001" "\1\31\127" "\0279" )"
+                           "\"\xc3\xa9 \xff\x80\" ");
     std::string all;
     // A digit after each byte tests escape padding.
     for (int c = 0; c < 256; ++c) all.append({static_cast<char>(c), static_cast<char>('0' + c % 10)});
     EXPECT_EQ(Parse(ScriptVal(all).ToText()).AsText(), all);
-    std::string read;
+    std::string readText;
     for (const std::string &text :
          {std::string(R"('it\'s "q"')"), std::string(R"("\a\b\f\n\r\t\v\\\"\'")"), std::string(R"("\65\066\0677\255")"),
           std::string(R"("a\0b")"), std::string("\"a\0b\"", 5), std::string("\"a\\\nb\\\r\nc\""),
           std::string("[[\n\nl1\r\nl2\rl3]]"), std::string("[==[a]]b]=]c]==]"), std::string(R"([[a\nb]])")})
-        read += Parse(text).ToText() + " ";
+        readText += Parse(text).ToText() + " ";
     // Line breaks in a text read as \n; only the one right after a long bracket is dropped.
-    EXPECT_EQ(read, R"("it's \"q\"" "\7\8\12\n\r\t\11\\\"'" "ABC7)"
-                    "\xff"
-                    R"(" "a\0b" "a\0b" "a\nb\nc" )"
-                    R"("\nl1\nl2\nl3" "a]]b]=]c" "a\\nb" )");
+    EXPECT_EQ(readText, R"("it's \"q\"" "\7\8\12\n\r\t\11\\\"'" "ABC7)"
+                        "\xff"
+                        R"(" "a\0b" "a\0b" "a\nb\nc" )"
+                        R"("\nl1\nl2\nl3" "a]]b]=]c" "a\\nb" )");
 }
 
 TEST(ScriptValWrite, ScalarsSmallTablesAndTheOneLineLimit) {

@@ -50,7 +50,7 @@ TEST(AnimCurve, LinearAndHoldMeetTheirKeysHoldAtTheEndsAndKeysAreReplacedAndRemo
     EXPECT_FALSE(AnimCurve().ValueAt(0));
 }
 
-TEST(AnimCurve, SmoothPassesThroughKeysWithMatchingSlopes) {
+TEST(AnimCurve, SmoothPassesThroughKeysWithMatchingSlopesAndPointsFollowTheirComponents) {
     // Uneven spacing, so that tangents must be scaled to each span.
     const std::vector<std::pair<double, double>> keys{{0, 0}, {4, 2}, {5, -1}, {12, 3}, {20, 3.5}};
     const AnimCurve c = Orvane::Test::NumberCurve(keys, KeyInterp::Smooth);
@@ -73,9 +73,6 @@ TEST(AnimCurve, SmoothPassesThroughKeysWithMatchingSlopes) {
     // A smooth span of two keys alone is the smoothstep between them.
     const AnimCurve two = Orvane::Test::NumberCurve({{0, 2}, {10, 6}}, KeyInterp::Smooth);
     for (double u : {0.1, 0.25, 0.5, 0.8}) EXPECT_NEAR(At(two, 10 * u), 2 + 4 * (3 * u * u - 2 * u * u * u), 1e-12);
-}
-
-TEST(AnimCurve, PointsInterpolatePerComponentAndOtherValuesHold) {
     for (const KeyInterp interp : {KeyInterp::Linear, KeyInterp::Smooth, KeyInterp::Hold}) {
         SCOPED_TRACE(KeyInterpName(interp));
         // Each component follows the curve of its own numbers.

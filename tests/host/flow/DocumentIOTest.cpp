@@ -201,7 +201,7 @@ return Orvane.Document{
     EXPECT_EQ(SaveDocument(*doc).find("-- the last step"), std::string::npos);
 }
 
-TEST(DocumentIO, OnlyValuesThatDifferFromTheirDefaultsAreWritten) {
+TEST(DocumentIO, OnlyValuesThatDifferFromTheirDefaultsAreWrittenAndValuesReadAreChecked) {
     Ref<OrvaneDoc> doc = MakeRef<OrvaneDoc>();
     Operator *u = AddDocTool(*doc, "U1"), *same = AddDocTool(*doc, "Same"), *changed = AddDocTool(*doc, "Changed");
     ts::SetNumbers(same, {{"Size", 1.0}, {"Width", 100}});
@@ -226,9 +226,6 @@ TEST(DocumentIO, OnlyValuesThatDifferFromTheirDefaultsAreWritten) {
                                      {"Linked", {"Input"}}})
         EXPECT_EQ(InputKeys(text, tool), keys) << tool << "\n" << text;
     ExpectStableRoundTrip(*doc);
-}
-
-TEST(DocumentIO, ValuesAreCheckedAndChoicesTakenByName) {
     // Name = value for tool A1; the problem ("" when it loads); the value set when loaded leniently ("": left alone).
     const std::tuple<const char *, const char *, const char *> cases[] = {
         {"Size = 2", "", "2"},

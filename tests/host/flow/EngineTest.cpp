@@ -280,7 +280,7 @@ TEST(Engine, EveryPixelRequestFollowsAPreCalculationAndAToolWithoutDoDSupportGet
     }
 }
 
-TEST(Engine, AFailingToolStopsTheChainWithItsOneLine) {
+TEST(Engine, AFailingToolStopsTheChainWithItsOneLineAndSoDoesOneThatGivesNothingOrLacksARequiredImage) {
     enum How { Fails, FailsInPreCalcToo, RunsOutOfMemory, RunsOutOfMemoryInAChunk };
     const char *const failed = "Bad: cannot go on at time 2", *const noMemory = "Bad: out of memory (time = 2.000000)";
     // How it fails, which input of the tool below it feeds, whether that tool below is evaluated, the line.
@@ -312,20 +312,17 @@ TEST(Engine, AFailingToolStopsTheChainWithItsOneLine) {
         EXPECT_EQ(ts::ConsoleText(*d.doc), "error: " + std::string(line) + "\n");
         EXPECT_EQ(down->PixelCalls(), 0) << "the tool below does not run";
     }
-}
-
-TEST(Engine, AToolThatGivesNothingOrLacksARequiredImageFailsWithOneHostLine) {
-    Doc d;
-    Probe *silent = d.Add("Silent", d.src->Out()), *p = d.Add("Lonely1", nullptr);
+    Doc e;
+    Probe *silent = e.Add("Silent", e.src->Out()), *p = e.Add("Lonely1", nullptr);
     silent->onProcess = [](Probe &p, Request *req) { req->IsPreCalc() ? p.MakeOutput(req) : void(); };
     EXPECT_FALSE(ts::EvalImage(silent, 4.0));
-    ASSERT_TRUE(p->late->ConnectTo(d.src->Out())); // the tool could work from Late alone
+    ASSERT_TRUE(p->late->ConnectTo(e.src->Out())); // the tool could work from Late alone
     EXPECT_FALSE(ts::EvalImage(p) || !p->calls.empty());
     // Optional inputs may stay unconnected.
-    ASSERT_TRUE(p->input->ConnectTo(d.src->Out()));
+    ASSERT_TRUE(p->input->ConnectTo(e.src->Out()));
     p->late->Disconnect();
     EXPECT_TRUE(ts::EvalImage(p));
-    EXPECT_EQ(ts::ConsoleText(*d.doc),
+    EXPECT_EQ(ts::ConsoleText(*e.doc),
               "error: Silent: produced no result at time 4\nerror: Lonely1: input \"Input\" is not connected\n");
 }
 

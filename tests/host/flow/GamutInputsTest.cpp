@@ -94,7 +94,7 @@ TEST(GamutInputs, AddsItsInputsShowsWhatTheSpaceNeedsAndPassesTheImageWhenOff) {
     EXPECT_EQ(img->GetFlt(2, 2), before);
 }
 
-TEST(GamutInputs, ConvertsFloatAndIntegerImages) {
+TEST(GamutInputs, ConvertsFloatAndIntegerImagesWithTheClippingModesInBothDirections) {
     for (int depth : {DepthRGBAInt8, DepthRGBAInt16, DepthRGBAFlt16, DepthRGBAFlt32}) {
         SCOPED_TRACE(depth);
         Fixture f(true);
@@ -118,9 +118,6 @@ TEST(GamutInputs, ConvertsFloatAndIntegerImages) {
             }
         EXPECT_NEAR(out->GetCanvasColor().R, decode(0.5f), 1e-6);
     }
-}
-
-TEST(GamutInputs, ClippingModesInPlaceAndTheSaverDirection) {
     Fixture f(false);
     ts::SetID(f.tool, "GamutSpace", "CineonLog");
     ts::SetNumber(f.tool, "GamutLogWhite", 700);
