@@ -94,7 +94,7 @@ public:
         return {p.R * gain + 0.125f, std::sqrt(std::fabs(p.G)), p.B * p.A, p.A};
     }
     long PixelCalls() const {
-        return std::count_if(calls.begin(), calls.end(), [](auto &s) { return !s.precalc; });
+        return std::ranges::count_if(calls, [](const Seen &s) { return !s.precalc; });
     }
     Input *last = ts::AddIn(this, "Last", CLSID_DataType_Number, {{InputPriority, PriorityLast}});
     Input *input = ts::AddImageIn(this);

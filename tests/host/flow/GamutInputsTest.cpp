@@ -33,6 +33,8 @@ public:
     std::unique_ptr<GamutInputs> gamut;
 };
 
+float Decode(float v) { return static_cast<float>(v <= 0.04045 ? v / 12.92 : std::pow((v + 0.055) / 1.055, 2.4)); }
+
 struct Fixture {
     Ref<OrvaneDoc> doc = MakeRef<OrvaneDoc>();
     Operator *tool;
@@ -107,16 +109,13 @@ TEST(GamutInputs, ConvertsFloatAndIntegerImagesWithTheClippingModesInBothDirecti
         Ref<Image> out = f.Process(src.Get(), nullptr);
         ASSERT_TRUE(out && out.Get() != src.Get() && out->Depth() == depth);
         const double tol = depth == DepthRGBAInt8 ? 0.5 / 255 + 1e-6 : depth == DepthRGBAInt16 ? 1e-5 : 2e-3;
-        auto decode = [](float v) {
-            return static_cast<float>(v <= 0.04045 ? v / 12.92 : std::pow((v + 0.055) / 1.055, 2.4));
-        };
         for (int y = 0; y < 3; ++y)
             for (int x = 0; x < 8; ++x) {
                 const FltPixel a = src->GetFlt(x, y), b = out->GetFlt(x, y);
-                ts::ExpectPixelNear(b, {decode(a.R), decode(a.G), decode(a.B), a.A}, tol);
+                ts::ExpectPixelNear(b, {Decode(a.R), Decode(a.G), Decode(a.B), a.A}, tol);
                 EXPECT_EQ(b.A, a.A);
             }
-        EXPECT_NEAR(out->GetCanvasColor().R, decode(0.5f), 1e-6);
+        EXPECT_NEAR(out->GetCanvasColor().R, Decode(0.5f), 1e-6);
     }
     Fixture f(false);
     ts::SetID(f.tool, "GamutSpace", "CineonLog");

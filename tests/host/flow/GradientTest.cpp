@@ -58,8 +58,7 @@ TEST(Gradient, BlendsAsItsColourSpaceDoesAndGivesTheStopColoursExactlyAtStopsAnd
         for (int space : spaces)
             for (double pos : positions)
                 ts::ExpectPixelNear(Sample(Gradient(stops), pos, space), want, tol,
-                                    std::string(name) + ", space " + std::to_string(space) + ", at " +
-                                        std::to_string(pos));
+                                    name + (" " + std::to_string(space)) + " " + std::to_string(pos));
     // Black to white in L*a*b*: L* 50 at the middle, luminance ((50 + 16) / 116)^3.
     const float y = static_cast<float>(std::pow(66.0 / 116.0, 3.0));
     ts::ExpectPixelNear(Sample(Gradient(), 0.5, LAB), {y, y, y, 1}, 1e-5, "Lab");

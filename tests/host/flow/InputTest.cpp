@@ -194,7 +194,7 @@ TEST_F(InputTest, AttributesChangeAtRunTimeAndHiddenAndInternalInputsStillDelive
     EXPECT_EQ(std::pair(NumberOf(hard->Constant()), hard->Tags().GetDouble(InputMinAllowed)), std::pair(3.0, -1.0));
 }
 
-TEST_F(InputTest, NotifyChangedHearsFirstValuesAndChangesOfNotifyingInputsButNeverRenders) {
+TEST_F(InputTest, NotifyChangedHearsFirstValuesAndChangesButNeverRendersAndTextBecomesTheValueTheInputTakes) {
     EXPECT_EQ(a->heard, Names{"Notified 1"});
     a->heard.clear();
     Input *notified = a->FindInput("Notified");
@@ -210,11 +210,8 @@ TEST_F(InputTest, NotifyChangedHearsFirstValuesAndChangesOfNotifyingInputsButNev
     a->heard.clear(), b->heard.clear();
     for (double time : {0.0, 1.0, 2.0}) EXPECT_EQ(NumberOf(Evaluate(b->value, time)), 3.0);
     EXPECT_TRUE(b->processCount == 3 && a->heard.empty() && b->heard.empty());
-}
-
-// Text as typed on a command line: script syntax where it parses, text as it stands for inputs that take text, a link
-// only to a tool that exists.
-TEST_F(InputTest, TextBecomesTheValueTheInputTakes) {
+    // Text as typed on a command line: script syntax where it parses, text as it stands for inputs that take text, a
+    // link only to a tool that exists.
     std::string read;
     for (const std::string set :
          {"Hard=2.5", "Hard=\"7\"", "Hard=Nope.Value", "Where={ 0.5, 0.25 }", "Caption=two words", "Caption=\"quoted\"",
