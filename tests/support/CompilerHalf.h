@@ -1,8 +1,6 @@
 #pragma once
-// The compiler's own half-precision type, the reference the half conversions
-// are checked against. Clang before 15 has _Float16 on x86 only with AVX-512
-// FP16; its __fp16 converts through the compiler runtime (linked into the
-// tests for Clang builds).
+// The compiler's half type, the reference for the half conversions. Clang before 15 has _Float16 on x86 only with
+// AVX-512 FP16; its __fp16 converts through the compiler runtime (linked into the tests for Clang builds).
 namespace Orvane::Test {
 #if defined(__clang__) && !defined(__FLT16_MAX__)
 using CompilerHalf = __fp16;

@@ -6,8 +6,13 @@
 #include <filesystem>
 
 #include "host/app/Application.h"
+#include "host/core/Registry.h"
 #include "host/core/Tags.h"
+#include "host/flow/DataTypes.h"
+#include "host/flow/Engine.h"
+#include "host/flow/Request.h"
 #include "host/image/NewImage.h"
+#include "host/image/TransformMatrix.h"
 
 namespace Orvane::Test {
 
@@ -28,22 +33,16 @@ TempDir::~TempDir() {
     std::filesystem::remove_all(path, ignored);
 }
 
-std::string SourcePath(const std::string &relative) { return std::string(ORVANE_SOURCE_DIR) + "/" + relative; }
-
 Ref<Image> PatternImage(int w, int h, int depth, unsigned seed) {
     Ref<Image> img = NewImageTagList({{ImgWidth, w}, {ImgHeight, h}, {ImgDepth, depth}});
     img->AllocScanLineData();
     uint32_t state = seed * 2654435761u + 12345u;
     auto next = [&state] {
         state = state * 1664525u + 1013904223u;
-        return (state >> 8) * (1.0f / 16777216.0f);
+        return -0.25f + 1.75f * ((state >> 8) * (1.0f / 16777216.0f));
     };
-    for (int y = 0; y < h; ++y)
-        for (int x = 0; x < w; ++x) {
-            const float r = -0.25f + 1.75f * next(), g = -0.25f + 1.75f * next();
-            const float b = -0.25f + 1.75f * next(), a = -0.25f + 1.75f * next();
-            img->PutFlt(x, y, {r, g, b, a});
-        }
+    for (int y = 0; y < h; ++y) // a braced list evaluates its elements in order: R, G, B, A
+        for (int x = 0; x < w; ++x) img->PutFlt(x, y, {next(), next(), next(), next()});
     return img;
 }
 
@@ -64,11 +63,10 @@ std::string RectText(const ImgRectI &r) {
 
 std::string ConsoleText(const OrvaneDoc &doc) {
     std::string text;
-    for (const ConsoleLine &line : doc.ConsoleLines())
-        text += (line.code == ConsoleError     ? "error: "
-                 : line.code == ConsoleWarning ? "warning: "
-                                               : "") +
-                line.text + "\n";
+    for (const ConsoleLine &line : doc.ConsoleLines()) {
+        const char *kind = line.code == ConsoleError ? "error: " : line.code == ConsoleWarning ? "warning: " : "";
+        text += kind + line.text + "\n";
+    }
     return text;
 }
 
@@ -79,21 +77,12 @@ void ExpectPixelNear(const FltPixel &got, const FltPixel &want, double tol, cons
     EXPECT_NEAR(got.A, want.A, tol) << where << " alpha";
 }
 
-} // namespace Orvane::Test
-
-#include "host/core/Registry.h"
-#include "host/flow/DataTypes.h"
-#include "host/flow/Engine.h"
-#include "host/flow/Request.h"
-#include "host/image/TransformMatrix.h"
-
-namespace Orvane::Test {
 namespace {
 
 OvID RegisterToolWith(const char *id, ClassFactory make, const TagList &attrs) {
     if (ClassRegistry && ClassRegistry->Find(OvID(id))) return OvID(id);
     TagList tags{{RegConstructor, make}, {RegTypeFlags, static_cast<long long>(RegKindOperator | RegKindTool)}};
-    for (const TagItem &a : attrs.Items()) tags.Set(a);
+    tags.Merge(attrs);
     Registry::_Init(&ClassRegistry, OvID(id), tags);
     return OvID(id);
 }
@@ -137,24 +126,20 @@ ImageSourceTool::ImageSourceTool(const Registry *reg, const ScriptVal &args, con
     : ThreadedOperator(reg, args, tags), output_(AddImageOut(this)) {}
 
 void ImageSourceTool::Process(Request *req) {
-    if (!image_) {
-        req->SetOutputData(output_, nullptr);
-        return;
-    }
+    if (!image_) return req->SetOutputData(output_, nullptr);
     if (req->IsPreCalc()) {
         const ImgRectI dw = image_->DataWindow();
         const FltPixel canvas = image_->GetCanvasColor();
-        Ref<Image> shape = NewImageTagList(
-            {{ImgLikeImage, image_.Get()}, {ImgDataWindow, &dw}, {ImgNoData, 1}, {ImgCanvasColor, &canvas}});
-        req->SetOutputData(output_, shape.Get());
-        return;
+        return req->SetOutputData(
+            output_,
+            NewImageTagList(
+                {{ImgLikeImage, image_.Get()}, {ImgDataWindow, &dw}, {ImgNoData, 1}, {ImgCanvasColor, &canvas}}));
     }
     ++processCount;
     asked.push_back(req->RoI());
     if (cutToRegion && req->RoI() && !req->RoI()->rect.Contains(image_->DataWindow())) {
         const ImgRectI cut = image_->DataWindow() & req->RoI()->rect;
-        req->SetOutputData(output_, image_->CopyOfImageTagList({{ImgDataWindow, &cut}}).Get());
-        return;
+        return req->SetOutputData(output_, image_->CopyOfImageTagList({{ImgDataWindow, &cut}}).Get());
     }
     req->SetOutputData(output_, image_.Get());
 }
@@ -186,24 +171,20 @@ void ValueProbe::Process(Request *req) {
     req->SetOutputData(output_, pixels ? pixels.Get() : v);
 }
 
+template <bool TakesTransforms> Object *MakeValueProbe(const Registry *r, const ScriptVal &a, const TagList &t) {
+    return new ValueProbe(r, a, t, TakesTransforms);
+}
+
 ValueProbe *AddValueProbe(OrvaneDoc &doc, Operator *src, bool takesTransforms) {
-    static const OvID takes = RegisterTestTool("TestTakesTransforms",
-                                               [](const Registry *r, const ScriptVal &a, const TagList &t) -> Object * {
-                                                   return new ValueProbe(r, a, t, true);
-                                               });
-    static const OvID images =
-        RegisterTestTool("TestTakesImages", [](const Registry *r, const ScriptVal &a, const TagList &t) -> Object * {
-            return new ValueProbe(r, a, t, false);
-        });
+    static const OvID takes = RegisterTestTool("TestTakesTransforms", &MakeValueProbe<true>);
+    static const OvID images = RegisterTestTool("TestTakesImages", &MakeValueProbe<false>);
     auto *probe = dynamic_cast<ValueProbe *>(doc.AddTool(takesTransforms ? takes : images));
     EXPECT_TRUE(probe && probe->FindInput("Input")->ConnectTo(src->FindMainOutput()));
     return probe;
 }
 
 Ref<Image> EvalImage(Operator *op, double time, const ImgRectI *roi) {
-    EvalOptions opt;
-    if (roi) opt.roi = ImageDomain(*roi);
-    return EvalImage(op, time, opt);
+    return EvalImage(op, time, EvalOptions{.roi = roi ? std::optional(ImageDomain(*roi)) : std::nullopt});
 }
 
 Ref<Image> EvalImage(Operator *op, double time, const EvalOptions &options) {

@@ -1,6 +1,5 @@
 #pragma once
-// Helpers shared by the tests: loading the tool library once, making
-// documents and tools, and small image utilities.
+// Helpers shared by the tests: the tool library, test tools in documents, small image utilities.
 #include <initializer_list>
 #include <optional>
 #include <string>
@@ -19,11 +18,7 @@ namespace Orvane::Test {
 /// Loads liborvaneoperators from the build folder (fails the test if it cannot).
 void LoadOperators();
 
-/// A path under the source tree.
-std::string SourcePath(const std::string &relative);
-
-/// A fresh folder under the system's temporary folder, removed with all it
-/// holds when the object goes.
+/// A fresh folder under the system's temporary folder, removed with all it holds when the object goes.
 struct TempDir {
     std::string path;
     TempDir();
@@ -33,12 +28,10 @@ struct TempDir {
     std::string operator/(const std::string &name) const { return path + "/" + name; }
 };
 
-/// An RGBA float image of w x h with a deterministic, non-constant pattern
-/// (values spread over -0.25..1.5 in every channel, alpha included).
+/// An RGBA image of w x h with a deterministic pattern (values over -0.25..1.5 in every channel, alpha included).
 Ref<Image> PatternImage(int w, int h, int depth = 8, unsigned seed = 1);
 
-/// A w x h image whose data window `dw` holds PatternImage's pattern (its
-/// corner at dw's corner), with `canvas` outside.
+/// A w x h image whose data window `dw` holds PatternImage's pattern (from dw's corner), with `canvas` outside.
 Ref<Image> WindowedImage(int w, int h, const ImgRectI &dw, const FltPixel &canvas, unsigned seed, int depth = 8);
 
 /// "(x0,y0,x1,y1)", for comparisons whose failure should read well.
@@ -50,12 +43,7 @@ std::string ConsoleText(const OrvaneDoc &doc);
 /// Expects each channel of `got` within `tol` of `want`.
 void ExpectPixelNear(const FltPixel &got, const FltPixel &want, double tol, const std::string &where = "");
 
-} // namespace Orvane::Test
-
-namespace Orvane::Test {
-
-/// A tool for tests that outputs a fixed image (a copy of its windows
-/// without pixels in pre-calculation). Add it with AddImageSource.
+/// A tool that outputs a fixed image (its windows without pixels in pre-calculation). Add it with AddImageSource.
 class ImageSourceTool : public ThreadedOperator {
 public:
     ImageSourceTool(const Registry *reg, const ScriptVal &args, const TagList &tags);
@@ -65,8 +53,7 @@ public:
     int processCount = 0; ///< pixel requests served (pre-calculations not counted)
     /// The regions of interest of the pixel requests so far (absent: the whole frame).
     std::vector<std::optional<ImageDomain>> asked;
-    /// When set, a pixel request gets only the part of the image it asks
-    /// for (the rest is canvas), as from any tool.
+    /// When set, a pixel request gets only the part of the image it asks for (the rest is canvas).
     bool cutToRegion = false;
 
 private:
@@ -74,13 +61,11 @@ private:
     Output *output_;
 };
 
-/// Registers a test tool class `id` made by `make` (an operator tool with
-/// regions and domains, no blend or effect mask controls, `extra` on top);
-/// returns its ID.
+/// Registers a test tool class `id` made by `make` (an operator tool with regions and domains, no blend or effect mask
+/// controls, `extra` on top); returns its ID.
 OvID RegisterTestTool(const char *id, ClassFactory make, std::initializer_list<TagItem> extra = {});
 
-/// One T for the whole test program, made on first use (classes of test tools
-/// are registered this way, after the registry exists).
+/// One T for the whole test program, made on first use (classes of test tools are registered this way).
 template <class T> const T &Once() {
     static const T once;
     return once;
@@ -98,10 +83,9 @@ AnimCurve NumberCurve(const std::vector<std::pair<double, double>> &keys, KeyInt
 /// Adds an ImageSourceTool named `name` that outputs `img`.
 ImageSourceTool *AddImageSource(OrvaneDoc &doc, const std::string &name, Ref<Image> img);
 
-/// A test tool that notes the value it gets on its image input (and, in a
-/// pre-calculation, the input's domain) and hands on that value's pixels
-/// (or the value itself when it has none).
-/// With `takesTransforms` its input also takes a pending transform.
+/// A test tool that notes the value it gets on its image input (and, in a pre-calculation, the input's domain) and
+/// hands on that value's pixels (or the value itself when it has none). With `takesTransforms` its input also takes a
+/// pending transform.
 class ValueProbe : public ThreadedOperator {
 public:
     ValueProbe(const Registry *reg, const ScriptVal &args, const TagList &tags, bool takesTransforms);
@@ -126,13 +110,11 @@ template <class T> Object *MakeTool(const Registry *reg, const ScriptVal &args, 
     return new T(reg, args, tags);
 }
 
-/// Enters a tool class in the class registry (an operator of kind tool made
-/// by `make`, with `attrs` on top) and gives its ID.
+/// Enters a tool class in the class registry (an operator tool made by `make`, `attrs` on top) and gives its ID.
 OvID RegisterTool(const char *id, ClassFactory make, std::initializer_list<TagItem> attrs = {});
 
-/// Sets a number input by ID; fails the test when the input is missing.
+/// Set inputs by ID (several numbers in order); fail the test when an input is missing or refuses the value.
 void SetNumber(Operator *op, const char *id, double value);
-/// Sets several number inputs by ID, in order.
 void SetNumbers(Operator *op, const std::vector<std::pair<const char *, double>> &values);
 void SetPoint(Operator *op, const char *id, double x, double y);
 void SetID(Operator *op, const char *id, const char *value);

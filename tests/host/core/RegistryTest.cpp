@@ -8,6 +8,7 @@
 #include <memory>
 #include <string>
 #include <thread>
+#include <tuple>
 #include <vector>
 
 #include "host/core/ScriptVal.h"
@@ -53,19 +54,15 @@ bool LookupInit(Registry *reg) {
     return true;
 }
 
-TEST(RegistryFind, ByIdAndByOldIdsInRegistrationOrder) {
+TEST(RegistryFind, ByIdAndByOldIdsInRegistrationOrderAndEachRowKeepsItsOwnTags) {
     LocalList l;
     Registry *a = l.Add("RegTestA", {{RegOldClassId, "RegTestOldA"}, {RegOldClassId, "RegTestOlderA"}});
     Registry *b = l.Add("RegTestB", {{RegOldClassId, "RegTestA2"}});
     Registry *c = l.Add("RegTestA2", {});
     const std::pair<const char *, const Registry *> cases[] = {
-        {"RegTestA", a},
-        {"RegTestOldA", a},
-        {"RegTestOlderA", a},
-        {"RegTestB", b},
-        {"RegTestA2", c}, // a class ID comes before another's old ID
-        {"RegTestMissing", nullptr},
-    };
+        {"RegTestA", a}, {"RegTestOldA", a}, {"RegTestOlderA", a},
+        {"RegTestB", b}, {"RegTestA2", c},   {"RegTestMissing", nullptr},
+    }; // RegTestA2: a class ID comes before another's old ID
     for (const auto &[id, row] : cases) EXPECT_EQ(l.Find(id), row) << id;
     EXPECT_EQ(l.list->Find(OvID()), nullptr);
     // Rows list in registration order, whatever their names and hashes.
@@ -74,80 +71,56 @@ TEST(RegistryFind, ByIdAndByOldIdsInRegistrationOrder) {
         expected.push_back(l.Add(("RegTestOrder" + std::to_string((i * 17) % 40)).c_str(), {})->ID().Text());
     EXPECT_EQ(l.Ids(), expected);
     EXPECT_EQ(l.list->Size(), 43u);
-}
-
-TEST(RegistryFind, RowKeepsItsOwnCopyOfTheTags) {
-    LocalList l;
     char name[] = "Display Name", word[] = "ClassWord";
     Registry *row = l.Add("RegTestCopy", {{RegName, name}, {RegClassName, word}, {RegTypeFlags, 5}});
     std::memset(name, '!', std::strlen(name));
     std::memset(word, '!', std::strlen(word));
-    EXPECT_STREQ(row->DisplayName(), "Display Name");
-    EXPECT_STREQ(row->ClassName(), "ClassWord");
+    EXPECT_EQ(std::string(row->DisplayName()) + "/" + row->ClassName(), "Display Name/ClassWord");
     EXPECT_EQ(row->TypeFlags(), 5u);
     // Without names the class word is the ID and the display name the class word.
     Registry *bare = l.Add("RegTestBare", {});
-    EXPECT_STREQ(bare->ClassName(), "RegTestBare");
-    EXPECT_STREQ(bare->DisplayName(), "RegTestBare");
+    EXPECT_EQ(std::string(bare->DisplayName()) + "/" + bare->ClassName(), "RegTestBare/RegTestBare");
     EXPECT_STREQ(l.Add("RegTestWorded", {{RegClassName, "Worded"}})->DisplayName(), "Worded");
 }
 
-TEST(RegistryTypes, LowBitsAndFamily) {
+TEST(RegistryTypes, LowBitsAndFamilyAndClassTypesFollowTheBaseChain) {
     LocalList l;
     const Registry *data = l.Add("RegTestData", {{RegTypeFlags, RegKindOperator | RegKindTool | RegFamilyDataType}});
     const Registry *plain = l.Add("RegTestPlain", {{RegTypeFlags, RegKindOperator | RegKindSource}});
     const Registry *none = l.Add("RegTestNoFlags", {});
-    // Every low bit asked for must be there; a family must match whole (the
-    // bits of 0x00070000 and 0x00130000 lie inside the row's family).
-    const struct {
-        const Registry *row;
-        uint32_t type;
-        bool is;
-    } cases[] = {{data, 0, true},
-                 {data, RegKindOperator | RegKindTool, true},
-                 {data, RegKindOperator | RegKindSource, false},
-                 {data, RegFamilyDataType, true},
-                 {data, RegFamilyDataType | RegKindTool, true},
-                 {data, RegFamilyDataType | RegKindMask, false},
-                 {data, RegFamilyImageFormat | RegKindOperator, false},
-                 {data, 0x00070000, false},
-                 {data, 0x00130000, false},
-                 {plain, RegKindOperator | RegKindSource, true},
-                 {plain, RegFamilyDataType, false},
-                 {none, 0, true},
-                 {none, RegKindOperator, false},
-                 {none, RegFamilyShape, false}};
-    for (const auto &c : cases) {
-        SCOPED_TRACE(testing::Message() << c.row->ID().Text() << std::hex << " type 0x" << c.type);
-        EXPECT_EQ(c.row->IsRegClassType(c.type), c.is);
-        EXPECT_EQ(l.list->Find(c.row->ID(), c.type), c.is ? c.row : nullptr);
-    }
-}
-
-TEST(RegistryTypes, ClassTypeFollowsTheBaseChain) {
+    // Every low bit asked for must be there; a family must match whole (the bits of 0x00070000 and 0x00130000 lie
+    // inside the row's family). The types each row is, and those it is not.
+    const std::tuple<const Registry *, std::vector<uint32_t>, std::vector<uint32_t>> cases[] = {
+        {data,
+         {0, RegKindOperator | RegKindTool, RegFamilyDataType, RegFamilyDataType | RegKindTool},
+         {RegKindOperator | RegKindSource, RegFamilyDataType | RegKindMask, RegFamilyImageFormat | RegKindOperator,
+          0x00070000, 0x00130000}},
+        {plain, {RegKindOperator | RegKindSource}, {RegFamilyDataType}},
+        {none, {0}, {RegKindOperator, RegFamilyShape}},
+    };
+    for (const auto &[row, are, areNot] : cases)
+        for (const bool is : {true, false})
+            for (const uint32_t type : is ? are : areNot) {
+                SCOPED_TRACE(testing::Message() << row->ID().Text() << std::hex << " type 0x" << type);
+                EXPECT_EQ(row->IsRegClassType(type), is);
+                EXPECT_EQ(l.list->Find(row->ID(), type), is ? row : nullptr);
+            }
     static const OvID baseId("RegTestBase"), midId("RegTestMid"), foreignId("RegTestForeign");
-    LocalList l;
     const Registry *base = l.Add("RegTestBase", {});
     const Registry *mid = l.Add("RegTestMid", {{RegBaseClass, &baseId}});
     const Registry *leaf = l.Add("RegTestLeaf", {{RegBaseClass, &midId}});
     const Registry *other = l.Add("RegTestOtherLeaf", {{RegBaseClass, &foreignId}}); // base not registered
-    EXPECT_EQ(base->Base(), nullptr);
-    EXPECT_EQ(mid->Base(), base);
-    EXPECT_EQ(leaf->Base(), mid);
-    EXPECT_EQ(other->Base(), nullptr);
-    EXPECT_EQ(other->BaseID(), foreignId);
-    EXPECT_TRUE(base->BaseID().IsNull());
-    const struct {
-        const Registry *row;
-        const char *id;
-        bool is;
-    } cases[] = {
+    EXPECT_EQ(std::vector({base->Base(), mid->Base(), leaf->Base(), other->Base()}),
+              std::vector<const Registry *>({nullptr, base, mid, nullptr}));
+    EXPECT_TRUE(other->BaseID() == foreignId && base->BaseID().IsNull());
+    const std::tuple<const Registry *, const char *, bool> chain[] = {
         {leaf, "RegTestLeaf", true},       {leaf, "RegTestMid", true},      {leaf, "RegTestBase", true},
         {leaf, "RegTestOtherLeaf", false}, {mid, "RegTestBase", true},      {mid, "RegTestLeaf", false},
         {base, "RegTestBase", true},       {base, "RegTestMid", false},     {other, "RegTestForeign", true},
         {other, "RegTestBase", false},     {leaf, "RegTestUnknown", false},
     };
-    for (const auto &c : cases) EXPECT_EQ(c.row->IsClassType(OvID(c.id)), c.is) << c.row->ID().Text() << " is " << c.id;
+    for (const auto &[row, id, is] : chain)
+        EXPECT_EQ(row->IsClassType(OvID(id)), is) << row->ID().Text() << " is " << id;
 }
 
 TEST(RegistryNew, FactoriesMakeObjects) {
@@ -155,35 +128,25 @@ TEST(RegistryNew, FactoriesMakeObjects) {
     const Registry *made = l.Add("RegTestMade", {{RegConstructor, &MakeWidget}});
     const Registry *failing = l.Add("RegTestFailing", {{RegConstructor, &MakeNothing}});
     const Registry *abstract = l.Add("RegTestAbstract", {});
-    EXPECT_TRUE(made->CanCreate());
-    EXPECT_TRUE(failing->CanCreate());
-    EXPECT_FALSE(abstract->CanCreate());
-
+    EXPECT_TRUE(made->CanCreate() && failing->CanCreate() && !abstract->CanCreate());
     std::unique_ptr<Object> obj(made->New(ScriptVal(42.0), TagList()));
     auto *w = dynamic_cast<Widget *>(obj.get());
     ASSERT_NE(w, nullptr);
-    EXPECT_EQ(w->seenReg, made);
-    EXPECT_EQ(w->arg, 42.0);
-    EXPECT_EQ(obj->GetRegistry(), made);
-    std::unique_ptr<Object> viaNewObj(NewObj(*made, ScriptVal(7.0), TagList()));
-    ASSERT_NE(dynamic_cast<Widget *>(viaNewObj.get()), nullptr);
-    EXPECT_EQ(dynamic_cast<Widget *>(viaNewObj.get())->arg, 7.0);
-    EXPECT_EQ(failing->New(ScriptVal(), TagList()), nullptr);
-    EXPECT_EQ(abstract->New(ScriptVal(), TagList()), nullptr);
-
+    EXPECT_EQ(std::tuple(w->seenReg, w->arg, obj->GetRegistry()), std::tuple(made, 42.0, made));
+    EXPECT_FALSE(failing->New(ScriptVal(), TagList()) || abstract->New(ScriptVal(), TagList()));
     // The list's New finds the class and passes the document on.
     int marker = 0;
     auto *doc = reinterpret_cast<OrvaneDoc *>(&marker); // only carried, never used
     std::unique_ptr<Object> byId(l.list->New(OvID("RegTestMade"), 0, doc));
     ASSERT_NE(dynamic_cast<Widget *>(byId.get()), nullptr);
-    EXPECT_EQ(dynamic_cast<Widget *>(byId.get())->doc, &marker);
-    EXPECT_EQ(byId->GetRegistry(), made);
+    EXPECT_EQ(std::pair(dynamic_cast<Widget *>(byId.get())->doc, byId->GetRegistry()),
+              std::pair(static_cast<const void *>(&marker), made));
     for (const char *id : {"RegTestFailing", "RegTestAbstract", "RegTestNowhere"})
         EXPECT_EQ(l.list->New(OvID(id), 0, nullptr), nullptr) << id;
     EXPECT_EQ(l.list->New(OvID("RegTestMade"), RegKindTool, nullptr), nullptr) << "the wrong type";
 }
 
-TEST(RegistryInit, RefusedRowsAreDisabled) {
+TEST(RegistryInit, RefusedRowsAreDisabledAndStartUpHooksMayLookUpTheList) {
     hookLog.clear();
     LocalList l;
     Registry *yes =
@@ -195,16 +158,10 @@ TEST(RegistryInit, RefusedRowsAreDisabled) {
     l.list->InitAll();
     l.list->InitAll(); // once only
     EXPECT_EQ(hookLog, (std::vector<std::string>{"accept RegTestYes", "refuse RegTestNo"}));
-    EXPECT_TRUE(yes->IsEnabled());
-    EXPECT_FALSE(no->IsEnabled());
-    EXPECT_TRUE(plain->IsEnabled());
-    EXPECT_EQ(l.Find("RegTestNo"), nullptr);
-    EXPECT_EQ(l.Find("RegTestOldNo"), nullptr);
-    EXPECT_EQ(l.Find("RegTestYes"), yes);
-    EXPECT_EQ(no->New(ScriptVal(), TagList()), nullptr);
-    EXPECT_EQ(l.list->New(OvID("RegTestNo"), 0, nullptr), nullptr);
+    EXPECT_TRUE(yes->IsEnabled() && !no->IsEnabled() && plain->IsEnabled());
+    EXPECT_TRUE(!l.Find("RegTestNo") && !l.Find("RegTestOldNo") && l.Find("RegTestYes") == yes);
+    EXPECT_FALSE(no->New(ScriptVal(), TagList()) || l.list->New(OvID("RegTestNo"), 0, nullptr));
     EXPECT_EQ(l.list->Size(), 2u);
-
     // Rows entered after InitAll start at once.
     hookLog.clear();
     EXPECT_TRUE(l.Add("RegTestLate", {{RegInitFunc, &AcceptInit}})->IsEnabled());
@@ -214,27 +171,23 @@ TEST(RegistryInit, RefusedRowsAreDisabled) {
     l.list->CleanupAll();
     EXPECT_EQ(hookLog, (std::vector<std::string>{"accept RegTestLate", "refuse RegTestLateNo", "cleanup RegTestYes",
                                                  "cleanup RegTestNoHook"}));
-}
-
-TEST(RegistryInit, StartUpHooksMayLookUpTheList) {
     static const OvID baseId("RegTestHookBase");
     hookLog.clear();
-    LocalList l;
-    l.Add("RegTestHookBase", {});
-    l.Add("RegTestHookEarly", {{RegBaseClass, &baseId}, {RegInitFunc, &LookupInit}});
-    l.list->InitAll();
-    // The same hook on a row entered after InitAll. Run on a thread of its own
-    // so that a hook blocked on the list's lock fails the test instead of
-    // hanging it.
+    LocalList hooked;
+    hooked.Add("RegTestHookBase", {});
+    hooked.Add("RegTestHookEarly", {{RegBaseClass, &baseId}, {RegInitFunc, &LookupInit}});
+    hooked.list->InitAll();
+    // The same hook on a row entered after InitAll. Run on a thread of its own so that a hook blocked on the list's
+    // lock fails the test instead of hanging it.
     auto done = std::make_shared<std::promise<void>>();
     std::future<void> finished = done->get_future();
-    std::thread([listRef = &l.list, done] {
+    std::thread([listRef = &hooked.list, done] {
         TagList tags{{RegBaseClass, &baseId}, {RegInitFunc, &LookupInit}};
         Registry::_Init(listRef, OvID("RegTestHookLate"), tags);
         done->set_value();
     }).detach();
     if (finished.wait_for(std::chrono::seconds(20)) != std::future_status::ready) {
-        l.list = nullptr; // the blocked thread still uses it: leave it alive
+        hooked.list = nullptr; // the blocked thread still uses it: leave it alive
         FAIL() << "a start-up hook of a late row blocked on the registry lock";
     }
     EXPECT_EQ(hookLog, (std::vector<std::string>{"base RegTestHookBase, self", "base RegTestHookBase, self"}));
@@ -249,16 +202,12 @@ TEST(RegistryRemove, TakesRowsOut) {
     EXPECT_EQ(l.Ids(), (std::vector<std::string>{"RegTestRemA", "RegTestRemC"}));
     for (const char *gone : {"RegTestRemB", "RegTestRemOldB", "RegTestRemOldB2"})
         EXPECT_EQ(l.Find(gone), nullptr) << gone;
-    EXPECT_EQ(l.Find("RegTestRemOldA"), a);
-    EXPECT_EQ(l.Find("RegTestRemOldC"), c);
-
+    EXPECT_TRUE(l.Find("RegTestRemOldA") == a && l.Find("RegTestRemOldC") == c);
     // A row that is not in this list is ignored.
     LocalList other;
     const Registry *foreign = other.Add("RegTestRemForeign", {});
     l.list->Remove(foreign);
-    EXPECT_EQ(l.list->Size(), 2u);
-    EXPECT_EQ(other.Find("RegTestRemForeign"), foreign);
-
+    EXPECT_TRUE(l.list->Size() == 2u && other.Find("RegTestRemForeign") == foreign);
     // A second row with the same ID hides the first until it is removed.
     const Registry *shadow = l.Add("RegTestRemA", {});
     EXPECT_EQ(l.Find("RegTestRemA"), shadow);
@@ -266,8 +215,7 @@ TEST(RegistryRemove, TakesRowsOut) {
     EXPECT_EQ(l.Find("RegTestRemA"), a);
     l.list->Remove(a);
     l.list->Remove(c);
-    EXPECT_EQ(l.list->Size(), 0u);
-    EXPECT_TRUE(l.list->Rows().empty());
+    EXPECT_TRUE(l.list->Size() == 0u && l.list->Rows().empty());
 }
 
 } // namespace

@@ -9,6 +9,7 @@
 #include <limits>
 #include <random>
 #include <string>
+#include <tuple>
 #include <vector>
 
 namespace Orvane::scriptval_test {
@@ -51,10 +52,7 @@ void ExpectPlacesInText(const ScriptVal &v, const std::string &text) {
 }
 
 TEST(ScriptValValue, Equality) {
-    const struct {
-        ScriptVal a, b;
-        bool equal;
-    } cases[] = {
+    const std::tuple<ScriptVal, ScriptVal, bool> cases[] = {
         {ScriptVal(static_cast<const char *>(nullptr)), ScriptVal(), true},
         {ScriptVal(kNaN), ScriptVal(-kNaN), true},
         {ScriptVal(0.0), ScriptVal(-0.0), true},
@@ -66,13 +64,11 @@ TEST(ScriptValValue, Equality) {
         {Make({{"t", Make({{1, "a"}})}}), Make({{"t", Make({{1, "b"}})}}), false},
         {Parse("-- c\n{ 1, 2 }"), Make({{1, 1}, {2, 2}}), true}, // places and comments do not count
     };
-    for (const auto &c : cases) {
-        EXPECT_EQ(c.a == c.b, c.equal) << c.a.ToText() << " and " << c.b.ToText();
-        EXPECT_EQ(c.b != c.a, !c.equal) << c.a.ToText() << " and " << c.b.ToText();
-    }
+    for (const auto &[a, b, equal] : cases)
+        EXPECT_EQ(std::pair(a == b, b != a), std::pair(equal, !equal)) << a.ToText() << " and " << b.ToText();
 }
 
-TEST(ScriptValTable, MisuseIsReported) {
+TEST(ScriptValTable, MisuseIsReportedAndTableOfMakesWhatSetMakesButRefusesRepeatedKeys) {
     for (const char *bad : {"", "1abc", "a..b", "a.", ".a", "a b", "end", "a.nil", "Tool-1", "\xc3\xbc"}) {
         EXPECT_THROW(ScriptVal::Ref(bad), std::invalid_argument) << bad;
         EXPECT_THROW(ScriptVal::Table(*bad ? bad : "-"), std::invalid_argument) << bad;
@@ -92,19 +88,32 @@ TEST(ScriptValTable, MisuseIsReported) {
     // Setting into nil makes a plain table.
     EXPECT_EQ(ScriptVal().Set("k", 1), Make({{"k", 1}}));
     EXPECT_EQ(ScriptVal().Append("x"), Make({{1, "x"}}));
+    const ScriptVal of = ScriptVal::TableOf("Point", {{1, "a"}, {2, "b"}, {"x", 2}, {"1", 3}, {false, 0}});
+    EXPECT_EQ(of, Make({{1, "a"}, {2, "b"}, {"x", 2}, {"1", 3}, {false, 0}}, "Point"));
+    EXPECT_TRUE(*of.At(2) == ScriptVal("b") && !of.At(3));
+    EXPECT_EQ(ScriptVal::TableOf({}, {{"x", 1}, {2, 2}, {1, 1}}).ArrayLength(), 2u);
+    for (const auto &[entries, message] : std::vector<std::pair<std::vector<ScriptVal::Entry>, std::string>>{
+             {{{"a", 1}, {"b", 2}, {"a", 3}}, "key \"a\" given twice"},
+             {{{0.0, 1}, {-0.0, 2}}, "key -0 given twice"},
+             {{{kNaN, 1}}, "invalid key or nil value"},
+             {{{ScriptVal::Table(), 1}}, "invalid key or nil value"},
+             {{{"a", ScriptVal()}}, "invalid key or nil value"}}) {
+        try {
+            ADD_FAILURE() << "accepted " << ScriptVal::TableOf({}, entries).ToText();
+        } catch (const std::invalid_argument &e) {
+            EXPECT_EQ(e.what(), "ScriptVal::TableOf: " + message);
+        }
+    }
+    EXPECT_THROW(ScriptVal::TableOf("not a name", {}), std::invalid_argument);
 }
 
 // Random edits checked against a plain list of entries kept by the test; copies taken on the way never change.
 TEST(ScriptValTable, RandomEditsMatchAPlainModel) {
     using Model = std::vector<ScriptVal::Entry>;
-    auto find = [](const Model &m, const ScriptVal &key) -> const ScriptVal * {
-        for (const auto &e : m)
-            if (e.first == key) return &e.second;
-        return nullptr;
-    };
-    auto arrayLength = [&](const Model &m) {
+    auto arrayLength = [](const Model &m) {
         size_t n = 0;
-        while (find(m, ScriptVal(static_cast<double>(n + 1)))) ++n;
+        while (std::ranges::any_of(m, [&](const auto &e) { return e.first == ScriptVal(static_cast<double>(n + 1)); }))
+            ++n;
         return n;
     };
     // Texts that read like numbers, both zeros, booleans, a fraction and a negative: keys of one kind never meet
@@ -134,35 +143,14 @@ TEST(ScriptValTable, RandomEditsMatchAPlainModel) {
                 snapshot = t;
                 snapshotModel = model;
             }
-            ASSERT_EQ(t.Entries(), model) << "round " << round << " step " << step;
-            ASSERT_EQ(t.ArrayLength(), arrayLength(model)) << "round " << round << " step " << step;
+            ASSERT_EQ(std::pair(t.Entries(), t.ArrayLength()), std::pair(model, arrayLength(model)))
+                << "round " << round << " step " << step;
             ASSERT_EQ(snapshot.Entries(), snapshotModel) << "a copy changed with the original";
         }
     }
 }
 
-TEST(ScriptValTable, TableOfMakesWhatSetMakesAndRefusesRepeatedKeys) {
-    const ScriptVal t = ScriptVal::TableOf("Point", {{1, "a"}, {2, "b"}, {"x", 2}, {"1", 3}, {false, 0}});
-    EXPECT_EQ(t, Make({{1, "a"}, {2, "b"}, {"x", 2}, {"1", 3}, {false, 0}}, "Point"));
-    EXPECT_EQ(*t.At(2), ScriptVal("b"));
-    EXPECT_EQ(t.At(3), nullptr);
-    EXPECT_EQ(ScriptVal::TableOf({}, {{"x", 1}, {2, 2}, {1, 1}}).ArrayLength(), 2u);
-    for (const auto &[entries, message] : std::vector<std::pair<std::vector<ScriptVal::Entry>, std::string>>{
-             {{{"a", 1}, {"b", 2}, {"a", 3}}, "key \"a\" given twice"},
-             {{{0.0, 1}, {-0.0, 2}}, "key -0 given twice"},
-             {{{kNaN, 1}}, "invalid key or nil value"},
-             {{{ScriptVal::Table(), 1}}, "invalid key or nil value"},
-             {{{"a", ScriptVal()}}, "invalid key or nil value"}}) {
-        try {
-            ADD_FAILURE() << "accepted " << ScriptVal::TableOf({}, entries).ToText();
-        } catch (const std::invalid_argument &e) {
-            EXPECT_EQ(e.what(), "ScriptVal::TableOf: " + message);
-        }
-    }
-    EXPECT_THROW(ScriptVal::TableOf("not a name", {}), std::invalid_argument);
-}
-
-TEST(ScriptValNumbers, WrittenShortestReadBackBitExactAndReadInEveryForm) {
+TEST(ScriptValScalars, NumbersAndTextsAreWrittenShortestOrEscapedAndReadInEveryForm) {
     std::string written;
     for (double d : {0.0, -0.0, -42.0, 0.1, 1e5, 1e300, 5e-324, kInf, -kInf, kNaN, -kNaN, 1.0 / 3, 0x1p53 + 2})
         written += ScriptVal(d).ToText() + " ";
@@ -187,47 +175,39 @@ TEST(ScriptValNumbers, WrittenShortestReadBackBitExactAndReadInEveryForm) {
     read += Parse("0." + std::string(400, '0') + "1").ToText();
     // 0x7fff... rounds to 2^63, 3e-324 to the smallest denormal; an underflow reads as zero with its sign.
     EXPECT_EQ(read, "16 255 16 0.5 21 9223372036854775808 0.01 2500 0.5 5 -3 -16 -1/0 1/0 0/0 5e-324 0 -0 -0 0");
-}
-
-TEST(ScriptValText, WrittenWithEscapesAndReadInEveryForm) {
-    std::string written;
+    std::string writtenText;
     for (const std::string &text :
          {std::string(), std::string("say \"hi\" it's"), std::string("back\\slash"), std::string("a\nb\rc\td"),
           std::string("\0x", 2), std::string("\0001", 2), std::string("\x01\x1f\x7f"), std::string("\0339"),
           std::string("\xc3\xa9 \xff\x80")}) {
-        written += ScriptVal(text).ToText() + " ";
+        writtenText += ScriptVal(text).ToText() + " ";
         EXPECT_EQ(Parse(ScriptVal(text).ToText()).AsText(), text);
     }
     // A decimal escape is padded to three digits where a digit follows; bytes from 0x80 stay as they are.
-    EXPECT_EQ(written, R"("" "say \"hi\" it's" "back\\slash" "a\nb\rc\td" "\0x" "\0001" "\1\31\127" "\0279" )"
-                       "\"\xc3\xa9 \xff\x80\" ");
+    EXPECT_EQ(writtenText, R"("" "say \"hi\" it's" "back\\slash" "a\nb\rc\td" "\0x" "\0001" "\1\31\127" "\0279" )"
+                           "\"\xc3\xa9 \xff\x80\" ");
     std::string all;
-    for (int c = 0; c < 256; ++c) {
-        all += static_cast<char>(c);
-        all += static_cast<char>('0' + c % 10); // a digit after each byte tests escape padding
-    }
+    // A digit after each byte tests escape padding.
+    for (int c = 0; c < 256; ++c) all.append({static_cast<char>(c), static_cast<char>('0' + c % 10)});
     EXPECT_EQ(Parse(ScriptVal(all).ToText()).AsText(), all);
-    std::string read;
+    std::string readText;
     for (const std::string &text :
          {std::string(R"('it\'s "q"')"), std::string(R"("\a\b\f\n\r\t\v\\\"\'")"), std::string(R"("\65\066\0677\255")"),
           std::string(R"("a\0b")"), std::string("\"a\0b\"", 5), std::string("\"a\\\nb\\\r\nc\""),
           std::string("[[\n\nl1\r\nl2\rl3]]"), std::string("[==[a]]b]=]c]==]"), std::string(R"([[a\nb]])")})
-        read += Parse(text).ToText() + " ";
+        readText += Parse(text).ToText() + " ";
     // Line breaks in a text read as \n; only the one right after a long bracket is dropped.
-    EXPECT_EQ(read, R"("it's \"q\"" "\7\8\12\n\r\t\11\\\"'" "ABC7)"
-                    "\xff"
-                    R"(" "a\0b" "a\0b" "a\nb\nc" )"
-                    R"("\nl1\nl2\nl3" "a]]b]=]c" "a\\nb" )");
+    EXPECT_EQ(readText, R"("it's \"q\"" "\7\8\12\n\r\t\11\\\"'" "ABC7)"
+                        "\xff"
+                        R"(" "a\0b" "a\0b" "a\nb\nc" )"
+                        R"("\nl1\nl2\nl3" "a]]b]=]c" "a\\nb" )");
 }
 
 TEST(ScriptValWrite, ScalarsSmallTablesAndTheOneLineLimit) {
     ScriptVal mixed = ScriptVal::Table();
     mixed.Append(1).Append(2).Set("x", 3);
     const ScriptVal keys = Make({{"not id", 1}, {"end", 2}, {1.5, 3}, {true, 4}, {kInf, 5}, {"_ok9", 7}});
-    const struct {
-        ScriptVal value;
-        std::string text;
-    } cases[] = {
+    const std::pair<ScriptVal, std::string> cases[] = {
         {ScriptVal(), "nil"},
         {ScriptVal(false), "false"},
         {ScriptVal::Table("Orvane.Document"), "Orvane.Document {}"},
@@ -237,10 +217,7 @@ TEST(ScriptValWrite, ScalarsSmallTablesAndTheOneLineLimit) {
         {Make({{"Pos", ScriptVal::Ref("A.B")}}, "Point"), "Point { Pos = A.B }"},
         {keys, "{ [\"not id\"] = 1, [\"end\"] = 2, [1.5] = 3, [true] = 4, [1/0] = 5, _ok9 = 7 }"},
     };
-    for (const auto &c : cases) {
-        EXPECT_EQ(c.value.ToText(), c.text);
-        EXPECT_EQ(Parse(c.text), c.value) << c.text;
-    }
+    for (const auto &[value, text] : cases) EXPECT_EQ(std::pair(value.ToText(), Parse(text)), std::pair(text, value));
     // `{ "..." }` is the text length plus 6.
     ScriptVal fits = ScriptVal::Table(), tooLong = ScriptVal::Table();
     fits.Append(std::string(74, 'x'));
@@ -254,9 +231,7 @@ TEST(ScriptValWrite, ScalarsSmallTablesAndTheOneLineLimit) {
 }
 
 TEST(ScriptValPlaces, CommentsAndPlacesStayThroughARoundTrip) {
-    const struct {
-        std::string text, written, comments;
-    } cases[] = {
+    const std::tuple<std::string, std::string, std::string> cases[] = {
         {"-- top\n-- two\n{ a = 1, -- on a\n  -- before b\n  b = { 1, 2 }, c = 3 -- on c\n}",
          "-- top\n-- two\n{\n\ta = 1, -- on a\n\t-- before b\n\tb = { 1, 2 },\n\tc = 3, -- on c\n}",
          " before: -- top\n before: -- two\n/\"a\" after: -- on a\n/\"b\" before: -- before b\n/\"c\" after: -- on "
@@ -273,16 +248,12 @@ TEST(ScriptValPlaces, CommentsAndPlacesStayThroughARoundTrip) {
          "\tLink = Tool.Output,\n\tkey = 16,\n}",
          " before: -- by hand\n/\"Tools\" before: --[[ a\n long comment ]]\n"},
     };
-    for (const auto &c : cases) {
-        SCOPED_TRACE(c.text);
-        const ScriptVal v = Parse(c.text);
-        EXPECT_EQ(CommentsOf(v), c.comments);
-        EXPECT_EQ(v.ToText(), c.written);
-        const ScriptVal back = Parse(c.written);
-        EXPECT_EQ(back, v);
-        EXPECT_EQ(CommentsOf(back), c.comments);
-        EXPECT_EQ(back.ToText(), c.written);
-        ExpectPlacesInText(back, c.written);
+    for (const auto &[text, written, comments] : cases) {
+        SCOPED_TRACE(text);
+        const ScriptVal v = Parse(text), back = Parse(written);
+        EXPECT_EQ(std::pair(CommentsOf(v), v.ToText()), std::pair(comments, written));
+        EXPECT_EQ(std::tuple(back, CommentsOf(back), back.ToText()), std::tuple(v, comments, written));
+        ExpectPlacesInText(back, written);
     }
     // Lines end at CR LF as well; columns count characters, not bytes. Values made in code have no place.
     const ScriptVal v = Parse("-- c\r\n{ \"\xc3\xa9\", y = -2 }");
@@ -292,7 +263,7 @@ TEST(ScriptValPlaces, CommentsAndPlacesStayThroughARoundTrip) {
 }
 
 // What loose text means, shown as the canonical text of what was read.
-TEST(ScriptValParse, Structure) {
+TEST(ScriptValParse, StructureAndRepeatedKeysNotedWithBothPlaces) {
     std::string read;
     for (const std::string text :
          {"  true  ", "\xEF\xBB\xBF{ a = 1 }", "{ 'a', x = 1, 'b', [10] = 'j', 'c' }", "{ [1] = 'a', 'b' }",
@@ -310,15 +281,9 @@ TEST(ScriptValParse, Structure) {
     for (const ScriptVal *p = &deep; p->Size() == 1; p = p->At(1)) ++depth;
     EXPECT_EQ(depth, 256);
     EXPECT_EQ(Parse(deep.ToText()), deep);
-}
-
-TEST(ScriptValParse, RepeatedKeysAreNotedWithBothPlaces) {
     std::string many = "{ ";
     for (int i = 1; i <= 20; ++i) many += "k" + std::to_string(i) + " = 1, "; // past the size where keys are indexed
-    const struct {
-        std::string text;
-        std::vector<std::string> notes;
-    } cases[] = {
+    const std::pair<std::string, std::vector<std::string>> cases[] = {
         {"{ a = 1,\n  a = 2 }", {"line 2, column 3: 'a' is given twice (first at line 1)"}},
         {"{ ['a b'] = 1, [2.5] = 2,\n[\"a b\"] = 3, [true] = 0, [2.5] = 4, [true] = 1 }",
          {"line 2, column 2: [\"a b\"] is given twice (first at line 1)",
@@ -329,17 +294,17 @@ TEST(ScriptValParse, RepeatedKeysAreNotedWithBothPlaces) {
         {"{ [1] = 'a',\n 'b' }", {"line 2, column 2: [1] is given twice (first at line 1)"}},
         {many + "\n\n k7 = 2 }", {"line 3, column 2: 'k7' is given twice (first at line 1)"}},
     };
-    for (const auto &c : cases) {
+    for (const auto &[text, want] : cases) {
         std::vector<ScriptParseError> notes;
-        EXPECT_EQ(ScriptVal::FromText(c.text, &notes), Parse(c.text));
+        EXPECT_EQ(ScriptVal::FromText(text, &notes), Parse(text));
         std::vector<std::string> got;
         for (const ScriptParseError &n : notes) got.push_back(n.what());
-        EXPECT_EQ(got, c.notes) << c.text;
+        EXPECT_EQ(got, want) << text;
     }
 }
 
-// Many fields with repeats and removals: the parsed table matches the same fields applied through Set, and every
-// key given again is noted once.
+// Many fields with repeats and removals: the parsed table matches the same fields applied through Set, and every key
+// given again is noted once.
 TEST(ScriptValParse, LargeTablesFollowSetSemantics) {
     std::mt19937 rng(7);
     for (int round = 0; round < 10; ++round) {
@@ -367,13 +332,9 @@ TEST(ScriptValParse, LargeTablesFollowSetSemantics) {
 
 TEST(ScriptValParse, ErrorPositions) {
     const std::string deep = std::string(256, '{') + std::string(256, '}');
-    const struct {
-        std::string text;
-        int line, column;
-        std::string message;
-    } cases[] = {
+    const std::tuple<std::string, int, int, std::string> cases[] = {
         {"{" + deep + "}", 1, 257, "nesting too deep"},
-        {"A{" + deep + "}", 1, 258, "nesting too deep"}, // typed tables count
+        {"A{" + deep + "}", 1, 258, "nesting too deep"},
         {std::string(1000000, '{'), 1, 257, "nesting too deep"},
         {"{\n" + deep, 2, 256, "nesting too deep"},
         {"{ a = \"abc", 1, 7, "unfinished string"},
@@ -418,16 +379,14 @@ TEST(ScriptValParse, ErrorPositions) {
         {std::string("{ \0 }", 5), 1, 3, "unexpected byte 0x00"},
         {"{ \"\xc3\xbc\xe2\x9c\x93\" + }", 1, 8, "unexpected symbol '+'"},
         {"{\r\n a = 1\r\n +", 3, 2, "unexpected symbol '+'"},
-        {"{\r\r+", 3, 1, "unexpected symbol '+'"},
-    };
-    for (const auto &c : cases) {
+        {"{\r\r+", 3, 1, "unexpected symbol '+'"}};
+    for (const auto &[text, line, column, message] : cases) {
         try {
-            ADD_FAILURE() << "parsed without error as: " << Parse(c.text).ToText();
+            ADD_FAILURE() << "parsed without error as: " << Parse(text).ToText();
         } catch (const ScriptParseError &e) {
-            EXPECT_EQ(std::make_tuple(e.Line(), e.Column(), e.Message()), std::make_tuple(c.line, c.column, c.message))
-                << c.text;
-            EXPECT_EQ(e.what(),
-                      "line " + std::to_string(c.line) + ", column " + std::to_string(c.column) + ": " + c.message);
+            EXPECT_EQ(std::make_tuple(e.Line(), e.Column(), e.Message()), std::make_tuple(line, column, message))
+                << text;
+            EXPECT_EQ(e.what(), "line " + std::to_string(line) + ", column " + std::to_string(column) + ": " + message);
         }
     }
 }

@@ -8,8 +8,8 @@
 namespace Orvane::suggest_test {
 namespace {
 
-// Distances worked out by hand: each counts the fewest inserted, deleted, replaced or swapped neighbouring
-// characters, case aside, where no character is edited twice ("ca" to "abc" takes three, not two).
+// Distances worked out by hand: each counts the fewest inserted, deleted, replaced or swapped neighbouring characters,
+// case aside, where no character is edited twice ("ca" to "abc" takes three, not two).
 TEST(Suggest, NameDistanceCountsEditsIgnoringCase) {
     const struct {
         const char *a, *b;
@@ -35,8 +35,6 @@ TEST(Suggest, OnlyCloseNamesAreOffered) {
         offered += std::string(word) + ":" + ClosestName(word, names) + " ";
     EXPECT_EQ(offered, "gIAN:Gain Xain:Gain gama:Gamma Sturatin:Saturation Satxrxtixn:Saturation Sxturxtxox: "
                        "Blxnx:Blend Bxxnx: Bnd: Ac:Ab Xy: Game: ");
-    EXPECT_EQ(DidYouMean("Blnd", names), " (did you mean 'Blend'?)");
-    EXPECT_EQ(DidYouMean("Lift", names), "");
     EXPECT_EQ(ClosestName("Gain", {}), "");
 }
 

@@ -1,7 +1,5 @@
-// The common controls the host adds to tools (Blend, the channel switches,
-// the effect mask) and what PostProcess makes of them, checked pixel by pixel
-// against the mixing rule worked out here, over an area reaching beyond
-// every data window so that windows and canvas colours are checked too.
+// The common controls and what PostProcess makes of them, checked pixel by pixel against the mixing rule worked out
+// here, over an area reaching beyond every data window so that windows and canvas colours are checked too.
 #include <algorithm>
 #include <optional>
 #include <string>
@@ -18,8 +16,8 @@ namespace Orvane::commoncontrolstest {
 namespace ts = ::Orvane::Test;
 namespace {
 
-/// Outputs a fixed image given by the test, or passes its input on when it
-/// has none. Pre-calculation gives the same windows without pixels.
+/// Outputs a fixed image given by the test, or passes its input on when it has none. Pre-calculation gives the same
+/// windows without pixels.
 class Tool : public ThreadedOperator {
 public:
     Tool(const Registry *reg, const ScriptVal &args, const TagList &tags, bool withInput = true)
@@ -69,29 +67,17 @@ TEST(CommonControls, ExistAsTheClassAsksFor) {
         Ref<OrvaneDoc> doc = MakeRef<OrvaneDoc>();
         Operator *op = doc->AddTool(cls, "T1");
         ASSERT_NE(op, nullptr);
-        for (int i = 0; i < 10; ++i)
-            EXPECT_EQ(op->FindInput(ids[i]) != nullptr, (has & (i < 5   ? HasBlend
-                                                                : i < 9 ? HasMask
-                                                                        : HasClipping)) != 0)
-                << ids[i];
-        EXPECT_EQ(op->Common().blend != nullptr, (has & HasBlend) != 0);
-        EXPECT_EQ(op->Common().effectMask != nullptr, (has & HasMask) != 0);
-        EXPECT_EQ(op->Common().clippingMode != nullptr, (has & HasClipping) != 0);
+        for (int i = 0; i < 10; ++i) // the first five are blend controls, the next four the mask's
+            EXPECT_EQ(!op->FindInput(ids[i]), !(has & (i < 5 ? HasBlend : i < 9 ? HasMask : HasClipping))) << ids[i];
+        const Operator::CommonInputs &common = op->Common();
+        EXPECT_EQ(std::tuple(!common.blend, !common.effectMask, !common.clippingMode),
+                  std::tuple(!(has & HasBlend), !(has & HasMask), !(has & HasClipping)));
         const Input *mask = op->FindInput("EffectMask"), *clip = op->FindInput("ClippingMode");
         EXPECT_TRUE(!mask || (mask->Priority() == PriorityMask && !mask->IsRequired() &&
                               mask->DataType() == CLSID_DataType_Mask));
         EXPECT_TRUE(!clip || dynamic_cast<const IDValue &>(*clip->Default()).value == ClippingMode_None);
-        if (Input *blend = op->FindInput("Blend")) {
-            EXPECT_EQ(dynamic_cast<const Number &>(*blend->Default()).value, 1.0);
-            for (const auto &[set, kept] : {std::pair{1.5, 1.0}, {-0.5, 0.0}}) {
-                ASSERT_TRUE(blend->SetValue(MakeRef<Number>(set)));
-                EXPECT_EQ(dynamic_cast<const Number &>(*blend->Constant()).value, kept) << "Blend stays within 0..1";
-            }
-        }
     }
 }
-
-// ---- PostProcess -----------------------------------------------------------
 
 enum MaskKind { NoMask, RGBAMask, GreyRGBAMask, SingleChannelMask };
 
@@ -127,6 +113,8 @@ FltPixel Mixed(const MixCase &c, const FltPixel &in, const FltPixel &res, const 
     return {o[0], o[1], o[2], o[3]};
 }
 
+const std::string Channels[] = {"Red", "Green", "Blue", "Alpha"};
+
 void RunMix(const MixCase &c) {
     SCOPED_TRACE(c.name);
     Ref<OrvaneDoc> doc = MakeRef<OrvaneDoc>();
@@ -148,15 +136,9 @@ void RunMix(const MixCase &c) {
     tool->result = res;
     ASSERT_TRUE(c.generator || tool->input->ConnectTo(ts::AddImageSource(*doc, "Src", src)->Out()));
     ASSERT_TRUE(!mask || tool->Common().effectMask->ConnectTo(ts::AddImageSource(*doc, "MaskSrc", mask)->Out()));
-    ts::SetNumbers(tool, {{"ProcessRed", c.process[0]},
-                          {"ProcessGreen", c.process[1]},
-                          {"ProcessBlue", c.process[2]},
-                          {"ProcessAlpha", c.process[3]}});
-    ts::SetNumbers(tool, {{"Blend", c.blend},
-                          {"EffectMaskChannel", c.channel},
-                          {"EffectMaskInvert", c.invert},
-                          {"MultiplyByMask", c.multiply}});
-
+    for (int ch = 0; ch < 4; ++ch) ts::SetNumber(tool, ("Process" + Channels[ch]).c_str(), c.process[ch]);
+    ts::SetNumbers(tool, {{"Blend", c.blend}, {"EffectMaskChannel", c.channel}});
+    ts::SetNumbers(tool, {{"EffectMaskInvert", c.invert}, {"MultiplyByMask", c.multiply}});
     Ref<Image> out = ts::EvalImage(tool, 0.0, c.roi ? &*c.roi : nullptr);
     ASSERT_TRUE(out);
     EXPECT_EQ(ts::ConsoleText(*doc), "");
@@ -177,15 +159,12 @@ void RunMix(const MixCase &c) {
     EXPECT_TRUE(!c.roi || c.roi->Contains(out->DataWindow())) << ts::RectText(out->DataWindow());
 }
 
-TEST(CommonControls, BlendChannelSwitchesAndTheEffectMaskMixResultAndInput) {
+TEST(CommonControls, BlendChannelSwitchesAndTheEffectMaskMixResultAndInputAndWindowsGrowWhereNeeded) {
+    const FltPixel opaque{0.5f, 0.25f, 0.f, 1.f};
     const MixCase cases[] = {
         {.name = "blend 0.25", .blend = 0.25},
         {.name = "blend 0", .blend = 0.0},
-        {.name = "result window larger than the input's, blend 0.25",
-         .blend = 0.25,
-         .srcWindow = {4, 4, 8, 8},
-         .resWindow = {0, 0, 16, 12},
-         .srcCanvas = {0.5f, 0.25f, 0.f, 1.f}},
+        {.name = "wider", .blend = 0.25, .srcWindow = {4, 4, 8, 8}, .resWindow = {0, 0, 16, 12}, .srcCanvas = opaque},
         {.name = "red and alpha off", .process = {false, true, true, false}},
         {.name = "green off, blend 0.6", .blend = 0.6, .process = {true, false, true, true}},
         {.name = "all off", .blend = 0.6, .process = {false, false, false, false}},
@@ -194,23 +173,15 @@ TEST(CommonControls, BlendChannelSwitchesAndTheEffectMaskMixResultAndInput) {
         {.name = "green mask, inverted", .mask = RGBAMask, .channel = 2, .invert = true},
         {.name = "blue mask", .mask = RGBAMask, .channel = 3},
         {.name = "luminance of a grey mask", .mask = GreyRGBAMask, .channel = 4},
-        {.name = "luminance, inverted, blend 0.4", .blend = 0.4, .mask = GreyRGBAMask, .channel = 4, .invert = true},
+        {.name = "luminance, inverted", .blend = 0.4, .mask = GreyRGBAMask, .channel = 4, .invert = true},
         {.name = "single-channel mask, green", .mask = SingleChannelMask, .channel = 2},
         {.name = "multiply by mask", .mask = RGBAMask, .multiply = true},
-        {.name = "multiply by inverted red, blend 0.5",
-         .blend = 0.5,
-         .mask = RGBAMask,
-         .channel = 1,
-         .invert = true,
-         .multiply = true},
+        {.name = "times inverted red", .blend = 0.5, .mask = RGBAMask, .channel = 1, .invert = true, .multiply = true},
         {.name = "generator, masked", .mask = RGBAMask, .channel = 1, .generator = true},
-        {.name = "generator, blend 0.25: mixed with transparent black", .blend = 0.25, .generator = true},
+        {.name = "generator: mixed with transparent black", .blend = 0.25, .generator = true},
         {.name = "region", .blend = 0.5, .mask = RGBAMask, .roi = ImgRectI(2, 3, 9, 8)},
     };
     for (const MixCase &c : cases) RunMix(c);
-}
-
-TEST(CommonControls, DataWindowsGrowWhereTheMixNeedsThem) {
     const FltPixel clear{}, grey{0.3f, 0.2f, 0.1f, 0.5f};
     for (const bool multiply : {false, true})
         for (const FltPixel &srcCanvas : {clear, grey}) {

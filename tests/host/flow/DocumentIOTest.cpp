@@ -1,13 +1,10 @@
-// Flow documents as text: exact round trips, the canonical layout and the
-// comments a writer left, what is written and what is not, every problem of a
-// document reported at once with its place, lenient loading that keeps what
-// this program does not know, class names, and atomic saving.
 #include <sys/stat.h>
 #include <unistd.h>
 
-#include <algorithm>
+#include <cstring>
 #include <filesystem>
 #include <fstream>
+#include <set>
 #include <string>
 #include <tuple>
 #include <vector>
@@ -28,8 +25,8 @@ namespace {
 
 using Names = std::vector<std::string>;
 
-/// A tool with one input of each kind a document stores, declared in the
-/// order Size, Center, Caption, Mode, Colors, Width, Histo, Choice, Input.
+/// A tool with one input of each kind a document stores, in the order Size, Center, Caption, Mode, Colors, Width,
+/// Histo, Choice, Input.
 class DocTool : public ThreadedOperator {
 public:
     DocTool(const Registry *reg, const ScriptVal &args, const TagList &tags) : ThreadedOperator(reg, args, tags) {
@@ -69,11 +66,7 @@ OvID DocToolID() {
                              {RegNoEffectMask, 1}});
 }
 
-Operator *AddDocTool(OrvaneDoc &doc, const std::string &name) {
-    Operator *op = doc.AddTool(DocToolID(), name);
-    EXPECT_NE(op, nullptr) << name;
-    return op;
-}
+Operator *AddDocTool(OrvaneDoc &doc, const std::string &name) { return doc.AddTool(DocToolID(), name); }
 
 DocumentLoadResult Load(const std::string &text, OrvaneDoc &doc, bool lenient = false) {
     DocToolID();
@@ -99,17 +92,13 @@ std::string Joined(const Names &lines) {
     return all;
 }
 
-/// Saves, loads into a fresh document, saves again: both texts must match, and so must a third generation.
+/// Saves, loads into a fresh document without a warning, saves again: both texts must match.
 void ExpectStableRoundTrip(const OrvaneDoc &doc) {
     const std::string first = SaveDocument(doc);
-    Ref<OrvaneDoc> again = MakeRef<OrvaneDoc>(), third = MakeRef<OrvaneDoc>();
+    Ref<OrvaneDoc> again = MakeRef<OrvaneDoc>();
     const DocumentLoadResult r = Load(first, *again);
-    ASSERT_TRUE(r.ok) << r.error << "\n" << first;
-    EXPECT_TRUE(r.warnings.empty()) << Joined(r.warnings);
-    const std::string second = SaveDocument(*again);
-    EXPECT_EQ(second, first);
-    ASSERT_TRUE(Load(second, *third).ok);
-    EXPECT_EQ(SaveDocument(*third), first);
+    ASSERT_TRUE(r.ok && r.warnings.empty()) << r.error << Joined(r.warnings) << "\n" << first;
+    EXPECT_EQ(SaveDocument(*again), first);
 }
 
 Ref<Gradient> TwoStops() {
@@ -147,22 +136,16 @@ TEST(DocumentIO, SaveLoadSaveGivesTheSameBytesAndRestoresWhatWasSaved) {
     doc->SetGlobalRange(-10, 250.5);
     doc->SetRenderRange(12, 48);
     ExpectStableRoundTrip(*doc);
-
     Ref<OrvaneDoc> back = MakeRef<OrvaneDoc>();
     ASSERT_TRUE(Load(SaveDocument(*doc), *back).ok);
     Operator *c2 = back->FindTool("Const1"), *a2 = back->FindTool("Anim1"), *src2 = back->FindTool("Src");
-    ASSERT_TRUE(c2 && a2 && src2);
+    ASSERT_TRUE(c2 && a2 && src2 && a2->FindInput("Center")->Curve());
     EXPECT_TRUE(c2->FindInput("Size")->Constant()->Equals(Number(1.0 / 3.0)));
     EXPECT_TRUE(c2->FindInput("Colors")->Constant()->Equals(*TwoStops()));
     EXPECT_EQ(back->FindTool("Blur_2")->FindInput("Input")->Link(), src2->FindOutput("Output"));
     EXPECT_EQ(back->FindTool("after")->FindInput("Size")->Link(), src2->FindOutput("Value"));
-    const AnimCurve *curve = a2->FindInput("Center")->Curve();
-    ASSERT_TRUE(curve && curve->Keys().size() == 2u);
-    EXPECT_EQ(curve->Keys()[0].interp, KeyInterp::Smooth);
-    EXPECT_EQ(curve->Keys()[1].interp, KeyInterp::Hold);
-    EXPECT_TRUE(curve->Keys()[1].value->Equals(Point(1.0, 0.0)));
-    EXPECT_EQ(back->GetPrefLong(PREF_FFWidth), 1280);
-    EXPECT_FALSE(back->PrefIsSet(PREF_FFHeight));
+    EXPECT_EQ(a2->FindInput("Center")->Curve()->ToScript(), center.ToScript());
+    EXPECT_TRUE(back->GetPrefLong(PREF_FFWidth) == 1280 && !back->PrefIsSet(PREF_FFHeight));
     EXPECT_EQ(std::vector<double>({back->GlobalStart(), back->GlobalEnd(), back->RenderStart(), back->RenderEnd()}),
               std::vector<double>({-10, 250.5, 12, 48}));
 }
@@ -186,32 +169,31 @@ return Orvane.Document{
   RenderRange = {5, 50}, Version = 1, GlobalRange={0,200},
 }
 )";
-    Ref<OrvaneDoc> doc = MakeRef<OrvaneDoc>(), again = MakeRef<OrvaneDoc>();
+    Ref<OrvaneDoc> doc = MakeRef<OrvaneDoc>();
     const DocumentLoadResult r = Load(hand, *doc);
-    ASSERT_TRUE(r.ok) << r.error;
-    EXPECT_TRUE(r.warnings.empty()) << Joined(r.warnings);
+    ASSERT_TRUE(r.ok && r.warnings.empty()) << r.error << Joined(r.warnings);
     const std::string canonical = SaveDocument(*doc);
     const ScriptVal root = ScriptVal::FromText(canonical);
     EXPECT_EQ(Keys(&root), (Names{"Version", "Program", "GlobalRange", "RenderRange", "Prefs", "Tools"}));
     EXPECT_EQ(Keys(root.Find("Tools")), (Names{"Alpha", "Mid", "Zed"}));
-    // Declaration order; defaults are not added (Width's neither, though it asks to be saved), but one the
-    // document gave stays.
-    EXPECT_EQ(InputKeys(canonical, "Zed"), (Names{"Size", "Width", "Input"}));
-    EXPECT_EQ(InputKeys(canonical, "Alpha"), (Names{"Size", "Center", "Mode", "Choice"}));
-    EXPECT_EQ(InputKeys(canonical, "Mid"), Names{"Width"});
+    // Declaration order; defaults are not added (Width's neither, though it asks to be saved), but one the document
+    // gave stays.
+    for (const auto &[tool, keys] : {std::pair<const char *, Names>{"Zed", {"Size", "Width", "Input"}},
+                                     {"Alpha", {"Size", "Center", "Mode", "Choice"}},
+                                     {"Mid", {"Width"}}})
+        EXPECT_EQ(InputKeys(canonical, tool), keys) << tool;
     EXPECT_EQ(ToolIn(canonical, "Mid").ClassName(), DocToolClass) << "an alias is saved as the class's ID";
+    // A choice by its number, keys in time order.
     const ScriptVal alpha = *ToolIn(canonical, "Alpha").Find("Inputs");
-    EXPECT_EQ(alpha.Find("Choice")->AsNumber(), 1);
-    ASSERT_EQ(alpha.Find("Size")->ArrayLength(), 2u);
-    EXPECT_EQ(alpha.Find("Size")->At(1)->At(1)->AsNumber(), 0) << "keys in time order";
+    EXPECT_EQ(alpha.Find("Choice")->ToText() + " " + alpha.Find("Size")->ToText(),
+              "1 Curve {\n\t{ 0, 1, Interp = \"Hold\" },\n\t{ 10, 2 },\n}");
     // The leading block, a comment before a tool and one after an input's value stay where they were.
     for (const char *kept :
          {"-- written by hand, in an order of its own\n-- orvane-render: --frames 5-50\n"
           "Orvane.Document {\n",
           "\t\t-- the last step\n\t\tZed = DocIOTestTool {", "\"ModeB\", -- a bare word for an ID\n"})
         EXPECT_NE(canonical.find(kept), std::string::npos) << kept << "\n" << canonical;
-    ASSERT_TRUE(Load(canonical, *again).ok);
-    EXPECT_EQ(SaveDocument(*again), canonical);
+    ExpectStableRoundTrip(*doc);
     // Editing keeps them; removing a tool drops its own.
     ts::SetNumber(doc->FindTool("Alpha"), "Size", 5);
     EXPECT_NE(SaveDocument(*doc).find("-- a bare word for an ID"), std::string::npos);
@@ -219,7 +201,7 @@ return Orvane.Document{
     EXPECT_EQ(SaveDocument(*doc).find("-- the last step"), std::string::npos);
 }
 
-TEST(DocumentIO, OnlyValuesThatDifferFromTheirDefaultsAreWritten) {
+TEST(DocumentIO, OnlyValuesThatDifferFromTheirDefaultsAreWrittenAndValuesReadAreChecked) {
     Ref<OrvaneDoc> doc = MakeRef<OrvaneDoc>();
     Operator *u = AddDocTool(*doc, "U1"), *same = AddDocTool(*doc, "Same"), *changed = AddDocTool(*doc, "Changed");
     ts::SetNumbers(same, {{"Size", 1.0}, {"Width", 100}});
@@ -244,9 +226,6 @@ TEST(DocumentIO, OnlyValuesThatDifferFromTheirDefaultsAreWritten) {
                                      {"Linked", {"Input"}}})
         EXPECT_EQ(InputKeys(text, tool), keys) << tool << "\n" << text;
     ExpectStableRoundTrip(*doc);
-}
-
-TEST(DocumentIO, ValuesAreCheckedAndChoicesTakenByName) {
     // Name = value for tool A1; the problem ("" when it loads); the value set when loaded leniently ("": left alone).
     const std::tuple<const char *, const char *, const char *> cases[] = {
         {"Size = 2", "", "2"},
@@ -286,17 +265,14 @@ TEST(DocumentIO, ValuesAreCheckedAndChoicesTakenByName) {
             const DocumentLoadResult r = Load(text, *doc, lenient);
             EXPECT_EQ(r.ok, lenient || !*problem) << r.error;
             ASSERT_EQ(r.problems.size(), *problem ? 1u : 0u) << r.error << Joined(r.warnings);
-            if (*problem) {
-                const DocumentProblem &p = r.problems[0];
-                EXPECT_EQ(p.error, !lenient);
-                EXPECT_EQ(p.message.rfind(problem, 0), 0u) << p.message;
-                const size_t valueAt = text.find(value) + std::string(value).find('=') + 2;
-                EXPECT_EQ(std::pair(p.line, p.column), std::pair(2, static_cast<int>(valueAt - text.find('\n'))));
-            }
+            // A problem is an error only when loading strictly, and stands where the value starts.
+            const int column = static_cast<int>(text.find(value) + std::string(value).find('=') + 2 - text.find('\n'));
+            for (const DocumentProblem &p : r.problems)
+                EXPECT_EQ(std::tuple(p.error, p.message.substr(0, strlen(problem)), p.line, p.column),
+                          std::tuple(!lenient, std::string(problem), 2, column));
             if (!lenient || !*leniently) continue;
             const Input *in = doc->FindTool("A1")->FindInput(std::string(value, std::string(value).find(' ')).c_str());
-            ASSERT_TRUE(in->Constant());
-            EXPECT_EQ(in->Constant()->ToScript().ToText(), leniently);
+            EXPECT_EQ(in->Constant() ? in->Constant()->ToScript().ToText() : "none", leniently);
         }
     }
 }
@@ -340,7 +316,7 @@ TEST(DocumentIO, EveryProblemOfADocumentIsReportedInTextOrder) {
     EXPECT_EQ(doc->FindTool("B1")->FindInput("Input")->Link(), nullptr);
 }
 
-TEST(DocumentIO, SyntaxErrorsAndNonDocumentsFailAtOnce) {
+TEST(DocumentIO, SyntaxErrorsFailAtOnceAndLenientLoadingKeepsWhatItDoesNotKnow) {
     for (const auto &[text, problem] : {
              std::pair<std::string, std::string>{
                  "Orvane.Document {\n\tTools = {\n\t\tA = DocIOTestTool { Inputs = { Size = @ } },\n\t},\n}\n",
@@ -359,19 +335,12 @@ TEST(DocumentIO, SyntaxErrorsAndNonDocumentsFailAtOnce) {
             EXPECT_NE(r.error.find(problem), std::string::npos) << r.error;
             EXPECT_TRUE(doc->Tools().empty());
         }
-}
-
-TEST(DocumentIO, LenientLoadingKeepsWhatItDoesNotKnowAndWritesItBack) {
     const std::string text = R"(Orvane.Document {
 	Layout = { Zoom = 2, Views = { "A", "B" } },
 	Prefs = { FrameWidth = 1280, FuturePref = { Mode = "fast" } },
 	Tools = {
 		A1 = DocIOTestTool {
-			Inputs = {
-				Bogus = { 1, 2, Deep = { x = "y" } },
-				Size = Mystery1.Amount,
-				Input = Mystery1.Output,
-			},
+			Inputs = { Bogus = { 1, 2, Deep = { x = "y" } }, Size = Mystery1.Amount, Input = Mystery1.Output },
 			ViewInfo = OperatorInfo { Pos = { 1, 2 } },
 		},
 		Mystery1 = FancyThing {
@@ -386,10 +355,8 @@ TEST(DocumentIO, LenientLoadingKeepsWhatItDoesNotKnowAndWritesItBack) {
     const DocumentLoadResult r = Load(text, *doc, true);
     ASSERT_TRUE(r.ok) << r.error;
     EXPECT_EQ(r.warnings.size(), 6u) << Joined(r.warnings); // Layout, FuturePref, FancyThing, Bogus, two links
-    EXPECT_EQ(doc->FindTool("Mystery1"), nullptr);
+    EXPECT_TRUE(!doc->FindTool("Mystery1") && doc->GetPrefLong(PREF_FFWidth) == 1280);
     EXPECT_EQ(doc->FindTool("A1")->FindInput("Input")->UnresolvedLink(), "Mystery1.Output");
-    EXPECT_EQ(doc->GetPrefLong(PREF_FFWidth), 1280);
-
     const std::string saved = SaveDocument(*doc);
     const ScriptVal source = ScriptVal::FromText(text), root = ScriptVal::FromText(saved), a1 = ToolIn(saved, "A1");
     EXPECT_EQ(root.Find("Layout")->ToText(), source.Find("Layout")->ToText());
@@ -405,106 +372,77 @@ TEST(DocumentIO, LenientLoadingKeepsWhatItDoesNotKnowAndWritesItBack) {
     EXPECT_EQ(ToolIn(SaveDocument(*doc), "A1").Find("Inputs")->Find("Size")->ToText(), "4");
 }
 
-TEST(DocumentIO, APlannedToolKeepsItsSettingsWithOneWarning) {
+TEST(DocumentIO, APlannedToolKeepsItsSettingsAndAnyNameOfAClassIsSavedByItsID) {
     ts::LoadOperators();
-    const std::string text = R"(Orvane.Document {
-	Tools = {
-		Glow1 = Glow { Inputs = { Input = Src1.Output, XBlurSize = 4.5, Filter = "Gaussian", Lockxy = true } },
-		Src1 = DocIOTestTool { },
-	},
-}
-)";
+    const std::string text = "Orvane.Document { Tools = { Src1 = DocIOTestTool {}, Glow1 = Glow { Inputs = { "
+                             "Input = Src1.Output, XBlurSize = 4.5, Filter = \"Gaussian\", Lockxy = true } } } }";
     Ref<OrvaneDoc> doc = MakeRef<OrvaneDoc>();
     const DocumentLoadResult r = Load(text, *doc);
-    ASSERT_TRUE(r.ok) << r.error;
-    ASSERT_EQ(r.warnings.size(), 1u) << Joined(r.warnings);
+    ASSERT_TRUE(r.ok && r.warnings.size() == 1u) << r.error << Joined(r.warnings);
     EXPECT_NE(r.warnings[0].find("Glow1: the Glow tool is not available yet"), std::string::npos) << r.warnings[0];
     const ScriptVal was = *ScriptVal::FromText(text).Find("Tools")->Find("Glow1")->Find("Inputs");
     const ScriptVal now = *ToolIn(SaveDocument(*doc), "Glow1").Find("Inputs");
     EXPECT_EQ(now.Size(), was.Size());
     for (const auto &[key, value] : was.Entries()) EXPECT_EQ(now.Find(key)->ToText(), value.ToText());
-    // Asked for a result, it fails with one line.
-    EXPECT_FALSE(Evaluate(doc->FindTool("Glow1")->FindMainOutput(), 0.0));
-    EXPECT_EQ(ts::ConsoleText(*doc), "error: Glow1: the Glow tool is not available yet in this version of Orvane\n");
-}
-
-TEST(DocumentIO, AnyNameOfAClassMakesItAndItIsSavedByItsID) {
-    ts::LoadOperators();
     // An old ID, an alias, and an alias of this file's class.
     for (const auto &[written, saved] :
          {std::pair{"SetBgColor", "SetCanvasColor"}, {"Resize", "BetterResize"}, {"DocAlias", DocToolClass}}) {
-        Ref<OrvaneDoc> doc = MakeRef<OrvaneDoc>();
-        const DocumentLoadResult r =
-            Load(std::string("Orvane.Document { Tools = { T1 = ") + written + " { } } }", *doc);
-        ASSERT_TRUE(r.ok) << r.error;
-        EXPECT_EQ(doc->FindTool("T1")->ClassID(), OvID(saved));
-        EXPECT_EQ(ToolIn(SaveDocument(*doc), "T1").ClassName(), saved);
+        Ref<OrvaneDoc> named = MakeRef<OrvaneDoc>();
+        ASSERT_TRUE(Load(std::string("Orvane.Document { Tools = { T1 = ") + written + " { } } }", *named).ok);
+        EXPECT_EQ(named->FindTool("T1")->ClassID(), OvID(saved));
+        EXPECT_EQ(ToolIn(SaveDocument(*named), "T1").ClassName(), saved);
     }
 }
 
-std::string ReadFile(const std::filesystem::path &p) {
+std::string ReadFile(const std::string &p) {
     return std::string(std::istreambuf_iterator<char>(std::ifstream(p, std::ios::binary).rdbuf()), {});
 }
-void WriteFile(const std::filesystem::path &p, const std::string &text) { std::ofstream(p, std::ios::binary) << text; }
+void WriteFile(const std::string &p, const std::string &text) { std::ofstream(p, std::ios::binary) << text; }
 
 TEST(DocumentIO, SavingReplacesAFileWholeOrLeavesWhatWasThereAndOnlyFilesAreRead) {
     namespace fs = std::filesystem;
-    struct TempDir {
-        fs::path path = fs::temp_directory_path() / ("orvane-doctest-" + std::to_string(getpid()));
-        TempDir() { fs::remove_all(path), fs::create_directories(path); }
-        ~TempDir() {
-            std::error_code ignored;
-            fs::permissions(path, fs::perms::owner_all, ignored);
-            fs::remove_all(path, ignored);
-        }
-        Names Entries() const {
-            Names names;
-            for (const auto &e : fs::directory_iterator(path)) names.push_back(e.path().filename().string());
-            std::sort(names.begin(), names.end());
-            return names;
-        }
-    } dir;
+    const ts::TempDir dir;
+    auto entries = [&] {
+        std::set<std::string> names;
+        for (const auto &e : fs::directory_iterator(dir.path)) names.insert(e.path().filename().string());
+        return names;
+    };
     Ref<OrvaneDoc> doc = MakeRef<OrvaneDoc>(), back = MakeRef<OrvaneDoc>();
     ts::SetNumber(AddDocTool(*doc, "T1"), "Size", 7.0);
-    const fs::path target = dir.path / "comp.orv";
+    const std::string target = dir / "comp.orv";
     std::string error;
     for (const bool existing : {false, true}) {
         if (existing) WriteFile(target, std::string(10000, 'x'));
-        ASSERT_TRUE(SaveDocumentFile(*doc, target.string(), error)) << error;
+        ASSERT_TRUE(SaveDocumentFile(*doc, target, error)) << error;
         EXPECT_EQ(ReadFile(target), SaveDocument(*doc));
-        EXPECT_EQ(dir.Entries(), Names{"comp.orv"}) << "no temporary file remains";
+        EXPECT_EQ(entries(), std::set<std::string>{"comp.orv"}) << "no temporary file remains";
     }
-    const DocumentLoadResult r = LoadDocumentFile(target.string(), *back);
+    const DocumentLoadResult r = LoadDocumentFile(target, *back);
     ASSERT_TRUE(r.ok) << r.error;
     EXPECT_EQ(SaveDocument(*back), SaveDocument(*doc));
-
-    // Failed saves: under a plain file, onto a folder.
+    // Failed saves, under a plain file and onto a folder, leave both as they were.
     fs::remove(target);
-    WriteFile(dir.path / "plain", "not a folder");
-    EXPECT_FALSE(SaveDocumentFile(*doc, (dir.path / "plain" / "comp.orv").string(), error));
-    EXPECT_EQ(ReadFile(dir.path / "plain"), "not a folder");
-    fs::create_directory(dir.path / "taken");
-    WriteFile(dir.path / "taken" / "inside", "keep");
-    EXPECT_FALSE(SaveDocumentFile(*doc, (dir.path / "taken").string(), error));
-    EXPECT_EQ(ReadFile(dir.path / "taken" / "inside"), "keep");
-    EXPECT_EQ(dir.Entries(), (Names{"plain", "taken"})) << "no temporary file remains";
-
+    WriteFile(dir / "plain", "not a folder");
+    EXPECT_FALSE(SaveDocumentFile(*doc, dir / "plain/comp.orv", error));
+    fs::create_directory(dir / "taken");
+    WriteFile(dir / "taken/inside", "keep");
+    EXPECT_FALSE(SaveDocumentFile(*doc, dir / "taken", error));
+    EXPECT_EQ(ReadFile(dir / "plain") + ReadFile(dir / "taken/inside"), "not a folderkeep");
+    EXPECT_EQ(entries(), (std::set<std::string>{"plain", "taken"})) << "no temporary file remains";
     // Reading: a missing file, a folder, and a FIFO with no writer (which must not wait for one).
-    ASSERT_EQ(mkfifo((dir.path / "pipe").c_str(), 0600), 0);
+    ASSERT_EQ(mkfifo((dir / "pipe").c_str(), 0600), 0);
     for (const auto &[name, says] : {std::pair{"absent.orv", "cannot open"}, std::pair{"taken", "not a regular file"},
                                      std::pair{"pipe", "not a regular file"}}) {
-        const DocumentLoadResult failed = LoadDocumentFile((dir.path / name).string(), *MakeRef<OrvaneDoc>());
-        EXPECT_FALSE(failed.ok);
-        EXPECT_NE(failed.error.find(says), std::string::npos) << failed.error;
-        EXPECT_NE(failed.error.find(name), std::string::npos) << failed.error;
+        const DocumentLoadResult failed = LoadDocumentFile(dir / name, *MakeRef<OrvaneDoc>());
+        EXPECT_FALSE(failed.ok || failed.error.find(says) == std::string::npos ||
+                     failed.error.find(name) == std::string::npos)
+            << failed.error;
     }
-
     // Into a read-only folder (folder permissions do not bind the superuser).
     if (geteuid() == 0) return;
     WriteFile(target, "the old document");
     fs::permissions(dir.path, fs::perms::owner_read | fs::perms::owner_exec);
-    EXPECT_FALSE(SaveDocumentFile(*doc, target.string(), error));
-    EXPECT_FALSE(error.empty());
+    EXPECT_FALSE(SaveDocumentFile(*doc, target, error) || error.empty());
     fs::permissions(dir.path, fs::perms::owner_all);
     EXPECT_EQ(ReadFile(target), "the old document");
 }

@@ -1,6 +1,5 @@
-// Inputs: limits, rounding, types, links and loops, hidden and internal inputs, run-time attributes,
-// NotifyChanged for inputs that ask for it and never from renders, and values typed as text on a command line.
 #include <string>
+#include <tuple>
 #include <vector>
 
 #include <gtest/gtest.h>
@@ -17,8 +16,8 @@ namespace {
 
 using Names = std::vector<std::string>;
 
-/// A tool with one input of each kind the tests need. Its "Value" output is
-/// the number that reached Process through the input named by `watch`.
+/// A tool with one input of each kind the tests need. Its "Value" output is the number that reached Process through the
+/// input named by `watch`.
 class KnobsTool : public ThreadedOperator {
 public:
     KnobsTool(const Registry *reg, const ScriptVal &args, const TagList &tags) : ThreadedOperator(reg, args, tags) {
@@ -77,7 +76,7 @@ protected:
     KnobsTool *a = Add("A"), *b = Add("B"), *c = Add("C");
 };
 
-// Constants and curve keys alike: the hard limits hold, the slider limits do not, whole inputs round.
+// Constants and curve keys alike; the slider limits do not bind.
 TEST_F(InputTest, HardLimitsClampAndWholeInputsRound) {
     auto stored = [&](const char *id, std::initializer_list<double> values) {
         std::string out;
@@ -123,14 +122,14 @@ TEST_F(InputTest, DefaultsComeFromTheTagsAndIsDefaultTracksThem) {
         defaults += a->FindInput(id)->Constant()->ToScript().ToText() + " ";
     }
     EXPECT_EQ(defaults, "0 { 0.5, 0.25 } \"hello\" \"ModeB\" 3 ");
-
     Input *hidden = a->FindInput("Hidden");
     ASSERT_TRUE(hidden->SetValue(MakeRef<Number>(2.0)));
     EXPECT_FALSE(hidden->IsDefault());
-    ASSERT_TRUE(hidden->SetValue(MakeRef<Number>(3.0))); // an equal value, not the same object
+    // An equal value, not the same object, is the default; an animated input is not at its default.
+    ASSERT_TRUE(hidden->SetValue(MakeRef<Number>(3.0)));
     EXPECT_TRUE(hidden->IsDefault());
     ASSERT_TRUE(hidden->SetCurve(ts::NumberCurve({{0.0, 3.0}})));
-    EXPECT_FALSE(hidden->IsDefault()) << "an animated input is not at its default";
+    EXPECT_FALSE(hidden->IsDefault());
     hidden->ResetValue();
     EXPECT_TRUE(hidden->IsDefault() && !hidden->IsAnimated());
     // A value that rounds to the default is the default.
@@ -142,12 +141,7 @@ TEST_F(InputTest, LinksCheckTypesRefuseLoopsAndGoWithANewValue) {
     // Links first made: B.Input <- A.Output, C.Input <- B.Output (A -> B -> C).
     ASSERT_TRUE(b->FindInput("Input")->ConnectTo(a->FindOutput("Output")));
     ASSERT_TRUE(c->FindInput("Input")->ConnectTo(b->FindOutput("Output")));
-    const struct {
-        const char *name;
-        Input *in;
-        Output *out;
-        bool ok;
-    } cases[] = {
+    const std::tuple<const char *, Input *, Output *, bool> cases[] = {
         {"number from an image", a->FindInput("Hard"), b->FindOutput("Output"), false},
         {"image from a number", c->FindInput("Input"), a->FindOutput("Value"), false},
         {"to itself", a->FindInput("Input"), a->FindOutput("Output"), false},
@@ -158,25 +152,22 @@ TEST_F(InputTest, LinksCheckTypesRefuseLoopsAndGoWithANewValue) {
         {"number from a number", c->FindInput("Hard"), a->FindOutput("Value"), true},
         {"image from a second branch", c->FindInput("Input"), a->FindOutput("Output"), true},
     };
-    for (const auto &t : cases) {
-        Output *before = t.in->Link();
-        EXPECT_EQ(t.in->ConnectTo(t.out), t.ok) << t.name;
-        EXPECT_EQ(t.in->Link(), t.ok ? t.out : before) << t.name;
+    for (const auto &[name, in, out, ok] : cases) {
+        Output *before = in->Link();
+        EXPECT_EQ(in->ConnectTo(out), ok) << name;
+        EXPECT_EQ(in->Link(), ok ? out : before) << name;
     }
     // Consumers follow the links.
     EXPECT_EQ(a->FindOutput("Output")->Consumers(),
               (std::vector<Input *>{b->FindInput("Input"), c->FindInput("Input")}));
     EXPECT_TRUE(b->FindOutput("Output")->Consumers().empty()) << "C's Input moved on to A";
-
     // Disconnect and SetValue drop a link.
     Input *hard = b->FindInput("Hard");
     ASSERT_TRUE(hard->ConnectTo(c->FindOutput("Value")));
-    EXPECT_FALSE(hard->IsDefault());
-    EXPECT_FALSE(hard->ValueAt(0.0)) << "a linked input has no value of its own";
+    EXPECT_FALSE(hard->IsDefault() || hard->ValueAt(0.0)) << "a linked input has no value of its own";
     hard->Disconnect();
     EXPECT_TRUE(hard->Link() == nullptr && c->FindOutput("Value")->Consumers().empty() && hard->IsDefault());
     hard->Disconnect(); // again: nothing happens
-
     ASSERT_TRUE(hard->ConnectTo(c->FindOutput("Value")));
     ASSERT_TRUE(hard->SetValue(MakeRef<Number>(6.0)));
     EXPECT_TRUE(hard->Link() == nullptr && c->FindOutput("Value")->Consumers().empty());
@@ -184,32 +175,26 @@ TEST_F(InputTest, LinksCheckTypesRefuseLoopsAndGoWithANewValue) {
     EXPECT_TRUE(c->FindInput("Hard")->ConnectTo(b->FindOutput("Value")));
 }
 
-// Hidden inputs, inputs changed to hidden and internal inputs all deliver their values to renders.
 TEST_F(InputTest, AttributesChangeAtRunTimeAndHiddenAndInternalInputsStillDeliver) {
     Input *hidden = a->FindInput("Hidden"), *hard = a->FindInput("Hard"), *internal = a->FindInput("Internal");
     EXPECT_FALSE(hidden->IsVisible() || internal->IsExternal());
-    ASSERT_TRUE(hidden->SetValue(MakeRef<Number>(7.5)));
-    EXPECT_EQ(NumberOf(Evaluate(a->value, 0.0)), 7.5);
-    ASSERT_TRUE(hard->SetValue(MakeRef<Number>(6.25)));
     hard->SetAttrsTagList({{ControlVisible, 0}});
     EXPECT_FALSE(hard->IsVisible());
-    a->watch = "Hard";
-    EXPECT_EQ(NumberOf(Evaluate(a->value, 1.0)), 6.25);
     EXPECT_FALSE(internal->SetCurve(ts::NumberCurve({{0.0, 1.0}})) || internal->IsAnimated())
         << "an internal input takes no curve";
-    ASSERT_TRUE(internal->SetValue(MakeRef<Number>(9.0)));
-    a->watch = "Internal";
-    EXPECT_EQ(NumberOf(Evaluate(a->value, 2.0)), 9.0);
+    for (const auto &[input, value] : {std::pair{"Hidden", 7.5}, {"Hard", 6.25}, {"Internal", 9.0}}) {
+        ASSERT_TRUE(a->FindInput(input)->SetValue(MakeRef<Number>(value)));
+        a->watch = input;
+        EXPECT_EQ(NumberOf(Evaluate(a->value, value)), value) << input;
+    }
     // Shown again with a new label; a new limit holds for values set afterwards, other tags stay.
     hard->SetAttrsTagList({{ControlVisible, 1}, {ControlLabel, "Strength"}, {InputMaxAllowed, 3.0}});
-    EXPECT_TRUE(hard->IsVisible());
-    EXPECT_STREQ(hard->Label(), "Strength");
+    EXPECT_TRUE(hard->IsVisible() && hard->Label() == std::string("Strength"));
     ASSERT_TRUE(hard->SetValue(MakeRef<Number>(9.0)));
-    EXPECT_EQ(NumberOf(hard->Constant()), 3.0);
-    EXPECT_EQ(hard->Tags().GetDouble(InputMinAllowed), -1.0);
+    EXPECT_EQ(std::pair(NumberOf(hard->Constant()), hard->Tags().GetDouble(InputMinAllowed)), std::pair(3.0, -1.0));
 }
 
-TEST_F(InputTest, NotifyChangedHearsFirstValuesAndChangesOfNotifyingInputsButNeverRenders) {
+TEST_F(InputTest, NotifyChangedHearsFirstValuesAndChangesButNeverRendersAndTextBecomesTheValueTheInputTakes) {
     EXPECT_EQ(a->heard, Names{"Notified 1"});
     a->heard.clear();
     Input *notified = a->FindInput("Notified");
@@ -220,18 +205,13 @@ TEST_F(InputTest, NotifyChangedHearsFirstValuesAndChangesOfNotifyingInputsButNev
     notified->ResetValue();                                              // heard with the default
     EXPECT_FALSE(notified->SetValue(MakeRef<Text>("x"))) << "a value refused changes nothing and is not heard";
     EXPECT_EQ(a->heard, (Names{"Notified 2.5", "Quiet -1", "Notified 4", "Notified 1"}));
-
     ASSERT_TRUE(b->FindInput("Notified")->ConnectTo(a->FindOutput("Value")));
     b->watch = "Notified";
     a->heard.clear(), b->heard.clear();
     for (double time : {0.0, 1.0, 2.0}) EXPECT_EQ(NumberOf(Evaluate(b->value, time)), 3.0);
-    EXPECT_EQ(b->processCount, 3);
-    EXPECT_TRUE(a->heard.empty() && b->heard.empty());
-}
-
-// Text as typed on a command line: script syntax where it parses, text as it stands for inputs that take text,
-// a link only to a tool that exists.
-TEST_F(InputTest, TextBecomesTheValueTheInputTakes) {
+    EXPECT_TRUE(b->processCount == 3 && a->heard.empty() && b->heard.empty());
+    // Text as typed on a command line: script syntax where it parses, text as it stands for inputs that take text, a
+    // link only to a tool that exists.
     std::string read;
     for (const std::string set :
          {"Hard=2.5", "Hard=\"7\"", "Hard=Nope.Value", "Where={ 0.5, 0.25 }", "Caption=two words", "Caption=\"quoted\"",
