@@ -63,7 +63,10 @@ Ref<Parameter> ResultCache::Find(const CacheKey &key, const std::optional<ImageD
 
 void ResultCache::Store(const CacheKey &key, const std::optional<ImageDomain> &roi, const Ref<Parameter> &value) {
     if (!value) return;
+    const size_t bytes = value->SizeOf();
     std::lock_guard<std::mutex> guard(lock_);
+    // A value larger than the whole budget is not kept, and evicts nothing.
+    if (bytes > budget_) return;
     // A whole-frame result replaces region results of the same key.
     auto [first, last] = index_.equal_range(key);
     std::vector<decltype(first)> stale;
@@ -74,7 +77,6 @@ void ResultCache::Store(const CacheKey &key, const std::optional<ImageDomain> &r
         lru_.erase(it->second);
         index_.erase(it);
     }
-    const size_t bytes = value->SizeOf();
     lru_.push_front(Entry{key, roi, value, bytes});
     index_.emplace(key, lru_.begin());
     bytes_ += bytes;

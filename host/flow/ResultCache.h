@@ -8,7 +8,8 @@
 //
 // A result made for a region of interest serves any request whose region it
 // covers; a whole-frame result serves every region. Entries beyond the
-// memory budget are evicted, least recently used first. The cache also gives
+// memory budget are evicted, least recently used first; a result larger than
+// the whole budget is not kept and evicts nothing. The cache also gives
 // way to pixel memory (PixelMemory.h): when an allocation would pass the
 // process's limit, it drops the least recently used results that nobody but
 // the cache holds.
