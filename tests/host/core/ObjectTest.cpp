@@ -256,7 +256,7 @@ TEST(ParallelJobs, RangesAreCoveredOnceNestedOrFromManyThreadsAndOneWorkerIsTheC
                 const int n = std::max(last - first, 0);
                 std::vector<std::atomic<int>> hits(n), each(n);
                 std::atomic<int> badPieces{0};
-                auto count = [&](int b, int e) {
+                auto count = [&, first = first, last = last](int b, int e) {
                     badPieces += b >= e || b < first || e > last;
                     for (int i = std::max(b, first); i < std::min(e, last); ++i) ++hits[i - first];
                 };

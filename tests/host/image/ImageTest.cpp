@@ -163,7 +163,7 @@ TEST(PixelRuns, LoadStoreAndReadSpansAsWorkedOutHere) {
         for (size_t i = 0; i < codes.size(); ++i)
             wide ? void(std::memcpy(&raw[2 * i], &codes[i], 2)) : void(raw[i] = static_cast<uint8_t>(codes[i]));
         auto value = [&](uint16_t code) -> double {
-            return half ? static_cast<float>(std::bit_cast<CompilerHalf>(code)) : code / (wide ? 65535.0 : 255.0);
+            return half ? CompilerHalfToFloat(code) : code / (wide ? 65535.0 : 255.0);
         };
         const int n = static_cast<int>(codes.size()) / fmt.channels;
         std::vector<FltPixel> f(n);

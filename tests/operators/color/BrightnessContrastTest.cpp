@@ -479,7 +479,7 @@ TEST_F(BrightnessContrast, CanvasBeyondTheDataWindowAndRegionsUnderEachClippingM
                 const Model model(settings);
                 // Integer rows take the 16-bit steps, which clamp between steps; the rest follows the float steps.
                 const bool integer = depth == DepthRGBAInt16;
-                auto expectedOf = [&](const Px &in) {
+                auto expectedOf = [&, rows = rows](const Px &in) {
                     Px out = model.Float(in);
                     if (!integer) return out;
                     std::array<int64_t, 4> p;

@@ -235,7 +235,7 @@ TEST_F(BackgroundRamp, IntegerRampsFollowTheFormulaClampedThroughFloatsAndStartF
             ASSERT_TRUE(img);
             ExpectPixels(
                 *img,
-                [&](int x, int y, int ch) {
+                [&, m = m, colors = colors](int x, int y, int ch) {
                     return std::clamp(RampValue(m, colors, ch, x / double(W - 1), y / double(H - 1)), 0.0, 1.0) * top;
                 },
                 1.0);
