@@ -1,5 +1,6 @@
 // The resize kernels against the rows: floats bit for bit (the kernels sum in the rows' order), integers within
 // the device's own rounding; and the fall-back to the rows.
+#include "host/krom/GPUMemory.h"
 #include "tests/host/image/ImageTestSupport.h"
 #include "tests/host/krom/DeviceTestSupport.h"
 
