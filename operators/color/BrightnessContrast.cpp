@@ -11,8 +11,8 @@
 #include "host/color/FastPow.h"
 #include "host/core/Tags.h"
 #include "host/flow/DataTypes.h"
+#include "host/flow/PointRows.h"
 #include "host/flow/Request.h"
-#include "host/flow/ToolFrame.h"
 #include "host/image/Half.h"
 #include "host/image/Image.h"
 #include "host/image/NewImage.h"
@@ -646,15 +646,7 @@ void BrightnessContrast::Process(Request *req) {
     // 2. The output image.
     const bool precalc = req->IsPreCalc();
     const OvID clipping = GetClippingMode(req);
-    const AutoImageRoI roi(req);
-    const ImgRectI dataWindow = OutputDataWindow(req, input_, src, clipping);
-    const ImgRectI validWindow = roi ? roi->rect : dataWindow;
-    Ref<Image> dst = NewImageTagList({{ImgLikeImage, src},
-                                      {ImgDataWindow, &dataWindow},
-                                      {ImgValidWindow, &validWindow},
-                                      {ImgNoData, precalc},
-                                      {ImgForRequest, 1},
-                                      {ImgTakeWindows, 1}});
+    Ref<Image> dst = NewPointOutput(req, input_, src, clipping);
     auto outOfMemory = [&] {
         Fail(req, "%s: out of memory (time = %f)\n", Name().c_str(), req->Time());
         req->SetOutputData(output_, nullptr);
@@ -688,57 +680,37 @@ void BrightnessContrast::Process(Request *req) {
                 tableFltExponent_ = v.gamma;
             }
         }
-        span_ = ChooseSpan(v.depth, v.reverse, fastPower, vectorRows);
-        bytesPerPixel_ = src->BytesPerPixel();
+        const SpanFunction span = ChooseSpan(v.depth, v.reverse, fastPower, vectorRows);
+        uint8_t canvasPixel[16];
 
         // The canvas colour through the same function, also stored in the
         // output's depth for the spans beyond the input's window.
         if (isFloat) {
             const FltPixel canvas = ChainOfColor(v, fastPower, src->GetCanvasColor());
             dst->SetCanvasColor(canvas);
-            StoreFlt(v.depth, &canvas, 1, canvasPixel_);
+            StoreFlt(v.depth, &canvas, 1, canvasPixel);
         } else {
             Pixel canvas;
             src->GetCanvasColor(canvas);
             canvas = v.reverse ? PixelInt<true>(v, canvas) : PixelInt<false>(v, canvas);
             dst->SetCanvasColor(canvas);
-            StorePixel(v.depth, &canvas, 1, canvasPixel_);
+            StorePixel(v.depth, &canvas, 1, canvasPixel);
         }
 
         const bool rowsWanted = !precalc && !dst->ValidWindow().IsNull();
         const bool onDevice = rowsWanted && IsGPUEnabled(req, true) && RunDevice(req, src, dst.Get());
         if (rowsWanted && !onDevice) {
             if (!src->DownloadGPUMem() || !dst->AllocScanLineData()) return outOfMemory();
-            src_ = src;
-            dst_ = dst.Get();
-            inWindow_ = src->HasScanLineData() ? src->DataWindow() : ImgRectI();
-            outWindow_ = dataWindow;
-            DoMultiProcess(req, dataWindow.Height());
-            src_ = nullptr;
-            dst_ = nullptr;
+            const PointRows rows(*src, *dst, canvasPixel);
+            DoMultiProcess(
+                [&](int i) { rows.Row(i, [&](const uint8_t *in, uint8_t *out, int n) { span(v, in, out, n); }); },
+                rows.Count());
         }
     }
 
     // 5. With clipping, what lies beyond the window keeps the input's canvas.
     if (clipping != ClippingMode_None) dst->CopyCanvasColor(src);
     req->SetOutputData(output_, dst.Get());
-}
-
-void BrightnessContrast::ProcessChunk(Request *, int chunk) {
-    if (dst_->CheckAbort()) return;
-    const int y = outWindow_.y0 + chunk;
-    uint8_t *row = dst_->ScanLine(y);
-    if (!row) return;
-    const int bpp = bytesPerPixel_;
-    auto fillCanvas = [this, bpp](uint8_t *at, int count) {
-        for (int i = 0; i < count; ++i) std::memcpy(at + static_cast<size_t>(i) * bpp, canvasPixel_, bpp);
-    };
-    const RowSpans s = SplitRow(outWindow_, inWindow_, y);
-    fillCanvas(row, s.midStart - s.x0);
-    if (s.hasInput)
-        span_(v_, src_->PixelAddress(s.midStart, y), row + static_cast<size_t>(s.midStart - s.x0) * bpp,
-              s.midEnd - s.midStart);
-    fillCanvas(row + static_cast<size_t>(s.midEnd - s.x0) * bpp, s.x1 - s.midEnd);
 }
 
 } // namespace Orvane

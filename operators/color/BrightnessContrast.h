@@ -8,8 +8,8 @@
 //    itself is handed on;
 //  * the chain is linear (no gamma, no pre-divide, and no clip on float): it is
 //    folded into one colour matrix and left to the host's ApplyMatrixTagList;
-//  * otherwise rows, one chunk per output row, with the canvas colour carried
-//    through the same pixel function; when the render has a device, the
+//  * otherwise rows (PointRows.h), one chunk per output row, with the canvas
+//    colour carried through the same pixel function; when the render has a device, the
 //    kernels "BrightnessContrast" / "BrightnessContrastReverse" of the common
 //    library do the same first, and the rows run only if they fail.
 //
@@ -20,7 +20,6 @@
 #include "host/color/GammaTable.h"
 #include "host/flow/Operator.h"
 #include "host/image/ColorMatrix.h"
-#include "host/image/Rect.h"
 
 namespace Orvane {
 
@@ -33,7 +32,6 @@ public:
     size_t SizeOf() const override { return sizeof(*this); }
 
     void Process(Request *req) override;
-    void ProcessChunk(Request *req, int chunk) override;
 
     /// The values one request works with, derived from the inputs.
     struct Values {
@@ -79,12 +77,6 @@ private:
     ColorMatrixFull satMat_; ///< forward saturation matrix (reverse: inverted)
     GammaTable gammaTable_;
     double tableFltExponent_ = -1.0, tableIntExponent_ = -1.0; ///< what the table holds; -1 nothing
-    const Image *src_ = nullptr;
-    Image *dst_ = nullptr;
-    ImgRectI inWindow_, outWindow_;
-    int bytesPerPixel_ = 0;
-    SpanFunction span_ = nullptr;
-    uint8_t canvasPixel_[16] = {}; ///< the processed canvas colour, stored in the output's depth
 };
 
 } // namespace Orvane
