@@ -75,6 +75,27 @@ void SmoothCurve(int size, int radius, uint16_t *curve) {
     for (int i = 0; i < size; ++i) curve[i] = static_cast<uint16_t>(std::clamp(std::lround(v[i]), 0L, 65535L));
 }
 
+/// Reads `count` pixels of row y as 16-bit values, from x0 every `step` pixels (FloatToU16 for floats).
+void ReadSamples(const Image &img, int x0, int y, int step, int count, Pixel *out) {
+    const uint8_t *p = img.PixelAddress(x0, y);
+    if (img.Depth() == DepthRGBAFlt32) {
+        // The common float frame, converted without branches (NaN reads as 0) so that the loop vectorises.
+        const float *f = reinterpret_cast<const float *>(p);
+        uint16_t *o = &out[0].R;
+        static_assert(sizeof(Pixel) == 4 * sizeof(uint16_t));
+        for (int c = 0; c < count; ++c, f += 4 * step)
+            for (int k = 0; k < 4; ++k) {
+                const float low = f[k] > 0.f ? f[k] : 0.f, v = low < 1.f ? low : 1.f;
+                o[4 * c + k] = static_cast<uint16_t>(static_cast<int>(static_cast<double>(v) * 65535.0 + 0.5));
+            }
+    } else if (step == 1) {
+        LoadPixel(img.Depth(), p, count, out);
+    } else {
+        for (int c = 0; c < count; ++c)
+            LoadPixel(img.Depth(), p + static_cast<size_t>(c) * step * img.BytesPerPixel(), 1, &out[c]);
+    }
+}
+
 int ClampToInt(double v) { return static_cast<int>(std::clamp(v, -2.0 * DomainEndless, 2.0 * DomainEndless)); }
 
 } // namespace
@@ -87,10 +108,6 @@ Histogram::Histogram(int size)
 
 int Histogram::SizeForPrecision(int precision) { return precision <= 0 ? 256 : precision == 1 ? 1024 : 65536; }
 
-uint16_t Histogram::Luma16(uint16_t r, uint16_t g, uint16_t b) {
-    return static_cast<uint16_t>(std::min(65535.0, kLumaR * r + kLumaG * g + kLumaB * b + 0.5));
-}
-
 bool Histogram::CountImage(const Image &img, const ImgRectI &rect, const HistogramSampling &sampling) {
     std::fill(counts_.begin(), counts_.end(), 0);
     samples_ = 0;
@@ -101,37 +118,36 @@ bool Histogram::CountImage(const Image &img, const ImgRectI &rect, const Histogr
 
     const int step = std::max(1, sampling.proxyStep);
     const int cols = (area.Width() + step - 1) / step, rows = (area.Height() + step - 1) / step;
-    const int depth = img.Depth(), bpp = img.BytesPerPixel();
     const int grain = static_cast<int>(
         std::max<int64_t>((rows + 2 * WorkerCount() - 1) / (2 * WorkerCount()), (kMinPiecePixels + cols - 1) / cols));
     std::mutex merge;
     ParallelRange(
         0, rows,
         [&](int first, int last) {
-            std::vector<uint64_t> bins(counts_.size());
+            // 32-bit bins halve the memory a piece touches; a block of rows stays below 2^32 samples.
+            const int blockRows = static_cast<int>(std::min<int64_t>(last - first, UINT32_MAX / cols));
+            std::vector<uint32_t> bins(counts_.size());
             std::vector<Pixel> line(cols);
-            uint64_t *l = bins.data(), *r = l + size_, *g = r + size_, *b = g + size_;
-            uint64_t samples = 0;
-            for (int k = first; k < last; ++k) {
-                if (img.CheckAbort()) return;
-                const uint8_t *p = img.PixelAddress(area.x0, area.y0 + k * step);
-                if (step == 1)
-                    LoadPixel(depth, p, cols, line.data());
-                else
-                    for (int c = 0; c < cols; ++c)
-                        LoadPixel(depth, p + static_cast<size_t>(c) * step * bpp, 1, &line[c]);
-                for (const Pixel &px : line) {
-                    if (sampling.ignoreTransparent && px.A == 0) continue;
-                    ++l[Luma16(px.R, px.G, px.B) >> shift_];
-                    ++r[px.R >> shift_];
-                    ++g[px.G >> shift_];
-                    ++b[px.B >> shift_];
-                    ++samples;
+            uint32_t *l = bins.data(), *r = l + size_, *g = r + size_, *b = g + size_;
+            for (int block = first; block < last; block += blockRows) {
+                if (block != first) std::fill(bins.begin(), bins.end(), 0);
+                uint64_t samples = 0;
+                for (int k = block; k < std::min(last, block + blockRows); ++k) {
+                    if (img.CheckAbort()) return;
+                    ReadSamples(img, area.x0, area.y0 + k * step, step, cols, line.data());
+                    for (const Pixel &px : line) {
+                        if (sampling.ignoreTransparent && px.A == 0) continue;
+                        ++l[Luma16(px.R, px.G, px.B) >> shift_];
+                        ++r[px.R >> shift_];
+                        ++g[px.G >> shift_];
+                        ++b[px.B >> shift_];
+                        ++samples;
+                    }
                 }
+                std::lock_guard<std::mutex> guard(merge);
+                for (size_t i = 0; i < bins.size(); ++i) counts_[i] += bins[i];
+                samples_ += samples;
             }
-            std::lock_guard<std::mutex> guard(merge);
-            for (size_t i = 0; i < bins.size(); ++i) counts_[i] += bins[i];
-            samples_ += samples;
         },
         grain);
     if (!img.CheckAbort()) return true;

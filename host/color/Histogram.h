@@ -34,6 +34,7 @@
 // Thread safety: CountImage, Equalize, Match, ResetCurves and assignment
 // change the object and must not overlap any other call on it; the const
 // members (counts, GetValue*) are safe from many threads at once.
+#include <algorithm>
 #include <cstdint>
 #include <vector>
 
@@ -71,7 +72,9 @@ public:
     /// The size chosen by a precision choice: 0 "8-bit" 256, 1 "10-bit" 1024, 2 "16-bit" 65536 (clamped).
     static int SizeForPrecision(int precision);
     /// The luminance of three 16-bit values, as counted.
-    static uint16_t Luma16(uint16_t r, uint16_t g, uint16_t b);
+    static uint16_t Luma16(uint16_t r, uint16_t g, uint16_t b) {
+        return static_cast<uint16_t>(std::min(65535.0, kLumaR * r + kLumaG * g + kLumaB * b + 0.5));
+    }
 
     int Size() const { return size_; }
     int Shift() const { return shift_; }
