@@ -9,11 +9,11 @@
 // 0.299 R + 0.587 G + 0.114 B of the three 16-bit values, rounded. A mask image
 // counts its one channel as R, G, B and L alike.
 //
-// Counting. CountImage counts the pixels of a rectangle (clipped to the data
-// window), every proxyStep-th column and row from its lower left corner, and
-// may skip pixels whose 16-bit alpha is 0. Rows run in parallel on the worker
-// pool, each piece into bins of its own that are then added up: the counts are
-// the same at any thread count.
+// Counting. CountImage counts the pixels of a rectangle clipped to the data
+// window, every proxyStep-th column and row from the clipped rectangle's lower
+// left pixel, and may skip pixels whose 16-bit alpha is 0. Rows run in
+// parallel on the worker pool, each piece into bins of its own that are then
+// added up: the counts are the same at any thread count.
 //
 // Curves. For each of L, R, G and B a table of Size() 16-bit values;
 // GetValueX(bin) is the corrected value of a pixel in that bin. Until a curve
@@ -24,7 +24,7 @@
 // cumulative distribution (each reference bin's count spread evenly over its
 // width) reaches the source's at the middle of that part. Equalising matches a
 // flat reference. So the corrected histogram follows the reference's
-// cumulative distribution to within one source bin's share, and curves never
+// cumulative distribution to within half a source bin's share; curves never
 // fall. Smoothing (0..1) runs a box filter three times over a built curve,
 // radius up to Size() / 16 bins; it keeps the curve rising.
 //
