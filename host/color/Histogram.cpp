@@ -96,6 +96,14 @@ void ReadSamples(const Image &img, int x0, int y, int step, int count, Pixel *ou
     }
 }
 
+/// Colour divided by alpha on the 16-bit values, rounded and held at 65535; 0 where alpha is 0.
+Pixel DividedByAlpha(const Pixel &p) {
+    auto divide = [a = uint64_t(p.A)](uint16_t v) {
+        return static_cast<uint16_t>(a == 0 ? 0 : std::min<uint64_t>(65535, (v * uint64_t(2 * 65535) + a) / (2 * a)));
+    };
+    return {divide(p.R), divide(p.G), divide(p.B), p.A};
+}
+
 int ClampToInt(double v) { return static_cast<int>(std::clamp(v, -2.0 * DomainEndless, 2.0 * DomainEndless)); }
 
 } // namespace
@@ -135,8 +143,9 @@ bool Histogram::CountImage(const Image &img, const ImgRectI &rect, const Histogr
                 for (int k = block; k < std::min(last, block + blockRows); ++k) {
                     if (img.CheckAbort()) return;
                     ReadSamples(img, area.x0, area.y0 + k * step, step, cols, line.data());
-                    for (const Pixel &px : line) {
+                    for (Pixel px : line) {
                         if (sampling.ignoreTransparent && px.A == 0) continue;
+                        if (sampling.divideByAlpha) px = DividedByAlpha(px);
                         ++l[Luma16(px.R, px.G, px.B) >> shift_];
                         ++r[px.R >> shift_];
                         ++g[px.G >> shift_];

@@ -11,9 +11,10 @@
 //
 // Counting. CountImage counts the pixels of a rectangle clipped to the data
 // window, every proxyStep-th column and row from the clipped rectangle's lower
-// left pixel, and may skip pixels whose 16-bit alpha is 0. Rows run in
-// parallel on the worker pool, each piece into bins of its own that are then
-// added up: the counts are the same at any thread count.
+// left pixel; it may skip pixels whose 16-bit alpha is 0 and may divide the
+// colour by alpha first. Rows run in parallel on the worker pool, each piece
+// into bins of its own that are then added up: the counts are the same at any
+// thread count.
 //
 // Curves. For each of L, R, G and B a table of Size() 16-bit values;
 // GetValueX(bin) is the corrected value of a pixel in that bin. Until a curve
@@ -52,6 +53,9 @@ constexpr int kHistogramChannels = 4;
 struct HistogramSampling {
     int proxyStep = 1;              ///< every n-th column and row; below 1 reads as 1
     bool ignoreTransparent = false; ///< skip pixels whose 16-bit alpha is 0
+    /// Count R, G and B divided by alpha (the 16-bit values, rounded, held at 65535; 0 where alpha is 0), as a tool
+    /// that works on unpremultiplied colour sees them.
+    bool divideByAlpha = false;
 };
 
 /// Which curves Equalize and Match build; the others stay the identity.

@@ -141,14 +141,14 @@ TEST(Histogram, CountsMatchPerPixelCountAcrossDepthsRectanglesProxyTransparencyA
         int depth, size;
         ImgRectI rect;
         int step;
-        bool ignoreTransparent;
+        bool ignoreTransparent, divide;
     } cases[] = {
-        {DepthRGBAFlt32, 65536, ImgRectI(0, 0, 701, 389), 1, false},
-        {DepthRGBAFlt32, 1024, ImgRectI(5, 3, 400, 300), 3, true},
-        {DepthRGBAInt8, 256, ImgRectI(-10, -10, 900, 900), 2, true},
-        {DepthRGBAInt16, 65536, ImgRectI(7, 9, 8, 10), 1, false},
-        {DepthRGBAFlt16, 1024, ImgRectI(0, 0, 701, 389), 4, false},
-        {DepthAInt16, 256, ImgRectI(1, 1, 600, 386), 1, true},
+        {DepthRGBAFlt32, 65536, ImgRectI(0, 0, 701, 389), 1, false, false},
+        {DepthRGBAFlt32, 1024, ImgRectI(5, 3, 400, 300), 3, true, true},
+        {DepthRGBAInt8, 256, ImgRectI(-10, -10, 900, 900), 2, true, false},
+        {DepthRGBAInt16, 65536, ImgRectI(7, 9, 8, 10), 1, false, false},
+        {DepthRGBAFlt16, 65536, ImgRectI(0, 0, 701, 389), 4, false, true},
+        {DepthAInt16, 256, ImgRectI(1, 1, 600, 386), 1, true, false},
     };
     const int workersBefore = WorkerCount();
     for (const Case &c : cases) {
@@ -161,15 +161,19 @@ TEST(Histogram, CountsMatchPerPixelCountAcrossDepthsRectanglesProxyTransparencyA
         for (int y = area.y0; y < area.y1; y += c.step)
             for (int x = area.x0; x < area.x1; x += c.step) {
                 const FltPixel p = img->GetFlt(x, y);
-                if (c.ignoreTransparent && to16(p.A) == 0) continue;
-                const int r = to16(p.R), g = to16(p.G), b = to16(p.B);
+                const long a = to16(p.A);
+                if (c.ignoreTransparent && a == 0) continue;
+                auto value = [&](float v) {
+                    return !c.divide ? to16(v) : a == 0 ? 0 : int(std::min(65535L, std::lround(65535.0 * to16(v) / a)));
+                };
+                const int r = value(p.R), g = value(p.G), b = value(p.B);
                 ++samples, ++want[0][std::lround(0.299 * r + 0.587 * g + 0.114 * b) >> shift];
                 ++want[1][r >> shift], ++want[2][g >> shift], ++want[3][b >> shift];
             }
         for (int workers : {1, 3}) {
             SetWorkerCount(workers);
             Histogram h(c.size);
-            ASSERT_TRUE(h.CountImage(*img, c.rect, {c.step, c.ignoreTransparent}));
+            ASSERT_TRUE(h.CountImage(*img, c.rect, {c.step, c.ignoreTransparent, c.divide}));
             EXPECT_EQ(h.Samples(), samples) << "depth " << c.depth << ", workers " << workers;
             for (int ch = 0; ch < kHistogramChannels; ++ch)
                 EXPECT_TRUE(std::equal(want[ch].begin(), want[ch].end(), h.Counts(static_cast<HistogramChannel>(ch))))
