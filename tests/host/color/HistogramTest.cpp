@@ -10,9 +10,9 @@
 
 #include <gtest/gtest.h>
 
-#include "../../support/TestSupport.h"
 #include "host/core/Parallel.h"
 #include "host/image/PixPtr.h"
+#include "tests/support/TestSupport.h"
 
 using namespace Orvane;
 
