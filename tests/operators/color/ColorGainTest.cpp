@@ -163,7 +163,8 @@ TEST_F(ColorGain, FrameRulesOnTheMatrixAndTheRows) {
     for (const auto &[name, s] : Cases()) {
         SCOPED_TRACE(name);
         gaintest::ExpectFrameRules(
-            "ColorGain", [&s = s](Operator *op) { Apply(op, s); }, [&s = s](const Px &p) { return Model(s, p); }, 2e-5);
+            "ColorGain", [&s = s](Operator *op) { Apply(op, s); },
+            [&s = s](const Image &, const Px &p) { return Model(s, p); }, 2e-5);
     }
 }
 

@@ -53,12 +53,12 @@ inline void ExpectSameBits(const Image &a, const Image &b, const ImgRectI &r) {
 }
 
 /// The rules of the frame for a tool whose settings are already made (`set` applies them to a fresh tool), with
-/// `model` the expected colour of an input colour, within `tol` (relative above 1) on float32 and one 16-bit step
-/// plus `tol` on 16-bit: under each clipping mode the data window, the canvas colour (processed, or kept under
-/// Domain and Frame), the processed canvas beyond the input's window, pre-calculation windows without pixels,
-/// regions of interest that are the same bits as the whole frame, and the same bits with one worker or many.
+/// `model` the expected colour of an input colour of the source image, within `tol` (relative above 1) on float32 and
+/// one 16-bit step plus `tol` on 16-bit: under each clipping mode the data window, the canvas colour (processed, or
+/// kept under Domain and Frame), the processed canvas beyond the input's window, pre-calculation windows without
+/// pixels, regions of interest that are the same bits as the whole frame, and the same bits with one worker or many.
 inline void ExpectFrameRules(const char *cls, const std::function<void(Operator *)> &set,
-                             const std::function<Px(const Px &)> &model, double tol) {
+                             const std::function<Px(const Image &, const Px &)> &model, double tol) {
     const ImgRectI inWindow(8, 4, 40, 28);
     const FltPixel canvas{0.2f, 0.4f, 0.6f, 0.8f};
     const std::tuple<const char *, ImgRectI, bool> clips[] = {{"ClippingMode_None", inWindow, false},
@@ -83,14 +83,14 @@ inline void ExpectFrameRules(const char *cls, const std::function<void(Operator 
             ASSERT_TRUE(shape && shape->IsNoData() && !shape->HasScanLineData() && shape->DataWindow() == window);
             Ref<Image> out = Render(rig.tool);
             ASSERT_TRUE(out && out->DataWindow() == window);
-            const Px processedCanvas = model(ToPx(canvas));
+            const Px processedCanvas = model(*src, ToPx(canvas));
             if (keepsCanvas)
                 EXPECT_EQ(out->GetCanvasColor(), canvas);
             else
                 for (int c = 0; c < 4; ++c) EXPECT_NEAR(ToPx(out->GetCanvasColor())[c], processedCanvas[c], tol);
             for (int y = window.y0; y < window.y1; ++y)
                 for (int x = window.x0; x < window.x1; ++x) {
-                    const Px want = inWindow.Contains(x, y) ? model(ToPx(src->GetFlt(x, y))) : processedCanvas;
+                    const Px want = inWindow.Contains(x, y) ? model(*src, ToPx(src->GetFlt(x, y))) : processedCanvas;
                     near(ToPx(out->GetFlt(x, y)), want, (std::to_string(x) + "," + std::to_string(y)).c_str());
                 }
             for (const ImgRectI &roi : {ImgRectI(5, 7, 30, 20), ImgRectI(0, 0, 10, 5), ImgRectI(38, 25, 60, 40)}) {

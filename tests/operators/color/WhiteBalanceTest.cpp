@@ -160,7 +160,7 @@ TEST_F(WhiteBalance, FrameRules) {
     const Px n{0.6, 0.45, 0.3, 1};
     gaintest::ExpectFrameRules(
         "WhiteBalance", [&](Operator *op) { Picked(op, n, 0); },
-        [&](const Px &p) {
+        [&](const Image &, const Px &p) {
             const double y = Luminance(n);
             return Px{p[0] * y / n[0], p[1] * y / n[1], p[2] * y / n[2], p[3]};
         },
