@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <cmath>
+#include <cstdint>
 #include <limits>
 #include <vector>
 
@@ -47,21 +48,43 @@ struct Extent {
     }
 };
 
+/// Adds n pixels (red, green, blue, alpha) to `e`; values that are not
+/// finite are left out. Written without branches, so that it vectorises.
+void AddPixels(Extent &e, const float *px, int n) {
+    for (int c = 0; c < 4; ++c) {
+        float lo = e.lo[c], hi = e.hi[c];
+        for (int k = 0; k < n; ++k) {
+            const float v = px[4 * k + c];
+            const bool finite = std::fabs(v) <= std::numeric_limits<float>::max(); // false for NaN too
+            lo = std::min(lo, finite ? v : lo);
+            hi = std::max(hi, finite ? v : hi);
+        }
+        e.lo[c] = lo, e.hi[c] = hi;
+    }
+}
+
 /// The extent of every pixel of `src`'s data window (not its canvas), a row
-/// per chunk; values that are not finite are left out.
+/// per chunk, combined in row order.
 Extent Measure(ThreadedOperator &op, const Image &src) {
+    constexpr int kBlock = 256;
     const ImgRectI dw = src.DataWindow();
     std::vector<Extent> rows(static_cast<size_t>(std::max(0, dw.Height())));
+    const bool direct = src.Depth() == DepthRGBAFlt32;
     op.DoMultiProcess(
         [&](int i) {
             if (src.CheckAbort()) return;
-            std::vector<FltPixel> px(static_cast<size_t>(dw.Width()));
-            LoadFlt(src.Depth(), src.ScanLine(dw.y0 + i), dw.Width(), px.data());
+            const uint8_t *row = src.ScanLine(dw.y0 + i);
             Extent &e = rows[static_cast<size_t>(i)];
-            for (const FltPixel &p : px) {
-                const float v[4] = {p.R, p.G, p.B, p.A};
-                for (int c = 0; c < 4; ++c)
-                    if (std::isfinite(v[c])) e.lo[c] = std::min(e.lo[c], v[c]), e.hi[c] = std::max(e.hi[c], v[c]);
+            if (direct) return AddPixels(e, reinterpret_cast<const float *>(row), dw.Width());
+            const int bpp = src.BytesPerPixel();
+            FltPixel px[kBlock];
+            for (int x = 0; x < dw.Width(); x += kBlock) {
+                const int n = std::min(kBlock, dw.Width() - x);
+                LoadFlt(src.Depth(), row + static_cast<size_t>(x) * bpp, n, px);
+                float flat[kBlock][4];
+                for (int k = 0; k < n; ++k)
+                    flat[k][0] = px[k].R, flat[k][1] = px[k].G, flat[k][2] = px[k].B, flat[k][3] = px[k].A;
+                AddPixels(e, flat[0], n);
             }
         },
         static_cast<int>(rows.size()));

@@ -1,6 +1,6 @@
 #pragma once
-// What the tests of the gain tools share: a document with a source and the tool, renders without the cache, and one
-// check of the processing frame that every per-pixel tool must keep.
+// What the tests of the gain tools share: a document with a source and the tool, renders without the cache, the
+// comparison with a model on every depth, and one check of the processing frame that every per-pixel tool keeps.
 #include <algorithm>
 #include <array>
 #include <cmath>
@@ -52,13 +52,43 @@ inline void ExpectSameBits(const Image &a, const Image &b, const ImgRectI &r) {
             << "row " << y;
 }
 
+using Model = std::function<Px(const Image &src, const Px &in)>;
+
+/// Renders the tool over a pattern at every depth (`set` makes its settings) and compares each pixel with `model`
+/// of the source pixel (a mask: its value in every channel): float32 within 2e-5, float16 within 1.5e-3 (relative
+/// above 1), integers the nearest stored value within float rounding of the half-way points.
+inline void ExpectModelOnEveryDepth(const char *cls, const std::function<void(Operator *)> &set, const Model &model) {
+    for (int depth : {DepthRGBAFlt32, DepthRGBAFlt16, DepthRGBAInt16, DepthRGBAInt8, DepthAFlt32, DepthAInt16}) {
+        SCOPED_TRACE("depth " + std::to_string(depth));
+        Ref<Image> src = Test::PatternImage(37, 11, depth, 7);
+        Rig rig(cls, src);
+        set(rig.tool);
+        Ref<Image> out = Render(rig.tool);
+        ASSERT_TRUE(out && out.Get() != src.Get());
+        const bool isFloat = src->IsFloat(), mask = src->IsMask();
+        const double top = isFloat ? 1 : depth == DepthRGBAInt8 ? 255 : 65535;
+        const double tol = depth == DepthRGBAFlt32 || depth == DepthAFlt32 ? 2e-5 : 1.5e-3;
+        for (int y = 0; y < 11; ++y)
+            for (int x = 0; x < 37; ++x) {
+                Px in = ToPx(src->GetFlt(x, y));
+                if (mask) in = {in[3], in[3], in[3], in[3]};
+                const Px want = model(*src, in), got = ToPx(out->GetFlt(x, y));
+                for (int c = mask ? 3 : 0; c < 4; ++c)
+                    if (isFloat)
+                        ASSERT_NEAR(got[c], want[c], tol * std::max(1.0, std::fabs(want[c]))) << x << "," << y;
+                    else
+                        ASSERT_NEAR(got[c] * top, std::clamp(want[c], 0.0, 1.0) * top, 0.52) << x << "," << y;
+            }
+    }
+}
+
 /// The rules of the frame for a tool whose settings are already made (`set` applies them to a fresh tool), with
 /// `model` the expected colour of an input colour of the source image, within `tol` (relative above 1) on float32 and
 /// one 16-bit step plus `tol` on 16-bit: under each clipping mode the data window, the canvas colour (processed, or
 /// kept under Domain and Frame), the processed canvas beyond the input's window, pre-calculation windows without
 /// pixels, regions of interest that are the same bits as the whole frame, and the same bits with one worker or many.
-inline void ExpectFrameRules(const char *cls, const std::function<void(Operator *)> &set,
-                             const std::function<Px(const Image &, const Px &)> &model, double tol) {
+inline void ExpectFrameRules(const char *cls, const std::function<void(Operator *)> &set, const Model &model,
+                             double tol) {
     const ImgRectI inWindow(8, 4, 40, 28);
     const FltPixel canvas{0.2f, 0.4f, 0.6f, 0.8f};
     const std::tuple<const char *, ImgRectI, bool> clips[] = {{"ClippingMode_None", inWindow, false},
