@@ -246,10 +246,13 @@ bool ColorGain::ReadValues(Request *req) {
     Values v;
     for (int s = 0; s < kSteps; ++s) {
         Step &st = s == 0 ? v.overall : v.range[s - 1];
-        const double masterGamma = read(gamma_[s][4]);
+        // The master values act on red, green and blue; alpha has only its own.
+        const double masterGain = read(gain_[s][4]), masterLift = read(lift_[s][4]), masterGamma = read(gamma_[s][4]);
         for (int c = 0; c < 4; ++c) {
-            const double gain = read(gain_[s][4]) * read(gain_[s][c]), lift = read(lift_[s][4]) + read(lift_[s][c]);
-            const double gamma = masterGamma * read(gamma_[s][c]);
+            const bool color = c < 3;
+            const double gain = (color ? masterGain : 1.0) * read(gain_[s][c]);
+            const double lift = (color ? masterLift : 0.0) + read(lift_[s][c]);
+            const double gamma = (color ? masterGamma : 1.0) * read(gamma_[s][c]);
             st.gain[c] = static_cast<float>(gain);
             st.lift[c] = static_cast<float>(lift);
             st.exponent[c] = static_cast<float>(gamma < 1e-5 ? 1e5 : 1.0 / gamma);

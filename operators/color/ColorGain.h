@@ -1,6 +1,6 @@
 #pragma once
-// ColorGain: gain, lift, gamma and saturation, each as a master value and per
-// channel, applied to the whole image and then once more, weighted, to its
+// ColorGain: gain, lift, gamma and saturation, each as a master value (red,
+// green, blue) and per channel (alpha too), applied to the whole image and then once more, weighted, to its
 // shadows, midtones and highlights (docs/COLOR_GAIN.md has the formulas).
 //
 // A frame takes one of three ways:

@@ -114,6 +114,7 @@ WhiteBalance::WhiteBalance(const Registry *reg, const ScriptVal &args, const Tag
                               {{LinkDataType, CLSID_DataType_Number},
                                {InputControl, CLSID_InputControl_MultiButton},
                                {InputDefault, 0.0},
+                               {InputNotify, 1},
                                {ButtonsFillRow, 1},
                                {ListAddItem, "Picked Color"},
                                {ListAddItem, "Temperature"}});
@@ -177,6 +178,17 @@ WhiteBalance::WhiteBalance(const Registry *reg, const ScriptVal &args, const Tag
 }
 
 WhiteBalance::~WhiteBalance() = default;
+
+void WhiteBalance::NotifyChanged(Input *in, Parameter *param, double time, TagList *tags) {
+    // Only the controls of the chosen method are shown.
+    if (const auto *n = dynamic_cast<const Number *>(param); n && in == method_) {
+        const bool picked = std::lround(n->value) == 0;
+        for (Input *i : neutral_) i->SetAttrsTagList({{ControlVisible, picked}});
+        for (Input *i : {temperature_, tint_, targetTemperature_, targetTint_})
+            i->SetAttrsTagList({{ControlVisible, !picked}});
+    }
+    ThreadedOperator::NotifyChanged(in, param, time, tags);
+}
 
 void WhiteBalance::Process(Request *req) {
     auto *src = dynamic_cast<Image *>(req->GetInputData(input_));

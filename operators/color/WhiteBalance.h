@@ -22,6 +22,7 @@ public:
     ~WhiteBalance() override;
     size_t SizeOf() const override { return sizeof(*this); }
 
+    void NotifyChanged(Input *in, Parameter *param, double time, TagList *tags) override;
     void Process(Request *req) override;
 
     /// CIE 1931 xy of the white of a colour temperature in kelvin (1667 to

@@ -40,8 +40,9 @@ double Luminance(const Px &p) { return 0.2126 * p[0] + 0.7152 * p[1] + 0.0722 * 
 
 Px ModelStep(const Step &s, Px p) {
     for (int c = 0; c < 4; ++c) {
-        p[c] = p[c] * s.gain[c] * s.gain[4] + s.lift[c] + s.lift[4];
-        const double gamma = s.gamma[c] * s.gamma[4];
+        const bool color = c < 3; // the master leaves alpha alone
+        p[c] = p[c] * s.gain[c] * (color ? s.gain[4] : 1) + s.lift[c] + (color ? s.lift[4] : 0);
+        const double gamma = s.gamma[c] * (color ? s.gamma[4] : 1);
         if (std::fabs(gamma - 1) >= 1.1920929e-07) {
             const double e = gamma < 1e-5 ? 1e5 : 1 / gamma;
             p[c] = std::copysign(std::pow(std::fabs(p[c]), e), p[c]);
