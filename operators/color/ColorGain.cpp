@@ -2,7 +2,9 @@
 
 #include <algorithm>
 #include <cmath>
+#include <cstddef>
 #include <cstring>
+#include <memory>
 #include <string>
 
 #include "host/color/FastPow.h"
@@ -12,6 +14,8 @@
 #include "host/flow/Request.h"
 #include "host/image/Image.h"
 #include "host/image/PixelConvert.h"
+#include "host/krom/KROMComputeNode.h"
+#include "host/krom/KROMParams.h"
 #include "operators/frame/Registration.h"
 
 namespace Orvane {
@@ -175,6 +179,80 @@ struct Reader {
     double operator()(const Input *in) const { return req->GetInputNumber(in); }
 };
 
+// The device kernel: the float rows' steps in their order, with the device's
+// powf for the power. Step s, channel c is entry 4 s + c of the arrays (s 0 the
+// whole image, 1 to 3 shadows, midtones, highlights); dp is the processed
+// canvas colour; windows are x0, x1, y0, y1.
+KROM_PARAM_STRUCT(ColorGainParams, {
+    float dp[4];
+    float gain[16], lift[16], exponent[16], sat[16];
+    int power[16];
+    int doSat[4], active[4];
+    float shadowsEnd, highlightsStart;
+    int doRanges, unused;
+    int inDataWindow[4];
+    int outDataWindow[4];
+    int workSize[2];
+    int srcCompOrder, dstCompOrder;
+})
+static_assert(sizeof(ColorGainParams) == 432);
+static_assert(offsetof(ColorGainParams, inDataWindow) == 384);
+static_assert(offsetof(ColorGainParams, srcCompOrder) == 424);
+
+const char kColorGainKernel[] = R"KROM(
+KROM_FN void cg_step(__CONSTANTREF__ ColorGainParams *q, int s, float *p) {
+    for (int c = 0; c < 4; ++c) {
+        float x = p[c] * q->gain[4 * s + c] + q->lift[4 * s + c];
+        if (q->power[4 * s + c]) x = _copysignf(_powf(_fabs(x), q->exponent[4 * s + c]), x);
+        p[c] = x;
+    }
+    if (q->doSat[s]) {
+        const float y = 0.2126f * p[0] + 0.7152f * p[1] + 0.0722f * p[2];
+        for (int c = 0; c < 3; ++c) p[c] = y + q->sat[4 * s + c] * (p[c] - y);
+    }
+}
+
+KROM_FN float cg_edge(float t) {
+    t = _fminf(_fmaxf(t, 0.f), 1.f);
+    return t * t * (3.f - 2.f * t);
+}
+
+KROM_FN float4 cg_chain(__CONSTANTREF__ ColorGainParams *q, float4 in) {
+    float p[4] = {in.x, in.y, in.z, in.w};
+    cg_step(q, 0, p);
+    if (q->doRanges) {
+        const float y = 0.2126f * p[0] + 0.7152f * p[1] + 0.0722f * p[2];
+        const float s = q->shadowsEnd > 0.f ? cg_edge(y / q->shadowsEnd) : (y > 0.f ? 1.f : 0.f);
+        const float hw = 1.f - q->highlightsStart;
+        const float h = hw > 0.f ? cg_edge((y - q->highlightsStart) / hw) : (y >= 1.f ? 1.f : 0.f);
+        float w[3];
+        w[0] = 1.f - s;
+        w[2] = h;
+        w[1] = 1.f - w[0] - w[2];
+        float sum[4] = {p[0], p[1], p[2], p[3]};
+        for (int r = 0; r < 3; ++r) {
+            if (!q->active[r + 1]) continue;
+            float t[4] = {p[0], p[1], p[2], p[3]};
+            cg_step(q, r + 1, t);
+            for (int c = 0; c < 4; ++c) sum[c] += w[r] * (t[c] - p[c]);
+        }
+        for (int c = 0; c < 4; ++c) p[c] = sum[c];
+    }
+    return make_float4(p[0], p[1], p[2], p[3]);
+}
+
+__KERNEL__ void ColorGain(__CONSTANTREF__ ColorGainParams *p_pParams, __TEXTURE2D__ input, __TEXTURE2D_WRITE__ output) {
+    DEFINE_KERNEL_ITERATORS_XY(x, y);
+    if (x >= p_pParams->workSize[0] || y >= p_pParams->workSize[1]) return;
+    const int2 pos = make_int2(x + p_pParams->outDataWindow[0], y + p_pParams->outDataWindow[2]);
+    float4 c = to_float4_v(p_pParams->dp);
+    if (IsInsideROI(pos, p_pParams->inDataWindow))
+        c = cg_chain(p_pParams, _tex2DVecN(input, pos.x - p_pParams->inDataWindow[0],
+                                           pos.y - p_pParams->inDataWindow[2], p_pParams->srcCompOrder));
+    _tex2DVec4Write(output, x, y, make_intensity(c, p_pParams->dstCompOrder));
+}
+)KROM";
+
 } // namespace
 
 void ColorGain::RangeWeights(const Values &v, float y, float w[3]) {
@@ -320,6 +398,35 @@ void ColorGain::BuildTables() {
     for (int c = 0; c < 4; ++c) v_.table[c] = tables_[c].data();
 }
 
+bool ColorGain::RunDevice(Request *req, const Image *src, Image *dst) const {
+    auto block = std::make_shared<ColorGainParams>();
+    ColorGainParams &p = *block;
+    std::memset(&p, 0, sizeof p);
+    const FltPixel canvas = dst->GetCanvasColor(); // already through the chain
+    const float dp[4] = {canvas.R, canvas.G, canvas.B, canvas.A};
+    std::memcpy(p.dp, dp, sizeof dp);
+    for (int s = 0; s < kSteps; ++s) {
+        const Step &st = s == 0 ? v_.overall : v_.range[s - 1];
+        for (int c = 0; c < 4; ++c) {
+            p.gain[4 * s + c] = st.gain[c], p.lift[4 * s + c] = st.lift[c], p.exponent[4 * s + c] = st.exponent[c];
+            p.power[4 * s + c] = st.power[c];
+            if (c < 3) p.sat[4 * s + c] = st.sat[c];
+        }
+        p.doSat[s] = st.doSat, p.active[s] = !st.neutral;
+    }
+    p.shadowsEnd = v_.shadowsEnd, p.highlightsStart = v_.highlightsStart, p.doRanges = v_.doRanges;
+    const bool hasPixels = src->HasScanLineData() || src->IsGPUMemDirty();
+    const ImgRectI in = hasPixels ? src->DataWindow() : ImgRectI(), out = dst->DataWindow();
+    const int inWindow[4] = {in.x0, in.x1, in.y0, in.y1}, outWindow[4] = {out.x0, out.x1, out.y0, out.y1};
+    std::memcpy(p.inDataWindow, inWindow, sizeof inWindow);
+    std::memcpy(p.outDataWindow, outWindow, sizeof outWindow);
+    p.workSize[0] = out.Width();
+    p.workSize[1] = out.Height();
+    return KROMComputeNode::ExecKernelI(
+        req, "ColorGain", kColorGainKernel, ColorGainParamsText, sizeof p, offsetof(ColorGainParams, srcCompOrder),
+        offsetof(ColorGainParams, dstCompOrder), block, {{"input", const_cast<Image *>(src)}, {"output", dst}});
+}
+
 void ColorGain::Process(Request *req) {
     auto *src = dynamic_cast<Image *>(req->GetInputData(input_));
     if (!src || !ReadValues(req)) {
@@ -362,7 +469,8 @@ void ColorGain::Process(Request *req) {
     uint8_t canvasPixel[16];
     StoreFlt(v_.depth, &out, 1, canvasPixel);
 
-    if (!req->IsPreCalc() && !dst->ValidWindow().IsNull()) {
+    const bool rowsWanted = !req->IsPreCalc() && !dst->ValidWindow().IsNull();
+    if (rowsWanted && !(IsGPUEnabled(req, true) && RunDevice(req, src, dst.Get()))) {
         if (span != &SpanGeneral && span != &SpanFlt32) BuildTables();
         if (!src->DownloadGPUMem() || !dst->AllocScanLineData()) return outOfMemory();
         const PointRows rows(*src, *dst, canvasPixel);

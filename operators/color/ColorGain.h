@@ -11,6 +11,9 @@
 //    the steps in float with true powers (FastPow.h); 8 and 16-bit RGBA pixels
 //    read the per-channel gain, lift and gamma from tables worked out in double
 //    for every stored value, and take saturation and the ranges in float.
+//    When the render has a device, the tool's own kernel "ColorGain" does the
+//    float steps there first (powers by the device's powf), and the rows run
+//    only if it fails.
 // The canvas colour goes through the same function as the pixels.
 //
 // RunGainMatrix is the matrix way shared by the gain tools (WhiteBalance and
@@ -72,6 +75,7 @@ private:
     bool ReadValues(Request *req);
     ColorMatrixFull LinearMatrix() const;
     void BuildTables();
+    bool RunDevice(Request *req, const Image *src, Image *dst) const;
 
     static constexpr int kSteps = 4, kChannels = 5; ///< overall + three ranges; R, G, B, A, master
     Input *gain_[kSteps][kChannels], *lift_[kSteps][kChannels], *gamma_[kSteps][kChannels];

@@ -6,6 +6,7 @@
 
 #include <gtest/gtest.h>
 
+#include "tests/host/krom/DeviceTestSupport.h"
 #include "tests/operators/color/GainTestSupport.h"
 
 namespace Orvane::colorgaintest {
@@ -136,6 +137,36 @@ TEST_F(ColorGain, NeutralSettingsHandTheInputOnAndABadRangeFails) {
     const auto lines = rig.doc.ConsoleLines();
     ASSERT_EQ(lines.size(), 1u);
     EXPECT_EQ(lines[0].text.rfind(rig.tool->Name() + ": Shadows End", 0), 0u) << lines[0].text;
+}
+
+TEST_F(ColorGain, TheDeviceMatchesTheRows) {
+    ORVANE_NEED_OPENCL(ctx);
+    // The device's powf against the rows' powers; integers are the rows' tables in double against float.
+    const std::pair<int, double> depths[] = {
+        {DepthRGBAFlt32, 2e-5}, {DepthRGBAFlt16, 1e-3}, {DepthRGBAInt16, 1.01 / 65535}, {DepthRGBAInt8, 1.01 / 255}};
+    const ImgRectI window(-3, 5, 50, 38), roi(12, 2, 61, 33);
+    for (const auto &[name, s] : Cases())
+        for (const auto &[depth, tol] : depths) {
+            SCOPED_TRACE(std::string(name) + ", depth " + std::to_string(depth));
+            gaintest::Rig rig("ColorGain",
+                              Orvane::Test::WindowedImage(64, 40, window, {0.2f, -0.1f, 0.6f, 0.5f}, 5, depth));
+            Apply(rig.tool, s);
+            const int launches = ctx->LaunchCount();
+            RenderTask task;
+            Ref<Image> cpu = gaintest::Render(rig.tool, &roi), dev = gaintest::Render(rig.tool, &roi, 0, ctx, &task);
+            ASSERT_TRUE(cpu && dev && dev->DataWindow() == cpu->DataWindow());
+            EXPECT_GT(ctx->LaunchCount(), launches) << "the device ran";
+            EXPECT_TRUE(task.DeviceLog().empty()) << task.DeviceLog().front();
+            EXPECT_EQ(dev->GetCanvasColor(), cpu->GetCanvasColor());
+            const ImgRectI dw = cpu->DataWindow();
+            for (int y = dw.y0; y < dw.y1; ++y)
+                for (int x = dw.x0; x < dw.x1; ++x)
+                    for (int c = 0; c < 4; ++c) {
+                        const double want = gaintest::ToPx(cpu->GetFlt(x, y))[c];
+                        ASSERT_NEAR(gaintest::ToPx(dev->GetFlt(x, y))[c], want, tol * std::max(1.0, std::fabs(want)))
+                            << x << "," << y << " channel " << c;
+                    }
+        }
 }
 
 } // namespace

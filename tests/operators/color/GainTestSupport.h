@@ -35,11 +35,14 @@ struct Rig {
     }
 };
 
-/// Renders a tool's main output without the result cache.
-inline Ref<Image> Render(Operator *op, const ImgRectI *roi = nullptr, uint32_t flags = 0) {
-    RenderTask task;
+/// Renders a tool's main output without the result cache (on `device` when given, in `task` when given).
+inline Ref<Image> Render(Operator *op, const ImgRectI *roi = nullptr, uint32_t flags = 0,
+                         IDeviceContext *device = nullptr, RenderTask *task = nullptr) {
+    RenderTask own;
+    RenderTask &t = task ? *task : own;
+    t.SetDevice(device);
     EvalOptions opt;
-    opt.task = &task, opt.flags = flags, opt.useCache = false;
+    opt.task = &t, opt.flags = flags, opt.useCache = false;
     if (roi) opt.roi = ImageDomain(*roi);
     return Test::EvalImage(op, 0.0, opt);
 }
