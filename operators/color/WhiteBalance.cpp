@@ -62,8 +62,9 @@ void UVToXY(double u, double v, double &x, double &y) {
     x = 3 * u / d, y = 2 * v / d;
 }
 
-/// The Planckian locus in xy, by the cubic spline approximation of Kim et al.
-/// (2002), good to about 1e-3 from 1667 K to 25000 K.
+/// The Planckian locus in xy by the published cubic spline approximation
+/// (x as a cubic in 1000 / T over two spans, y as a cubic in x over three),
+/// good to about 1e-3 from 1667 K to 25000 K.
 void PlanckXY(double t, double &x, double &y) {
     const double t1 = 1e3 / t, t2 = t1 * t1, t3 = t2 * t1;
     x = t <= 4000 ? -0.2661239 * t3 - 0.2343589 * t2 + 0.8776956 * t1 + 0.179910
