@@ -8,6 +8,7 @@
 
 #include "tests/host/krom/DeviceTestSupport.h"
 #include "tests/operators/color/GainTestSupport.h"
+#include "tests/operators/media/FormatTestSupport.h"
 
 namespace Orvane::colorgaintest {
 namespace {
@@ -137,6 +138,41 @@ TEST_F(ColorGain, NeutralSettingsHandTheInputOnAndABadRangeFails) {
     const auto lines = rig.doc.ConsoleLines();
     ASSERT_EQ(lines.size(), 1u);
     EXPECT_EQ(lines[0].text.rfind(rig.tool->Name() + ": Shadows End", 0), 0u) << lines[0].text;
+}
+
+TEST_F(ColorGain, TheWholeImageStepAgreesWithOiiotool) {
+    if (!FmtTest::HaveProgram("oiiotool")) GTEST_SKIP() << "oiiotool is not installed";
+    // Gain, lift, gamma and saturation as oiiotool's multiply, add, power and saturate, on values that the lift keeps
+    // above 0 (its power of a negative value is not a number).
+    const Orvane::Test::TempDir dir;
+    FmtTest::WriteFile(dir / "in.exr",
+                       FmtTest::Save("OpenEXRFormat", Orvane::Test::PatternImage(33, 17, DepthRGBAFlt32, 3).Get()));
+    const FmtTest::LoadResult in = FmtTest::Load("OpenEXRFormat", FmtTest::ReadFile(dir / "in.exr"));
+    ASSERT_TRUE(in.image) << in.error; // both start from the values as the file holds them
+    ASSERT_TRUE(FmtTest::RunShell("oiiotool " + (dir / "in.exr") +
+                                  " --mulc 1.32,0.99,1.1,1 --addc 0.35,0.35,0.35,0 --powc 1.25,0.625,0.8,1"
+                                  " --saturate 0.7 -d float -o " +
+                                  (dir / "out.exr") + " >/dev/null"));
+    FmtTest::LoadResult theirs = FmtTest::Load("OpenEXRFormat", FmtTest::ReadFile(dir / "out.exr"));
+    ASSERT_TRUE(theirs.image) << theirs.error;
+    gaintest::Rig rig("ColorGain", in.image);
+    Orvane::Test::SetNumbers(rig.tool, {{"Gain", 1.1},
+                                        {"RedGain", 1.2},
+                                        {"GreenGain", 0.9},
+                                        {"Lift", 0.35},
+                                        {"Gamma", 1.25},
+                                        {"RedGamma", 0.64},
+                                        {"GreenGamma", 1.28},
+                                        {"Saturation", 0.7}});
+    Ref<Image> ours = gaintest::Render(rig.tool);
+    ASSERT_TRUE(ours);
+    for (int y = 0; y < 17; ++y)
+        for (int x = 0; x < 33; ++x)
+            for (int c = 0; c < 4; ++c) {
+                const double want = gaintest::ToPx(theirs.image->GetFlt(x, y))[c];
+                ASSERT_NEAR(gaintest::ToPx(ours->GetFlt(x, y))[c], want, 2e-6 * std::max(1.0, std::fabs(want)))
+                    << x << "," << y << " channel " << c;
+            }
 }
 
 TEST_F(ColorGain, TheDeviceMatchesTheRows) {
