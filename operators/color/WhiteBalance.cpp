@@ -201,7 +201,8 @@ void WhiteBalance::Process(Request *req) {
     const ColorMatrixFull toSpace = ToScalingSpace(cones);
     // The white to remove and the white it becomes, as RGB.
     double from[3], to[3];
-    if (std::lround(req->GetInputNumber(method_)) == 0) {
+    const bool picked = std::lround(req->GetInputNumber(method_)) == 0;
+    if (picked) {
         for (int c = 0; c < 3; ++c) from[c] = req->GetInputNumber(neutral_[c]);
         const double y = 0.2126 * from[0] + 0.7152 * from[1] + 0.0722 * from[2];
         to[0] = to[1] = to[2] = y;
@@ -219,8 +220,13 @@ void WhiteBalance::Process(Request *req) {
     bool neutral = true;
     for (int c = 0; c < 3; ++c) {
         if (!(fromS[c] > kEps) || !(toS[c] > kEps)) {
-            Fail(req, "%s: the neutral color (%g, %g, %g) cannot be balanced: it has no %s\n", Name().c_str(), from[0],
-                 from[1], from[2], cones ? "positive cone response" : "positive red, green and blue");
+            // A picked colour with a channel at 0, or a temperature white outside the RGB primaries.
+            const double *bad = fromS[c] > kEps ? to : from;
+            Fail(req, "%s: the %s (%g, %g, %g) cannot be balanced: it has no %s\n", Name().c_str(),
+                 picked        ? "neutral color"
+                 : bad == from ? "temperature's white"
+                               : "target's white",
+                 bad[0], bad[1], bad[2], cones ? "positive cone response" : "positive red, green and blue");
             req->SetOutputData(output_, nullptr);
             return;
         }

@@ -117,7 +117,7 @@ TEST_F(WhiteBalance, ForwardThenReverseGivesTheInputBack) {
         }
 }
 
-TEST_F(WhiteBalance, NeutralSettingsHandTheInputOnAndAColourWithoutRedFails) {
+TEST_F(WhiteBalance, NeutralSettingsHandTheInputOnAndWhitesItCannotScaleFail) {
     Ref<Image> src = Orvane::Test::PatternImage(8, 4, DepthRGBAFlt16);
     Rig rig("WhiteBalance", src);
     const Values neutral[] = {
@@ -128,11 +128,17 @@ TEST_F(WhiteBalance, NeutralSettingsHandTheInputOnAndAColourWithoutRedFails) {
         Orvane::Test::SetNumbers(rig.tool, values);
         EXPECT_EQ(Render(rig.tool).Get(), src.Get());
     }
-    Orvane::Test::SetNumbers(rig.tool, Picked({0, 0.5, 0.5, 1}, 0));
-    EXPECT_EQ(Render(rig.tool), nullptr);
-    const auto lines = rig.doc.ConsoleLines();
-    ASSERT_EQ(lines.size(), 1u);
-    EXPECT_EQ(lines[0].text.rfind(rig.tool->Name() + ": the neutral color", 0), 0u) << lines[0].text;
+    // A picked colour without red; 1667 K, whose white has no blue in Rec. 709 RGB: one line each.
+    const std::pair<Values, const char *> bad[] = {
+        {Picked({0, 0.5, 0.5, 1}, 0), ": the neutral color"},
+        {{{"Method", 1}, {"Space", 0}, {"Temperature", 1667}}, ": the temperature's white"}};
+    for (size_t i = 0; i < std::size(bad); ++i) {
+        Orvane::Test::SetNumbers(rig.tool, bad[i].first);
+        EXPECT_EQ(Render(rig.tool), nullptr);
+        const auto lines = rig.doc.ConsoleLines();
+        ASSERT_EQ(lines.size(), i + 1);
+        EXPECT_EQ(lines[i].text.rfind(rig.tool->Name() + bad[i].second, 0), 0u) << lines[i].text;
+    }
 }
 
 TEST_F(WhiteBalance, MatchesItsScalesInRGBOnEveryDepthAndKeepsTheFrameRules) {
