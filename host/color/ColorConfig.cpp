@@ -143,6 +143,16 @@ void ColorProcessor::Apply(float *rgba, int count) const {
     impl_->cpu->apply(desc);
 }
 
+ColorProcessorPtr KeptColorProcessor::Get(const std::string &key,
+                                          const std::function<ColorProcessorPtr(std::string *)> &make,
+                                          std::string *error) {
+    std::lock_guard<std::mutex> hold(lock_);
+    if (kept_ && key == key_) return kept_;
+    ColorProcessorPtr made = make(error);
+    if (made) kept_ = made, key_ = key;
+    return made;
+}
+
 ColorConfig::ColorConfig(std::unique_ptr<Impl> impl) : impl_(std::move(impl)) {}
 ColorConfig::~ColorConfig() = default;
 

@@ -19,7 +19,9 @@
 // Thread safety: configurations and processors are immutable once made, and
 // may be used from any number of threads at once. The functions that load
 // configurations keep a cache under a lock, and are safe from any thread.
+#include <functional>
 #include <memory>
+#include <mutex>
 #include <string>
 #include <vector>
 
@@ -48,6 +50,21 @@ private:
 };
 
 using ColorProcessorPtr = std::shared_ptr<const ColorProcessor>;
+
+/// The processor last made for a tool's settings, kept under a key that
+/// stands for them, so that it is built and optimised once and not per frame.
+class ORVANE_API KeptColorProcessor {
+public:
+    /// The processor kept under `key`, made by `make` when the key changed
+    /// (a failure, with `error` set by `make`, is not kept).
+    ColorProcessorPtr Get(const std::string &key, const std::function<ColorProcessorPtr(std::string *)> &make,
+                          std::string *error);
+
+private:
+    std::mutex lock_;
+    std::string key_;
+    ColorProcessorPtr kept_;
+};
 
 /// How a LUT file's table is read between its points: the file format's
 /// own way, linear (1D) and trilinear (3D), tetrahedral (3D), or the best

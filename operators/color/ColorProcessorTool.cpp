@@ -43,16 +43,6 @@ void ColorProcessorTool::AddImageLinks() {
     output_ = AddOutputTagList("Output", "Output", {{LinkDataType, CLSID_DataType_Image}, {LinkMain, 1}});
 }
 
-ColorProcessorPtr ColorProcessorTool::Kept(const std::string &key,
-                                           const std::function<ColorProcessorPtr(std::string *)> &make,
-                                           std::string *error) {
-    std::lock_guard<std::mutex> hold(keptLock_);
-    if (kept_ && key == keptKey_) return kept_;
-    ColorProcessorPtr made = make(error);
-    if (made) kept_ = made, keptKey_ = key;
-    return made;
-}
-
 void ColorProcessorTool::Process(Request *req) {
     auto *src = dynamic_cast<Image *>(req->GetInputData(input_));
     if (!src) { // a required main input: the engine does not get here without one

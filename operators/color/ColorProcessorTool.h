@@ -16,7 +16,6 @@
 // Thread safety: Process runs on the tool's render thread; the kept
 // processor is guarded by a lock, and the rows share the processor read-only.
 #include <functional>
-#include <mutex>
 #include <string>
 
 #include "host/color/ColorConfig.h"
@@ -38,14 +37,14 @@ protected:
     virtual ColorProcessorPtr ProcessorFor(Request *req, bool *passThrough, std::string *error) = 0;
     /// The processor kept under `key`, made by `make` when the key changed.
     ColorProcessorPtr Kept(const std::string &key, const std::function<ColorProcessorPtr(std::string *)> &make,
-                           std::string *error);
+                           std::string *error) {
+        return kept_.Get(key, make, error);
+    }
 
 private:
     Input *input_ = nullptr;
     Output *output_ = nullptr;
-    std::mutex keptLock_;
-    std::string keptKey_;
-    ColorProcessorPtr kept_;
+    KeptColorProcessor kept_;
 };
 
 } // namespace Orvane

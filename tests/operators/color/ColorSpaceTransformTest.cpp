@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <cmath>
 #include <cstdlib>
+#include <filesystem>
 #include <fstream>
 #include <string>
 #include <vector>
@@ -11,8 +12,11 @@
 
 #include "host/color/ColorConfig.h"
 #include "host/flow/Engine.h"
+#include "host/flow/InputValue.h"
 #include "host/flow/OrvaneDoc.h"
+#include "host/flow/RenderTask.h"
 #include "host/image/NewImage.h"
+#include "host/media/Clip.h"
 #include "tests/host/image/ImageTestSupport.h"
 #include "tests/support/TestSupport.h"
 
@@ -178,6 +182,63 @@ TEST_F(ColorSpaceTransformTest, FailuresNameWhatIsMissing) {
         EXPECT_NE(console.find(cst->Name() + ": " + c.line), std::string::npos) << console;
         if (c.config) EXPECT_NE(console.find(dir / c.config), std::string::npos) << console;
     }
+}
+
+TEST_F(ColorSpaceTransformTest, LoaderReadsFromAConfigurationSpace) {
+    // A float file of sRGB-encoded greys; the Loader's Color Space choice takes them to scene_linear.
+    const std::string file = dir / "greys.raw";
+    std::string error;
+    ASSERT_TRUE(Clip(file).PutFrameTagList(0, Greys(kValues).Get(), {}, error)) << error;
+    struct Case {
+        const char *space;
+        bool fails;
+    };
+    for (const Case &c : {Case{"srgb_texture", false}, Case{"Nowhere", true}}) {
+        SCOPED_TRACE(c.space);
+        OrvaneDoc doc;
+        Operator *loader = doc.AddTool(OvID("Loader"), "Plate");
+        ASSERT_TRUE(loader);
+        for (const auto &[id, value] : {std::pair<const char *, ScriptVal>{"Clip", ScriptVal(file)},
+                                        {"GamutSpace", ScriptVal("ColorSpace")},
+                                        {"GamutColorSpace", ScriptVal(c.space)}})
+            ASSERT_EQ(ApplyInputValue(doc, loader->FindInput(id), value), "") << id;
+        Ref<Image> out = T::EvalImage(loader);
+        if (c.fails) {
+            EXPECT_FALSE(out);
+            EXPECT_NE(T::ConsoleText(doc).find("Plate: no colour space 'Nowhere' in the configuration built-in"),
+                      std::string::npos)
+                << T::ConsoleText(doc);
+            continue;
+        }
+        ASSERT_TRUE(out) << T::ConsoleText(doc);
+        for (size_t x = 0; x < kValues.size(); ++x)
+            EXPECT_NEAR(out->GetFlt(static_cast<int>(x), 0).G, SrgbToLinear(kValues[x]),
+                        2e-5 * std::max(1.0, kValues[x]))
+                << kValues[x];
+    }
+}
+
+TEST_F(ColorSpaceTransformTest, SaverWritesToAConfigurationSpace) {
+    OrvaneDoc doc;
+    Operator *source = T::AddImageSource(doc, "Src", Greys(kValues));
+    Operator *saver = doc.AddTool(OvID("Saver"), "Out");
+    ASSERT_TRUE(saver && saver->FindInput("Input")->ConnectTo(source->FindMainOutput()));
+    for (const auto &[id, value] : {std::pair<const char *, ScriptVal>{"Clip", ScriptVal(dir / "out.0000.raw")},
+                                    {"GamutSpace", ScriptVal("ColorSpace")},
+                                    {"GamutColorSpace", ScriptVal("color_picking")}})
+        ASSERT_EQ(ApplyInputValue(doc, saver->FindInput(id), value), "") << id;
+    RenderTask task;
+    EvalOptions opt;
+    opt.task = &task;
+    ASSERT_TRUE(Evaluate(saver->FindMainOutput(), 0.0, opt)) << T::ConsoleText(doc);
+    std::vector<std::string> written;
+    for (const auto &entry : std::filesystem::directory_iterator(dir.path)) written.push_back(entry.path().string());
+    ASSERT_EQ(written.size(), 1u);
+    std::string error;
+    Ref<Image> back = Clip(written[0]).GetFrameTagList(0, {}, error);
+    ASSERT_TRUE(back) << error;
+    for (size_t x = 0; x < kValues.size(); ++x)
+        EXPECT_NEAR(back->GetFlt(static_cast<int>(x), 0).B, LinearToSrgb(kValues[x]), 2e-5) << kValues[x];
 }
 
 TEST_F(ColorSpaceTransformTest, SameAsOiiotool) {
