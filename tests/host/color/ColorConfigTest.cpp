@@ -5,6 +5,8 @@
 #include <gtest/gtest.h>
 
 #include "host/color/ColorConfig.h"
+#include "host/flow/DocumentIO.h"
+#include "host/flow/OrvaneDoc.h"
 
 namespace Orvane {
 namespace {
@@ -61,6 +63,32 @@ TEST(ColorConfig, ProcessorValues) {
     EXPECT_FLOAT_EQ(c[2], 0.1f);
     EXPECT_FALSE(ColorConfig::DescribedProcessor("!<NoSuchTransform> {}", &error));
     EXPECT_TRUE(ColorConfig::BuiltIn()->SpaceProcessor("linear", "scene_linear", &error)->IsNoOp());
+}
+
+TEST(ColorConfig, DocumentPreferenceIsReadWrittenAndChecked) {
+    struct Case {
+        const char *prefs;
+        bool ok;
+        const char *path;
+    };
+    const Case cases[] = {{"ColorConfig = \"looks/show.ocio\"", true, "looks/show.ocio"},
+                          {"ColorConfig = 3", false, ""},
+                          {"FFWidth = 640", true, ""}};
+    for (const Case &c : cases) {
+        SCOPED_TRACE(c.prefs);
+        OrvaneDoc doc;
+        const std::string text = std::string("Orvane.Document { Prefs = { ") + c.prefs + " } }\n";
+        const DocumentLoadResult result = LoadDocument(text, doc);
+        EXPECT_EQ(result.ok, c.ok) << result.error;
+        if (!c.ok) continue;
+        EXPECT_EQ(doc.ColorConfigPath(), c.path);
+        // Saved and read again: the same preference; relative names are taken from the document's folder.
+        OrvaneDoc again;
+        ASSERT_TRUE(LoadDocument(SaveDocument(doc), again).ok);
+        EXPECT_EQ(again.ColorConfigPath(), c.path);
+        again.SetFilePath("/shows/a/comp.orvane");
+        EXPECT_EQ(ColorConfig::PathFor(&again), *c.path ? std::string("/shows/a/") + c.path : "");
+    }
 }
 
 } // namespace

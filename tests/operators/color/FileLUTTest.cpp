@@ -174,13 +174,22 @@ TEST_F(FileLUTTest, InterpolationAndDirection) {
     }
 }
 
-TEST_F(FileLUTTest, CanvasColourAndRelativeNames) {
+TEST_F(FileLUTTest, CanvasColourRegionsAndRelativeNames) {
     Write(dir / "invert.cube", Cube3D(Invert, 2));
     const FltPixel canvas{0.25f, 0.5f, 0.75f, 1.f};
     Rig rig(T::WindowedImage(16, 8, ImgRectI(4, 2, 10, 6), canvas, 5, DepthRGBAFlt32));
     rig.doc.SetFilePath(dir / "flow.orvane"); // relative names are taken from the document's folder
     Ref<Image> out = rig.Run("invert.cube");
     ASSERT_TRUE(out) << T::ConsoleText(rig.doc);
+    // A region of interest gives the same values as the same part of the whole frame.
+    const ImgRectI roi(3, 1, 9, 5);
+    EvalOptions opt;
+    opt.useCache = false;
+    opt.roi = ImageDomain(roi);
+    Ref<Image> part = T::EvalImage(rig.lut, 0.0, opt);
+    ASSERT_TRUE(part);
+    for (int y = roi.y0; y < roi.y1; ++y)
+        for (int x = roi.x0; x < roi.x1; ++x) EXPECT_EQ(part->GetFlt(x, y), out->GetFlt(x, y)) << x << "," << y;
     const FltPixel want{0.75f, 0.5f, 0.25f, 1.f};
     T::ExpectPixelNear(out->GetCanvasColor(), want, 1e-6, "canvas");
     T::ExpectPixelNear(out->GetFlt(1, 1), want, 1e-6, "beyond the window");
