@@ -5,6 +5,8 @@ packages=(
   build-essential cmake ninja-build pkg-config ccache
   libtbb-dev libfmt-dev libgtest-dev libgmock-dev libbenchmark-dev
   libjpeg62-turbo-dev libpng-dev zlib1g-dev libopenexr-dev
+  # Colour management: colour spaces and LUT files.
+  libopencolorio-dev
   # The device path: OpenCL headers and loader, and PoCL, which runs OpenCL
   # kernels on the CPU so that every machine exercises the device path.
   ocl-icd-opencl-dev opencl-headers pocl-opencl-icd

@@ -73,5 +73,6 @@ int RunDescribe(const std::vector<std::string> &args);
 int RunEval(const std::vector<std::string> &args);
 int RunInfo(const std::vector<std::string> &args);
 int RunRender(const std::vector<std::string> &args);
+int RunColorSpaces(const std::vector<std::string> &args);
 
 } // namespace Orvane::Cli

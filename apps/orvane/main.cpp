@@ -93,6 +93,11 @@ const Command kCommands[] = {
   --json                one JSON array of files (docs/EXR.md)
   Exit: 0 every file read, 2 bad command line, 3 a file could not be read.
 )"},
+    {"colorspaces", RunColorSpaces, R"(orvane colorspaces [--config FILE]
+  Lists the colour spaces (name, family, aliases) and roles of a colour
+  configuration: FILE, else the one named by $OCIO, else the built-in one.
+  Exit: 0 listed, 2 bad command line, 3 the configuration could not be read.
+)"},
     {"version", RunVersion, R"(orvane version
   Prints the program version (also orvane --version).
 )"},

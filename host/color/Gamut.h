@@ -30,8 +30,18 @@
 
 namespace Orvane {
 
-/// Encodings. The numbers are stable (tools may store them).
-enum class GamutSpace : int { NoChange = 0, Linear = 1, SRGB = 2, Rec709 = 3, Gamma = 4, CineonLog = 5 };
+/// Encodings. The numbers are stable (tools may store them). ConfigSpace is a
+/// colour space of the colour configuration (host/color/ColorConfig.h), which
+/// GamutInputs converts; the curve functions below leave its values alone.
+enum class GamutSpace : int {
+    NoChange = 0,
+    Linear = 1,
+    SRGB = 2,
+    Rec709 = 3,
+    Gamma = 4,
+    CineonLog = 5,
+    ConfigSpace = 6
+};
 
 struct CineonLogParams {
     double black = 95.0;    ///< code value of black (linear 0)

@@ -29,6 +29,8 @@ namespace Orvane {
 namespace {
 
 constexpr const char *DocumentClass = "Orvane.Document";
+/// The preference that names a colour management configuration file.
+constexpr const char *kColorConfigPref = "ColorConfig";
 const std::vector<std::string> kTopEntries = {"Version", "Program", "GlobalRange", "RenderRange", "Prefs", "Tools"};
 /// Documents larger than this are refused before reading (a flow of 50,000 tools is a few MiB).
 constexpr size_t kMostDocumentBytes = size_t(512) << 20;
@@ -167,7 +169,12 @@ private:
         for (int i = 0; i < PREF_Count; ++i) names.push_back(PrefName(static_cast<PrefID>(i)));
         for (const auto &[key, value] : prefs.Entries()) {
             const auto known = key.IsText() ? std::find(names.begin(), names.end(), key.AsText()) : names.end();
-            if (known == names.end()) {
+            if (key.IsText() && key.AsText() == kColorConfigPref) {
+                if (value.IsText())
+                    doc_.SetColorConfigPath(value.AsText());
+                else
+                    Problem(&value, "Prefs." + key.AsText() + ": expects a file name, got " + value.ToText());
+            } else if (known == names.end()) {
                 Warn(&key, "unknown preference " + key.ToText() +
                                (key.IsText() ? DidYouMean(key.AsText(), names) : std::string()) + " is kept as it is");
                 doc_.KeptPrefs().Set(key, value);
@@ -400,6 +407,7 @@ std::string SaveDocument(const OrvaneDoc &doc) {
     for (int id = 0; id < PREF_Count; ++id)
         if (doc.PrefIsSet(static_cast<PrefID>(id)))
             prefs.Set(PrefName(static_cast<PrefID>(id)), doc.GetPrefDouble(static_cast<PrefID>(id)));
+    if (!doc.ColorConfigPath().empty()) prefs.Set(kColorConfigPref, doc.ColorConfigPath());
     for (const auto &[key, value] : doc.KeptPrefs().Entries()) prefs.Set(key, value);
     if (prefs.Size()) add("Prefs", std::move(prefs));
 

@@ -8,6 +8,7 @@
 #include "host/flow/DataTypes.h"
 #include "host/flow/Link.h"
 #include "host/flow/Operator.h"
+#include "host/flow/Parameter.h"
 #include "host/flow/RenderTask.h"
 #include "host/flow/Request.h"
 #include "host/image/NewImage.h"
@@ -25,7 +26,8 @@ constexpr Choice kChoices[] = {{GamutSpace::NoChange, "NoChange", "No Change"},
                                {GamutSpace::SRGB, "sRGB", "sRGB"},
                                {GamutSpace::Rec709, "Rec709", "Rec.709"},
                                {GamutSpace::Gamma, "Gamma", "Gamma"},
-                               {GamutSpace::CineonLog, "CineonLog", "Cineon Log"}};
+                               {GamutSpace::CineonLog, "CineonLog", "Cineon Log"},
+                               {GamutSpace::ConfigSpace, "ColorSpace", "Color Space"}};
 
 /// Pixels converted at a time in the rows.
 constexpr int kBlock = 256;
@@ -34,6 +36,7 @@ constexpr int kBlock = 256;
 struct Converter {
     GamutCurve curve;
     bool toLinear, preDivide;
+    const ColorProcessor *proc; ///< a configuration's transform, in place of the curve
 
     void Run(FltPixel *px, int n) const {
         auto *f = reinterpret_cast<float *>(px);
@@ -51,7 +54,9 @@ struct Converter {
         }
     }
     void Convert(float *rgba, int n) const {
-        if (toLinear)
+        if (proc)
+            proc->Apply(rgba, n);
+        else if (toLinear)
             GamutRowToLinear(curve, rgba, n);
         else
             GamutRowFromLinear(curve, rgba, n);
@@ -114,6 +119,11 @@ GamutInputs::GamutInputs(Operator *tool, Direction direction) : tool_(tool), dir
     enable_ =
         toLinear ? checkbox("Remove Gamma", "GamutRemoveGamma", 1.0) : checkbox("Add Gamma", "GamutAddGamma", 1.0);
     preDivide_ = checkbox("Pre-Divide/Post-Multiply", "GamutPreDivide", 0.0);
+    colorSpace_ = tool_->AddInputTagList("Color Space", "GamutColorSpace",
+                                         {{LinkDataType, CLSID_DataType_Text},
+                                          {InputControl, CLSID_InputControl_TextEdit},
+                                          {ControlPage, page},
+                                          {InputDefaultText, "sRGB"}});
     ShowFor(GamutSpace::NoChange);
 }
 
@@ -124,6 +134,7 @@ void GamutInputs::ShowFor(GamutSpace space) {
     const bool log = space == GamutSpace::CineonLog;
     const bool curve = space != GamutSpace::NoChange && space != GamutSpace::Linear;
     show(gamma_, space == GamutSpace::Gamma);
+    show(colorSpace_, space == GamutSpace::ConfigSpace);
     for (Input *in : {logBlack_, logWhite_, logFilmGamma_, logSoftClip_}) show(in, log);
     show(enable_, curve);
     show(preDivide_, curve);
@@ -148,12 +159,39 @@ GamutCurve GamutInputs::CurveOf(const Request *req) const {
     return c;
 }
 
-Ref<Image> GamutInputs::ProcessOf(Request *req, Image *in, Image *out, OvID clippingMode, bool convert) {
+ColorProcessorPtr GamutInputs::ConfigProcessor(const Request *req, std::string *error) {
+    const auto *text = req ? dynamic_cast<const Text *>(req->GetInputData(colorSpace_)) : nullptr;
+    const std::string space = text ? text->value : "sRGB";
+    const std::string from = direction_ == ToLinear ? space : "scene_linear";
+    const std::string to = direction_ == ToLinear ? "scene_linear" : space;
+    const std::string configPath = ColorConfig::PathFor(tool_->GetDoc());
+    return kept_.Get(
+        configPath + '\n' + from + '\n' + to,
+        [&](std::string *err) -> ColorProcessorPtr {
+            const auto config = ColorConfig::Load(configPath, err);
+            return config ? config->SpaceProcessor(from, to, err) : nullptr;
+        },
+        error);
+}
+
+Ref<Image> GamutInputs::ProcessOf(Request *req, Image *in, Image *out, OvID clippingMode, bool convert,
+                                  std::string *error) {
     if (!in) return nullptr;
     const GamutCurve curve = CurveOf(req);
     const bool enabled = !req || req->GetInputNumber(enable_, 1.0) >= 0.5;
     if (!convert || !enabled || curve.IsIdentity() || in->IsMask()) return Ref<Image>(in);
-    const gamutinputs::Converter conv{curve, direction_ == ToLinear, req && req->GetInputNumber(preDivide_) >= 0.5};
+    ColorProcessorPtr proc;
+    if (curve.space == GamutSpace::ConfigSpace) {
+        std::string why;
+        proc = ConfigProcessor(req, &why);
+        if (!proc) {
+            if (error) *error = why;
+            return nullptr;
+        }
+        if (proc->IsNoOp()) return Ref<Image>(in);
+    }
+    const gamutinputs::Converter conv{curve, direction_ == ToLinear, req && req->GetInputNumber(preDivide_) >= 0.5,
+                                      proc.get()};
     const bool frameOnly = clippingMode == ClippingMode_Frame;
 
     // The canvas: converted when nothing clips, the input's otherwise.

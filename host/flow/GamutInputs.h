@@ -3,6 +3,9 @@
 // between a file's encoding and linear light. A loader converts to linear
 // (ToLinear), a saver from linear to the file's encoding (FromLinear). The
 // curves are those of host/color/Gamut.h; docs/GAMUT.md lists the inputs.
+// The choice Color Space names a colour space of the document's colour
+// configuration instead (host/color/ColorConfig.h): a loader converts from
+// it to the role scene_linear, a saver from scene_linear to it.
 //
 // Use: make the group in the tool's constructor (after adding the page the
 // inputs should sit on), forward the tool's NotifyChanged to it, and pass each
@@ -10,7 +13,9 @@
 //
 // Inputs (on the tool's current page; a tool without pages gets "Gamut"):
 //   GamutSpace        "Source Space" / "Output Space": No Change (default),
-//                     Linear, sRGB, Rec.709, Gamma, Cineon Log
+//                     Linear, sRGB, Rec.709, Gamma, Cineon Log, Color Space
+//   GamutColorSpace   "Color Space" (sRGB): a configuration's colour space,
+//                     name, role or alias; shown for Color Space
 //   GamutGamma        "Gamma" (2.2), shown for Gamma
 //   GamutLogBlack, GamutLogWhite, GamutLogFilmGamma, GamutLogSoftClip
 //                     "Black Level" (95), "White Level" (685), "Film Gamma"
@@ -22,6 +27,9 @@
 //
 // Thread safety: construction and NotifyChanged on the main thread; ProcessOf
 // on the tool's render thread (its rows on the workers).
+#include <string>
+
+#include "host/color/ColorConfig.h"
 #include "host/color/Gamut.h"
 #include "host/core/OvID.h"
 #include "host/image/Image.h"
@@ -50,8 +58,10 @@ public:
     /// image gets the data window cut to the frame). With _None the canvas colour is
     /// converted too; otherwise it stays the input's.
     /// Returns the image to use (possibly `in` itself when nothing is to be done); null
-    /// when memory ran out or the render was aborted.
-    Ref<Image> ProcessOf(Request *req, Image *in, Image *out, OvID clippingMode, bool convert);
+    /// when memory ran out or the render was aborted, or with `error` set when the
+    /// colour configuration or colour space cannot be found.
+    Ref<Image> ProcessOf(Request *req, Image *in, Image *out, OvID clippingMode, bool convert,
+                         std::string *error = nullptr);
 
     /// The curve the inputs choose for `req` (its time's values; defaults without a request).
     GamutCurve CurveOf(const Request *req) const;
@@ -65,11 +75,15 @@ public:
 
 private:
     void ShowFor(GamutSpace space);
+    /// The configuration's transform for the chosen colour space; null with `error` set.
+    ColorProcessorPtr ConfigProcessor(const Request *req, std::string *error);
 
     Operator *tool_;
     Direction direction_;
     Input *space_ = nullptr, *gamma_ = nullptr, *logBlack_ = nullptr, *logWhite_ = nullptr;
     Input *logFilmGamma_ = nullptr, *logSoftClip_ = nullptr, *enable_ = nullptr, *preDivide_ = nullptr;
+    Input *colorSpace_ = nullptr;
+    KeptColorProcessor kept_;
 };
 
 } // namespace Orvane

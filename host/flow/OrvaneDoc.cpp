@@ -58,6 +58,7 @@ void OrvaneDoc::SetPref(PrefID id, double value) {
 uint64_t OrvaneDoc::PrefsHash() const {
     uint64_t h = 0x9ef5;
     for (double v : prefs_) h = HashMix(h, HashDouble(v));
+    for (char c : colorConfig_) h = HashMix(h, static_cast<uint64_t>(static_cast<unsigned char>(c)));
     return h;
 }
 

@@ -83,6 +83,10 @@ public:
     FrameFormat GetFrameFormat() const;
     /// Hash of every preference (results may depend on them: cache keys).
     uint64_t PrefsHash() const;
+    /// The colour management configuration file (preference ColorConfig; ""
+    /// when not set: host/color/ColorConfig.h says what is used then).
+    const std::string &ColorConfigPath() const { return colorConfig_; }
+    void SetColorConfigPath(std::string path) { colorConfig_ = std::move(path); }
 
     // ---- console ----
     void PrintF(int code, const char *fmt, ...) __attribute__((format(printf, 3, 4)));
@@ -157,6 +161,7 @@ public:
 
 private:
     double prefs_[PREF_Count];
+    std::string colorConfig_;
     mutable std::mutex consoleLock_;
     std::vector<ConsoleLine> console_;
     std::function<void(const ConsoleLine &)> listener_;

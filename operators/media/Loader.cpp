@@ -765,15 +765,19 @@ void Loader::Process(Request *req) {
     int depth = s.depth == 1 ? GetDoc()->GetFrameFormat().depth : kDepthCodes[std::clamp(s.depth, 0, 5)];
     if (depth < DepthRGBAInt8 || depth > DepthRGBAFlt32) depth = 0;
     if (depth > image->Depth()) image = ConvertDepth(image.Get(), depth);
+    std::string colourError;
     if (image && !req->IsPreCalc()) {
-        image =
-            gamut_->ProcessOf(req, image.Get(), image.Get(), ClippingMode_Frame, !entry->clip->GetAttrB(ClipIsLinear));
+        image = gamut_->ProcessOf(req, image.Get(), image.Get(), ClippingMode_Frame,
+                                  !entry->clip->GetAttrB(ClipIsLinear), &colourError);
         if (image) image = ApplyAlphaOptions(req, image, s);
     }
     if (image) image = FitFieldAndProxy(req, image, s);
     if (image && depth && depth != image->Depth()) image = ConvertDepth(image.Get(), depth);
     if (!image) {
-        Fail(req, "%s: out of memory", Name().c_str());
+        if (colourError.empty())
+            Fail(req, "%s: out of memory", Name().c_str());
+        else
+            Fail(req, "%s: %s", Name().c_str(), colourError.c_str());
         req->SetOutputData(outImage_, nullptr);
         return;
     }

@@ -301,8 +301,8 @@ bool Saver::SavesThisRequest(Request *req, const Image &image) const {
            !(((flags >> 21) | flags) & 1);
 }
 
-Ref<Image> Saver::GamutAndLegal(Request *req, Ref<Image> image) {
-    image = gamut_->ProcessOf(req, image.Get(), nullptr, GetClippingMode(req), true);
+Ref<Image> Saver::GamutAndLegal(Request *req, Ref<Image> image, std::string *error) {
+    image = gamut_->ProcessOf(req, image.Get(), nullptr, GetClippingMode(req), true, error);
     if (!image) return image;
     const int action = IdIndex(req->GetInputID(inAction_), kActions);
     if (action == 0) return image;
@@ -332,10 +332,14 @@ bool Saver::SaveFrame(Request *req, Ref<Image> image) {
             return false;
         }
     }
-    image = GamutAndLegal(req, image);
+    std::string colourError;
+    image = GamutAndLegal(req, image, &colourError);
     if (image && req->GetInputNumber(inAlphaToColor_) >= 0.5) image = AlphaToColor(*image);
     if (!image) {
-        Fail(req, "%s: out of memory", Name().c_str());
+        if (colourError.empty())
+            Fail(req, "%s: out of memory", Name().c_str());
+        else
+            Fail(req, "%s: %s", Name().c_str(), colourError.c_str());
         return false;
     }
     if (!audioWarned_) {
@@ -381,7 +385,10 @@ void Saver::Process(Request *req) {
         return;
     }
     if (!SavesThisRequest(req, *image)) {
-        req->SetOutputData(outImage_, GamutAndLegal(req, image).Get());
+        std::string colourError;
+        Ref<Image> shown = GamutAndLegal(req, image, &colourError);
+        if (!shown && !colourError.empty()) Fail(req, "%s: %s", Name().c_str(), colourError.c_str());
+        req->SetOutputData(outImage_, shown.Get());
         return;
     }
     req->SetOutputData(outImage_, SaveFrame(req, image) ? input : nullptr);

@@ -53,7 +53,9 @@ private:
     OvID ExtensionFormat(const Parameter *clip) const;
     bool SavesThisRequest(Request *req, const Image &image) const;
     bool SaveFrame(Request *req, Ref<Image> image);
-    Ref<Image> GamutAndLegal(Request *req, Ref<Image> image);
+    /// The gamut conversion and legal range; null when memory ran out, or
+    /// with `error` set when the colour space cannot be found.
+    Ref<Image> GamutAndLegal(Request *req, Ref<Image> image, std::string *error);
     void AddFormatInputs(OvID format);
 
     Input *inClip_, *inCreateDir_, *inCreateDirNow_, *inOutputFormat_, *inSaveFrames_, *inRelative_, *inOffset_;

@@ -31,6 +31,8 @@ TEST(Cli, CommandsAnswerWithTheirExitCodesAndMessages) {
                             "Sw = Switch { Inputs = { Input0 = Red.Output, Input1 = Blue.Output } }");
     const std::string blue = "eval " + sw + " Sw --set Sw.Source=Blue --pixel 1,1 --json";
     const std::string d = dir.Path().string(), lenient = "eval --lenient " + unknown + " X1";
+    const std::string lut = flow("lut.flow", "Bg = Background { Inputs = { Width = 4, Height = 4 } },"
+                                             "L = FileLUT { Inputs = { Input = Bg.Output, LUTFile = \"none.cube\" } }");
     const std::string future = d + "/unknown.flow:1:34: X1: unknown class 'FutureTool'";
     const struct {
         std::string args;
@@ -50,6 +52,14 @@ TEST(Cli, CommandsAnswerWithTheirExitCodesAndMessages) {
         {"describe Glow", 0, {"path:          Tools/Effect/Glow", "built:         not yet", "EffectMask"}, {}},
         {"describe SetBgColor", 0, {"SetCanvasColor"}, {}}, // an old class ID names the class that replaced it
         {"describe Switch", 0, {"choices: \"Input 0\" (0), \"Input 1\" (1)"}, {}},
+        // Colour spaces of the built-in configuration; a configuration that cannot be read names the file.
+        {"colorspaces", 0, {"configuration: built-in", "Cineon Log", "aliases: cineon, log", "scene_linear"}, {}},
+        {"colorspaces --config " + Quote(d + "/none.ocio"),
+         3,
+         {},
+         {"cannot read colour configuration '" + d + "/none.ocio'"}},
+        {"colorspaces --frobnicate", 2, {}, {}},
+        {"eval " + lut + " L", 3, {}, {"L: cannot read LUT file '" + d + "/none.cube'"}},
         // Document errors are one line with exit code 2.
         {"eval " + syntax + " A", 2, {}, {"ERROR: " + d + "/syntax.flow:3:"}},
         {"eval " + Quote(d + "/none.flow") + " A", 2, {}, {"cannot open"}},

@@ -212,5 +212,6 @@ void SetNumbers(Operator *op, const std::vector<std::pair<const char *, double>>
 
 void SetPoint(Operator *op, const char *id, double x, double y) { SetValue(op, id, MakeRef<Point>(x, y)); }
 void SetID(Operator *op, const char *id, const char *value) { SetValue(op, id, MakeRef<IDValue>(OvID(value))); }
+void SetText(Operator *op, const char *id, const std::string &value) { SetValue(op, id, MakeRef<Text>(value)); }
 
 } // namespace Orvane::Test

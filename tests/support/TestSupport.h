@@ -118,5 +118,6 @@ void SetNumber(Operator *op, const char *id, double value);
 void SetNumbers(Operator *op, const std::vector<std::pair<const char *, double>> &values);
 void SetPoint(Operator *op, const char *id, double x, double y);
 void SetID(Operator *op, const char *id, const char *value);
+void SetText(Operator *op, const char *id, const std::string &value);
 
 } // namespace Orvane::Test

@@ -1,0 +1,186 @@
+// ColorSpaceTransform and the Loader's and Saver's Color Space choice: known values from the curves' formulas, float
+// round trips, where the configuration comes from, what cannot be found, and oiiotool with the same configuration.
+#include <cstdlib>
+#include <filesystem>
+#include <fstream>
+#include <string>
+
+#include <gtest/gtest.h>
+
+#include "host/color/ColorConfig.h"
+#include "host/flow/InputValue.h"
+#include "host/flow/RenderTask.h"
+#include "host/media/Clip.h"
+#include "tests/operators/color/ColorManagedTestSupport.h"
+
+namespace Orvane::cmtest {
+namespace {
+namespace T = Orvane::Test;
+
+double SrgbToLinear(double v) { return v <= 0.04045 ? v / 12.92 : std::pow((v + 0.055) / 1.055, 2.4); }
+double LinearToSrgb(double v) { return v <= 0.0031308 ? v * 12.92 : 1.055 * std::pow(v, 1 / 2.4) - 0.055; }
+/// Printing density with black at code 95 and white at 685 (0.002 density a code, film gamma 0.6).
+double CineonToLinear(double v) {
+    const double black = std::pow(10.0, (95.0 - 685.0) / 300.0);
+    return (std::pow(10.0, (v * 1023.0 - 685.0) / 300.0) - black) / (1 - black);
+}
+
+const std::vector<double> kValues = {0.0, 0.002, 0.04045, 0.1, 0.18, 0.5, 0.8, 1.0, 1.5};
+
+std::vector<Rgb> Greys(const std::vector<double> &values, double (*f)(double) = nullptr) {
+    std::vector<Rgb> out;
+    for (double v : values) out.push_back({f ? f(v) : v, f ? f(v) : v, f ? f(v) : v});
+    return out;
+}
+
+/// A configuration tool's inputs from one space to another.
+std::vector<std::pair<const char *, std::string>> Spaces(const std::string &from, const std::string &to) {
+    return {{"FromSpace", from}, {"ToSpace", to}};
+}
+
+class ColorSpaceTransformTest : public ::testing::Test {
+protected:
+    static void SetUpTestSuite() { T::LoadOperators(); }
+    void SetUp() override { unsetenv("OCIO"); }
+    void TearDown() override { unsetenv("OCIO"); }
+    /// Sets inputs as a document does.
+    static void Set(OrvaneDoc &doc, Operator *op, const std::vector<std::pair<const char *, ScriptVal>> &values) {
+        for (const auto &[id, value] : values) ASSERT_EQ(ApplyInputValue(doc, op->FindInput(id), value), "") << id;
+    }
+    T::TempDir dir;
+};
+
+TEST_F(ColorSpaceTransformTest, KnownValuesByNameRoleAndAlias) {
+    // The tolerance covers the fast powers of the optimised transform.
+    const std::tuple<const char *, const char *, double (*)(double)> cases[] = {
+        {"sRGB", "Linear Rec.709", SrgbToLinear},
+        {"srgb_texture", "scene_linear", SrgbToLinear},
+        {"lin_rec709", "sRGB", LinearToSrgb},
+        {"cineon", "linear", CineonToLinear}};
+    for (const auto &[from, to, model] : cases) {
+        SCOPED_TRACE(std::string(from) + " -> " + to);
+        Chain chain(ColourRow(Greys(kValues), 0.25f));
+        chain.Add("ColorSpaceTransform", Spaces(from, to));
+        Ref<Image> out = chain.Run();
+        ASSERT_TRUE(out) << T::ConsoleText(chain.doc);
+        const std::vector<Rgb> got = ColoursOf(*out), want = Greys(kValues, model);
+        for (size_t i = 0; i < got.size(); ++i) EXPECT_NEAR(got[i][1], want[i][1], 2e-5 * std::max(1.0, want[i][1]));
+        EXPECT_EQ(out->GetFlt(0, 0).A, 0.25f);
+    }
+}
+
+TEST_F(ColorSpaceTransformTest, FloatRoundTrips) {
+    // To linear and back through each encoding. (Integer depths store the linear values between the two tools in
+    // whole codes and clip them at white, so they do not come back.)
+    for (const char *space : {"sRGB", "Rec.709", "Cineon Log", "Linear Rec.2020"})
+        for (int depth : {DepthRGBAFlt16, DepthRGBAFlt32}) {
+            SCOPED_TRACE(std::string(space) + " depth " + std::to_string(depth));
+            Ref<Image> src = T::PatternImage(19, 5, depth, 7);
+            Chain chain(src);
+            chain.Add("ColorSpaceTransform", Spaces(space, "scene_linear"));
+            chain.Add("ColorSpaceTransform", Spaces("scene_linear", space));
+            Ref<Image> out = chain.Run();
+            ASSERT_TRUE(out);
+            for (int y = 0; y < 5; ++y)
+                for (int x = 0; x < 19; ++x) {
+                    const FltPixel a = src->GetFlt(x, y), b = out->GetFlt(x, y);
+                    if (std::min({a.R, a.G, a.B}) < 0) continue; // below black the curves leave their use
+                    const double tol = (depth == DepthRGBAFlt16 ? 4e-3 : 1e-4) * std::max({1.f, a.R, a.G, a.B});
+                    T::ExpectPixelNear(b, a, tol, std::to_string(x) + "," + std::to_string(y));
+                }
+        }
+}
+
+TEST_F(ColorSpaceTransformTest, ConfigurationSourcesAndFailures) {
+    // A configuration of our own: its space "squared" is the square of its reference.
+    std::ofstream(dir / "own.ocio") << "ocio_profile_version: 2\nroles: {default: ref}\ncolorspaces:\n"
+                                       "  - !<ColorSpace> {name: ref}\n"
+                                       "  - !<ColorSpace>\n    name: squared\n"
+                                       "    from_scene_reference: !<ExponentTransform> {value: 2}\n";
+    const std::tuple<const char *, const char *, const char *, const char *, std::string> cases[] = {
+        // preference, environment, from, to: 0.5 squared, or the console line
+        {"own.ocio", nullptr, "ref", "squared", ""},
+        {nullptr, "own.ocio", "ref", "squared", ""},
+        {nullptr, nullptr, "ref", "squared", "no colour space 'ref' in the configuration built-in"},
+        {nullptr, nullptr, "sRGB", "", "no colour space '' in the configuration built-in"},
+        {"missing.ocio", nullptr, "sRGB", "linear", "cannot read colour configuration '" + dir / "missing.ocio" + "'"},
+    };
+    for (const auto &[pref, env, from, to, line] : cases) {
+        SCOPED_TRACE(line);
+        Chain chain(ColourRow({{0.5, 0.5, 0.5}}));
+        chain.doc.SetFilePath(dir / "flow.orvane");
+        if (pref) chain.doc.SetColorConfigPath(pref);
+        if (env) setenv("OCIO", (dir / env).c_str(), 1);
+        Operator *cst = chain.Add("ColorSpaceTransform", Spaces(from, to));
+        Ref<Image> out = chain.Run();
+        unsetenv("OCIO");
+        if (line.empty()) {
+            ASSERT_TRUE(out) << T::ConsoleText(chain.doc);
+            EXPECT_NEAR(out->GetFlt(0, 0).R, 0.25, 1e-5);
+        } else {
+            EXPECT_FALSE(out);
+            EXPECT_NE(T::ConsoleText(chain.doc).find(cst->Name() + ": " + line), std::string::npos)
+                << T::ConsoleText(chain.doc);
+        }
+    }
+}
+
+TEST_F(ColorSpaceTransformTest, LoaderAndSaverNameConfigurationSpaces) {
+    // A float file of sRGB-encoded greys; the Loader takes them to scene_linear, or fails naming the space.
+    const std::string file = dir / "greys.raw";
+    std::string error;
+    ASSERT_TRUE(Clip(file).PutFrameTagList(0, ColourRow(Greys(kValues)).Get(), {}, error)) << error;
+    for (const char *space : {"srgb_texture", "Nowhere"}) {
+        OrvaneDoc doc;
+        Operator *loader = doc.AddTool(OvID("Loader"), "Plate");
+        Set(doc, loader,
+            {{"Clip", ScriptVal(file)},
+             {"GamutSpace", ScriptVal("ColorSpace")},
+             {"GamutColorSpace", ScriptVal(space)}});
+        Ref<Image> out = T::EvalImage(loader);
+        if (std::string(space) == "Nowhere") {
+            EXPECT_FALSE(out);
+            EXPECT_NE(T::ConsoleText(doc).find("Plate: no colour space 'Nowhere' in the configuration built-in"),
+                      std::string::npos)
+                << T::ConsoleText(doc);
+            continue;
+        }
+        ASSERT_TRUE(out) << T::ConsoleText(doc);
+        ExpectColoursNear(ColoursOf(*out), Greys(kValues, SrgbToLinear), 1e-4);
+    }
+
+    // The Saver writes linear greys encoded for the role color_picking (sRGB).
+    Chain chain(ColourRow(Greys(kValues)));
+    Operator *saver = chain.doc.AddTool(OvID("Saver"), "Out");
+    ASSERT_TRUE(saver->FindInput("Input")->ConnectTo(chain.last->FindMainOutput()));
+    std::filesystem::create_directory(dir / "out");
+    Set(chain.doc, saver,
+        {{"Clip", ScriptVal(dir / "out/greys.0000.raw")},
+         {"GamutSpace", ScriptVal("ColorSpace")},
+         {"GamutColorSpace", ScriptVal("color_picking")}});
+    RenderTask task;
+    EvalOptions opt;
+    opt.task = &task;
+    ASSERT_TRUE(Evaluate(saver->FindMainOutput(), 0.0, opt)) << T::ConsoleText(chain.doc);
+    const auto written = std::filesystem::directory_iterator(dir / "out")->path().string();
+    Ref<Image> back = Clip(written).GetFrameTagList(0, {}, error);
+    ASSERT_TRUE(back) << error;
+    ExpectColoursNear(ColoursOf(*back), Greys(kValues, LinearToSrgb), 2e-5);
+}
+
+TEST_F(ColorSpaceTransformTest, SameAsOiiotool) {
+    if (!T::HaveProgram("oiiotool")) GTEST_SKIP() << "oiiotool is not installed";
+    std::ofstream(dir / "builtin.ocio") << ColorConfig::BuiltInText();
+    Ref<Image> src = T::PatternImage(24, 12, DepthRGBAFlt32, 4);
+    Ref<Image> theirs = ThroughOiiotool(
+        *src, dir.path, "--colorconfig " + dir / "builtin.ocio" + " --colorconvert sRGB \"Linear Rec.2020\"");
+    ASSERT_TRUE(theirs);
+    Chain chain(src);
+    chain.Add("ColorSpaceTransform", Spaces("sRGB", "Linear Rec.2020"));
+    Ref<Image> ours = chain.Run();
+    ASSERT_TRUE(ours);
+    EXPECT_LT(WorstColourDifference(*ours, *theirs), 1e-5);
+}
+
+} // namespace
+} // namespace Orvane::cmtest
