@@ -29,7 +29,6 @@ static ClassRegistration<AutoGain, ThreadedOperator>
                     {RegIcon, "Icons.Tools.Icons.AutoGain"},
                     {RegNoMotionBlurControls, 1},
                     {RegSupportsRoI, 1},
-                    {RegProcessesCanvasColor, 1},
                     {RegSupportsDoD, 1}});
 
 namespace {
