@@ -52,19 +52,24 @@ template <class T> void LoadUnits(int depth, const uint8_t *src, int n, T (*px)[
     }
 }
 
-/// The stored 16-bit form of a value over 0..1 at an integer depth: the
-/// nearest step of that depth, clamped (8-bit steps widened by 257).
-inline uint16_t UnitToStep(double v, bool eightBit) {
-    const double top = eightBit ? 255.0 : 65535.0;
-    const double s = std::floor(std::clamp(v * top, 0.0, top) + 0.5); // NaN clamps to 0 below
-    return static_cast<uint16_t>((s > 0.0 ? s : 0.0) * (eightBit ? 257.0 : 1.0));
+/// The step (0..top) a value over 0..1 lands on at an integer depth whose
+/// largest value is `top`: the nearest one, or with a dither number d in
+/// [0, 1) the one below v * top + d. Values within `snap` (relative) of a
+/// step stay on it: a step of another depth that went through float comes
+/// back a rounding away from where it was. NaN gives 0.
+inline double StepOf(double v, double top, double d = -1.0, double snap = 0x1p-23) {
+    const double s = std::clamp(v * top, 0.0, top);
+    if (!(s > 0.0)) return 0.0;
+    const double nearest = std::floor(s + 0.5);
+    return d < 0.0 || std::fabs(s - nearest) <= s * snap ? nearest : std::floor(s + d);
 }
 
 /// Writes n pixels of values over 0..1 at `depth`. `dither` (integer depths
 /// only) gives for pixel k and channel c a number in [0, 1) added before the
-/// value is cut down to its step, in place of rounding to nearest.
+/// value is cut down to its step, in place of rounding to nearest; `snap` as
+/// in StepOf.
 template <class T, class Dither>
-void StoreUnits(int depth, const T (*px)[4], int n, uint8_t *dst, const Dither &dither) {
+void StoreUnits(int depth, const T (*px)[4], int n, uint8_t *dst, const Dither &dither, double snap = 0x1p-23) {
     const PixelFormat f = FormatOfDepth(depth);
     const size_t bpp = static_cast<size_t>(f.BytesPerPixel());
     if (f.isFloat) {
@@ -85,11 +90,9 @@ void StoreUnits(int depth, const T (*px)[4], int n, uint8_t *dst, const Dither &
         const int m = std::min(kPointBlock, n - i);
         for (int k = 0; k < m; ++k) {
             uint16_t v[4];
-            for (int c = 0; c < 4; ++c) {
-                const double d = dither(i + k, c);
-                v[c] = d < 0.0 ? UnitToStep(static_cast<double>(px[i + k][c]), eight)
-                               : UnitToStep((std::floor(static_cast<double>(px[i + k][c]) * top + d)) / top, eight);
-            }
+            for (int c = 0; c < 4; ++c)
+                v[c] = static_cast<uint16_t>(StepOf(static_cast<double>(px[i + k][c]), top, dither(i + k, c), snap) *
+                                             (eight ? 257.0 : 1.0));
             out[k] = {v[0], v[1], v[2], v[3]};
         }
         StorePixel(depth, out, m, dst + static_cast<size_t>(i) * bpp);

@@ -11,6 +11,7 @@
 #include <functional>
 #include <string>
 #include <utility>
+#include <vector>
 
 #include <gtest/gtest.h>
 
@@ -117,12 +118,13 @@ inline void ExpectSameBits(const Image &a, const Image &b, const ImgRectI &r) {
 /// canvas spans follow `model`; regions are crops of the whole render; one
 /// worker or many give the same bits. `setup` sets the tool's controls.
 inline void ExpectFrame(const char *classId, const std::function<void(Operator *)> &setup, const PixelModel &model,
-                        bool canvasThroughModel = true) {
+                        bool canvasThroughModel = true,
+                        std::vector<int> depths = {std::begin(kEveryDepth), std::end(kEveryDepth)}) {
     const ImgRectI inWindow(8, 4, 40, 28);
     const FltPixel canvas{0.2f, 0.4f, 0.6f, 0.8f};
     const std::tuple<const char *, ImgRectI, bool> clips[] = {{"ClippingMode_None", inWindow, false},
                                                               {"ClippingMode_Frame", ImgRectI(0, 0, 48, 32), true}};
-    for (int depth : kEveryDepth)
+    for (int depth : depths)
         for (const auto &[mode, window, keepsInputCanvas] : clips) {
             const std::string what = std::string(classId) + " " + mode + ", depth " + std::to_string(depth);
             SCOPED_TRACE(what);
