@@ -88,8 +88,10 @@ inline double StoredTolerance(int depth, double e) {
 inline double Storable(int depth, double e) { return FormatOfDepth(depth).isFloat ? e : std::clamp(e, 0.0, 1.0); }
 
 /// Expects every pixel of `out` over `window` to be `model` of `in`'s pixel
-/// (beyond `in`'s data window: of its canvas colour).
-inline void ExpectModel(const PixelModel &model, const Image &in, const Image &out, const std::string &what) {
+/// (beyond `in`'s data window: of its canvas colour), within the stored
+/// rounding and `slack` (for tools that work in float on integer data).
+inline void ExpectModel(const PixelModel &model, const Image &in, const Image &out, const std::string &what,
+                        double slack = 0) {
     const ImgRectI dw = out.DataWindow();
     const int depth = out.Depth();
     for (int y = dw.y0; y < dw.y1; ++y)
@@ -97,7 +99,7 @@ inline void ExpectModel(const PixelModel &model, const Image &in, const Image &o
             const Px e = model(in.DataWindow().Contains(x, y) ? UnitPx(in, x, y) : ToPx(in.GetCanvasColor()));
             for (int c = 0; c < 4; ++c) {
                 const double want = Storable(depth, e[c]);
-                ASSERT_NEAR(Unit(out, x, y, c), want, StoredTolerance(depth, want))
+                ASSERT_NEAR(Unit(out, x, y, c), want, StoredTolerance(depth, want) + slack)
                     << what << " at " << x << "," << y << " channel " << c << " from " << Unit(in, x, y, c);
             }
         }
@@ -118,7 +120,7 @@ inline void ExpectSameBits(const Image &a, const Image &b, const ImgRectI &r) {
 /// canvas spans follow `model`; regions are crops of the whole render; one
 /// worker or many give the same bits. `setup` sets the tool's controls.
 inline void ExpectFrame(const char *classId, const std::function<void(Operator *)> &setup, const PixelModel &model,
-                        bool canvasThroughModel = true,
+                        double slack = 0, bool canvasThroughModel = true,
                         std::vector<int> depths = {std::begin(kEveryDepth), std::end(kEveryDepth)}) {
     const ImgRectI inWindow(8, 4, 40, 28);
     const FltPixel canvas{0.2f, 0.4f, 0.6f, 0.8f};
@@ -141,7 +143,7 @@ inline void ExpectFrame(const char *classId, const std::function<void(Operator *
             const Px outCanvas = ToPx(out->GetCanvasColor());
             const Px wantCanvas = keepsInputCanvas || !canvasThroughModel ? ToPx(canvas) : model(ToPx(canvas));
             for (int c = 0; c < 4; ++c) EXPECT_NEAR(outCanvas[c], wantCanvas[c], 1e-6 * (1 + std::fabs(wantCanvas[c])));
-            ExpectModel(model, *src, *out, what);
+            ExpectModel(model, *src, *out, what, slack);
             for (const ImgRectI &roi : {ImgRectI(5, 7, 30, 20), ImgRectI(38, 25, 60, 40)}) {
                 Ref<Image> part = Render(rig.tool, &roi);
                 ASSERT_TRUE(part && part->DataWindow() == (window & roi) && part->ValidWindow() == (window & roi));

@@ -90,9 +90,9 @@ TEST_F(ChangeDepth, StepsSurviveADitheredTripThroughFloat) {
 }
 
 TEST_F(ChangeDepth, TheFrameHoldsAndTheDitherNumbersSpreadEvenly) {
-    ExpectFrame("ChangeDepth", [](Operator *op) { Orvane::Test::SetNumber(op, "Depth", 1); }, kSame, true,
+    ExpectFrame("ChangeDepth", [](Operator *op) { Orvane::Test::SetNumber(op, "Depth", 1); }, kSame, 0, true,
                 {DepthRGBAFlt32, DepthRGBAFlt16, DepthRGBAInt16});
-    ExpectFrame("ChangeDepth", [](Operator *op) { Orvane::Test::SetNumber(op, "Depth", 4); }, kSame, true,
+    ExpectFrame("ChangeDepth", [](Operator *op) { Orvane::Test::SetNumber(op, "Depth", 4); }, kSame, 0, true,
                 {DepthRGBAInt8});
     // Over a block of places, each tenth of [0, 1) gets its share of the numbers, and neighbours differ.
     int bins[10] = {};
