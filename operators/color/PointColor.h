@@ -52,6 +52,20 @@ template <class T> void LoadUnits(int depth, const uint8_t *src, int n, T (*px)[
     }
 }
 
+/// Reads x0..x1-1 of row y of `img` as values over 0..1: its pixels inside
+/// its data window, its canvas colour elsewhere; an absent image (null) reads
+/// as 0.
+template <class T> void ReadUnitSpan(const Image *img, int y, int x0, int x1, T (*px)[4]) {
+    const FltPixel canvas = img ? img->GetCanvasColor() : FltPixel{};
+    const ImgRectI dw = img && img->HasScanLineData() ? img->DataWindow() : ImgRectI();
+    const bool rowIn = y >= dw.y0 && y < dw.y1;
+    const int left = rowIn ? std::clamp(dw.x0, x0, x1) : x1, right = rowIn ? std::clamp(dw.x1, left, x1) : x1;
+    for (int x = x0; x < x1; ++x)
+        if (x < left || x >= right)
+            px[x - x0][0] = canvas.R, px[x - x0][1] = canvas.G, px[x - x0][2] = canvas.B, px[x - x0][3] = canvas.A;
+    if (right > left) LoadUnits(img->Depth(), img->PixelAddress(left, y), right - left, px + (left - x0));
+}
+
 /// The step (0..top) a value over 0..1 lands on at an integer depth whose
 /// largest value is `top`: the nearest one, or with a dither number d in
 /// [0, 1) the one below v * top + d. Values within `snap` (relative) of a

@@ -31,14 +31,14 @@ using PixelModel = std::function<Px(const Px &)>;
 
 inline constexpr int kEveryDepth[] = {DepthRGBAFlt32, DepthRGBAFlt16, DepthRGBAInt16, DepthRGBAInt8};
 
-/// A document with an image source feeding a tool of class `classId`.
+/// A document with an image source feeding the main input of a tool of class `classId`.
 struct Rig {
     OrvaneDoc doc;
-    Orvane::Test::ImageSourceTool *source;
+    Test::ImageSourceTool *source;
     Operator *tool;
-    Rig(const char *classId, Ref<Image> img) : source(Orvane::Test::AddImageSource(doc, "Src", std::move(img))) {
+    Rig(const char *classId, Ref<Image> img) : source(Test::AddImageSource(doc, "Src", std::move(img))) {
         tool = doc.AddTool(OvID(classId));
-        EXPECT_TRUE(tool && tool->FindInput("Input") && tool->FindInput("Input")->ConnectTo(source->FindMainOutput()));
+        EXPECT_TRUE(tool && tool->FindMainInput() && tool->FindMainInput()->ConnectTo(source->FindMainOutput()));
     }
 };
 
