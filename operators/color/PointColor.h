@@ -16,6 +16,7 @@
 #include <algorithm>
 #include <cmath>
 #include <cstdint>
+#include <type_traits>
 
 #include "host/core/Tags.h"
 #include "host/flow/Operator.h"
@@ -136,7 +137,10 @@ template <class Fn> void MapPointSpan(int depth, const Fn &fn, const uint8_t *in
         for (int i = 0; i < n; i += kPointBlock) {
             const int m = std::min(kPointBlock, n - i);
             LoadUnits(depth, in + i * bpp, m, px);
-            for (int k = 0; k < m; ++k) fn(px[k]);
+            if constexpr (std::is_invocable_v<const Fn &, T(*)[4], int>)
+                fn(px, m); // the function takes a block at once
+            else
+                for (int k = 0; k < m; ++k) fn(px[k]);
             StoreUnits(depth, px, m, out + i * bpp, NoDither{});
         }
     });
