@@ -36,7 +36,7 @@ TEST_F(ChangeDepth, EveryConversionGivesTheNearestValueOfTheNewDepth) {
 TEST_F(ChangeDepth, DitherKeepsTheMeanAndRepeatsOverRegions) {
     // A flat colour between two 8-bit steps: plain rounding gives one step everywhere (77 for red, 0.17 off); dither
     // mixes the two neighbours so that the mean over an area is the value itself. Alpha is rounded.
-    const Px flat{0.3013, 0.7 + 0.25 / 255, 0.1, 0.6};
+    const Px flat{0.3013, 0.7 + 0.25 / 255, 0.1, 0.6 + 0.3 / 255};
     Ref<Image> src = NewImageTagList({{ImgWidth, 64}, {ImgHeight, 64}, {ImgDepth, DepthRGBAFlt32}});
     src->Fill({float(flat[0]), float(flat[1]), float(flat[2]), float(flat[3])});
     Rig rig("ChangeDepth", src);
