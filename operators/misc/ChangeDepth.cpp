@@ -32,6 +32,29 @@ static ClassRegistration<ChangeDepth, ThreadedOperator>
                     {RegSupportsDoD, 1},
                     {RegSupportsGPUImages, 1}});
 
+namespace {
+
+/// n pixels from depth `from` to `to` by the host's conversions: float through
+/// FltPixel, integers through 16-bit Pixel.
+void HostConvert(int from, int to, const uint8_t *in, uint8_t *out, int n) {
+    const size_t inBytes = static_cast<size_t>(FormatOfDepth(from).BytesPerPixel());
+    const size_t outBytes = static_cast<size_t>(FormatOfDepth(to).BytesPerPixel());
+    FltPixel f[kPointBlock];
+    Pixel p[kPointBlock];
+    for (int k = 0; k < n; k += kPointBlock) {
+        const int m = std::min(kPointBlock, n - k);
+        if (FormatOfDepth(from).isFloat) {
+            LoadFlt(from, in + k * inBytes, m, f);
+            StoreFlt(to, f, m, out + k * outBytes);
+        } else {
+            LoadPixel(from, in + k * inBytes, m, p);
+            StorePixel(to, p, m, out + k * outBytes);
+        }
+    }
+}
+
+} // namespace
+
 ChangeDepth::ChangeDepth(const Registry *reg, const ScriptVal &args, const TagList &tags)
     : ThreadedOperator(reg, args, tags) {
     AddControlPageTagList("Controls", {});
@@ -75,6 +98,10 @@ void ChangeDepth::Process(Request *req) {
     // Values within the input's own rounding of a step stay on it (half floats hold 11 bits).
     const double snap = inFormat.isFloat && inFormat.bytesPerComponent == 2 ? 0x1p-10 : 0x1p-23;
 
+    // Without dither the host's conversions already give the nearest value, except from integers to float, which
+    // they scale in float: those take the exact way below.
+    const bool hostConverts = !dither && (inFormat.isFloat || !outFormat.isFloat);
+
     const OvID clipping = GetClippingMode(req);
     const AutoImageRoI roi(req);
     const ImgRectI dataWindow = OutputDataWindow(req, input_, src, clipping);
@@ -102,6 +129,10 @@ void ChangeDepth::Process(Request *req) {
                 [&](int i) {
                     const int y = out.y0 + i;
                     rows.Row(i, [&](const uint8_t *a, uint8_t *b, int n) {
+                        if (hostConverts) {
+                            HostConvert(from, to, a, b, n);
+                            return;
+                        }
                         WithUnit(to, [&](auto zero) {
                             using T = decltype(zero);
                             T px[kPointBlock][4];
