@@ -1,0 +1,144 @@
+#pragma once
+// Shared by the tests of the small colour tools: a document with an image source feeding the tool, values read back
+// exactly at every depth, a check of every pixel against a model written in the test, and the frame every per-pixel
+// tool keeps (pre-calculation windows, canvas, regions equal to the crop of the whole render, worker count).
+#include <algorithm>
+#include <array>
+#include <cmath>
+#include <cstring>
+#include <functional>
+#include <string>
+#include <vector>
+
+#include <gtest/gtest.h>
+
+#include "host/core/Parallel.h"
+#include "host/flow/Engine.h"
+#include "host/flow/Link.h"
+#include "host/flow/RenderTask.h"
+#include "host/flow/Request.h"
+#include "host/image/NewImage.h"
+#include "tests/support/TestSupport.h"
+
+namespace Orvane::colortest {
+
+using Px = std::array<double, 4>;
+using PixelModel = std::function<Px(const Px &)>; ///< the tool's function of one pixel, in double
+
+inline constexpr int kEveryDepth[] = {DepthRGBAFlt32, DepthRGBAFlt16, DepthRGBAInt16, DepthRGBAInt8};
+
+/// A document with an image source feeding the main input of a tool of class `classId`.
+struct Rig {
+    OrvaneDoc doc;
+    Test::ImageSourceTool *source;
+    Operator *tool;
+    Rig(const char *classId, Ref<Image> img) : source(Test::AddImageSource(doc, "Src", std::move(img))) {
+        tool = doc.AddTool(OvID(classId));
+        EXPECT_TRUE(tool && tool->FindMainInput()->ConnectTo(source->FindMainOutput()));
+    }
+    /// A second tool of `classId` fed by this one.
+    Operator *Then(const char *classId) {
+        Operator *next = doc.AddTool(OvID(classId));
+        EXPECT_TRUE(next->FindMainInput()->ConnectTo(tool->FindMainOutput()));
+        return next;
+    }
+};
+
+/// Renders a tool's main output without the result cache.
+inline Ref<Image> Render(Operator *op, const ImgRectI *roi = nullptr, uint32_t flags = 0) {
+    RenderTask task;
+    EvalOptions opt;
+    opt.flags = flags, opt.task = &task, opt.useCache = false;
+    if (roi) opt.roi = ImageDomain(*roi);
+    return Test::EvalImage(op, 0.0, opt);
+}
+
+/// Channel c at (x, y) over 0..1, read exactly from the stored data (integers over 255 or 65535 in double).
+inline double Unit(const Image &img, int x, int y, int c) {
+    if (img.IsFloat()) {
+        const FltPixel p = img.GetFlt(x, y);
+        return c == 0 ? p.R : c == 1 ? p.G : c == 2 ? p.B : p.A;
+    }
+    const int i = (x - img.DataWindow().x0) * (img.IsMask() ? 1 : 4) + (img.IsMask() ? 0 : c);
+    if (FormatOfDepth(img.Depth()).bytesPerComponent == 1) return img.Row<uint8_t>(y)[i] / 255.0;
+    return img.Row<uint16_t>(y)[i] / 65535.0;
+}
+inline Px UnitPx(const Image &img, int x, int y) {
+    return {Unit(img, x, y, 0), Unit(img, x, y, 1), Unit(img, x, y, 2), Unit(img, x, y, 3)};
+}
+inline Px ToPx(const FltPixel &p) { return {p.R, p.G, p.B, p.A}; }
+
+/// Expects the stored `got` to be the exact result `e` as `depth` holds it: clamped to 0..1 and within half a step
+/// on integers, within half an ulp on floats; plus `slack` relative (tools that work in float on integer data).
+inline void ExpectStored(int depth, double got, double e, double slack, const std::string &where) {
+    const PixelFormat f = FormatOfDepth(depth);
+    const double want = f.isFloat ? e : std::clamp(e, 0.0, 1.0);
+    const double tol = !f.isFloat                 ? 0.5 / (f.bytesPerComponent == 1 ? 255 : 65535) + 1e-11
+                       : f.bytesPerComponent == 2 ? std::fabs(want) / 2048 + 3e-8
+                                                  : std::fabs(want) * 6e-8 + 1e-37;
+    ASSERT_NEAR(got, want, tol + slack * (1 + std::fabs(want))) << where;
+}
+
+/// Expects every pixel of `out` to be `model` of `in`'s pixel (beyond `in`'s data window: of its canvas colour).
+inline void ExpectModel(const PixelModel &model, const Image &in, const Image &out, const std::string &what,
+                        double slack = 0) {
+    const ImgRectI dw = out.DataWindow();
+    for (int y = dw.y0; y < dw.y1; ++y)
+        for (int x = dw.x0; x < dw.x1; ++x) {
+            const Px e = model(in.DataWindow().Contains(x, y) ? UnitPx(in, x, y) : ToPx(in.GetCanvasColor()));
+            for (int c = 0; c < 4; ++c)
+                ExpectStored(out.Depth(), Unit(out, x, y, c), e[c], slack,
+                             what + " at " + std::to_string(x) + "," + std::to_string(y) + " channel " +
+                                 std::to_string(c));
+        }
+}
+
+/// Expects `a` to hold `b`'s bytes over `r`.
+inline void ExpectSameBits(const Image &a, const Image &b, const ImgRectI &r) {
+    for (int y = r.y0; y < r.y1; ++y)
+        ASSERT_EQ(std::memcmp(a.PixelAddress(r.x0, y), b.PixelAddress(r.x0, y), size_t(r.Width()) * a.BytesPerPixel()),
+                  0)
+            << "row " << y;
+}
+
+/// The frame of a per-pixel tool over a 48 x 32 frame whose data window leaves canvas on every side, for each of
+/// `depths`, without clipping and with ClippingMode_Frame: a pre-calculation gives the windows without pixels; the
+/// canvas colour goes through `model` (with the clipping mode the input's stays); every pixel, canvas spans
+/// included, follows `model`; regions are crops of the whole render; one worker gives the same bits as many.
+inline void ExpectFrame(const char *classId, const std::function<void(Operator *)> &setup, const PixelModel &model,
+                        double slack = 0, std::vector<int> depths = {std::begin(kEveryDepth), std::end(kEveryDepth)}) {
+    const ImgRectI inWindow(8, 4, 40, 28), frame(0, 0, 48, 32);
+    const FltPixel canvas{0.2f, 0.4f, 0.6f, 0.8f};
+    for (int depth : depths)
+        for (bool clipped : {false, true}) {
+            const std::string what =
+                std::string(classId) + (clipped ? " frame" : "") + " depth " + std::to_string(depth);
+            SCOPED_TRACE(what);
+            Ref<Image> src = Test::WindowedImage(48, 32, inWindow, canvas, 3, depth);
+            Rig rig(classId, src);
+            setup(rig.tool);
+            Test::SetID(rig.tool, "ClippingMode", clipped ? "ClippingMode_Frame" : "ClippingMode_None");
+            const ImgRectI window = clipped ? frame : inWindow;
+            Ref<Image> shape = Render(rig.tool, nullptr, ReqFlagPreCalc);
+            ASSERT_TRUE(shape && shape->IsNoData() && !shape->HasScanLineData() && shape->DataWindow() == window);
+            EXPECT_EQ(rig.source->processCount, 0) << "pre-calculation asked the source for pixels";
+            Ref<Image> out = Render(rig.tool);
+            ASSERT_TRUE(out && out->DataWindow() == window);
+            const Px gotCanvas = ToPx(out->GetCanvasColor()), wantCanvas = clipped ? ToPx(canvas) : model(ToPx(canvas));
+            for (int c = 0; c < 4; ++c) EXPECT_NEAR(gotCanvas[c], wantCanvas[c], 1e-6 * (1 + std::fabs(wantCanvas[c])));
+            ExpectModel(model, *src, *out, what, slack);
+            for (const ImgRectI &roi : {ImgRectI(5, 7, 30, 20), ImgRectI(38, 25, 60, 40)}) {
+                Ref<Image> part = Render(rig.tool, &roi);
+                ASSERT_TRUE(part && part->DataWindow() == (window & roi) && part->ValidWindow() == (window & roi));
+                ExpectSameBits(*part, *out, window & roi);
+            }
+            const int before = WorkerCount();
+            SetWorkerCount(1);
+            Ref<Image> one = Render(rig.tool);
+            SetWorkerCount(before);
+            ASSERT_TRUE(one);
+            ExpectSameBits(*one, *out, window);
+        }
+}
+
+} // namespace Orvane::colortest
