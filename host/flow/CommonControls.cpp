@@ -222,8 +222,7 @@ void Operator::PostProcess(Request *req) {
     const Ref<Image> resultPixels = ImageOfValue(value, pixelTags);
     const Ref<Image> srcPixels = srcValue ? ImageOfValue(srcValue, pixelTags) : nullptr;
     if (!resultPixels || (srcValue && !srcPixels && dynamic_cast<TransformMatrix *>(srcValue))) {
-        if (!(req->GetTask() && req->GetTask()->IsAborted()))
-            Fail(req, "%s: out of memory (time = %f)\n", Name().c_str(), req->Time());
+        if (!(req->GetTask() && req->GetTask()->IsAborted())) FailOutOfMemory(req);
         req->SetOutputData(out, nullptr);
         return;
     }
@@ -259,7 +258,7 @@ void Operator::PostProcess(Request *req) {
     mixed->SetScale(result->XScale(), result->YScale());
     if (!mixed->IsNoData()) {
         if (!mixed->AllocScanLineData()) {
-            Fail(req, "%s: out of memory (time = %f)\n", Name().c_str(), req->Time());
+            FailOutOfMemory(req);
             req->SetOutputData(out, nullptr);
             return;
         }

@@ -112,6 +112,10 @@ bool Operator::IsGPUEnabled(Request *req, bool) {
 bool Operator::RegInit(Registry *) { return true; }
 void Operator::RegCleanup(Registry *) {}
 
+void Operator::FailOutOfMemory(Request *req) {
+    Fail(req, "%s: out of memory (time = %f)\n", name_.c_str(), req->Time());
+}
+
 void Operator::Fail(Request *req, const char *fmt, ...) {
     // A failure after refused pixel memory says what was needed and the limit.
     if (const std::string why = TakePixelRefusal(); !why.empty()) {

@@ -160,6 +160,9 @@ protected:
     /// name; after a refused pixel allocation the line says what was needed
     /// and the memory limit instead (PixelMemory.h).
     void Fail(Request *req, const char *fmt, ...) __attribute__((format(printf, 3, 4)));
+    /// Fail with the line every tool gives when memory for its result was not
+    /// to be had: "NAME: out of memory (time = T)", or the refusal above.
+    void FailOutOfMemory(Request *req);
 
 private:
     std::string name_, group_;

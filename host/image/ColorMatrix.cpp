@@ -11,6 +11,7 @@
 #include "host/image/Image.h"
 #include "host/image/PixelConvert.h"
 #include "host/krom/KROMComputeNode.h"
+#include "host/krom/PointKernel.h"
 #include "host/krom/kernels/ColorKernelParams.h"
 
 namespace Orvane {
@@ -165,13 +166,7 @@ bool MatrixOnDevice(Request *req, const Image *src, Image *dst, const RowMatrix 
     const FltPixel c = src->GetCanvasColor();
     float canvas[4] = {c.R, c.G, c.B, c.A};
     MatrixRun(mx, canvas, p.dp, 1);
-    const bool hasPixels = src->HasScanLineData() || src->IsGPUMemDirty();
-    const ImgRectI in = hasPixels ? src->DataWindow() : ImgRectI(), out = dst->DataWindow();
-    const int inWindow[4] = {in.x0, in.x1, in.y0, in.y1}, outWindow[4] = {out.x0, out.x1, out.y0, out.y1};
-    std::memcpy(p.inDataWindow, inWindow, sizeof inWindow);
-    std::memcpy(p.outDataWindow, outWindow, sizeof outWindow);
-    p.workSize[0] = out.Width();
-    p.workSize[1] = out.Height();
+    SetPointKernelWindows(p, *src, *dst);
     return KROMComputeNode::ExecKernelI(
         req, "ColorMatrix", nullptr, ColorMatrixParamsText, sizeof p, offsetof(ColorMatrixParams, srcCompOrder),
         offsetof(ColorMatrixParams, dstCompOrder), block, {{"input", const_cast<Image *>(src)}, {"output", dst}});

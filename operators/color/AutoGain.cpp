@@ -136,7 +136,7 @@ void AutoGain::Process(Request *req) {
         return;
     }
     auto outOfMemory = [&] {
-        Fail(req, "%s: out of memory (time = %f)\n", Name().c_str(), req->Time());
+        FailOutOfMemory(req);
         req->SetOutputData(output_, nullptr);
     };
     if (req->IsPreCalc()) { // no pixels to measure: the windows only

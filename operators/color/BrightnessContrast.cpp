@@ -18,6 +18,7 @@
 #include "host/image/NewImage.h"
 #include "host/image/PixelConvert.h"
 #include "host/krom/KROMComputeNode.h"
+#include "host/krom/PointKernel.h"
 #include "host/krom/kernels/ColorKernelParams.h"
 #include "operators/frame/Registration.h"
 
@@ -606,15 +607,10 @@ bool BrightnessContrast::RunDevice(Request *req, const Image *src, Image *dst) {
         satRows[r][3] = 0.f;
     }
     p.sat = v.sat, p._sat = v._sat, p.finalScale = v.finalScale, p.low = v.low;
-    const bool hasPixels = src->HasScanLineData() || src->IsGPUMemDirty();
-    const ImgRectI in = hasPixels ? src->DataWindow() : ImgRectI(), out = dst->DataWindow();
-    const int inWindow[4] = {in.x0, in.x1, in.y0, in.y1}, outWindow[4] = {out.x0, out.x1, out.y0, out.y1};
-    std::memcpy(p.inDataWindow, inWindow, sizeof inWindow);
-    std::memcpy(p.outDataWindow, outWindow, sizeof outWindow);
-    p.x0 = std::min(in.x0, out.x1);
-    p.x1 = std::min(in.x1, out.x1);
-    p.workSize[0] = out.Width();
-    p.workSize[1] = out.Height();
+    SetPointKernelWindows(p, *src, *dst);
+    // The span of each row the kernel reads from the input (windows are x0, x1, y0, y1).
+    p.x0 = std::min(p.inDataWindow[0], p.outDataWindow[1]);
+    p.x1 = std::min(p.inDataWindow[1], p.outDataWindow[1]);
     return KROMComputeNode::ExecKernelI(
         req, v.reverse ? "BrightnessContrastReverse" : "BrightnessContrast", nullptr, BrightnessContrastParamsText,
         sizeof p, offsetof(BrightnessContrastParams, srcCompOrder), offsetof(BrightnessContrastParams, dstCompOrder),
@@ -648,7 +644,7 @@ void BrightnessContrast::Process(Request *req) {
     const OvID clipping = GetClippingMode(req);
     Ref<Image> dst = NewPointOutput(req, input_, src, clipping);
     auto outOfMemory = [&] {
-        Fail(req, "%s: out of memory (time = %f)\n", Name().c_str(), req->Time());
+        FailOutOfMemory(req);
         req->SetOutputData(output_, nullptr);
     };
     if (!dst) return outOfMemory();

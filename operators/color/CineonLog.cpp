@@ -126,7 +126,7 @@ void CineonLog::Process(Request *req) {
     }
     fn.table = &table;
     Ref<Image> dst = RunPointColor(*this, req, input_, src, fn);
-    if (!dst) Fail(req, "%s: out of memory (time = %f)\n", Name().c_str(), req->Time());
+    if (!dst) FailOutOfMemory(req);
     req->SetOutputData(output_, dst.Get());
 }
 

@@ -16,6 +16,7 @@
 #include "host/image/PixelConvert.h"
 #include "host/krom/KROMComputeNode.h"
 #include "host/krom/KROMParams.h"
+#include "host/krom/PointKernel.h"
 #include "operators/frame/Registration.h"
 
 namespace Orvane {
@@ -415,13 +416,7 @@ bool ColorGain::RunDevice(Request *req, const Image *src, Image *dst) const {
         p.doSat[s] = st.doSat, p.active[s] = !st.neutral;
     }
     p.shadowsEnd = v_.shadowsEnd, p.highlightsStart = v_.highlightsStart, p.doRanges = v_.doRanges;
-    const bool hasPixels = src->HasScanLineData() || src->IsGPUMemDirty();
-    const ImgRectI in = hasPixels ? src->DataWindow() : ImgRectI(), out = dst->DataWindow();
-    const int inWindow[4] = {in.x0, in.x1, in.y0, in.y1}, outWindow[4] = {out.x0, out.x1, out.y0, out.y1};
-    std::memcpy(p.inDataWindow, inWindow, sizeof inWindow);
-    std::memcpy(p.outDataWindow, outWindow, sizeof outWindow);
-    p.workSize[0] = out.Width();
-    p.workSize[1] = out.Height();
+    SetPointKernelWindows(p, *src, *dst);
     return KROMComputeNode::ExecKernelI(
         req, "ColorGain", kColorGainKernel, ColorGainParamsText, sizeof p, offsetof(ColorGainParams, srcCompOrder),
         offsetof(ColorGainParams, dstCompOrder), block, {{"input", const_cast<Image *>(src)}, {"output", dst}});
@@ -440,7 +435,7 @@ void ColorGain::Process(Request *req) {
         return;
     }
     auto outOfMemory = [&] {
-        Fail(req, "%s: out of memory (time = %f)\n", Name().c_str(), req->Time());
+        FailOutOfMemory(req);
         req->SetOutputData(output_, nullptr);
     };
     // 2. Linear: one matrix.

@@ -65,7 +65,7 @@ void ColorProcessorTool::Process(Request *req) {
     const OvID clipping = GetClippingMode(req);
     Ref<Image> dst = NewPointOutput(req, input_, src, clipping);
     auto outOfMemory = [&] {
-        Fail(req, "%s: out of memory (time = %f)\n", Name().c_str(), req->Time());
+        FailOutOfMemory(req);
         req->SetOutputData(output_, nullptr);
     };
     if (!dst) return outOfMemory();

@@ -87,7 +87,7 @@ void CustomColorMatrix::Process(Request *req) {
                        {WorkUseGPU, !precalc && IsGPUEnabled(req, false)},
                        {WorkRequest, req}};
     if (!dst || !ApplyMatrixTagList(src, dst.Get(), tags)) {
-        Fail(req, "%s: out of memory (time = %f)\n", Name().c_str(), req->Time());
+        FailOutOfMemory(req);
         req->SetOutputData(output_, nullptr);
         return;
     }

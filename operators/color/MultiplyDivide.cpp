@@ -62,7 +62,7 @@ void MultiplyDivide::Process(Request *req) {
     };
     Ref<Image> dst =
         divide_ ? RunPointColor(*this, req, input_, src, divide) : RunPointColor(*this, req, input_, src, multiply);
-    if (!dst) Fail(req, "%s: out of memory (time = %f)\n", Name().c_str(), req->Time());
+    if (!dst) FailOutOfMemory(req);
     req->SetOutputData(output_, dst.Get());
 }
 

@@ -85,7 +85,7 @@ void SetCanvasColor::Process(Request *req) {
                 rows.Count());
         }
     }
-    if (!ok) Fail(req, "%s: out of memory (time = %f)\n", Name().c_str(), req->Time());
+    if (!ok) FailOutOfMemory(req);
     req->SetOutputData(output_, ok ? dst.Get() : nullptr);
 }
 

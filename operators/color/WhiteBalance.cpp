@@ -243,7 +243,7 @@ void WhiteBalance::Process(Request *req) {
     m.Then(back);
     if (req->GetInputNumber(direction_) >= 0.5) m.Invert();
     Ref<Image> dst = RunGainMatrix(*this, req, input_, src, m);
-    if (!dst) Fail(req, "%s: out of memory (time = %f)\n", Name().c_str(), req->Time());
+    if (!dst) FailOutOfMemory(req);
     req->SetOutputData(output_, dst.Get());
 }
 

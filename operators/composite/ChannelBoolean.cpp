@@ -165,7 +165,7 @@ void ChannelBoolean::Process(Request *req) {
         }
     }
     if (!ok) {
-        Fail(req, "%s: out of memory (time = %f)\n", Name().c_str(), req->Time());
+        FailOutOfMemory(req);
         req->SetOutputData(output_, nullptr);
         return;
     }

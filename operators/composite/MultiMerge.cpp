@@ -240,8 +240,7 @@ void MultiMerge::Process(Request *req) {
     Ref<TransformMatrix> blended = MakeRef<TransformMatrix>(bgValue, req, background_, 0u, TimeUndefined);
     if (!blended->MergeConcatenateTagList(stack.Get(),
                                           {{XfMergeToolBlend, -1}, {XfRequest, static_cast<const void *>(req)}})) {
-        if (!(req->GetTask() && req->GetTask()->IsAborted()))
-            Fail(req, "%s: out of memory (time = %g)\n", Name().c_str(), req->Time());
+        if (!(req->GetTask() && req->GetTask()->IsAborted())) FailOutOfMemory(req);
         req->SetOutputData(output_, nullptr);
         return;
     }

@@ -442,7 +442,7 @@ void Background::Process(Request *req) {
         const bool onDevice = !field_ && IsGPUEnabled(req, true) && RunDevice(req, img.Get());
         if (!onDevice) {
             if (!img->AllocScanLineData()) {
-                Fail(req, "%s: out of memory (time = %f)\n", Name().c_str(), req->Time());
+                FailOutOfMemory(req);
                 req->SetOutputData(outImage_, nullptr);
                 return;
             }

@@ -235,8 +235,7 @@ void Transform::Process(Request *req) {
     tags.Set({XfRequest, static_cast<const void *>(req)});
     if (!tm->ImageConcatenateTagList(tags)) {
         // Flattening stopped: the render was abandoned, or memory ran out.
-        if (!(req->GetTask() && req->GetTask()->IsAborted()))
-            Fail(req, "%s: out of memory (time = %f)\n", Name().c_str(), req->Time());
+        if (!(req->GetTask() && req->GetTask()->IsAborted())) FailOutOfMemory(req);
         req->SetOutputData(output_, nullptr);
         return;
     }
