@@ -183,8 +183,10 @@ void PrintInput(const InputLine &in) {
     fmt::print("{}\n", list);
 }
 
-/// Calls `onPage` with a page's name where a new page begins, then `onInput` for each input, in order.
-template <class OnPage, class OnInput> void ForEachInputByPage(const Operator &op, OnPage onPage, OnInput onInput) {
+/// Calls `onPage` with a page's name where a new page begins, `onNest` with the caption of each fold of
+/// controls where it begins, then `onInput` for each input, in order.
+template <class OnPage, class OnNest, class OnInput>
+void ForEachInputByPage(const Operator &op, OnPage onPage, OnNest onNest, OnInput onInput) {
     int page = -2;
     for (const auto &in : op.Inputs()) {
         if (in->Page() != page) {
@@ -192,6 +194,8 @@ template <class OnPage, class OnInput> void ForEachInputByPage(const Operator &o
             const auto &pages = op.Pages();
             onPage(page >= 0 && page < static_cast<int>(pages.size()) ? pages[page].name : std::string("Controls"));
         }
+        for (const ControlNest &nest : op.Nests())
+            if (nest.firstInput == in->Index() && nest.endInput > nest.firstInput) onNest(nest.name);
         onInput(*in);
     }
 }
@@ -219,6 +223,7 @@ void PrintMarkdown(const Registry &row, const Operator *op) {
         [](const std::string &page) {
             fmt::print("\n## Page \"{}\"\n\n| ID | Label | Type | Details |\n|---|---|---|---|\n", page);
         },
+        [](const std::string &nest) { fmt::print("| | **{}** | group | |\n", Cell(nest)); },
         [](const Input &in) {
             const InputLine line = DescribeInput(in);
             std::string details = line.details;
@@ -317,6 +322,7 @@ int RunDescribe(const std::vector<std::string> &args) {
     if (!op) return ExitOk;
     ForEachInputByPage(
         *op, [](const std::string &page) { fmt::print("\npage \"{}\"\n", page); },
+        [](const std::string &nest) { fmt::print("  group \"{}\"\n", nest); },
         [](const Input &in) { PrintInput(DescribeInput(in)); });
     fmt::print("\noutputs\n");
     for (const auto &out : op->Outputs()) fmt::print("  {:<28} {}\n", out->ID().Text(), TypeWord(out->DataType()));
