@@ -1,6 +1,5 @@
-// ColorCorrector: the range function's steps against a double-precision model written from them, the whole tool
-// against a model of how its controls fold into the range records, edge cases, every depth, regions, threads, and
-// the range curves through a saved document.
+// ColorCorrector against a double-precision model written from its documented steps and folding of the controls,
+// the pixel function's edge cases, every depth, regions, threads, and the range curves through a saved document.
 #include <algorithm>
 #include <array>
 #include <cmath>
@@ -17,7 +16,6 @@
 #include "host/core/Tags.h"
 #include "host/flow/DocumentIO.h"
 #include "host/flow/Link.h"
-#include "host/flow/RenderTask.h"
 #include "host/flow/Request.h"
 #include "host/image/NewImage.h"
 #include "operators/color/ColorCorrectorRanges.h"
@@ -37,15 +35,9 @@ D3 Mul(const double m[3][3], const D3 &v) {
     for (int i = 0; i < 3; ++i) o[i] = m[i][0] * v[0] + m[i][1] * v[1] + m[i][2] * v[2];
     return o;
 }
-D3 Apply(const cc::Matrix34 &m, const D3 &v) {
-    D3 o;
-    for (int i = 0; i < 3; ++i) o[i] = m.m[i][0] * v[0] + m.m[i][1] * v[1] + m.m[i][2] * v[2] + m.m[i][3];
-    return o;
-}
 /// `x` rounded to a 32-bit float. Out of line on purpose: GCC 12 at -O2 may drop the rounding of double -> float ->
 /// double round trips that it packs into one vector operation.
 [[gnu::noinline]] float AsFloat(double x) { return static_cast<float>(x); }
-
 double Luma(const D3 &c) { return 0.299 * c[0] + 0.587 * c[1] + 0.114 * c[2]; }
 double SignedPow(double x, double e) { return x < 0 ? -std::pow(-x, e) : std::pow(x, e); }
 double Hue(const D3 &c) {
@@ -58,256 +50,96 @@ double Hue(const D3 &c) {
     return h < 0 ? h + 1 : h;
 }
 
-/// The range function in double, step by step, from a record as the tool holds it.
-Px RangeModel(const cc::PixelSettings &s, const cc::RangeRecord &r, double L, const Px &p) {
-    D3 c{p[0], p[1], p[2]};
-    if (r.doMatrix) {
-        if (s.tintMode == cc::TintFast || (L >= 0 && L <= 1)) {
-            c = Apply(L < 0.5 ? r.low : r.high, c);
-        } else {
-            D3 y = Apply(s.toLumaFirst, c);
-            const double luma = y[0];
-            y[0] = L < 0 ? std::max(y[0], 0.0) : std::min(y[0], 1.0);
-            y = Apply(L < 0 ? r.belowBlack : r.aboveWhite, y);
-            y[0] = luma;
-            c = Apply(s.fromLumaFirst, y);
-        }
-    }
-    for (int i = 0; i < 3; ++i) {
-        double x = c[i];
-        if (s.gammaAfterLevels) {
-            if (r.doLevels1) x = x * r.mul1[i] + r.add1[i];
-            if (r.doGamma && r.gamma[i] != 1.f) x = SignedPow(x, r.gamma[i]);
-            if (r.doLevels2) x = x * r.mul2[i] + r.add2[i];
-        } else {
-            if (r.doGamma && r.gamma[i] != 1.f) x = SignedPow(x, r.gamma[i]);
-            if (r.doLevels1) x = x * r.mul1[i] + r.add1[i];
-        }
-        c[i] = x;
-    }
-    if (const cc::Suppression *t = r.suppression) {
-        const int n = cc::Suppression::kSamples;
-        const double f = t->factor[std::clamp(static_cast<int>(n * Hue(c)), 0, n - 1)];
-        if (std::fabs(f - 1) > 1e-6) {
-            const double d = (t->wR * c[0] + t->wG * c[1] + t->wB * c[2] + t->offset) * (1 - f);
-            for (double &x : c) x = x * f + d;
-        }
-    }
-    return {c[0], c[1], c[2], p[3]};
-}
-
-cc::Matrix34 Mat(std::initializer_list<float> v) {
-    cc::Matrix34 m;
-    auto it = v.begin();
-    for (auto &row : m.m)
-        for (float &x : row) x = *it++;
-    return m;
-}
-
-cc::PixelSettings LumaFirstSettings() {
-    cc::PixelSettings s;
-    for (int i = 0; i < 3; ++i)
-        for (int j = 0; j < 3; ++j) {
-            s.toLumaFirst.m[i][j] = static_cast<float>(kToLuma[i][j]);
-            s.fromLumaFirst.m[i][j] = static_cast<float>(kFromLuma[i][j]);
-        }
-    return s;
-}
-
-/// A record with every stage on and distinct values in each.
-cc::RangeRecord FullRecord(const cc::Suppression *table) {
-    cc::RangeRecord r;
-    r.doMatrix = r.doGamma = r.doLevels1 = r.doLevels2 = true;
-    r.low = Mat({1.1f, 0.05f, -0.02f, 0.01f, 0.03f, 0.9f, 0.02f, -0.02f, -0.04f, 0.1f, 1.2f, 0.03f});
-    r.high = Mat({0.8f, 0.1f, 0.05f, 0.1f, 0.0f, 1.3f, -0.1f, 0.0f, 0.2f, 0.0f, 0.7f, -0.05f});
-    r.belowBlack = Mat({1.f, 0.f, 0.f, 0.f, 0.1f, 1.2f, 0.1f, 0.02f, -0.2f, 0.f, 0.9f, 0.01f});
-    r.aboveWhite = Mat({1.f, 0.f, 0.f, 0.f, -0.1f, 0.8f, 0.f, 0.05f, 0.3f, 0.1f, 1.1f, -0.03f});
-    const float g[3] = {0.8f, 1.0f, 1.7f}, m1[3] = {1.2f, 0.9f, 1.05f}, a1[3] = {0.02f, -0.05f, 0.1f};
-    const float m2[3] = {0.9f, 1.1f, 0.7f}, a2[3] = {0.05f, 0.f, -0.03f};
-    for (int i = 0; i < 3; ++i)
-        r.gamma[i] = g[i], r.mul1[i] = m1[i], r.add1[i] = a1[i], r.mul2[i] = m2[i], r.add2[i] = a2[i];
-    r.suppression = table;
-    return r;
-}
-
 class ColorCorrector : public ::testing::Test {
 protected:
     static void SetUpTestSuite() { ts::LoadOperators(); }
 };
 
-TEST_F(ColorCorrector, RangeFunctionFollowsItsStepsInEveryModeAndOrder) {
-    cc::Suppression table;
-    for (int i = 0; i < cc::Suppression::kSamples; ++i) table.factor[i] = 0.3f + 0.7f * std::fabs(std::sin(i * 0.05f));
-    table.factor[100] = 1.f; // an entry that leaves the pixel alone
-    table.offset = 0.02f;
-    const cc::RangeRecord full = FullRecord(&table);
-    const Px pixels[] = {{0.2137, 0.4291, 0.6173, 1.0},    {0.9031, 0.6817, 0.7993, 0.5},
-                         {-0.3107, -0.1123, -0.2009, 1.0}, {1.4113, 1.2347, 1.6071, 1.0},
-                         {0.5039, -0.2111, 0.1297, 0.7},   {0.3, 0.3, 0.3, 1.0},
-                         {2.0131, -1.0173, 0.5519, 1.0},   {0.4513, 0.5077, 0.5591, 0.2}};
-    // What each case switches off from the full record.
-    struct Case {
-        const char *name;
-        bool matrix, gamma, levels1, levels2, suppression;
-    };
-    const Case cases[] = {
-        {"every stage", true, true, true, true, true},        {"colour alone", true, false, false, false, false},
-        {"gamma alone", false, true, false, false, false},    {"levels 1 alone", false, false, true, false, false},
-        {"levels 2 alone", false, false, false, true, false}, {"suppression alone", false, false, false, false, true},
-        {"levels and gamma", false, true, true, true, false}};
-    for (int mode : {cc::TintFast, cc::TintFull, cc::TintBetter})
-        for (bool after : {false, true})
-            for (const Case &k : cases) {
-                cc::PixelSettings s = LumaFirstSettings();
-                s.tintMode = mode, s.gammaAfterLevels = after;
-                cc::RangeRecord r = full;
-                r.doMatrix = k.matrix, r.doGamma = k.gamma, r.doLevels1 = k.levels1, r.doLevels2 = k.levels2;
-                r.suppression = k.suppression ? &table : nullptr;
-                for (const Px &p : pixels) {
-                    const double L = 0.299 * p[0] + 0.587 * p[1] + 0.114 * p[2];
-                    const float in[4] = {AsFloat(p[0]), AsFloat(p[1]), AsFloat(p[2]), AsFloat(p[3])};
-                    float out[4];
-                    cc::RangeFunction(s, r, static_cast<float>(L), in, out);
-                    const Px want = RangeModel(s, r, L, {in[0], in[1], in[2], in[3]});
-                    for (int c = 0; c < 4; ++c)
-                        ASSERT_NEAR(out[c], want[c], 2e-6 * (1 + std::fabs(want[c])))
-                            << k.name << ", mode " << mode << (after ? ", gamma after" : ", gamma before") << ", pixel "
-                            << p[0] << "," << p[1] << "," << p[2] << " channel " << c;
-                }
-            }
+// ---- the pixel function's edge cases ----
+
+cc::Matrix34 Diagonal(float k) {
+    cc::Matrix34 m;
+    for (int i = 0; i < 3; ++i) m.m[i][i] = k;
+    return m;
 }
 
-TEST_F(ColorCorrector, RangeFunctionEdgeCases) {
+TEST_F(ColorCorrector, PixelFunctionEdgeCases) {
     cc::Suppression greyTable;
     std::fill(std::begin(greyTable.factor), std::end(greyTable.factor), 1.f);
     greyTable.factor[0] = 0.25f, greyTable.offset = 0.1f;
-    const cc::RangeRecord full = FullRecord(nullptr);
-    auto with = [](cc::RangeRecord r, auto change) {
-        change(r);
-        return r;
-    };
-    const cc::RangeRecord onlyMatrix = with(full, [](auto &r) { r.doGamma = r.doLevels1 = r.doLevels2 = false; });
-    const cc::RangeRecord squareRoot = with(cc::RangeRecord{}, [](auto &r) {
-        r.doGamma = true;
-        r.gamma[0] = r.gamma[1] = 0.5f, r.gamma[2] = 2.f;
-    });
-    const cc::RangeRecord levels2 = with(cc::RangeRecord{}, [](auto &r) {
-        r.doLevels2 = true;
-        std::fill(r.mul2, r.mul2 + 3, 3.f);
-    });
-    const cc::RangeRecord grey = with(cc::RangeRecord{}, [&](auto &r) { r.suppression = &greyTable; });
-    auto apply = [](const cc::Matrix34 &m, const Px &p) {
-        const D3 c = Apply(m, {p[0], p[1], p[2]});
-        return Px{c[0], c[1], c[2], p[3]};
-    };
+    // Records: the low matrix doubles, the high one triples; square roots (blue squared); output levels x3; the
+    // suppression table above; a lift of 0.1.
+    cc::RangeRecord matrices, roots, levels2, grey, lift;
+    matrices.doMatrix = true, matrices.low = Diagonal(2.f), matrices.high = Diagonal(3.f);
+    roots.doGamma = true, roots.gamma[0] = roots.gamma[1] = 0.5f, roots.gamma[2] = 2.f;
+    levels2.doLevels2 = true, std::fill(levels2.mul2, levels2.mul2 + 3, 3.f);
+    grey.suppression = &greyTable;
+    lift.doLevels1 = true, std::fill(lift.add1, lift.add1 + 3, 0.1f);
+    const float kPixel = std::nanf(""); // L from the pixel: the whole pixel function, not one range function
+    enum How : unsigned { Fast = 1, Full = 2, GammaFirst = 4, Pre = 8, Post = 16 }; // else Better, gamma after levels
     struct Edge {
         const char *name;
-        int mode;
-        bool after;
-        cc::RangeRecord r;
+        const cc::RangeRecord *r;
+        unsigned how;
         float L;
         Px in, want;
     };
-    const Px dark{-0.2, -0.1, -0.3, 1}, bright{1.5, 1.3, 1.2, 1}, mid{0.5, 0.5, 0.5, 1};
+    const Px mid{.5, .5, .5, 1}, dark{-.2, -.1, -.3, 1}, bright{1.5, 1.3, 1.2, 1}, px{.2, .4, .6, 1};
+    const cc::RangeRecord neutral;
     const Edge edges[] = {
-        {"neutral record: the pixel as it came", cc::TintBetter, true, {}, 0.3f, {0.2, -5, 7, 0.4}, {0.2, -5, 7, 0.4}},
-        {"L exactly 0.5 takes the high matrix", cc::TintBetter, true, onlyMatrix, 0.5f, mid, apply(full.high, mid)},
-        {"just below 0.5 the low one", cc::TintBetter, true, onlyMatrix, std::nextafter(0.5f, 0.f), mid,
-         apply(full.low, mid)},
-        {"Fast below black: the low matrix", cc::TintFast, true, onlyMatrix, -0.16f, dark, apply(full.low, dark)},
-        {"Fast above white: the high matrix", cc::TintFast, true, onlyMatrix, 1.35f, bright, apply(full.high, bright)},
-        {"negative values keep their sign under gamma",
-         cc::TintBetter,
-         true,
-         squareRoot,
-         0.f,
-         {-0.25, 0.25, -2, 1},
-         {-0.5, 0.5, -4, 1}},
-        {"gamma before levels: levels 2 does not run",
-         cc::TintBetter,
-         false,
-         levels2,
-         0.f,
-         {0.1, 0.2, 0.3, 1},
-         {0.1, 0.2, 0.3, 1}},
-        {"gamma after levels: levels 2 runs",
-         cc::TintBetter,
-         true,
-         levels2,
-         0.f,
-         {0.1, 0.2, 0.3, 1},
-         {0.3, 0.6, 0.9, 1}},
-        // Grey has hue 0: the first entry, 0.25, desaturates towards luma + offset.
-        {"grey takes the first suppression entry",
-         cc::TintBetter,
-         true,
-         grey,
-         0.f,
-         {0.3, 0.3, 0.3, 1},
-         {0.375, 0.375, 0.375, 1}},
-        {"a cyan pixel reads another entry", cc::TintBetter, true, grey, 0.f, {0.1, 0.5, 0.5, 1}, {0.1, 0.5, 0.5, 1}},
+        {"neutral: the pixel as it came", &neutral, 0, 0.3f, {0.2, -5, 7, 0.4}, {0.2, -5, 7, 0.4}},
+        {"L exactly 0.5 takes the high matrix", &matrices, 0, 0.5f, mid, {1.5, 1.5, 1.5, 1}},
+        {"just below 0.5 the low one", &matrices, 0, std::nextafter(0.5f, 0.f), mid, {1, 1, 1, 1}},
+        {"Fast, below black: the low matrix", &matrices, Fast, -0.16f, dark, {-0.4, -0.2, -0.6, 1}},
+        {"Fast, above white: the high matrix", &matrices, Fast, 1.35f, bright, {4.5, 3.9, 3.6, 1}},
+        // The below-black and above-white matrices here are identities: the detour changes nothing.
+        {"Better, below black: the luma-first detour", &matrices, 0, -0.16f, dark, dark},
+        {"Full, above white: the luma-first detour", &matrices, Full, 1.35f, bright, bright},
+        {"negative values keep their sign under gamma", &roots, 0, 0.f, {-.25, .25, -2, 1}, {-.5, .5, -4, 1}},
+        {"gamma before levels: levels 2 does not run", &levels2, GammaFirst, 0.f, px, px},
+        {"gamma after levels: levels 2 runs", &levels2, 0, 0.f, px, {.6, 1.2, 1.8, 1}},
+        // Grey has hue 0: entry 0 (0.25) pulls it towards luma + offset.
+        {"grey takes the first suppression entry", &grey, 0, 0.f, {.3, .3, .3, 1}, {.375, .375, .375, 1}},
+        {"cyan reads another entry", &grey, 0, 0.f, {.1, .5, .5, 1}, {.1, .5, .5, 1}},
+        {"alpha 0 with pre-divide: black first", &lift, Pre, kPixel, {.2, .4, .6, 0}, {.1, .1, .1, 0}},
+        {"pre-divide by alpha", &lift, Pre, kPixel, {.2, .4, .1, .5}, {.5, .9, .3, .5}},
+        {"divided, lifted, multiplied back", &lift, Pre | Post, kPixel, {.2, .4, .1, .5}, {.25, .45, .15, .5}},
+        {"post-multiply: alpha 5e-7 gives black", &lift, Post, kPixel, {.2, .4, .6, 5e-7}, {0, 0, 0, 5e-7}},
+        {"post-multiply: alpha -9e-7 too", &lift, Post, kPixel, {.2, .4, .6, -9e-7}, {0, 0, 0, -9e-7}},
+        {"post-multiply: alpha 2e-6 multiplies", &lift, Post, kPixel, {.2, .4, .6, 2e-6}, {6e-7, 1e-6, 1.4e-6, 2e-6}},
     };
     for (const Edge &e : edges) {
-        cc::PixelSettings s = LumaFirstSettings();
-        s.tintMode = e.mode, s.gammaAfterLevels = e.after;
-        const float in[4] = {AsFloat(e.in[0]), AsFloat(e.in[1]), AsFloat(e.in[2]), AsFloat(e.in[3])};
-        float out[4];
-        cc::RangeFunction(s, e.r, e.L, in, out);
-        for (int c = 0; c < 4; ++c) EXPECT_NEAR(out[c], e.want[c], 1e-6 * (1 + std::fabs(e.want[c]))) << e.name << c;
-        if (e.L == 0.3f) {
-            EXPECT_EQ(std::memcmp(in, out, sizeof in), 0) << "bit for bit";
+        cc::PixelSettings s;
+        for (int i = 0; i < 3; ++i)
+            for (int j = 0; j < 3; ++j) {
+                s.toLumaFirst.m[i][j] = static_cast<float>(kToLuma[i][j]);
+                s.fromLumaFirst.m[i][j] = static_cast<float>(kFromLuma[i][j]);
+            }
+        s.tintMode = e.how & Fast ? cc::TintFast : e.how & Full ? cc::TintFull : cc::TintBetter;
+        s.gammaAfterLevels = !(e.how & GammaFirst), s.preDivide = e.how & Pre, s.postMultiply = e.how & Post;
+        s.records[0] = *e.r;
+        float p[4] = {AsFloat(e.in[0]), AsFloat(e.in[1]), AsFloat(e.in[2]), AsFloat(e.in[3])}, out[4];
+        std::copy(p, p + 4, out);
+        if (std::isnan(e.L))
+            cc::CorrectPixel(s, out);
+        else
+            cc::RangeFunction(s, *e.r, e.L, p, out);
+        for (int c = 0; c < 4; ++c)
+            EXPECT_NEAR(out[c], e.want[c], 1e-7 + 1e-6 * std::fabs(e.want[c])) << e.name << ", channel " << c;
+        if (e.r == &neutral) {
+            EXPECT_EQ(std::memcmp(p, out, sizeof p), 0) << "bit for bit";
         }
     }
-    // Full and Better outside 0..1 take the luma-first detour, not the in-range matrices.
-    cc::PixelSettings s = LumaFirstSettings();
-    s.tintMode = cc::TintFull;
-    float out[4];
-    const float in[4] = {-0.2f, -0.1f, -0.3f, 1.f};
-    cc::RangeFunction(s, onlyMatrix, -0.16f, in, out);
-    EXPECT_GT(std::fabs(out[1] - apply(full.low, dark)[1]), 1e-3);
-}
-
-TEST_F(ColorCorrector, PixelPreDividesWeighsRangesAndFlushesTinyAlphaOnPostMultiply) {
-    const cc::RangeRecord lift = [] {
-        cc::RangeRecord r;
-        r.doLevels1 = true;
-        std::fill(r.add1, r.add1 + 3, 0.1f);
-        return r;
-    }();
-    struct Case {
-        const char *name;
-        bool pre, post;
-        Px in, want;
-    };
-    const Case cases[] = {
-        {"alpha 0 with pre-divide: black before the correction", true, false, {0.2, 0.4, 0.6, 0}, {0.1, 0.1, 0.1, 0}},
-        {"pre-divide by alpha", true, false, {0.2, 0.4, 0.1, 0.5}, {0.5, 0.9, 0.3, 0.5}},
-        {"post-multiply: alpha inside 1e-6 gives black", false, true, {0.2, 0.4, 0.6, 5e-7}, {0, 0, 0, 5e-7}},
-        {"post-multiply: negative tiny alpha too", false, true, {0.2, 0.4, 0.6, -9e-7}, {0, 0, 0, -9e-7}},
-        {"post-multiply: alpha 2e-6 multiplies", false, true, {0.2, 0.4, 0.6, 2e-6}, {6e-7, 1e-6, 1.4e-6, 2e-6}},
-        {"both: a round trip with the lift in between", true, true, {0.2, 0.4, 0.1, 0.5}, {0.25, 0.45, 0.15, 0.5}},
-    };
-    for (const Case &k : cases) {
-        cc::PixelSettings s;
-        s.records[0] = lift;
-        s.preDivide = k.pre, s.postMultiply = k.post;
-        float p[4] = {AsFloat(k.in[0]), AsFloat(k.in[1]), AsFloat(k.in[2]), AsFloat(k.in[3])};
-        cc::CorrectPixel(s, p);
-        for (int c = 0; c < 4; ++c) EXPECT_NEAR(p[c], k.want[c], 1e-7 + 1e-6 * std::fabs(k.want[c])) << k.name << c;
-    }
-    // With ranges: the three functions weighted by the curves and summed, alpha included.
+    // With ranges the three range functions are weighted by the curves and summed, alpha included.
     const ColorCurvesTable curves;
     cc::PixelSettings s;
     s.rangesInUse = true, s.curves = &curves;
     const float adds[3] = {0.3f, 0.f, -0.2f};
-    for (int k = 0; k < 3; ++k) {
-        s.records[k].doLevels1 = true;
-        std::fill(s.records[k].add1, s.records[k].add1 + 3, adds[k]);
-    }
+    for (int k = 0; k < 3; ++k)
+        s.records[k].doLevels1 = true, std::fill(s.records[k].add1, s.records[k].add1 + 3, adds[k]);
     for (float v : {0.f, 0.1f, 0.25f, 0.5f, 0.8f, 1.2f}) {
-        float p[4] = {v, v, v, 0.6f};
-        float ws, wm, wh;
-        curves.WeightsAt(0.299f * v + 0.587f * v + 0.114f * v, ws, wm, wh);
+        float p[4] = {v, v, v, 0.6f}, ws, wm, wh;
+        curves.WeightsAt(cc::LumaOf(p), ws, wm, wh);
         cc::CorrectPixel(s, p);
         EXPECT_NEAR(p[0], v + ws * 0.3 - wh * 0.2, 1e-6) << v;
         EXPECT_NEAR(p[3], 0.6, 1e-6) << v;
@@ -322,36 +154,16 @@ using Controls = std::map<std::string, double>;
 const char *const kRangeIds[] = {"Master", "Shadows", "MidTones", "Highlights"};
 const char *const kChannels[] = {"RGB", "Red", "Green", "Blue"};
 
-double Default(const std::string &id) {
-    auto endsWith = [&id](const char *w) {
-        const size_t n = std::strlen(w);
-        return id.size() >= n && id.compare(id.size() - n, n, w) == 0;
-    };
-    if (id == "TintMode") return 2.0;
-    for (const char *one : {"Contrast", "Gain", "Gamma", "Mid", "High"})
-        if (endsWith(one)) return 1.0;
-    if (std::isdigit(static_cast<unsigned char>(id.back()))) {
-        const std::string word = id.substr(0, id.size() - 1);
-        for (const char *one : {"WheelSaturation", "Saturation", "Red", "Yellow", "Green", "Cyan", "Blue", "Magenta"})
-            if (word == one) return 1.0;
-    }
-    return 0.0;
-}
-
 /// The tool's documented folding and pixel steps, in double, from the control values.
 struct ToolModel {
     Controls v;
+    const Operator *tool; ///< gives the defaults of the controls not in v
+    double Default(const std::string &id) const {
+        return dynamic_cast<const Number &>(*tool->FindInput(id.c_str())->Default()).value;
+    }
     double Get(const std::string &id) const {
         auto it = v.find(id);
         return it == v.end() ? Default(id) : it->second;
-    }
-    /// Whether a control whose ID begins with one of `words` and ends in a range number is off its default.
-    bool Changed(std::initializer_list<const char *> words) const {
-        for (const auto &[id, value] : v)
-            for (const char *w : words)
-                if (id.rfind(w, 0) == 0 && std::isdigit(static_cast<unsigned char>(id.back())) && value != Default(id))
-                    return true;
-        return false;
     }
     bool RangesInUse() const {
         for (const auto &[id, value] : v)
@@ -498,48 +310,33 @@ Ref<Image> Render(Operator *op, const ImgRectI *roi = nullptr, uint32_t flags = 
 
 Px ToPx(const FltPixel &p) { return {p.R, p.G, p.B, p.A}; }
 
-const std::pair<const char *, Controls> kSettings[] = {
-    {"master gain and lift", {{"MasterRGBGain", 1.4}, {"MasterRGBLift", 0.05}}},
+/// Controls from "ID=value ID=value ...".
+Controls Parse(const std::string &text) {
+    Controls c;
+    for (size_t at = 0, eq; (eq = text.find('=', at)) != std::string::npos;) {
+        const size_t end = std::min(text.find(' ', eq), text.size());
+        c[text.substr(at, eq - at)] = std::stod(text.substr(eq + 1, end - eq - 1));
+        at = end + 1;
+    }
+    return c;
+}
+
+const std::pair<const char *, const char *> kSettings[] = {
+    {"master gain and lift", "MasterRGBGain=1.4 MasterRGBLift=0.05"},
     {"master per channel, gamma after levels",
-     {{"MasterRedGain", 0.8},
-      {"MasterBlueGamma", 1.6},
-      {"MasterRGBContrast", 1.3},
-      {"MasterGreenBrightness", -0.05},
-      {"ProcessOrder", 1}}},
+     "MasterRedGain=0.8 MasterBlueGamma=1.6 MasterRGBContrast=1.3 MasterGreenBrightness=-0.05 ProcessOrder=1"},
     {"levels, gamma before levels",
-     {{"MasterRGBLow", 0.1},
-      {"MasterRGBHigh", 0.9},
-      {"MasterRGBMid", 1.4},
-      {"MasterRedOutputLow", 0.05},
-      {"MasterRGBOutputHigh", 0.8}}},
-    {"levels, gamma after levels",
-     {{"MasterRGBLow", 0.1},
-      {"MasterRGBHigh", 0.9},
-      {"MasterRGBMid", 1.4},
-      {"MasterRedOutputLow", 0.05},
-      {"MasterRGBOutputHigh", 0.8},
-      {"ProcessOrder", 1}}},
-    {"hue, saturation and tint, Better",
-     {{"WheelHue0", 30}, {"WheelSaturation0", 0.7}, {"WheelTintAngle0", 200}, {"WheelTintLength0", 0.1}}},
-    {"tint, Full", {{"WheelTintAngle0", 100}, {"WheelTintLength0", 0.15}, {"Saturation0", 1.3}, {"TintMode", 1}}},
-    {"tint, Fast", {{"WheelTintAngle0", 100}, {"WheelTintLength0", 0.15}, {"Hue0", -20}, {"TintMode", 0}}},
-    {"suppression", {{"Red0", 0.2}, {"Cyan0", 0.6}, {"SuppressionAngle0", 15}}},
-    {"ranges with master",
-     {{"MasterRGBGain", 1.1},
-      {"ShadowsRGBLift", 0.08},
-      {"MidTonesGreenGamma", 1.3},
-      {"HighlightsRGBGain", 0.8},
-      {"WheelTintLength1", 0.1},
-      {"WheelTintAngle1", 250},
-      {"Blue3", 0.3},
-      {"ProcessOrder", 1}}},
-    {"pre-divide with everything",
-     {{"PreDividePostMultiply", 1},
-      {"MasterRGBGamma", 0.8},
-      {"WheelHue2", 40},
-      {"Magenta0", 0.5},
-      {"HighlightsRedOutputHigh", 0.9},
-      {"ProcessOrder", 1}}},
+     "MasterRGBLow=0.1 MasterRGBHigh=0.9 MasterRGBMid=1.4 MasterRedOutputLow=0.05 MasterRGBOutputHigh=0.8"},
+    {"levels, gamma after levels", "MasterRGBLow=0.1 MasterRGBHigh=0.9 MasterRGBMid=1.4 MasterRedOutputLow=0.05 "
+                                   "MasterRGBOutputHigh=0.8 ProcessOrder=1"},
+    {"hue, saturation and tint, Better", "WheelHue0=30 WheelSaturation0=0.7 WheelTintAngle0=200 WheelTintLength0=0.1"},
+    {"tint, Full", "WheelTintAngle0=100 WheelTintLength0=0.15 Saturation0=1.3 TintMode=1"},
+    {"tint, Fast", "WheelTintAngle0=100 WheelTintLength0=0.15 Hue0=-20 TintMode=0"},
+    {"suppression", "Red0=0.2 Cyan0=0.6 SuppressionAngle0=15"},
+    {"ranges with master", "MasterRGBGain=1.1 ShadowsRGBLift=0.08 MidTonesGreenGamma=1.3 HighlightsRGBGain=0.8 "
+                           "WheelTintLength1=0.1 WheelTintAngle1=250 Blue3=0.3 ProcessOrder=1"},
+    {"pre-divide with everything", "PreDividePostMultiply=1 MasterRGBGamma=0.8 WheelHue2=40 Magenta0=0.5 "
+                                   "HighlightsRedOutputHigh=0.9 ProcessOrder=1"},
 };
 
 TEST_F(ColorCorrector, MatchesTheModelOfItsControlsAtEveryDepth) {
@@ -549,10 +346,11 @@ TEST_F(ColorCorrector, MatchesTheModelOfItsControlsAtEveryDepth) {
         {DepthRGBAFlt32, 0.0}, {DepthRGBAFlt16, 1.0 / 1024}, {DepthRGBAInt16, 0.5 / 65535}, {DepthRGBAInt8, 0.5 / 255}};
     for (const auto &[depth, storeTol] : depths) {
         Ref<Image> src = ts::PatternImage(37, 11, depth, 7);
-        for (const auto &[name, controls] : kSettings) {
+        for (const auto &[name, text] : kSettings) {
+            const Controls controls = Parse(text);
             Rig fresh(src);
             fresh.Set(controls);
-            const ToolModel model{controls};
+            const ToolModel model{controls, fresh.cc};
             Ref<Image> out = Render(fresh.cc);
             ASSERT_TRUE(out) << name;
             ASSERT_NE(out.Get(), src.Get()) << name;
@@ -582,20 +380,20 @@ TEST_F(ColorCorrector, MatchesTheModelOfItsControlsAtEveryDepth) {
 }
 
 TEST_F(ColorCorrector, NeutralPassesTheInputOnAndPreCalculationMakesNoPixels) {
-    const std::tuple<const char *, bool, Controls> cases[] = {
-        {"defaults", true, {}},
-        {"a passive control", true, {{"Menu", 2}, {"CorrectionRange", 3}, {"RangesChannel", 1}}},
-        {"gain within eps of 1", true, {{"ShadowsRGBGain", 1.0 + 5e-8}}},
-        {"suppression sliders at 1 but turned", true, {{"SuppressionAngle0", 40}}},
-        {"pre-divide alone", false, {{"PreDividePostMultiply", 1}}},
-        {"the range weights shown", false, {{"RenderOutputRange", 1}}},
-        {"a range's gain", false, {{"MidTonesRGBGain", 1.2}}},
+    const std::tuple<const char *, bool, const char *> cases[] = {
+        {"defaults", true, ""},
+        {"passive controls", true, "Menu=2 CorrectionRange=3 RangesChannel=1"},
+        {"gain within eps of 1", true, "ShadowsRGBGain=1.00000005"},
+        {"suppression sliders at 1 but turned", true, "SuppressionAngle0=40"},
+        {"pre-divide alone", false, "PreDividePostMultiply=1"},
+        {"the range weights shown", false, "RenderOutputRange=1"},
+        {"a range's gain", false, "MidTonesRGBGain=1.2"},
     };
     for (const auto &[name, passes, controls] : cases) {
         SCOPED_TRACE(name);
         Ref<Image> src = ts::PatternImage(8, 4, DepthRGBAFlt32);
         Rig rig(src);
-        rig.Set(controls);
+        rig.Set(Parse(controls));
         Ref<Image> shape = Render(rig.cc, nullptr, ReqFlagPreCalc);
         ASSERT_TRUE(shape && !shape->HasScanLineData());
         EXPECT_EQ(shape->DataWindow(), ImgRectI(0, 0, 8, 4));
@@ -653,14 +451,14 @@ void ExpectSameBits(const Image &a, const Image &b, const ImgRectI &r) {
 TEST_F(ColorCorrector, CanvasRegionsAndThreadCountLeaveTheResultAlone) {
     const ImgRectI inWindow(8, 4, 40, 28);
     const FltPixel canvas{0.2f, 0.4f, 0.6f, 0.8f};
-    const Controls &controls = kSettings[std::size(kSettings) - 2].second; // ranges with master
+    const Controls controls = Parse(kSettings[std::size(kSettings) - 2].second); // ranges with master
     const int before = WorkerCount();
     for (int depth : {DepthRGBAFlt32, DepthRGBAFlt16, DepthRGBAInt16, DepthRGBAInt8}) {
         SCOPED_TRACE(depth);
         Ref<Image> src = ts::WindowedImage(48, 32, inWindow, canvas, 3, depth);
         Rig rig(src);
         rig.Set(controls);
-        const ToolModel model{controls};
+        const ToolModel model{controls, rig.cc};
         SetWorkerCount(1);
         Ref<Image> one = Render(rig.cc);
         SetWorkerCount(std::max(2, before));
@@ -719,7 +517,7 @@ TEST_F(ColorCorrector, RangeCurvesAndPresetsSurviveASavedDocument) {
     EXPECT_TRUE(back->FindInput("ColorRanges")->Constant()->Equals(*custom));
     EXPECT_EQ(SaveDocument(*again), text);
 
-    // A malformed curve is a document problem, not a crash; the input keeps its default.
+    // A malformed curve is reported as a document problem, not taken.
     std::string broken = text;
     const size_t at = broken.find("Points");
     ASSERT_NE(at, std::string::npos);
