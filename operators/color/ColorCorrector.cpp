@@ -163,21 +163,26 @@ bool SuppressionIsNeutral(const double *sliders) {
 /// integer values are worked on as 0..1 and rounded back on store).
 void CorrectSpan(const PixelSettings &s, bool rangeOutput, int shown, int depth, const uint8_t *src, uint8_t *dst,
                  int count) {
-    constexpr int kBlock = 256;
     const int bpp = FormatOfDepth(depth).BytesPerPixel();
-    FltPixel block[kBlock];
+    FltPixel loaded[kBlock];
+    float block[kBlock][4];
     for (int i = 0; i < count; i += kBlock) {
         const int n = std::min(kBlock, count - i);
-        LoadFlt(depth, src + static_cast<size_t>(i) * bpp, n, block);
-        for (int k = 0; k < n; ++k) {
-            float p[4] = {block[k].R, block[k].G, block[k].B, block[k].A};
-            if (rangeOutput)
-                RangeOutput(s, shown, p);
-            else
-                CorrectPixel(s, p);
-            block[k] = {p[0], p[1], p[2], p[3]};
+        const uint8_t *in = src + static_cast<size_t>(i) * bpp;
+        uint8_t *out = dst + static_cast<size_t>(i) * bpp;
+        if (depth == DepthRGBAFlt32 && !rangeOutput) { // worked on in the output row itself
+            if (in != out) std::memcpy(out, in, static_cast<size_t>(n) * bpp);
+            CorrectBlock(s, reinterpret_cast<float(*)[4]>(out), n);
+            continue;
         }
-        StoreFlt(depth, block, n, dst + static_cast<size_t>(i) * bpp);
+        LoadFlt(depth, in, n, loaded);
+        for (int k = 0; k < n; ++k) {
+            block[k][0] = loaded[k].R, block[k][1] = loaded[k].G, block[k][2] = loaded[k].B, block[k][3] = loaded[k].A;
+            if (rangeOutput) RangeOutput(s, shown, block[k]);
+        }
+        if (!rangeOutput) CorrectBlock(s, block, n);
+        for (int k = 0; k < n; ++k) loaded[k] = {block[k][0], block[k][1], block[k][2], block[k][3]};
+        StoreFlt(depth, loaded, n, out);
     }
 }
 

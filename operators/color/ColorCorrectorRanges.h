@@ -16,10 +16,12 @@
 // of colours by hue.
 //
 // Thread safety: everything here is read-only once Process has filled it.
+#include <algorithm>
 #include <cmath>
 #include <cstdint>
 
 #include "host/color/ColorCurvesTable.h"
+#include "host/color/FastPow.h"
 
 namespace Orvane::cc {
 
@@ -59,12 +61,6 @@ struct PixelSettings {
     const ColorCurvesTable *curves = nullptr; ///< needed when rangesInUse
 };
 
-/// x to the power e with the sign kept; e exactly 1 leaves x alone.
-inline float SignedPow(float x, float e) {
-    if (e == 1.f) return x;
-    return x < 0.f ? -std::pow(-x, e) : std::pow(x, e);
-}
-
 /// Hue of R, G, B in 0..1 (0 for grey), as the suppression table reads it.
 inline float HueOf(float r, float g, float b) {
     const float mx = std::fmax(r, std::fmax(g, b)), mn = std::fmin(r, std::fmin(g, b));
@@ -75,29 +71,45 @@ inline float HueOf(float r, float g, float b) {
     return h < 0.f ? h + 1.f : h;
 }
 
-/// One record's range function on p (RGBA) with luminance L, into out.
-inline void RangeFunction(const PixelSettings &s, const RangeRecord &r, float L, const float p[4], float out[4]) {
-    float c[3] = {p[0], p[1], p[2]};
-    out[3] = p[3];
-    if (r.doMatrix) {
-        if (s.tintMode == TintFast || (L >= 0.f && L <= 1.f)) {
-            (L < 0.5f ? r.low : r.high).Apply(p, c);
-        } else {
-            float y[3], z[3];
-            s.toLumaFirst.Apply(p, y);
-            const float luma = y[0];
-            const bool below = L < 0.f;
-            y[0] = below ? std::fmax(y[0], 0.f) : std::fmin(y[0], 1.f);
-            (below ? r.belowBlack : r.aboveWhite).Apply(y, z);
-            z[0] = luma;
-            s.fromLumaFirst.Apply(z, c);
+/// Pixels the block functions below take at a time at most.
+constexpr int kBlock = 256;
+
+/// One record's range function on n pixels p (RGBA) with luminances L, into
+/// out (which may be p itself). Stage by stage over the block, each flag
+/// tested once, so the multiply-add stages compile to vector operations.
+inline void RangeBlock(const PixelSettings &s, const RangeRecord &r, const float *L, const float (*p)[4],
+                       float (*out)[4], int n) {
+    if (out != p)
+        for (int k = 0; k < n; ++k)
+            for (int i = 0; i < 4; ++i) out[k][i] = p[k][i];
+    if (r.doMatrix)
+        for (int k = 0; k < n; ++k) {
+            const float in[3] = {out[k][0], out[k][1], out[k][2]};
+            if (s.tintMode == TintFast || (L[k] >= 0.f && L[k] <= 1.f)) {
+                (L[k] < 0.5f ? r.low : r.high).Apply(in, out[k]);
+            } else {
+                float y[3], z[3];
+                s.toLumaFirst.Apply(in, y);
+                const float luma = y[0];
+                const bool below = L[k] < 0.f;
+                y[0] = below ? std::fmax(y[0], 0.f) : std::fmin(y[0], 1.f);
+                (below ? r.belowBlack : r.aboveWhite).Apply(y, z);
+                z[0] = luma;
+                s.fromLumaFirst.Apply(z, out[k]);
+            }
         }
-    }
-    auto levels = [&c](const float *mul, const float *add) {
-        for (int i = 0; i < 3; ++i) c[i] = c[i] * mul[i] + add[i];
+    auto levels = [out, n](const float *mul, const float *add) {
+        for (int k = 0; k < n; ++k)
+            for (int i = 0; i < 3; ++i) out[k][i] = out[k][i] * mul[i] + add[i];
     };
-    auto gamma = [&c, &r] {
-        for (int i = 0; i < 3; ++i) c[i] = SignedPow(c[i], r.gamma[i]);
+    auto gamma = [out, n, &r] { // a true power with the sign kept, one channel's values at a time
+        float plane[kBlock];
+        for (int i = 0; i < 3; ++i) {
+            if (r.gamma[i] == 1.f) continue;
+            for (int k = 0; k < n; ++k) plane[k] = out[k][i];
+            PowAbsSigned(plane, r.gamma[i], plane, n);
+            for (int k = 0; k < n; ++k) out[k][i] = plane[k];
+        }
     };
     if (s.gammaAfterLevels) {
         if (r.doLevels1) levels(r.mul1, r.add1);
@@ -107,16 +119,22 @@ inline void RangeFunction(const PixelSettings &s, const RangeRecord &r, float L,
         if (r.doGamma) gamma();
         if (r.doLevels1) levels(r.mul1, r.add1);
     }
-    if (const Suppression *t = r.suppression) {
-        int i = static_cast<int>(Suppression::kSamples * HueOf(c[0], c[1], c[2]));
-        i = i < 0 ? 0 : i >= Suppression::kSamples ? Suppression::kSamples - 1 : i;
-        const float f = t->factor[i];
-        if (std::fabs(f - 1.f) > 1e-6f) {
-            const float d = (t->wR * c[0] + t->wG * c[1] + t->wB * c[2] + t->offset) * (1.f - f);
-            for (float &x : c) x = x * f + d;
+    if (const Suppression *t = r.suppression)
+        for (int k = 0; k < n; ++k) {
+            float *c = out[k];
+            int i = static_cast<int>(Suppression::kSamples * HueOf(c[0], c[1], c[2]));
+            i = i < 0 ? 0 : i >= Suppression::kSamples ? Suppression::kSamples - 1 : i;
+            const float f = t->factor[i];
+            if (std::fabs(f - 1.f) > 1e-6f) {
+                const float d = (t->wR * c[0] + t->wG * c[1] + t->wB * c[2] + t->offset) * (1.f - f);
+                for (int j = 0; j < 3; ++j) c[j] = c[j] * f + d;
+            }
         }
-    }
-    out[0] = c[0], out[1] = c[1], out[2] = c[2];
+}
+
+/// The range function of one pixel.
+inline void RangeFunction(const PixelSettings &s, const RangeRecord &r, float L, const float p[4], float out[4]) {
+    RangeBlock(s, r, &L, reinterpret_cast<const float(*)[4]>(p), reinterpret_cast<float(*)[4]>(out), 1);
 }
 
 /// Step 1: R, G, B over alpha, or 0 where alpha is exactly 0.
@@ -129,28 +147,36 @@ inline void PreDivide(float p[4]) {
 
 inline float LumaOf(const float p[4]) { return 0.299f * p[0] + 0.587f * p[1] + 0.114f * p[2]; }
 
-/// The whole correction of one pixel, in place.
-inline void CorrectPixel(const PixelSettings &s, float p[4]) {
-    if (s.preDivide) PreDivide(p);
-    const float L = s.rangesInUse || s.records[0].doMatrix ? LumaOf(p) : 0.f;
-    float out[4];
+/// The whole correction of up to kBlock pixels, in place.
+inline void CorrectBlock(const PixelSettings &s, float (*p)[4], int n) {
+    if (s.preDivide)
+        for (int k = 0; k < n; ++k) PreDivide(p[k]);
+    float L[kBlock];
+    if (s.rangesInUse || s.records[0].doMatrix)
+        for (int k = 0; k < n; ++k) L[k] = LumaOf(p[k]);
+    else
+        std::fill(L, L + n, 0.f);
     if (!s.rangesInUse) {
-        RangeFunction(s, s.records[0], L, p, out);
+        RangeBlock(s, s.records[0], L, p, p, n);
     } else {
-        float w[3], part[4];
-        s.curves->WeightsAt(L, w[0], w[1], w[2]);
-        out[0] = out[1] = out[2] = out[3] = 0.f;
-        for (int k = 0; k < 3; ++k) {
-            RangeFunction(s, s.records[k], L, p, part);
-            for (int i = 0; i < 4; ++i) out[i] += w[k] * part[i];
+        float sum[kBlock][4] = {}, part[kBlock][4], w[kBlock][3];
+        for (int k = 0; k < n; ++k) s.curves->WeightsAt(L[k], w[k][0], w[k][1], w[k][2]);
+        for (int r = 0; r < 3; ++r) {
+            RangeBlock(s, s.records[r], L, p, part, n);
+            for (int k = 0; k < n; ++k)
+                for (int i = 0; i < 4; ++i) sum[k][i] += w[k][r] * part[k][i];
         }
+        std::copy(&sum[0][0], &sum[0][0] + 4 * n, &p[0][0]);
     }
-    if (s.postMultiply) {
-        const float a = out[3] > -1e-6f && out[3] < 1e-6f ? 0.f : out[3];
-        for (int i = 0; i < 3; ++i) out[i] *= a;
-    }
-    for (int i = 0; i < 4; ++i) p[i] = out[i];
+    if (s.postMultiply)
+        for (int k = 0; k < n; ++k) {
+            const float a = p[k][3] > -1e-6f && p[k][3] < 1e-6f ? 0.f : p[k][3];
+            for (int i = 0; i < 3; ++i) p[k][i] *= a;
+        }
 }
+
+/// The whole correction of one pixel, in place.
+inline void CorrectPixel(const PixelSettings &s, float p[4]) { CorrectBlock(s, reinterpret_cast<float(*)[4]>(p), 1); }
 
 /// Which weight RangeOutput shows.
 enum RangeShown { ShowResult = 0, ShowShadows = 1, ShowMidtones = 2, ShowHighlights = 3 };
