@@ -63,6 +63,10 @@ public:
         shadows = table_[i][0], midtones = table_[i][1], highlights = table_[i][2];
     }
 
+    /// Sample i (0..kSamples-1, at luminance i / (kSamples - 1)): shadows,
+    /// midtones, highlights; for device copies of the table.
+    const float *Sample(int i) const { return table_[i]; }
+
     OvID DataType() const override;
     ScriptVal ToScript() const override;
     bool Equals(const Parameter &other) const override;

@@ -2,7 +2,9 @@
 
 #include <algorithm>
 #include <cmath>
+#include <cstddef>
 #include <cstring>
+#include <memory>
 #include <string>
 
 #include "host/color/ColorCurvesTable.h"
@@ -12,7 +14,10 @@
 #include "host/flow/PointRows.h"
 #include "host/flow/Request.h"
 #include "host/image/Image.h"
+#include "host/image/NewImage.h"
 #include "host/image/PixelConvert.h"
+#include "host/krom/KROMComputeNode.h"
+#include "host/krom/kernels/ColorKernelParams.h"
 #include "operators/frame/Registration.h"
 
 namespace Orvane {
@@ -547,6 +552,84 @@ void ColorCorrector::Fold(const Controls &c, PixelSettings &s, std::vector<Suppr
     }
 }
 
+// ---- the device ----
+
+bool ColorCorrector::RunDevice(Request *req, const Image *src, Image *dst, bool rangeOutput, int shown) {
+    const PixelSettings &s = settings_;
+    const bool hasPixels = src->HasScanLineData() || src->IsGPUMemDirty();
+    const ImgRectI in = hasPixels ? src->DataWindow() : ImgRectI(), out = dst->DataWindow();
+    const int srcWindow[4] = {in.x0, in.x1, in.y0, in.y1}, dstWindow[4] = {out.x0, out.x1, out.y0, out.y1};
+    const FltPixel canvas = dst->GetCanvasColor(); // already through the pixel function
+    const float canvasColor[4] = {canvas.R, canvas.G, canvas.B, canvas.A};
+    constexpr int kWidth = ColorCurvesTable::kSamples;
+
+    // The tables as a small float image: suppression factors by record in rows
+    // 0..2, the range weights (and the desaturation weights) in the last row.
+    const int rows = rangeOutput ? 1 : 4;
+    Ref<Image> tables = NewImageTagList({{ImgWidth, kWidth}, {ImgHeight, rows}, {ImgDepth, DepthRGBAFlt32}});
+    if (!tables || !tables->AllocScanLineData()) return false;
+    for (int y = 0; y < rows; ++y) std::fill_n(tables->Row<float>(y), 4 * kWidth, 0.f);
+    float *weights = tables->Row<float>(rows - 1);
+    if (s.curves)
+        for (int i = 0; i < kWidth; ++i) std::copy_n(s.curves->Sample(i), 3, weights + 4 * i);
+
+    if (rangeOutput) {
+        auto block = std::make_shared<CCProcessRangeParams>();
+        CCProcessRangeParams &p = *block;
+        std::memcpy(p.defaultP, canvasColor, sizeof canvasColor);
+        p.channel = 0, p.selected = shown, p.sampleCount = kWidth, p.invSampleHeight = 1.f, p.sampleWidth = kWidth;
+        p.preDivide = s.preDivide;
+        std::memcpy(p.srcWindow, srcWindow, sizeof srcWindow);
+        std::memcpy(p.dstWindow, dstWindow, sizeof dstWindow);
+        p.workSize[0] = out.Width(), p.workSize[1] = out.Height();
+        return KROMComputeNode::ExecKernelI(
+            req, "CCProcessRange", nullptr, CCProcessRangeParamsText, sizeof p,
+            offsetof(CCProcessRangeParams, srcCompOrder), offsetof(CCProcessRangeParams, dstCompOrder), block,
+            {{"input", const_cast<Image *>(src)}, {"tables", tables.Get()}, {"output", dst}});
+    }
+
+    auto block = std::make_shared<CCProcessPixelParams>();
+    CCProcessPixelParams &p = *block;
+    std::memcpy(p.processCanvasColor, canvasColor, sizeof canvasColor);
+    auto putMatrix = [&p](int slot, const Matrix34 &m) { std::memcpy(p.colorMat + 12 * slot, m.m, sizeof m.m); };
+    bool suppression = false;
+    p.doFlag = 0;
+    for (int r = 0; r < 3; ++r) {
+        const RangeRecord &rec = s.records[r];
+        const Matrix34 *mats[4] = {&rec.low, &rec.high, &rec.belowBlack, &rec.aboveWhite};
+        for (int k = 0; k < 4; ++k) putMatrix(4 * r + k, *mats[k]);
+        float *levels = p.colorMatSimple + 16 * r;
+        for (int i = 0; i < 3; ++i) {
+            p.gamma[4 * r + i] = rec.gamma[i];
+            levels[i] = rec.mul1[i], levels[4 + i] = rec.add1[i];
+            levels[8 + i] = rec.mul2[i], levels[12 + i] = rec.add2[i];
+        }
+        p.gamma[4 * r + 3] = 1.f, levels[3] = levels[11] = 1.f, levels[7] = levels[15] = 0.f;
+        p.doFlag |= (rec.doMatrix | rec.doGamma << 1 | rec.doLevels1 << 2 | rec.doLevels2 << 3) << (4 * r);
+        p.hasSuppressionTable[r] = rec.suppression != nullptr;
+        p.sampleCount[r] = Suppression::kSamples;
+        if (const Suppression *t = rec.suppression) {
+            suppression = true;
+            float *row = tables->Row<float>(r);
+            for (int i = 0; i < Suppression::kSamples; ++i) row[4 * i] = t->factor[i];
+            const float w[4] = {t->wR, t->wG, t->wB, t->offset};
+            for (int i = 0; i < 4; ++i) weights[4 * i + 3] = w[i];
+        }
+    }
+    putMatrix(12, s.toLumaFirst);
+    putMatrix(13, s.fromLumaFirst);
+    p.orderTintChannel = s.gammaAfterLevels | s.tintMode << 1 | s.rangesInUse << 3;
+    p.prePost = s.preDivide | s.postMultiply << 1;
+    p.sampleCount[3] = kWidth, p.invSampleHeight = 0.25f, p.sampleWidth = kWidth;
+    std::memcpy(p.srcWindow, srcWindow, sizeof srcWindow);
+    std::memcpy(p.dstWindow, dstWindow, sizeof dstWindow);
+    p.workSize[0] = out.Width(), p.workSize[1] = out.Height();
+    return KROMComputeNode::ExecKernelI(
+        req, suppression ? "CCProcessPixel" : "CCProcessPixelSimple", nullptr, CCProcessPixelParamsText, sizeof p,
+        offsetof(CCProcessPixelParams, srcCompOrder), offsetof(CCProcessPixelParams, dstCompOrder), block,
+        {{"input", const_cast<Image *>(src)}, {"tables", tables.Get()}, {"output", dst}});
+}
+
 // ---- a frame ----
 
 void ColorCorrector::Process(Request *req) {
@@ -607,7 +690,9 @@ void ColorCorrector::Process(Request *req) {
         dst->SetCanvasColor(canvas);
     }
 
-    if (!req->IsPreCalc() && !dst->ValidWindow().IsNull()) {
+    const bool rowsWanted = !req->IsPreCalc() && !dst->ValidWindow().IsNull();
+    const bool onDevice = rowsWanted && IsGPUEnabled(req, true) && RunDevice(req, src, dst.Get(), rangeOutput, shown);
+    if (rowsWanted && !onDevice) {
         if (!src->DownloadGPUMem() || !dst->AllocScanLineData()) return outOfMemory();
         const PointRows rows(*src, *dst, canvasPixel);
         DoMultiProcess(

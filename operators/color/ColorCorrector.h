@@ -15,6 +15,10 @@
 // (Colors, Levels, Histogram, Suppress) for the range and channel chosen
 // above it, a Ranges page with the curves, and an Options page.
 //
+// When the render has a device, the kernels "CCProcessPixel" (with
+// suppression), "CCProcessPixelSimple" (without) or "CCProcessRange" of the
+// common library run first, and the rows only if they fail.
+//
 // Not built yet: the histogram modes (Equalize, Match); a HistogramType other
 // than Keep fails the render with a console line saying so.
 //
@@ -26,6 +30,8 @@
 #include "operators/color/ColorCorrectorRanges.h"
 
 namespace Orvane {
+
+class Image;
 
 class ColorCorrector : public ThreadedOperator {
 public:
@@ -64,6 +70,8 @@ private:
     void UpdateVisibility();
     void ResetGroup(int group);
     Controls ReadControls(Request *req) const;
+    /// The kernels "CCProcessPixel" / "CCProcessPixelSimple" / "CCProcessRange"; false when they did not run.
+    bool RunDevice(Request *req, const Image *src, Image *dst, bool rangeOutput, int shown);
 
     Input *attr_[kRanges][kChannels][kAttributes];
     Input *wheel_[kRanges][4], *hue_[kRanges], *saturation_[kRanges];

@@ -16,9 +16,11 @@
 #include "host/core/Tags.h"
 #include "host/flow/DocumentIO.h"
 #include "host/flow/Link.h"
+#include "host/flow/RenderTask.h"
 #include "host/flow/Request.h"
 #include "host/image/NewImage.h"
 #include "operators/color/ColorCorrectorRanges.h"
+#include "tests/host/krom/DeviceTestSupport.h"
 #include "tests/support/TestSupport.h"
 
 namespace Orvane::cctest {
@@ -525,6 +527,45 @@ TEST_F(ColorCorrector, RangeCurvesAndPresetsSurviveASavedDocument) {
     Ref<OrvaneDoc> bad = MakeRef<OrvaneDoc>();
     const DocumentLoadResult refused = LoadDocument(broken, *bad);
     EXPECT_FALSE(refused.ok && refused.warnings.empty());
+}
+
+TEST_F(ColorCorrector, DeviceMatchesTheRows) {
+    ORVANE_NEED_OPENCL(ctx);
+    // Float results agree to the rounding of the power (the device's powf against the rows' vectorised power);
+    // stored depths to their step.
+    const std::pair<int, double> depths[] = {
+        {DepthRGBAFlt32, 2e-5}, {DepthRGBAFlt16, 1e-3}, {DepthRGBAInt16, 1.01 / 65535}, {DepthRGBAInt8, 1.01 / 255}};
+    std::vector<std::pair<const char *, std::string>> cases(std::begin(kSettings), std::end(kSettings));
+    cases.emplace_back("range weights shown", "RenderOutputRange=1 RangesRange=2 PreDividePostMultiply=1");
+    const ImgRectI dw(-3, 5, 50, 38), roi(12, 2, 61, 33);
+    for (const auto &[depth, tol] : depths) {
+        Ref<Image> src = ts::PatternImage(64, 40, depth, 5)->CopyOfImageTagList({{ImgDataWindow, &dw}});
+        src->SetCanvasColor(FltPixel{0.2f, -0.1f, 0.6f, 0.5f});
+        for (const auto &[name, text] : cases) {
+            SCOPED_TRACE(std::string(name) + ", depth " + std::to_string(depth));
+            Rig rig(src);
+            rig.Set(Parse(text));
+            Ref<Image> cpu = Render(rig.cc, &roi);
+            RenderTask task;
+            task.SetDevice(ctx);
+            EvalOptions opt;
+            opt.task = &task, opt.useCache = false, opt.roi = ImageDomain(roi);
+            const int launches = ctx->LaunchCount();
+            Ref<Image> dev = ts::EvalImage(rig.cc, 0.0, opt);
+            ASSERT_TRUE(cpu && dev);
+            EXPECT_GT(ctx->LaunchCount(), launches) << "the device ran";
+            EXPECT_TRUE(task.DeviceLog().empty()) << task.DeviceLog().front();
+            ASSERT_EQ(dev->DataWindow(), cpu->DataWindow());
+            EXPECT_EQ(dev->GetCanvasColor(), cpu->GetCanvasColor());
+            const ImgRectI w = cpu->DataWindow();
+            for (int y = w.y0; y < w.y1; ++y)
+                for (int x = w.x0; x < w.x1; ++x) {
+                    const Px a = ToPx(dev->GetFlt(x, y)), b = ToPx(cpu->GetFlt(x, y));
+                    for (int c = 0; c < 4; ++c)
+                        ASSERT_NEAR(a[c], b[c], tol * std::max(1.0, std::fabs(b[c]))) << x << "," << y << " ch " << c;
+                }
+        }
+    }
 }
 
 } // namespace
