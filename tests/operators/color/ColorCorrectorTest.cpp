@@ -529,6 +529,35 @@ TEST_F(ColorCorrector, RangeCurvesAndPresetsSurviveASavedDocument) {
     EXPECT_FALSE(refused.ok && refused.warnings.empty());
 }
 
+TEST_F(ColorCorrector, MenuShowsOneGroupForTheChosenRangeAndResetsClearOnlyTheirGroup) {
+    OrvaneDoc doc;
+    Operator *cc = doc.AddTool(OvID("ColorCorrector"));
+    ASSERT_TRUE(cc);
+    auto visible = [cc](const char *id) { return cc->FindInput(id)->IsVisible(); };
+    // Menu, range, channel; an input of each group for that choice is shown, the others are not.
+    const std::tuple<int, int, int, const char *> choices[] = {{0, 0, 0, "MasterRGBGain"},
+                                                               {0, 2, 3, "MidTonesBlueLift"},
+                                                               {1, 3, 1, "HighlightsRedOutputHigh"},
+                                                               {2, 1, 0, "HistogramType"},
+                                                               {3, 1, 2, "Magenta1"}};
+    for (const auto &[menu, range, channel, shown] : choices) {
+        ts::SetNumbers(cc, {{"Menu", menu}, {"CorrectionRange", range}, {"Channel", channel}});
+        int count = 0;
+        for (const auto &[m, r, ch, id] : choices) count += visible(id);
+        EXPECT_TRUE(visible(shown)) << shown;
+        EXPECT_EQ(count, 1) << shown;
+    }
+    ts::SetNumbers(cc, {{"MasterRGBGain", 2}, {"MasterRGBLow", 0.2}, {"Red0", 0.5}, {"WheelHue3", 10}});
+    cc->FindInput("ResetAllColorChanges")->SetValue(MakeRef<Number>(1.0));
+    auto value = [cc](const char *id) { return dynamic_cast<const Number &>(*cc->FindInput(id)->Constant()).value; };
+    EXPECT_EQ(value("MasterRGBGain"), 1.0);
+    EXPECT_EQ(value("WheelHue3"), 0.0);
+    EXPECT_EQ(value("MasterRGBLow"), 0.2) << "levels are not colours";
+    EXPECT_EQ(value("Red0"), 0.5);
+    cc->FindInput("ResetAllSuppression")->SetValue(MakeRef<Number>(1.0));
+    EXPECT_EQ(value("Red0"), 1.0);
+}
+
 TEST_F(ColorCorrector, DeviceMatchesTheRows) {
     ORVANE_NEED_OPENCL(ctx);
     // Float results agree to the rounding of the power (the device's powf against the rows' vectorised power);
