@@ -63,7 +63,7 @@ struct PixelSettings {
 
 /// Hue of R, G, B in 0..1 (0 for grey), as the suppression table reads it.
 inline float HueOf(float r, float g, float b) {
-    const float mx = std::fmax(r, std::fmax(g, b)), mn = std::fmin(r, std::fmin(g, b));
+    const float mx = r > g ? (r > b ? r : b) : (g > b ? g : b), mn = r < g ? (r < b ? r : b) : (g < b ? g : b);
     if (mx == mn) return 0.f;
     const float d = mx - mn;
     float h = mx == r ? (g - b) / d : mx == g ? (b - r) / d + 2.f : (r - g) / d + 4.f;
