@@ -15,15 +15,7 @@ namespace {
 void RunTool(benchmark::State &state, const std::vector<std::pair<const char *, double>> &settings) {
     if (!LoadLibrary(state)) return;
     OrvaneDoc doc;
-    Output *source = AddFrameSource(doc);
-    Operator *cc = doc.AddTool(OvID("ColorCorrector"));
-    if (!source || !cc) {
-        state.SkipWithError("cannot make the tools");
-        return;
-    }
-    cc->FindInput("Input")->ConnectTo(source);
-    for (const auto &[id, value] : settings) cc->FindInput(id)->SetValue(MakeRef<Number>(value));
-    RenderLoop(state, cc);
+    if (Operator *tool = AddToolOnFrame(state, doc, "ColorCorrector", settings)) RenderLoop(state, tool);
 }
 
 void BM_ColorCorrector_MasterGain(benchmark::State &state) { RunTool(state, {{"MasterRGBGain", 1.2}}); }

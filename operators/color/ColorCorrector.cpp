@@ -13,6 +13,7 @@
 #include "host/flow/Link.h"
 #include "host/flow/PointRows.h"
 #include "host/flow/Request.h"
+#include "host/image/ColorMatrix.h"
 #include "host/image/Image.h"
 #include "host/image/NewImage.h"
 #include "host/image/PixelConvert.h"
@@ -672,6 +673,29 @@ void ColorCorrector::Process(Request *req) {
         req->SetOutputData(output_, nullptr);
     };
     if (!dst) return outOfMemory();
+
+    // Master levels alone (no colour, gamma, suppression, ranges or
+    // pre-divide) are linear: one colour matrix, applied by the host.
+    const RangeRecord &first = s.records[0];
+    if (!rangeOutput && !s.rangesInUse && !s.preDivide && !first.doMatrix && !first.doGamma && !first.suppression) {
+        ColorMatrixFull full;
+        for (int i = 0; i < 3; ++i) {
+            if (first.doLevels1) full.Scale(i, first.mul1[i]).Offset(i, first.add1[i]);
+            if (first.doLevels2 && s.gammaAfterLevels) full.Scale(i, first.mul2[i]).Offset(i, first.add2[i]);
+        }
+        const ColorMatrix m(full); // alpha passes
+        const bool precalc = req->IsPreCalc();
+        if (!ApplyMatrixTagList(src, dst.Get(),
+                                {{MtxColorMatrix, &m},
+                                 {WorkOperator, this},
+                                 {WorkThreaded, 1},
+                                 {WorkUseGPU, !precalc && IsGPUEnabled(req, false)},
+                                 {WorkRequest, req}}))
+            return outOfMemory();
+        if (clipping != ClippingMode_None) dst->CopyCanvasColor(src);
+        req->SetOutputData(output_, dst.Get());
+        return;
+    }
 
     // The canvas colour through the same function, stored once for the spans
     // beyond the input's window.

@@ -6,9 +6,11 @@
 // ranges are weighted by editable curves over luminance (ColorCurvesTable).
 //
 // Process folds every control into three range records
-// (ColorCorrectorRanges.h) and runs one pixel function over the rows
-// (PointRows.h), the canvas colour once through the same function. With all
-// controls neutral the input is handed on. With "Output the range you see now
+// (ColorCorrectorRanges.h). With all controls neutral the input is handed on;
+// when only Master's levels, gain, lift, contrast and brightness are set the
+// correction is linear and goes to the host as one colour matrix; otherwise
+// one pixel function runs over the rows (PointRows.h), the canvas colour once
+// through the same function. With "Output the range you see now
 // as final render" the result is the chosen range's weight instead.
 //
 // The panel: a Correction page whose Menu shows one group of controls
