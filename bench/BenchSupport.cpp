@@ -83,6 +83,18 @@ Output *AddFrameSource(OrvaneDoc &doc) {
     return source ? source->Out() : nullptr;
 }
 
+Operator *AddToolOnFrame(benchmark::State &state, OrvaneDoc &doc, const char *classId,
+                         const std::vector<std::pair<const char *, double>> &numbers) {
+    Output *source = AddFrameSource(doc);
+    Operator *tool = doc.AddTool(OvID(classId));
+    if (!source || !tool || !tool->FindInput("Input")->ConnectTo(source)) {
+        state.SkipWithError("cannot make the tools");
+        return nullptr;
+    }
+    for (const auto &[id, value] : numbers) tool->FindInput(id)->SetValue(MakeRef<Number>(value));
+    return tool;
+}
+
 void ReportPixels(benchmark::State &state) {
     state.counters["pixels/s"] =
         benchmark::Counter(static_cast<double>(kWidth) * kHeight, benchmark::Counter::kIsIterationInvariantRate);

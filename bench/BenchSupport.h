@@ -1,6 +1,9 @@
 #pragma once
 // Shared pieces of the benchmarks: the UHD test frame, a tool that hands it
 // on, loading the tool library, and the pixels/s counter.
+#include <utility>
+#include <vector>
+
 #include <benchmark/benchmark.h>
 
 #include "host/flow/Operator.h"
@@ -19,6 +22,11 @@ bool LoadLibrary(benchmark::State &state);
 
 /// Adds a tool that outputs UhdFrame() (its windows only in pre-calculation).
 Output *AddFrameSource(OrvaneDoc &doc);
+
+/// Adds a tool of class `classId` reading the frame, with the number inputs
+/// `numbers` set; null, with the benchmark marked skipped, when it cannot.
+Operator *AddToolOnFrame(benchmark::State &state, OrvaneDoc &doc, const char *classId,
+                         const std::vector<std::pair<const char *, double>> &numbers);
 
 /// Reports pixels per second for a UHD frame per iteration.
 void ReportPixels(benchmark::State &state);

@@ -15,15 +15,7 @@ namespace {
 void RunTool(benchmark::State &state, const std::vector<std::pair<const char *, double>> &settings) {
     if (!LoadLibrary(state)) return;
     OrvaneDoc doc;
-    Output *source = AddFrameSource(doc);
-    Operator *bc = doc.AddTool(OvID("BrightnessContrast"));
-    if (!source || !bc) {
-        state.SkipWithError("cannot make the tools");
-        return;
-    }
-    bc->FindInput("Input")->ConnectTo(source);
-    for (const auto &[id, value] : settings) bc->FindInput(id)->SetValue(MakeRef<Number>(value));
-    RenderLoop(state, bc);
+    if (Operator *tool = AddToolOnFrame(state, doc, "BrightnessContrast", settings)) RenderLoop(state, tool);
 }
 
 void BM_BrightnessContrast_Matrix(benchmark::State &state) { RunTool(state, {{"Gain", 1.2}, {"Brightness", 0.1}}); }

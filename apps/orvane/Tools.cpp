@@ -183,15 +183,21 @@ void PrintInput(const InputLine &in) {
     fmt::print("{}\n", list);
 }
 
-/// Calls `onPage` with a page's name where a new page begins, then `onInput` for each input, in order.
-template <class OnPage, class OnInput> void ForEachInputByPage(const Operator &op, OnPage onPage, OnInput onInput) {
+/// Calls `onPage` with a page's name and tab icon ("" for none) where a new page begins, `onNest` with the caption of
+/// each fold of controls where it begins, then `onInput` for each input, in order.
+template <class OnPage, class OnNest, class OnInput>
+void ForEachInputByPage(const Operator &op, OnPage onPage, OnNest onNest, OnInput onInput) {
     int page = -2;
     for (const auto &in : op.Inputs()) {
         if (in->Page() != page) {
             page = in->Page();
             const auto &pages = op.Pages();
-            onPage(page >= 0 && page < static_cast<int>(pages.size()) ? pages[page].name : std::string("Controls"));
+            const bool known = page >= 0 && page < static_cast<int>(pages.size());
+            const char *icon = known ? pages[page].tags.GetPtrAs<const char>(PageIcon) : nullptr;
+            onPage(known ? pages[page].name : std::string("Controls"), std::string(icon ? icon : ""));
         }
+        for (const ControlNest &nest : op.Nests())
+            if (nest.firstInput == in->Index() && nest.endInput > nest.firstInput) onNest(nest.name);
         onInput(*in);
     }
 }
@@ -216,9 +222,12 @@ void PrintMarkdown(const Registry &row, const Operator *op) {
     if (!op) return;
     ForEachInputByPage(
         *op,
-        [](const std::string &page) {
-            fmt::print("\n## Page \"{}\"\n\n| ID | Label | Type | Details |\n|---|---|---|---|\n", page);
+        [](const std::string &page, const std::string &icon) {
+            fmt::print("\n## Page \"{}\"\n\n", page);
+            if (!icon.empty()) fmt::print("Tab icon: `{}`\n\n", icon);
+            fmt::print("| ID | Label | Type | Details |\n|---|---|---|---|\n");
         },
+        [](const std::string &nest) { fmt::print("| | **{}** | group | |\n", Cell(nest)); },
         [](const Input &in) {
             const InputLine line = DescribeInput(in);
             std::string details = line.details;
@@ -316,7 +325,11 @@ int RunDescribe(const std::vector<std::string> &args) {
     fmt::print("  {:<14} {}\n", "built:", BuiltWord(row));
     if (!op) return ExitOk;
     ForEachInputByPage(
-        *op, [](const std::string &page) { fmt::print("\npage \"{}\"\n", page); },
+        *op,
+        [](const std::string &page, const std::string &icon) {
+            fmt::print("\npage \"{}\"{}\n", page, icon.empty() ? std::string() : " (tab icon " + icon + ")");
+        },
+        [](const std::string &nest) { fmt::print("  group \"{}\"\n", nest); },
         [](const Input &in) { PrintInput(DescribeInput(in)); });
     fmt::print("\noutputs\n");
     for (const auto &out : op->Outputs()) fmt::print("  {:<28} {}\n", out->ID().Text(), TypeWord(out->DataType()));

@@ -5,6 +5,7 @@
 #include <algorithm>
 #include <cmath>
 
+#include "host/color/ColorCurvesTable.h"
 #include "host/flow/DataTypes.h"
 #include "host/flow/Gradient.h"
 #include "host/flow/Operator.h"
@@ -47,6 +48,7 @@ Ref<Parameter> DefaultValueFor(OvID dataType, const TagList &tags) {
         return MakeRef<IDValue>(def);
     }
     if (dataType == CLSID_DataType_Gradient) return MakeRef<Gradient>();
+    if (dataType == CLSID_DataType_ColorCurves) return MakeRef<ColorCurvesTable>();
     if (dataType == CLSID_DataType_Clip) return MakeRef<Clip>(tags.GetText(InputDefaultText, ""));
     if (dataType == CLSID_DataType_ScriptVal) return MakeRef<ScriptValue>();
     return nullptr;
@@ -66,6 +68,7 @@ Ref<Parameter> ParameterFromScript(OvID dataType, const ScriptVal &v) {
     if (dataType == CLSID_DataType_Text) return v.IsText() ? MakeRef<Text>(v.AsText()) : nullptr;
     if (dataType == CLSID_DataType_OvID) return v.IsText() ? MakeRef<IDValue>(OvID(v.AsText())) : nullptr;
     if (dataType == CLSID_DataType_Gradient) return Gradient::FromScript(v);
+    if (dataType == CLSID_DataType_ColorCurves) return ColorCurvesTable::FromScript(v);
     if (dataType == CLSID_DataType_Clip) return v.IsText() ? MakeRef<Clip>(v.AsText()) : nullptr;
     if (dataType == CLSID_DataType_ScriptVal) return MakeRef<ScriptValue>(v);
     return nullptr;

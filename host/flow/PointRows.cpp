@@ -1,5 +1,6 @@
 #include "host/flow/PointRows.h"
 
+#include "host/core/Tags.h"
 #include "host/flow/Request.h"
 #include "host/image/NewImage.h"
 

@@ -132,3 +132,155 @@ __KERNEL__ void ColorMatrix(__CONSTANTREF__ ColorMatrixParams *p_pParams, __TEXT
 )KROM";
 
 } // namespace Orvane
+
+namespace Orvane {
+
+const char kColorCorrectorKernels[] = R"KROM(
+/// Applies 3 by 4 matrix m (12 floats) to c.
+KROM_FN void cc_apply(__CONSTANTREF__ float *m, const float *c, float *out) {
+    for (int i = 0; i < 3; ++i) out[i] = m[4 * i] * c[0] + m[4 * i + 1] * c[1] + m[4 * i + 2] * c[2] + m[4 * i + 3];
+}
+
+KROM_FN float cc_hue(const float *c) {
+    const float mx = _fmaxf(c[0], _fmaxf(c[1], c[2])), mn = _fminf(c[0], _fminf(c[1], c[2]));
+    if (mx == mn) return 0.f;
+    const float d = mx - mn;
+    float h = mx == c[0] ? (c[1] - c[2]) / d : mx == c[1] ? (c[2] - c[0]) / d + 2.f : (c[0] - c[1]) / d + 4.f;
+    h = h / 6.f;
+    return h < 0.f ? h + 1.f : h;
+}
+
+/// One record's range function on p (RGB) with luminance L; alpha stays.
+KROM_FN void cc_range(__CONSTANTREF__ CCProcessPixelParams *q, __TEXTURE2D__ tables, int r, float L, const float *p,
+                      float *c, int suppression) {
+    const int flags = q->doFlag >> (4 * r);
+    const int mode = (q->orderTintChannel >> 1) & 3;
+    c[0] = p[0], c[1] = p[1], c[2] = p[2];
+    if (flags & 1) {
+        __CONSTANTREF__ float *m = q->colorMat + 48 * r;
+        if (mode == 0 || (L >= 0.f && L <= 1.f)) {
+            cc_apply(L < 0.5f ? m : m + 12, p, c);
+        } else {
+            float y[3], z[3];
+            cc_apply(q->colorMat + 144, p, y);
+            const float luma = y[0];
+            y[0] = L < 0.f ? _fmaxf(y[0], 0.f) : _fminf(y[0], 1.f);
+            cc_apply(L < 0.f ? m + 24 : m + 36, y, z);
+            z[0] = luma;
+            cc_apply(q->colorMat + 156, z, c);
+        }
+    }
+    __CONSTANTREF__ float *l1 = q->colorMatSimple + 16 * r;
+    __CONSTANTREF__ float *l2 = l1 + 8;
+    for (int i = 0; i < 3; ++i) {
+        float x = c[i];
+        const float e = q->gamma[4 * r + i];
+        const int gamma = (flags & 2) && e != 1.f;
+        if (q->orderTintChannel & 1) {
+            if (flags & 4) x = x * l1[i] + l1[4 + i];
+            if (gamma) x = _copysignf(_powf(_fabs(x), e), x);
+            if (flags & 8) x = x * l2[i] + l2[4 + i];
+        } else {
+            if (gamma) x = _copysignf(_powf(_fabs(x), e), x);
+            if (flags & 4) x = x * l1[i] + l1[4 + i];
+        }
+        c[i] = x;
+    }
+    if (suppression && q->hasSuppressionTable[r]) {
+        const int n = q->sampleCount[r];
+        const int i = (int)_fminf(_fmaxf((float)(int)((float)n * cc_hue(c)), 0.f), (float)(n - 1));
+        const float f = _tex2DVecN(tables, i, r, 0).x;
+        if (_fabs(f - 1.f) > 1e-6f) {
+            const float4 w0 = _tex2DVecN(tables, 0, 3, 0), w1 = _tex2DVecN(tables, 1, 3, 0);
+            const float4 w2 = _tex2DVecN(tables, 2, 3, 0), w3 = _tex2DVecN(tables, 3, 3, 0);
+            const float d = (w0.w * c[0] + w1.w * c[1] + w2.w * c[2] + w3.w) * (1.f - f);
+            for (int k = 0; k < 3; ++k) c[k] = c[k] * f + d;
+        }
+    }
+}
+
+KROM_FN float cc_luma(const float *p) { return 0.299f * p[0] + 0.587f * p[1] + 0.114f * p[2]; }
+
+/// The range weights of luminance L: row 3 of the table image (row 0 of a range picture's table).
+KROM_FN float4 cc_weights(__TEXTURE2D__ tables, int row, int n, float L) {
+    const float x = L > 0.f ? (L < 1.f ? L : 1.f) : 0.f;
+    return _tex2DVecN(tables, (int)(x * (float)(n - 1) + 0.5f), row, 0);
+}
+
+KROM_FN void cc_pixel(__CONSTANTREF__ CCProcessPixelParams *q, __TEXTURE2D__ input, __TEXTURE2D__ tables,
+                      __TEXTURE2D_WRITE__ output, int x, int y, int suppression) {
+    if (x >= q->workSize[0] || y >= q->workSize[1]) return;
+    const int2 pos = make_int2(x + q->dstWindow[0], y + q->dstWindow[2]);
+    float4 c = to_float4_v(q->processCanvasColor);
+    if (IsInsideROI(pos, q->srcWindow)) {
+        const float4 in = _tex2DVecN(input, pos.x - q->srcWindow[0], pos.y - q->srcWindow[2], q->srcCompOrder);
+        float p[4] = {in.x, in.y, in.z, in.w}, out[4], part[3];
+        if (q->prePost & 1) {
+            if (p[3] == 0.f)
+                p[0] = p[1] = p[2] = 0.f;
+            else
+                for (int i = 0; i < 3; ++i) p[i] = p[i] / p[3];
+        }
+        const int ranges = (q->orderTintChannel >> 3) & 1;
+        const float L = ranges || (q->doFlag & 1) ? cc_luma(p) : 0.f;
+        if (!ranges) {
+            cc_range(q, tables, 0, L, p, out, suppression);
+            out[3] = p[3];
+        } else {
+            const float4 w4 = cc_weights(tables, 3, q->sampleCount[3], L);
+            const float w[3] = {w4.x, w4.y, w4.z};
+            out[0] = out[1] = out[2] = out[3] = 0.f;
+            for (int r = 0; r < 3; ++r) {
+                cc_range(q, tables, r, L, p, part, suppression);
+                for (int i = 0; i < 3; ++i) out[i] += w[r] * part[i];
+                out[3] += w[r] * p[3];
+            }
+        }
+        if (q->prePost & 2) {
+            const float a = out[3] > -1e-6f && out[3] < 1e-6f ? 0.f : out[3];
+            for (int i = 0; i < 3; ++i) out[i] = out[i] * a;
+        }
+        c = make_float4(out[0], out[1], out[2], out[3]);
+    }
+    _tex2DVec4Write(output, x, y, make_intensity(c, q->dstCompOrder));
+}
+
+__KERNEL__ void CCProcessPixel(__CONSTANTREF__ CCProcessPixelParams *p_pParams, __TEXTURE2D__ input,
+                               __TEXTURE2D__ tables, __TEXTURE2D_WRITE__ output) {
+    DEFINE_KERNEL_ITERATORS_XY(x, y);
+    cc_pixel(p_pParams, input, tables, output, x, y, 1);
+}
+
+__KERNEL__ void CCProcessPixelSimple(__CONSTANTREF__ CCProcessPixelParams *p_pParams, __TEXTURE2D__ input,
+                                     __TEXTURE2D__ tables, __TEXTURE2D_WRITE__ output) {
+    DEFINE_KERNEL_ITERATORS_XY(x, y);
+    cc_pixel(p_pParams, input, tables, output, x, y, 0);
+}
+)KROM";
+
+const char kColorCorrectorRangeKernel[] = R"KROM(
+__KERNEL__ void CCProcessRange(__CONSTANTREF__ CCProcessRangeParams *p_pParams, __TEXTURE2D__ input,
+                               __TEXTURE2D__ tables, __TEXTURE2D_WRITE__ output) {
+    DEFINE_KERNEL_ITERATORS_XY(x, y);
+    __CONSTANTREF__ CCProcessRangeParams *q = p_pParams;
+    if (x >= q->workSize[0] || y >= q->workSize[1]) return;
+    const int2 pos = make_int2(x + q->dstWindow[0], y + q->dstWindow[2]);
+    float4 c = to_float4_v(q->defaultP);
+    if (IsInsideROI(pos, q->srcWindow)) {
+        const float4 in = _tex2DVecN(input, pos.x - q->srcWindow[0], pos.y - q->srcWindow[2], q->srcCompOrder);
+        float p[3] = {in.x, in.y, in.z};
+        if (q->preDivide)
+            for (int i = 0; i < 3; ++i) p[i] = in.w == 0.f ? 0.f : p[i] / in.w;
+        const float L = 0.299f * p[0] + 0.587f * p[1] + 0.114f * p[2];
+        const float v = L > 0.f ? (L < 1.f ? L : 1.f) : 0.f;
+        const float4 w = _tex2DVecN(tables, (int)(v * (float)(q->sampleCount - 1) + 0.5f), 0, 0);
+        c = q->selected == 0 ? make_float4(w.x, w.y, w.z, 1.f)
+            : q->selected == 1 ? make_float4(w.x, w.x, w.x, 1.f)
+            : q->selected == 2 ? make_float4(w.y, w.y, w.y, 1.f)
+                               : make_float4(w.z, w.z, w.z, 1.f);
+    }
+    _tex2DVec4Write(output, x, y, make_intensity(c, q->dstCompOrder));
+}
+)KROM";
+
+} // namespace Orvane

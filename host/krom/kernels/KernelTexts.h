@@ -3,6 +3,10 @@
 namespace Orvane {
 /// "BrightnessContrast" and "BrightnessContrastReverse".
 extern const char kBrightnessContrastKernels[];
+/// "CCProcessPixel" and "CCProcessPixelSimple".
+extern const char kColorCorrectorKernels[];
+/// "CCProcessRange".
+extern const char kColorCorrectorRangeKernel[];
 /// "ColorMatrix".
 extern const char kColorMatrixKernel[];
 /// "Background".
