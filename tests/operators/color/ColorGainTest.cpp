@@ -1,5 +1,5 @@
-// ColorGain against a double-precision model of its formulas, on every depth, with the frame rules; neutral settings
-// and a bad range.
+// ColorGain against a double-precision model of its formulas on every depth with the frame rules, neutral settings,
+// a bad range, oiiotool, and the device against the rows.
 #include <cmath>
 #include <string>
 #include <vector>
@@ -7,12 +7,10 @@
 #include <gtest/gtest.h>
 
 #include "tests/host/krom/DeviceTestSupport.h"
-#include "tests/operators/color/GainTestSupport.h"
-#include "tests/operators/media/FormatTestSupport.h"
+#include "tests/operators/color/ColorTestSupport.h"
 
-namespace Orvane::colorgaintest {
+namespace Orvane::colortest::colorgain {
 namespace {
-using gaintest::Px;
 
 /// One step's settings: index 0..3 red, green, blue, alpha, 4 the master (saturation: 3 is the master).
 struct Step {
@@ -25,30 +23,25 @@ struct Settings {
 };
 
 void Apply(Operator *op, const Settings &s) {
-    const char *steps[] = {"", "Shadows", "Midtones", "Highlights"};
-    const char *chans[] = {"Red", "Green", "Blue", "Alpha", ""};
+    const char *steps[] = {"", "Shadows", "Midtones", "Highlights"}, *chans[] = {"Red", "Green", "Blue", "Alpha", ""};
     for (int r = 0; r < 4; ++r)
         for (int c = 0; c < 5; ++c) {
             const std::string pre = std::string(steps[r]) + chans[c];
-            Orvane::Test::SetNumber(op, (pre + "Gain").c_str(), s.step[r].gain[c]);
-            Orvane::Test::SetNumber(op, (pre + "Lift").c_str(), s.step[r].lift[c]);
-            Orvane::Test::SetNumber(op, (pre + "Gamma").c_str(), s.step[r].gamma[c]);
-            if (c != 3) Orvane::Test::SetNumber(op, (pre + "Saturation").c_str(), s.step[r].sat[c == 4 ? 3 : c]);
+            T::SetNumbers(op, {{(pre + "Gain").c_str(), s.step[r].gain[c]},
+                               {(pre + "Lift").c_str(), s.step[r].lift[c]},
+                               {(pre + "Gamma").c_str(), s.step[r].gamma[c]}});
+            if (c != 3) T::SetNumber(op, (pre + "Saturation").c_str(), s.step[r].sat[c == 4 ? 3 : c]);
         }
-    Orvane::Test::SetNumbers(op, {{"ShadowsEnd", s.shadowsEnd}, {"HighlightsStart", s.highlightsStart}});
+    T::SetNumbers(op, {{"ShadowsEnd", s.shadowsEnd}, {"HighlightsStart", s.highlightsStart}});
 }
-
-double Luminance(const Px &p) { return 0.2126 * p[0] + 0.7152 * p[1] + 0.0722 * p[2]; }
 
 Px ModelStep(const Step &s, Px p) {
     for (int c = 0; c < 4; ++c) {
         const bool color = c < 3; // the master leaves alpha alone
         p[c] = p[c] * s.gain[c] * (color ? s.gain[4] : 1) + s.lift[c] + (color ? s.lift[4] : 0);
         const double gamma = s.gamma[c] * (color ? s.gamma[4] : 1);
-        if (std::fabs(gamma - 1) >= 1.1920929e-07) {
-            const double e = gamma < 1e-5 ? 1e5 : 1 / gamma;
-            p[c] = std::copysign(std::pow(std::fabs(p[c]), e), p[c]);
-        }
+        if (std::fabs(gamma - 1) >= 1.1920929e-07)
+            p[c] = std::copysign(std::pow(std::fabs(p[c]), gamma < 1e-5 ? 1e5 : 1 / gamma), p[c]);
     }
     const double y = Luminance(p);
     for (int c = 0; c < 3; ++c) p[c] = y + s.sat[c] * s.sat[3] * (p[c] - y);
@@ -60,16 +53,12 @@ double Smooth(double t) {
     return t * t * (3 - 2 * t);
 }
 
-/// Weights of shadows, midtones, highlights at luminance y.
-std::array<double, 3> Weights(const Settings &s, double y) {
-    const double sh = 1 - (s.shadowsEnd > 0 ? Smooth(y / s.shadowsEnd) : y > 0);
-    const double hi = s.highlightsStart < 1 ? Smooth((y - s.highlightsStart) / (1 - s.highlightsStart)) : y >= 1;
-    return {sh, 1 - sh - hi, hi};
-}
-
 Px Model(const Settings &s, const Px &in) {
     const Px p = ModelStep(s.step[0], in);
-    const auto w = Weights(s, Luminance(p));
+    const double y = Luminance(p);
+    const double sh = 1 - (s.shadowsEnd > 0 ? Smooth(y / s.shadowsEnd) : y > 0);
+    const double hi = s.highlightsStart < 1 ? Smooth((y - s.highlightsStart) / (1 - s.highlightsStart)) : y >= 1;
+    const double w[3] = {sh, 1 - sh - hi, hi}; // shadows, midtones, highlights
     Px out{};
     for (int r = 0; r < 3; ++r) {
         const Px q = ModelStep(s.step[r + 1], p);
@@ -109,7 +98,7 @@ std::vector<std::pair<const char *, Settings>> Cases() {
 
 class ColorGain : public ::testing::Test {
 protected:
-    static void SetUpTestSuite() { Orvane::Test::LoadOperators(); }
+    static void SetUpTestSuite() { T::LoadOperators(); }
 };
 
 TEST_F(ColorGain, MatchesTheModelOnEveryDepthAndKeepsTheFrameRules) {
@@ -117,62 +106,49 @@ TEST_F(ColorGain, MatchesTheModelOnEveryDepthAndKeepsTheFrameRules) {
         SCOPED_TRACE(name);
         auto set = [&s = s](Operator *op) { Apply(op, s); };
         auto model = [&s = s](const Image &, const Px &p) { return Model(s, p); };
-        gaintest::ExpectModelOnEveryDepth("ColorGain", set, model);
-        gaintest::ExpectFrameRules("ColorGain", set, model, 2e-5);
+        ExpectModelOnEveryDepth("ColorGain", set, model);
+        ExpectFrameRules("ColorGain", set, model, 2e-5);
     }
 }
 
 TEST_F(ColorGain, NeutralSettingsHandTheInputOnAndABadRangeFails) {
-    Ref<Image> src = Orvane::Test::PatternImage(8, 4, DepthRGBAInt16);
-    gaintest::Rig rig("ColorGain", src);
-    Settings tiny; // changes below the neutral test
+    Ref<Image> src = T::PatternImage(8, 4, DepthRGBAInt16);
+    Chain chain(src, "ColorGain");
+    Settings tiny, bad; // changes below the neutral test; shadows ending above the start of highlights
     tiny.step[0].gain[4] = 1 + 5e-8, tiny.step[2].lift[1] = 1e-8, tiny.shadowsEnd = 0.1;
-    for (const Settings &s : {Settings{}, tiny}) {
-        Apply(rig.tool, s);
-        EXPECT_EQ(gaintest::Render(rig.tool).Get(), src.Get());
-    }
-    Settings bad;
     bad.shadowsEnd = 0.6, bad.highlightsStart = 0.4;
-    Apply(rig.tool, bad);
-    EXPECT_EQ(gaintest::Render(rig.tool), nullptr);
-    const auto lines = rig.doc.ConsoleLines();
+    for (const Settings &s : {Settings{}, tiny}) {
+        Apply(chain.last, s);
+        EXPECT_EQ(chain.Run().Get(), src.Get());
+    }
+    Apply(chain.last, bad);
+    EXPECT_EQ(chain.Run(), nullptr);
+    const auto lines = chain.doc.ConsoleLines();
     ASSERT_EQ(lines.size(), 1u);
-    EXPECT_EQ(lines[0].text.rfind(rig.tool->Name() + ": Shadows End", 0), 0u) << lines[0].text;
+    EXPECT_EQ(lines[0].text.rfind(chain.last->Name() + ": Shadows End", 0), 0u) << lines[0].text;
 }
 
 TEST_F(ColorGain, TheWholeImageStepAgreesWithOiiotool) {
-    if (!FmtTest::HaveProgram("oiiotool")) GTEST_SKIP() << "oiiotool is not installed";
+    if (!T::HaveProgram("oiiotool")) GTEST_SKIP() << "oiiotool is not installed";
     // Gain, lift, gamma and saturation as oiiotool's multiply, add, power and saturate, on values that the lift keeps
     // above 0 (its power of a negative value is not a number).
-    const Orvane::Test::TempDir dir;
-    FmtTest::WriteFile(dir / "in.exr",
-                       FmtTest::Save("OpenEXRFormat", Orvane::Test::PatternImage(33, 17, DepthRGBAFlt32, 3).Get()));
-    const FmtTest::LoadResult in = FmtTest::Load("OpenEXRFormat", FmtTest::ReadFile(dir / "in.exr"));
-    ASSERT_TRUE(in.image) << in.error; // both start from the values as the file holds them
-    ASSERT_TRUE(FmtTest::RunShell("oiiotool " + (dir / "in.exr") +
-                                  " --mulc 1.32,0.99,1.1,1 --addc 0.35,0.35,0.35,0 --powc 1.25,0.625,0.8,1"
-                                  " --saturate 0.7 -d float -o " +
-                                  (dir / "out.exr") + " >/dev/null"));
-    FmtTest::LoadResult theirs = FmtTest::Load("OpenEXRFormat", FmtTest::ReadFile(dir / "out.exr"));
-    ASSERT_TRUE(theirs.image) << theirs.error;
-    gaintest::Rig rig("ColorGain", in.image);
-    Orvane::Test::SetNumbers(rig.tool, {{"Gain", 1.1},
-                                        {"RedGain", 1.2},
-                                        {"GreenGain", 0.9},
-                                        {"Lift", 0.35},
-                                        {"Gamma", 1.25},
-                                        {"RedGamma", 0.64},
-                                        {"GreenGamma", 1.28},
-                                        {"Saturation", 0.7}});
-    Ref<Image> ours = gaintest::Render(rig.tool);
+    const T::TempDir dir;
+    Ref<Image> src = T::PatternImage(33, 17, DepthRGBAFlt32, 3);
+    Ref<Image> theirs = ThroughOiiotool(
+        *src, dir.path, "--mulc 1.32,0.99,1.1 --addc 0.35,0.35,0.35 --powc 1.25,0.625,0.8 --saturate 0.7 -d float");
+    ASSERT_TRUE(theirs);
+    Chain chain(src, "ColorGain");
+    T::SetNumbers(chain.last, {{"Gain", 1.1},
+                               {"RedGain", 1.2},
+                               {"GreenGain", 0.9},
+                               {"Lift", 0.35},
+                               {"Gamma", 1.25},
+                               {"RedGamma", 0.64},
+                               {"GreenGamma", 1.28},
+                               {"Saturation", 0.7}});
+    Ref<Image> ours = chain.Run();
     ASSERT_TRUE(ours);
-    for (int y = 0; y < 17; ++y)
-        for (int x = 0; x < 33; ++x)
-            for (int c = 0; c < 4; ++c) {
-                const double want = gaintest::ToPx(theirs.image->GetFlt(x, y))[c];
-                ASSERT_NEAR(gaintest::ToPx(ours->GetFlt(x, y))[c], want, 2e-6 * std::max(1.0, std::fabs(want)))
-                    << x << "," << y << " channel " << c;
-            }
+    EXPECT_LT(WorstDifference(*ours, *theirs, ours->DataWindow()), 2e-6);
 }
 
 TEST_F(ColorGain, TheDeviceMatchesTheRows) {
@@ -184,26 +160,18 @@ TEST_F(ColorGain, TheDeviceMatchesTheRows) {
     for (const auto &[name, s] : Cases())
         for (const auto &[depth, tol] : depths) {
             SCOPED_TRACE(std::string(name) + ", depth " + std::to_string(depth));
-            gaintest::Rig rig("ColorGain",
-                              Orvane::Test::WindowedImage(64, 40, window, {0.2f, -0.1f, 0.6f, 0.5f}, 5, depth));
-            Apply(rig.tool, s);
+            Chain chain(T::WindowedImage(64, 40, window, {0.2f, -0.1f, 0.6f, 0.5f}, 5, depth), "ColorGain");
+            Apply(chain.last, s);
             const int launches = ctx->LaunchCount();
             RenderTask task;
-            Ref<Image> cpu = gaintest::Render(rig.tool, &roi), dev = gaintest::Render(rig.tool, &roi, 0, ctx, &task);
+            Ref<Image> cpu = chain.Run(&roi), dev = chain.Run(&roi, 0, ctx, &task);
             ASSERT_TRUE(cpu && dev && dev->DataWindow() == cpu->DataWindow());
             EXPECT_GT(ctx->LaunchCount(), launches) << "the device ran";
             EXPECT_TRUE(task.DeviceLog().empty()) << task.DeviceLog().front();
             EXPECT_EQ(dev->GetCanvasColor(), cpu->GetCanvasColor());
-            const ImgRectI dw = cpu->DataWindow();
-            for (int y = dw.y0; y < dw.y1; ++y)
-                for (int x = dw.x0; x < dw.x1; ++x)
-                    for (int c = 0; c < 4; ++c) {
-                        const double want = gaintest::ToPx(cpu->GetFlt(x, y))[c];
-                        ASSERT_NEAR(gaintest::ToPx(dev->GetFlt(x, y))[c], want, tol * std::max(1.0, std::fabs(want)))
-                            << x << "," << y << " channel " << c;
-                    }
+            EXPECT_LE(WorstDifference(*dev, *cpu, cpu->DataWindow(), 4, true), tol);
         }
 }
 
 } // namespace
-} // namespace Orvane::colorgaintest
+} // namespace Orvane::colortest::colorgain

@@ -1,5 +1,5 @@
-// FileLUT: tables written here for exact known functions, at every depth; interpolation and direction; the canvas
-// colour and regions; files that cannot be read; and oiiotool applying the same file.
+// FileLUT: tables written here for exact known functions, at every depth; interpolation and direction; the frame
+// rules; names relative to the document; files that cannot be read; and oiiotool applying the same file.
 #include <fstream>
 #include <functional>
 #include <string>
@@ -7,12 +7,10 @@
 #include <gtest/gtest.h>
 
 #include "host/color/ColorConfig.h"
-#include "host/image/PixelConvert.h"
-#include "tests/operators/color/ColorManagedTestSupport.h"
+#include "tests/operators/color/ColorTestSupport.h"
 
-namespace Orvane::cmtest {
+namespace Orvane::colortest::filelut {
 namespace {
-namespace T = Orvane::Test;
 
 using Function = std::function<Rgb(const Rgb &)>;
 
@@ -34,7 +32,6 @@ std::string Table3D(const Function &f, int n, bool spi = false) {
     return t;
 }
 
-const char *const kInvert1DCube = "LUT_1D_SIZE 2\n1 1 1\n0 0 0\n";
 const char *const kInvertSpi1D = "Version 1\nFrom 0.0 1.0\nLength 2\nComponents 1\n{\n 1.0\n 0.0\n}\n";
 
 class FileLUTTest : public ::testing::Test {
@@ -47,10 +44,12 @@ protected:
     T::TempDir dir;
 };
 
-TEST_F(FileLUTTest, ExactFunctionsAtEveryDepth) {
+TEST_F(FileLUTTest, ExactFunctionsAtEveryDepthAndTheFrameRules) {
     const std::tuple<const char *, std::string, Function> cases[] = {
-        {"invert.cube", Table3D(Invert, 2), Invert},        {"rotate.cube", Table3D(Rotate, 5), Rotate},
-        {"invert1d.cube", kInvert1DCube, Invert},           {"invert.spi1d", kInvertSpi1D, Invert},
+        {"invert.cube", Table3D(Invert, 2), Invert},
+        {"rotate.cube", Table3D(Rotate, 5), Rotate},
+        {"invert1d.cube", "LUT_1D_SIZE 2\n1 1 1\n0 0 0\n", Invert},
+        {"invert.spi1d", kInvertSpi1D, Invert},
         {"rotate.spi3d", Table3D(Rotate, 2, true), Rotate},
     };
     for (const auto &[name, text, f] : cases) {
@@ -61,31 +60,30 @@ TEST_F(FileLUTTest, ExactFunctionsAtEveryDepth) {
             Chain chain(src);
             chain.Add("FileLUT", {{"LUTFile", file}});
             Ref<Image> out = chain.Run();
-            ASSERT_TRUE(out);
-            ASSERT_EQ(out->Depth(), depth);
-            int wrong = 0;
+            ASSERT_TRUE(out && out->Depth() == depth);
+            // The function's value stored at the depth (integers and halves round once); alpha passes.
+            Ref<Image> want = T::PatternImage(23, 7, depth, 3);
             for (int y = 0; y < 7; ++y)
                 for (int x = 0; x < 23; ++x) {
-                    const FltPixel in = src->GetFlt(x, y), got = out->GetFlt(x, y);
-                    const Rgb want = f({in.R, in.G, in.B});
-                    // The function's value stored at the depth (integers and halves round once); alpha passes.
-                    FltPixel stored{float(want[0]), float(want[1]), float(want[2]), in.A};
-                    uint8_t bytes[16];
-                    StoreFlt(depth, &stored, 1, bytes);
-                    LoadFlt(depth, bytes, 1, &stored);
-                    const double tol = depth == DepthRGBAFlt32 ? 1e-6 : 0.0;
-                    wrong += std::fabs(got.R - stored.R) > tol || std::fabs(got.G - stored.G) > tol ||
-                             std::fabs(got.B - stored.B) > tol || got.A != stored.A;
+                    const FltPixel in = src->GetFlt(x, y);
+                    const Rgb w = f({in.R, in.G, in.B});
+                    want->PutFlt(x, y, {float(w[0]), float(w[1]), float(w[2]), in.A});
                 }
-            EXPECT_EQ(wrong, 0);
+            EXPECT_LE(WorstDifference(*out, *want, want->DataWindow(), 4), depth == DepthRGBAFlt32 ? 1e-6 : 0.0);
         }
     }
+    ExpectFrameRules(
+        "FileLUT", [&](Operator *op) { T::SetText(op, "LUTFile", dir / "invert.cube"); },
+        [](const Image &, const Px &p) {
+            const Rgb c = Invert({p[0], p[1], p[2]});
+            return Px{c[0], c[1], c[2], p[3]};
+        },
+        1e-6);
 }
 
 TEST_F(FileLUTTest, InterpolationAndDirection) {
     const std::string spi1d = Write("invert.spi1d", kInvertSpi1D), rotate = Write("rotate.cube", Table3D(Rotate, 9)),
                       products = Write("products.cube", Table3D(Products, 2));
-    const std::vector<Rgb> colours = {{0.3, 0.7, 0.0}, {0.1, 0.55, 0.9}};
     const std::tuple<std::string, int, bool, std::vector<Rgb>, double> cases[] = {
         // Products of channels from their values at the cube's corners: trilinear reading gives the products
         // themselves; tetrahedral weighs the four corners along the path of the sorted coordinates (for 0.3,
@@ -98,48 +96,30 @@ TEST_F(FileLUTTest, InterpolationAndDirection) {
     };
     for (const auto &[file, interpolation, inverse, want, tol] : cases) {
         SCOPED_TRACE(file + " " + std::to_string(interpolation) + (inverse ? " inverse" : ""));
-        Chain chain(ColourRow(colours));
+        Chain chain(ColourRow({{0.3, 0.7, 0.0}, {0.1, 0.55, 0.9}}));
         chain.Add("FileLUT", {{"LUTFile", file}}, {{"Interpolation", interpolation}, {"Direction", inverse}});
-        Ref<Image> out = chain.Run();
-        ASSERT_TRUE(out);
-        ExpectColoursNear(ColoursOf(*out), want, tol);
+        ExpectColoursNear(chain.Run(), want, tol);
     }
 }
 
-TEST_F(FileLUTTest, CanvasColourRegionsAndRelativeNames) {
+TEST_F(FileLUTTest, RelativeNamesAndFilesThatCannotBeRead) {
     Write("invert.cube", Table3D(Invert, 2));
-    Chain chain(T::WindowedImage(16, 8, ImgRectI(4, 2, 10, 6), {0.25f, 0.5f, 0.75f, 1.f}, 5, DepthRGBAFlt32));
-    chain.doc.SetFilePath(dir / "flow.orvane"); // relative names are taken from the document's folder
-    chain.Add("FileLUT", {{"LUTFile", "invert.cube"}});
-    Ref<Image> out = chain.Run();
-    ASSERT_TRUE(out) << T::ConsoleText(chain.doc);
-    const FltPixel want{0.75f, 0.5f, 0.25f, 1.f};
-    T::ExpectPixelNear(out->GetCanvasColor(), want, 1e-6, "canvas");
-    T::ExpectPixelNear(out->GetFlt(1, 1), want, 1e-6, "beyond the window");
-    // A region of interest gives the same values as the same part of the whole frame.
-    const ImgRectI roi(3, 1, 9, 5);
-    Ref<Image> part = chain.Run(&roi);
-    ASSERT_TRUE(part);
-    for (int y = roi.y0; y < roi.y1; ++y)
-        for (int x = roi.x0; x < roi.x1; ++x) EXPECT_EQ(part->GetFlt(x, y), out->GetFlt(x, y)) << x << "," << y;
-}
-
-TEST_F(FileLUTTest, UnreadableFilesFailNamingThem) {
     Write("broken.cube", "LUT_3D_SIZE 2\n0 0 0\n1 1\n");
     Write("unknown.xyz", "0 1\n");
     for (const char *name : {"missing.cube", "broken.cube", "unknown.xyz"}) {
         Chain chain(T::PatternImage(4, 4, DepthRGBAFlt32));
         Operator *lut = chain.Add("FileLUT", {{"LUTFile", dir / name}});
-        EXPECT_FALSE(chain.Run()) << name;
-        EXPECT_NE(T::ConsoleText(chain.doc).find(lut->Name() + ": cannot read LUT file '" + dir / name + "'"),
-                  std::string::npos)
+        EXPECT_TRUE(!chain.Run() && T::ConsoleText(chain.doc).find(lut->Name() + ": cannot read LUT file '" +
+                                                                   dir / name + "'") != std::string::npos)
             << T::ConsoleText(chain.doc);
     }
-    // No file named yet: nothing to do, the input is handed on.
-    Ref<Image> src = T::PatternImage(4, 4, DepthRGBAFlt32);
-    Chain chain(src);
-    chain.Add("FileLUT");
+    // No file named yet: nothing to do, the input is handed on. A relative name is found in the document's folder.
+    Ref<Image> src = ColourRow({{0.25, 0.5, 1}});
+    Chain chain(src, "FileLUT");
     EXPECT_EQ(chain.Run().Get(), src.Get());
+    chain.doc.SetFilePath(dir / "flow.orvane");
+    T::SetText(chain.last, "LUTFile", "invert.cube");
+    ExpectColoursNear(chain.Run(), {{0.75, 0.5, 0}}, 1e-6);
 }
 
 TEST_F(FileLUTTest, SameAsOiiotool) {
@@ -161,8 +141,8 @@ TEST_F(FileLUTTest, SameAsOiiotool) {
     chain.Add("FileLUT", {{"LUTFile", cube}});
     Ref<Image> ours = chain.Run();
     ASSERT_TRUE(ours);
-    EXPECT_LT(WorstColourDifference(*ours, *theirs), 1e-5);
+    EXPECT_LT(WorstDifference(*ours, *theirs, ours->DataWindow()), 1e-5);
 }
 
 } // namespace
-} // namespace Orvane::cmtest
+} // namespace Orvane::colortest::filelut

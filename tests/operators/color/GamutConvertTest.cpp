@@ -1,30 +1,26 @@
-// GamutConvert: published conversion matrices, white kept between every pair of gamuts, curves by their formulas,
-// and round trips.
+// GamutConvert: published conversion matrices with the frame rules, white kept between every pair of gamuts, curves
+// by their formulas, and round trips.
 #include <string>
 
 #include <gtest/gtest.h>
 
-#include "tests/operators/color/ColorManagedTestSupport.h"
+#include "tests/operators/color/ColorTestSupport.h"
 
-namespace Orvane::cmtest {
+namespace Orvane::colortest::gamut {
 namespace {
-namespace T = Orvane::Test;
 
 enum Gamut { Rec709, Rec2020, DCIP3, DisplayP3, AP0, AP1 };
 enum Curve { Linear, SRGB, Rec709Curve, Gamma, Cineon };
 
 /// A Gamut tool's inputs.
-std::vector<std::pair<const char *, double>> Convert(Gamut from, Curve fromCurve, Gamut to, Curve toCurve) {
+Numbers Convert(Gamut from, Curve fromCurve, Gamut to, Curve toCurve) {
     return {{"SourceGamut", from}, {"SourceCurve", fromCurve}, {"OutputGamut", to}, {"OutputCurve", toCurve}};
 }
 
-std::vector<Rgb> Through(const std::vector<Rgb> &colours,
-                         const std::vector<std::vector<std::pair<const char *, double>>> &steps) {
+Ref<Image> Through(const std::vector<Rgb> &colours, const std::vector<Numbers> &steps) {
     Chain chain(ColourRow(colours));
-    for (const auto &settings : steps) chain.Add("GamutConvert", {}, settings);
-    Ref<Image> out = chain.Run();
-    EXPECT_TRUE(out) << T::ConsoleText(chain.doc);
-    return out ? ColoursOf(*out) : std::vector<Rgb>{};
+    for (const Numbers &settings : steps) chain.Add("GamutConvert", {}, settings);
+    return chain.Run();
 }
 
 class GamutConvertTest : public ::testing::Test {
@@ -32,23 +28,22 @@ protected:
     static void SetUpTestSuite() { T::LoadOperators(); }
 };
 
-TEST_F(GamutConvertTest, PublishedMatrices) {
+TEST_F(GamutConvertTest, PublishedMatricesKeepTheFrameRules) {
     // BT.2087 (Rec.709 to Rec.2020, four places) and the ACES AP0 to AP1 matrix (ten places).
     const double bt2087[3][3] = {{0.6274, 0.3293, 0.0433}, {0.0691, 0.9195, 0.0114}, {0.0164, 0.0880, 0.8956}};
     const double ap0ToAp1[3][3] = {{1.4514393161, -0.2365107469, -0.2149285693},
                                    {-0.0765537734, 1.1762296998, -0.0996759264},
                                    {0.0083161484, -0.0060324498, 0.9977163014}};
-    const std::vector<Rgb> colours = {{1, 1, 1}, {1, 0, 0}, {0, 1, 0}, {0, 0, 1}, {0.3, 0.6, 0.1}};
     const std::tuple<Gamut, Gamut, const double(*)[3], double> cases[] = {{Rec709, Rec2020, bt2087, 1e-4},
                                                                           {AP0, AP1, ap0ToAp1, 2e-6}};
     for (const auto &[from, to, m, tol] : cases) {
-        std::vector<Rgb> want;
-        for (const Rgb &c : colours) {
-            Rgb w{};
-            for (int r = 0; r < 3; ++r) w[r] = m[r][0] * c[0] + m[r][1] * c[1] + m[r][2] * c[2];
-            want.push_back(w);
-        }
-        ExpectColoursNear(Through(colours, {Convert(from, Linear, to, Linear)}), want, tol);
+        auto set = [&](Operator *op) { T::SetNumbers(op, Convert(from, Linear, to, Linear)); };
+        auto model = [&](const Image &, const Px &p) {
+            Px w{0, 0, 0, p[3]};
+            for (int r = 0; r < 3; ++r) w[r] = m[r][0] * p[0] + m[r][1] * p[1] + m[r][2] * p[2];
+            return w;
+        };
+        ExpectFrameRules("GamutConvert", set, model, tol);
     }
 }
 
@@ -79,4 +74,4 @@ TEST_F(GamutConvertTest, CurvesAndRoundTrips) {
 }
 
 } // namespace
-} // namespace Orvane::cmtest
+} // namespace Orvane::colortest::gamut

@@ -1,46 +1,30 @@
 // WhiteBalance: a picked colour becomes the grey of its luminance in either space, temperature whites against
-// published chromaticities, forward then reverse gives the input back, neutral settings, a colour it cannot balance,
-// and the RGB scales on every depth with the frame rules.
+// published chromaticities, forward then reverse, neutral settings, whites it cannot scale, and the frame rules.
 #include <cmath>
 #include <string>
 #include <vector>
 
 #include <gtest/gtest.h>
 
-#include "tests/operators/color/GainTestSupport.h"
+#include "tests/operators/color/ColorTestSupport.h"
 
-namespace Orvane::whitebalancetest {
+namespace Orvane::colortest::whitebalance {
 namespace {
-using gaintest::Px;
-using gaintest::Render;
-using gaintest::Rig;
-using gaintest::ToPx;
-using Values = std::vector<std::pair<const char *, double>>;
 
 class WhiteBalance : public ::testing::Test {
 protected:
-    static void SetUpTestSuite() { Orvane::Test::LoadOperators(); }
+    static void SetUpTestSuite() { T::LoadOperators(); }
 };
 
-double Luminance(const Px &p) { return 0.2126 * p[0] + 0.7152 * p[1] + 0.0722 * p[2]; }
-
-/// A float32 image of one row of `pixels`.
-Ref<Image> Row(const std::vector<FltPixel> &pixels) {
-    Ref<Image> img = NewImageTagList({{ImgWidth, int(pixels.size())}, {ImgHeight, 1}, {ImgDepth, DepthRGBAFlt32}});
-    img->AllocScanLineData();
-    for (size_t i = 0; i < pixels.size(); ++i) img->PutFlt(int(i), 0, pixels[i]);
-    return img;
-}
-
-Values Picked(const Px &n, double space) {
+Numbers Picked(const Px &n, double space) {
     return {{"Method", 0}, {"Space", space}, {"NeutralRed", n[0]}, {"NeutralGreen", n[1]}, {"NeutralBlue", n[2]}};
 }
 
 /// Linear Rec. 709 RGB of the white at CIE xy (luminance 1), by the published XYZ to RGB matrix.
-FltPixel WhiteOf(double x, double y) {
+Rgb WhiteOf(double x, double y) {
     const double X = x / y, Z = (1 - x - y) / y;
-    return {float(3.2404542 * X - 1.5371385 - 0.4985314 * Z), float(-0.9692660 * X + 1.8760108 + 0.0415560 * Z),
-            float(0.0556434 * X - 0.2040259 + 1.0572252 * Z), 1.f};
+    return {3.2404542 * X - 1.5371385 - 0.4985314 * Z, -0.9692660 * X + 1.8760108 + 0.0415560 * Z,
+            0.0556434 * X - 0.2040259 + 1.0572252 * Z};
 }
 
 TEST_F(WhiteBalance, APickedColourBecomesTheGreyOfItsLuminance) {
@@ -48,11 +32,12 @@ TEST_F(WhiteBalance, APickedColourBecomesTheGreyOfItsLuminance) {
     for (double space : {0.0, 1.0})
         for (const Px &n : picked) {
             SCOPED_TRACE(std::to_string(n[0]) + "," + std::to_string(n[1]) + (space ? " cones" : " RGB"));
-            const float a = 0.4f; // premultiplied, the same grey times alpha
-            Rig rig("WhiteBalance", Row({{float(n[0]), float(n[1]), float(n[2]), 1.f},
-                                         {float(n[0]) * a, float(n[1]) * a, float(n[2]) * a, a}}));
-            Orvane::Test::SetNumbers(rig.tool, Picked(n, space));
-            Ref<Image> out = Render(rig.tool);
+            const float a = 0.4f; // premultiplied: the same grey times alpha
+            Ref<Image> src = ColourRow({{n[0], n[1], n[2]}, {}});
+            src->PutFlt(1, 0, {float(n[0]) * a, float(n[1]) * a, float(n[2]) * a, a});
+            Chain chain(src, "WhiteBalance");
+            T::SetNumbers(chain.last, Picked(n, space));
+            Ref<Image> out = chain.Run();
             ASSERT_TRUE(out);
             const double y = Luminance(n);
             for (int c = 0; c < 3; ++c) {
@@ -72,85 +57,71 @@ TEST_F(WhiteBalance, TemperatureWhitesMatchPublishedChromaticities) {
             for (double space : {0.0, 1.0}) {
                 SCOPED_TRACE(std::to_string(from[0]) + " K to " + std::to_string(to[0]) + " K, space " +
                              std::to_string(space));
-                Rig rig("WhiteBalance", Row({WhiteOf(from[1], from[2])}));
-                Orvane::Test::SetNumbers(
-                    rig.tool,
+                Chain chain(ColourRow({WhiteOf(from[1], from[2])}), "WhiteBalance");
+                T::SetNumbers(
+                    chain.last,
                     {{"Method", 1}, {"Space", space}, {"Temperature", from[0]}, {"TargetTemperature", to[0]}});
-                Ref<Image> out = Render(rig.tool);
-                ASSERT_TRUE(out);
-                const Px got = ToPx(out->GetFlt(0, 0)), want = ToPx(WhiteOf(to[1], to[2]));
-                for (int c = 0; c < 3; ++c) EXPECT_NEAR(got[c], want[c], 0.01) << c;
+                ExpectColoursNear(chain.Run(), {WhiteOf(to[1], to[2])}, 0.01);
             }
     // Tint: a source white said to be greener is corrected by taking green away.
-    Rig rig("WhiteBalance", Row({{1, 1, 1, 1}}));
-    Orvane::Test::SetNumbers(rig.tool, {{"Method", 1}, {"Tint", 10}});
-    Ref<Image> out = Render(rig.tool);
+    Chain chain(ColourRow({{1, 1, 1}}), "WhiteBalance");
+    T::SetNumbers(chain.last, {{"Method", 1}, {"Tint", 10}});
+    Ref<Image> out = chain.Run();
     ASSERT_TRUE(out);
     EXPECT_LT(out->GetFlt(0, 0).G, std::min(out->GetFlt(0, 0).R, out->GetFlt(0, 0).B) - 0.01);
 }
 
 TEST_F(WhiteBalance, ForwardThenReverseGivesTheInputBack) {
-    const Values cases[] = {Picked({0.7, 0.5, 0.2, 1}, 0),
-                            Picked({0.3, 0.6, 0.9, 1}, 1),
-                            {{"Method", 1}, {"Temperature", 3200}, {"Tint", -7}, {"TargetTemperature", 7500}}};
+    const Numbers cases[] = {Picked({0.7, 0.5, 0.2, 1}, 0),
+                             Picked({0.3, 0.6, 0.9, 1}, 1),
+                             {{"Method", 1}, {"Temperature", 3200}, {"Tint", -7}, {"TargetTemperature", 7500}}};
     for (int depth : {DepthRGBAFlt32, DepthRGBAFlt16})
-        for (const Values &values : cases) {
+        for (const Numbers &values : cases) {
             SCOPED_TRACE("depth " + std::to_string(depth) + ", Method " + std::to_string(values[0].second));
-            Ref<Image> src = Orvane::Test::PatternImage(40, 9, depth, 11);
-            Rig rig("WhiteBalance", src);
-            Operator *back = rig.doc.AddTool(OvID("WhiteBalance"));
-            ASSERT_TRUE(back && back->FindInput("Input")->ConnectTo(rig.tool->FindMainOutput()));
-            Orvane::Test::SetNumbers(rig.tool, values);
-            Orvane::Test::SetNumbers(back, values);
-            Orvane::Test::SetNumber(back, "Direction", 1);
-            Ref<Image> there = Render(rig.tool), out = Render(back);
-            ASSERT_TRUE(there && out);
-            EXPECT_GT(std::fabs(there->GetFlt(3, 3).R - src->GetFlt(3, 3).R), 1e-3); // the colours did move
-            const double tol = depth == DepthRGBAFlt32 ? 1e-5 : 4e-3;
-            for (int y = 0; y < 9; ++y)
-                for (int x = 0; x < 40; ++x)
-                    for (int c = 0; c < 4; ++c) {
-                        const double in = ToPx(src->GetFlt(x, y))[c];
-                        ASSERT_NEAR(ToPx(out->GetFlt(x, y))[c], in, tol * std::max(1.0, std::fabs(in)))
-                            << x << "," << y;
-                    }
+            Ref<Image> src = T::PatternImage(40, 9, depth, 11);
+            Chain chain(src);
+            chain.Add("WhiteBalance", {}, values);
+            T::SetNumber(chain.Add("WhiteBalance", {}, values), "Direction", 1);
+            Ref<Image> out = chain.Run();
+            ASSERT_TRUE(out);
+            EXPECT_LE(WorstDifference(*out, *src, src->DataWindow(), 4, true), depth == DepthRGBAFlt32 ? 1e-5 : 4e-3);
         }
 }
 
 TEST_F(WhiteBalance, NeutralSettingsHandTheInputOnAndWhitesItCannotScaleFail) {
-    Ref<Image> src = Orvane::Test::PatternImage(8, 4, DepthRGBAFlt16);
-    Rig rig("WhiteBalance", src);
-    const Values neutral[] = {
+    Ref<Image> src = T::PatternImage(8, 4, DepthRGBAFlt16);
+    Chain chain(src, "WhiteBalance");
+    const Numbers neutral[] = {
         {},
         Picked({0.3, 0.3, 0.3, 1}, 1),
         {{"Method", 1}, {"Temperature", 3000}, {"Tint", 4}, {"TargetTemperature", 3000}, {"TargetTint", 4}}};
-    for (const Values &values : neutral) {
-        Orvane::Test::SetNumbers(rig.tool, values);
-        EXPECT_EQ(Render(rig.tool).Get(), src.Get());
+    for (const Numbers &values : neutral) {
+        T::SetNumbers(chain.last, values);
+        EXPECT_EQ(chain.Run().Get(), src.Get());
     }
     // A picked colour without red; 1667 K, whose white has no blue in Rec. 709 RGB: one line each.
-    const std::pair<Values, const char *> bad[] = {
+    const std::pair<Numbers, const char *> bad[] = {
         {Picked({0, 0.5, 0.5, 1}, 0), ": the neutral color"},
         {{{"Method", 1}, {"Space", 0}, {"Temperature", 1667}}, ": the temperature's white"}};
     for (size_t i = 0; i < std::size(bad); ++i) {
-        Orvane::Test::SetNumbers(rig.tool, bad[i].first);
-        EXPECT_EQ(Render(rig.tool), nullptr);
-        const auto lines = rig.doc.ConsoleLines();
+        T::SetNumbers(chain.last, bad[i].first);
+        EXPECT_EQ(chain.Run(), nullptr);
+        const auto lines = chain.doc.ConsoleLines();
         ASSERT_EQ(lines.size(), i + 1);
-        EXPECT_EQ(lines[i].text.rfind(rig.tool->Name() + bad[i].second, 0), 0u) << lines[i].text;
+        EXPECT_EQ(lines[i].text.rfind(chain.last->Name() + bad[i].second, 0), 0u) << lines[i].text;
     }
 }
 
 TEST_F(WhiteBalance, MatchesItsScalesInRGBOnEveryDepthAndKeepsTheFrameRules) {
     const Px n{0.6, 0.45, 0.3, 1};
-    auto set = [&](Operator *op) { Orvane::Test::SetNumbers(op, Picked(n, 0)); };
+    auto set = [&](Operator *op) { T::SetNumbers(op, Picked(n, 0)); };
     auto model = [&](const Image &, const Px &p) {
         const double y = Luminance(n);
         return Px{p[0] * y / n[0], p[1] * y / n[1], p[2] * y / n[2], p[3]};
     };
-    gaintest::ExpectModelOnEveryDepth("WhiteBalance", set, model);
-    gaintest::ExpectFrameRules("WhiteBalance", set, model, 2e-6);
+    ExpectModelOnEveryDepth("WhiteBalance", set, model);
+    ExpectFrameRules("WhiteBalance", set, model, 2e-6);
 }
 
 } // namespace
-} // namespace Orvane::whitebalancetest
+} // namespace Orvane::colortest::whitebalance
