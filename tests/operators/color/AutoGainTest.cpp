@@ -12,10 +12,7 @@
 namespace Orvane::colortest::autogain {
 namespace {
 
-class AutoGain : public ::testing::Test {
-protected:
-    static void SetUpTestSuite() { T::LoadOperators(); }
-};
+class AutoGain : public ToolTest {};
 
 struct Settings {
     double low = 0, high = 1;
@@ -51,8 +48,7 @@ TEST_F(AutoGain, MatchesTheStretchOfItsOwnMeasurementOnEveryDepthAndKeepsTheFram
         SCOPED_TRACE(std::to_string(s.low) + ".." + std::to_string(s.high) + (s.separate ? " separate" : ""));
         auto set = [&](Operator *op) { Apply(op, s); };
         auto model = [&](const Image &src, const Px &p) { return Model(s, src, p); };
-        ExpectModelOnEveryDepth("AutoGain", set, model);
-        ExpectFrameRules("AutoGain", set, model, 2e-6);
+        ExpectFrameRules("AutoGain", set, model, 2e-6, kEveryDepth);
     }
 }
 

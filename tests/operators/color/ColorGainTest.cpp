@@ -96,18 +96,14 @@ std::vector<std::pair<const char *, Settings>> Cases() {
     return cases;
 }
 
-class ColorGain : public ::testing::Test {
-protected:
-    static void SetUpTestSuite() { T::LoadOperators(); }
-};
+class ColorGain : public ToolTest {};
 
 TEST_F(ColorGain, MatchesTheModelOnEveryDepthAndKeepsTheFrameRules) {
     for (const auto &[name, s] : Cases()) {
         SCOPED_TRACE(name);
         auto set = [&s = s](Operator *op) { Apply(op, s); };
         auto model = [&s = s](const Image &, const Px &p) { return Model(s, p); };
-        ExpectModelOnEveryDepth("ColorGain", set, model);
-        ExpectFrameRules("ColorGain", set, model, 2e-5);
+        ExpectFrameRules("ColorGain", set, model, 2e-6, kEveryDepth);
     }
 }
 

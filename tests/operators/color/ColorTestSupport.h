@@ -6,6 +6,7 @@
 #include <array>
 #include <cmath>
 #include <cstring>
+#include <fstream>
 #include <functional>
 #include <string>
 #include <utility>
@@ -113,74 +114,58 @@ inline void ExpectSameBits(const Image &a, const Image &b, const ImgRectI &r) {
 
 using Setter = std::function<void(Operator *)>;
 using Model = std::function<Px(const Image &src, const Px &in)>;
+const std::vector<int> kFloatAndInt16 = {DepthRGBAFlt32, DepthRGBAInt16};
+const std::vector<int> kEveryDepth = {DepthRGBAFlt32, DepthRGBAFlt16, DepthRGBAInt16,
+                                      DepthRGBAInt8,  DepthAFlt32,    DepthAInt16};
 
-/// Renders tool `cls` (`set` makes its settings) over a pattern at every depth and compares each pixel with `model` of
-/// the source pixel (a mask: its value in every channel): float32 within 2e-5, float16 within 1.5e-3 (relative above
-/// 1), integers the nearest stored value within float rounding of the half-way points.
-inline void ExpectModelOnEveryDepth(const char *cls, const Setter &set, const Model &model) {
-    for (int depth : {DepthRGBAFlt32, DepthRGBAFlt16, DepthRGBAInt16, DepthRGBAInt8, DepthAFlt32, DepthAInt16}) {
-        SCOPED_TRACE("depth " + std::to_string(depth));
-        Ref<Image> src = T::PatternImage(37, 11, depth, 7);
-        Chain chain(src, cls);
-        set(chain.last);
-        Ref<Image> out = chain.Run();
-        ASSERT_TRUE(out && out.Get() != src.Get());
-        const bool isFloat = src->IsFloat(), mask = src->IsMask();
-        const double top = isFloat ? 1 : depth == DepthRGBAInt8 ? 255 : 65535;
-        const double tol = depth == DepthRGBAFlt32 || depth == DepthAFlt32 ? 2e-5 : 1.5e-3;
-        for (int y = 0; y < 11; ++y)
-            for (int x = 0; x < 37; ++x) {
-                Px in = ToPx(src->GetFlt(x, y));
-                if (mask) in = {in[3], in[3], in[3], in[3]};
-                const Px want = model(*src, in), got = ToPx(out->GetFlt(x, y));
-                for (int c = mask ? 3 : 0; c < 4; ++c)
-                    if (isFloat)
-                        ASSERT_NEAR(got[c], want[c], tol * std::max(1.0, std::fabs(want[c]))) << x << "," << y;
-                    else
-                        ASSERT_NEAR(got[c] * top, std::clamp(want[c], 0.0, 1.0) * top, 0.52) << x << "," << y;
-            }
-    }
-}
-
-/// The rules of the frame for tool `cls` (`set` makes its settings), with `model` the expected colour of an input
-/// colour, within `tol` (relative above 1) on float32 and one 16-bit step plus `tol` on 16-bit: under each clipping
-/// mode the data window, the canvas colour (processed, or kept under Domain and Frame), the processed canvas beyond
-/// the input's window, pre-calculation windows without pixels, regions of interest that are the same bits as the
-/// whole frame (the source giving only the region asked for; the result cut to the region unless `cropsToRegion` is
-/// false), and the same bits with one worker or many.
+/// The rules of the frame for tool `cls` (`set` makes its settings) at each of `depths`, with `model` the expected
+/// colour of an input colour (a mask: its value in every channel): float32 within `tol`, float16 within 1.5e-3
+/// (relative above 1), integers the nearest stored value within float rounding of the half-way points or within
+/// `tol`. Under each clipping mode: the data window, the canvas colour (processed, or kept under Domain and Frame),
+/// the processed canvas beyond the input's window, pre-calculation windows without pixels, regions of interest that
+/// are the same bits as the whole frame (the source giving only the region asked for; the result cut to the region
+/// unless `cropsToRegion` is false), and the same bits with one worker or many.
 inline void ExpectFrameRules(const char *cls, const Setter &set, const Model &model, double tol,
-                             bool cropsToRegion = true) {
+                             const std::vector<int> &depths = kFloatAndInt16, bool cropsToRegion = true) {
     const ImgRectI inWindow(8, 4, 40, 28);
-    const FltPixel canvas{0.2f, 0.4f, 0.6f, 0.8f};
     const std::tuple<const char *, ImgRectI, bool> clips[] = {{"ClippingMode_None", inWindow, false},
                                                               {"ClippingMode_Domain", inWindow, true},
                                                               {"ClippingMode_Frame", ImgRectI(0, 0, 48, 32), true}};
-    for (int depth : {DepthRGBAFlt32, DepthRGBAInt16})
+    for (int depth : depths)
         for (const auto &[mode, window, keepsCanvas] : clips) {
             SCOPED_TRACE(std::string(mode) + ", depth " + std::to_string(depth));
-            const bool integer = depth == DepthRGBAInt16;
-            Ref<Image> src = T::WindowedImage(48, 32, inWindow, canvas, 3, depth);
+            Ref<Image> src = T::WindowedImage(48, 32, inWindow, {0.2f, 0.4f, 0.6f, 0.8f}, 3, depth);
+            const bool isFloat = src->IsFloat(), mask = src->IsMask();
+            const double step = isFloat ? 0 : depth == DepthRGBAInt8 ? 1.0 / 255 : 1.0 / 65535;
+            auto expected = [&](FltPixel p) {
+                if (mask) p.R = p.G = p.B = p.A;
+                return model(*src, ToPx(p));
+            };
+            auto expectNear = [&](const Px &got, const Px &want, int x, int y) {
+                for (int c = mask ? 3 : 0; c < 4; ++c)
+                    if (isFloat)
+                        ASSERT_NEAR(got[c], want[c],
+                                    (depth == DepthRGBAFlt16 ? 1.5e-3 : tol) * std::max(1.0, std::fabs(want[c])))
+                            << x << "," << y << " channel " << c;
+                    else
+                        ASSERT_NEAR(got[c], std::clamp(want[c], 0.0, 1.0), std::max(0.52 * step, tol))
+                            << x << "," << y << " channel " << c;
+            };
             Chain chain(src, cls);
             set(chain.last);
             T::SetID(chain.last, "ClippingMode", mode);
             Ref<Image> shape = chain.Run(nullptr, ReqFlagPreCalc), out = chain.Run();
             ASSERT_TRUE(shape && shape->IsNoData() && !shape->HasScanLineData() && shape->DataWindow() == window);
-            ASSERT_TRUE(out && out->DataWindow() == window);
-            const Px processedCanvas = model(*src, ToPx(canvas));
+            ASSERT_TRUE(out && out.Get() != src.Get() && out->DataWindow() == window);
+            const Px processedCanvas = expected(src->GetCanvasColor());
             if (keepsCanvas)
-                EXPECT_EQ(out->GetCanvasColor(), canvas);
+                EXPECT_EQ(out->GetCanvasColor(), src->GetCanvasColor());
             else
-                for (int c = 0; c < 4; ++c) EXPECT_NEAR(ToPx(out->GetCanvasColor())[c], processedCanvas[c], tol);
+                expectNear(ToPx(out->GetCanvasColor()), processedCanvas, -1, -1);
             for (int y = window.y0; y < window.y1; ++y)
-                for (int x = window.x0; x < window.x1; ++x) {
-                    const Px want = inWindow.Contains(x, y) ? model(*src, ToPx(src->GetFlt(x, y))) : processedCanvas;
-                    const Px got = ToPx(out->GetFlt(x, y));
-                    for (int c = 0; c < 4; ++c) {
-                        const double w = integer ? std::clamp(want[c], 0.0, 1.0) : want[c];
-                        ASSERT_NEAR(got[c], w, integer ? 1.0 / 65535 + tol : tol * std::max(1.0, std::fabs(w)))
-                            << x << "," << y << " channel " << c;
-                    }
-                }
+                for (int x = window.x0; x < window.x1; ++x)
+                    expectNear(ToPx(out->GetFlt(x, y)),
+                               inWindow.Contains(x, y) ? expected(src->GetFlt(x, y)) : processedCanvas, x, y);
             chain.source->cutToRegion = true;
             for (const ImgRectI &roi : {ImgRectI(5, 7, 30, 20), ImgRectI(0, 0, 10, 5), ImgRectI(38, 25, 60, 40)}) {
                 Ref<Image> part = chain.Run(&roi);
@@ -197,5 +182,16 @@ inline void ExpectFrameRules(const char *cls, const Setter &set, const Model &mo
             ExpectSameBits(*one, *out, window);
         }
 }
+
+/// The fixture of the colour tool tests: the tools loaded once, and a folder for files.
+class ToolTest : public ::testing::Test {
+protected:
+    static void SetUpTestSuite() { T::LoadOperators(); }
+    std::string Write(const std::string &name, const std::string &text) {
+        std::ofstream(dir / name) << text;
+        return dir / name;
+    }
+    T::TempDir dir;
+};
 
 } // namespace Orvane::colortest

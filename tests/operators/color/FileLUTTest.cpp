@@ -34,15 +34,7 @@ std::string Table3D(const Function &f, int n, bool spi = false) {
 
 const char *const kInvertSpi1D = "Version 1\nFrom 0.0 1.0\nLength 2\nComponents 1\n{\n 1.0\n 0.0\n}\n";
 
-class FileLUTTest : public ::testing::Test {
-protected:
-    static void SetUpTestSuite() { T::LoadOperators(); }
-    std::string Write(const std::string &name, const std::string &text) {
-        std::ofstream(dir / name) << text;
-        return dir / name;
-    }
-    T::TempDir dir;
-};
+class FileLUTTest : public ToolTest {};
 
 TEST_F(FileLUTTest, ExactFunctionsAtEveryDepthAndTheFrameRules) {
     const std::tuple<const char *, std::string, Function> cases[] = {

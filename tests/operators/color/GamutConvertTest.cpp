@@ -23,10 +23,7 @@ Ref<Image> Through(const std::vector<Rgb> &colours, const std::vector<Numbers> &
     return chain.Run();
 }
 
-class GamutConvertTest : public ::testing::Test {
-protected:
-    static void SetUpTestSuite() { T::LoadOperators(); }
-};
+class GamutConvertTest : public ToolTest {};
 
 TEST_F(GamutConvertTest, PublishedMatricesKeepTheFrameRules) {
     // BT.2087 (Rec.709 to Rec.2020, four places) and the ACES AP0 to AP1 matrix (ten places).

@@ -11,10 +11,7 @@
 namespace Orvane::colortest::whitebalance {
 namespace {
 
-class WhiteBalance : public ::testing::Test {
-protected:
-    static void SetUpTestSuite() { T::LoadOperators(); }
-};
+class WhiteBalance : public ToolTest {};
 
 Numbers Picked(const Px &n, double space) {
     return {{"Method", 0}, {"Space", space}, {"NeutralRed", n[0]}, {"NeutralGreen", n[1]}, {"NeutralBlue", n[2]}};
@@ -119,8 +116,7 @@ TEST_F(WhiteBalance, MatchesItsScalesInRGBOnEveryDepthAndKeepsTheFrameRules) {
         const double y = Luminance(n);
         return Px{p[0] * y / n[0], p[1] * y / n[1], p[2] * y / n[2], p[3]};
     };
-    ExpectModelOnEveryDepth("WhiteBalance", set, model);
-    ExpectFrameRules("WhiteBalance", set, model, 2e-6);
+    ExpectFrameRules("WhiteBalance", set, model, 2e-6, kEveryDepth);
 }
 
 } // namespace
