@@ -1,16 +1,10 @@
 // AutoGain against its stretch worked out from the test's own measurement of the source, on every depth with the
 // frame rules (a region still measures the whole input); values that are not finite, and flat images.
-#include <algorithm>
-#include <cmath>
 #include <limits>
-#include <string>
-
-#include <gtest/gtest.h>
 
 #include "tests/operators/color/ColorTestSupport.h"
 
 namespace Orvane::colortest::autogain {
-namespace {
 
 class AutoGain : public ToolTest {};
 
@@ -74,5 +68,4 @@ TEST_F(AutoGain, SkipsValuesThatAreNotFiniteAndHandsFlatImagesOn) {
     }
 }
 
-} // namespace
 } // namespace Orvane::colortest::autogain

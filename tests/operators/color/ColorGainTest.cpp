@@ -1,16 +1,10 @@
 // ColorGain against a double-precision model of its formulas on every depth with the frame rules, neutral settings,
 // a bad range, oiiotool, and the device against the rows.
-#include <cmath>
-#include <string>
-#include <vector>
-
-#include <gtest/gtest.h>
 
 #include "tests/host/krom/DeviceTestSupport.h"
 #include "tests/operators/color/ColorTestSupport.h"
 
 namespace Orvane::colortest::colorgain {
-namespace {
 
 /// One step's settings: index 0..3 red, green, blue, alpha, 4 the master (saturation: 3 is the master).
 struct Step {
@@ -110,14 +104,11 @@ TEST_F(ColorGain, MatchesTheModelOnEveryDepthAndKeepsTheFrameRules) {
 TEST_F(ColorGain, NeutralSettingsHandTheInputOnAndABadRangeFails) {
     Ref<Image> src = T::PatternImage(8, 4, DepthRGBAInt16);
     Chain chain(src, "ColorGain");
-    Settings tiny, bad; // changes below the neutral test; shadows ending above the start of highlights
-    tiny.step[0].gain[4] = 1 + 5e-8, tiny.step[2].lift[1] = 1e-8, tiny.shadowsEnd = 0.1;
-    bad.shadowsEnd = 0.6, bad.highlightsStart = 0.4;
-    for (const Settings &s : {Settings{}, tiny}) {
-        Apply(chain.last, s);
-        EXPECT_EQ(chain.Run().Get(), src.Get());
-    }
-    Apply(chain.last, bad);
+    // Changes below the neutral test hand the input on; shadows ending above the start of highlights fail.
+    EXPECT_EQ(chain.Run().Get(), src.Get());
+    T::SetNumbers(chain.last, {{"Gain", 1 + 5e-8}, {"MidtonesGreenLift", 1e-8}, {"ShadowsEnd", 0.1}});
+    EXPECT_EQ(chain.Run().Get(), src.Get());
+    T::SetNumbers(chain.last, {{"ShadowsEnd", 0.6}, {"HighlightsStart", 0.4}});
     EXPECT_EQ(chain.Run(), nullptr);
     const auto lines = chain.doc.ConsoleLines();
     ASSERT_EQ(lines.size(), 1u);
@@ -128,20 +119,13 @@ TEST_F(ColorGain, TheWholeImageStepAgreesWithOiiotool) {
     if (!T::HaveProgram("oiiotool")) GTEST_SKIP() << "oiiotool is not installed";
     // Gain, lift, gamma and saturation as oiiotool's multiply, add, power and saturate, on values that the lift keeps
     // above 0 (its power of a negative value is not a number).
-    const T::TempDir dir;
     Ref<Image> src = T::PatternImage(33, 17, DepthRGBAFlt32, 3);
     Ref<Image> theirs = ThroughOiiotool(
         *src, dir.path, "--mulc 1.32,0.99,1.1 --addc 0.35,0.35,0.35 --powc 1.25,0.625,0.8 --saturate 0.7 -d float");
     ASSERT_TRUE(theirs);
     Chain chain(src, "ColorGain");
-    T::SetNumbers(chain.last, {{"Gain", 1.1},
-                               {"RedGain", 1.2},
-                               {"GreenGain", 0.9},
-                               {"Lift", 0.35},
-                               {"Gamma", 1.25},
-                               {"RedGamma", 0.64},
-                               {"GreenGamma", 1.28},
-                               {"Saturation", 0.7}});
+    T::SetNumbers(chain.last, {{"Gain", 1.1}, {"RedGain", 1.2}, {"GreenGain", 0.9}, {"Lift", 0.35}});
+    T::SetNumbers(chain.last, {{"Gamma", 1.25}, {"RedGamma", 0.64}, {"GreenGamma", 1.28}, {"Saturation", 0.7}});
     Ref<Image> ours = chain.Run();
     ASSERT_TRUE(ours);
     EXPECT_LT(WorstDifference(*ours, *theirs, ours->DataWindow()), 2e-6);
@@ -169,5 +153,4 @@ TEST_F(ColorGain, TheDeviceMatchesTheRows) {
         }
 }
 
-} // namespace
 } // namespace Orvane::colortest::colorgain

@@ -83,6 +83,11 @@ inline void ExpectColoursNear(const Ref<Image> &img, const std::vector<Rgb> &wan
         for (int c = 0; c < 3; ++c) EXPECT_NEAR(ToPx(img->GetFlt(int(i), 0))[c], want[i][c], tol) << i << "/" << c;
 }
 
+/// Expects `out` null and the document's console to hold `line`.
+inline void ExpectFailure(const Ref<Image> &out, const OrvaneDoc &doc, const std::string &line) {
+    EXPECT_TRUE(!out && T::ConsoleText(doc).find(line) != std::string::npos) << T::ConsoleText(doc);
+}
+
 /// `src` through oiiotool with `args` between reading and writing (the files in `dir`); null when it failed.
 inline Ref<Image> ThroughOiiotool(const Image &src, const std::string &dir, const std::string &args) {
     T::WritePfm(src, dir + "/oiio-in.pfm");
@@ -102,14 +107,6 @@ inline double WorstDifference(const Image &a, const Image &b, const ImgRectI &r,
                 worst = std::max(worst, relative ? d / std::max(1.0, std::fabs(want)) : d);
             }
     return worst;
-}
-
-/// Expects `a` to hold `b`'s bytes over `r`.
-inline void ExpectSameBits(const Image &a, const Image &b, const ImgRectI &r) {
-    for (int y = r.y0; y < r.y1; ++y)
-        ASSERT_EQ(std::memcmp(a.PixelAddress(r.x0, y), b.PixelAddress(r.x0, y), size_t(r.Width()) * a.BytesPerPixel()),
-                  0)
-            << "row " << y;
 }
 
 using Setter = std::function<void(Operator *)>;
@@ -151,6 +148,12 @@ inline void ExpectFrameRules(const char *cls, const Setter &set, const Model &mo
                         ASSERT_NEAR(got[c], std::clamp(want[c], 0.0, 1.0), std::max(0.52 * step, tol))
                             << x << "," << y << " channel " << c;
             };
+            auto expectSameBits = [](const Image &a, const Image &b, const ImgRectI &r) {
+                for (int y = r.y0; y < r.y1; ++y)
+                    ASSERT_EQ(
+                        std::memcmp(a.PixelAddress(r.x0, y), b.PixelAddress(r.x0, y), r.Width() * a.BytesPerPixel()), 0)
+                        << "row " << y;
+            };
             Chain chain(src, cls);
             set(chain.last);
             T::SetID(chain.last, "ClippingMode", mode);
@@ -172,14 +175,14 @@ inline void ExpectFrameRules(const char *cls, const Setter &set, const Model &mo
                 const ImgRectI rendered = cropsToRegion ? window & roi : window;
                 ASSERT_TRUE(part && part->DataWindow() == rendered && part->ValidWindow() == rendered);
                 EXPECT_EQ(part->GetCanvasColor(), out->GetCanvasColor());
-                ExpectSameBits(*part, *out, window & roi);
+                expectSameBits(*part, *out, window & roi);
             }
             const int before = WorkerCount();
             SetWorkerCount(1);
             Ref<Image> one = chain.Run();
             SetWorkerCount(before);
             ASSERT_TRUE(one && one.Get() != out.Get());
-            ExpectSameBits(*one, *out, window);
+            expectSameBits(*one, *out, window);
         }
 }
 

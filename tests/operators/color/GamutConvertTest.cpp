@@ -1,13 +1,9 @@
 // GamutConvert: published conversion matrices with the frame rules, white kept between every pair of gamuts, curves
 // by their formulas, and round trips.
-#include <string>
-
-#include <gtest/gtest.h>
 
 #include "tests/operators/color/ColorTestSupport.h"
 
 namespace Orvane::colortest::gamut {
-namespace {
 
 enum Gamut { Rec709, Rec2020, DCIP3, DisplayP3, AP0, AP1 };
 enum Curve { Linear, SRGB, Rec709Curve, Gamma, Cineon };
@@ -70,5 +66,4 @@ TEST_F(GamutConvertTest, CurvesAndRoundTrips) {
         ExpectColoursNear(Through(colours, {Convert(a, ac, b, bc), Convert(b, bc, a, ac)}), colours, 1e-4);
 }
 
-} // namespace
 } // namespace Orvane::colortest::gamut
