@@ -1,5 +1,3 @@
-// ColorConfig: names, roles and aliases of the built-in configuration, what cannot be read, and the document
-// preference.
 #include <string>
 
 #include <gtest/gtest.h>

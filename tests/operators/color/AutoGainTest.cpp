@@ -1,5 +1,3 @@
-// AutoGain against its stretch worked out from the test's own measurement of the source, on every depth with the
-// frame rules (a region still measures the whole input); values that are not finite, and flat images.
 #include <limits>
 
 #include "tests/operators/color/ColorTestSupport.h"

@@ -1,6 +1,3 @@
-// ColorGain against a double-precision model of its formulas on every depth with the frame rules, neutral settings,
-// a bad range, oiiotool, and the device against the rows.
-
 #include "tests/host/krom/DeviceTestSupport.h"
 #include "tests/operators/color/ColorTestSupport.h"
 

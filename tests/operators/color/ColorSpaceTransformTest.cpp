@@ -1,6 +1,3 @@
-// ColorSpaceTransform and the Loader's and Saver's Color Space choice: the curves' formulas with the frame rules,
-// float round trips, where the configuration comes from, what cannot be found, and oiiotool with the same
-// configuration.
 #include <cstdlib>
 #include <filesystem>
 
@@ -50,7 +47,7 @@ TEST_F(ColorSpaceTransformTest, CurvesByNameRoleAndAliasKeepTheFrameRules) {
         {"cineon", "linear", CineonToLinear}};
     for (const auto &[from, to, f] : cases) {
         SCOPED_TRACE(std::string(from) + " -> " + to);
-        auto set = [&](Operator *op) { SetTexts(op, Spaces(from, to)); };
+        auto set = [&](Operator *op) { T::SetText(op, "FromSpace", from), T::SetText(op, "ToSpace", to); };
         auto model = [&](const Image &, const Px &p) { return Px{f(p[0]), f(p[1]), f(p[2]), p[3]}; };
         ExpectFrameRules("ColorSpaceTransform", set, model, 2e-5, {DepthRGBAFlt32, DepthRGBAFlt16, DepthRGBAInt16},
                          false); // it renders whole windows
@@ -135,8 +132,8 @@ TEST_F(ColorSpaceTransformTest, SameAsOiiotool) {
     Ref<Image> theirs =
         ThroughOiiotool(*src, dir.path, "--colorconfig " + config + " --colorconvert sRGB \"Linear Rec.2020\"");
     ASSERT_TRUE(theirs);
-    Chain chain(src, "ColorSpaceTransform");
-    SetTexts(chain.last, Spaces("sRGB", "Linear Rec.2020"));
+    Chain chain(src);
+    chain.Add("ColorSpaceTransform", Spaces("sRGB", "Linear Rec.2020"));
     Ref<Image> ours = chain.Run();
     ASSERT_TRUE(ours);
     EXPECT_LT(WorstDifference(*ours, *theirs, ours->DataWindow()), 1e-5);

@@ -1,6 +1,3 @@
-// GamutConvert: published conversion matrices with the frame rules, white kept between every pair of gamuts, curves
-// by their formulas, and round trips.
-
 #include "tests/operators/color/ColorTestSupport.h"
 
 namespace Orvane::colortest::gamut {

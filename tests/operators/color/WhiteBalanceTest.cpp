@@ -1,6 +1,3 @@
-// WhiteBalance: a picked colour becomes the grey of its luminance in either space, temperature whites against
-// published chromaticities, forward then reverse, neutral settings, whites it cannot scale, and the frame rules.
-
 #include "tests/operators/color/ColorTestSupport.h"
 
 namespace Orvane::colortest::whitebalance {
