@@ -6,7 +6,7 @@
 #include "host/media/Clip.h"
 #include "tests/operators/color/ColorTestSupport.h"
 
-namespace Orvane::colortest::cst {
+namespace Orvane::colortest::managed {
 
 // The sRGB curve with its toe where the power's tangent passes through black (slope 12.923, rounded to 12.92 where
 // it is published).
@@ -139,4 +139,179 @@ TEST_F(ColorSpaceTransformTest, SameAsOiiotool) {
     EXPECT_LT(WorstDifference(*ours, *theirs, ours->DataWindow()), 1e-5);
 }
 
-} // namespace Orvane::colortest::cst
+using Function = std::function<Rgb(const Rgb &)>;
+
+double Clamp01(double v) { return std::clamp(v, 0.0, 1.0); }
+// Tables clamp their input to the domain 0..1 they are written over.
+Rgb Invert(const Rgb &c) { return {1 - Clamp01(c[0]), 1 - Clamp01(c[1]), 1 - Clamp01(c[2])}; }
+Rgb Rotate(const Rgb &c) { return {Clamp01(c[2]), Clamp01(c[0]), Clamp01(c[1])}; }
+Rgb Products(const Rgb &c) { return {c[0] * c[1], c[1] * c[2], c[2] * c[0]}; }
+
+/// A .cube 3D table of `n` points a side (red fastest), or an .spi3d table (`spi`, each line with its indices).
+std::string Table3D(const Function &f, int n, bool spi = false) {
+    std::string t = spi ? "SPILUT 1.0\n3 3\n2 2 2\n" : "LUT_3D_SIZE " + std::to_string(n) + "\n";
+    for (int i = 0; i < n * n * n; ++i) {
+        const int r = spi ? i / (n * n) : i % n, g = i / n % n, b = spi ? i % n : i / (n * n);
+        const Rgb o = f({r / (n - 1.0), g / (n - 1.0), b / (n - 1.0)});
+        if (spi) t += std::to_string(r) + " " + std::to_string(g) + " " + std::to_string(b) + " ";
+        t += std::to_string(o[0]) + " " + std::to_string(o[1]) + " " + std::to_string(o[2]) + "\n";
+    }
+    return t;
+}
+
+const char *const kInvertSpi1D = "Version 1\nFrom 0.0 1.0\nLength 2\nComponents 1\n{\n 1.0\n 0.0\n}\n";
+
+class FileLUTTest : public ToolTest {};
+
+TEST_F(FileLUTTest, ExactFunctionsAtEveryDepth) {
+    const std::tuple<const char *, std::string, Function> cases[] = {
+        {"invert.cube", Table3D(Invert, 2), Invert},
+        {"rotate.cube", Table3D(Rotate, 5), Rotate},
+        {"invert1d.cube", "LUT_1D_SIZE 2\n1 1 1\n0 0 0\n", Invert},
+        {"invert.spi1d", kInvertSpi1D, Invert},
+        {"rotate.spi3d", Table3D(Rotate, 2, true), Rotate},
+    };
+    for (const auto &[name, text, f] : cases) {
+        const std::string file = Write(name, text);
+        for (int depth : {DepthRGBAInt8, DepthRGBAInt16, DepthRGBAFlt16, DepthRGBAFlt32}) {
+            SCOPED_TRACE(std::string(name) + " depth " + std::to_string(depth));
+            Ref<Image> src = T::PatternImage(23, 7, depth, 3);
+            Chain chain(src);
+            chain.Add("FileLUT", {{"LUTFile", file}});
+            Ref<Image> out = chain.Run();
+            ASSERT_TRUE(out && out->Depth() == depth);
+            // The function's value stored at the depth (integers and halves round once); alpha passes.
+            Ref<Image> want = T::PatternImage(23, 7, depth, 3);
+            for (int y = 0; y < 7; ++y)
+                for (int x = 0; x < 23; ++x) {
+                    const FltPixel in = src->GetFlt(x, y);
+                    const Rgb w = f({in.R, in.G, in.B});
+                    want->PutFlt(x, y, {float(w[0]), float(w[1]), float(w[2]), in.A});
+                }
+            EXPECT_LE(WorstDifference(*out, *want, want->DataWindow(), 4), depth == DepthRGBAFlt32 ? 1e-6 : 0.0);
+        }
+    }
+}
+
+TEST_F(FileLUTTest, InterpolationAndDirection) {
+    const std::string spi1d = Write("invert.spi1d", kInvertSpi1D), rotate = Write("rotate.cube", Table3D(Rotate, 9)),
+                      products = Write("products.cube", Table3D(Products, 2));
+    const std::tuple<std::string, int, bool, std::vector<Rgb>, double> cases[] = {
+        // Products of channels from their values at the cube's corners: trilinear reading gives the products
+        // themselves; tetrahedral weighs the four corners along the path of the sorted coordinates (for 0.3,
+        // 0.7, 0: 000, 010, 110, 111 with weights 0.3, 0.4, 0.3, 0).
+        {products, 1, false, {{0.21, 0, 0}, {0.055, 0.495, 0.09}}, 1e-6},
+        {products, 2, false, {{0.3, 0, 0}, {0.1, 0.55, 0.1}}, 1e-6},
+        // Inverting 1 - x gives 1 - x again; the inverse of the rotation is found by search.
+        {spi1d, 1, true, {{0.7, 0.3, 1}, {0.9, 0.45, 0.1}}, 1e-5},
+        {rotate, 1, true, {{0.7, 0.0, 0.3}, {0.55, 0.9, 0.1}}, 1e-3},
+    };
+    for (const auto &[file, interpolation, inverse, want, tol] : cases) {
+        SCOPED_TRACE(file + " " + std::to_string(interpolation) + (inverse ? " inverse" : ""));
+        Chain chain(ColourRow({{0.3, 0.7, 0.0}, {0.1, 0.55, 0.9}}));
+        chain.Add("FileLUT", {{"LUTFile", file}}, {{"Interpolation", interpolation}, {"Direction", inverse}});
+        ExpectColoursNear(chain.Run(), want, tol);
+    }
+}
+
+TEST_F(FileLUTTest, RelativeNamesAndFilesThatCannotBeRead) {
+    Write("invert.cube", Table3D(Invert, 2));
+    Write("broken.cube", "LUT_3D_SIZE 2\n0 0 0\n1 1\n");
+    Write("unknown.xyz", "0 1\n");
+    for (const char *name : {"missing.cube", "broken.cube", "unknown.xyz"}) {
+        Chain chain(T::PatternImage(4, 4, DepthRGBAFlt32));
+        Operator *lut = chain.Add("FileLUT", {{"LUTFile", dir / name}});
+        ExpectFailure(chain.Run(), chain.doc, lut->Name() + ": cannot read LUT file '" + dir / name + "'");
+    }
+    // No file named yet: nothing to do, the input is handed on. A relative name is found in the document's folder.
+    Ref<Image> src = ColourRow({{0.25, 0.5, 1}});
+    Chain chain(src, "FileLUT");
+    EXPECT_EQ(chain.Run().Get(), src.Get());
+    chain.doc.SetFilePath(dir / "flow.orvane");
+    T::SetText(chain.last, "LUTFile", "invert.cube");
+    ExpectColoursNear(chain.Run(), {{0.75, 0.5, 0}}, 1e-6);
+}
+
+TEST_F(FileLUTTest, SameAsOiiotool) {
+    if (!T::HaveProgram("oiiotool")) GTEST_SKIP() << "oiiotool is not installed";
+    // A smooth table with cross-talk between the channels, 17 points a side. oiiotool reads a table only with a
+    // configuration at hand; ours serves.
+    const std::string cube = Write(
+        "look.cube",
+        Table3D(
+            [](const Rgb &c) {
+                return Rgb{std::pow(c[0], 0.8) * 0.9 + 0.1 * c[1], 0.2 * c[0] + 0.8 * std::sqrt(c[1]), c[2] * c[2]};
+            },
+            17));
+    const std::string config = Write("builtin.ocio", ColorConfig::BuiltInText());
+    Ref<Image> src = T::PatternImage(32, 16, DepthRGBAFlt32, 9);
+    Ref<Image> theirs = ThroughOiiotool(*src, dir.path, "--colorconfig " + config + " --ociofiletransform " + cube);
+    ASSERT_TRUE(theirs);
+    Chain chain(src);
+    chain.Add("FileLUT", {{"LUTFile", cube}});
+    Ref<Image> ours = chain.Run();
+    ASSERT_TRUE(ours);
+    EXPECT_LT(WorstDifference(*ours, *theirs, ours->DataWindow()), 1e-5);
+}
+
+enum Gamut { Rec709, Rec2020, DCIP3, DisplayP3, AP0, AP1 };
+enum Curve { Linear, SRGB, Rec709Curve, Gamma, Cineon };
+
+/// A Gamut tool's inputs.
+Numbers Convert(Gamut from, Curve fromCurve, Gamut to, Curve toCurve) {
+    return {{"SourceGamut", from}, {"SourceCurve", fromCurve}, {"OutputGamut", to}, {"OutputCurve", toCurve}};
+}
+
+Ref<Image> Through(const std::vector<Rgb> &colours, const std::vector<Numbers> &steps) {
+    Chain chain(ColourRow(colours));
+    for (const Numbers &settings : steps) chain.Add("GamutConvert", {}, settings);
+    return chain.Run();
+}
+
+class GamutConvertTest : public ToolTest {};
+
+TEST_F(GamutConvertTest, PublishedMatricesKeepTheFrameRules) {
+    // BT.2087 (Rec.709 to Rec.2020, four places) and the ACES AP0 to AP1 matrix (ten places).
+    const double bt2087[3][3] = {{0.6274, 0.3293, 0.0433}, {0.0691, 0.9195, 0.0114}, {0.0164, 0.0880, 0.8956}};
+    const double ap0ToAp1[3][3] = {{1.4514393161, -0.2365107469, -0.2149285693},
+                                   {-0.0765537734, 1.1762296998, -0.0996759264},
+                                   {0.0083161484, -0.0060324498, 0.9977163014}};
+    const std::tuple<Gamut, Gamut, const double(*)[3], double> cases[] = {{Rec709, Rec2020, bt2087, 1e-4},
+                                                                          {AP0, AP1, ap0ToAp1, 2e-6}};
+    for (const auto &[from, to, m, tol] : cases) {
+        auto set = [&](Operator *op) { T::SetNumbers(op, Convert(from, Linear, to, Linear)); };
+        auto model = [&](const Image &, const Px &p) {
+            Px w{0, 0, 0, p[3]};
+            for (int r = 0; r < 3; ++r) w[r] = m[r][0] * p[0] + m[r][1] * p[1] + m[r][2] * p[2];
+            return w;
+        };
+        ExpectFrameRules("GamutConvert", set, model, tol);
+    }
+}
+
+TEST_F(GamutConvertTest, WhiteStaysWhiteBetweenEveryPair) {
+    // The whites are adapted, so equal RGB stays equal RGB from any gamut to any other.
+    const std::vector<Rgb> greys = {{1, 1, 1}, {0.18, 0.18, 0.18}};
+    for (int from = Rec709; from <= AP1; ++from)
+        for (int to = Rec709; to <= AP1; ++to) {
+            SCOPED_TRACE(std::to_string(from) + " -> " + std::to_string(to));
+            ExpectColoursNear(Through(greys, {Convert(Gamut(from), Linear, Gamut(to), Linear)}), greys, 2e-6);
+        }
+}
+
+TEST_F(GamutConvertTest, CurvesAndRoundTrips) {
+    ExpectColoursNear(Through({{0.02, 0.5, 1}}, {Convert(Rec709, SRGB, Rec709, Linear)}),
+                      {{SrgbToLinear(0.02), SrgbToLinear(0.5), 1}}, 2e-5);
+    ExpectColoursNear(Through({{0.5, 0.25, 1}}, {Convert(Rec709, Gamma, Rec709, Linear)}), // the default gamma, 2.2
+                      {{std::pow(0.5, 2.2), std::pow(0.25, 2.2), 1}}, 2e-5);
+    const std::tuple<Gamut, Curve, Gamut, Curve> trips[] = {{Rec709, SRGB, AP1, Cineon},
+                                                            {DisplayP3, Rec709Curve, Rec2020, Gamma},
+                                                            {DCIP3, Gamma, AP0, Linear},
+                                                            {Rec2020, Cineon, Rec709, SRGB}};
+    // Colours well inside every gamut, so that no step clamps.
+    const std::vector<Rgb> colours = {{0.5, 0.5, 0.5}, {0.4, 0.5, 0.45}, {0.2, 0.3, 0.25}};
+    for (const auto &[a, ac, b, bc] : trips)
+        ExpectColoursNear(Through(colours, {Convert(a, ac, b, bc), Convert(b, bc, a, ac)}), colours, 1e-4);
+}
+
+} // namespace Orvane::colortest::managed
