@@ -28,6 +28,28 @@ std::vector<Rgb> Greys(double (*f)(double) = [](double v) { return v; }) {
 
 Texts Spaces(const std::string &from, const std::string &to) { return {{"FromSpace", from}, {"ToSpace", to}}; }
 
+using Function = std::function<Rgb(const Rgb &)>;
+
+double Clamp01(double v) { return std::clamp(v, 0.0, 1.0); }
+// Tables clamp their input to the domain 0..1 they are written over.
+Rgb Invert(const Rgb &c) { return {1 - Clamp01(c[0]), 1 - Clamp01(c[1]), 1 - Clamp01(c[2])}; }
+Rgb Rotate(const Rgb &c) { return {Clamp01(c[2]), Clamp01(c[0]), Clamp01(c[1])}; }
+Rgb Products(const Rgb &c) { return {c[0] * c[1], c[1] * c[2], c[2] * c[0]}; }
+
+/// A .cube 3D table of `n` points a side (red fastest), or an .spi3d table (`spi`, each line with its indices).
+std::string Table3D(const Function &f, int n, bool spi = false) {
+    std::string t = spi ? "SPILUT 1.0\n3 3\n2 2 2\n" : "LUT_3D_SIZE " + std::to_string(n) + "\n";
+    for (int i = 0; i < n * n * n; ++i) {
+        const int r = spi ? i / (n * n) : i % n, g = i / n % n, b = spi ? i % n : i / (n * n);
+        const Rgb o = f({r / (n - 1.0), g / (n - 1.0), b / (n - 1.0)});
+        if (spi) t += std::to_string(r) + " " + std::to_string(g) + " " + std::to_string(b) + " ";
+        t += std::to_string(o[0]) + " " + std::to_string(o[1]) + " " + std::to_string(o[2]) + "\n";
+    }
+    return t;
+}
+
+const char *const kInvertSpi1D = "Version 1\nFrom 0.0 1.0\nLength 2\nComponents 1\n{\n 1.0\n 0.0\n}\n";
+
 class ColorSpaceTransformTest : public ToolTest {
 protected:
     void SetUp() override { unsetenv("OCIO"); }
@@ -65,33 +87,43 @@ TEST_F(ColorSpaceTransformTest, FloatRoundTrips) {
     }
 }
 
-TEST_F(ColorSpaceTransformTest, ConfigurationSourcesAndFailures) {
+TEST_F(ColorSpaceTransformTest, WhereConfigurationsAndTablesComeFromAndWhatCannotBeRead) {
     // A configuration of our own: its space "squared" is the square of its reference.
     Write("own.ocio", "ocio_profile_version: 2\nroles: {default: ref}\ncolorspaces:\n"
                       "  - !<ColorSpace> {name: ref}\n"
                       "  - !<ColorSpace>\n    name: squared\n"
                       "    from_scene_reference: !<ExponentTransform> {value: 2}\n");
-    const std::tuple<const char *, const char *, const char *, const char *, std::string> cases[] = {
-        // preference, environment, from, to: 0.5 squared, or the console line
-        {"own.ocio", nullptr, "ref", "squared", ""},
-        {nullptr, "own.ocio", "ref", "squared", ""},
-        {nullptr, nullptr, "ref", "squared", "no colour space 'ref' in the configuration built-in"},
-        {nullptr, nullptr, "sRGB", "", "no colour space '' in the configuration built-in"},
-        {"missing.ocio", nullptr, "sRGB", "linear", "cannot read colour configuration '" + dir / "missing.ocio" + "'"},
+    Write("invert.cube", Table3D(Invert, 2)), Write("broken.cube", "LUT_3D_SIZE 2\n0 0 0\n1 1\n");
+    Write("unknown.xyz", "0 1\n");
+    const char *cst = "ColorSpaceTransform";
+    auto lut = [&](const char *name) { return Texts{{"LUTFile", dir / name}}; };
+    const std::tuple<const char *, const char *, const char *, Texts, double, std::string> cases[] = {
+        // preference, environment, tool, its inputs: the grey 0.25 made `want`, or the console line
+        {"own.ocio", nullptr, cst, Spaces("ref", "squared"), 0.0625, ""},
+        {nullptr, "own.ocio", cst, Spaces("ref", "squared"), 0.0625, ""},
+        {nullptr, nullptr, cst, Spaces("ref", "squared"), 0, "no colour space 'ref' in the configuration built-in"},
+        {nullptr, nullptr, cst, Spaces("sRGB", ""), 0, "no colour space '' in the configuration built-in"},
+        {"missing.ocio", nullptr, cst, Spaces("sRGB", "linear"), 0,
+         "cannot read colour configuration '" + dir / "missing.ocio" + "'"},
+        {nullptr, nullptr, "FileLUT", {}, 0.25, ""},                           // no file named yet
+        {nullptr, nullptr, "FileLUT", {{"LUTFile", "invert.cube"}}, 0.75, ""}, // in the document's folder
+        {nullptr, nullptr, "FileLUT", lut("missing.cube"), 0, "cannot read LUT file '" + dir / "missing.cube" + "'"},
+        {nullptr, nullptr, "FileLUT", lut("broken.cube"), 0, "cannot read LUT file '" + dir / "broken.cube" + "'"},
+        {nullptr, nullptr, "FileLUT", lut("unknown.xyz"), 0, "cannot read LUT file '" + dir / "unknown.xyz" + "'"},
     };
-    for (const auto &[pref, env, from, to, line] : cases) {
-        SCOPED_TRACE(line);
-        Chain chain(ColourRow({{0.5, 0.5, 0.5}}));
+    for (const auto &[pref, env, cls, texts, want, line] : cases) {
+        SCOPED_TRACE(std::string(cls) + " " + line);
+        Chain chain(ColourRow({{0.25, 0.25, 0.25}}));
         chain.doc.SetFilePath(dir / "flow.orvane");
         if (pref) chain.doc.SetColorConfigPath(pref);
         if (env) setenv("OCIO", (dir / env).c_str(), 1);
-        Operator *cst = chain.Add("ColorSpaceTransform", Spaces(from, to));
+        Operator *tool = chain.Add(cls, texts);
         Ref<Image> out = chain.Run();
         unsetenv("OCIO");
         if (line.empty())
-            ExpectColoursNear(out, {{0.25, 0.25, 0.25}}, 1e-5);
+            ExpectColoursNear(out, {{want, want, want}}, 1e-5);
         else
-            ExpectFailure(out, chain.doc, cst->Name() + ": " + line);
+            ExpectFailure(out, chain.doc, tool->Name() + ": " + line);
     }
 }
 
@@ -124,28 +156,6 @@ TEST_F(ColorSpaceTransformTest, LoaderAndSaverNameConfigurationSpaces) {
     const auto written = std::filesystem::directory_iterator(dir / "out")->path().string();
     ExpectColoursNear(Clip(written).GetFrameTagList(0, {}, error), Greys(LinearToSrgb), 2e-5);
 }
-
-using Function = std::function<Rgb(const Rgb &)>;
-
-double Clamp01(double v) { return std::clamp(v, 0.0, 1.0); }
-// Tables clamp their input to the domain 0..1 they are written over.
-Rgb Invert(const Rgb &c) { return {1 - Clamp01(c[0]), 1 - Clamp01(c[1]), 1 - Clamp01(c[2])}; }
-Rgb Rotate(const Rgb &c) { return {Clamp01(c[2]), Clamp01(c[0]), Clamp01(c[1])}; }
-Rgb Products(const Rgb &c) { return {c[0] * c[1], c[1] * c[2], c[2] * c[0]}; }
-
-/// A .cube 3D table of `n` points a side (red fastest), or an .spi3d table (`spi`, each line with its indices).
-std::string Table3D(const Function &f, int n, bool spi = false) {
-    std::string t = spi ? "SPILUT 1.0\n3 3\n2 2 2\n" : "LUT_3D_SIZE " + std::to_string(n) + "\n";
-    for (int i = 0; i < n * n * n; ++i) {
-        const int r = spi ? i / (n * n) : i % n, g = i / n % n, b = spi ? i % n : i / (n * n);
-        const Rgb o = f({r / (n - 1.0), g / (n - 1.0), b / (n - 1.0)});
-        if (spi) t += std::to_string(r) + " " + std::to_string(g) + " " + std::to_string(b) + " ";
-        t += std::to_string(o[0]) + " " + std::to_string(o[1]) + " " + std::to_string(o[2]) + "\n";
-    }
-    return t;
-}
-
-const char *const kInvertSpi1D = "Version 1\nFrom 0.0 1.0\nLength 2\nComponents 1\n{\n 1.0\n 0.0\n}\n";
 
 class FileLUTTest : public ToolTest {};
 
@@ -198,24 +208,6 @@ TEST_F(FileLUTTest, InterpolationAndDirection) {
         chain.Add("FileLUT", {{"LUTFile", file}}, {{"Interpolation", interpolation}, {"Direction", inverse}});
         ExpectColoursNear(chain.Run(), want, tol);
     }
-}
-
-TEST_F(FileLUTTest, RelativeNamesAndFilesThatCannotBeRead) {
-    Write("invert.cube", Table3D(Invert, 2));
-    Write("broken.cube", "LUT_3D_SIZE 2\n0 0 0\n1 1\n");
-    Write("unknown.xyz", "0 1\n");
-    for (const char *name : {"missing.cube", "broken.cube", "unknown.xyz"}) {
-        Chain chain(T::PatternImage(4, 4, DepthRGBAFlt32));
-        Operator *lut = chain.Add("FileLUT", {{"LUTFile", dir / name}});
-        ExpectFailure(chain.Run(), chain.doc, lut->Name() + ": cannot read LUT file '" + dir / name + "'");
-    }
-    // No file named yet: nothing to do, the input is handed on. A relative name is found in the document's folder.
-    Ref<Image> src = ColourRow({{0.25, 0.5, 1}});
-    Chain chain(src, "FileLUT");
-    EXPECT_EQ(chain.Run().Get(), src.Get());
-    chain.doc.SetFilePath(dir / "flow.orvane");
-    T::SetText(chain.last, "LUTFile", "invert.cube");
-    ExpectColoursNear(chain.Run(), {{0.75, 0.5, 0}}, 1e-6);
 }
 
 TEST_F(FileLUTTest, BothToolsAgreeWithOiiotool) {
