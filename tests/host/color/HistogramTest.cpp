@@ -135,7 +135,7 @@ TEST(Histogram, CountsMatchPerPixelCountAcrossDepthsRectanglesProxyTransparencyA
                 const FltPixel p = img->GetFlt(x, y);
                 const long a = to16(p.A);
                 if (ignoreTransparent && a == 0) continue;
-                auto value = [&](float v) {
+                auto value = [&, divide = divide](float v) {
                     return !divide ? to16(v) : a == 0 ? 0 : int(std::min(65535L, std::lround(65535.0 * to16(v) / a)));
                 };
                 const int r = value(p.R), g = value(p.G), b = value(p.B);

@@ -69,8 +69,10 @@ TEST_F(ColorSpaceTransformTest, CurvesByNameRoleAndAliasKeepTheFrameRules) {
         {"cineon", "linear", CineonToLinear}};
     for (const auto &[from, to, f] : cases) {
         SCOPED_TRACE(std::string(from) + " -> " + to);
-        auto set = [&](Operator *op) { T::SetText(op, "FromSpace", from), T::SetText(op, "ToSpace", to); };
-        auto model = [&](const Image &, const Px &p) { return Px{f(p[0]), f(p[1]), f(p[2]), p[3]}; };
+        auto set = [from = from, to = to](Operator *op) {
+            T::SetText(op, "FromSpace", from), T::SetText(op, "ToSpace", to);
+        };
+        auto model = [f = f](const Image &, const Px &p) { return Px{f(p[0]), f(p[1]), f(p[2]), p[3]}; };
         ExpectFrameRules("ColorSpaceTransform", set, model, 2e-5, {DepthRGBAFlt32, DepthRGBAFlt16, DepthRGBAInt16},
                          false); // it renders whole windows
     }
@@ -261,8 +263,8 @@ TEST_F(GamutConvertTest, PublishedMatricesKeepTheFrameRules) {
     const std::tuple<Gamut, Gamut, const double(*)[3], double> cases[] = {{Rec709, Rec2020, bt2087, 1e-4},
                                                                           {AP0, AP1, ap0ToAp1, 2e-6}};
     for (const auto &[from, to, m, tol] : cases) {
-        auto set = [&](Operator *op) { T::SetNumbers(op, Convert(from, Linear, to, Linear)); };
-        auto model = [&](const Image &, const Px &p) {
+        auto set = [from = from, to = to](Operator *op) { T::SetNumbers(op, Convert(from, Linear, to, Linear)); };
+        auto model = [m = m](const Image &, const Px &p) {
             Px w{0, 0, 0, p[3]};
             for (int r = 0; r < 3; ++r) w[r] = m[r][0] * p[0] + m[r][1] * p[1] + m[r][2] * p[2];
             return w;

@@ -2,23 +2,12 @@
 // What the tests of the colour tools share: a chain of tools after an image source rendered without the cache, rows
 // of known colours, oiiotool's result for the same image, a model compared on every depth, and the rules of the
 // processing frame that every per-pixel tool keeps.
-#include <algorithm>
-#include <array>
-#include <cmath>
 #include <fstream>
 #include <functional>
-#include <string>
-#include <utility>
-#include <vector>
 
 #include <gtest/gtest.h>
 
 #include "host/core/Parallel.h"
-#include "host/flow/Engine.h"
-#include "host/flow/OrvaneDoc.h"
-#include "host/flow/RenderTask.h"
-#include "host/flow/Request.h"
-#include "host/image/NewImage.h"
 #include "tests/host/image/ImageTestSupport.h"
 #include "tests/support/TestSupport.h"
 
