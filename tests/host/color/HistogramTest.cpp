@@ -1,10 +1,6 @@
 #include "host/color/Histogram.h"
 
-#include <algorithm>
 #include <atomic>
-#include <cmath>
-#include <initializer_list>
-#include <vector>
 
 #include <gtest/gtest.h>
 
