@@ -99,13 +99,12 @@ const std::vector<int> kFloatAndInt16 = {DepthRGBAFlt32, DepthRGBAInt16};
 const std::vector<int> kEveryDepth = {DepthRGBAFlt32, DepthRGBAFlt16, DepthRGBAInt16,
                                       DepthRGBAInt8,  DepthAFlt32,    DepthAInt16};
 
-/// The rules of the frame for tool `cls` (`set` makes its settings) at each of `depths`, with `model` the expected
-/// colour of an input colour (a mask: its value in every channel): float32 within `tol`, float16 within 1.5e-3
-/// (relative above 1), integers the nearest stored value within float rounding of the half-way points or within
-/// `tol`. Under each clipping mode: the data window, the canvas colour (processed, or kept under Domain and Frame),
-/// the processed canvas beyond the input's window, pre-calculation windows without pixels, regions of interest that
-/// are the same values as the whole frame (the source giving only the region asked for; the result cut to the region
-/// unless `cropsToRegion` is false), and the same values with one worker or many.
+/// The frame rules of tool `cls` (`set` makes its settings) at each of `depths` under each clipping mode, `model`
+/// giving the colour of an input colour (a mask: its value in every channel) within `tol` (float16: 1.5e-3, relative
+/// above 1; integers: the nearest code or `tol`): data window, canvas colour (processed, or kept under Domain and
+/// Frame), the processed canvas beyond the input's window, pre-calculation without pixels, regions (the source cutting
+/// its image to them) of the same values as the whole frame (cut to the region unless `cropsToRegion` is false), and
+/// workers.
 inline void ExpectFrameRules(const char *cls, const Setter &set, const Model &model, double tol,
                              const std::vector<int> &depths = kFloatAndInt16, bool cropsToRegion = true) {
     const ImgRectI inWindow(8, 4, 40, 28);
@@ -326,7 +325,7 @@ TEST_F(ColorTools, WhiteBalanceAPickedColourBecomesTheGreyOfItsLuminanceAndTheFr
     ExpectFrameRules("WhiteBalance", set, model, 2e-6, kEveryDepth);
 }
 
-TEST_F(ColorTools, WhiteBalanceTemperatureWhitesMatchPublishedChromaticities) {
+TEST_F(ColorTools, WhiteBalanceTemperatureWhitesMatchPublishedChromaticitiesAndReverseUndoesForward) {
     // Planckian whites: 2856 K (CIE illuminant A), 5000 K and 6500 K. The white of one temperature becomes the white
     // of the target, to the accuracy of the locus approximation, in either space.
     const double whites[][3] = {{2856, 0.44757, 0.40745}, {5000, 0.3451, 0.3516}, {6500, 0.3135, 0.3236}};
@@ -344,14 +343,11 @@ TEST_F(ColorTools, WhiteBalanceTemperatureWhitesMatchPublishedChromaticities) {
     T::SetNumbers(chain.last, {{"Method", 1}, {"Tint", 10}});
     const Ref<Image> out = chain.Run();
     ASSERT_TRUE(out && out->GetFlt(0, 0).G < std::min(out->GetFlt(0, 0).R, out->GetFlt(0, 0).B) - 0.01);
-}
-
-TEST_F(ColorTools, WhiteBalanceForwardThenReverseGivesTheInputBack) {
-    const Numbers cases[] = {Picked({0.7, 0.5, 0.2, 1}, 0),
-                             Picked({0.3, 0.6, 0.9, 1}, 1),
-                             {{"Method", 1}, {"Temperature", 3200}, {"Tint", -7}, {"TargetTemperature", 7500}}};
+    const Numbers settings[] = {Picked({0.7, 0.5, 0.2, 1}, 0),
+                                Picked({0.3, 0.6, 0.9, 1}, 1),
+                                {{"Method", 1}, {"Temperature", 3200}, {"Tint", -7}, {"TargetTemperature", 7500}}};
     for (int depth : {DepthRGBAFlt32, DepthRGBAFlt16})
-        for (const Numbers &values : cases) {
+        for (const Numbers &values : settings) {
             SCOPED_TRACE("depth " + std::to_string(depth) + ", Method " + std::to_string(values[0].second));
             Ref<Image> src = T::PatternImage(40, 9, depth, 11);
             Chain chain(src);
@@ -416,16 +412,13 @@ Px StretchModel(const Stretch &s, const Image &src, Px p) {
     return p;
 }
 
-TEST_F(ColorTools, AutoGainMatchesTheStretchOfItsOwnMeasurementOnEveryDepthAndKeepsTheFrameRules) {
+TEST_F(ColorTools, AutoGainMatchesTheStretchOfItsOwnMeasurementSkipsValuesThatAreNotFiniteAndHandsFlatImagesOn) {
     for (const Stretch &s : {Stretch{0.1, 0.8, false}, {0.1, 0.8, true}, {1, 0, false}, {-0.2, 1.3, true}}) {
         SCOPED_TRACE(std::to_string(s.low) + ".." + std::to_string(s.high) + (s.separate ? " separate" : ""));
         auto set = [&](Operator *op) { T::SetNumbers(op, Values(s)); };
         auto model = [&](const Image &src, const Px &p) { return StretchModel(s, src, p); };
         ExpectFrameRules("AutoGain", set, model, 2e-6, kEveryDepth);
     }
-}
-
-TEST_F(ColorTools, AutoGainSkipsValuesThatAreNotFiniteAndHandsFlatImagesOn) {
     const float nan = std::numeric_limits<float>::quiet_NaN(), inf = std::numeric_limits<float>::infinity();
     Ref<Image> odd = T::PatternImage(16, 4, DepthRGBAFlt32, 2);
     odd->PutFlt(3, 1, {nan, inf, -inf, 1});
@@ -490,7 +483,7 @@ std::string Table3D(const Function &f, int n, bool spi = false) {
 
 const char *const kInvertSpi1D = "Version 1\nFrom 0.0 1.0\nLength 2\nComponents 1\n{\n 1.0\n 0.0\n}\n";
 
-TEST_F(ColorTools, ColorSpaceTransformCurvesByNameRoleAndAliasKeepTheFrameRules) {
+TEST_F(ColorTools, ColorSpaceTransformCurvesByNameRoleAndAliasKeepTheFrameRulesAndRoundTrip) {
     // The tolerance covers the fast powers of the optimised transform.
     const std::tuple<const char *, const char *, double (*)(double)> cases[] = {
         {"sRGB", "Linear Rec.709", SrgbToLinear},
@@ -506,9 +499,6 @@ TEST_F(ColorTools, ColorSpaceTransformCurvesByNameRoleAndAliasKeepTheFrameRules)
         ExpectFrameRules("ColorSpaceTransform", set, model, 2e-5, {DepthRGBAFlt32, DepthRGBAFlt16, DepthRGBAInt16},
                          false); // it renders whole windows
     }
-}
-
-TEST_F(ColorTools, ColorSpaceTransformFloatRoundTrips) {
     // To linear and back through each encoding, from black up (below black the curves leave their use).
     const std::vector<Rgb> colours = {{0, 0.002, 0.04}, {0.18, 0.5, 0.8}, {1, 1.2, 1.5}};
     for (const char *space : {"sRGB", "Rec.709", "Cineon Log", "Linear Rec.2020"}) {
@@ -576,20 +566,15 @@ TEST_F(ColorTools, ColorSpaceTransformLoaderAndSaverNameConfigurationSpaces) {
     }
     // The Saver writes linear greys encoded for the role color_picking (sRGB).
     Chain chain(ColourRow(Greys()));
-    Operator *saver = chain.doc.AddTool(OvID("Saver"), "Out");
-    ASSERT_TRUE(saver->FindInput("Input")->ConnectTo(chain.last->FindMainOutput()));
     std::filesystem::create_directory(dir / "out");
-    Set(chain.doc, saver,
+    Set(chain.doc, chain.Add("Saver"),
         {{"Clip", dir / "out/greys.0000.raw"}, {"GamutSpace", "ColorSpace"}, {"GamutColorSpace", "color_picking"}});
-    RenderTask task;
-    EvalOptions opt;
-    opt.task = &task;
-    ASSERT_TRUE(Evaluate(saver->FindMainOutput(), 0.0, opt)) << T::ConsoleText(chain.doc);
+    ASSERT_TRUE(chain.Run()) << T::ConsoleText(chain.doc);
     const auto written = std::filesystem::directory_iterator(dir / "out")->path().string();
     ExpectColoursNear(Clip(written).GetFrameTagList(0, {}, error), Greys(LinearToSrgb), 2e-5);
 }
 
-TEST_F(ColorTools, FileLUTExactFunctionsAtEveryDepth) {
+TEST_F(ColorTools, FileLUTExactFunctionsAtEveryDepthInterpolationAndDirection) {
     const std::tuple<const char *, std::string, Function> cases[] = {
         {"invert.cube", Table3D(Invert, 2), Invert},
         {"rotate.cube", Table3D(Rotate, 5), Rotate},
@@ -616,12 +601,9 @@ TEST_F(ColorTools, FileLUTExactFunctionsAtEveryDepth) {
             EXPECT_LE(WorstDifference(*out, *want, want->DataWindow(), 4), depth == DepthRGBAFlt32 ? 1e-6 : 0.0);
         }
     }
-}
-
-TEST_F(ColorTools, FileLUTInterpolationAndDirection) {
     const std::string spi1d = Write("invert.spi1d", kInvertSpi1D), rotate = Write("rotate.cube", Table3D(Rotate, 9)),
                       products = Write("products.cube", Table3D(Products, 2));
-    const std::tuple<std::string, int, bool, std::vector<Rgb>, double> cases[] = {
+    const std::tuple<std::string, int, bool, std::vector<Rgb>, double> reads[] = {
         // Products of channels from their values at the cube's corners: trilinear reading gives the products
         // themselves; tetrahedral weighs the four corners along the path of the sorted coordinates (for 0.3,
         // 0.7, 0: 000, 010, 110, 111 with weights 0.3, 0.4, 0.3, 0).
@@ -631,7 +613,7 @@ TEST_F(ColorTools, FileLUTInterpolationAndDirection) {
         {spi1d, 1, true, {{0.7, 0.3, 1}, {0.9, 0.45, 0.1}}, 1e-5},
         {rotate, 1, true, {{0.7, 0.0, 0.3}, {0.55, 0.9, 0.1}}, 1e-3},
     };
-    for (const auto &[file, interpolation, inverse, want, tol] : cases) {
+    for (const auto &[file, interpolation, inverse, want, tol] : reads) {
         SCOPED_TRACE(file + " " + std::to_string(interpolation) + (inverse ? " inverse" : ""));
         Chain chain(ColourRow({{0.3, 0.7, 0.0}, {0.1, 0.55, 0.9}}));
         chain.Add("FileLUT", {{"LUTFile", file}}, {{"Interpolation", interpolation}, {"Direction", inverse}});
@@ -692,7 +674,7 @@ Ref<Image> Through(const std::vector<Rgb> &colours, const std::vector<Numbers> &
     return chain.Run();
 }
 
-TEST_F(ColorTools, GamutConvertPublishedMatricesKeepTheFrameRules) {
+TEST_F(ColorTools, GamutConvertPublishedMatricesFrameRulesWhiteCurvesAndRoundTrips) {
     // BT.2087 (Rec.709 to Rec.2020, four places) and the ACES AP0 to AP1 matrix (ten places).
     const double bt2087[3][3] = {{0.6274, 0.3293, 0.0433}, {0.0691, 0.9195, 0.0114}, {0.0164, 0.0880, 0.8956}};
     const double ap0ToAp1[3][3] = {{1.4514393161, -0.2365107469, -0.2149285693},
@@ -709,9 +691,6 @@ TEST_F(ColorTools, GamutConvertPublishedMatricesKeepTheFrameRules) {
         };
         ExpectFrameRules("GamutConvert", set, model, tol);
     }
-}
-
-TEST_F(ColorTools, GamutConvertWhiteStaysWhiteBetweenEveryPair) {
     // The whites are adapted, so equal RGB stays equal RGB from any gamut to any other.
     const std::vector<Rgb> greys = {{1, 1, 1}, {0.18, 0.18, 0.18}};
     for (int from = Rec709; from <= AP1; ++from)
@@ -719,9 +698,6 @@ TEST_F(ColorTools, GamutConvertWhiteStaysWhiteBetweenEveryPair) {
             SCOPED_TRACE(std::to_string(from) + " -> " + std::to_string(to));
             ExpectColoursNear(Through(greys, {Convert(Gamut(from), Linear, Gamut(to), Linear)}), greys, 2e-6);
         }
-}
-
-TEST_F(ColorTools, GamutConvertCurvesAndRoundTrips) {
     ExpectColoursNear(Through({{0.02, 0.5, 1}}, {Convert(Rec709, SRGB, Rec709, Linear)}),
                       {{SrgbToLinear(0.02), SrgbToLinear(0.5), 1}}, 2e-5);
     ExpectColoursNear(Through({{0.5, 0.25, 1}}, {Convert(Rec709, Gamma, Rec709, Linear)}), // the default gamma, 2.2
