@@ -139,7 +139,7 @@ TEST(Histogram, CountsMatchPerPixelCountAcrossDepthsRectanglesProxyTransparencyA
     SetWorkerCount(workersBefore);
 }
 
-TEST(Histogram, FailsWithoutPixelsOrOnAbortAndSizesFollowPrecision) {
+TEST(Histogram, FailsWithoutPixelsOrOnAbortSizesFollowPrecisionAndTheMatchRectangleRounds) {
     const Ref<Image> img = Orvane::Test::PatternImage(64, 64);
     std::atomic<bool> stop{true};
     img->SetAbortFlag(&stop);
@@ -155,9 +155,7 @@ TEST(Histogram, FailsWithoutPixelsOrOnAbortAndSizesFollowPrecision) {
     for (auto [precision, size] : {std::pair{-1, 256}, {0, 256}, {1, 1024}, {2, 65536}, {9, 65536}})
         EXPECT_EQ(Histogram::SizeForPrecision(precision), size) << precision;
     EXPECT_EQ(Histogram(300).Size(), 65536);
-}
-
-TEST(Histogram, MatchRectangleFloorsLeftAndBottomAndRoundsUpRightAndTop) {
+    // The match rectangle floors left and bottom and rounds up right and top.
     const ImgRectI frame(0, 0, 100, 50), window(10, 10, 60, 40);
     const std::tuple<ImgRectI, double, double, double, double, ImgRectI> cases[] = {
         {frame, 0.5, 0.5, 1.0, 1.0, frame},

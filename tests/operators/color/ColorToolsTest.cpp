@@ -117,10 +117,7 @@ inline void ExpectFrameRules(const char *cls, const Setter &set, const Model &mo
             Ref<Image> src = T::WindowedImage(48, 32, inWindow, {0.2f, 0.4f, 0.6f, 0.8f}, 3, depth);
             const bool isFloat = src->IsFloat(), mask = src->IsMask();
             const double step = isFloat ? 0 : depth == DepthRGBAInt8 ? 1.0 / 255 : 1.0 / 65535;
-            auto expected = [&](FltPixel p) {
-                if (mask) p.R = p.G = p.B = p.A;
-                return model(*src, ToPx(p));
-            };
+            auto expected = [&](const FltPixel &p) { return model(*src, mask ? Px{p.A, p.A, p.A, p.A} : ToPx(p)); };
             auto expectNear = [&](const Px &got, const Px &want, int x, int y) {
                 for (int c = mask ? 3 : 0; c < 4; ++c) {
                     const double w = isFloat ? want[c] : std::clamp(want[c], 0.0, 1.0);
@@ -194,9 +191,9 @@ void Apply(Operator *op, const Settings &s) {
     for (int r = 0; r < 4; ++r)
         for (int c = 0; c < 5; ++c) {
             const std::string pre = std::string(steps[r]) + chans[c];
-            T::SetNumbers(op, {{(pre + "Gain").c_str(), s.step[r].gain[c]},
-                               {(pre + "Lift").c_str(), s.step[r].lift[c]},
-                               {(pre + "Gamma").c_str(), s.step[r].gamma[c]}});
+            for (const auto &[name, v] :
+                 {std::pair{"Gain", s.step[r].gain}, {"Lift", s.step[r].lift}, {"Gamma", s.step[r].gamma}})
+                T::SetNumber(op, (pre + name).c_str(), v[c]);
             if (c != 3) T::SetNumber(op, (pre + "Saturation").c_str(), s.step[r].sat[c == 4 ? 3 : c]);
         }
     T::SetNumbers(op, {{"ShadowsEnd", s.shadowsEnd}, {"HighlightsStart", s.highlightsStart}});
