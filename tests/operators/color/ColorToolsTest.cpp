@@ -41,8 +41,7 @@ struct Chain {
     /// The last tool's output without the cache (on `device` in `task` when given); null when it failed.
     Ref<Image> Run(const ImgRectI *roi = nullptr, uint32_t flags = 0, IDeviceContext *device = nullptr,
                    RenderTask *task = nullptr) {
-        RenderTask own;
-        RenderTask &t = task ? *task : own;
+        RenderTask own, &t = task ? *task : own;
         t.SetDevice(device);
         EvalOptions opt;
         opt.task = &t, opt.flags = flags, opt.useCache = false;
@@ -79,8 +78,7 @@ inline Ref<Image> ThroughOiiotool(const Image &src, const std::string &dir, cons
     return T::ReadOiioDump(dir + "/oiio-out.exr", src.Width(), src.Height());
 }
 
-/// The largest difference of the first `channels` channels of `a` from `b` over `r` (absolute, or relative to `b`
-/// above 1).
+/// The largest difference of the first `channels` channels of `a` from `b` over `r` (or relative to `b` above 1).
 inline double WorstDifference(const Image &a, const Image &b, const ImgRectI &r, int channels = 3,
                               bool relative = false) {
     double worst = 0;
@@ -154,8 +152,7 @@ inline void ExpectFrameRules(const char *cls, const Setter &set, const Model &mo
             SetWorkerCount(1);
             Ref<Image> one = chain.Run();
             SetWorkerCount(before);
-            ASSERT_TRUE(one && one.Get() != out.Get());
-            EXPECT_EQ(WorstDifference(*one, *out, window, 4), 0);
+            EXPECT_TRUE(one && one.Get() != out.Get() && WorstDifference(*one, *out, window, 4) == 0) << "one worker";
         }
 }
 
@@ -212,16 +209,12 @@ Px ModelStep(const Step &s, Px p) {
     return p;
 }
 
-double Smooth(double t) {
-    t = std::clamp(t, 0.0, 1.0);
-    return t * t * (3 - 2 * t);
-}
-
 Px GainModel(const Settings &s, const Px &in) {
+    auto smooth = [](double t) { return t <= 0 ? 0 : t >= 1 ? 1 : t * t * (3 - 2 * t); };
     const Px p = ModelStep(s.step[0], in);
     const double y = Luminance(p);
-    const double sh = 1 - (s.shadowsEnd > 0 ? Smooth(y / s.shadowsEnd) : y > 0);
-    const double hi = s.highlightsStart < 1 ? Smooth((y - s.highlightsStart) / (1 - s.highlightsStart)) : y >= 1;
+    const double sh = 1 - (s.shadowsEnd > 0 ? smooth(y / s.shadowsEnd) : y > 0);
+    const double hi = s.highlightsStart < 1 ? smooth((y - s.highlightsStart) / (1 - s.highlightsStart)) : y >= 1;
     const double w[3] = {sh, 1 - sh - hi, hi}; // shadows, midtones, highlights
     Px out{};
     for (int r = 0; r < 3; ++r) {
@@ -239,14 +232,12 @@ std::vector<std::pair<const char *, Settings>> Cases() {
         s.step[0].gain[4] = 1.3, s.step[0].lift[4] = 0.05, s.step[0].gain[3] = 0.8, s.step[0].gain[0] = 1.2;
         s.step[0].gain[2] = 0.8, s.step[0].sat[3] = 0.6, s.step[0].sat[1] = 1.5;
     });
-    add("gamma per channel", [](Settings &s) {
-        s.step[0].gamma[4] = 1.4, s.step[0].gamma[0] = 0.7, s.step[0].gamma[3] = 2.0, s.step[0].lift[2] = 0.1;
-    });
     add("shadows lift, midtones gamma and saturation, highlights gain", [](Settings &s) {
         s.step[1].lift[4] = 0.1, s.step[3].gain[4] = 0.7, s.shadowsEnd = 0.3, s.highlightsStart = 0.6;
         s.step[0].gain[4] = 1.1, s.step[2].gamma[4] = 1.8, s.step[2].sat[3] = 0.5, s.step[2].gain[1] = 1.2;
     });
-    add("everything, ranges of no width", [](Settings &s) {
+    add("gamma per channel, ranges of no width", [](Settings &s) {
+        s.step[0].gamma[4] = 1.4, s.step[0].gamma[0] = 0.7, s.step[0].gamma[3] = 2.0, s.step[0].lift[2] = 0.1;
         s.step[0].gamma[1] = 0.5, s.step[0].sat[3] = 1.3, s.step[1].gamma[2] = 1.5, s.step[3].lift[0] = -0.05;
         s.step[3].sat[3] = 0, s.shadowsEnd = 0, s.highlightsStart = 1;
     });
@@ -281,9 +272,8 @@ TEST_F(ColorTools, ColorGainTheDeviceMatchesTheRows) {
             RenderTask task;
             Ref<Image> cpu = chain.Run(&roi), dev = chain.Run(&roi, 0, ctx, &task);
             ASSERT_TRUE(cpu && dev && dev->DataWindow() == cpu->DataWindow());
-            EXPECT_GT(ctx->LaunchCount(), launches) << "the device ran";
+            EXPECT_TRUE(ctx->LaunchCount() > launches && dev->GetCanvasColor() == cpu->GetCanvasColor()) << "ran";
             EXPECT_TRUE(task.DeviceLog().empty()) << task.DeviceLog().front();
-            EXPECT_EQ(dev->GetCanvasColor(), cpu->GetCanvasColor());
             EXPECT_LE(WorstDifference(*dev, *cpu, cpu->DataWindow(), 4, true), tol);
         }
 }
@@ -304,13 +294,11 @@ TEST_F(ColorTools, WhiteBalanceAPickedColourBecomesTheGreyOfItsLuminanceAndTheFr
     for (double space : {0.0, 1.0})
         for (const Px &n : picked) {
             SCOPED_TRACE(std::to_string(n[0]) + "," + std::to_string(n[1]) + (space ? " cones" : " RGB"));
-            // Premultiplied by 0.4: the same grey times alpha, alpha kept.
+            // Premultiplied by 0.4: the same grey times alpha.
             Chain chain(ColourRow({{0.4 * n[0], 0.4 * n[1], 0.4 * n[2]}}, 0.4f), "WhiteBalance");
             T::SetNumbers(chain.last, Picked(n, space));
-            Ref<Image> out = chain.Run();
             const double y = 0.4 * Luminance(n);
-            ExpectColoursNear(out, {{y, y, y}}, 2e-6);
-            EXPECT_EQ(out->GetFlt(0, 0).A, 0.4f);
+            ExpectColoursNear(chain.Run(), {{y, y, y}}, 2e-6);
         }
     // In RGB, a scale of each channel on every depth.
     const Px n{0.6, 0.45, 0.3, 1};
@@ -323,8 +311,7 @@ TEST_F(ColorTools, WhiteBalanceAPickedColourBecomesTheGreyOfItsLuminanceAndTheFr
 }
 
 TEST_F(ColorTools, WhiteBalanceTemperatureWhitesMatchPublishedChromaticitiesAndReverseUndoesForward) {
-    // Planckian whites: 2856 K (CIE illuminant A), 5000 K and 6500 K. The white of one temperature becomes the white
-    // of the target, to the accuracy of the locus approximation, in either space.
+    // Planckian whites (2856 K is CIE illuminant A) become those of the target, as the locus approximation allows.
     const double whites[][3] = {{2856, 0.44757, 0.40745}, {5000, 0.3451, 0.3516}, {6500, 0.3135, 0.3236}};
     for (const auto &from : whites)
         for (const auto &to : whites)
@@ -389,8 +376,8 @@ struct Stretch {
 
 Numbers Values(const Stretch &s) { return {{"Low", s.low}, {"High", s.high}, {"Channels", double(s.separate)}}; }
 
-/// The expected stretch of `p`, from the finite values of `src`'s data window: red, green and blue (a mask: its
-/// one channel, read as alpha) from their lowest and highest, together or each on its own, to Low and High.
+/// The stretch of `p` from the lowest and highest finite values of `src`'s data window (RGB together or each; a mask:
+/// alpha) to Low and High.
 Px StretchModel(const Stretch &s, const Image &src, Px p) {
     const int first = src.IsMask() ? 3 : 0, last = src.IsMask() ? 4 : 3;
     double lo[4] = {INFINITY, INFINITY, INFINITY, INFINITY}, hi[4] = {-INFINITY, -INFINITY, -INFINITY, -INFINITY};
@@ -438,8 +425,7 @@ TEST_F(ColorTools, AutoGainMatchesTheStretchOfItsOwnMeasurementSkipsValuesThatAr
     }
 }
 
-// The sRGB curve with its toe where the power's tangent passes through black (slope 12.923, rounded to 12.92 where
-// it is published).
+// The sRGB curve, its toe where the power's tangent meets black (slope 12.923; published rounded to 12.92).
 constexpr double kA = 0.055, kG = 2.4, kBreak = kA / (kG - 1);
 const double kSlope = kBreak / std::pow((kBreak + kA) / (1 + kA), kG);
 double SrgbToLinear(double v) { return v <= kBreak ? v / kSlope : std::pow((v + kA) / (1 + kA), kG); }
@@ -506,7 +492,7 @@ TEST_F(ColorTools, ColorSpaceTransformCurvesByNameRoleAndAliasKeepTheFrameRulesA
     }
 }
 
-TEST_F(ColorTools, ColorSpaceTransformWhereConfigurationsAndTablesComeFromAndWhatCannotBeRead) {
+TEST_F(ColorTools, ColorSpaceTransformWhereConfigurationsAndTablesComeFromWhatCannotBeReadAndTheLoaderAndSaver) {
     // A configuration of our own: its space "squared" is the square of its reference.
     Write("own.ocio", "ocio_profile_version: 2\nroles: {default: ref}\ncolorspaces:\n"
                       "  - !<ColorSpace> {name: ref}\n"
@@ -544,9 +530,6 @@ TEST_F(ColorTools, ColorSpaceTransformWhereConfigurationsAndTablesComeFromAndWha
         else
             ExpectFailure(out, chain.doc, tool->Name() + ": " + line);
     }
-}
-
-TEST_F(ColorTools, ColorSpaceTransformLoaderAndSaverNameConfigurationSpaces) {
     // A float file of sRGB-encoded greys; the Loader takes them to scene_linear, or fails naming the space.
     const std::string file = dir / "greys.raw";
     std::string error;
@@ -601,9 +584,8 @@ TEST_F(ColorTools, FileLUTExactFunctionsAtEveryDepthInterpolationAndDirection) {
     const std::string spi1d = Write("invert.spi1d", kInvertSpi1D), rotate = Write("rotate.cube", Table3D(Rotate, 9)),
                       products = Write("products.cube", Table3D(Products, 2));
     const std::tuple<std::string, int, bool, std::vector<Rgb>, double> reads[] = {
-        // Products of channels from their values at the cube's corners: trilinear reading gives the products
-        // themselves; tetrahedral weighs the four corners along the path of the sorted coordinates (for 0.3,
-        // 0.7, 0: 000, 010, 110, 111 with weights 0.3, 0.4, 0.3, 0).
+        // Products of channels from the cube's corners: trilinear gives the products; tetrahedral weighs the corners
+        // on the path of the sorted coordinates (for 0.3, 0.7, 0: 000, 010, 110, 111 by 0.3, 0.4, 0.3, 0).
         {products, 1, false, {{0.21, 0, 0}, {0.055, 0.495, 0.09}}, 1e-6},
         {products, 2, false, {{0.3, 0, 0}, {0.1, 0.55, 0.1}}, 1e-6},
         // Inverting 1 - x gives 1 - x again; the inverse of the rotation is found by search.
@@ -620,30 +602,19 @@ TEST_F(ColorTools, FileLUTExactFunctionsAtEveryDepthInterpolationAndDirection) {
 
 TEST_F(ColorTools, ColorGainColorSpaceTransformAndFileLUTAgreeWithOiiotool) {
     if (!T::HaveProgram("oiiotool")) GTEST_SKIP() << "oiiotool is not installed";
-    // ColorGain's gain, lift, gamma and saturation as oiiotool's multiply, add, power and saturate, on values that the
-    // lift keeps above 0 (its power of a negative value is not a number). A smooth table with cross-talk between the
-    // channels, 17 points a side: oiiotool reads a table only with a configuration at hand; ours serves.
+    // ColorGain as oiiotool's multiply, add, power and saturate, the lift keeping values above 0 (its power of a
+    // negative is not a number); a smooth table with cross-talk, read by oiiotool with our configuration at hand.
     const std::string config = Write("builtin.ocio", ColorConfig::BuiltInText());
-    const std::string cube = Write(
-        "look.cube",
-        Table3D(
-            [](const Rgb &c) {
-                return Rgb{std::pow(c[0], 0.8) * 0.9 + 0.1 * c[1], 0.2 * c[0] + 0.8 * std::sqrt(c[1]), c[2] * c[2]};
-            },
-            17));
+    auto look = [](const Rgb &c) {
+        return Rgb{std::pow(c[0], 0.8) * 0.9 + 0.1 * c[1], 0.2 * c[0] + 0.8 * std::sqrt(c[1]), c[2] * c[2]};
+    };
+    const std::string cube = Write("look.cube", Table3D(look, 17));
+    Numbers gain = {{"Gain", 1.1}, {"RedGain", 1.2}, {"GreenGain", 0.9}, {"Lift", 0.35}, {"Gamma", 1.25}};
+    gain.insert(gain.end(), {{"RedGamma", 0.64}, {"GreenGamma", 1.28}, {"Saturation", 0.7}});
+    const std::string gainArgs =
+        "--mulc 1.32,0.99,1.1 --addc 0.35,0.35,0.35 --powc 1.25,0.625,0.8 --saturate 0.7 -d float";
     const std::tuple<const char *, Texts, Numbers, std::string, double> cases[] = {
-        {"ColorGain",
-         {},
-         {{"Gain", 1.1},
-          {"RedGain", 1.2},
-          {"GreenGain", 0.9},
-          {"Lift", 0.35},
-          {"Gamma", 1.25},
-          {"RedGamma", 0.64},
-          {"GreenGamma", 1.28},
-          {"Saturation", 0.7}},
-         "--mulc 1.32,0.99,1.1 --addc 0.35,0.35,0.35 --powc 1.25,0.625,0.8 --saturate 0.7 -d float",
-         2e-6},
+        {"ColorGain", {}, gain, gainArgs, 2e-6},
         {"ColorSpaceTransform", Spaces("sRGB", "Linear Rec.2020"), {}, "--colorconvert sRGB \"Linear Rec.2020\"", 1e-5},
         {"FileLUT", {{"LUTFile", cube}}, {}, "--ociofiletransform " + cube, 1e-5}};
     Ref<Image> src = T::PatternImage(32, 16, DepthRGBAFlt32, 9);
@@ -660,7 +631,6 @@ TEST_F(ColorTools, ColorGainColorSpaceTransformAndFileLUTAgreeWithOiiotool) {
 enum Gamut { Rec709, Rec2020, DCIP3, DisplayP3, AP0, AP1 };
 enum Curve { Linear, SRGB, Rec709Curve, Gamma, Cineon };
 
-/// A Gamut tool's inputs.
 Numbers Convert(Gamut from, Curve fromCurve, Gamut to, Curve toCurve) {
     return {{"SourceGamut", from}, {"SourceCurve", fromCurve}, {"OutputGamut", to}, {"OutputCurve", toCurve}};
 }
