@@ -10,7 +10,7 @@
 #include "tests/host/krom/DeviceTestSupport.h"
 #include "tests/support/TestSupport.h"
 
-namespace Orvane::colortest {
+namespace Orvane::colortoolstest {
 namespace T = Orvane::Test;
 
 using Px = std::array<double, 4>;
@@ -679,4 +679,4 @@ TEST_F(ColorTools, GamutConvertPublishedMatricesFrameRulesWhiteCurvesAndRoundTri
         ExpectColoursNear(Through(colours, {Convert(a, ac, b, bc), Convert(b, bc, a, ac)}), colours, 1e-4);
 }
 
-} // namespace Orvane::colortest
+} // namespace Orvane::colortoolstest
