@@ -843,7 +843,7 @@ void ColorCorrector::ProcessHistogram(Request *req, Image *src, bool match) {
         LoadFlt(depth, canvasPixel, 1, &canvas);
         dst->SetCanvasColor(canvas);
     }
-    if (!dst->ValidWindow().IsNull()) {
+    if (!dst->ValidWindow().IsNull() && !(IsGPUEnabled(req, true) && RunEqualizeDevice(req, src, dst.Get()))) {
         if (!src->DownloadGPUMem() || !dst->AllocScanLineData()) return FailOutOfMemory(req);
         const PointRows rows(*src, *dst, canvasPixel);
         DoMultiProcess(
@@ -854,6 +854,39 @@ void ColorCorrector::ProcessHistogram(Request *req, Image *src, bool match) {
     }
     if (clipping != ClippingMode_None) dst->CopyCanvasColor(src);
     req->SetOutputData(output_, dst.Get());
+}
+
+bool ColorCorrector::RunEqualizeDevice(Request *req, const Image *src, Image *dst) {
+    const HistogramSettings &s = histogramSettings_;
+    const Histogram &h = *s.curves;
+    // The four curves as one RGBA float texel per bin, rows of up to 1024 bins.
+    const int width = std::min(h.Size(), 1024), rows = h.Size() / width;
+    Ref<Image> tables = NewImageTagList({{ImgWidth, width}, {ImgHeight, rows}, {ImgDepth, DepthRGBAFlt32}});
+    if (!tables || !tables->AllocScanLineData()) return false;
+    for (int k = 0; k < h.Size(); ++k) {
+        float *texel = tables->Row<float>(k / width) + 4 * (k % width);
+        texel[0] = h.GetValueL(k), texel[1] = h.GetValueR(k), texel[2] = h.GetValueG(k), texel[3] = h.GetValueB(k);
+    }
+    auto block = std::make_shared<CCProcessEqualizeParams>();
+    CCProcessEqualizeParams &p = *block;
+    const FltPixel canvas = dst->GetCanvasColor(); // already through the pixel function
+    const float canvasColor[4] = {canvas.R, canvas.G, canvas.B, canvas.A};
+    std::memcpy(p.processCanvasColor, canvasColor, sizeof canvasColor);
+    std::memcpy(p.colorMat, s.toLumaFirst.m, sizeof s.toLumaFirst.m);
+    std::memcpy(p.colorMat + 12, s.fromLumaFirst.m, sizeof s.fromLumaFirst.m);
+    p.histogramBlendL = s.luminance ? 1.f : 0.f;
+    p.preDivide = s.preDivide;
+    p.shift = h.Shift(), p.sampleCount = h.Size(), p.sampleWidth = width;
+    const bool hasPixels = src->HasScanLineData() || src->IsGPUMemDirty();
+    const ImgRectI in = hasPixels ? src->DataWindow() : ImgRectI(), out = dst->DataWindow();
+    const int srcWindow[4] = {in.x0, in.x1, in.y0, in.y1}, dstWindow[4] = {out.x0, out.x1, out.y0, out.y1};
+    std::memcpy(p.srcWindow, srcWindow, sizeof srcWindow);
+    std::memcpy(p.dstWindow, dstWindow, sizeof dstWindow);
+    p.workSize[0] = out.Width(), p.workSize[1] = out.Height();
+    return KROMComputeNode::ExecKernelI(
+        req, "CCProcessEqualize", nullptr, CCProcessEqualizeParamsText, sizeof p,
+        offsetof(CCProcessEqualizeParams, srcCompOrder), offsetof(CCProcessEqualizeParams, dstCompOrder), block,
+        {{"input", const_cast<Image *>(src)}, {"tables", tables.Get()}, {"output", dst}});
 }
 
 // ---- a frame ----

@@ -26,7 +26,7 @@
 // pixel), curves are built that equalise it or match it onto the reference's
 // (MatchReference, or the histogram kept by Snapshot Match Time until Release
 // Match), and the pixel function reads the curves
-// (ColorCorrectorHistogram.h). The
+// (ColorCorrectorHistogram.h); "CCProcessEqualize" runs it on a device. The
 // snapshot's counts are kept in the hidden input MatchSnapshotData, so a
 // saved document keeps them.
 //
@@ -85,6 +85,8 @@ private:
     bool RunDevice(Request *req, const Image *src, Image *dst, bool rangeOutput, int shown);
     /// The histogram modes: counts, builds the curves, corrects.
     void ProcessHistogram(Request *req, Image *src, bool match);
+    /// The kernel "CCProcessEqualize"; false when it did not run.
+    bool RunEqualizeDevice(Request *req, const Image *src, Image *dst);
     HistogramSampling Sampling(double proxy, double ignoreTransparent, double prePost) const;
     /// Counts the reference of Match now and keeps it in MatchSnapshotData (Snapshot Match Time).
     void TakeSnapshot(double time);

@@ -708,5 +708,39 @@ TEST_F(ColorCorrector, DeviceMatchesTheRows) {
     }
 }
 
+TEST_F(ColorCorrector, HistogramKernelMatchesTheRows) {
+    ORVANE_NEED_OPENCL(ctx);
+    const char *const cases[] = {
+        "HistogramType=1 EqualizeRed=1 EqualizeGreen=0.6 EqualizeBlue=1 Precision=0",
+        "HistogramType=1 EqualizeLuminance=0.7 LockRedGreenBlue=0 EqualizeBlue=1 Precision=1 PreDividePostMultiply=1",
+        "HistogramType=2 EqualizeLuminance=1 EqualizeRed=1 SmoothOutCorrectionCurve=0.3",
+    };
+    const ImgRectI dw(-3, 5, 50, 38), roi(12, 2, 61, 33);
+    for (int depth : {DepthRGBAFlt32, DepthRGBAInt8}) {
+        Ref<Image> src = ts::PatternImage(64, 40, depth, 5)->CopyOfImageTagList({{ImgDataWindow, &dw}});
+        src->SetCanvasColor(FltPixel{0.2f, -0.1f, 0.6f, 0.5f});
+        for (const char *text : cases) {
+            SCOPED_TRACE(std::string(text) + ", depth " + std::to_string(depth));
+            Rig rig(src);
+            rig.Set(Parse(text));
+            ASSERT_TRUE(rig.cc->FindInput("MatchReference")
+                            ->ConnectTo(ts::AddImageSource(rig.doc, "Ref", ts::PatternImage(30, 20, depth, 9))->Out()));
+            Ref<Image> cpu = Render(rig.cc, &roi);
+            RenderTask task;
+            task.SetDevice(ctx);
+            EvalOptions opt;
+            opt.task = &task, opt.useCache = false, opt.roi = ImageDomain(roi);
+            const int launches = ctx->LaunchCount();
+            Ref<Image> dev = ts::EvalImage(rig.cc, 0.0, opt);
+            ASSERT_TRUE(cpu && dev);
+            EXPECT_GT(ctx->LaunchCount(), launches) << "the device ran";
+            EXPECT_TRUE(task.DeviceLog().empty()) << task.DeviceLog().front();
+            ASSERT_EQ(dev->DataWindow(), cpu->DataWindow());
+            EXPECT_EQ(dev->GetCanvasColor(), cpu->GetCanvasColor());
+            ExpectSameBits(*dev, *cpu, cpu->DataWindow());
+        }
+    }
+}
+
 } // namespace
 } // namespace Orvane::cctest
