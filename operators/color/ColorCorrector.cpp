@@ -6,6 +6,7 @@
 #include <cstdlib>
 #include <cstring>
 #include <memory>
+#include <optional>
 #include <string>
 
 #include "host/color/ColorCurvesTable.h"
@@ -705,16 +706,23 @@ std::unique_ptr<Histogram> SnapshotFromScript(const ScriptVal &v) {
 /// The histogram correction over `count` stored pixels of `depth`.
 void HistogramSpan(const HistogramSettings &s, int depth, const uint8_t *src, uint8_t *dst, int count) {
     const int bpp = FormatOfDepth(depth).BytesPerPixel();
-    FltPixel block[kBlock];
+    FltPixel loaded[kBlock];
+    float block[kBlock][4];
     for (int i = 0; i < count; i += kBlock) {
         const int n = std::min(kBlock, count - i);
-        LoadFlt(depth, src + static_cast<size_t>(i) * bpp, n, block);
-        for (int k = 0; k < n; ++k) {
-            float p[4] = {block[k].R, block[k].G, block[k].B, block[k].A};
-            HistogramPixel(s, p);
-            block[k] = {p[0], p[1], p[2], p[3]};
+        const uint8_t *in = src + static_cast<size_t>(i) * bpp;
+        uint8_t *out = dst + static_cast<size_t>(i) * bpp;
+        if (depth == DepthRGBAFlt32) { // worked on in the output row itself
+            if (in != out) std::memcpy(out, in, static_cast<size_t>(n) * bpp);
+            HistogramBlock(s, reinterpret_cast<float(*)[4]>(out), n);
+            continue;
         }
-        StoreFlt(depth, block, n, dst + static_cast<size_t>(i) * bpp);
+        LoadFlt(depth, in, n, loaded);
+        for (int k = 0; k < n; ++k)
+            block[k][0] = loaded[k].R, block[k][1] = loaded[k].G, block[k][2] = loaded[k].B, block[k][3] = loaded[k].A;
+        HistogramBlock(s, block, n);
+        for (int k = 0; k < n; ++k) loaded[k] = {block[k][0], block[k][1], block[k][2], block[k][3]};
+        StoreFlt(depth, loaded, n, out);
     }
 }
 
@@ -771,7 +779,7 @@ void ColorCorrector::ProcessHistogram(Request *req, Image *src, bool match) {
         Sampling(req->GetInputNumber(proxyScale_), req->GetInputNumber(ignoreTransparent_), prePost);
 
     // The reference: the kept snapshot, else the Match Reference image.
-    Histogram counted(size), reduced(size);
+    std::optional<Histogram> counted; // the reference's counts, or the snapshot's in fewer bins
     const Histogram *reference = nullptr;
     if (match) {
         Parameter *kept = req->GetInputData(snapshotData_);
@@ -784,15 +792,16 @@ void ColorCorrector::ProcessHistogram(Request *req, Image *src, bool match) {
             if (!snapshot_) return fail("the kept match snapshot is damaged; take it again with Snapshot Match Time");
             if (snapshot_->Size() < size)
                 return fail("the kept match snapshot has fewer bins than the Precision asks for");
-            reduced = snapshot_->Reduced(size);
-            reference = snapshot_->Size() == size ? snapshot_.get() : &reduced;
+            if (snapshot_->Size() != size) counted = snapshot_->Reduced(size);
+            reference = counted ? &*counted : snapshot_.get();
         } else if (const auto *ref = dynamic_cast<const Image *>(req->GetInputData(matchReference_))) {
             if (!req->IsPreCalc()) {
-                if (!counted.CountImage(*ref, ref->DataWindow(), sampling)) {
+                counted.emplace(size);
+                if (!counted->CountImage(*ref, ref->DataWindow(), sampling)) {
                     if (!ref->CheckAbort()) fail("the Match Reference image's pixels could not be read");
                     return;
                 }
-                reference = &counted;
+                reference = &*counted;
             }
         } else {
             return fail("Match needs a Match Reference image or a snapshot (Snapshot Match Time)");
@@ -827,6 +836,11 @@ void ColorCorrector::ProcessHistogram(Request *req, Image *src, bool match) {
 
     HistogramSettings &s = histogramSettings_;
     s.curves = &h;
+    for (int i = 0; i < 3; ++i) {
+        const uint16_t *curve = h.Curve(static_cast<HistogramChannel>(1 + i));
+        s.rgb[i].resize(h.Size());
+        for (int k = 0; k < h.Size(); ++k) s.rgb[i][k] = curve[k] / 65535.f;
+    }
     s.luminance = choice.luminance;
     s.preDivide = s.postMultiply = prePost;
     s.toLumaFirst = ToLumaFirst().ToFloat();

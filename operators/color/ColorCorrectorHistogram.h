@@ -15,6 +15,8 @@
 // reads the identity curve (which still rounds to the bins).
 //
 // Thread safety: read-only once Process has filled it.
+#include <vector>
+
 #include "host/color/Histogram.h"
 #include "operators/color/ColorCorrectorRanges.h"
 
@@ -22,38 +24,65 @@ namespace Orvane::cc {
 
 struct HistogramSettings {
     const Histogram *curves = nullptr;
+    /// The R, G and B curves as 0..1 (value / 65535), Size() each, so a pixel reads its result at once.
+    std::vector<float> rgb[3];
     bool luminance = false; ///< step 3 runs
     bool preDivide = false, postMultiply = false;
     Matrix34 toLumaFirst, fromLumaFirst;
 };
 
 inline int To16(float v) {
-    const float c = v > 0.f ? (v < 1.f ? v : 1.f) : 0.f; // NaN reads as 0
+    float c = v > 0.f ? v : 0.f; // NaN reads as 0
+    c = c < 1.f ? c : 1.f;
     return static_cast<int>(c * 65535.f + 0.5f);
+}
+inline float Clamp16(float v) {
+    const float c = v > 0.f ? v : 0.f;
+    return c < 65535.f ? c : 65535.f;
+}
+
+/// The histogram correction of up to kBlock pixels, in place. Stage by stage
+/// over the block, so that all but the curve look-ups compile to vector
+/// operations.
+inline void HistogramBlock(const HistogramSettings &s, float (*p)[4], int n) {
+    if (s.preDivide)
+        for (int k = 0; k < n; ++k) PreDivide(p[k]);
+    const Histogram &h = *s.curves;
+    const int shift = h.Shift();
+    int v[3][kBlock];
+    for (int k = 0; k < n; ++k)
+        for (int i = 0; i < 3; ++i) v[i][k] = To16(p[k][i]);
+    if (s.luminance) {
+        const Matrix34 &to = s.toLumaFirst, &from = s.fromLumaFirst;
+        float y[3][kBlock];
+        for (int k = 0; k < n; ++k) {
+            const float in[3] = {float(v[0][k]), float(v[1][k]), float(v[2][k])};
+            for (int i = 0; i < 3; ++i)
+                y[i][k] = to.m[i][0] * in[0] + to.m[i][1] * in[1] + to.m[i][2] * in[2] + to.m[i][3];
+        }
+        for (int k = 0; k < n; ++k) y[0][k] = h.GetValueL(static_cast<int>(Clamp16(y[0][k]) + 0.5f) >> shift);
+        for (int k = 0; k < n; ++k)
+            for (int i = 0; i < 3; ++i)
+                v[i][k] = static_cast<int>(
+                    Clamp16(from.m[i][0] * y[0][k] + from.m[i][1] * y[1][k] + from.m[i][2] * y[2][k] + from.m[i][3]) +
+                    0.5f);
+    }
+    const float *r = s.rgb[0].data(), *g = s.rgb[1].data(), *b = s.rgb[2].data();
+    for (int k = 0; k < n; ++k) {
+        p[k][0] = r[v[0][k] >> shift];
+        p[k][1] = g[v[1][k] >> shift];
+        p[k][2] = b[v[2][k] >> shift];
+    }
+    if (s.postMultiply)
+        for (int k = 0; k < n; ++k) {
+            const float a = p[k][3] > -1e-6f && p[k][3] < 1e-6f ? 0.f : p[k][3];
+            for (int i = 0; i < 3; ++i) p[k][i] *= a;
+        }
 }
 
 /// The histogram correction of one pixel, in place.
 inline void HistogramPixel(const HistogramSettings &s, float p[4]) {
-    if (s.preDivide) PreDivide(p);
-    const Histogram &h = *s.curves;
-    const int shift = h.Shift();
-    int v[3] = {To16(p[0]), To16(p[1]), To16(p[2])};
-    if (s.luminance) {
-        float in[3] = {float(v[0]), float(v[1]), float(v[2])}, y[3], back[3];
-        s.toLumaFirst.Apply(in, y);
-        const float luma = y[0] > 0.f ? (y[0] < 65535.f ? y[0] : 65535.f) : 0.f;
-        y[0] = static_cast<float>(h.GetValueL(static_cast<int>(luma + 0.5f) >> shift));
-        s.fromLumaFirst.Apply(y, back);
-        for (int i = 0; i < 3; ++i)
-            v[i] = static_cast<int>((back[i] > 0.f ? (back[i] < 65535.f ? back[i] : 65535.f) : 0.f) + 0.5f);
-    }
-    p[0] = h.GetValueR(v[0] >> shift) / 65535.f;
-    p[1] = h.GetValueG(v[1] >> shift) / 65535.f;
-    p[2] = h.GetValueB(v[2] >> shift) / 65535.f;
-    if (s.postMultiply) {
-        const float a = p[3] > -1e-6f && p[3] < 1e-6f ? 0.f : p[3];
-        for (int i = 0; i < 3; ++i) p[i] *= a;
-    }
+    HistogramBlock(s, reinterpret_cast<float(*)[4]>(p), 1);
 }
 
 } // namespace Orvane::cc

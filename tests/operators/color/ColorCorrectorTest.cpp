@@ -545,6 +545,14 @@ TEST_F(ColorCorrector, MatchTakesTheReferencesHistogramWithinTheMatchRectangle) 
     }
     rig.cc->FindInput("ReleaseMatch")->SetValue(MakeRef<Number>(1.0));
     EXPECT_FALSE(Render(rig.cc));
+    // Kept counts that do not add up to their samples are refused with one line, never matched against.
+    ScriptVal damaged = ScriptVal::Table();
+    for (const char *c : {"L", "R", "G", "B"}) damaged.Set(c, "0 4 255 1 ");
+    damaged.Set("Size", 256);
+    damaged.Set("Samples", 6); // 5 counted
+    rig.cc->FindInput("MatchSnapshotData")->SetValue(MakeRef<ScriptValue>(damaged));
+    EXPECT_FALSE(Render(rig.cc));
+    EXPECT_NE(ts::ConsoleText(rig.doc).find("the kept match snapshot is damaged"), std::string::npos);
 
     // Equalising over the left half counts only it: the left half comes out flat, which the whole frame (half of
     // it white) does not give.
