@@ -22,6 +22,7 @@
 #include "host/image/NewImage.h"
 #include "host/image/PixelConvert.h"
 #include "host/krom/KROMComputeNode.h"
+#include "host/krom/PointKernel.h"
 #include "host/krom/kernels/ColorKernelParams.h"
 #include "operators/frame/Registration.h"
 
@@ -169,29 +170,27 @@ bool SuppressionIsNeutral(const double *sliders) {
     return std::all_of(sliders, sliders + 6, [](double v) { return Near(v, 1.0); });
 }
 
-/// The pixel function over `count` stored pixels of `depth` (any depth:
-/// integer values are worked on as 0..1 and rounded back on store).
-void CorrectSpan(const PixelSettings &s, bool rangeOutput, int shown, int depth, const uint8_t *src, uint8_t *dst,
-                 int count) {
+/// A block function (float (*p)[4], int n: up to kBlock RGBA pixels, in place) over `count` stored pixels of
+/// `depth` (any depth: integer values are worked on as 0..1 and rounded back on store).
+template <class Block> void BlockSpan(int depth, const uint8_t *src, uint8_t *dst, int count, const Block &block) {
     const int bpp = FormatOfDepth(depth).BytesPerPixel();
     FltPixel loaded[kBlock];
-    float block[kBlock][4];
+    float pixels[kBlock][4];
     for (int i = 0; i < count; i += kBlock) {
         const int n = std::min(kBlock, count - i);
         const uint8_t *in = src + static_cast<size_t>(i) * bpp;
         uint8_t *out = dst + static_cast<size_t>(i) * bpp;
-        if (depth == DepthRGBAFlt32 && !rangeOutput) { // worked on in the output row itself
+        if (depth == DepthRGBAFlt32) { // worked on in the output row itself
             if (in != out) std::memcpy(out, in, static_cast<size_t>(n) * bpp);
-            CorrectBlock(s, reinterpret_cast<float(*)[4]>(out), n);
+            block(reinterpret_cast<float(*)[4]>(out), n);
             continue;
         }
         LoadFlt(depth, in, n, loaded);
-        for (int k = 0; k < n; ++k) {
-            block[k][0] = loaded[k].R, block[k][1] = loaded[k].G, block[k][2] = loaded[k].B, block[k][3] = loaded[k].A;
-            if (rangeOutput) RangeOutput(s, shown, block[k]);
-        }
-        if (!rangeOutput) CorrectBlock(s, block, n);
-        for (int k = 0; k < n; ++k) loaded[k] = {block[k][0], block[k][1], block[k][2], block[k][3]};
+        for (int k = 0; k < n; ++k)
+            pixels[k][0] = loaded[k].R, pixels[k][1] = loaded[k].G, pixels[k][2] = loaded[k].B,
+            pixels[k][3] = loaded[k].A;
+        block(pixels, n);
+        for (int k = 0; k < n; ++k) loaded[k] = {pixels[k][0], pixels[k][1], pixels[k][2], pixels[k][3]};
         StoreFlt(depth, loaded, n, out);
     }
 }
@@ -575,11 +574,21 @@ void ColorCorrector::Fold(const Controls &c, PixelSettings &s, std::vector<Suppr
 
 // ---- the device ----
 
+namespace {
+/// The windows of one of the tool's kernel blocks (srcWindow, dstWindow, workSize), as every per-pixel kernel has them.
+template <class Params> void SetWindows(Params &p, const Image &src, const Image &dst) {
+    struct {
+        int inDataWindow[4], outDataWindow[4], workSize[2];
+    } w;
+    SetPointKernelWindows(w, src, dst);
+    std::memcpy(p.srcWindow, w.inDataWindow, sizeof w.inDataWindow);
+    std::memcpy(p.dstWindow, w.outDataWindow, sizeof w.outDataWindow);
+    std::memcpy(p.workSize, w.workSize, sizeof w.workSize);
+}
+} // namespace
+
 bool ColorCorrector::RunDevice(Request *req, const Image *src, Image *dst, bool rangeOutput, int shown) {
     const PixelSettings &s = settings_;
-    const bool hasPixels = src->HasScanLineData() || src->IsGPUMemDirty();
-    const ImgRectI in = hasPixels ? src->DataWindow() : ImgRectI(), out = dst->DataWindow();
-    const int srcWindow[4] = {in.x0, in.x1, in.y0, in.y1}, dstWindow[4] = {out.x0, out.x1, out.y0, out.y1};
     const FltPixel canvas = dst->GetCanvasColor(); // already through the pixel function
     const float canvasColor[4] = {canvas.R, canvas.G, canvas.B, canvas.A};
     constexpr int kWidth = ColorCurvesTable::kSamples;
@@ -600,9 +609,7 @@ bool ColorCorrector::RunDevice(Request *req, const Image *src, Image *dst, bool 
         std::memcpy(p.defaultP, canvasColor, sizeof canvasColor);
         p.channel = 0, p.selected = shown, p.sampleCount = kWidth, p.invSampleHeight = 1.f, p.sampleWidth = kWidth;
         p.preDivide = s.preDivide;
-        std::memcpy(p.srcWindow, srcWindow, sizeof srcWindow);
-        std::memcpy(p.dstWindow, dstWindow, sizeof dstWindow);
-        p.workSize[0] = out.Width(), p.workSize[1] = out.Height();
+        SetWindows(p, *src, *dst);
         return KROMComputeNode::ExecKernelI(
             req, "CCProcessRange", nullptr, CCProcessRangeParamsText, sizeof p,
             offsetof(CCProcessRangeParams, srcCompOrder), offsetof(CCProcessRangeParams, dstCompOrder), block,
@@ -642,9 +649,7 @@ bool ColorCorrector::RunDevice(Request *req, const Image *src, Image *dst, bool 
     p.orderTintChannel = s.gammaAfterLevels | s.tintMode << 1 | s.rangesInUse << 3;
     p.prePost = s.preDivide | s.postMultiply << 1;
     p.sampleCount[3] = kWidth, p.invSampleHeight = 0.25f, p.sampleWidth = kWidth;
-    std::memcpy(p.srcWindow, srcWindow, sizeof srcWindow);
-    std::memcpy(p.dstWindow, dstWindow, sizeof dstWindow);
-    p.workSize[0] = out.Width(), p.workSize[1] = out.Height();
+    SetWindows(p, *src, *dst);
     return KROMComputeNode::ExecKernelI(
         req, suppression ? "CCProcessPixel" : "CCProcessPixelSimple", nullptr, CCProcessPixelParamsText, sizeof p,
         offsetof(CCProcessPixelParams, srcCompOrder), offsetof(CCProcessPixelParams, dstCompOrder), block,
@@ -701,29 +706,6 @@ std::unique_ptr<Histogram> SnapshotFromScript(const ScriptVal &v) {
     }
     if (!h->SetCounts(counts, static_cast<uint64_t>(samples->AsNumber()))) return nullptr;
     return h;
-}
-
-/// The histogram correction over `count` stored pixels of `depth`.
-void HistogramSpan(const HistogramSettings &s, int depth, const uint8_t *src, uint8_t *dst, int count) {
-    const int bpp = FormatOfDepth(depth).BytesPerPixel();
-    FltPixel loaded[kBlock];
-    float block[kBlock][4];
-    for (int i = 0; i < count; i += kBlock) {
-        const int n = std::min(kBlock, count - i);
-        const uint8_t *in = src + static_cast<size_t>(i) * bpp;
-        uint8_t *out = dst + static_cast<size_t>(i) * bpp;
-        if (depth == DepthRGBAFlt32) { // worked on in the output row itself
-            if (in != out) std::memcpy(out, in, static_cast<size_t>(n) * bpp);
-            HistogramBlock(s, reinterpret_cast<float(*)[4]>(out), n);
-            continue;
-        }
-        LoadFlt(depth, in, n, loaded);
-        for (int k = 0; k < n; ++k)
-            block[k][0] = loaded[k].R, block[k][1] = loaded[k].G, block[k][2] = loaded[k].B, block[k][3] = loaded[k].A;
-        HistogramBlock(s, block, n);
-        for (int k = 0; k < n; ++k) loaded[k] = {block[k][0], block[k][1], block[k][2], block[k][3]};
-        StoreFlt(depth, loaded, n, out);
-    }
 }
 
 } // namespace
@@ -862,7 +844,9 @@ void ColorCorrector::ProcessHistogram(Request *req, Image *src, bool match) {
         const PointRows rows(*src, *dst, canvasPixel);
         DoMultiProcess(
             [&](int i) {
-                rows.Row(i, [&](const uint8_t *in, uint8_t *out, int n) { HistogramSpan(s, depth, in, out, n); });
+                rows.Row(i, [&](const uint8_t *in, uint8_t *out, int n) {
+                    BlockSpan(depth, in, out, n, [&](float(*p)[4], int count) { HistogramBlock(s, p, count); });
+                });
             },
             rows.Count());
     }
@@ -891,12 +875,7 @@ bool ColorCorrector::RunEqualizeDevice(Request *req, const Image *src, Image *ds
     p.histogramBlendL = s.luminance ? 1.f : 0.f;
     p.preDivide = s.preDivide;
     p.shift = h.Shift(), p.sampleCount = h.Size(), p.sampleWidth = width;
-    const bool hasPixels = src->HasScanLineData() || src->IsGPUMemDirty();
-    const ImgRectI in = hasPixels ? src->DataWindow() : ImgRectI(), out = dst->DataWindow();
-    const int srcWindow[4] = {in.x0, in.x1, in.y0, in.y1}, dstWindow[4] = {out.x0, out.x1, out.y0, out.y1};
-    std::memcpy(p.srcWindow, srcWindow, sizeof srcWindow);
-    std::memcpy(p.dstWindow, dstWindow, sizeof dstWindow);
-    p.workSize[0] = out.Width(), p.workSize[1] = out.Height();
+    SetWindows(p, *src, *dst);
     return KROMComputeNode::ExecKernelI(
         req, "CCProcessEqualize", nullptr, CCProcessEqualizeParamsText, sizeof p,
         offsetof(CCProcessEqualizeParams, srcCompOrder), offsetof(CCProcessEqualizeParams, dstCompOrder), block,
@@ -990,7 +969,10 @@ void ColorCorrector::Process(Request *req) {
         DoMultiProcess(
             [&](int i) {
                 rows.Row(i, [&](const uint8_t *in, uint8_t *out, int n) {
-                    CorrectSpan(s, rangeOutput, shown, depth, in, out, n);
+                    BlockSpan(depth, in, out, n, [&](float(*p)[4], int count) {
+                        if (!rangeOutput) return CorrectBlock(s, p, count);
+                        for (int k = 0; k < count; ++k) RangeOutput(s, shown, p[k]);
+                    });
                 });
             },
             rows.Count());
