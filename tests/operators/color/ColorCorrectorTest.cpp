@@ -554,19 +554,26 @@ TEST_F(ColorCorrector, MatchTakesTheReferencesHistogramWithinTheMatchRectangle) 
     EXPECT_FALSE(Render(rig.cc));
     EXPECT_NE(ts::ConsoleText(rig.doc).find("the kept match snapshot is damaged"), std::string::npos);
 
-    // Equalising over the left half counts only it: the left half comes out flat, which the whole frame (half of
-    // it white) does not give.
+    // The left half dark, the right half white and transparent: counting the left half alone (by the match
+    // rectangle, or by leaving out transparent pixels) equalises it flat; counting everything does not.
     Ref<Image> halves = GreyImage(Dark);
-    for (int y = 0; y < 16; ++y) std::fill_n(halves->Row<uint8_t>(y) + 4 * 128, 4 * 128, 255);
-    Rig split(halves);
-    split.Set(Parse("HistogramType=1 EqualizeRed=1 Precision=0"));
-    Ref<Image> whole = Render(split.cc);
-    ts::SetPoint(split.cc, "MatchCenter", 0.25, 0.5);
-    ts::SetNumber(split.cc, "MatchWidth", 0.5);
-    Ref<Image> inRect = Render(split.cc);
-    ASSERT_TRUE(whole && inRect);
-    EXPECT_GT(Farthest(Cumulative(*whole, left, 0), Flat()), 0.2);
-    EXPECT_LT(Farthest(Cumulative(*inRect, left, 0), Flat()), kFollow);
+    for (int y = 0; y < 16; ++y)
+        for (int x = 128; x < 256; ++x) std::copy_n("\xff\xff\xff\0", 4, halves->Row<uint8_t>(y) + 4 * x);
+    const std::tuple<const char *, bool, bool> counted[] = {
+        // controls, match rectangle over the left half, comes out flat
+        {"", false, false},
+        {"MatchWidth=0.5", true, true},
+        {"HistogramIgnoreTransparent=1", false, true},
+    };
+    for (const auto &[controls, inRect, flat] : counted) {
+        Rig split(halves);
+        split.Set(Parse(std::string("HistogramType=1 EqualizeRed=1 Precision=0 ") + controls));
+        if (inRect) ts::SetPoint(split.cc, "MatchCenter", 0.25, 0.5);
+        Ref<Image> out = Render(split.cc);
+        ASSERT_TRUE(out) << controls;
+        const double off = Farthest(Cumulative(*out, left, 0), Flat());
+        EXPECT_TRUE(flat ? off < kFollow : off > 0.2) << controls << ": " << off;
+    }
 }
 
 TEST_F(ColorCorrector, CanvasRegionsAndThreadCountLeaveTheResultAlone) {
