@@ -2,12 +2,17 @@
 //   MasterGain     Master gain 1.2 only: one record, the multiply-add stage alone
 //   AllRanges      every range changed, with tint and suppression: three records
 //                  weighted by the range curves, all stages on
+//   HistogramMatch Match of luminance and locked R/G/B at 16-bit precision
+//                  against a snapshot of the frame itself: each render counts
+//                  the frame, builds four 65536-bin curves and corrects
 // Compare with BM_CopyFloor (CopyBench.cpp), the memory-bandwidth floor.
 #include <utility>
 #include <vector>
 
 #include "bench/BenchSupport.h"
 #include "host/core/Tags.h"
+#include "host/flow/Link.h"
+#include "host/flow/Parameter.h"
 
 namespace Orvane::Bench {
 namespace {
@@ -33,6 +38,21 @@ void BM_ColorCorrector_AllRanges(benchmark::State &state) {
                     {"ProcessOrder", 1}});
 }
 BENCHMARK(BM_ColorCorrector_AllRanges)->UseRealTime()->Unit(benchmark::kMillisecond);
+
+void BM_ColorCorrector_HistogramMatch(benchmark::State &state) {
+    if (!LoadLibrary(state)) return;
+    OrvaneDoc doc;
+    Operator *tool = AddToolOnFrame(state, doc, "ColorCorrector",
+                                    {{"HistogramType", 2},
+                                     {"EqualizeLuminance", 1},
+                                     {"EqualizeRed", 1},
+                                     {"EqualizeGreen", 1},
+                                     {"EqualizeBlue", 1}});
+    if (!tool) return;
+    tool->FindInput("SnapshotMatch")->SetValue(MakeRef<Number>(1.0));
+    RenderLoop(state, tool);
+}
+BENCHMARK(BM_ColorCorrector_HistogramMatch)->UseRealTime()->Unit(benchmark::kMillisecond);
 
 } // namespace
 } // namespace Orvane::Bench

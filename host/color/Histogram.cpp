@@ -169,6 +169,39 @@ void Histogram::ResetCurves() {
     for (int c = 0; c < kHistogramChannels; ++c) IdentityCurve(size_, curves_.data() + static_cast<size_t>(c) * size_);
 }
 
+void Histogram::BlendCurve(HistogramChannel c, double amount) {
+    const double a = std::isnan(amount) ? 0.0 : std::clamp(amount, 0.0, 1.0);
+    std::vector<uint16_t> identity(size_);
+    IdentityCurve(size_, identity.data());
+    uint16_t *curve = curves_.data() + Index(c);
+    for (int i = 0; i < size_; ++i)
+        curve[i] = static_cast<uint16_t>(std::lround(identity[i] + a * (double(curve[i]) - identity[i])));
+}
+
+Histogram Histogram::Reduced(int size) const {
+    Histogram out(std::min(size, size_));
+    const int merge = size_ / out.size_;
+    for (size_t i = 0; i < counts_.size(); ++i) out.counts_[i / merge] += counts_[i]; // channels stay apart
+    out.samples_ = samples_;
+    return out;
+}
+
+bool Histogram::SetCounts(const std::vector<uint64_t> &counts, uint64_t samples) {
+    if (counts.size() != counts_.size()) return false;
+    for (int c = 0; c < kHistogramChannels; ++c) {
+        uint64_t total = 0;
+        for (int i = 0; i < size_; ++i) {
+            const uint64_t v = counts[static_cast<size_t>(c) * size_ + i];
+            if (v > samples - total) return false; // also catches an overflowing sum
+            total += v;
+        }
+        if (total != samples) return false;
+    }
+    counts_ = counts;
+    samples_ = samples;
+    return true;
+}
+
 void Histogram::Equalize(const HistogramCorrection &choice) { BuildCurves(nullptr, choice); }
 
 bool Histogram::Match(const Histogram &reference, const HistogramCorrection &choice) {

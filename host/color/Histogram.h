@@ -99,6 +99,16 @@ public:
     bool Match(const Histogram &reference, const HistogramCorrection &choice);
     /// Every curve back to the identity.
     void ResetCurves();
+    /// Moves a curve towards the identity: each value becomes identity + amount x (value - identity), rounded;
+    /// amount 1 keeps the curve, 0 gives the identity (clamped to 0..1).
+    void BlendCurve(HistogramChannel c, double amount);
+
+    /// The same counts in `size` bins (each the sum of the bins it covers), curves the identity; `size` no more
+    /// than Size() (a larger size reads as Size()).
+    Histogram Reduced(int size) const;
+    /// Replaces the counts: Size() values for each of L, R, G and B in that order, each channel adding up to
+    /// `samples`. False, nothing changed, when they do not (a damaged saved histogram).
+    bool SetCounts(const std::vector<uint64_t> &counts, uint64_t samples);
 
     /// The corrected value of a pixel in `bin` (0 <= bin < Size()).
     uint16_t GetValueL(int bin) const { return curves_[bin]; }

@@ -17,6 +17,7 @@ const std::vector<CommonKernel> &CommonKernels() {
         {"CCProcessPixel", CCProcessPixelParamsText, kColorCorrectorKernels},
         {"CCProcessPixelSimple", CCProcessPixelParamsText, kColorCorrectorKernels},
         {"CCProcessRange", CCProcessRangeParamsText, kColorCorrectorRangeKernel},
+        {"CCProcessEqualize", CCProcessEqualizeParamsText, kColorCorrectorEqualizeKernel},
         {"Background", BackgroundParamsText, kBackgroundKernel},
         {"BackgroundGrad", BackgroundGradParamsText, kBackgroundGradKernel},
         {"BlurRows", BlurRowsParamsText, kBlurRowsKernel},

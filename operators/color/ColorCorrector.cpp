@@ -3,14 +3,18 @@
 #include <algorithm>
 #include <cmath>
 #include <cstddef>
+#include <cstdlib>
 #include <cstring>
 #include <memory>
+#include <optional>
 #include <string>
 
 #include "host/color/ColorCurvesTable.h"
 #include "host/core/Tags.h"
 #include "host/flow/DataTypes.h"
+#include "host/flow/Engine.h"
 #include "host/flow/Link.h"
+#include "host/flow/OrvaneDoc.h"
 #include "host/flow/PointRows.h"
 #include "host/flow/Request.h"
 #include "host/image/ColorMatrix.h"
@@ -18,6 +22,7 @@
 #include "host/image/NewImage.h"
 #include "host/image/PixelConvert.h"
 #include "host/krom/KROMComputeNode.h"
+#include "host/krom/PointKernel.h"
 #include "host/krom/kernels/ColorKernelParams.h"
 #include "operators/frame/Registration.h"
 
@@ -165,29 +170,27 @@ bool SuppressionIsNeutral(const double *sliders) {
     return std::all_of(sliders, sliders + 6, [](double v) { return Near(v, 1.0); });
 }
 
-/// The pixel function over `count` stored pixels of `depth` (any depth:
-/// integer values are worked on as 0..1 and rounded back on store).
-void CorrectSpan(const PixelSettings &s, bool rangeOutput, int shown, int depth, const uint8_t *src, uint8_t *dst,
-                 int count) {
+/// A block function (float (*p)[4], int n: up to kBlock RGBA pixels, in place) over `count` stored pixels of
+/// `depth` (any depth: integer values are worked on as 0..1 and rounded back on store).
+template <class Block> void BlockSpan(int depth, const uint8_t *src, uint8_t *dst, int count, const Block &block) {
     const int bpp = FormatOfDepth(depth).BytesPerPixel();
     FltPixel loaded[kBlock];
-    float block[kBlock][4];
+    float pixels[kBlock][4];
     for (int i = 0; i < count; i += kBlock) {
         const int n = std::min(kBlock, count - i);
         const uint8_t *in = src + static_cast<size_t>(i) * bpp;
         uint8_t *out = dst + static_cast<size_t>(i) * bpp;
-        if (depth == DepthRGBAFlt32 && !rangeOutput) { // worked on in the output row itself
+        if (depth == DepthRGBAFlt32) { // worked on in the output row itself
             if (in != out) std::memcpy(out, in, static_cast<size_t>(n) * bpp);
-            CorrectBlock(s, reinterpret_cast<float(*)[4]>(out), n);
+            block(reinterpret_cast<float(*)[4]>(out), n);
             continue;
         }
         LoadFlt(depth, in, n, loaded);
-        for (int k = 0; k < n; ++k) {
-            block[k][0] = loaded[k].R, block[k][1] = loaded[k].G, block[k][2] = loaded[k].B, block[k][3] = loaded[k].A;
-            if (rangeOutput) RangeOutput(s, shown, block[k]);
-        }
-        if (!rangeOutput) CorrectBlock(s, block, n);
-        for (int k = 0; k < n; ++k) loaded[k] = {block[k][0], block[k][1], block[k][2], block[k][3]};
+        for (int k = 0; k < n; ++k)
+            pixels[k][0] = loaded[k].R, pixels[k][1] = loaded[k].G, pixels[k][2] = loaded[k].B,
+            pixels[k][3] = loaded[k].A;
+        block(pixels, n);
+        for (int k = 0; k < n; ++k) loaded[k] = {pixels[k][0], pixels[k][1], pixels[k][2], pixels[k][3]};
         StoreFlt(depth, loaded, n, out);
     }
 }
@@ -308,33 +311,38 @@ ColorCorrector::ColorCorrector(const Registry *reg, const ScriptVal &args, const
     EndControlNest();
 
     BeginControlNestTagList("Histogram", "HistogramGroup", true, {});
-    Add("Histogram", "HistogramReference", histogramDisplay(), Histogram);
-    Add("Histogram", "HistogramOutput", histogramDisplay(), Histogram);
-    Add("Histogram", "HistogramCurve", histogramDisplay(), Histogram);
+    Add("Histogram", "HistogramReference", histogramDisplay(), Histograms);
+    Add("Histogram", "HistogramOutput", histogramDisplay(), Histograms);
+    Add("Histogram", "HistogramCurve", histogramDisplay(), Histograms);
     histogramType_ =
-        Add("Histogram Type", "HistogramType", choice({"Keep", "Equalize", "Match"}, 0.0, false), Histogram);
-    Add("Equalize Luminance", "EqualizeLuminance", slider(0.0, 0.0, 1.0), Histogram);
-    Add("Lock R/G/B", "LockRedGreenBlue", checkbox(1.0), Histogram);
-    for (const char *c : {"Red", "Green", "Blue"})
-        Add((std::string("Equalize ") + c).c_str(), (std::string("Equalize") + c).c_str(), slider(0.0, 0.0, 1.0),
-            Histogram);
-    Add("Precision", "Precision", choice({"8-bit", "10-bit", "16-bit"}, 2.0, false), Histogram);
-    Add("Smooth Correction", "SmoothOutCorrectionCurve", slider(0.0, 0.0, 1.0), Histogram);
-    Add("Snapshot Match Time", "SnapshotMatch", button(), Histogram);
-    Add("Release Match", "ReleaseMatch", button(), Histogram);
+        Add("Histogram Type", "HistogramType", choice({"Keep", "Equalize", "Match"}, 0.0, false), Histograms);
+    equalizeL_ = Add("Equalize Luminance", "EqualizeLuminance", slider(0.0, 0.0, 1.0), Histograms);
+    lockRGB_ = Add("Lock R/G/B", "LockRedGreenBlue", checkbox(1.0), Histograms);
+    const char *const rgbWords[] = {"Red", "Green", "Blue"};
+    for (int i = 0; i < 3; ++i)
+        equalizeRGB_[i] = Add((std::string("Equalize ") + rgbWords[i]).c_str(),
+                              (std::string("Equalize") + rgbWords[i]).c_str(), slider(0.0, 0.0, 1.0), Histograms);
+    precision_ = Add("Precision", "Precision", choice({"8-bit", "10-bit", "16-bit"}, 2.0, false), Histograms);
+    smooth_ = Add("Smooth Correction", "SmoothOutCorrectionCurve", slider(0.0, 0.0, 1.0), Histograms);
+    snapshotButton_ = Add("Snapshot Match Time", "SnapshotMatch", button(), Histograms);
+    release_ = Add("Release Match", "ReleaseMatch", button(), Histograms);
     Add("Match Rectangle", "MatchNest", {number, {InputControl, CLSID_InputControl_Nest}, {InputPassive, 1}},
-        Histogram);
-    Add("Show Match Rectangle", "MatchShow", checkbox(0.0), Histogram);
-    Add("Match Center", "MatchCenter",
-        {{LinkDataType, CLSID_DataType_Point},
-         {InputControl, CLSID_InputControl_Offset},
-         {PreviewControl, CLSID_PreviewControl_Rectangle},
-         {InputDefaultX, 0.5},
-         {InputDefaultY, 0.5}},
-        Histogram);
-    Add("Match Width", "MatchWidth", slider(1.0, 0.0, 1.0), Histogram);
-    Add("Match Height", "MatchHeight", slider(1.0, 0.0, 1.0), Histogram);
-    resetHistogram_ = Add("Reset All Histogram Changes", "ResetAllHistogramChanges", button(), Histogram);
+        Histograms);
+    Add("Show Match Rectangle", "MatchShow", checkbox(0.0), Histograms);
+    matchCenter_ = Add("Match Center", "MatchCenter",
+                       {{LinkDataType, CLSID_DataType_Point},
+                        {InputControl, CLSID_InputControl_Offset},
+                        {PreviewControl, CLSID_PreviewControl_Rectangle},
+                        {InputDefaultX, 0.5},
+                        {InputDefaultY, 0.5}},
+                       Histograms);
+    matchWidth_ = Add("Match Width", "MatchWidth", slider(1.0, 0.0, 1.0), Histograms);
+    matchHeight_ = Add("Match Height", "MatchHeight", slider(1.0, 0.0, 1.0), Histograms);
+    // The counts kept by Snapshot Match Time: never shown, saved with the document.
+    snapshotData_ =
+        AddInputTagList("Match Snapshot", "MatchSnapshotData",
+                        {{LinkDataType, CLSID_DataType_ScriptVal}, {InputExternal, 0}, {ControlVisible, 0}});
+    resetHistogram_ = Add("Reset All Histogram Changes", "ResetAllHistogramChanges", button(), Histograms);
     EndControlNest();
 
     BeginControlNestTagList("Suppress", "SuppressGroup", true, {});
@@ -378,8 +386,8 @@ ColorCorrector::ColorCorrector(const Registry *reg, const ScriptVal &args, const
     TagList proxy = slider(1.0, 1.0, 8.0);
     proxy.Add({InputInteger, 1});
     proxy.Add({InputMinAllowed, 1.0});
-    AddInputTagList("Histogram Proxy Scale", "HistogramProxyScale", proxy);
-    AddInputTagList("Histogram Ignore Transparent", "HistogramIgnoreTransparent", checkbox(0.0));
+    proxyScale_ = AddInputTagList("Histogram Proxy Scale", "HistogramProxyScale", proxy);
+    ignoreTransparent_ = AddInputTagList("Histogram Ignore Transparent", "HistogramIgnoreTransparent", checkbox(0.0));
     processOrder_ = AddInputTagList("Process Order", "ProcessOrder",
                                     choice({"Gamma Before Levels", "Gamma After Levels"}, 0.0, false));
 
@@ -413,7 +421,7 @@ void ColorCorrector::UpdateVisibility() {
     }
     // The channel chooser means nothing to the histogram and suppression groups.
     channel_->SetAttrsTagList({{ControlVisible, group == Colors || group == Levels ? 1 : 0}});
-    correctionRange_->SetAttrsTagList({{ControlVisible, group != Histogram ? 1 : 0}});
+    correctionRange_->SetAttrsTagList({{ControlVisible, group != Histograms ? 1 : 0}});
 }
 
 void ColorCorrector::ResetGroup(int group) {
@@ -429,19 +437,30 @@ void ColorCorrector::NotifyChanged(Input *in, Parameter *param, double time, Tag
         if (in == resetColors_) ResetGroup(Colors);
         if (in == resetLevels_) ResetGroup(Levels);
         if (in == resetSuppression_) ResetGroup(Suppress);
-        if (in == resetHistogram_) ResetGroup(Histogram);
+        if (in == resetHistogram_) ResetGroup(Histograms);
+        if (in == snapshotButton_) TakeSnapshot(time);
+        if (in == release_) snapshotData_->SetValue(MakeRef<ScriptValue>());
     }
     ThreadedOperator::NotifyChanged(in, param, time, tags);
 }
 
 void ColorCorrector::CheckRequest(Request *req) {
     ThreadedOperator::CheckRequest(req);
-    // The match reference and mask only feed the histogram modes.
     const auto *type = dynamic_cast<const Number *>(histogramType_->ValueAt(req->Time()).Get());
-    if (!type || std::lround(type->value) != 2) {
+    const int mode = type ? static_cast<int>(std::lround(type->value)) : 0;
+    if (mode == 0) { // the match reference and mask only feed the histogram modes
         if (req->GetPri() == PriorityMask) req->SetInputData(matchMask_, nullptr);
         if (req->GetPri() == PriorityImage) req->SetInputData(matchReference_, nullptr);
+        return;
     }
+    if (req->GetPri() != PriorityImage) return;
+    // The histograms count the whole images, whatever part of the output is asked for.
+    req->SetInputRoI(input_, nullptr);
+    const auto *kept = dynamic_cast<const ScriptValue *>(snapshotData_->ValueAt(req->Time()).Get());
+    if (mode != 2 || (kept && kept->value.Size() > 0))
+        req->SetInputData(matchReference_, nullptr);
+    else
+        req->SetInputRoI(matchReference_, nullptr);
 }
 
 // ---- folding the controls ----
@@ -555,11 +574,21 @@ void ColorCorrector::Fold(const Controls &c, PixelSettings &s, std::vector<Suppr
 
 // ---- the device ----
 
+namespace {
+/// The windows of one of the tool's kernel blocks (srcWindow, dstWindow, workSize), as every per-pixel kernel has them.
+template <class Params> void SetWindows(Params &p, const Image &src, const Image &dst) {
+    struct {
+        int inDataWindow[4], outDataWindow[4], workSize[2];
+    } w;
+    SetPointKernelWindows(w, src, dst);
+    std::memcpy(p.srcWindow, w.inDataWindow, sizeof w.inDataWindow);
+    std::memcpy(p.dstWindow, w.outDataWindow, sizeof w.outDataWindow);
+    std::memcpy(p.workSize, w.workSize, sizeof w.workSize);
+}
+} // namespace
+
 bool ColorCorrector::RunDevice(Request *req, const Image *src, Image *dst, bool rangeOutput, int shown) {
     const PixelSettings &s = settings_;
-    const bool hasPixels = src->HasScanLineData() || src->IsGPUMemDirty();
-    const ImgRectI in = hasPixels ? src->DataWindow() : ImgRectI(), out = dst->DataWindow();
-    const int srcWindow[4] = {in.x0, in.x1, in.y0, in.y1}, dstWindow[4] = {out.x0, out.x1, out.y0, out.y1};
     const FltPixel canvas = dst->GetCanvasColor(); // already through the pixel function
     const float canvasColor[4] = {canvas.R, canvas.G, canvas.B, canvas.A};
     constexpr int kWidth = ColorCurvesTable::kSamples;
@@ -580,9 +609,7 @@ bool ColorCorrector::RunDevice(Request *req, const Image *src, Image *dst, bool 
         std::memcpy(p.defaultP, canvasColor, sizeof canvasColor);
         p.channel = 0, p.selected = shown, p.sampleCount = kWidth, p.invSampleHeight = 1.f, p.sampleWidth = kWidth;
         p.preDivide = s.preDivide;
-        std::memcpy(p.srcWindow, srcWindow, sizeof srcWindow);
-        std::memcpy(p.dstWindow, dstWindow, sizeof dstWindow);
-        p.workSize[0] = out.Width(), p.workSize[1] = out.Height();
+        SetWindows(p, *src, *dst);
         return KROMComputeNode::ExecKernelI(
             req, "CCProcessRange", nullptr, CCProcessRangeParamsText, sizeof p,
             offsetof(CCProcessRangeParams, srcCompOrder), offsetof(CCProcessRangeParams, dstCompOrder), block,
@@ -622,12 +649,236 @@ bool ColorCorrector::RunDevice(Request *req, const Image *src, Image *dst, bool 
     p.orderTintChannel = s.gammaAfterLevels | s.tintMode << 1 | s.rangesInUse << 3;
     p.prePost = s.preDivide | s.postMultiply << 1;
     p.sampleCount[3] = kWidth, p.invSampleHeight = 0.25f, p.sampleWidth = kWidth;
-    std::memcpy(p.srcWindow, srcWindow, sizeof srcWindow);
-    std::memcpy(p.dstWindow, dstWindow, sizeof dstWindow);
-    p.workSize[0] = out.Width(), p.workSize[1] = out.Height();
+    SetWindows(p, *src, *dst);
     return KROMComputeNode::ExecKernelI(
         req, suppression ? "CCProcessPixel" : "CCProcessPixelSimple", nullptr, CCProcessPixelParamsText, sizeof p,
         offsetof(CCProcessPixelParams, srcCompOrder), offsetof(CCProcessPixelParams, dstCompOrder), block,
+        {{"input", const_cast<Image *>(src)}, {"tables", tables.Get()}, {"output", dst}});
+}
+
+// ---- the histogram modes ----
+
+namespace {
+
+const char *const kSnapshotChannels[kHistogramChannels] = {"L", "R", "G", "B"};
+
+/// The saved form of a histogram: its size, samples, and per channel the bins that are not empty as the text
+/// "bin count bin count ...".
+ScriptVal SnapshotToScript(const Histogram &h) {
+    ScriptVal t = ScriptVal::Table();
+    t.Set("Size", h.Size());
+    t.Set("Samples", static_cast<double>(h.Samples()));
+    for (int c = 0; c < kHistogramChannels; ++c) {
+        std::string text;
+        const uint64_t *counts = h.Counts(static_cast<HistogramChannel>(c));
+        for (int i = 0; i < h.Size(); ++i)
+            if (counts[i]) text += std::to_string(i) + ' ' + std::to_string(counts[i]) + ' ';
+        t.Set(kSnapshotChannels[c], text);
+    }
+    return t;
+}
+
+/// The histogram of a saved form; null when it is not one.
+std::unique_ptr<Histogram> SnapshotFromScript(const ScriptVal &v) {
+    const ScriptVal *size = v.Find("Size"), *samples = v.Find("Samples");
+    if (!size || !samples || !size->IsNumber() || !samples->IsNumber() || !(samples->AsNumber() >= 0) ||
+        samples->AsNumber() > 9e15)
+        return nullptr;
+    auto h = std::make_unique<Histogram>(static_cast<int>(size->AsNumber()));
+    if (h->Size() != size->AsNumber()) return nullptr;
+    std::vector<uint64_t> counts(static_cast<size_t>(kHistogramChannels) * h->Size());
+    for (int c = 0; c < kHistogramChannels; ++c) {
+        const ScriptVal *text = v.Find(kSnapshotChannels[c]);
+        if (!text || !text->IsText()) return nullptr;
+        const char *at = text->AsText().c_str();
+        for (;;) {
+            while (*at == ' ') ++at;
+            if (!*at) break;
+            char *end;
+            const unsigned long long bin = std::strtoull(at, &end, 10);
+            if (end == at || *end != ' ') return nullptr;
+            at = end;
+            const unsigned long long count = std::strtoull(at, &end, 10);
+            if (end == at || bin >= static_cast<unsigned long long>(h->Size())) return nullptr;
+            at = end;
+            counts[static_cast<size_t>(c) * h->Size() + bin] = count;
+        }
+    }
+    if (!h->SetCounts(counts, static_cast<uint64_t>(samples->AsNumber()))) return nullptr;
+    return h;
+}
+
+} // namespace
+
+HistogramSampling ColorCorrector::Sampling(double proxy, double ignoreTransparent, double prePost) const {
+    HistogramSampling s;
+    s.proxyStep = static_cast<int>(std::clamp(std::lround(std::isnan(proxy) ? 1.0 : proxy), 1L, 1L << 20));
+    s.ignoreTransparent = ignoreTransparent >= 0.5;
+    s.divideByAlpha = prePost >= 0.5;
+    return s;
+}
+
+void ColorCorrector::TakeSnapshot(double time) {
+    auto number = [time](const Input *in) {
+        const auto *n = dynamic_cast<const Number *>(in->ValueAt(time).Get());
+        return n ? n->value : 0.0;
+    };
+    // The reference of Match at this time: the Match Reference image, or the input itself when none is connected.
+    Output *from = matchReference_->Link() ? matchReference_->Link() : input_->Link();
+    const Ref<Parameter> value = from ? Evaluate(from, time) : Ref<Parameter>();
+    const auto *img = dynamic_cast<const Image *>(value.Get());
+    Histogram counted;
+    if (!img || !counted.CountImage(*img, img->DataWindow(),
+                                    Sampling(number(proxyScale_), number(ignoreTransparent_), number(prePost_)))) {
+        if (GetDoc())
+            GetDoc()->PrintF(60, "%s: Snapshot Match Time found no image to count at time %g\n", Name().c_str(), time);
+        return;
+    }
+    snapshotData_->SetValue(MakeRef<ScriptValue>(SnapshotToScript(counted)));
+}
+
+void ColorCorrector::ProcessHistogram(Request *req, Image *src, bool match) {
+    auto fail = [&](const char *why) {
+        Fail(req, "%s: %s\n", Name().c_str(), why);
+        req->SetOutputData(output_, nullptr);
+    };
+    if (req->GetInputData(matchMask_)) return fail("the Match Mask input is not available yet; disconnect it");
+    const int size = Histogram::SizeForPrecision(static_cast<int>(std::lround(req->GetInputNumber(precision_))));
+    const double blendL = std::clamp(req->GetInputNumber(equalizeL_), 0.0, 1.0);
+    double blendRGB[3];
+    for (int i = 0; i < 3; ++i) blendRGB[i] = std::clamp(req->GetInputNumber(equalizeRGB_[i]), 0.0, 1.0);
+    HistogramCorrection choice;
+    choice.luminance = blendL > 0, choice.red = blendRGB[0] > 0, choice.green = blendRGB[1] > 0,
+    choice.blue = blendRGB[2] > 0;
+    choice.lockRGB = req->GetInputNumber(lockRGB_) >= 0.5;
+    choice.smooth = req->GetInputNumber(smooth_);
+    if (!choice.luminance && !choice.red && !choice.green && !choice.blue) { // every blend at 0: nothing to do
+        req->SetOutputData(output_, src);
+        return;
+    }
+    const bool prePost = req->GetInputNumber(prePost_) >= 0.5;
+    const HistogramSampling sampling =
+        Sampling(req->GetInputNumber(proxyScale_), req->GetInputNumber(ignoreTransparent_), prePost);
+
+    // The reference: the kept snapshot, else the Match Reference image.
+    std::optional<Histogram> counted; // the reference's counts, or the snapshot's in fewer bins
+    const Histogram *reference = nullptr;
+    if (match) {
+        Parameter *kept = req->GetInputData(snapshotData_);
+        const auto *script = dynamic_cast<const ScriptValue *>(kept);
+        if (script && script->value.Size() > 0) {
+            if (kept != snapshotValue_.Get()) {
+                snapshotValue_ = Ref<Parameter>(kept);
+                snapshot_ = SnapshotFromScript(script->value);
+            }
+            if (!snapshot_) return fail("the kept match snapshot is damaged; take it again with Snapshot Match Time");
+            if (snapshot_->Size() < size)
+                return fail("the kept match snapshot has fewer bins than the Precision asks for");
+            if (snapshot_->Size() != size) counted = snapshot_->Reduced(size);
+            reference = counted ? &*counted : snapshot_.get();
+        } else if (const auto *ref = dynamic_cast<const Image *>(req->GetInputData(matchReference_))) {
+            if (!req->IsPreCalc()) {
+                counted.emplace(size);
+                if (!counted->CountImage(*ref, ref->DataWindow(), sampling)) {
+                    if (!ref->CheckAbort()) fail("the Match Reference image's pixels could not be read");
+                    return;
+                }
+                reference = &*counted;
+            }
+        } else {
+            return fail("Match needs a Match Reference image or a snapshot (Snapshot Match Time)");
+        }
+    }
+
+    const OvID clipping = GetClippingMode(req);
+    Ref<Image> dst = NewPointOutput(req, input_, src, clipping);
+    if (!dst) return FailOutOfMemory(req);
+    if (req->IsPreCalc()) { // no pixels to count: the output's shape only
+        req->SetOutputData(output_, dst.Get());
+        return;
+    }
+
+    // The pre-pass: the input's histogram over the match rectangle, then the curves.
+    Histogram &h = histogram_;
+    h = Histogram(size);
+    const auto *center = dynamic_cast<const Point *>(req->GetInputData(matchCenter_));
+    const ImgRectI rect = HistogramMatchRect(src->Width(), src->Height(), src->DataWindow(), center ? center->x : 0.5,
+                                             center ? center->y : 0.5, req->GetInputNumber(matchWidth_),
+                                             req->GetInputNumber(matchHeight_));
+    if (!h.CountImage(*src, rect, sampling)) {
+        if (!src->CheckAbort()) fail("the input's pixels could not be read");
+        return;
+    }
+    if (!match)
+        h.Equalize(choice);
+    else if (!h.Match(*reference, choice))
+        return fail("the match reference has no pixels to count");
+    h.BlendCurve(HistogramChannel::L, blendL);
+    for (int i = 0; i < 3; ++i) h.BlendCurve(static_cast<HistogramChannel>(1 + i), blendRGB[i]);
+
+    HistogramSettings &s = histogramSettings_;
+    s.curves = &h;
+    for (int i = 0; i < 3; ++i) {
+        const uint16_t *curve = h.Curve(static_cast<HistogramChannel>(1 + i));
+        s.rgb[i].resize(h.Size());
+        for (int k = 0; k < h.Size(); ++k) s.rgb[i][k] = curve[k] / 65535.f;
+    }
+    s.luminance = choice.luminance;
+    s.preDivide = s.postMultiply = prePost;
+    s.toLumaFirst = ToLumaFirst().ToFloat();
+    s.fromLumaFirst = FromLumaFirst().ToFloat();
+
+    const int depth = src->Depth();
+    uint8_t canvasPixel[16];
+    {
+        const FltPixel in = src->GetCanvasColor();
+        float p[4] = {in.R, in.G, in.B, in.A};
+        HistogramPixel(s, p);
+        FltPixel canvas{p[0], p[1], p[2], p[3]};
+        StoreFlt(depth, &canvas, 1, canvasPixel);
+        LoadFlt(depth, canvasPixel, 1, &canvas);
+        dst->SetCanvasColor(canvas);
+    }
+    if (!dst->ValidWindow().IsNull() && !(IsGPUEnabled(req, true) && RunEqualizeDevice(req, src, dst.Get()))) {
+        if (!src->DownloadGPUMem() || !dst->AllocScanLineData()) return FailOutOfMemory(req);
+        const PointRows rows(*src, *dst, canvasPixel);
+        DoMultiProcess(
+            [&](int i) {
+                rows.Row(i, [&](const uint8_t *in, uint8_t *out, int n) {
+                    BlockSpan(depth, in, out, n, [&](float(*p)[4], int count) { HistogramBlock(s, p, count); });
+                });
+            },
+            rows.Count());
+    }
+    if (clipping != ClippingMode_None) dst->CopyCanvasColor(src);
+    req->SetOutputData(output_, dst.Get());
+}
+
+bool ColorCorrector::RunEqualizeDevice(Request *req, const Image *src, Image *dst) {
+    const HistogramSettings &s = histogramSettings_;
+    const Histogram &h = *s.curves;
+    // The four curves as one RGBA float texel per bin, rows of up to 1024 bins.
+    const int width = std::min(h.Size(), 1024), rows = h.Size() / width;
+    Ref<Image> tables = NewImageTagList({{ImgWidth, width}, {ImgHeight, rows}, {ImgDepth, DepthRGBAFlt32}});
+    if (!tables || !tables->AllocScanLineData()) return false;
+    for (int k = 0; k < h.Size(); ++k) {
+        float *texel = tables->Row<float>(k / width) + 4 * (k % width);
+        texel[0] = h.GetValueL(k), texel[1] = h.GetValueR(k), texel[2] = h.GetValueG(k), texel[3] = h.GetValueB(k);
+    }
+    auto block = std::make_shared<CCProcessEqualizeParams>();
+    CCProcessEqualizeParams &p = *block;
+    const FltPixel canvas = dst->GetCanvasColor(); // already through the pixel function
+    const float canvasColor[4] = {canvas.R, canvas.G, canvas.B, canvas.A};
+    std::memcpy(p.processCanvasColor, canvasColor, sizeof canvasColor);
+    std::memcpy(p.colorMat, s.toLumaFirst.m, sizeof s.toLumaFirst.m);
+    std::memcpy(p.colorMat + 12, s.fromLumaFirst.m, sizeof s.fromLumaFirst.m);
+    p.histogramBlendL = s.luminance ? 1.f : 0.f;
+    p.preDivide = s.preDivide;
+    p.shift = h.Shift(), p.sampleCount = h.Size(), p.sampleWidth = width;
+    SetWindows(p, *src, *dst);
+    return KROMComputeNode::ExecKernelI(
+        req, "CCProcessEqualize", nullptr, CCProcessEqualizeParamsText, sizeof p,
+        offsetof(CCProcessEqualizeParams, srcCompOrder), offsetof(CCProcessEqualizeParams, dstCompOrder), block,
         {{"input", const_cast<Image *>(src)}, {"tables", tables.Get()}, {"output", dst}});
 }
 
@@ -639,12 +890,8 @@ void ColorCorrector::Process(Request *req) {
         req->SetOutputData(output_, nullptr);
         return;
     }
-    if (std::lround(req->GetInputNumber(histogramType_)) != 0) {
-        Fail(req, "%s: the histogram modes (Equalize, Match) are not available yet; set Histogram Type to Keep\n",
-             Name().c_str());
-        req->SetOutputData(output_, nullptr);
-        return;
-    }
+    if (const int mode = static_cast<int>(std::lround(req->GetInputNumber(histogramType_))); mode == 1 || mode == 2)
+        return ProcessHistogram(req, src, mode == 2);
     Fold(ReadControls(req), settings_, tables_);
     PixelSettings &s = settings_;
     const bool rangeOutput = req->GetInputNumber(renderOutputRange_) >= 0.5;
@@ -722,7 +969,10 @@ void ColorCorrector::Process(Request *req) {
         DoMultiProcess(
             [&](int i) {
                 rows.Row(i, [&](const uint8_t *in, uint8_t *out, int n) {
-                    CorrectSpan(s, rangeOutput, shown, depth, in, out, n);
+                    BlockSpan(depth, in, out, n, [&](float(*p)[4], int count) {
+                        if (!rangeOutput) return CorrectBlock(s, p, count);
+                        for (int k = 0; k < count; ++k) RangeOutput(s, shown, p[k]);
+                    });
                 });
             },
             rows.Count());

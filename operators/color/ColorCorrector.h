@@ -21,14 +21,23 @@
 // suppression), "CCProcessPixelSimple" (without) or "CCProcessRange" of the
 // common library run first, and the rows only if they fail.
 //
-// Not built yet: the histogram modes (Equalize, Match); a HistogramType other
-// than Keep fails the render with a console line saying so.
+// Histogram modes (HistogramType Equalize, Match): the input's histogram is
+// counted first (over the match rectangle, every HistogramProxyScale-th
+// pixel), curves are built that equalise it or match it onto the reference's
+// (MatchReference, or the histogram kept by Snapshot Match Time until Release
+// Match), and the pixel function reads the curves
+// (ColorCorrectorHistogram.h); "CCProcessEqualize" runs it on a device. The
+// snapshot's counts are kept in the hidden input MatchSnapshotData, so a
+// saved document keeps them.
 //
 // Thread safety: the constructor and NotifyChanged on the main thread;
 // Process writes the settings before any row starts, rows only read them.
+#include <memory>
 #include <vector>
 
+#include "host/color/Histogram.h"
 #include "host/flow/Operator.h"
+#include "operators/color/ColorCorrectorHistogram.h"
 #include "operators/color/ColorCorrectorRanges.h"
 
 namespace Orvane {
@@ -62,7 +71,7 @@ public:
     static void Fold(const Controls &c, cc::PixelSettings &s, std::vector<cc::Suppression> &tables);
 
 private:
-    enum Group { Always = -1, Colors = 0, Levels = 1, Histogram = 2, Suppress = 3 };
+    enum Group { Always = -1, Colors = 0, Levels = 1, Histograms = 2, Suppress = 3 };
     /// Shows an input only in its Menu group, for its range and channel (-1: any).
     struct Shown {
         Input *in;
@@ -74,6 +83,13 @@ private:
     Controls ReadControls(Request *req) const;
     /// The kernels "CCProcessPixel" / "CCProcessPixelSimple" / "CCProcessRange"; false when they did not run.
     bool RunDevice(Request *req, const Image *src, Image *dst, bool rangeOutput, int shown);
+    /// The histogram modes: counts, builds the curves, corrects.
+    void ProcessHistogram(Request *req, Image *src, bool match);
+    /// The kernel "CCProcessEqualize"; false when it did not run.
+    bool RunEqualizeDevice(Request *req, const Image *src, Image *dst);
+    HistogramSampling Sampling(double proxy, double ignoreTransparent, double prePost) const;
+    /// Counts the reference of Match now and keeps it in MatchSnapshotData (Snapshot Match Time).
+    void TakeSnapshot(double time);
 
     Input *attr_[kRanges][kChannels][kAttributes];
     Input *wheel_[kRanges][4], *hue_[kRanges], *saturation_[kRanges];
@@ -82,6 +98,8 @@ private:
     Input *histogramType_, *resetHistogram_, *resetColors_, *resetLevels_, *resetSuppression_;
     Input *rangesRange_, *colorRanges_, *renderOutputRange_, *presetSimple_, *presetSmooth_;
     Input *prePost_, *processOrder_;
+    Input *equalizeL_, *lockRGB_, *equalizeRGB_[3], *precision_, *smooth_, *snapshotButton_, *release_;
+    Input *matchCenter_, *matchWidth_, *matchHeight_, *proxyScale_, *ignoreTransparent_, *snapshotData_;
     Input *input_, *matchReference_, *matchMask_;
     Output *output_;
     std::vector<Shown> shown_;
@@ -90,6 +108,11 @@ private:
     cc::PixelSettings settings_;
     std::vector<cc::Suppression> tables_;
     Ref<Parameter> curves_;
+    Histogram histogram_{256};
+    cc::HistogramSettings histogramSettings_;
+    // The snapshot read from MatchSnapshotData, kept while that value stays (requests run one at a time).
+    Ref<Parameter> snapshotValue_;
+    std::unique_ptr<Histogram> snapshot_;
 };
 
 } // namespace Orvane

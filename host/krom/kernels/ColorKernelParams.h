@@ -106,4 +106,32 @@ static_assert(sizeof(CCProcessRangeParams) == 88);
 static_assert(offsetof(CCProcessRangeParams, srcCompOrder) == 80);
 static_assert(offsetof(CCProcessRangeParams, dstCompOrder) == 84);
 
+// CCProcessEqualize: the Color Corrector's histogram modes. colorMat holds
+// the two global matrices into and out of the luma-first space (3 rows of 4
+// floats each); the luma curve is read when histogramBlendL is above 0.
+// preDivide: colour divided by alpha before and multiplied after. Values are
+// taken as 16-bit (0..65535) and shifted down by `shift` to a bin; the table
+// image holds bin k's curve values L, R, G, B (0..65535) as one RGBA float
+// texel at (k % sampleWidth, k / sampleWidth), sampleCount bins in all.
+KROM_PARAM_STRUCT(CCProcessEqualizeParams, {
+    float processCanvasColor[4];
+    float colorMat[2 * 12];
+    float histogramBlendL;
+    int preDivide;
+    int shift;
+    int sampleCount;
+    int sampleWidth;
+    int srcWindow[4];
+    int dstWindow[4];
+    int workSize[2];
+    int srcCompOrder, dstCompOrder;
+})
+static_assert(sizeof(CCProcessEqualizeParams) == 180);
+static_assert(offsetof(CCProcessEqualizeParams, colorMat) == 16);
+static_assert(offsetof(CCProcessEqualizeParams, histogramBlendL) == 112);
+static_assert(offsetof(CCProcessEqualizeParams, sampleCount) == 124);
+static_assert(offsetof(CCProcessEqualizeParams, srcWindow) == 132);
+static_assert(offsetof(CCProcessEqualizeParams, srcCompOrder) == 172);
+static_assert(offsetof(CCProcessEqualizeParams, dstCompOrder) == 176);
+
 } // namespace Orvane

@@ -283,4 +283,61 @@ __KERNEL__ void CCProcessRange(__CONSTANTREF__ CCProcessRangeParams *p_pParams, 
 }
 )KROM";
 
+const char kColorCorrectorEqualizeKernel[] = R"KROM(
+/// Applies 3 by 4 matrix m (12 floats) to c.
+KROM_FN void cce_apply(__CONSTANTREF__ float *m, const float *c, float *out) {
+    for (int i = 0; i < 3; ++i) out[i] = m[4 * i] * c[0] + m[4 * i + 1] * c[1] + m[4 * i + 2] * c[2] + m[4 * i + 3];
+}
+
+/// A value clamped to 0..1 as a 16-bit value, rounded (NaN reads as 0).
+KROM_FN int cce_16(float v) {
+    const float c = v > 0.f ? (v < 1.f ? v : 1.f) : 0.f;
+    return (int)(c * 65535.f + 0.5f);
+}
+
+/// The curves of bin k: L, R, G, B.
+KROM_FN float4 cce_curves(__CONSTANTREF__ CCProcessEqualizeParams *q, __TEXTURE2D__ tables, int k) {
+    return _tex2DVecN(tables, k % q->sampleWidth, k / q->sampleWidth, 0);
+}
+
+__KERNEL__ void CCProcessEqualize(__CONSTANTREF__ CCProcessEqualizeParams *p_pParams, __TEXTURE2D__ input,
+                                  __TEXTURE2D__ tables, __TEXTURE2D_WRITE__ output) {
+    DEFINE_KERNEL_ITERATORS_XY(x, y);
+    __CONSTANTREF__ CCProcessEqualizeParams *q = p_pParams;
+    if (x >= q->workSize[0] || y >= q->workSize[1]) return;
+    const int2 pos = make_int2(x + q->dstWindow[0], y + q->dstWindow[2]);
+    float4 c = to_float4_v(q->processCanvasColor);
+    if (IsInsideROI(pos, q->srcWindow)) {
+        const float4 in = _tex2DVecN(input, pos.x - q->srcWindow[0], pos.y - q->srcWindow[2], q->srcCompOrder);
+        float p[4] = {in.x, in.y, in.z, in.w};
+        if (q->preDivide) {
+            if (p[3] == 0.f)
+                p[0] = p[1] = p[2] = 0.f;
+            else
+                for (int i = 0; i < 3; ++i) p[i] = p[i] / p[3];
+        }
+        int v[3] = {cce_16(p[0]), cce_16(p[1]), cce_16(p[2])};
+        if (q->histogramBlendL > 0.f) {
+            const float f[3] = {(float)v[0], (float)v[1], (float)v[2]};
+            float l[3], back[3];
+            cce_apply(q->colorMat, f, l);
+            const float luma = l[0] > 0.f ? (l[0] < 65535.f ? l[0] : 65535.f) : 0.f;
+            l[0] = cce_curves(q, tables, (int)(luma + 0.5f) >> q->shift).x;
+            cce_apply(q->colorMat + 12, l, back);
+            for (int i = 0; i < 3; ++i)
+                v[i] = (int)((back[i] > 0.f ? (back[i] < 65535.f ? back[i] : 65535.f) : 0.f) + 0.5f);
+        }
+        p[0] = cce_curves(q, tables, v[0] >> q->shift).y / 65535.f;
+        p[1] = cce_curves(q, tables, v[1] >> q->shift).z / 65535.f;
+        p[2] = cce_curves(q, tables, v[2] >> q->shift).w / 65535.f;
+        if (q->preDivide) {
+            const float a = p[3] > -1e-6f && p[3] < 1e-6f ? 0.f : p[3];
+            for (int i = 0; i < 3; ++i) p[i] = p[i] * a;
+        }
+        c = make_float4(p[0], p[1], p[2], p[3]);
+    }
+    _tex2DVec4Write(output, x, y, make_intensity(c, q->dstCompOrder));
+}
+)KROM";
+
 } // namespace Orvane

@@ -7,6 +7,8 @@ extern const char kBrightnessContrastKernels[];
 extern const char kColorCorrectorKernels[];
 /// "CCProcessRange".
 extern const char kColorCorrectorRangeKernel[];
+/// "CCProcessEqualize".
+extern const char kColorCorrectorEqualizeKernel[];
 /// "ColorMatrix".
 extern const char kColorMatrixKernel[];
 /// "Background".
