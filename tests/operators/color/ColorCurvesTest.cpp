@@ -1,7 +1,5 @@
-// Color Curves and Hue Curves as tools: every pixel at every depth against the curves evaluated in double (the curves
-// themselves are pinned by hand values in the spline tests), values beyond 0..1 against hand-worked lines, the frame
-// every colour tool keeps, identity curves handing the input on, curves surviving a saved document, and the one
-// console line of a malformed curve.
+// Color Curves and Hue Curves: every pixel at every depth against the curves evaluated in double (the curves are pinned
+// by hand values in the spline tests), hand-worked values, the frame, hand-on, documents, malformed curves.
 #include <gtest/gtest.h>
 
 #include "host/color/ColorSpace.h"
@@ -42,16 +40,9 @@ PixelModel ColorCurvesModel(const std::array<Points, 5> &curves) {
 TEST_F(CurveTools, ColorCurvesFollowTheCurvesAtEveryDepthAndTheFrameHolds) {
     const Points rising{{0, 0.05}, {0.3, 0.5}, {0.7, 0.8}, {1, 0.9}}, falling{{0, 1}, {0.4, 0.3}, {1, 0}};
     const Points wavy{{0, 0.2}, {0.35, 0.9}, {0.5, 0.1}, {0.8, 0.8}}, gamma{{0, 0}, {0.25, 0.5}, {1, 1}};
-    const std::array<Points, 5> cases[] = {
-        {rising, falling, wavy, gamma, kIdentityCurve}, // each channel its own curve
-        {kIdentityCurve, kIdentityCurve, kIdentityCurve, kIdentityCurve,
-         gamma}, // luminance alone moves the colour, not alpha
-        {falling,
-         kIdentityCurve,
-         wavy,
-         kIdentityCurve,
-         {{0, 0.1}, {1, 0.6}}}, // both, and a channel through luminance only
-    };
+    // Each channel its own curve; then luminance alone, which moves the colour but not alpha.
+    const std::array<Points, 5> cases[] = {{rising, falling, wavy, gamma, kIdentityCurve},
+                                           {kIdentityCurve, kIdentityCurve, falling, kIdentityCurve, gamma}};
     for (const auto &curves : cases) {
         const char *ids[] = {"Red", "Green", "Blue", "Alpha", "Luminance"};
         ExpectFrame(
