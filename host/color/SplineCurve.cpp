@@ -36,6 +36,8 @@ Spline::Spline(const std::vector<CurvePoint> &points, bool periodic) : periodic_
             m_[k] = tau * a * chord[k], m_[k + 1] = tau * b * chord[k];
         }
     }
+    // The seam is one knot seen from both sides: it keeps the smaller of its
+    // two scaled slopes (they share a sign), which overshoots on neither side.
     if (periodic)
         m_.front() = m_.back() =
             std::min(std::fabs(m_.front()), std::fabs(m_.back())) * (m_.front() < 0.0 ? -1.0 : 1.0);
@@ -88,7 +90,8 @@ std::string SplineCurve::Problem(bool periodic) const {
 }
 
 bool SplineCurve::IsIdentity() const {
-    return !points_.empty() &&
+    // One point alone is a flat curve, even on the diagonal.
+    return points_.size() >= 2 &&
            std::all_of(points_.begin(), points_.end(), [](const CurvePoint &p) { return p.x == p.y; });
 }
 

@@ -3,7 +3,7 @@
 // a curve input (data type LookUpTable) such as the channel curves of Color
 // Curves and the hue curves of Hue Curves.
 //
-// Shape: a monotone cubic (Fritsch-Carlson). The curve passes through every
+// Shape: a monotone cubic Hermite spline. The curve passes through every
 // point; between two points it is a cubic Hermite segment whose end slopes
 // start as the mean of the neighbouring chord slopes (0 where the chords turn,
 // the chord slope at the curve's ends) and are then scaled down where they
@@ -110,7 +110,7 @@ public:
     /// The curve to evaluate; only for a curve without a Problem.
     Spline ToSpline(bool periodic) const { return Spline(points_, periodic); }
 
-    /// Every point lies on y = x (the curve is the identity when open).
+    /// Two or more points, every one on y = x (the curve is the identity when open).
     bool IsIdentity() const;
     /// Every point has y == value (the curve is flat at value).
     bool IsFlatAt(double value) const;

@@ -138,7 +138,9 @@ TEST_F(CurveTools, NeutralCurvesHandTheInputOn) {
     EXPECT_EQ(Render(color.tool).Get(), src.Get());
     EXPECT_EQ(Render(hue.tool).Get(), src.Get());
     SetCurve(hue.tool, "Hue", {{0.5, 1e-9}});
+    SetCurve(color.tool, "Alpha", {{0.5, 0.5}}); // one point is flat, not the identity
     EXPECT_NE(Render(hue.tool).Get(), src.Get());
+    EXPECT_NE(Render(color.tool).Get(), src.Get());
 }
 
 TEST_F(CurveTools, CurvesSurviveASavedDocument) {
