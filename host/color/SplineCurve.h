@@ -61,7 +61,8 @@ private:
 /// A curve sampled at x = i / kSteps (i = 0..kSteps, so at every 16-bit code)
 /// and read between samples along straight lines. An open table goes on
 /// beyond 0..1 as a straight line with the slopes given for its ends; a
-/// periodic one takes x modulo 1. NaN reads as itself.
+/// periodic one takes x modulo 1. NaN (and, periodic, an infinite x) reads
+/// as NaN.
 class CurveTable {
 public:
     static constexpr int kSteps = 65535;
@@ -73,10 +74,9 @@ public:
     void SetEndSlopes(double atZero, double atOne) { slope0_ = atZero, slope1_ = atOne; }
 
     double operator()(double x) const {
+        if (periodic_) x -= std::floor(x); // an infinite x becomes NaN here
         if (x != x) return x;
-        if (periodic_)
-            x -= std::floor(x);
-        else if (x < 0.0)
+        if (x < 0.0)
             return values_.front() + x * slope0_;
         else if (x > 1.0)
             return values_.back() + (x - 1.0) * slope1_;

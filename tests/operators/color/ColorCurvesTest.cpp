@@ -73,6 +73,15 @@ TEST_F(CurveTools, FloatValuesBeyondZeroToOneGoOnStraight) {
             EXPECT_EQ(out->GetFlt(x, 0).A, xs[x]); // alpha's curve is the identity
         }
     }
+    // Values that are not finite do no harm: NaN stays NaN through a curve, and hues of them are no hues.
+    img->PutFlt(0, 0, {NAN, INFINITY, -INFINITY, 1});
+    for (const auto &[id, input] : {std::pair{"ColorCurves", "Red"}, {"HueCurves", "Hue"}}) {
+        Rig rig(id, img);
+        SetCurve(rig.tool, input, {{0.2, 0.1}, {0.7, 0.3}});
+        Ref<Image> out = Render(rig.tool);
+        ASSERT_TRUE(out);
+        EXPECT_TRUE(std::string(id) == "HueCurves" || std::isnan(out->GetFlt(0, 0).R));
+    }
 }
 
 /// Hue Curves in double: HLS, the three curves read at the hue, back to RGB.
