@@ -34,34 +34,18 @@ RangeCurve Curve(std::vector<RangeCurve::Point> points, bool smooth) {
 }
 
 ScriptVal CurveToScript(const RangeCurve &c) {
-    ScriptVal points = ScriptVal::Table();
-    for (const RangeCurve::Point &p : c.points) {
-        ScriptVal pair = ScriptVal::Table();
-        pair.Append(p.x);
-        pair.Append(p.y);
-        points.Append(std::move(pair));
-    }
     ScriptVal v = ScriptVal::Table();
     v.Set("Smooth", ScriptVal(c.smooth));
-    v.Set("Points", std::move(points));
+    v.Set("Points", PointsToScript(c.points));
     return v;
 }
 
 bool CurveFromScript(const ScriptVal *v, RangeCurve &out) {
     if (!v || !v->IsTable()) return false;
     const ScriptVal *smooth = v->Find("Smooth"), *points = v->Find("Points");
-    if (!points || !points->IsTable() || points->ArrayLength() == 0 || points->ArrayLength() != points->Size())
-        return false;
     if (smooth && !smooth->IsBool()) return false;
     std::vector<RangeCurve::Point> pts;
-    for (size_t i = 1; i <= points->ArrayLength(); ++i) {
-        const ScriptVal *p = points->At(i);
-        if (!p->IsTable() || p->ArrayLength() != 2 || p->Size() != 2) return false;
-        const ScriptVal *x = p->At(1), *y = p->At(2);
-        if (!x->IsNumber() || !y->IsNumber() || !std::isfinite(x->AsNumber()) || !std::isfinite(y->AsNumber()))
-            return false;
-        pts.push_back({x->AsNumber(), y->AsNumber()});
-    }
+    if (!points || !PointsFromScript(*points, pts) || pts.empty()) return false;
     out = Curve(std::move(pts), smooth && smooth->AsBool());
     return true;
 }

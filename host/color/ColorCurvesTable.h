@@ -21,16 +21,14 @@
 // is const and safe from any number of threads.
 #include <vector>
 
+#include "host/color/SplineCurve.h"
 #include "host/flow/Parameter.h"
 #include "host/image/Pixel.h"
 
 namespace Orvane {
 
 struct RangeCurve {
-    struct Point {
-        double x = 0.0, y = 0.0;
-        bool operator==(const Point &) const = default;
-    };
+    using Point = CurvePoint;
     std::vector<Point> points; ///< sorted by x
     bool smooth = false;
     bool operator==(const RangeCurve &) const = default;

@@ -167,27 +167,39 @@ void HLSToRGB(const double hls[3], double rgb[3]) {
 } // namespace
 } // namespace colorspace_impl
 
-void RGBToSpace(ColorSpaceType space, const float in[3], float out[3]) {
-    double rgb[3] = {in[0], in[1], in[2]}, res[3];
+void RGBToSpaceDouble(ColorSpaceType space, const double in[3], double out[3]) {
+    const double rgb[3] = {in[0], in[1], in[2]};
     switch (space) {
-    case ColorSpaceType::HLS: colorspace_impl::RGBToHLS(rgb, res); break;
-    case ColorSpaceType::HSV: colorspace_impl::RGBToHSV(rgb, res); break;
-    case ColorSpaceType::LAB: colorspace_impl::RGBToLab(rgb, res); break;
-    default: res[0] = rgb[0], res[1] = rgb[1], res[2] = rgb[2]; break;
+    case ColorSpaceType::HLS: colorspace_impl::RGBToHLS(rgb, out); break;
+    case ColorSpaceType::HSV: colorspace_impl::RGBToHSV(rgb, out); break;
+    case ColorSpaceType::LAB: colorspace_impl::RGBToLab(rgb, out); break;
+    default: out[0] = rgb[0], out[1] = rgb[1], out[2] = rgb[2]; break;
     }
+}
+
+void SpaceToRGBDouble(ColorSpaceType space, const double in[3], double out[3]) {
+    const double val[3] = {in[0], in[1], in[2]};
+    switch (space) {
+    case ColorSpaceType::HLS: colorspace_impl::HLSToRGB(val, out); break;
+    case ColorSpaceType::HSV: colorspace_impl::HSVToRGB(val, out); break;
+    case ColorSpaceType::LAB: colorspace_impl::LabToRGB(val, out); break;
+    default: out[0] = val[0], out[1] = val[1], out[2] = val[2]; break;
+    }
+}
+
+void RGBToSpace(ColorSpaceType space, const float in[3], float out[3]) {
+    const double rgb[3] = {in[0], in[1], in[2]};
+    double res[3];
+    RGBToSpaceDouble(space, rgb, res);
     for (int i = 0; i < 3; ++i) out[i] = static_cast<float>(res[i]);
     // A hue just under one turn can round up to 1 in float; keep it in [0, 1).
     if ((space == ColorSpaceType::HLS || space == ColorSpaceType::HSV) && out[0] >= 1.0f) out[0] = 0.0f;
 }
 
 void SpaceToRGB(ColorSpaceType space, const float in[3], float out[3]) {
-    double val[3] = {in[0], in[1], in[2]}, rgb[3];
-    switch (space) {
-    case ColorSpaceType::HLS: colorspace_impl::HLSToRGB(val, rgb); break;
-    case ColorSpaceType::HSV: colorspace_impl::HSVToRGB(val, rgb); break;
-    case ColorSpaceType::LAB: colorspace_impl::LabToRGB(val, rgb); break;
-    default: rgb[0] = val[0], rgb[1] = val[1], rgb[2] = val[2]; break;
-    }
+    const double val[3] = {in[0], in[1], in[2]};
+    double rgb[3];
+    SpaceToRGBDouble(space, val, rgb);
     for (int i = 0; i < 3; ++i) out[i] = static_cast<float>(rgb[i]);
 }
 

@@ -37,5 +37,8 @@ enum class ColorSpaceType : int { RGB = 0, HLS = 1, HSV = 5, LAB = 7 };
 ORVANE_API void RGBToSpace(ColorSpaceType space, const float in[3], float out[3]);
 /// `space` to linear RGB.
 ORVANE_API void SpaceToRGB(ColorSpaceType space, const float in[3], float out[3]);
+/// The same in double, for callers that round once themselves.
+ORVANE_API void RGBToSpaceDouble(ColorSpaceType space, const double in[3], double out[3]);
+ORVANE_API void SpaceToRGBDouble(ColorSpaceType space, const double in[3], double out[3]);
 
 } // namespace Orvane

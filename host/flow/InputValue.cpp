@@ -198,6 +198,7 @@ const char *ExpectedValueText(const Input *in) {
     if (t == CLSID_DataType_OvID) return "an ID (text)";
     if (t == CLSID_DataType_Gradient) return "a gradient";
     if (t == CLSID_DataType_ColorCurves) return "range curves (ColorCurves { Shadows = ..., Highlights = ... })";
+    if (t == CLSID_DataType_LookUpTable) return "a curve (LookUpTable { Points = { { x, y }, ... } })";
     if (t == CLSID_DataType_Clip) return "a file name (text)";
     if (IsImageDataType(t)) return "a link to an image output (Tool.Output)";
     return "a value of its own type";

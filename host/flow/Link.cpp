@@ -6,6 +6,7 @@
 #include <cmath>
 
 #include "host/color/ColorCurvesTable.h"
+#include "host/color/SplineCurve.h"
 #include "host/flow/DataTypes.h"
 #include "host/flow/Gradient.h"
 #include "host/flow/Operator.h"
@@ -49,6 +50,9 @@ Ref<Parameter> DefaultValueFor(OvID dataType, const TagList &tags) {
     }
     if (dataType == CLSID_DataType_Gradient) return MakeRef<Gradient>();
     if (dataType == CLSID_DataType_ColorCurves) return MakeRef<ColorCurvesTable>();
+    // A curve input is the identity unless its default names a flat curve.
+    if (dataType == CLSID_DataType_LookUpTable)
+        return tags.Has(InputDefault) ? SplineCurve::Flat(tags.GetDouble(InputDefault)) : MakeRef<SplineCurve>();
     if (dataType == CLSID_DataType_Clip) return MakeRef<Clip>(tags.GetText(InputDefaultText, ""));
     if (dataType == CLSID_DataType_ScriptVal) return MakeRef<ScriptValue>();
     return nullptr;
@@ -69,6 +73,7 @@ Ref<Parameter> ParameterFromScript(OvID dataType, const ScriptVal &v) {
     if (dataType == CLSID_DataType_OvID) return v.IsText() ? MakeRef<IDValue>(OvID(v.AsText())) : nullptr;
     if (dataType == CLSID_DataType_Gradient) return Gradient::FromScript(v);
     if (dataType == CLSID_DataType_ColorCurves) return ColorCurvesTable::FromScript(v);
+    if (dataType == CLSID_DataType_LookUpTable) return SplineCurve::FromScript(v);
     if (dataType == CLSID_DataType_Clip) return v.IsText() ? MakeRef<Clip>(v.AsText()) : nullptr;
     if (dataType == CLSID_DataType_ScriptVal) return MakeRef<ScriptValue>(v);
     return nullptr;
