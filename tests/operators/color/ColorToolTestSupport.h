@@ -1,7 +1,6 @@
 #pragma once
-// Shared by the tests of the small colour tools: a document with an image source feeding the tool, values read back
-// exactly at every depth, a check of every pixel against a model written in the test, and the frame every per-pixel
-// tool keeps (pre-calculation windows, canvas, regions equal to the crop of the whole render, worker count).
+// Shared by the tests of the small colour tools: a document feeding an image to the tool, values read back exactly at
+// every depth, every pixel against a model written in the test, and the frame every per-pixel tool keeps.
 #include <algorithm>
 #include <array>
 #include <cmath>
@@ -24,8 +23,14 @@ namespace Orvane::colortest {
 
 using Px = std::array<double, 4>;
 using PixelModel = std::function<Px(const Px &)>; ///< the tool's function of one pixel, in double
+/// A row of a frame table: how to set the tool, and what it then does to a pixel.
+using Setting = std::pair<std::function<void(Operator *)>, PixelModel>;
 
 inline constexpr int kEveryDepth[] = {DepthRGBAFlt32, DepthRGBAFlt16, DepthRGBAInt16, DepthRGBAInt8};
+
+struct ColorTool : ::testing::Test {
+    static void SetUpTestSuite() { Orvane::Test::LoadOperators(); }
+};
 
 /// A document with an image source feeding the main input of a tool of class `classId`.
 struct Rig {
@@ -63,20 +68,24 @@ inline double Unit(const Image &img, int x, int y, int c) {
     if (FormatOfDepth(img.Depth()).bytesPerComponent == 1) return img.Row<uint8_t>(y)[i] / 255.0;
     return img.Row<uint16_t>(y)[i] / 65535.0;
 }
-inline Px UnitPx(const Image &img, int x, int y) {
+inline Px ToPx(const FltPixel &p) { return {p.R, p.G, p.B, p.A}; }
+/// The pixel at (x, y), or the canvas colour beyond the data window.
+inline Px PxAt(const Image &img, int x, int y) {
+    if (!img.DataWindow().Contains(x, y)) return ToPx(img.GetCanvasColor());
     return {Unit(img, x, y, 0), Unit(img, x, y, 1), Unit(img, x, y, 2), Unit(img, x, y, 3)};
 }
-inline Px ToPx(const FltPixel &p) { return {p.R, p.G, p.B, p.A}; }
 
-/// Expects the stored `got` to be the exact result `e` as `depth` holds it: clamped to 0..1 and within half a step
-/// on integers, within half an ulp on floats; plus `slack` relative (tools that work in float on integer data).
-inline void ExpectStored(int depth, double got, double e, double slack, const std::string &where) {
+/// Expects the stored pixel `got` to be the exact result `e` as `depth` holds it: clamped to 0..1 and within half a
+/// step on integers, within half an ulp on floats; plus `slack` relative (tools that work in float on integer data).
+inline void ExpectPx(int depth, const Px &got, const Px &e, double slack, const std::string &where) {
     const PixelFormat f = FormatOfDepth(depth);
-    const double want = f.isFloat ? e : std::clamp(e, 0.0, 1.0);
-    const double tol = !f.isFloat                 ? 0.5 / (f.bytesPerComponent == 1 ? 255 : 65535) + 1e-11
-                       : f.bytesPerComponent == 2 ? std::fabs(want) / 2048 + 3e-8
-                                                  : std::fabs(want) * 6e-8 + 1e-37;
-    ASSERT_NEAR(got, want, tol + slack * (1 + std::fabs(want))) << where;
+    for (int c = 0; c < 4; ++c) {
+        const double want = f.isFloat ? e[c] : std::clamp(e[c], 0.0, 1.0);
+        const double tol = !f.isFloat                 ? 0.5 / (f.bytesPerComponent == 1 ? 255 : 65535) + 1e-11
+                           : f.bytesPerComponent == 2 ? std::fabs(want) / 2048 + 3e-8
+                                                      : std::fabs(want) * 6e-8 + 1e-37;
+        ASSERT_NEAR(got[c], want, tol + slack * (1 + std::fabs(want))) << where << " channel " << c;
+    }
 }
 
 /// Expects every pixel of `out` to be `model` of `in`'s pixel (beyond `in`'s data window: of its canvas colour).
@@ -84,61 +93,60 @@ inline void ExpectModel(const PixelModel &model, const Image &in, const Image &o
                         double slack = 0) {
     const ImgRectI dw = out.DataWindow();
     for (int y = dw.y0; y < dw.y1; ++y)
-        for (int x = dw.x0; x < dw.x1; ++x) {
-            const Px e = model(in.DataWindow().Contains(x, y) ? UnitPx(in, x, y) : ToPx(in.GetCanvasColor()));
-            for (int c = 0; c < 4; ++c)
-                ExpectStored(out.Depth(), Unit(out, x, y, c), e[c], slack,
-                             what + " at " + std::to_string(x) + "," + std::to_string(y) + " channel " +
-                                 std::to_string(c));
-        }
+        for (int x = dw.x0; x < dw.x1; ++x)
+            ExpectPx(out.Depth(), PxAt(out, x, y), model(PxAt(in, x, y)), slack,
+                     what + " at " + std::to_string(x) + "," + std::to_string(y));
 }
 
 /// Expects `a` to hold `b`'s bytes over `r`.
 inline void ExpectSameBits(const Image &a, const Image &b, const ImgRectI &r) {
     for (int y = r.y0; y < r.y1; ++y)
-        ASSERT_EQ(std::memcmp(a.PixelAddress(r.x0, y), b.PixelAddress(r.x0, y), size_t(r.Width()) * a.BytesPerPixel()),
-                  0)
-            << "row " << y;
+        ASSERT_EQ(0, std::memcmp(a.PixelAddress(r.x0, y), b.PixelAddress(r.x0, y), r.Width() * a.BytesPerPixel())) << y;
 }
 
-/// The frame of a per-pixel tool over a 48 x 32 frame whose data window leaves canvas on every side, for each of
-/// `depths`, without clipping and with ClippingMode_Frame: a pre-calculation gives the windows without pixels; the
-/// canvas colour goes through `model` (with the clipping mode the input's stays); every pixel, canvas spans
-/// included, follows `model`; regions are crops of the whole render; one worker gives the same bits as many.
-inline void ExpectFrame(const char *classId, const std::function<void(Operator *)> &setup, const PixelModel &model,
-                        double slack = 0, std::vector<int> depths = {std::begin(kEveryDepth), std::end(kEveryDepth)}) {
-    const ImgRectI inWindow(8, 4, 40, 28), frame(0, 0, 48, 32);
+/// The frame of a per-pixel tool in one setting over a 48 x 32 frame whose data window leaves canvas on every side,
+/// without clipping and with ClippingMode_Frame: a pre-calculation gives the windows without pixels; the canvas
+/// colour goes through the model (clipped, the input's stays); every pixel, canvas spans included, follows the model;
+/// regions are crops of the whole render; one worker gives the same bits as many.
+inline void ExpectFrameAt(const char *classId, const Setting &setting, int depth, bool clipped, double slack) {
+    const ImgRectI inWindow(8, 4, 40, 28), window = clipped ? ImgRectI(0, 0, 48, 32) : inWindow;
     const FltPixel canvas{0.2f, 0.4f, 0.6f, 0.8f};
-    for (int depth : depths)
-        for (bool clipped : {false, true}) {
-            const std::string what =
-                std::string(classId) + (clipped ? " frame" : "") + " depth " + std::to_string(depth);
-            SCOPED_TRACE(what);
-            Ref<Image> src = Test::WindowedImage(48, 32, inWindow, canvas, 3, depth);
-            Rig rig(classId, src);
-            setup(rig.tool);
-            Test::SetID(rig.tool, "ClippingMode", clipped ? "ClippingMode_Frame" : "ClippingMode_None");
-            const ImgRectI window = clipped ? frame : inWindow;
-            Ref<Image> shape = Render(rig.tool, nullptr, ReqFlagPreCalc);
-            ASSERT_TRUE(shape && shape->IsNoData() && !shape->HasScanLineData() && shape->DataWindow() == window);
-            EXPECT_EQ(rig.source->processCount, 0) << "pre-calculation asked the source for pixels";
-            Ref<Image> out = Render(rig.tool);
-            ASSERT_TRUE(out && out->DataWindow() == window);
-            const Px gotCanvas = ToPx(out->GetCanvasColor()), wantCanvas = clipped ? ToPx(canvas) : model(ToPx(canvas));
-            for (int c = 0; c < 4; ++c) EXPECT_NEAR(gotCanvas[c], wantCanvas[c], 1e-6 * (1 + std::fabs(wantCanvas[c])));
-            ExpectModel(model, *src, *out, what, slack);
-            for (const ImgRectI &roi : {ImgRectI(5, 7, 30, 20), ImgRectI(38, 25, 60, 40)}) {
-                Ref<Image> part = Render(rig.tool, &roi);
-                ASSERT_TRUE(part && part->DataWindow() == (window & roi) && part->ValidWindow() == (window & roi));
-                ExpectSameBits(*part, *out, window & roi);
+    Ref<Image> src = Test::WindowedImage(48, 32, inWindow, canvas, 3, depth);
+    Rig rig(classId, src);
+    setting.first(rig.tool);
+    Test::SetID(rig.tool, "ClippingMode", clipped ? "ClippingMode_Frame" : "ClippingMode_None");
+    Ref<Image> shape = Render(rig.tool, nullptr, ReqFlagPreCalc);
+    ASSERT_TRUE(shape && shape->IsNoData() && !shape->HasScanLineData() && shape->DataWindow() == window);
+    EXPECT_EQ(rig.source->processCount, 0) << "pre-calculation asked the source for pixels";
+    Ref<Image> out = Render(rig.tool);
+    ASSERT_TRUE(out && out->DataWindow() == window);
+    const Px wantCanvas = clipped ? ToPx(canvas) : setting.second(ToPx(canvas)),
+             gotCanvas = ToPx(out->GetCanvasColor());
+    for (int c = 0; c < 4; ++c) EXPECT_NEAR(gotCanvas[c], wantCanvas[c], 1e-6 * (1 + std::fabs(wantCanvas[c])));
+    ExpectModel(setting.second, *src, *out, classId, slack);
+    for (const ImgRectI &roi : {ImgRectI(5, 7, 30, 20), ImgRectI(38, 25, 60, 40)}) {
+        Ref<Image> part = Render(rig.tool, &roi);
+        ASSERT_TRUE(part && part->DataWindow() == (window & roi) && part->ValidWindow() == (window & roi));
+        ExpectSameBits(*part, *out, window & roi);
+    }
+    const int before = WorkerCount();
+    SetWorkerCount(1);
+    Ref<Image> one = Render(rig.tool);
+    SetWorkerCount(before);
+    ASSERT_TRUE(one);
+    ExpectSameBits(*one, *out, window);
+}
+
+/// ExpectFrameAt for each row of `settings` at each of `depths`, unclipped and clipped.
+inline void ExpectFrame(const char *classId, const std::vector<Setting> &settings, double slack = 0,
+                        const std::vector<int> &depths = {std::begin(kEveryDepth), std::end(kEveryDepth)}) {
+    for (size_t i = 0; i < settings.size(); ++i)
+        for (int depth : depths)
+            for (bool clipped : {false, true}) {
+                SCOPED_TRACE("setting " + std::to_string(i) + " depth " + std::to_string(depth) +
+                             (clipped ? " clipped" : ""));
+                ExpectFrameAt(classId, settings[i], depth, clipped, slack);
             }
-            const int before = WorkerCount();
-            SetWorkerCount(1);
-            Ref<Image> one = Render(rig.tool);
-            SetWorkerCount(before);
-            ASSERT_TRUE(one);
-            ExpectSameBits(*one, *out, window);
-        }
 }
 
 } // namespace Orvane::colortest
