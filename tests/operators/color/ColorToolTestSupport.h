@@ -1,19 +1,14 @@
 #pragma once
-// Shared by the tests of the small colour tools: a document feeding an image to the tool, values read back exactly at
-// every depth, every pixel against a model written in the test, and the frame every per-pixel tool keeps.
+// Shared by the small colour tools' tests: a tool fed an image, exact read-back, per-pixel models, the frame rules.
 #include <algorithm>
 #include <array>
 #include <cmath>
 #include <cstring>
 #include <functional>
-#include <string>
-#include <vector>
 
 #include <gtest/gtest.h>
 
 #include "host/core/Parallel.h"
-#include "host/flow/Engine.h"
-#include "host/flow/Link.h"
 #include "host/flow/RenderTask.h"
 #include "host/flow/Request.h"
 #include "host/image/NewImage.h"
@@ -23,8 +18,8 @@ namespace Orvane::colortest {
 
 using Px = std::array<double, 4>;
 using PixelModel = std::function<Px(const Px &)>; ///< the tool's function of one pixel, in double
-/// A row of a frame table: how to set the tool, and what it then does to a pixel.
-using Setting = std::pair<std::function<void(Operator *)>, PixelModel>;
+using Setter = std::function<void(Operator *)>;
+using Setting = std::pair<Setter, PixelModel>; ///< a row of a frame table: a tool's setting, its effect on a pixel
 
 inline constexpr int kEveryDepth[] = {DepthRGBAFlt32, DepthRGBAFlt16, DepthRGBAInt16, DepthRGBAInt8};
 
@@ -37,8 +32,8 @@ struct Rig {
     OrvaneDoc doc;
     Test::ImageSourceTool *source;
     Operator *tool;
-    Rig(const char *classId, Ref<Image> img) : source(Test::AddImageSource(doc, "Src", std::move(img))) {
-        tool = doc.AddTool(OvID(classId));
+    Rig(const char *classId, Ref<Image> img)
+        : source(Test::AddImageSource(doc, "Src", std::move(img))), tool(doc.AddTool(OvID(classId))) {
         EXPECT_TRUE(tool && tool->FindMainInput()->ConnectTo(source->FindMainOutput()));
     }
     /// A second tool of `classId` fed by this one.
@@ -57,18 +52,17 @@ inline Ref<Image> Render(Operator *op, const ImgRectI *roi = nullptr, uint32_t f
     if (roi) opt.roi = ImageDomain(*roi);
     return Test::EvalImage(op, 0.0, opt);
 }
-
+inline Px ToPx(const FltPixel &p) { return {p.R, p.G, p.B, p.A}; }
 /// Channel c at (x, y) over 0..1, read exactly from the stored data (integers over 255 or 65535 in double).
 inline double Unit(const Image &img, int x, int y, int c) {
-    if (img.IsFloat()) {
-        const FltPixel p = img.GetFlt(x, y);
-        return c == 0 ? p.R : c == 1 ? p.G : c == 2 ? p.B : p.A;
-    }
+    if (img.IsFloat()) return ToPx(img.GetFlt(x, y))[c];
     const int i = (x - img.DataWindow().x0) * (img.IsMask() ? 1 : 4) + (img.IsMask() ? 0 : c);
-    if (FormatOfDepth(img.Depth()).bytesPerComponent == 1) return img.Row<uint8_t>(y)[i] / 255.0;
-    return img.Row<uint16_t>(y)[i] / 65535.0;
+    return FormatOfDepth(img.Depth()).bytesPerComponent == 1 ? img.Row<uint8_t>(y)[i] / 255.0
+                                                             : img.Row<uint16_t>(y)[i] / 65535.0;
 }
-inline Px ToPx(const FltPixel &p) { return {p.R, p.G, p.B, p.A}; }
+inline Setter Numbers(const std::vector<std::pair<const char *, double>> &values) {
+    return [values](Operator *op) { Test::SetNumbers(op, values); };
+}
 /// The pixel at (x, y), or the canvas colour beyond the data window.
 inline Px PxAt(const Image &img, int x, int y) {
     if (!img.DataWindow().Contains(x, y)) return ToPx(img.GetCanvasColor());
@@ -87,7 +81,6 @@ inline void ExpectPx(int depth, const Px &got, const Px &e, double slack, const 
         ASSERT_NEAR(got[c], want, tol + slack * (1 + std::fabs(want))) << where << " channel " << c;
     }
 }
-
 /// Expects every pixel of `out` to be `model` of `in`'s pixel (beyond `in`'s data window: of its canvas colour).
 inline void ExpectModel(const PixelModel &model, const Image &in, const Image &out, const std::string &what,
                         double slack = 0) {
@@ -97,7 +90,6 @@ inline void ExpectModel(const PixelModel &model, const Image &in, const Image &o
             ExpectPx(out.Depth(), PxAt(out, x, y), model(PxAt(in, x, y)), slack,
                      what + " at " + std::to_string(x) + "," + std::to_string(y));
 }
-
 /// Expects `a` to hold `b`'s bytes over `r`.
 inline void ExpectSameBits(const Image &a, const Image &b, const ImgRectI &r) {
     for (int y = r.y0; y < r.y1; ++y)
@@ -120,9 +112,9 @@ inline void ExpectFrameAt(const char *classId, const Setting &setting, int depth
     EXPECT_EQ(rig.source->processCount, 0) << "pre-calculation asked the source for pixels";
     Ref<Image> out = Render(rig.tool);
     ASSERT_TRUE(out && out->DataWindow() == window);
-    const Px wantCanvas = clipped ? ToPx(canvas) : setting.second(ToPx(canvas)),
-             gotCanvas = ToPx(out->GetCanvasColor());
-    for (int c = 0; c < 4; ++c) EXPECT_NEAR(gotCanvas[c], wantCanvas[c], 1e-6 * (1 + std::fabs(wantCanvas[c])));
+    // The canvas colour is kept in float: within 1e-6 relative.
+    ExpectPx(DepthRGBAFlt32, ToPx(out->GetCanvasColor()), clipped ? ToPx(canvas) : setting.second(ToPx(canvas)), 9.4e-7,
+             "canvas");
     ExpectModel(setting.second, *src, *out, classId, slack);
     for (const ImgRectI &roi : {ImgRectI(5, 7, 30, 20), ImgRectI(38, 25, 60, 40)}) {
         Ref<Image> part = Render(rig.tool, &roi);

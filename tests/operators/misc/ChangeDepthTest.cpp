@@ -1,13 +1,8 @@
-// Change Depth: every conversion gives the nearest value of the new depth; dither keeps the mean and the steps and
-// repeats bit for bit; the frame.
 #include <tuple>
-
-#include <gtest/gtest.h>
 
 #include "tests/operators/color/ColorToolTestSupport.h"
 
 namespace Orvane::colortest {
-namespace {
 
 using ChangeDepth = ColorTool;
 
@@ -27,8 +22,8 @@ TEST_F(ChangeDepth, EveryConversionGivesTheNearestValueOfTheNewDepthAndTheFrameH
             ExpectModel(kSame, *src, *out, what);
         }
     // Half float and 8-bit from float and from integers: host conversions and the exact way, no depth handed on.
-    const auto to = [](int choice) { return [choice](Operator *op) { Orvane::Test::SetNumber(op, "Depth", choice); }; };
-    ExpectFrame("ChangeDepth", {{to(3), kSame}, {to(1), kSame}}, 0, {DepthRGBAFlt32, DepthRGBAInt16});
+    ExpectFrame("ChangeDepth", {{Numbers({{"Depth", 3}}), kSame}, {Numbers({{"Depth", 1}}), kSame}}, 0,
+                {DepthRGBAFlt32, DepthRGBAInt16});
 }
 
 TEST_F(ChangeDepth, DitherKeepsTheMeanAndTheStepsAndRepeatsOverRegions) {
@@ -69,5 +64,4 @@ TEST_F(ChangeDepth, DitherKeepsTheMeanAndTheStepsAndRepeatsOverRegions) {
     }
 }
 
-} // namespace
 } // namespace Orvane::colortest
