@@ -21,7 +21,8 @@ using PixelModel = std::function<Px(const Px &)>; ///< the tool's function of on
 using Setter = std::function<void(Operator *)>;
 using Setting = std::pair<Setter, PixelModel>; ///< a row of a frame table: a tool's setting, its effect on a pixel
 
-inline constexpr int kEveryDepth[] = {DepthRGBAFlt32, DepthRGBAFlt16, DepthRGBAInt16, DepthRGBAInt8};
+inline const std::vector<int> kEveryDepth = {DepthRGBAFlt32, DepthRGBAFlt16, DepthRGBAInt16, DepthRGBAInt8};
+inline constexpr FltPixel kFrameCanvas{0.2f, 0.4f, 0.6f, 0.8f}; ///< the canvas colour of ExpectFrame's input
 
 struct ColorTool : ::testing::Test {
     static void SetUpTestSuite() { Orvane::Test::LoadOperators(); }
@@ -96,48 +97,45 @@ inline void ExpectSameBits(const Image &a, const Image &b, const ImgRectI &r) {
         ASSERT_EQ(0, std::memcmp(a.PixelAddress(r.x0, y), b.PixelAddress(r.x0, y), r.Width() * a.BytesPerPixel())) << y;
 }
 
-/// The frame of a per-pixel tool in one setting over a 48 x 32 frame whose data window leaves canvas on every side,
-/// without clipping and with ClippingMode_Frame: a pre-calculation gives the windows without pixels; the canvas
-/// colour goes through the model (clipped, the input's stays); every pixel, canvas spans included, follows the model;
-/// regions are crops of the whole render; one worker gives the same bits as many.
-inline void ExpectFrameAt(const char *classId, const Setting &setting, int depth, bool clipped, double slack) {
-    const ImgRectI inWindow(8, 4, 40, 28), window = clipped ? ImgRectI(0, 0, 48, 32) : inWindow;
-    const FltPixel canvas{0.2f, 0.4f, 0.6f, 0.8f};
-    Ref<Image> src = Test::WindowedImage(48, 32, inWindow, canvas, 3, depth);
-    Rig rig(classId, src);
-    setting.first(rig.tool);
-    Test::SetID(rig.tool, "ClippingMode", clipped ? "ClippingMode_Frame" : "ClippingMode_None");
-    Ref<Image> shape = Render(rig.tool, nullptr, ReqFlagPreCalc);
-    ASSERT_TRUE(shape && shape->IsNoData() && !shape->HasScanLineData() && shape->DataWindow() == window);
-    EXPECT_EQ(rig.source->processCount, 0) << "pre-calculation asked the source for pixels";
-    Ref<Image> out = Render(rig.tool);
-    ASSERT_TRUE(out && out->DataWindow() == window);
-    // The canvas colour is kept in float: within 1e-6 relative.
-    ExpectPx(DepthRGBAFlt32, ToPx(out->GetCanvasColor()), clipped ? ToPx(canvas) : setting.second(ToPx(canvas)), 9.4e-7,
-             "canvas");
-    ExpectModel(setting.second, *src, *out, classId, slack);
-    for (const ImgRectI &roi : {ImgRectI(5, 7, 30, 20), ImgRectI(38, 25, 60, 40)}) {
-        Ref<Image> part = Render(rig.tool, &roi);
-        ASSERT_TRUE(part && part->DataWindow() == (window & roi) && part->ValidWindow() == (window & roi));
-        ExpectSameBits(*part, *out, window & roi);
-    }
-    const int before = WorkerCount();
-    SetWorkerCount(1);
-    Ref<Image> one = Render(rig.tool);
-    SetWorkerCount(before);
-    ASSERT_TRUE(one);
-    ExpectSameBits(*one, *out, window);
-}
-
-/// ExpectFrameAt for each row of `settings` at each of `depths`, unclipped and clipped.
+/// The frame of a per-pixel tool in each of `settings` at each of `depths`, over a 48 x 32 frame whose data window
+/// leaves kFrameCanvas on every side, under each clipping mode: a pre-calculation gives the windows and canvas colour
+/// without pixels; the canvas colour goes through the model (clipped, the input's stays unless `setsCanvas`); every
+/// pixel, canvas spans included, follows the model; regions are crops of the whole render; one worker gives the same
+/// bits as many.
 inline void ExpectFrame(const char *classId, const std::vector<Setting> &settings, double slack = 0,
-                        const std::vector<int> &depths = {std::begin(kEveryDepth), std::end(kEveryDepth)}) {
+                        const std::vector<int> &depths = kEveryDepth, bool setsCanvas = false) {
+    const ImgRectI inWindow(8, 4, 40, 28);
     for (size_t i = 0; i < settings.size(); ++i)
         for (int depth : depths)
-            for (bool clipped : {false, true}) {
-                SCOPED_TRACE("setting " + std::to_string(i) + " depth " + std::to_string(depth) +
-                             (clipped ? " clipped" : ""));
-                ExpectFrameAt(classId, settings[i], depth, clipped, slack);
+            for (const char *mode : {"ClippingMode_None", "ClippingMode_Domain", "ClippingMode_Frame"}) {
+                SCOPED_TRACE("setting " + std::to_string(i) + " depth " + std::to_string(depth) + " " + mode);
+                const bool clipped = std::string(mode) != "ClippingMode_None";
+                const ImgRectI window = std::string(mode) == "ClippingMode_Frame" ? ImgRectI(0, 0, 48, 32) : inWindow;
+                Ref<Image> src = Test::WindowedImage(48, 32, inWindow, kFrameCanvas, 3, depth);
+                Rig rig(classId, src);
+                settings[i].first(rig.tool);
+                Test::SetID(rig.tool, "ClippingMode", mode);
+                Ref<Image> shape = Render(rig.tool, nullptr, ReqFlagPreCalc);
+                EXPECT_EQ(rig.source->processCount, 0) << "pre-calculation asked the source for pixels";
+                Ref<Image> out = Render(rig.tool);
+                ASSERT_TRUE(shape && shape->IsNoData() && !shape->HasScanLineData() && shape->DataWindow() == window &&
+                            out && out->DataWindow() == window && shape->GetCanvasColor() == out->GetCanvasColor());
+                // The canvas colour is kept in float: within 1e-6 relative.
+                const Px canvas = ToPx(kFrameCanvas);
+                ExpectPx(DepthRGBAFlt32, ToPx(out->GetCanvasColor()),
+                         clipped && !setsCanvas ? canvas : settings[i].second(canvas), 9.4e-7, "canvas");
+                ExpectModel(settings[i].second, *src, *out, classId, slack);
+                for (const ImgRectI &roi : {ImgRectI(5, 7, 30, 20), ImgRectI(38, 25, 60, 40)}) {
+                    Ref<Image> part = Render(rig.tool, &roi);
+                    ASSERT_TRUE(part && part->DataWindow() == (window & roi) && part->ValidWindow() == (window & roi));
+                    ExpectSameBits(*part, *out, window & roi);
+                }
+                const int before = WorkerCount();
+                SetWorkerCount(1);
+                Ref<Image> one = Render(rig.tool);
+                SetWorkerCount(before);
+                ASSERT_TRUE(one);
+                ExpectSameBits(*one, *out, window);
             }
 }
 
