@@ -37,12 +37,6 @@ struct Rig {
         : source(Test::AddImageSource(doc, "Src", std::move(img))), tool(doc.AddTool(OvID(classId))) {
         EXPECT_TRUE(tool && tool->FindMainInput()->ConnectTo(source->FindMainOutput()));
     }
-    /// A second tool of `classId` fed by this one.
-    Operator *Then(const char *classId) {
-        Operator *next = doc.AddTool(OvID(classId));
-        EXPECT_TRUE(next->FindMainInput()->ConnectTo(tool->FindMainOutput()));
-        return next;
-    }
 };
 
 /// Renders a tool's main output without the result cache.
@@ -52,6 +46,15 @@ inline Ref<Image> Render(Operator *op, const ImgRectI *roi = nullptr, uint32_t f
     opt.flags = flags, opt.task = &task, opt.useCache = false;
     if (roi) opt.roi = ImageDomain(*roi);
     return Test::EvalImage(op, 0.0, opt);
+}
+/// `img` through a tool of `first` set by `setFirst`, then one of `second` set by `setSecond`.
+inline Ref<Image> Chain(Ref<Image> img, const char *first, const Setter &setFirst, const char *second,
+                        const Setter &setSecond) {
+    Rig rig(first, std::move(img));
+    Operator *next = rig.doc.AddTool(OvID(second));
+    EXPECT_TRUE(next->FindMainInput()->ConnectTo(rig.tool->FindMainOutput()));
+    setFirst(rig.tool), setSecond(next);
+    return Render(next);
 }
 inline Px ToPx(const FltPixel &p) { return {p.R, p.G, p.B, p.A}; }
 /// Channel c at (x, y) over 0..1, read exactly from the stored data (integers over 255 or 65535 in double).
@@ -120,8 +123,7 @@ inline void ExpectFrame(const char *classId, const std::vector<Setting> &setting
                 Ref<Image> out = Render(rig.tool);
                 ASSERT_TRUE(shape && shape->IsNoData() && !shape->HasScanLineData() && shape->DataWindow() == window &&
                             out && out->DataWindow() == window && shape->GetCanvasColor() == out->GetCanvasColor());
-                // The canvas colour is kept in float: within 1e-6 relative.
-                const Px canvas = ToPx(kFrameCanvas);
+                const Px canvas = ToPx(kFrameCanvas); // the canvas colour is kept in float: within 1e-6 relative
                 ExpectPx(DepthRGBAFlt32, ToPx(out->GetCanvasColor()),
                          clipped && !setsCanvas ? canvas : settings[i].second(canvas), 9.4e-7, "canvas");
                 ExpectModel(settings[i].second, *src, *out, classId, slack);

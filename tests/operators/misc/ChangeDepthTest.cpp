@@ -48,11 +48,8 @@ TEST_F(ChangeDepth, TheNearestValueOfTheNewDepthTheFrameAndDitherKeepingTheMeanA
     for (const auto &[from, wide, back] :
          {std::tuple{DepthRGBAInt8, 4, 1}, {DepthRGBAInt16, 4, 2}, {DepthRGBAInt8, 3, 1}, {DepthAInt16, 4, 2}}) {
         Ref<Image> codes = Orvane::Test::PatternImage(53, 9, from, 2);
-        Rig trip("ChangeDepth", codes);
-        Numbers({{"Depth", wide}})(trip.tool);
-        Operator *narrow = trip.Then("ChangeDepth");
-        Numbers({{"Depth", back}, {"Dither", 1}})(narrow);
-        Ref<Image> narrowed = Render(narrow);
+        Ref<Image> narrowed = Chain(codes, "ChangeDepth", Numbers({{"Depth", wide}}), "ChangeDepth",
+                                    Numbers({{"Depth", back}, {"Dither", 1}}));
         ASSERT_TRUE(narrowed && narrowed->Depth() == from) << from;
         ExpectSameBits(*narrowed, *codes, codes->DataWindow());
     }
