@@ -22,6 +22,7 @@ using Setter = std::function<void(Operator *)>;
 using Setting = std::pair<Setter, PixelModel>; ///< a row of a frame table: a tool's setting, its effect on a pixel
 
 inline const std::vector<int> kEveryDepth = {DepthRGBAFlt32, DepthRGBAFlt16, DepthRGBAInt16, DepthRGBAInt8};
+inline const PixelModel kIdentity = [](const Px &p) { return p; };
 inline constexpr FltPixel kFrameCanvas{0.2f, 0.4f, 0.6f, 0.8f}; ///< the canvas colour of ExpectFrame's input
 
 struct ColorTool : ::testing::Test {

@@ -31,29 +31,29 @@ static Setter Apply(const Case &k) {
 
 TEST_F(ChannelBoolean, EveryOperationAndSourceOverTwoImagesAtEveryDepthTheFrameAndTheDefaultsHandOn) {
     const FltPixel fgCanvas{0.1f, 0.3f, 0.f, 0.5f};
-    for (int depth : kEveryDepth)
-        for (int fgDepth : {DepthRGBAFlt16, DepthRGBAInt8}) {
-            // The Foreground covers part of the Background's window and reaches past it.
-            Ref<Image> bg = Orvane::Test::PatternImage(40, 12, depth, 6);
-            Ref<Image> fg = Orvane::Test::WindowedImage(40, 12, ImgRectI(10, -2, 52, 7), fgCanvas, 7, fgDepth);
-            Rig rig("ChannelBoolean", bg);
-            ASSERT_TRUE(rig.tool->FindInput("Foreground")
-                            ->ConnectTo(Orvane::Test::AddImageSource(rig.doc, "Fg", fg)->FindMainOutput()));
-            EXPECT_EQ(Render(rig.tool).Get(), bg.Get()) << "the defaults hand the Background on";
-            for (const Case &k : kCases) {
-                const std::string what = "operation " + std::to_string(k[4]) + " depth " + std::to_string(depth);
-                Apply(k)(rig.tool);
-                Ref<Image> out = Render(rig.tool);
-                ASSERT_TRUE(out && out->DataWindow() == bg->DataWindow()) << what;
-                // Float rows work in float on a Foreground read as float.
-                for (int y = 0; y < 12; ++y)
-                    for (int x = 0; x < 40; ++x)
-                        ExpectPx(depth, PxAt(*out, x, y), Expected(k, PxAt(*bg, x, y), PxAt(*fg, x, y)), 4e-7, what);
-                // Within 1e-6 (results lie within -1..1 here).
-                ExpectPx(DepthRGBAFlt32, ToPx(out->GetCanvasColor()),
-                         Expected(k, ToPx(bg->GetCanvasColor()), ToPx(fgCanvas)), 4.7e-7, what + " canvas");
-            }
+    // The Foreground, 8-bit or half float, covers part of the Background's window and reaches past it.
+    for (int depth : kEveryDepth) {
+        const int fgDepth = depth == DepthRGBAInt8 ? DepthRGBAFlt16 : DepthRGBAInt8;
+        Ref<Image> bg = Orvane::Test::PatternImage(40, 12, depth, 6);
+        Ref<Image> fg = Orvane::Test::WindowedImage(40, 12, ImgRectI(10, -2, 52, 7), fgCanvas, 7, fgDepth);
+        Rig rig("ChannelBoolean", bg);
+        ASSERT_TRUE(rig.tool->FindInput("Foreground")
+                        ->ConnectTo(Orvane::Test::AddImageSource(rig.doc, "Fg", fg)->FindMainOutput()));
+        EXPECT_EQ(Render(rig.tool).Get(), bg.Get()) << "the defaults hand the Background on";
+        for (const Case &k : kCases) {
+            const std::string what = "operation " + std::to_string(k[4]) + " depth " + std::to_string(depth);
+            Apply(k)(rig.tool);
+            Ref<Image> out = Render(rig.tool);
+            ASSERT_TRUE(out && out->DataWindow() == bg->DataWindow()) << what;
+            // Float rows work in float on a Foreground read as float.
+            for (int y = 0; y < 12; ++y)
+                for (int x = 0; x < 40; ++x)
+                    ExpectPx(depth, PxAt(*out, x, y), Expected(k, PxAt(*bg, x, y), PxAt(*fg, x, y)), 4e-7, what);
+            // Within 1e-6 (results lie within -1..1 here).
+            ExpectPx(DepthRGBAFlt32, ToPx(out->GetCanvasColor()),
+                     Expected(k, ToPx(bg->GetCanvasColor()), ToPx(fgCanvas)), 4.7e-7, what + " canvas");
         }
+    }
     // Without a Foreground, its channels read as 0.
     const auto model = [](const Case &k) { return [k](const Px &p) { return Expected(k, p, Px{}); }; };
     ExpectFrame("ChannelBoolean", {{Apply(kCases[0]), model(kCases[0])}, {Apply(kCases[4]), model(kCases[4])}}, 4e-7);

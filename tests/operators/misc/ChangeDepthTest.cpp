@@ -6,8 +6,6 @@ namespace Orvane::colortest {
 
 using ChangeDepth = ColorTool;
 
-const PixelModel kSame = [](const Px &p) { return p; };
-
 TEST_F(ChangeDepth, TheNearestValueOfTheNewDepthTheFrameAndDitherKeepingTheMeanAndTheSteps) {
     for (int from : {DepthRGBAFlt32, DepthRGBAFlt16, DepthRGBAInt16, DepthRGBAInt8, DepthAFlt32, DepthAInt16})
         for (int choice = 0; choice <= 4; ++choice) {
@@ -18,10 +16,10 @@ TEST_F(ChangeDepth, TheNearestValueOfTheNewDepthTheFrameAndDitherKeepingTheMeanA
             const int to = choice == 0 ? from : (src->IsMask() ? DepthAInt8 : DepthRGBAInt8) + choice - 1;
             Ref<Image> out = Render(rig.tool);
             ASSERT_TRUE(out && out->Depth() == to && (out.Get() == src.Get()) == (to == from)) << what;
-            ExpectModel(kSame, *src, *out, what);
+            ExpectModel(kIdentity, *src, *out, what);
         }
     // Half float and 8-bit from float and from integers: host conversions and the exact way, no depth handed on.
-    ExpectFrame("ChangeDepth", {{Numbers({{"Depth", 3}}), kSame}, {Numbers({{"Depth", 1}}), kSame}}, 0,
+    ExpectFrame("ChangeDepth", {{Numbers({{"Depth", 3}}), kIdentity}, {Numbers({{"Depth", 1}}), kIdentity}}, 0,
                 {DepthRGBAFlt32, DepthRGBAInt16});
     // A flat colour between two 8-bit steps: plain rounding gives one step everywhere (77 for red, 0.17 off); dither
     // mixes the two neighbours so that the mean over an area is the value itself. Alpha is rounded.
