@@ -3,7 +3,6 @@
 namespace Orvane::colortest {
 
 using CineonLog = ColorTool;
-
 static Setter Levels(double black, double white, double gamma, double softClip, bool toLog) {
     return Numbers(
         {{"Mode", toLog}, {"BlackLevel", black}, {"WhiteLevel", white}, {"FilmGamma", gamma}, {"SoftClip", softClip}});
@@ -31,7 +30,7 @@ TEST_F(CineonLog, BothWaysFollowTheFormulaRoundTripWithAndWithoutSoftClipAndBadL
         for (bool toLog : {false, true})
             settings.push_back({Levels(black, white, gamma, 0, toLog), Model(black, white, gamma, toLog)});
     ExpectFrame("CineonLog", settings, 1e-12);
-    Ref<Image> src = Orvane::Test::PatternImage(64, 16, DepthRGBAFlt32, 12);
+    Ref<Image> src = PatternImage(64, 16, DepthRGBAFlt32, 12);
     for (double softClip : {0.0, 60.0}) {
         const Setter toLinear = Levels(95, 685, 0.6, softClip, false), toLog = Levels(95, 685, 0.6, softClip, true);
         Rig rig("CineonLog", src);
@@ -51,7 +50,7 @@ TEST_F(CineonLog, BothWaysFollowTheFormulaRoundTripWithAndWithoutSoftClipAndBadL
         rig.tool->SetName("Log1");
         Levels(95, std::stod(white), 0.6, 0, false)(rig.tool);
         EXPECT_FALSE(Render(rig.tool));
-        EXPECT_EQ(Orvane::Test::ConsoleText(rig.doc),
+        EXPECT_EQ(ConsoleText(rig.doc),
                   "error: Log1: the white level (" + std::string(white) + ") must lie above the black level (95)\n");
     }
 }

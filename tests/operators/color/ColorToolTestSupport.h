@@ -16,11 +16,11 @@
 
 namespace Orvane::colortest {
 
+using Test::AddImageSource, Test::ConsoleText, Test::PatternImage, Test::WindowedImage;
 using Px = std::array<double, 4>;
 using PixelModel = std::function<Px(const Px &)>; ///< the tool's function of one pixel, in double
 using Setter = std::function<void(Operator *)>;
 using Setting = std::pair<Setter, PixelModel>; ///< a row of a frame table: a tool's setting, its effect on a pixel
-
 inline const std::vector<int> kEveryDepth = {DepthRGBAFlt32, DepthRGBAFlt16, DepthRGBAInt16, DepthRGBAInt8};
 inline const PixelModel kIdentity = [](const Px &p) { return p; };
 inline constexpr FltPixel kFrameCanvas{0.2f, 0.4f, 0.6f, 0.8f}; ///< the canvas colour of ExpectFrame's input
@@ -101,11 +101,9 @@ inline void ExpectSameBits(const Image &a, const Image &b, const ImgRectI &r) {
         ASSERT_EQ(0, std::memcmp(a.PixelAddress(r.x0, y), b.PixelAddress(r.x0, y), r.Width() * a.BytesPerPixel())) << y;
 }
 
-/// The frame of a per-pixel tool in each of `settings` at each of `depths`, over a 48 x 32 frame whose data window
-/// leaves kFrameCanvas on every side, under each clipping mode: a pre-calculation gives the windows and canvas colour
-/// without pixels; the canvas colour goes through the model (clipped, the input's stays unless `setsCanvas`); every
-/// pixel, canvas spans included, follows the model; regions are crops of the whole render; one worker gives the same
-/// bits as many.
+/// Each setting at each depth over a 48 x 32 frame whose data window leaves kFrameCanvas on every side, under each
+/// clipping mode: pre-calculation gives windows and canvas without pixels; the canvas goes through the model (clipped,
+/// the input's stays unless `setsCanvas`); every pixel follows the model; regions crop the whole; one worker = many.
 inline void ExpectFrame(const char *classId, const std::vector<Setting> &settings, double slack = 0,
                         const std::vector<int> &depths = kEveryDepth, bool setsCanvas = false) {
     const ImgRectI inWindow(8, 4, 40, 28);

@@ -29,7 +29,7 @@ TEST_F(CustomColorMatrix, TheMatrixSumAtEveryDepthInvertedAsARoundTripAndSingula
         {{{1, 0, 0, 0, 0}, {0, 1, 0, 0, 0}, {0, 0, 1, 0, 0}, {0, 0.5, 0, 0.5, 0.1}}},
         {{{.2126, .7152, .0722, 0, 0}, {.2126, .7152, .0722, 0, 0}, {.2126, .7152, .0722, 0, 0}, {0, 0, 0, 1, 0}}}};
     std::vector<Setting> settings;
-    Ref<Image> src = Orvane::Test::PatternImage(40, 6, DepthRGBAFlt32, 4);
+    Ref<Image> src = PatternImage(40, 6, DepthRGBAFlt32, 4);
     for (const Matrix &m : matrices) {
         settings.push_back({Set(m), [m](const Px &p) { return Times(m, p); }});
         if (&m == &matrices[3]) break;
@@ -44,8 +44,7 @@ TEST_F(CustomColorMatrix, TheMatrixSumAtEveryDepthInvertedAsARoundTripAndSingula
     rig.tool->SetName("Mixer");
     Set(matrices[3], true)(rig.tool);
     EXPECT_FALSE(Render(rig.tool));
-    EXPECT_EQ(Orvane::Test::ConsoleText(rig.doc),
-              "error: Mixer: the matrix cannot be inverted (its determinant is 0)\n");
+    EXPECT_EQ(ConsoleText(rig.doc), "error: Mixer: the matrix cannot be inverted (its determinant is 0)\n");
 }
 
 } // namespace Orvane::colortest

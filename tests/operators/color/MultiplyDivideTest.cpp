@@ -3,7 +3,6 @@
 namespace Orvane::colortest {
 
 using MultiplyDivide = ColorTool;
-
 static Px Multiplied(const Px &p) { return {p[0] * p[3], p[1] * p[3], p[2] * p[3], p[3]}; }
 static Px Divided(const Px &p) { return p[3] == 0 ? Px{} : Px{p[0] / p[3], p[1] / p[3], p[2] / p[3], p[3]}; }
 
@@ -15,7 +14,7 @@ TEST_F(MultiplyDivide, FormulaAtEveryDepthTheFrameAMaskHandedOnAndTheRoundTrip) 
         Rig maskRig(id, mask);
         EXPECT_EQ(Render(maskRig.tool).Get(), mask.Get()) << id;
     }
-    Ref<Image> src = Orvane::Test::PatternImage(64, 9, DepthRGBAFlt32, 8);
+    Ref<Image> src = PatternImage(64, 9, DepthRGBAFlt32, 8);
     Ref<Image> back = Chain(src, "AlphaMultiply", Numbers({}), "AlphaDivide", Numbers({}));
     ASSERT_TRUE(back);
     ExpectModel([](const Px &p) { return p[3] == 0 ? Px{} : p; }, *src, *back, "round trip", 3e-7);

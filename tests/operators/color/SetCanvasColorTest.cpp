@@ -3,7 +3,6 @@
 namespace Orvane::colortest {
 
 using SetCanvasColor = ColorTool;
-
 TEST_F(SetCanvasColor, PixelsStayTheRestTakesTheColourTheSameColourHandsOnAndTheOldIdMakesTheTool) {
     const Px color{0.25, -0.5, 1.5, 1};
     ExpectFrame(
@@ -11,7 +10,7 @@ TEST_F(SetCanvasColor, PixelsStayTheRestTakesTheColourTheSameColourHandsOnAndThe
         {{Numbers({{"CanvasRed", color[0]}, {"CanvasGreen", color[1]}, {"CanvasBlue", color[2]}, {"CanvasAlpha", 1}}),
           [&](const Px &p) { return p == ToPx(kFrameCanvas) ? color : p; }}},
         0, kEveryDepth, true);
-    Ref<Image> src = Orvane::Test::WindowedImage(16, 8, ImgRectI(2, 2, 10, 6), {}, 1);
+    Ref<Image> src = WindowedImage(16, 8, ImgRectI(2, 2, 10, 6), {}, 1);
     Rig rig("SetCanvasColor", src);
     EXPECT_EQ(Render(rig.tool).Get(), src.Get()); // the default colour is the input's canvas
     EXPECT_EQ(rig.doc.AddTool(OvID("SetBgColor"))->ClassID(), OvID("SetCanvasColor"));

@@ -34,11 +34,10 @@ TEST_F(ChannelBoolean, EveryOperationAndSourceOverTwoImagesAtEveryDepthTheFrameA
     // The Foreground, 8-bit or half float, covers part of the Background's window and reaches past it.
     for (int depth : kEveryDepth) {
         const int fgDepth = depth == DepthRGBAInt8 ? DepthRGBAFlt16 : DepthRGBAInt8;
-        Ref<Image> bg = Orvane::Test::PatternImage(40, 12, depth, 6);
-        Ref<Image> fg = Orvane::Test::WindowedImage(40, 12, ImgRectI(10, -2, 52, 7), fgCanvas, 7, fgDepth);
+        Ref<Image> bg = PatternImage(40, 12, depth, 6);
+        Ref<Image> fg = WindowedImage(40, 12, ImgRectI(10, -2, 52, 7), fgCanvas, 7, fgDepth);
         Rig rig("ChannelBoolean", bg);
-        ASSERT_TRUE(rig.tool->FindInput("Foreground")
-                        ->ConnectTo(Orvane::Test::AddImageSource(rig.doc, "Fg", fg)->FindMainOutput()));
+        ASSERT_TRUE(rig.tool->FindInput("Foreground")->ConnectTo(AddImageSource(rig.doc, "Fg", fg)->FindMainOutput()));
         EXPECT_EQ(Render(rig.tool).Get(), bg.Get()) << "the defaults hand the Background on";
         for (const Case &k : kCases) {
             const std::string what = "operation " + std::to_string(k[4]) + " depth " + std::to_string(depth);

@@ -5,12 +5,11 @@
 namespace Orvane::colortest {
 
 using ChangeDepth = ColorTool;
-
 TEST_F(ChangeDepth, TheNearestValueOfTheNewDepthTheFrameAndDitherKeepingTheMeanAndTheSteps) {
     for (int from : {DepthRGBAFlt32, DepthRGBAFlt16, DepthRGBAInt16, DepthRGBAInt8, DepthAFlt32, DepthAInt16})
         for (int choice = 0; choice <= 4; ++choice) {
             const std::string what = "from " + std::to_string(from) + " choice " + std::to_string(choice);
-            Ref<Image> src = Orvane::Test::PatternImage(41, 7, from, 9);
+            Ref<Image> src = PatternImage(41, 7, from, 9);
             Rig rig("ChangeDepth", src);
             Orvane::Test::SetNumber(rig.tool, "Depth", choice);
             const int to = choice == 0 ? from : (src->IsMask() ? DepthAInt8 : DepthRGBAInt8) + choice - 1;
@@ -45,7 +44,7 @@ TEST_F(ChangeDepth, TheNearestValueOfTheNewDepthTheFrameAndDitherKeepingTheMeanA
     // Integer codes widened to float and dithered back are the same codes: dither only moves values between steps.
     for (const auto &[from, wide, back] :
          {std::tuple{DepthRGBAInt8, 4, 1}, {DepthRGBAInt16, 4, 2}, {DepthRGBAInt8, 3, 1}, {DepthAInt16, 4, 2}}) {
-        Ref<Image> codes = Orvane::Test::PatternImage(53, 9, from, 2);
+        Ref<Image> codes = PatternImage(53, 9, from, 2);
         Ref<Image> narrowed = Chain(codes, "ChangeDepth", Numbers({{"Depth", wide}}), "ChangeDepth",
                                     Numbers({{"Depth", back}, {"Dither", 1}}));
         ASSERT_TRUE(narrowed && narrowed->Depth() == from) << from;
