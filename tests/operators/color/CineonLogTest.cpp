@@ -33,9 +33,8 @@ TEST_F(CineonLog, BothWaysFollowTheFormulaRoundTripWithAndWithoutSoftClipAndBadL
     Ref<Image> src = PatternImage(64, 16, DepthRGBAFlt32, 12);
     for (double softClip : {0.0, 60.0}) {
         const Setter toLinear = Levels(95, 685, 0.6, softClip, false), toLog = Levels(95, 685, 0.6, softClip, true);
-        Rig rig("CineonLog", src);
-        toLinear(rig.tool);
-        Ref<Image> linear = Render(rig.tool), again = Chain(src, "CineonLog", toLinear, "CineonLog", toLog);
+        Ref<Image> linear = Through(src, {{"CineonLog", toLinear}}),
+                   again = Through(src, {{"CineonLog", toLinear}, {"CineonLog", toLog}});
         ASSERT_TRUE(linear && again);
         // Soft clip keeps every value at or below 1; far above its knee it flattens too much to come back from float.
         for (int i = 0; i < 64 * 16 * 3; ++i) {

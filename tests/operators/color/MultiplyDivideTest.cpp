@@ -15,7 +15,7 @@ TEST_F(MultiplyDivide, FormulaAtEveryDepthTheFrameAMaskHandedOnAndTheRoundTrip) 
         EXPECT_EQ(Render(maskRig.tool).Get(), mask.Get()) << id;
     }
     Ref<Image> src = PatternImage(64, 9, DepthRGBAFlt32, 8);
-    Ref<Image> back = Chain(src, "AlphaMultiply", Numbers({}), "AlphaDivide", Numbers({}));
+    Ref<Image> back = Through(src, {{"AlphaMultiply", Numbers({})}, {"AlphaDivide", Numbers({})}});
     ASSERT_TRUE(back);
     ExpectModel([](const Px &p) { return p[3] == 0 ? Px{} : p; }, *src, *back, "round trip", 3e-7);
 }

@@ -11,9 +11,8 @@ TEST_F(SetCanvasColor, PixelsStayTheRestTakesTheColourTheSameColourHandsOnAndThe
           [&](const Px &p) { return p == ToPx(kFrameCanvas) ? color : p; }}},
         0, kEveryDepth, true);
     Ref<Image> src = WindowedImage(16, 8, ImgRectI(2, 2, 10, 6), {}, 1);
-    Rig rig("SetCanvasColor", src);
-    EXPECT_EQ(Render(rig.tool).Get(), src.Get()); // the default colour is the input's canvas
-    EXPECT_EQ(rig.doc.AddTool(OvID("SetBgColor"))->ClassID(), OvID("SetCanvasColor"));
+    EXPECT_EQ(Through(src, {{"SetCanvasColor", Numbers({})}}).Get(), src.Get()); // the default colour is the input's
+    EXPECT_EQ(OrvaneDoc().AddTool(OvID("SetBgColor"))->ClassID(), OvID("SetCanvasColor"));
 }
 
 } // namespace Orvane::colortest

@@ -10,10 +10,8 @@ TEST_F(ChangeDepth, TheNearestValueOfTheNewDepthTheFrameAndDitherKeepingTheMeanA
         for (int choice = 0; choice <= 4; ++choice) {
             const std::string what = "from " + std::to_string(from) + " choice " + std::to_string(choice);
             Ref<Image> src = PatternImage(41, 7, from, 9);
-            Rig rig("ChangeDepth", src);
-            Orvane::Test::SetNumber(rig.tool, "Depth", choice);
             const int to = choice == 0 ? from : (src->IsMask() ? DepthAInt8 : DepthRGBAInt8) + choice - 1;
-            Ref<Image> out = Render(rig.tool);
+            Ref<Image> out = Through(src, {{"ChangeDepth", Numbers({{"Depth", choice}})}});
             ASSERT_TRUE(out && out->Depth() == to && (out.Get() == src.Get()) == (to == from)) << what;
             ExpectModel(kIdentity, *src, *out, what);
         }
@@ -45,8 +43,8 @@ TEST_F(ChangeDepth, TheNearestValueOfTheNewDepthTheFrameAndDitherKeepingTheMeanA
     for (const auto &[from, wide, back] :
          {std::tuple{DepthRGBAInt8, 4, 1}, {DepthRGBAInt16, 4, 2}, {DepthRGBAInt8, 3, 1}, {DepthAInt16, 4, 2}}) {
         Ref<Image> codes = PatternImage(53, 9, from, 2);
-        Ref<Image> narrowed = Chain(codes, "ChangeDepth", Numbers({{"Depth", wide}}), "ChangeDepth",
-                                    Numbers({{"Depth", back}, {"Dither", 1}}));
+        Ref<Image> narrowed = Through(codes, {{"ChangeDepth", Numbers({{"Depth", wide}})},
+                                              {"ChangeDepth", Numbers({{"Depth", back}, {"Dither", 1}})}});
         ASSERT_TRUE(narrowed && narrowed->Depth() == from) << from;
         ExpectSameBits(*narrowed, *codes, codes->DataWindow());
     }
