@@ -48,8 +48,9 @@ inline Ref<Image> Render(Operator *op, const ImgRectI *roi = nullptr, uint32_t f
     if (roi) opt.roi = ImageDomain(*roi);
     return Test::EvalImage(op, 0.0, opt);
 }
-/// `img` through a chain of tools, each of a class and set by its setter.
-inline Ref<Image> Through(Ref<Image> img, const std::vector<std::pair<const char *, Setter>> &tools) {
+/// `img` through a chain of tools, each of a class and set by its setter, rendered over `roi` or all of it.
+inline Ref<Image> Through(Ref<Image> img, const std::vector<std::pair<const char *, Setter>> &tools,
+                          const ImgRectI *roi = nullptr) {
     OrvaneDoc doc;
     Operator *last = Test::AddImageSource(doc, "Src", std::move(img));
     for (const auto &[classId, set] : tools) {
@@ -57,7 +58,7 @@ inline Ref<Image> Through(Ref<Image> img, const std::vector<std::pair<const char
         EXPECT_TRUE(next && next->FindMainInput()->ConnectTo(last->FindMainOutput()));
         set(last = next);
     }
-    return Render(last);
+    return Render(last, roi);
 }
 inline Px ToPx(const FltPixel &p) { return {p.R, p.G, p.B, p.A}; }
 /// Channel c at (x, y) over 0..1, read exactly from the stored data (integers over 255 or 65535 in double).

@@ -8,12 +8,11 @@ using ChangeDepth = ColorTool;
 TEST_F(ChangeDepth, TheNearestValueOfTheNewDepthTheFrameAndDitherKeepingTheMeanAndTheSteps) {
     for (int from : {DepthRGBAFlt32, DepthRGBAFlt16, DepthRGBAInt16, DepthRGBAInt8, DepthAFlt32, DepthAInt16})
         for (int choice = 0; choice <= 4; ++choice) {
-            const std::string what = "from " + std::to_string(from) + " choice " + std::to_string(choice);
             Ref<Image> src = PatternImage(41, 7, from, 9);
             const int to = choice == 0 ? from : (src->IsMask() ? DepthAInt8 : DepthRGBAInt8) + choice - 1;
             Ref<Image> out = Through(src, {{"ChangeDepth", Numbers({{"Depth", choice}})}});
-            ASSERT_TRUE(out && out->Depth() == to && (out.Get() == src.Get()) == (to == from)) << what;
-            ExpectModel(kIdentity, *src, *out, what);
+            ASSERT_TRUE(out && out->Depth() == to && (out.Get() == src.Get()) == (to == from)) << from << " " << choice;
+            ExpectModel(kIdentity, *src, *out, "from " + std::to_string(from) + " choice " + std::to_string(choice));
         }
     // Half float and 8-bit from float and from integers: host conversions and the exact way, no depth handed on.
     ExpectFrame("ChangeDepth", {{Numbers({{"Depth", 3}}), kIdentity}, {Numbers({{"Depth", 1}}), kIdentity}}, 0,
@@ -23,10 +22,9 @@ TEST_F(ChangeDepth, TheNearestValueOfTheNewDepthTheFrameAndDitherKeepingTheMeanA
     const FltPixel flat{0.3013f, 0.7f + 0.25f / 255, 0.1f, 0.6f + 0.3f / 255};
     Ref<Image> src = NewImageTagList({{ImgWidth, 64}, {ImgHeight, 64}, {ImgDepth, DepthRGBAFlt32}});
     src->Fill(flat);
-    Rig rig("ChangeDepth", src);
-    Numbers({{"Depth", 1}, {"Dither", 1}})(rig.tool);
+    const Setter dither = Numbers({{"Depth", 1}, {"Dither", 1}});
     const ImgRectI roi(13, 20, 50, 41);
-    Ref<Image> out = Render(rig.tool), part = Render(rig.tool, &roi);
+    Ref<Image> out = Through(src, {{"ChangeDepth", dither}}), part = Through(src, {{"ChangeDepth", dither}}, &roi);
     ASSERT_TRUE(out && part && part->DataWindow() == roi);
     ExpectSameBits(*part, *out, roi); // the same noise wherever a region starts
     for (int c = 0; c < 4; ++c) {
