@@ -8,8 +8,7 @@ static Setter Levels(double black, double white, double gamma, double softClip, 
         {{"Mode", toLog}, {"BlackLevel", black}, {"WhiteLevel", white}, {"FilmGamma", gamma}, {"SoftClip", softClip}});
 }
 
-/// Code (v * 1023) to linear: density 0.002 per code over the film gamma, black at 0 and white at 1; below black the
-/// straight line with the curve's slope there. No soft clip.
+/// Code v * 1023 to linear, no soft clip: density 0.002 a code over film gamma, black 0, white 1, tangent below black.
 static PixelModel Model(double black, double white, double gamma, bool toLog) {
     return [=](const Px &p) {
         const double d = 0.002 / gamma, o = std::pow(10.0, (black - white) * d), s = std::log(10.0) * d * o / (1 - o);

@@ -28,7 +28,6 @@ inline constexpr FltPixel kFrameCanvas{0.2f, 0.4f, 0.6f, 0.8f}; ///< the canvas 
 struct ColorTool : ::testing::Test {
     static void SetUpTestSuite() { Orvane::Test::LoadOperators(); }
 };
-
 /// A document with an image source feeding the main input of a tool of class `classId`.
 struct Rig {
     OrvaneDoc doc;
@@ -39,7 +38,6 @@ struct Rig {
         EXPECT_TRUE(tool && tool->FindMainInput()->ConnectTo(source->FindMainOutput()));
     }
 };
-
 /// Renders a tool's main output without the result cache.
 inline Ref<Image> Render(Operator *op, const ImgRectI *roi = nullptr, uint32_t flags = 0) {
     RenderTask task;
@@ -76,7 +74,6 @@ inline Px PxAt(const Image &img, int x, int y) {
     if (!img.DataWindow().Contains(x, y)) return ToPx(img.GetCanvasColor());
     return {Unit(img, x, y, 0), Unit(img, x, y, 1), Unit(img, x, y, 2), Unit(img, x, y, 3)};
 }
-
 /// Expects the stored pixel `got` to be the exact result `e` as `depth` holds it: clamped to 0..1 and within half a
 /// step on integers, within half an ulp on floats; plus `slack` relative (tools that work in float on integer data).
 inline void ExpectPx(int depth, const Px &got, const Px &e, double slack, const std::string &where) {
@@ -103,7 +100,6 @@ inline void ExpectSameBits(const Image &a, const Image &b, const ImgRectI &r) {
     for (int y = r.y0; y < r.y1; ++y)
         ASSERT_EQ(0, std::memcmp(a.PixelAddress(r.x0, y), b.PixelAddress(r.x0, y), r.Width() * a.BytesPerPixel())) << y;
 }
-
 /// Each setting at each depth over a 48 x 32 frame whose data window leaves kFrameCanvas on every side, under each
 /// clipping mode: pre-calculation gives windows and canvas without pixels; the canvas goes through the model (clipped,
 /// the input's stays unless `setsCanvas`); every pixel follows the model; regions crop the whole; one worker = many.

@@ -48,8 +48,7 @@ TEST_F(ChannelBoolean, EveryOperationAndSourceOverTwoImagesAtEveryDepthTheFrameA
             for (int y = 0; y < 12; ++y)
                 for (int x = 0; x < 40; ++x)
                     ExpectPx(depth, PxAt(*out, x, y), Expected(k, PxAt(*bg, x, y), PxAt(*fg, x, y)), 4e-7, what);
-            // Within 1e-6 (results lie within -1..1 here).
-            ExpectPx(DepthRGBAFlt32, ToPx(out->GetCanvasColor()),
+            ExpectPx(DepthRGBAFlt32, ToPx(out->GetCanvasColor()), // within 1e-6: results lie in -1..1
                      Expected(k, ToPx(bg->GetCanvasColor()), ToPx(fgCanvas)), 4.7e-7, what + " canvas");
         }
     }

@@ -17,8 +17,7 @@ TEST_F(ChangeDepth, TheNearestValueOfTheNewDepthTheFrameAndDitherKeepingTheMeanA
     // Half float and 8-bit from float and from integers: host conversions and the exact way, no depth handed on.
     ExpectFrame("ChangeDepth", {{Numbers({{"Depth", 3}}), kIdentity}, {Numbers({{"Depth", 1}}), kIdentity}}, 0,
                 {DepthRGBAFlt32, DepthRGBAInt16});
-    // A flat colour between two 8-bit steps: plain rounding gives one step everywhere (77 for red, 0.17 off); dither
-    // mixes the two neighbours so that the mean over an area is the value itself. Alpha is rounded.
+    // Between two 8-bit steps dither mixes both so that the mean is the value (rounding: 77 for red); alpha is rounded.
     const FltPixel flat{0.3013f, 0.7f + 0.25f / 255, 0.1f, 0.6f + 0.3f / 255};
     Ref<Image> src = NewImageTagList({{ImgWidth, 64}, {ImgHeight, 64}, {ImgDepth, DepthRGBAFlt32}});
     src->Fill(flat);
