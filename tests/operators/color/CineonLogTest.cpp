@@ -38,7 +38,7 @@ TEST_F(CineonLog, BothWaysFollowTheFormulaRoundTripWithAndWithoutSoftClipAndBadL
         // Soft clip keeps every value at or below 1; far above its knee it flattens too much to come back from float.
         for (int i = 0; i < 64 * 16 * 3; ++i) {
             const int x = i / 3 % 64, y = i / 192, c = i % 3;
-            const double v = Unit(*src, x, y, c), lin = Unit(*linear, x, y, c), came = Unit(*again, x, y, c);
+            const double v = PxAt(*src, x, y)[c], lin = PxAt(*linear, x, y)[c], came = PxAt(*again, x, y)[c];
             ASSERT_TRUE(softClip == 0 || lin <= 1) << lin;
             ASSERT_TRUE((softClip > 0 && v * 1023 >= 685 + 60) || std::fabs(came - v) <= 2e-5) << v << " " << came;
         }

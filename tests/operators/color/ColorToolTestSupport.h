@@ -59,20 +59,19 @@ inline Ref<Image> Through(Ref<Image> img, const std::vector<std::pair<const char
     return Render(last, roi);
 }
 inline Px ToPx(const FltPixel &p) { return {p.R, p.G, p.B, p.A}; }
-/// Channel c at (x, y) over 0..1, read exactly from the stored data (integers over 255 or 65535 in double).
-inline double Unit(const Image &img, int x, int y, int c) {
-    if (img.IsFloat()) return ToPx(img.GetFlt(x, y))[c];
-    const int i = (x - img.DataWindow().x0) * (img.IsMask() ? 1 : 4) + (img.IsMask() ? 0 : c);
-    return FormatOfDepth(img.Depth()).bytesPerComponent == 1 ? img.Row<uint8_t>(y)[i] / 255.0
-                                                             : img.Row<uint16_t>(y)[i] / 65535.0;
-}
 inline Setter Numbers(const std::vector<std::pair<const char *, double>> &values) {
     return [values](Operator *op) { Test::SetNumbers(op, values); };
 }
-/// The pixel at (x, y), or the canvas colour beyond the data window.
+/// The pixel at (x, y) read exactly (integers over 255 or 65535, a mask's value in each channel), canvas beyond.
 inline Px PxAt(const Image &img, int x, int y) {
     if (!img.DataWindow().Contains(x, y)) return ToPx(img.GetCanvasColor());
-    return {Unit(img, x, y, 0), Unit(img, x, y, 1), Unit(img, x, y, 2), Unit(img, x, y, 3)};
+    if (img.IsFloat()) return ToPx(img.GetFlt(x, y));
+    const int i = (x - img.DataWindow().x0) * (img.IsMask() ? 1 : 4), s = img.IsMask() ? 0 : 1;
+    const bool b = FormatOfDepth(img.Depth()).bytesPerComponent == 1;
+    Px p;
+    for (int c = 0; c < 4; ++c)
+        p[c] = b ? img.Row<uint8_t>(y)[i + c * s] / 255.0 : img.Row<uint16_t>(y)[i + c * s] / 65535.0;
+    return p;
 }
 /// Expects the stored pixel `got` to be the exact result `e` as `depth` holds it: clamped to 0..1 and within half a
 /// step on integers, within half an ulp on floats; plus `slack` relative (tools that work in float on integer data).
