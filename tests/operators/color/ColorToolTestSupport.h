@@ -5,7 +5,6 @@
 #include <cmath>
 #include <cstring>
 #include <functional>
-
 #include <gtest/gtest.h>
 
 #include "host/core/Parallel.h"
@@ -24,7 +23,6 @@ using Setting = std::pair<Setter, PixelModel>; ///< a row of a frame table: a to
 inline const std::vector<int> kEveryDepth = {DepthRGBAFlt32, DepthRGBAFlt16, DepthRGBAInt16, DepthRGBAInt8};
 inline const PixelModel kIdentity = [](const Px &p) { return p; };
 inline constexpr FltPixel kFrameCanvas{0.2f, 0.4f, 0.6f, 0.8f}; ///< the canvas colour of ExpectFrame's input
-
 struct ColorTool : ::testing::Test {
     static void SetUpTestSuite() { Orvane::Test::LoadOperators(); }
 };
