@@ -1,58 +1,16 @@
-// Set Canvas Color: pixels stay byte for byte, everything beyond the input's data window takes the new colour under
-// every clipping mode and depth, regions are crops of the whole render, the old class ID still makes the tool.
-#include <gtest/gtest.h>
-
 #include "tests/operators/color/ColorToolTestSupport.h"
 
 namespace Orvane::colortest {
-namespace {
 
-class SetCanvasColor : public ::testing::Test {
-protected:
-    static void SetUpTestSuite() { Orvane::Test::LoadOperators(); }
-};
+using SetCanvasColor = ColorTool;
 
-TEST_F(SetCanvasColor, PixelsStayAndTheRestTakesTheColourUnderEveryClippingMode) {
-    const ImgRectI inWindow(8, 4, 40, 28);
-    const FltPixel color{0.25f, -0.5f, 1.5f, 1.f};
-    for (int depth : kEveryDepth)
-        for (const auto &[mode, window] : {std::pair{"ClippingMode_None", inWindow},
-                                           {"ClippingMode_Domain", inWindow},
-                                           {"ClippingMode_Frame", ImgRectI(0, 0, 48, 32)}}) {
-            SCOPED_TRACE(std::string(mode) + " depth " + std::to_string(depth));
-            Ref<Image> src = Orvane::Test::WindowedImage(48, 32, inWindow, {0.2f, 0.4f, 0.6f, 0.8f}, 4, depth);
-            Rig rig("SetCanvasColor", src);
-            Orvane::Test::SetNumbers(
-                rig.tool,
-                {{"CanvasRed", color.R}, {"CanvasGreen", color.G}, {"CanvasBlue", color.B}, {"CanvasAlpha", 1}});
-            Orvane::Test::SetID(rig.tool, "ClippingMode", mode);
-            Ref<Image> shape = Render(rig.tool, nullptr, ReqFlagPreCalc), out = Render(rig.tool);
-            ASSERT_TRUE(shape && shape->IsNoData() && shape->DataWindow() == window && out &&
-                        out->DataWindow() == window);
-            EXPECT_TRUE(shape->GetCanvasColor() == color && out->GetCanvasColor() == color);
-            ExpectSameBits(*out, *src, inWindow);
-            for (int y = 0; y < 32; ++y)
-                for (int x = 0; x < 48; ++x)
-                    if (window.Contains(x, y) && !inWindow.Contains(x, y))
-                        for (int c = 0; c < 4; ++c)
-                            ExpectStored(depth, Unit(*out, x, y, c), ToPx(color)[c], 0, "added");
-            const ImgRectI roi(30, 20, 60, 40);
-            Ref<Image> part = Render(rig.tool, &roi);
-            ASSERT_TRUE(part && part->DataWindow() == (window & roi));
-            ExpectSameBits(*part, *out, window & roi);
-        }
+TEST_F(SetCanvasColor, PixelsStayTheRestTakesTheColourTheSameColourHandsOnAndTheOldIdMakesTheTool) {
+    const Setter set = Numbers({{"CanvasRed", .25}, {"CanvasGreen", -.5}, {"CanvasBlue", 1.5}, {"CanvasAlpha", 1}});
+    const auto model = [](const Px &p) { return p == ToPx(kFrameCanvas) ? Px{.25, -.5, 1.5, 1} : p; };
+    ExpectFrame("SetCanvasColor", {{set, model}}, 0, kEveryDepth, true);
+    Ref<Image> src = WindowedImage(16, 8, ImgRectI(2, 2, 10, 6), {}, 1);
+    EXPECT_EQ(Through(src, {{"SetCanvasColor", Numbers({})}}).Get(), src.Get()); // the default colour is the input's
+    EXPECT_EQ(OrvaneDoc().AddTool(OvID("SetBgColor"))->ClassID(), OvID("SetCanvasColor"));
 }
 
-TEST_F(SetCanvasColor, TheSameColourHandsTheInputOnAndTheOldIdMakesTheTool) {
-    Ref<Image> src = Orvane::Test::WindowedImage(16, 8, ImgRectI(2, 2, 10, 6), {}, 1);
-    Rig rig("SetCanvasColor", src);
-    EXPECT_EQ(Render(rig.tool).Get(), src.Get()); // the default colour is the input's canvas
-    Orvane::Test::SetNumber(rig.tool, "CanvasAlpha", 1);
-    Ref<Image> out = Render(rig.tool);
-    ASSERT_TRUE(out && out.Get() != src.Get());
-    EXPECT_EQ(out->GetCanvasColor(), (FltPixel{0.f, 0.f, 0.f, 1.f}));
-    EXPECT_EQ(rig.doc.AddTool(OvID("SetBgColor"))->ClassID(), OvID("SetCanvasColor"));
-}
-
-} // namespace
 } // namespace Orvane::colortest

@@ -1,93 +1,60 @@
-// Channel Booleans: every operation and source against the formula written here, over a Foreground of another depth
-// and data window, every Background depth; the frame without a Foreground; defaults hand on.
-#include <gtest/gtest.h>
-
 #include "tests/operators/color/ColorToolTestSupport.h"
 
 namespace Orvane::colortest {
-namespace {
 
-class ChannelBoolean : public ::testing::Test {
-protected:
-    static void SetUpTestSuite() { Orvane::Test::LoadOperators(); }
-};
+using ChannelBoolean = ColorTool;
+using Case = std::array<int, 5>; ///< the source of red, green, blue and alpha, then the operation
 
-// Sources: channels 0-3 of the Background, 4-7 of the Foreground, black, white, luminance of each.
+// Sources: channels 0-3 of the Background, 4-7 of the Foreground, black, white, luminance of each. Operations: Copy,
+// Add, Subtract, Multiply, Divide, Minimum, Maximum, Difference, Average.
 enum { RBG, GBG, BBG, ABG, RFG, GFG, BFG, AFG, Black, White, LumaBG, LumaFG };
+const Case kCases[] = {{AFG, RBG, LumaFG, White, 0},    {RFG, GFG, BFG, AFG, 1},   {BFG, RFG, GBG, Black, 2},
+                       {LumaBG, LumaFG, AFG, White, 3}, {RFG, GFG, Black, AFG, 4}, {RFG, GFG, BFG, AFG, 5},
+                       {AFG, LumaFG, BFG, RBG, 6},      {RFG, GFG, BFG, AFG, 7},   {GFG, BBG, BFG, AFG, 8}};
 
-struct Case {
-    int to[4];
-    int operation; // Copy, Add, Subtract, Multiply, Divide, Minimum, Maximum, Difference, Average
-};
-const Case kCases[] = {{{AFG, RBG, LumaFG, White}, 0},    {{RFG, GFG, BFG, AFG}, 1},   {{BFG, RFG, GBG, Black}, 2},
-                       {{LumaBG, LumaFG, AFG, White}, 3}, {{RFG, GFG, Black, AFG}, 4}, {{RFG, GFG, BFG, AFG}, 5},
-                       {{AFG, LumaFG, BFG, RBG}, 6},      {{RFG, GFG, BFG, AFG}, 7},   {{GFG, BBG, BFG, AFG}, 8}};
-
-Px Expected(const Case &k, const Px &b, const Px &f) {
+static Px Expected(const Case &k, const Px &b, const Px &f) {
     auto luma = [](const Px &p) { return 0.2126 * p[0] + 0.7152 * p[1] + 0.0722 * p[2]; };
     Px out;
     for (int c = 0; c < 4; ++c) {
-        const int s = k.to[c];
+        const int s = k[c];
         const double v = s < 4 ? b[s] : s < 8 ? f[s - 4] : s == Black ? 0 : s == White ? 1 : luma(s == LumaBG ? b : f);
-        const double ops[] = {v,
-                              b[c] + v,
-                              b[c] - v,
-                              b[c] * v,
-                              v == 0 ? 0 : b[c] / v,
-                              std::min(b[c], v),
-                              std::max(b[c], v),
-                              std::fabs(b[c] - v),
-                              (b[c] + v) / 2};
-        out[c] = ops[k.operation];
+        const double a = b[c], q = v == 0 ? 0 : a / v;
+        const double r[] = {v, a + v, a - v, a * v, q, std::min(a, v), std::max(a, v), std::fabs(a - v), (a + v) / 2};
+        out[c] = r[k[4]];
     }
     return out;
 }
 
-void Apply(Operator *op, const Case &k) {
-    Orvane::Test::SetNumbers(op, {{"ToRed", k.to[0]},
-                                  {"ToGreen", k.to[1]},
-                                  {"ToBlue", k.to[2]},
-                                  {"ToAlpha", k.to[3]},
-                                  {"Operation", k.operation}});
+static Setter Apply(const Case &k) {
+    return Numbers({{"ToRed", k[0]}, {"ToGreen", k[1]}, {"ToBlue", k[2]}, {"ToAlpha", k[3]}, {"Operation", k[4]}});
 }
 
-TEST_F(ChannelBoolean, EveryOperationAndSourceOverTwoImagesAtEveryDepth) {
+TEST_F(ChannelBoolean, EveryOperationAndSourceOverTwoImagesAtEveryDepthTheFrameAndTheDefaultsHandOn) {
     const FltPixel fgCanvas{0.1f, 0.3f, 0.f, 0.5f};
-    for (int depth : kEveryDepth)
-        for (int fgDepth : {DepthRGBAFlt16, DepthRGBAInt8}) {
-            // The Foreground covers part of the Background's window and reaches past it.
-            Ref<Image> bg = Orvane::Test::PatternImage(40, 12, depth, 6);
-            Ref<Image> fg = Orvane::Test::WindowedImage(40, 12, ImgRectI(10, -2, 52, 7), fgCanvas, 7, fgDepth);
-            Rig rig("ChannelBoolean", bg);
-            ASSERT_TRUE(rig.tool->FindInput("Foreground")
-                            ->ConnectTo(Orvane::Test::AddImageSource(rig.doc, "Fg", fg)->FindMainOutput()));
-            for (const Case &k : kCases) {
-                const std::string what = "operation " + std::to_string(k.operation) + " depth " + std::to_string(depth);
-                Apply(rig.tool, k);
-                Ref<Image> out = Render(rig.tool);
-                ASSERT_TRUE(out && out->DataWindow() == bg->DataWindow()) << what;
-                for (int y = 0; y < 12; ++y)
-                    for (int x = 0; x < 40; ++x) {
-                        const Px f = fg->DataWindow().Contains(x, y) ? UnitPx(*fg, x, y) : ToPx(fgCanvas);
-                        const Px e = Expected(k, UnitPx(*bg, x, y), f);
-                        // Float rows work in float on a Foreground read as float.
-                        for (int c = 0; c < 4; ++c) ExpectStored(depth, Unit(*out, x, y, c), e[c], 4e-7, what);
-                    }
-                const Px canvas = Expected(k, ToPx(bg->GetCanvasColor()), ToPx(fgCanvas));
-                for (int c = 0; c < 4; ++c) EXPECT_NEAR(ToPx(out->GetCanvasColor())[c], canvas[c], 1e-6) << what;
-            }
+    // The Foreground, 8-bit or half float, covers part of the Background's window and reaches past it.
+    for (int depth : kEveryDepth) {
+        const int fgDepth = depth == DepthRGBAInt8 ? DepthRGBAFlt16 : DepthRGBAInt8;
+        Ref<Image> bg = PatternImage(40, 12, depth, 6);
+        Ref<Image> fg = WindowedImage(40, 12, ImgRectI(10, -2, 52, 7), fgCanvas, 7, fgDepth);
+        Rig rig("ChannelBoolean", bg);
+        ASSERT_TRUE(rig.tool->FindInput("Foreground")->ConnectTo(AddImageSource(rig.doc, "Fg", fg)->FindMainOutput()));
+        EXPECT_EQ(Render(rig.tool).Get(), bg.Get()) << "the defaults hand the Background on";
+        for (const Case &k : kCases) {
+            const std::string what = "operation " + std::to_string(k[4]) + " depth " + std::to_string(depth);
+            Apply(k)(rig.tool);
+            Ref<Image> out = Render(rig.tool);
+            ASSERT_TRUE(out && out->DataWindow() == bg->DataWindow()) << what;
+            // Float rows work in float on a Foreground read as float.
+            for (int y = 0; y < 12; ++y)
+                for (int x = 0; x < 40; ++x)
+                    ExpectPx(depth, PxAt(*out, x, y), Expected(k, PxAt(*bg, x, y), PxAt(*fg, x, y)), 4e-7, what);
+            ExpectPx(DepthRGBAFlt32, ToPx(out->GetCanvasColor()), // within 1e-6: results lie in -1..1
+                     Expected(k, ToPx(bg->GetCanvasColor()), ToPx(fgCanvas)), 4.7e-7, what + " canvas");
         }
+    }
+    // Without a Foreground, its channels read as 0.
+    const auto model = [](const Case &k) { return [k](const Px &p) { return Expected(k, p, Px{}); }; };
+    ExpectFrame("ChannelBoolean", {{Apply(kCases[0]), model(kCases[0])}, {Apply(kCases[4]), model(kCases[4])}}, 4e-7);
 }
 
-TEST_F(ChannelBoolean, TheFrameHoldsWithoutAForegroundAndTheDefaultsHandOn) {
-    for (const Case &k : {kCases[0], kCases[4]})
-        ExpectFrame(
-            "ChannelBoolean", [k](Operator *op) { Apply(op, k); }, [k](const Px &p) { return Expected(k, p, Px{}); },
-            4e-7);
-    Ref<Image> bg = Orvane::Test::PatternImage(8, 4);
-    Rig rig("ChannelBoolean", bg);
-    EXPECT_EQ(Render(rig.tool).Get(), bg.Get());
-}
-
-} // namespace
 } // namespace Orvane::colortest

@@ -1,80 +1,50 @@
-// Change Depth: every conversion gives the nearest value of the new depth; dither keeps the mean and the steps and
-// repeats bit for bit; the frame.
-#include <gtest/gtest.h>
+#include <tuple>
 
 #include "tests/operators/color/ColorToolTestSupport.h"
 
 namespace Orvane::colortest {
-namespace {
 
-class ChangeDepth : public ::testing::Test {
-protected:
-    static void SetUpTestSuite() { Orvane::Test::LoadOperators(); }
-};
-
-const PixelModel kSame = [](const Px &p) { return p; };
-
-TEST_F(ChangeDepth, EveryConversionGivesTheNearestValueOfTheNewDepth) {
+using ChangeDepth = ColorTool;
+TEST_F(ChangeDepth, TheNearestValueOfTheNewDepthTheFrameAndDitherKeepingTheMeanAndTheSteps) {
     for (int from : {DepthRGBAFlt32, DepthRGBAFlt16, DepthRGBAInt16, DepthRGBAInt8, DepthAFlt32, DepthAInt16})
         for (int choice = 0; choice <= 4; ++choice) {
-            const std::string what = "from " + std::to_string(from) + " choice " + std::to_string(choice);
-            Ref<Image> src = Orvane::Test::PatternImage(41, 7, from, 9);
-            Rig rig("ChangeDepth", src);
-            Orvane::Test::SetNumber(rig.tool, "Depth", choice);
-            Ref<Image> out = Render(rig.tool);
-            ASSERT_TRUE(out) << what;
+            Ref<Image> src = PatternImage(41, 7, from, 9);
             const int to = choice == 0 ? from : (src->IsMask() ? DepthAInt8 : DepthRGBAInt8) + choice - 1;
-            EXPECT_TRUE(out->Depth() == to && (out.Get() == src.Get()) == (to == from)) << what;
-            ExpectModel(kSame, *src, *out, what);
+            Ref<Image> out = Through(src, {{"ChangeDepth", Numbers({{"Depth", choice}})}});
+            ASSERT_TRUE(out && out->Depth() == to && (out.Get() == src.Get()) == (to == from)) << from << " " << choice;
+            ExpectModel(kIdentity, *src, *out, "from " + std::to_string(from) + " choice " + std::to_string(choice));
         }
-    ExpectFrame("ChangeDepth", [](Operator *op) { Orvane::Test::SetNumber(op, "Depth", 1); }, kSame, 0,
+    // Half float and 8-bit from float and from integers: host conversions and the exact way, no depth handed on.
+    ExpectFrame("ChangeDepth", {{Numbers({{"Depth", 3}}), kIdentity}, {Numbers({{"Depth", 1}}), kIdentity}}, 0,
                 {DepthRGBAFlt32, DepthRGBAInt16});
-    ExpectFrame("ChangeDepth", [](Operator *op) { Orvane::Test::SetNumber(op, "Depth", 4); }, kSame, 0,
-                {DepthRGBAInt8});
-}
-
-TEST_F(ChangeDepth, DitherKeepsTheMeanAndRepeatsOverRegions) {
-    // A flat colour between two 8-bit steps: plain rounding gives one step everywhere (77 for red, 0.17 off); dither
-    // mixes the two neighbours so that the mean over an area is the value itself. Alpha is rounded.
-    const Px flat{0.3013, 0.7 + 0.25 / 255, 0.1, 0.6 + 0.3 / 255};
+    // Between two 8-bit steps dither mixes both so that the mean is the value (rounding: 77 for red); alpha is rounded.
+    const FltPixel flat{0.3013f, 0.7f + 0.25f / 255, 0.1f, 0.6f + 0.3f / 255};
     Ref<Image> src = NewImageTagList({{ImgWidth, 64}, {ImgHeight, 64}, {ImgDepth, DepthRGBAFlt32}});
-    src->Fill({float(flat[0]), float(flat[1]), float(flat[2]), float(flat[3])});
-    Rig rig("ChangeDepth", src);
-    Orvane::Test::SetNumbers(rig.tool, {{"Depth", 1}, {"Dither", 1}});
-    Ref<Image> out = Render(rig.tool);
-    ASSERT_TRUE(out);
+    src->Fill(flat);
+    const Setter dither = Numbers({{"Depth", 1}, {"Dither", 1}});
+    const ImgRectI roi(13, 20, 50, 41);
+    Ref<Image> out = Through(src, {{"ChangeDepth", dither}}), part = Through(src, {{"ChangeDepth", dither}}, &roi);
+    ASSERT_TRUE(out && part && part->DataWindow() == roi);
+    ExpectSameBits(*part, *out, roi); // the same noise wherever a region starts
     for (int c = 0; c < 4; ++c) {
-        const double v = float(flat[c]) * 255.0;
+        const double v = ToPx(flat)[c] * 255;
         double sum = 0;
-        for (int y = 0; y < 64; ++y)
-            for (int x = 0; x < 64; ++x) {
-                const double got = out->Row<uint8_t>(y)[4 * x + c];
-                ASSERT_TRUE(c < 3 ? got == std::floor(v) || got == std::ceil(v) : got == std::round(v)) << c;
-                sum += got;
-            }
+        for (int i = 0; i < 64 * 64; ++i) {
+            const double got = out->Row<uint8_t>(i / 64)[4 * (i % 64) + c];
+            ASSERT_TRUE(c < 3 ? got == std::floor(v) || got == std::ceil(v) : got == std::round(v)) << c;
+            sum += got;
+        }
         EXPECT_NEAR(sum / 4096, v, c < 3 ? 0.03 : 0.5) << "channel " << c;
     }
-    ExpectSameBits(*Render(rig.tool), *out, out->DataWindow());
-    const ImgRectI roi(13, 20, 50, 41);
-    Ref<Image> part = Render(rig.tool, &roi);
-    ASSERT_TRUE(part && part->DataWindow() == roi);
-    ExpectSameBits(*part, *out, roi);
-}
-
-TEST_F(ChangeDepth, StepsSurviveADitheredTripThroughFloat) {
     // Integer codes widened to float and dithered back are the same codes: dither only moves values between steps.
     for (const auto &[from, wide, back] :
          {std::tuple{DepthRGBAInt8, 4, 1}, {DepthRGBAInt16, 4, 2}, {DepthRGBAInt8, 3, 1}, {DepthAInt16, 4, 2}}) {
-        Ref<Image> src = Orvane::Test::PatternImage(53, 9, from, 2);
-        Rig rig("ChangeDepth", src);
-        Orvane::Test::SetNumber(rig.tool, "Depth", wide);
-        Operator *narrow = rig.Then("ChangeDepth");
-        Orvane::Test::SetNumbers(narrow, {{"Depth", back}, {"Dither", 1}});
-        Ref<Image> out = Render(narrow);
-        ASSERT_TRUE(out && out->Depth() == from) << from;
-        ExpectSameBits(*out, *src, src->DataWindow());
+        Ref<Image> codes = PatternImage(53, 9, from, 2);
+        Ref<Image> narrowed = Through(codes, {{"ChangeDepth", Numbers({{"Depth", wide}})},
+                                              {"ChangeDepth", Numbers({{"Depth", back}, {"Dither", 1}})}});
+        ASSERT_TRUE(narrowed && narrowed->Depth() == from) << from;
+        ExpectSameBits(*narrowed, *codes, codes->DataWindow());
     }
 }
 
-} // namespace
 } // namespace Orvane::colortest
