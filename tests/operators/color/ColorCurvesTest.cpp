@@ -45,12 +45,12 @@ TEST_F(CurveTools, ColorCurvesFollowTheCurvesAtEveryDepthAndTheFrameHolds) {
                                            {kIdentityCurve, kIdentityCurve, falling, kIdentityCurve, gamma}};
     for (const auto &curves : cases) {
         const char *ids[] = {"Red", "Green", "Blue", "Alpha", "Luminance"};
-        ExpectFrame(
-            "ColorCurves",
-            [&](Operator *op) {
-                for (int i = 0; i < 5; ++i) SetCurve(op, ids[i], curves[i]);
-            },
-            ColorCurvesModel(curves), 1e-9);
+        ExpectFrame("ColorCurves",
+                    {{[&](Operator *op) {
+                          for (int i = 0; i < 5; ++i) SetCurve(op, ids[i], curves[i]);
+                      },
+                      ColorCurvesModel(curves)}},
+                    1e-9);
     }
 }
 
@@ -105,13 +105,13 @@ TEST_F(CurveTools, HueCurvesFollowTheCurvesAtEveryDepthAndTheFrameHolds) {
         {noShift, Points{{0.1, 1.8}, {0.5, -0.5}, {0.9, 1}}, Points{{0.2, 0.5}, {0.6, 1.4}}},
     };
     for (const auto &curves : cases)
-        ExpectFrame(
-            "HueCurves",
-            [&](Operator *op) {
-                SetCurve(op, "Hue", curves[0]), SetCurve(op, "Saturation", curves[1]);
-                SetCurve(op, "Luminance", curves[2]);
-            },
-            HueCurvesModel(curves), 2e-8); // tables read between samples 1/65535 turn apart: ~1e-9 off the curve
+        ExpectFrame("HueCurves",
+                    {{[&](Operator *op) {
+                          SetCurve(op, "Hue", curves[0]), SetCurve(op, "Saturation", curves[1]);
+                          SetCurve(op, "Luminance", curves[2]);
+                      },
+                      HueCurvesModel(curves)}},
+                    2e-8); // tables read between samples 1/65535 turn apart: ~1e-9 off the curve
 }
 
 TEST_F(CurveTools, HueCurvesOnPrimariesAndGreysWorkedOutByHand) {
