@@ -62,54 +62,75 @@ struct PixelSettings {
 };
 
 /// Hue of R, G, B in 0..1 (0 for grey), as the suppression table reads it.
+/// Written with selects rather than branches so that loops over planes of
+/// pixels compile to vector code; every operation is the one a branching
+/// form would do, so the result is the same bits.
 inline float HueOf(float r, float g, float b) {
     const float mx = r > g ? (r > b ? r : b) : (g > b ? g : b), mn = r < g ? (r < b ? r : b) : (g < b ? g : b);
-    if (mx == mn) return 0.f;
     const float d = mx - mn;
-    float h = mx == r ? (g - b) / d : mx == g ? (b - r) / d + 2.f : (r - g) / d + 4.f;
+    const bool redMax = mx == r, greenMax = mx == g;
+    const float q = (redMax ? g - b : greenMax ? b - r : r - g) / d;
+    float h = redMax ? q : q + (greenMax ? 2.f : 4.f);
     h /= 6.f;
-    return h < 0.f ? h + 1.f : h;
+    h = h < 0.f ? h + 1.f : h;
+    return mx == mn ? 0.f : h;
 }
 
 /// Pixels the block functions below take at a time at most.
 constexpr int kBlock = 256;
 
-/// One record's range function on n pixels p (RGBA) with luminances L, into
-/// out (which may be p itself). Stage by stage over the block, each flag
-/// tested once, so the multiply-add stages compile to vector operations.
-inline void RangeBlock(const PixelSettings &s, const RangeRecord &r, const float *L, const float (*p)[4],
-                       float (*out)[4], int n) {
-    if (out != p)
-        for (int k = 0; k < n; ++k)
-            for (int i = 0; i < 4; ++i) out[k][i] = p[k][i];
-    if (r.doMatrix)
-        for (int k = 0; k < n; ++k) {
-            const float in[3] = {out[k][0], out[k][1], out[k][2]};
-            if (s.tintMode == TintFast || (L[k] >= 0.f && L[k] <= 1.f)) {
-                (L[k] < 0.5f ? r.low : r.high).Apply(in, out[k]);
-            } else {
+/// A block of pixels as four planes: R, G, B, A.
+using Planes = float[4][kBlock];
+
+/// One record's range function on n pixels `in` with luminances L, into out
+/// (which may be `in` itself). Stage by stage over the planes, each flag
+/// tested once, so every stage compiles to vector operations.
+inline void RangePlanes(const PixelSettings &s, const RangeRecord &r, const float *L, const Planes &in, Planes &out,
+                        int n) {
+    if (r.doMatrix) {
+        // Pixels below black or above white (or not a number) take the
+        // luma-first detour in the Full and Better modes; they are rare, and
+        // are worked out first since `out` may be `in`.
+        int detours = 0, at[kBlock];
+        float detour[kBlock][3];
+        if (s.tintMode != TintFast)
+            for (int k = 0; k < n; ++k) {
+                if (L[k] >= 0.f && L[k] <= 1.f) continue;
+                const float rgb[3] = {in[0][k], in[1][k], in[2][k]};
                 float y[3], z[3];
-                s.toLumaFirst.Apply(in, y);
+                s.toLumaFirst.Apply(rgb, y);
                 const float luma = y[0];
                 const bool below = L[k] < 0.f;
                 y[0] = below ? std::fmax(y[0], 0.f) : std::fmin(y[0], 1.f);
                 (below ? r.belowBlack : r.aboveWhite).Apply(y, z);
                 z[0] = luma;
-                s.fromLumaFirst.Apply(z, out[k]);
+                s.fromLumaFirst.Apply(z, detour[detours]);
+                at[detours++] = k;
+            }
+        // Both halves' matrices for every pixel, the one for its luminance kept.
+        const Matrix34 &lo = r.low, &hi = r.high;
+        for (int k = 0; k < n; ++k) {
+            const float a = in[0][k], b = in[1][k], c = in[2][k];
+            const bool dark = L[k] < 0.5f;
+            for (int i = 0; i < 3; ++i) {
+                const float vl = lo.m[i][0] * a + lo.m[i][1] * b + lo.m[i][2] * c + lo.m[i][3];
+                const float vh = hi.m[i][0] * a + hi.m[i][1] * b + hi.m[i][2] * c + hi.m[i][3];
+                out[i][k] = dark ? vl : vh;
             }
         }
-    auto levels = [out, n](const float *mul, const float *add) {
-        for (int k = 0; k < n; ++k)
-            for (int i = 0; i < 3; ++i) out[k][i] = out[k][i] * mul[i] + add[i];
+        for (int j = 0; j < detours; ++j)
+            for (int i = 0; i < 3; ++i) out[i][at[j]] = detour[j][i];
+    } else if (&out != &in) {
+        for (int i = 0; i < 3; ++i) std::copy(in[i], in[i] + n, out[i]);
+    }
+    if (&out != &in) std::copy(in[3], in[3] + n, out[3]);
+    auto levels = [&out, n](const float *mul, const float *add) {
+        for (int i = 0; i < 3; ++i)
+            for (int k = 0; k < n; ++k) out[i][k] = out[i][k] * mul[i] + add[i];
     };
-    auto gamma = [out, n, &r] { // a true power with the sign kept, one channel's values at a time
-        float plane[kBlock];
-        for (int i = 0; i < 3; ++i) {
-            if (r.gamma[i] == 1.f) continue;
-            for (int k = 0; k < n; ++k) plane[k] = out[k][i];
-            PowAbsSigned(plane, r.gamma[i], plane, n);
-            for (int k = 0; k < n; ++k) out[k][i] = plane[k];
-        }
+    auto gamma = [&out, n, &r] { // a true power with the sign kept
+        for (int i = 0; i < 3; ++i)
+            if (r.gamma[i] != 1.f) PowAbsSigned(out[i], r.gamma[i], out[i], n);
     };
     if (s.gammaAfterLevels) {
         if (r.doLevels1) levels(r.mul1, r.add1);
@@ -119,23 +140,79 @@ inline void RangeBlock(const PixelSettings &s, const RangeRecord &r, const float
         if (r.doGamma) gamma();
         if (r.doLevels1) levels(r.mul1, r.add1);
     }
-    if (const Suppression *t = r.suppression)
+    if (const Suppression *t = r.suppression) {
+        int index[kBlock];
         for (int k = 0; k < n; ++k) {
-            float *c = out[k];
-            int i = static_cast<int>(Suppression::kSamples * HueOf(c[0], c[1], c[2]));
-            i = i < 0 ? 0 : i >= Suppression::kSamples ? Suppression::kSamples - 1 : i;
-            const float f = t->factor[i];
-            if (std::fabs(f - 1.f) > 1e-6f) {
-                const float d = (t->wR * c[0] + t->wG * c[1] + t->wB * c[2] + t->offset) * (1.f - f);
-                for (int j = 0; j < 3; ++j) c[j] = c[j] * f + d;
-            }
+            const int i = static_cast<int>(Suppression::kSamples * HueOf(out[0][k], out[1][k], out[2][k]));
+            index[k] = i < 0 ? 0 : i >= Suppression::kSamples ? Suppression::kSamples - 1 : i;
         }
+        float factor[kBlock];
+        for (int k = 0; k < n; ++k) factor[k] = t->factor[index[k]];
+        for (int k = 0; k < n; ++k) {
+            const float f = factor[k], c0 = out[0][k], c1 = out[1][k], c2 = out[2][k];
+            const bool moves = std::fabs(f - 1.f) > 1e-6f;
+            const float d = (t->wR * c0 + t->wG * c1 + t->wB * c2 + t->offset) * (1.f - f);
+            out[0][k] = moves ? c0 * f + d : c0;
+            out[1][k] = moves ? c1 * f + d : c1;
+            out[2][k] = moves ? c2 * f + d : c2;
+        }
+    }
 }
 
 /// The range function of one pixel.
 inline void RangeFunction(const PixelSettings &s, const RangeRecord &r, float L, const float p[4], float out[4]) {
-    RangeBlock(s, r, &L, reinterpret_cast<const float(*)[4]>(p), reinterpret_cast<float(*)[4]>(out), 1);
+    Planes q;
+    for (int i = 0; i < 4; ++i) q[i][0] = p[i];
+    RangePlanes(s, r, &L, q, q, 1);
+    for (int i = 0; i < 4; ++i) out[i] = q[i][0];
 }
+
+/// The whole correction of up to kBlock pixels (RGBA), in place.
+inline void CorrectBlock(const PixelSettings &s, float (*p)[4], int n) {
+    Planes in;
+    for (int k = 0; k < n; ++k)
+        for (int i = 0; i < 4; ++i) in[i][k] = p[k][i];
+    if (s.preDivide)
+        for (int k = 0; k < n; ++k) {
+            const float a = in[3][k];
+            for (int i = 0; i < 3; ++i) in[i][k] = a == 0.f ? 0.f : in[i][k] / a;
+        }
+    float L[kBlock];
+    if (s.rangesInUse || s.records[0].doMatrix)
+        for (int k = 0; k < n; ++k) L[k] = 0.299f * in[0][k] + 0.587f * in[1][k] + 0.114f * in[2][k];
+    else
+        std::fill(L, L + n, 0.f);
+    Planes *result = &in;
+    Planes sum;
+    if (!s.rangesInUse) {
+        RangePlanes(s, s.records[0], L, in, in, n);
+    } else {
+        Planes part;
+        float w[3][kBlock];
+        for (int k = 0; k < n; ++k) s.curves->WeightsAt(L[k], w[0][k], w[1][k], w[2][k]);
+        for (int r = 0; r < 3; ++r) {
+            RangePlanes(s, s.records[r], L, in, part, n);
+            if (r == 0) // 0 + x, as a sum from 0 would give (-0 becomes +0)
+                for (int i = 0; i < 4; ++i)
+                    for (int k = 0; k < n; ++k) sum[i][k] = 0.f + w[0][k] * part[i][k];
+            else
+                for (int i = 0; i < 4; ++i)
+                    for (int k = 0; k < n; ++k) sum[i][k] += w[r][k] * part[i][k];
+        }
+        result = &sum;
+    }
+    Planes &o = *result;
+    if (s.postMultiply)
+        for (int k = 0; k < n; ++k) {
+            const float a = o[3][k] > -1e-6f && o[3][k] < 1e-6f ? 0.f : o[3][k];
+            for (int i = 0; i < 3; ++i) o[i][k] *= a;
+        }
+    for (int k = 0; k < n; ++k)
+        for (int i = 0; i < 4; ++i) p[k][i] = o[i][k];
+}
+
+/// The whole correction of one pixel, in place.
+inline void CorrectPixel(const PixelSettings &s, float p[4]) { CorrectBlock(s, reinterpret_cast<float(*)[4]>(p), 1); }
 
 /// Step 1: R, G, B over alpha, or 0 where alpha is exactly 0.
 inline void PreDivide(float p[4]) {
@@ -146,37 +223,6 @@ inline void PreDivide(float p[4]) {
 }
 
 inline float LumaOf(const float p[4]) { return 0.299f * p[0] + 0.587f * p[1] + 0.114f * p[2]; }
-
-/// The whole correction of up to kBlock pixels, in place.
-inline void CorrectBlock(const PixelSettings &s, float (*p)[4], int n) {
-    if (s.preDivide)
-        for (int k = 0; k < n; ++k) PreDivide(p[k]);
-    float L[kBlock];
-    if (s.rangesInUse || s.records[0].doMatrix)
-        for (int k = 0; k < n; ++k) L[k] = LumaOf(p[k]);
-    else
-        std::fill(L, L + n, 0.f);
-    if (!s.rangesInUse) {
-        RangeBlock(s, s.records[0], L, p, p, n);
-    } else {
-        float sum[kBlock][4] = {}, part[kBlock][4], w[kBlock][3];
-        for (int k = 0; k < n; ++k) s.curves->WeightsAt(L[k], w[k][0], w[k][1], w[k][2]);
-        for (int r = 0; r < 3; ++r) {
-            RangeBlock(s, s.records[r], L, p, part, n);
-            for (int k = 0; k < n; ++k)
-                for (int i = 0; i < 4; ++i) sum[k][i] += w[k][r] * part[k][i];
-        }
-        std::copy(&sum[0][0], &sum[0][0] + 4 * n, &p[0][0]);
-    }
-    if (s.postMultiply)
-        for (int k = 0; k < n; ++k) {
-            const float a = p[k][3] > -1e-6f && p[k][3] < 1e-6f ? 0.f : p[k][3];
-            for (int i = 0; i < 3; ++i) p[k][i] *= a;
-        }
-}
-
-/// The whole correction of one pixel, in place.
-inline void CorrectPixel(const PixelSettings &s, float p[4]) { CorrectBlock(s, reinterpret_cast<float(*)[4]>(p), 1); }
 
 /// Which weight RangeOutput shows.
 enum RangeShown { ShowResult = 0, ShowShadows = 1, ShowMidtones = 2, ShowHighlights = 3 };
