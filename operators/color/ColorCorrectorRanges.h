@@ -17,6 +17,7 @@
 //
 // Thread safety: everything here is read-only once Process has filled it.
 #include <algorithm>
+#include <bit>
 #include <cmath>
 #include <cstdint>
 
@@ -61,19 +62,29 @@ struct PixelSettings {
     const ColorCurvesTable *curves = nullptr; ///< needed when rangesInUse
 };
 
+/// c ? a : b, by bit masks. Both values must be computed whatever c is, so a
+/// loop of these has no branch and compiles to vector code; a plain ?: over
+/// computed values lets the compiler move their arithmetic under a branch
+/// (float operations may trap), and the loop stays scalar.
+inline float Pick(bool c, float a, float b) {
+    const uint32_t mask = 0u - static_cast<uint32_t>(c);
+    return std::bit_cast<float>((std::bit_cast<uint32_t>(a) & mask) | (std::bit_cast<uint32_t>(b) & ~mask));
+}
+
 /// Hue of R, G, B in 0..1 (0 for grey), as the suppression table reads it.
-/// Written with selects rather than branches so that loops over planes of
-/// pixels compile to vector code; every operation is the one a branching
-/// form would do, so the result is the same bits.
+/// Every operation runs for every pixel and selects pick the results, so
+/// that loops over planes of pixels compile to vector code (a conditional
+/// float operation would keep them scalar); the selected values are the ones
+/// a branching form computes, bit for bit.
 inline float HueOf(float r, float g, float b) {
     const float mx = r > g ? (r > b ? r : b) : (g > b ? g : b), mn = r < g ? (r < b ? r : b) : (g < b ? g : b);
     const float d = mx - mn;
     const bool redMax = mx == r, greenMax = mx == g;
-    const float q = (redMax ? g - b : greenMax ? b - r : r - g) / d;
-    float h = redMax ? q : q + (greenMax ? 2.f : 4.f);
-    h /= 6.f;
-    h = h < 0.f ? h + 1.f : h;
-    return mx == mn ? 0.f : h;
+    const float fromRed = g - b, fromGreen = b - r, fromBlue = r - g;
+    const float q = Pick(redMax, fromRed, Pick(greenMax, fromGreen, fromBlue)) / d;
+    const float shifted = q + Pick(greenMax, 2.f, 4.f);
+    const float h = Pick(redMax, q, shifted) / 6.f, wrapped = h + 1.f;
+    return Pick(mx == mn, 0.f, Pick(h < 0.f, wrapped, h));
 }
 
 /// Pixels the block functions below take at a time at most.
@@ -108,14 +119,14 @@ inline void RangePlanes(const PixelSettings &s, const RangeRecord &r, const floa
                 at[detours++] = k;
             }
         // Both halves' matrices for every pixel, the one for its luminance kept.
-        const Matrix34 &lo = r.low, &hi = r.high;
+        const Matrix34 lo = r.low, hi = r.high; // copies: `out` cannot alias them
         for (int k = 0; k < n; ++k) {
             const float a = in[0][k], b = in[1][k], c = in[2][k];
             const bool dark = L[k] < 0.5f;
             for (int i = 0; i < 3; ++i) {
                 const float vl = lo.m[i][0] * a + lo.m[i][1] * b + lo.m[i][2] * c + lo.m[i][3];
                 const float vh = hi.m[i][0] * a + hi.m[i][1] * b + hi.m[i][2] * c + hi.m[i][3];
-                out[i][k] = dark ? vl : vh;
+                out[i][k] = Pick(dark, vl, vh);
             }
         }
         for (int j = 0; j < detours; ++j)
@@ -140,21 +151,24 @@ inline void RangePlanes(const PixelSettings &s, const RangeRecord &r, const floa
         if (r.doGamma) gamma();
         if (r.doLevels1) levels(r.mul1, r.add1);
     }
-    if (const Suppression *t = r.suppression) {
+    if (r.suppression) {
+        const Suppression &t = *r.suppression;
+        const float wR = t.wR, wG = t.wG, wB = t.wB, offset = t.offset;
         int index[kBlock];
         for (int k = 0; k < n; ++k) {
             const int i = static_cast<int>(Suppression::kSamples * HueOf(out[0][k], out[1][k], out[2][k]));
             index[k] = i < 0 ? 0 : i >= Suppression::kSamples ? Suppression::kSamples - 1 : i;
         }
         float factor[kBlock];
-        for (int k = 0; k < n; ++k) factor[k] = t->factor[index[k]];
+        for (int k = 0; k < n; ++k) factor[k] = t.factor[index[k]];
         for (int k = 0; k < n; ++k) {
             const float f = factor[k], c0 = out[0][k], c1 = out[1][k], c2 = out[2][k];
             const bool moves = std::fabs(f - 1.f) > 1e-6f;
-            const float d = (t->wR * c0 + t->wG * c1 + t->wB * c2 + t->offset) * (1.f - f);
-            out[0][k] = moves ? c0 * f + d : c0;
-            out[1][k] = moves ? c1 * f + d : c1;
-            out[2][k] = moves ? c2 * f + d : c2;
+            const float d = (wR * c0 + wG * c1 + wB * c2 + offset) * (1.f - f);
+            const float m0 = c0 * f + d, m1 = c1 * f + d, m2 = c2 * f + d;
+            out[0][k] = Pick(moves, m0, c0);
+            out[1][k] = Pick(moves, m1, c1);
+            out[2][k] = Pick(moves, m2, c2);
         }
     }
 }
@@ -175,7 +189,10 @@ inline void CorrectBlock(const PixelSettings &s, float (*p)[4], int n) {
     if (s.preDivide)
         for (int k = 0; k < n; ++k) {
             const float a = in[3][k];
-            for (int i = 0; i < 3; ++i) in[i][k] = a == 0.f ? 0.f : in[i][k] / a;
+            for (int i = 0; i < 3; ++i) {
+                const float divided = in[i][k] / a;
+                in[i][k] = Pick(a == 0.f, 0.f, divided);
+            }
         }
     float L[kBlock];
     if (s.rangesInUse || s.records[0].doMatrix)
