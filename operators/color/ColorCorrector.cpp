@@ -170,8 +170,9 @@ bool SuppressionIsNeutral(const double *sliders) {
     return std::all_of(sliders, sliders + 6, [](double v) { return Near(v, 1.0); });
 }
 
-/// A block function (float (*p)[4], int n: up to kBlock RGBA pixels, in place) over `count` stored pixels of
-/// `depth` (any depth: integer values are worked on as 0..1 and rounded back on store).
+/// A block function (const float (*in)[4], float (*out)[4], int n: up to kBlock RGBA pixels, out possibly in)
+/// over `count` stored pixels of `depth` (any depth: integer values are worked on as 0..1 and rounded back on
+/// store).
 template <class Block> void BlockSpan(int depth, const uint8_t *src, uint8_t *dst, int count, const Block &block) {
     const int bpp = FormatOfDepth(depth).BytesPerPixel();
     FltPixel loaded[kBlock];
@@ -180,16 +181,15 @@ template <class Block> void BlockSpan(int depth, const uint8_t *src, uint8_t *ds
         const int n = std::min(kBlock, count - i);
         const uint8_t *in = src + static_cast<size_t>(i) * bpp;
         uint8_t *out = dst + static_cast<size_t>(i) * bpp;
-        if (depth == DepthRGBAFlt32) { // worked on in the output row itself
-            if (in != out) std::memcpy(out, in, static_cast<size_t>(n) * bpp);
-            block(reinterpret_cast<float(*)[4]>(out), n);
+        if (depth == DepthRGBAFlt32) { // read from the input row, written to the output row
+            block(reinterpret_cast<const float(*)[4]>(in), reinterpret_cast<float(*)[4]>(out), n);
             continue;
         }
         LoadFlt(depth, in, n, loaded);
         for (int k = 0; k < n; ++k)
             pixels[k][0] = loaded[k].R, pixels[k][1] = loaded[k].G, pixels[k][2] = loaded[k].B,
             pixels[k][3] = loaded[k].A;
-        block(pixels, n);
+        block(pixels, pixels, n);
         for (int k = 0; k < n; ++k) loaded[k] = {pixels[k][0], pixels[k][1], pixels[k][2], pixels[k][3]};
         StoreFlt(depth, loaded, n, out);
     }
@@ -845,7 +845,10 @@ void ColorCorrector::ProcessHistogram(Request *req, Image *src, bool match) {
         DoMultiProcess(
             [&](int i) {
                 rows.Row(i, [&](const uint8_t *in, uint8_t *out, int n) {
-                    BlockSpan(depth, in, out, n, [&](float(*p)[4], int count) { HistogramBlock(s, p, count); });
+                    BlockSpan(depth, in, out, n, [&](const float(*from)[4], float(*p)[4], int count) {
+                        if (from != p) std::memcpy(p, from, sizeof *p * count);
+                        HistogramBlock(s, p, count);
+                    });
                 });
             },
             rows.Count());
@@ -969,8 +972,9 @@ void ColorCorrector::Process(Request *req) {
         DoMultiProcess(
             [&](int i) {
                 rows.Row(i, [&](const uint8_t *in, uint8_t *out, int n) {
-                    BlockSpan(depth, in, out, n, [&](float(*p)[4], int count) {
-                        if (!rangeOutput) return CorrectBlock(s, p, count);
+                    BlockSpan(depth, in, out, n, [&](const float(*from)[4], float(*p)[4], int count) {
+                        if (!rangeOutput) return CorrectBlock(s, from, p, count);
+                        if (from != p) std::memcpy(p, from, sizeof *p * count);
                         for (int k = 0; k < count; ++k) RangeOutput(s, shown, p[k]);
                     });
                 });

@@ -181,11 +181,12 @@ inline void RangeFunction(const PixelSettings &s, const RangeRecord &r, float L,
     for (int i = 0; i < 4; ++i) out[i] = q[i][0];
 }
 
-/// The whole correction of up to kBlock pixels (RGBA), in place.
-inline void CorrectBlock(const PixelSettings &s, float (*p)[4], int n) {
+/// The whole correction of up to kBlock pixels (RGBA) from `from` into p
+/// (which may be `from` itself).
+inline void CorrectBlock(const PixelSettings &s, const float (*from)[4], float (*p)[4], int n) {
     Planes in;
     for (int k = 0; k < n; ++k)
-        for (int i = 0; i < 4; ++i) in[i][k] = p[k][i];
+        for (int i = 0; i < 4; ++i) in[i][k] = from[k][i];
     if (s.preDivide)
         for (int k = 0; k < n; ++k) {
             const float a = in[3][k];
@@ -229,7 +230,9 @@ inline void CorrectBlock(const PixelSettings &s, float (*p)[4], int n) {
 }
 
 /// The whole correction of one pixel, in place.
-inline void CorrectPixel(const PixelSettings &s, float p[4]) { CorrectBlock(s, reinterpret_cast<float(*)[4]>(p), 1); }
+inline void CorrectPixel(const PixelSettings &s, float p[4]) {
+    CorrectBlock(s, reinterpret_cast<float(*)[4]>(p), reinterpret_cast<float(*)[4]>(p), 1);
+}
 
 /// Step 1: R, G, B over alpha, or 0 where alpha is exactly 0.
 inline void PreDivide(float p[4]) {
