@@ -897,6 +897,7 @@ void ColorCorrector::Process(Request *req) {
         return ProcessHistogram(req, src, mode == 2);
     Fold(ReadControls(req), settings_, tables_);
     PixelSettings &s = settings_;
+    for (RangeRecord &r : s.records) SetFiniteWithin(s, r);
     const bool rangeOutput = req->GetInputNumber(renderOutputRange_) >= 0.5;
     const int shown = std::clamp(static_cast<int>(std::lround(req->GetInputNumber(rangesRange_))), 0, 3);
     curves_ = Ref<Parameter>(req->GetInputData(colorRanges_));

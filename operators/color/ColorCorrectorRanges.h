@@ -51,7 +51,15 @@ struct RangeRecord {
     float mul1[3] = {1.f, 1.f, 1.f}, add1[3] = {0.f, 0.f, 0.f};
     float mul2[3] = {1.f, 1.f, 1.f}, add2[3] = {0.f, 0.f, 0.f};
     const Suppression *suppression = nullptr;
+    /// Set by SetFiniteWithin: finite pixels within kFiniteInput (all four
+    /// values) give finite results. Only then may a block whose weights for
+    /// this range are all 0 skip it: 0 times a finite value adds nothing to
+    /// the sum, 0 times inf or NaN would.
+    bool finiteWithin = false;
 };
+
+/// The bound on input values for RangeRecord::finiteWithin.
+constexpr float kFiniteInput = 65536.f;
 
 /// The whole pixel function's settings.
 struct PixelSettings {
@@ -85,6 +93,57 @@ inline float HueOf(float r, float g, float b) {
     const float shifted = q + Pick(greenMax, 2.f, 4.f);
     const float h = Pick(redMax, q, shifted) / 6.f, wrapped = h + 1.f;
     return Pick(mx == mn, 0.f, Pick(h < 0.f, wrapped, h));
+}
+
+/// Sets r.finiteWithin from a bound on the size of every stage's results, in
+/// double, for inputs of size at most kFiniteInput. The bound stays far below
+/// the float range, so the float rounding along the way cannot reach it.
+inline void SetFiniteWithin(const PixelSettings &s, RangeRecord &r) {
+    auto size = [](float v) { return std::isfinite(v) ? std::fabs(double(v)) : HUGE_VAL; };
+    auto sizeThrough = [&size](const Matrix34 &m, double x) {
+        double most = 0.0;
+        for (int i = 0; i < 3; ++i)
+            most = std::max(most, (size(m.m[i][0]) + size(m.m[i][1]) + size(m.m[i][2])) * x + size(m.m[i][3]));
+        return most;
+    };
+    double x = kFiniteInput;
+    if (r.doMatrix) {
+        double most = std::max(sizeThrough(r.low, x), sizeThrough(r.high, x));
+        if (s.tintMode != TintFast) {
+            const double y = sizeThrough(s.toLumaFirst, x);
+            const double z = std::max(y, std::max(sizeThrough(r.belowBlack, y), sizeThrough(r.aboveWhite, y)));
+            most = std::max(most, sizeThrough(s.fromLumaFirst, z));
+        }
+        x = most;
+    }
+    auto levels = [&x, &size](const float *mul, const float *add) {
+        double most = 0.0;
+        for (int i = 0; i < 3; ++i) most = std::max(most, size(mul[i]) * x + size(add[i]));
+        x = most;
+    };
+    bool powerBounded = true;
+    auto gamma = [&] {
+        for (int i = 0; i < 3; ++i) powerBounded = powerBounded && r.gamma[i] >= 0.f && r.gamma[i] < 64.f;
+        if (!powerBounded) return;
+        double most = x;
+        for (int i = 0; i < 3; ++i) most = std::max(most, std::pow(std::max(x, 1.0), double(r.gamma[i])));
+        x = most;
+    };
+    if (s.gammaAfterLevels) {
+        if (r.doLevels1) levels(r.mul1, r.add1);
+        if (r.doGamma) gamma();
+        if (r.doLevels2) levels(r.mul2, r.add2);
+    } else {
+        if (r.doGamma) gamma();
+        if (r.doLevels1) levels(r.mul1, r.add1);
+    }
+    if (const Suppression *t = r.suppression) {
+        double f = 0.0;
+        for (float v : t->factor) f = std::max(f, size(v));
+        const double grey = (size(t->wR) + size(t->wG) + size(t->wB)) * x + size(t->offset);
+        x = std::max(x, x * f + grey * (1.0 + f));
+    }
+    r.finiteWithin = powerBounded && x < 1e30; // a value that is not finite counts as unbounded
 }
 
 /// Pixels the block functions below take at a time at most.
@@ -208,15 +267,24 @@ inline void CorrectBlock(const PixelSettings &s, const float (*from)[4], float (
         Planes part;
         float w[3][kBlock];
         for (int k = 0; k < n; ++k) s.curves->WeightsAt(L[k], w[0][k], w[1][k], w[2][k]);
+        bool bounded = true; // every value finite and within kFiniteInput
+        for (int i = 0; i < 4; ++i)
+            for (int k = 0; k < n; ++k) bounded &= std::fabs(in[i][k]) <= kFiniteInput;
+        bool started = false;
         for (int r = 0; r < 3; ++r) {
+            if (bounded && s.records[r].finiteWithin && std::all_of(w[r], w[r] + n, [](float v) { return v == 0.f; }))
+                continue; // adds only zeros to the sum
             RangePlanes(s, s.records[r], L, in, part, n);
-            if (r == 0) // 0 + x, as a sum from 0 would give (-0 becomes +0)
+            if (!started) // 0 + x, as a sum from 0 would give (-0 becomes +0)
                 for (int i = 0; i < 4; ++i)
-                    for (int k = 0; k < n; ++k) sum[i][k] = 0.f + w[0][k] * part[i][k];
+                    for (int k = 0; k < n; ++k) sum[i][k] = 0.f + w[r][k] * part[i][k];
             else
                 for (int i = 0; i < 4; ++i)
                     for (int k = 0; k < n; ++k) sum[i][k] += w[r][k] * part[i][k];
+            started = true;
         }
+        if (!started)
+            for (int i = 0; i < 4; ++i) std::fill(sum[i], sum[i] + n, 0.f);
         result = &sum;
     }
     Planes &o = *result;
