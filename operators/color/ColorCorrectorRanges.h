@@ -267,9 +267,10 @@ inline void CorrectBlock(const PixelSettings &s, const float (*from)[4], float (
         Planes part;
         float w[3][kBlock];
         for (int k = 0; k < n; ++k) s.curves->WeightsAt(L[k], w[0][k], w[1][k], w[2][k]);
-        bool bounded = true; // every value finite and within kFiniteInput
+        int outside = 0; // values not finite or beyond kFiniteInput (an int sum, so the loop vectorises)
         for (int i = 0; i < 4; ++i)
-            for (int k = 0; k < n; ++k) bounded &= std::fabs(in[i][k]) <= kFiniteInput;
+            for (int k = 0; k < n; ++k) outside += !(std::fabs(in[i][k]) <= kFiniteInput);
+        const bool bounded = outside == 0;
         bool started = false;
         for (int r = 0; r < 3; ++r) {
             if (bounded && s.records[r].finiteWithin && std::all_of(w[r], w[r] + n, [](float v) { return v == 0.f; }))
