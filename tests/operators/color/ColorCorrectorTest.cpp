@@ -148,6 +148,44 @@ TEST_F(ColorCorrector, PixelFunctionEdgeCases) {
     }
 }
 
+TEST_F(ColorCorrector, BlocksGiveTheWeightedSumOfTheThreeRangeFunctions) {
+    // A block of dark pixels has highlight weight 0 throughout, and may skip that range, but only where that
+    // changes nothing: a highlights gain that overflows (the fourth pixel, R * 1e36) must still make 0 * inf = NaN.
+    const ColorCurvesTable curves;
+    for (float highGain : {2.f, 1e36f}) {
+        cc::PixelSettings s;
+        s.rangesInUse = true, s.curves = &curves;
+        for (int r = 0; r < 3; ++r) {
+            cc::RangeRecord &rec = s.records[r];
+            rec.doLevels1 = true, std::fill(rec.mul1, rec.mul1 + 3, r == 2 ? highGain : 1.5f);
+            cc::SetFiniteWithin(s, rec);
+        }
+        float block[6][4] = {{.1f, .2f, .1f, 1}, {0, 0, 0, 1},      {.3f, .1f, .2f, .5f},
+                             {1000, -510, 0, 1}, {-.2f, .1f, 0, 1}, {.4f, .3f, .2f, 1}};
+        float want[6][4];
+        for (int k = 0; k < 6; ++k) {
+            const float L = cc::LumaOf(block[k]);
+            float w[3], sum[4] = {};
+            curves.WeightsAt(L, w[0], w[1], w[2]);
+            ASSERT_EQ(w[2], 0.f) << "a dark pixel";
+            for (int r = 0; r < 3; ++r) {
+                float part[4];
+                cc::RangeFunction(s, s.records[r], L, block[k], part);
+                for (int c = 0; c < 4; ++c) sum[c] += w[r] * part[c];
+            }
+            std::copy(sum, sum + 4, want[k]);
+        }
+        cc::CorrectBlock(s, block, block, 6);
+        for (int k = 0; k < 6; ++k)
+            for (int c = 0; c < 4; ++c)
+                EXPECT_TRUE(std::memcmp(&block[k][c], &want[k][c], 4) == 0 ||
+                            (std::isnan(block[k][c]) && std::isnan(want[k][c])))
+                    << "gain " << highGain << ", pixel " << k << ", channel " << c << ": " << block[k][c] << " against "
+                    << want[k][c];
+        EXPECT_EQ(std::isnan(block[3][0]), highGain > 1e30f) << "the overflowing range still counts";
+    }
+}
+
 // ---- the whole tool against a model of its controls ----
 
 /// Control values by ID; the rest keep their defaults.
