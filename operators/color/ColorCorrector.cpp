@@ -195,6 +195,15 @@ template <class Block> void BlockSpan(int depth, const uint8_t *src, uint8_t *ds
     }
 }
 
+/// CorrectBlock compiled, whole, for the machine's vector width: with AVX2
+/// the planes' stages run twice as wide, and multiply-adds fuse (so the two
+/// forms may differ in the last bit). The histogram modes keep one form: a
+/// last-bit difference there can move a value into the next bin.
+__attribute__((flatten, target_clones("arch=x86-64-v3", "default"))) void
+CorrectSpan(const cc::PixelSettings &s, const float (*from)[4], float (*p)[4], int n) {
+    cc::CorrectBlock(s, from, p, n);
+}
+
 } // namespace
 
 // ---- the panel ----
@@ -958,7 +967,7 @@ void ColorCorrector::Process(Request *req) {
         if (rangeOutput)
             RangeOutput(s, shown, p);
         else
-            CorrectPixel(s, p);
+            CorrectSpan(s, reinterpret_cast<float(*)[4]>(p), reinterpret_cast<float(*)[4]>(p), 1); // as the rows do
         FltPixel canvas{p[0], p[1], p[2], p[3]};
         StoreFlt(depth, &canvas, 1, canvasPixel);
         LoadFlt(depth, canvasPixel, 1, &canvas); // as the depth holds it
@@ -974,7 +983,7 @@ void ColorCorrector::Process(Request *req) {
             [&](int i) {
                 rows.Row(i, [&](const uint8_t *in, uint8_t *out, int n) {
                     BlockSpan(depth, in, out, n, [&](const float(*from)[4], float(*p)[4], int count) {
-                        if (!rangeOutput) return CorrectBlock(s, from, p, count);
+                        if (!rangeOutput) return CorrectSpan(s, from, p, count);
                         if (from != p) std::memcpy(p, from, sizeof *p * count);
                         for (int k = 0; k < count; ++k) RangeOutput(s, shown, p[k]);
                     });
