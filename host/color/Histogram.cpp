@@ -96,6 +96,22 @@ void ReadSamples(const Image &img, int x0, int y, int step, int count, Pixel *ou
     }
 }
 
+/// keep[c] = whether the mask's alpha at (x0 + c * step, y) is at least one half.
+void MaskSamples(const Image &mask, int x0, int y, int step, int count, uint8_t *keep) {
+    const ImgRectI w = mask.DataWindow();
+    const bool canvasKeeps = mask.GetCanvasColor().A >= 0.5f, rowIn = y >= w.y0 && y < w.y1;
+    FltPixel f;
+    for (int c = 0; c < count; ++c) {
+        const int x = x0 + c * step;
+        if (!rowIn || x < w.x0 || x >= w.x1) {
+            keep[c] = canvasKeeps;
+            continue;
+        }
+        LoadFlt(mask.Depth(), mask.PixelAddress(x, y), 1, &f);
+        keep[c] = f.A >= 0.5f;
+    }
+}
+
 /// Colour divided by alpha on the 16-bit values, rounded and held at 65535; 0 where alpha is 0.
 Pixel DividedByAlpha(const Pixel &p) {
     auto divide = [a = uint64_t(p.A)](uint16_t v) {
@@ -123,6 +139,8 @@ bool Histogram::CountImage(const Image &img, const ImgRectI &rect, const Histogr
     if (area.IsNull()) return true;
     if (img.IsGPUMemDirty() && !img.DownloadGPUMem()) return false;
     if (!img.HasScanLineData()) return false;
+    const Image *mask = sampling.mask;
+    if (mask && ((mask->IsGPUMemDirty() && !mask->DownloadGPUMem()) || !mask->HasScanLineData())) return false;
 
     const int step = std::max(1, sampling.proxyStep);
     const int cols = (area.Width() + step - 1) / step, rows = (area.Height() + step - 1) / step;
@@ -136,15 +154,19 @@ bool Histogram::CountImage(const Image &img, const ImgRectI &rect, const Histogr
             const int blockRows = static_cast<int>(std::min<int64_t>(last - first, UINT32_MAX / cols));
             std::vector<uint32_t> bins(counts_.size());
             std::vector<Pixel> line(cols);
+            std::vector<uint8_t> keep(mask ? cols : 0);
             uint32_t *l = bins.data(), *r = l + size_, *g = r + size_, *b = g + size_;
             for (int block = first; block < last; block += blockRows) {
                 if (block != first) std::fill(bins.begin(), bins.end(), 0);
                 uint64_t samples = 0;
                 for (int k = block; k < std::min(last, block + blockRows); ++k) {
                     if (img.CheckAbort()) return;
-                    ReadSamples(img, area.x0, area.y0 + k * step, step, cols, line.data());
-                    for (Pixel px : line) {
-                        if (sampling.ignoreTransparent && px.A == 0) continue;
+                    const int y = area.y0 + k * step;
+                    ReadSamples(img, area.x0, y, step, cols, line.data());
+                    if (mask) MaskSamples(*mask, area.x0, y, step, cols, keep.data());
+                    for (int c = 0; c < cols; ++c) {
+                        Pixel px = line[c];
+                        if ((sampling.ignoreTransparent && px.A == 0) || (mask && !keep[c])) continue;
                         if (sampling.divideByAlpha) px = DividedByAlpha(px);
                         ++l[Luma16(px.R, px.G, px.B) >> shift_];
                         ++r[px.R >> shift_];

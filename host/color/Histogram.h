@@ -56,6 +56,9 @@ struct HistogramSampling {
     /// Count R, G and B divided by alpha (the 16-bit values, rounded, held at 65535; 0 where alpha is 0), as a tool
     /// that works on unpremultiplied colour sees them.
     bool divideByAlpha = false;
+    /// When set, only pixels where this image's alpha is at least one half count (its canvas colour's alpha
+    /// outside its data window; a single-channel mask's value is its alpha). It is read at the same coordinates.
+    const Image *mask = nullptr;
 };
 
 /// Which curves Equalize and Match build; the others stay the identity.

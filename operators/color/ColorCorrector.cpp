@@ -751,7 +751,6 @@ void ColorCorrector::ProcessHistogram(Request *req, Image *src, bool match) {
         Fail(req, "%s: %s\n", Name().c_str(), why);
         req->SetOutputData(output_, nullptr);
     };
-    if (req->GetInputData(matchMask_)) return fail("the Match Mask input is not available yet; disconnect it");
     const int size = Histogram::SizeForPrecision(static_cast<int>(std::lround(req->GetInputNumber(precision_))));
     const double blendL = std::clamp(req->GetInputNumber(equalizeL_), 0.0, 1.0);
     double blendRGB[3];
@@ -814,7 +813,11 @@ void ColorCorrector::ProcessHistogram(Request *req, Image *src, bool match) {
     const ImgRectI rect = HistogramMatchRect(src->Width(), src->Height(), src->DataWindow(), center ? center->x : 0.5,
                                              center ? center->y : 0.5, req->GetInputNumber(matchWidth_),
                                              req->GetInputNumber(matchHeight_));
-    if (!h.CountImage(*src, rect, sampling)) {
+    // The Match Mask limits which of the input's pixels are counted (not which are corrected: that is the
+    // effect mask's job).
+    HistogramSampling inputSampling = sampling;
+    inputSampling.mask = dynamic_cast<const Image *>(req->GetInputData(matchMask_));
+    if (!h.CountImage(*src, rect, inputSampling)) {
         if (!src->CheckAbort()) fail("the input's pixels could not be read");
         return;
     }

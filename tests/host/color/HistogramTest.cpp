@@ -94,17 +94,23 @@ TEST(Histogram, EqualiseAndMatchReachTheirDistributionsAsTheBinsAllow) {
 }
 
 TEST(Histogram, CountsMatchPerPixelCountAcrossDepthsRectanglesProxyTransparencyAndThreads) {
-    // depth, histogram size, rectangle, proxy step, ignore transparent, divide by alpha
-    const std::tuple<int, int, ImgRectI, int, bool, bool> cases[] = {
-        {DepthRGBAFlt32, 65536, ImgRectI(0, 0, 701, 389), 1, false, false},
-        {DepthRGBAFlt32, 1024, ImgRectI(5, 3, 400, 300), 3, true, true},
-        {DepthRGBAInt8, 256, ImgRectI(-10, -10, 900, 900), 2, true, false},
-        {DepthRGBAInt16, 65536, ImgRectI(7, 9, 8, 10), 1, false, false},
-        {DepthRGBAFlt16, 65536, ImgRectI(0, 0, 701, 389), 4, false, true},
-        {DepthAInt16, 256, ImgRectI(1, 1, 600, 386), 1, true, false},
+    // A mask over part of the frame, its canvas outside: kept where its alpha is at least one half.
+    const Ref<Image> maskOut = Orvane::Test::WindowedImage(701, 389, ImgRectI(100, 50, 500, 300), {}, 3, DepthAInt8);
+    const Ref<Image> maskIn =
+        Orvane::Test::WindowedImage(701, 389, ImgRectI(-50, 20, 300, 200), {0, 0, 0, 1}, 4, DepthRGBAFlt32);
+    // depth, histogram size, rectangle, proxy step, ignore transparent, divide by alpha, mask
+    const std::tuple<int, int, ImgRectI, int, bool, bool, const Image *> cases[] = {
+        {DepthRGBAFlt32, 65536, ImgRectI(0, 0, 701, 389), 1, false, false, nullptr},
+        {DepthRGBAFlt32, 1024, ImgRectI(5, 3, 400, 300), 3, true, true, nullptr},
+        {DepthRGBAInt8, 256, ImgRectI(-10, -10, 900, 900), 2, true, false, nullptr},
+        {DepthRGBAInt16, 65536, ImgRectI(7, 9, 8, 10), 1, false, false, nullptr},
+        {DepthRGBAFlt16, 65536, ImgRectI(0, 0, 701, 389), 4, false, true, nullptr},
+        {DepthAInt16, 256, ImgRectI(1, 1, 600, 386), 1, true, false, nullptr},
+        {DepthRGBAFlt32, 65536, ImgRectI(0, 0, 701, 389), 1, false, false, maskOut.Get()},
+        {DepthRGBAInt16, 1024, ImgRectI(5, 3, 400, 300), 3, true, false, maskIn.Get()},
     };
     const int workersBefore = WorkerCount();
-    for (const auto &[depth, size, rect, step, ignoreTransparent, divide] : cases) {
+    for (const auto &[depth, size, rect, step, ignoreTransparent, divide, mask] : cases) {
         const Ref<Image> img = Orvane::Test::WindowedImage(701, 389, ImgRectI(-3, 2, 690, 389), {}, 7, depth);
         const int shift = 16 - static_cast<int>(std::log2(size));
         std::vector<std::vector<uint64_t>> want(kHistogramChannels, std::vector<uint64_t>(size));
@@ -115,7 +121,7 @@ TEST(Histogram, CountsMatchPerPixelCountAcrossDepthsRectanglesProxyTransparencyA
             for (int x = area.x0; x < area.x1; x += step) {
                 const FltPixel p = img->GetFlt(x, y);
                 const long a = to16(p.A);
-                if (ignoreTransparent && a == 0) continue;
+                if ((ignoreTransparent && a == 0) || (mask && mask->GetFlt(x, y).A < 0.5f)) continue;
                 auto value = [&, divide = divide](float v) {
                     return !divide ? to16(v) : a == 0 ? 0 : int(std::min(65535L, std::lround(65535.0 * to16(v) / a)));
                 };
@@ -126,7 +132,7 @@ TEST(Histogram, CountsMatchPerPixelCountAcrossDepthsRectanglesProxyTransparencyA
         for (int workers : {1, 3}) {
             SetWorkerCount(workers);
             Histogram h(size);
-            ASSERT_TRUE(h.CountImage(*img, rect, {step, ignoreTransparent, divide}));
+            ASSERT_TRUE(h.CountImage(*img, rect, {step, ignoreTransparent, divide, mask}));
             SCOPED_TRACE("depth " + std::to_string(depth) + ", workers " + std::to_string(workers));
             EXPECT_EQ(h.Samples(), samples);
             for (int ch = 0; ch < kHistogramChannels; ++ch)

@@ -593,20 +593,28 @@ TEST_F(ColorCorrector, MatchTakesTheReferencesHistogramWithinTheMatchRectangle) 
     EXPECT_NE(ts::ConsoleText(rig.doc).find("the kept match snapshot is damaged"), std::string::npos);
 
     // The left half dark, the right half white and transparent: counting the left half alone (by the match
-    // rectangle, or by leaving out transparent pixels) equalises it flat; counting everything does not.
+    // rectangle, by leaving out transparent pixels, or by a Match Mask over it) equalises it flat; counting
+    // everything does not.
     Ref<Image> halves = GreyImage(Dark);
     for (int y = 0; y < 16; ++y)
         for (int x = 128; x < 256; ++x) std::copy_n("\xff\xff\xff\0", 4, halves->Row<uint8_t>(y) + 4 * x);
-    const std::tuple<const char *, bool, bool> counted[] = {
-        // controls, match rectangle over the left half, comes out flat
-        {"", false, false},
-        {"MatchWidth=0.5", true, true},
-        {"HistogramIgnoreTransparent=1", false, true},
+    Ref<Image> leftMask = MakeRef<Image>(256, 16, DepthAInt8);
+    ASSERT_TRUE(leftMask->AllocScanLineData());
+    for (int y = 0; y < 16; ++y) std::fill_n(leftMask->Row<uint8_t>(y), 128, uint8_t(200)); // above one half
+    const std::tuple<const char *, bool, bool, bool> counted[] = {
+        // controls, match rectangle over the left half, mask over the left half, comes out flat
+        {"", false, false, false},
+        {"MatchWidth=0.5", true, false, true},
+        {"HistogramIgnoreTransparent=1", false, false, true},
+        {"", false, true, true},
     };
-    for (const auto &[controls, inRect, flat] : counted) {
+    for (const auto &[controls, inRect, masked, flat] : counted) {
         Rig split(halves);
         split.Set(Parse(std::string("HistogramType=1 EqualizeRed=1 Precision=0 ") + controls));
         if (inRect) ts::SetPoint(split.cc, "MatchCenter", 0.25, 0.5);
+        if (masked)
+            ASSERT_TRUE(
+                split.cc->FindInput("MatchMask")->ConnectTo(ts::AddImageSource(split.doc, "Mask", leftMask)->Out()));
         Ref<Image> out = Render(split.cc);
         ASSERT_TRUE(out) << controls;
         const double off = Farthest(Cumulative(*out, left, 0), Flat());
