@@ -7,6 +7,8 @@ packages=(
   libjpeg62-turbo-dev libpng-dev zlib1g-dev libopenexr-dev
   # Colour management: colour spaces and LUT files.
   libopencolorio-dev
+  # Masks and shapes: polygon offsetting and stroking, anti-aliased scan conversion.
+  libpolyclipping-dev libagg-dev
   # The device path: OpenCL headers and loader, and PoCL, which runs OpenCL
   # kernels on the CPU so that every machine exercises the device path.
   ocl-icd-opencl-dev opencl-headers pocl-opencl-icd
