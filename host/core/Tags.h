@@ -368,6 +368,14 @@ constexpr Tag MrgBurnIn = 0x20090003;
 /// (TransformMatrix::MergeConcatenateTagList; the identity when absent).
 constexpr Tag MrgPlacement = 0x60090000;
 
+// ---- Shapes (Shape::FlattenOfShapeTagList, OutlineOfShapeTagList, ExpandOfShapeTagList) ----
+constexpr Tag ShapeJoin = 0x100b0000;       ///< ShapeJoinKind: 0 bevel, 1 miter, 2 round, 3 miter clip
+constexpr Tag ShapeCap = 0x100b0001;        ///< ShapeCapKind: 0 flat, 1 square, 2 round
+constexpr Tag ShapeWriteStart = 0x200b0000; ///< write-on: fraction of the path length where the stroke starts
+constexpr Tag ShapeWriteEnd = 0x200b0001;   ///< write-on: fraction where it ends
+constexpr Tag ShapeTolerance = 0x200b0002;  ///< the largest distance of a chord from its curve
+constexpr Tag ShapeMiterLimit = 0x200b0003; ///< miter length over stroke width before a miter is cut
+
 // ---- Application attributes (GetApp()->GetAttrB) -------------------------
 /// Rows use fast true powers rather than gamma tables.
 constexpr Tag AppFastPower = 0x10010002;
