@@ -31,5 +31,19 @@ void BM_CopyIntoExistingRows(benchmark::State &state) {
 }
 BENCHMARK(BM_CopyIntoExistingRows)->UseRealTime()->Unit(benchmark::kMillisecond);
 
+// The floor of a full-frame mask: a UHD one-channel float frame copied into a new image.
+void BM_CopyFloorAFlt32(benchmark::State &state) {
+    Ref<Image> frame = NewImageTagList({{ImgWidth, kWidth}, {ImgHeight, kHeight}, {ImgDepth, DepthAFlt32}});
+    frame->AllocScanLineData();
+    frame->Fill({0.5f, 0.5f, 0.5f, 0.5f});
+    for (auto _ : state) {
+        Ref<Image> copy = NewImageTagList({{ImgLikeImage, frame.Get()}});
+        copy->ImageCopy(frame.Get());
+        benchmark::DoNotOptimize(copy.Get());
+    }
+    ReportPixels(state);
+}
+BENCHMARK(BM_CopyFloorAFlt32)->UseRealTime()->Unit(benchmark::kMillisecond);
+
 } // namespace
 } // namespace Orvane::Bench

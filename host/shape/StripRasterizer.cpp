@@ -175,6 +175,9 @@ public:
         colLo_ = band.x0 * n;
         colHi_ = band.x1 * n - 1;
         weight_ = 1.0 / (static_cast<double>(n) * n);
+        if ((n & (n - 1)) == 0)
+            for (shift_ = 0; (int64_t(1) << shift_) < n; ++shift_) {
+            }
     }
 
     /// Adds the triangle of strip points i, i + 1, i + 2.
@@ -229,15 +232,20 @@ private:
 
         const int64_t n = g.n;
         const int width = band_.Width();
-        for (int64_t r = r0; r <= r1; ++r) {
+        int row = static_cast<int>(FloorDiv(r0, n)) - band_.y0; // the pixel row of sample row r
+        int64_t rowStep = r0 - (row + band_.y0) * n;
+        for (int64_t r = r0; r <= r1; ++r, ++rowStep) {
+            if (rowStep == n) {
+                rowStep = 0;
+                ++row;
+            }
             int64_t lo = colLo_, hi = colHi_;
             for (const EdgeBound &e : edges) e.Limit(lo, hi);
             if (lo <= hi) {
                 const double y = static_cast<double>((2 * r + 1) * g.k);
                 const double rowValue =
                     v[0].value + gy * (y - static_cast<double>(v[0].y)) - gx * static_cast<double>(v[0].x);
-                const int row = static_cast<int>(FloorDiv(r, n)) - band_.y0;
-                const int first = static_cast<int>(FloorDiv(lo, n)), last = static_cast<int>(FloorDiv(hi, n));
+                const int first = PixelOf(lo), last = PixelOf(hi);
                 float *value = buf_.value + static_cast<size_t>(row) * width - band_.x0;
                 float *coverage = buf_.coverage + static_cast<size_t>(row) * width - band_.x0;
                 for (int px = first; px <= last; ++px) {
@@ -257,12 +265,19 @@ private:
         }
     }
 
+    /// The pixel column of sample column j (j within the band's columns).
+    int PixelOf(int64_t j) const {
+        const int64_t offset = j - colLo_;
+        return band_.x0 + static_cast<int>(shift_ >= 0 ? offset >> shift_ : offset / grid_.n);
+    }
+
     const StripPoint *strip_;
     const StripRasterOptions &options_;
     const SampleGrid &grid_;
     ImgRectI band_;
     BandSums buf_;
     int64_t rowLo_, rowHi_, colLo_, colHi_;
+    int shift_ = -1; ///< log2 n when n is a power of 2 (columns to pixels by a shift)
     double weight_;
 };
 
