@@ -293,7 +293,7 @@ inline void FoldedSample(float coverage, float value, float &c, float &v) {
 }
 
 /// dst = dst x (1 - coverage) + value over columns first..last of one band row,
-/// where `value` (if not null) replaces the band's own value row.
+/// where `valueRow` (if not null, from column first on) replaces the band's own values.
 void BlendRow(Image &dst, int y, int first, int last, const float *coverage, const float *value,
               const FltPixel *valueRow, FltPixel *work) {
     const ImgRectI &w = dst.DataWindow();

@@ -53,7 +53,7 @@ struct StripRasterOptions {
 struct StripRasterResult {
     int bands = 0;        ///< bands the data window was split into
     int droppedBands = 0; ///< bands left unchanged because their memory was refused
-    bool aborted = false; ///< the render was abandoned (some bands may be unchanged)
+    bool aborted = false; ///< the render was abandoned (bands, or their later rows, may be unchanged)
     bool Ok() const { return droppedBands == 0 && !aborted; }
 };
 
