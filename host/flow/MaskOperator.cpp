@@ -5,6 +5,7 @@
 #include <cmath>
 #include <cstring>
 #include <memory>
+#include <utility>
 #include <vector>
 
 #include "host/core/Parallel.h"
@@ -182,21 +183,27 @@ MaskOperator::MaskOperator(const Registry *reg, const ScriptVal &args, const Tag
         "Solid", "Solid",
         with(
             {{InputControl, CLSID_InputControl_Checkbox}, {InputDefault, 1.0}, {ControlWidth, 0.5}, {InputNotify, 1}}));
-    TagList join = with({{InputControl, CLSID_InputControl_MultiButton},
-                         {ControlLabel, "Border Style"},
-                         {InputDefault, 0.0},
-                         {InputMinAllowed, 0.0},
-                         {InputMaxAllowed, 3.0},
-                         {InputInteger, 1},
-                         {InputNotify, 1}});
-    static const char *const joins[][2] = {{"Bevel", "Icons.Outline.JoinBevel"},
-                                           {"Round", "Icons.Outline.JoinRound"},
-                                           {"Miter", "Icons.Outline.JoinMiter"},
-                                           {"Miter Clip", "Icons.Outline.JoinMiterClip"}};
-    for (const auto &[label, icon] : joins) {
-        join.Add({ListAddItem, label});
-        join.Add({ButtonIcon, icon});
-    }
+    // Icon buttons: (label, icon) pairs; the value is the button's index.
+    using Buttons = std::initializer_list<std::pair<const char *, const char *>>;
+    auto iconButtons = [&with](Buttons buttons, const char *label) {
+        TagList t = with({{InputControl, CLSID_InputControl_MultiButton},
+                          {InputDefault, 0.0},
+                          {InputMinAllowed, 0.0},
+                          {InputMaxAllowed, static_cast<double>(buttons.size() - 1)},
+                          {InputInteger, 1}});
+        if (label) t.Set({ControlLabel, label});
+        for (const auto &[name, icon] : buttons) {
+            t.Add({ListAddItem, name});
+            t.Add({ButtonIcon, icon});
+        }
+        return t;
+    };
+    TagList join = iconButtons({{"Bevel", "Icons.Outline.JoinBevel"},
+                                {"Round", "Icons.Outline.JoinRound"},
+                                {"Miter", "Icons.Outline.JoinMiter"},
+                                {"Miter Clip", "Icons.Outline.JoinMiterClip"}},
+                               "Border Style");
+    join.Set({InputNotify, 1});
     joinStyle_ = AddInputTagList("Join Style", "JoinStyle", join);
     miterLimit_ = AddInputTagList("Miter Limit", "MiterLimit",
                                   with({{InputControl, CLSID_InputControl_Slider},
@@ -204,19 +211,11 @@ MaskOperator::MaskOperator(const Registry *reg, const ScriptVal &args, const Tag
                                         {InputSliderLow, 0.0},
                                         {InputSliderHigh, 10.0},
                                         {SliderRest, 4.0}}));
-    TagList cap = with({{InputControl, CLSID_InputControl_MultiButton},
-                        {InputDefault, 0.0},
-                        {InputMinAllowed, 0.0},
-                        {InputMaxAllowed, 2.0},
-                        {InputInteger, 1}});
-    static const char *const caps[][2] = {{"Flat", "Icons.Outline.CapButt"},
-                                          {"Rounded", "Icons.Outline.CapRound"},
-                                          {"Square", "Icons.Outline.CapSquare"}};
-    for (const auto &[label, icon] : caps) {
-        cap.Add({ListAddItem, label});
-        cap.Add({ButtonIcon, icon});
-    }
-    capStyle_ = AddInputTagList("Cap Style", "CapStyle", cap);
+    capStyle_ = AddInputTagList("Cap Style", "CapStyle",
+                                iconButtons({{"Flat", "Icons.Outline.CapButt"},
+                                             {"Rounded", "Icons.Outline.CapRound"},
+                                             {"Square", "Icons.Outline.CapSquare"}},
+                                            nullptr));
     for (int end = 0; end < 2; ++end)
         (end ? writeLength_ : writePosition_) =
             AddInputTagList(end ? "Length" : "Position", end ? "WriteLength" : "WritePosition",
