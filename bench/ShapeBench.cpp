@@ -1,7 +1,7 @@
 // Masks from shapes at UHD into a one-channel float32 frame (its rows already
 // allocated, as a mask tool's image has them by then): a filled ellipse, a
 // closed polygon of 200 Bezier points (flattened on the way in), and the
-// stroke of the ellipse (outline and scan conversion). BM_CopyFloorMaskFloat
+// stroke of the ellipse (outline and scan conversion). BM_CopyFloorAFlt32
 // (CopyBench.cpp) is the floor to read them against.
 #include <cmath>
 #include <numbers>

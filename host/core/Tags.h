@@ -376,6 +376,18 @@ constexpr Tag ShapeWriteEnd = 0x200b0001;   ///< write-on: fraction where it end
 constexpr Tag ShapeTolerance = 0x200b0002;  ///< the largest distance of a chord from its curve
 constexpr Tag ShapeMiterLimit = 0x200b0003; ///< miter length over stroke width before a miter is cut
 
+// ---- Masks (host/flow/MaskOperator.h) ------------------------------------
+/// CreateMaskImage: const ImgRectI *, the pixel rectangle the mask's shape can
+/// touch (absent: everywhere the mask may be needed).
+constexpr Tag MaskRegion = 0x60060000;
+/// CreateMaskImage: the mask's depth (1..4), instead of the tool's Depth control.
+constexpr Tag MaskDepth = 0x10060000;
+/// Request flag: the mask is asked for in the mask domain (the consumer reads
+/// it over its own region). A finished mask records it in its metadata under
+/// MaskDomainKey. Bit 5, where other hosts keep it, is ReqFlagNoGPU here.
+constexpr uint32_t ReqFlagMaskDomain = 1u << 6;
+constexpr const char *MaskDomainKey = "MaskDomain";
+
 // ---- Application attributes (GetApp()->GetAttrB) -------------------------
 /// Rows use fast true powers rather than gamma tables.
 constexpr Tag AppFastPower = 0x10010002;

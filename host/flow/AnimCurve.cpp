@@ -48,12 +48,6 @@ Ref<Parameter> Blend(const Keyframe &k0, const Keyframe &k1, double u) {
     return v.Get() == k1.value.Get() ? k0.value : v;
 }
 
-/// Hermite basis blend of four numbers at u in [0, 1] between p1 and p2.
-double Hermite(double p1, double p2, double m1, double m2, double u) {
-    const double u2 = u * u, u3 = u2 * u;
-    return (2 * u3 - 3 * u2 + 1) * p1 + (u3 - 2 * u2 + u) * m1 + (-2 * u3 + 3 * u2) * p2 + (u3 - u2) * m2;
-}
-
 } // namespace
 
 Ref<Parameter> AnimCurve::ValueAt(double time) const {
@@ -71,32 +65,31 @@ Ref<Parameter> AnimCurve::ValueAt(double time) const {
     case KeyInterp::Linear: return Blend(k0, k1, u);
     case KeyInterp::Smooth: break;
     }
-    // Smooth: cubic Hermite per component, Catmull-Rom tangents scaled to this
-    // span. Numbers and points are smooth; other kinds fall back to Interpolate.
-    auto *n0 = dynamic_cast<const Number *>(k0.value.Get());
-    auto *n1 = dynamic_cast<const Number *>(k1.value.Get());
-    auto *p0 = dynamic_cast<const Point *>(k0.value.Get());
-    auto *p1 = dynamic_cast<const Point *>(k1.value.Get());
-    const Keyframe *kPrev = i0 > 0 ? &keys_[i0 - 1] : nullptr;
-    const Keyframe *kNext = i1 + 1 < keys_.size() ? &keys_[i1 + 1] : nullptr;
-    auto tangent = [&](double vPrev, double tPrev, double vNext, double tNext) {
-        return (vNext - vPrev) / (tNext - tPrev) * span;
-    };
-    auto smooth1 = [&](auto get) {
-        const double v0 = get(*k0.value), v1 = get(*k1.value);
-        const double m0 = kPrev ? tangent(get(*kPrev->value), kPrev->time, v1, k1.time) : 0.0;
-        const double m1 = kNext ? tangent(v0, k0.time, get(*kNext->value), kNext->time) : 0.0;
-        return Hermite(v0, v1, m0, m1, u);
-    };
-    if (n0 && n1) {
-        return MakeRef<Number>(smooth1([](const Parameter &p) { return static_cast<const Number &>(p).value; }));
+    // Smooth: cubic Hermite with Catmull-Rom tangents scaled to this span, written as weights of the (up to) four
+    // keys involved, so that every kind that sums (numbers, points, polylines) takes this one path. A neighbour
+    // that does not blend with the span's keys counts as absent: a flat end.
+    if (!k0.value->BlendsWith(*k1.value)) return Blend(k0, k1, u);
+    const Keyframe *kPrev = i0 > 0 && keys_[i0 - 1].value->BlendsWith(*k0.value) ? &keys_[i0 - 1] : nullptr;
+    const Keyframe *kNext =
+        i1 + 1 < keys_.size() && keys_[i1 + 1].value->BlendsWith(*k0.value) ? &keys_[i1 + 1] : nullptr;
+    const double u2 = u * u, u3 = u2 * u;
+    const double h00 = 2 * u3 - 3 * u2 + 1, h10 = u3 - 2 * u2 + u, h01 = -2 * u3 + 3 * u2, h11 = u3 - u2;
+    // Tangents m0 = (v1 - vPrev) * a0 and m1 = (vNext - v0) * a1.
+    const double a0 = kPrev ? span / (k1.time - kPrev->time) : 0.0;
+    const double a1 = kNext ? span / (kNext->time - k0.time) : 0.0;
+    const Parameter *values[4] = {k0.value.Get(), k1.value.Get(), nullptr, nullptr};
+    double weights[4] = {h00 - h11 * a1, h01 + h10 * a0, 0.0, 0.0};
+    size_t n = 2;
+    if (kPrev) {
+        values[n] = kPrev->value.Get();
+        weights[n++] = -h10 * a0;
     }
-    if (p0 && p1) {
-        const double x = smooth1([](const Parameter &p) { return static_cast<const Point &>(p).x; });
-        const double y = smooth1([](const Parameter &p) { return static_cast<const Point &>(p).y; });
-        return MakeRef<Point>(x, y);
+    if (kNext) {
+        values[n] = kNext->value.Get();
+        weights[n++] = h11 * a1;
     }
-    return Blend(k0, k1, u);
+    Ref<Parameter> v = k0.value->WeightedSum(values, weights, n);
+    return v ? v : Blend(k0, k1, u);
 }
 
 ScriptVal AnimCurve::ToScript() const {

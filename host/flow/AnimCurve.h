@@ -7,8 +7,9 @@
 //           keys (Catmull-Rom), flat at the ends
 //   Hold    the first key's value until the next key
 // Before the first key and after the last the curve holds the end values.
-// Values that cannot blend (text, IDs) hold. Keys are kept sorted by time;
-// a key at the time of an existing one replaces it.
+// Values that cannot blend (text, IDs) hold; so do polylines whose point
+// counts differ: the earlier key's shape stays until the next key. Keys are
+// kept sorted by time; a key at the time of an existing one replaces it.
 //
 // Thread safety: a curve is edited on the main thread and read by renders
 // after; do not edit a curve while a render reads it.

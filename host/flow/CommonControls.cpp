@@ -68,11 +68,16 @@ struct Mix {
 } // namespace
 
 void Operator::FinishConstruction() {
-    const bool blend = !RegAttrB(RegNoBlendControls);
+    // Mask tools (RegKindMask) merge the mask on their EffectMask input with
+    // their own (MaskOperator.h): no Blend or channel switches, no mixing by
+    // the mask; their clipping mode bounds the soft edge.
+    const uint32_t kind = GetRegistry() ? static_cast<uint32_t>(GetRegistry()->Tags().GetLong(RegTypeFlags, 0)) : 0;
+    const bool maskTool = (kind & (RegKindOperator | RegKindMask)) == (RegKindOperator | RegKindMask);
+    const bool blend = !RegAttrB(RegNoBlendControls) && !maskTool;
     const bool mask = !RegAttrB(RegNoEffectMask);
     const Input *mainIn = FindMainInput(1);
-    const bool clipping =
-        mainIn && mainIn->DataType() == CLSID_DataType_Image && RegAttrB(RegSupportsDoD) && !FindInput("ClippingMode");
+    const bool clipping = (maskTool || (mainIn && mainIn->DataType() == CLSID_DataType_Image)) &&
+                          RegAttrB(RegSupportsDoD) && !FindInput("ClippingMode");
     // Motion blur for tools with an image output, unless one of its IDs is taken.
     static const char *const motionIds[] = {"MotionBlur", "MotionBlurQuality", "MotionBlurShutterAngle",
                                             "MotionBlurCenterBias", "MotionBlurSampleSpread"};
@@ -123,6 +128,8 @@ void Operator::FinishConstruction() {
                                               {InputRequired, 0},
                                               {ControlPage, page},
                                               {LinkMain, 100}});
+    }
+    if (mask && !maskTool) {
         common_.maskChannel = AddInputTagList("Mask Channel", "EffectMaskChannel",
                                               {{LinkDataType, CLSID_DataType_Number},
                                                {InputControl, CLSID_InputControl_Combo},

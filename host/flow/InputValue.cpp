@@ -10,6 +10,7 @@
 #include "host/flow/DataTypes.h"
 #include "host/flow/Operator.h"
 #include "host/flow/OrvaneDoc.h"
+#include "host/shape/PolyLine.h"
 
 namespace Orvane {
 namespace {
@@ -136,6 +137,7 @@ Ref<Parameter> CheckedParameter(const Input *in, const ScriptVal &v, bool lenien
         }
         return MakeRef<IDValue>(OvID(choices[at].id.empty() ? choices[at].label : choices[at].id));
     }
+    if (PolyLine::IsPolyLineType(type)) return PolyLine::FromScript(type, v, problem);
     Ref<Parameter> value = ParameterFromScript(type, v);
     if (!value) problem = std::string("expects ") + ExpectedValueText(in) + ", got " + v.ToText();
     return value;
@@ -200,6 +202,7 @@ const char *ExpectedValueText(const Input *in) {
     if (t == CLSID_DataType_ColorCurves) return "range curves (ColorCurves { Shadows = ..., Highlights = ... })";
     if (t == CLSID_DataType_LookUpTable) return "a curve (LookUpTable { Points = { { x, y }, ... } })";
     if (t == CLSID_DataType_Clip) return "a file name (text)";
+    if (PolyLine::IsPolyLineType(t)) return "a polyline (Polyline { \"x y\", ... })";
     if (IsImageDataType(t)) return "a link to an image output (Tool.Output)";
     return "a value of its own type";
 }

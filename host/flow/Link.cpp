@@ -12,6 +12,7 @@
 #include "host/flow/Operator.h"
 #include "host/flow/OrvaneDoc.h"
 #include "host/media/Clip.h"
+#include "host/shape/PolyLine.h"
 
 namespace Orvane {
 namespace {
@@ -55,6 +56,7 @@ Ref<Parameter> DefaultValueFor(OvID dataType, const TagList &tags) {
         return tags.Has(InputDefault) ? SplineCurve::Flat(tags.GetDouble(InputDefault)) : MakeRef<SplineCurve>();
     if (dataType == CLSID_DataType_Clip) return MakeRef<Clip>(tags.GetText(InputDefaultText, ""));
     if (dataType == CLSID_DataType_ScriptVal) return MakeRef<ScriptValue>();
+    if (PolyLine::IsPolyLineType(dataType)) return PolyLine::MakeOfType(dataType);
     return nullptr;
 }
 
@@ -76,6 +78,10 @@ Ref<Parameter> ParameterFromScript(OvID dataType, const ScriptVal &v) {
     if (dataType == CLSID_DataType_LookUpTable) return SplineCurve::FromScript(v);
     if (dataType == CLSID_DataType_Clip) return v.IsText() ? MakeRef<Clip>(v.AsText()) : nullptr;
     if (dataType == CLSID_DataType_ScriptVal) return MakeRef<ScriptValue>(v);
+    if (PolyLine::IsPolyLineType(dataType)) {
+        std::string problem;
+        return PolyLine::FromScript(dataType, v, problem);
+    }
     return nullptr;
 }
 

@@ -21,8 +21,9 @@ struct PrefInfo {
 };
 
 constexpr PrefInfo Prefs[PREF_Count] = {
-    {"FrameWidth", 1920}, {"FrameHeight", 1080}, {"FrameAspectX", 1.0},   {"FrameAspectY", 1.0}, {"FrameDepth", 8},
-    {"FrameRate", 24.0},  {"FrameFields", 0},    {"CacheMemoryMB", 2048}, {"UseGPU", 0},         {"ImageOverlay", 0},
+    {"FrameWidth", 1920}, {"FrameHeight", 1080}, {"FrameAspectX", 1.0}, {"FrameAspectY", 1.0},
+    {"FrameDepth", 8},    {"FrameRate", 24.0},   {"FrameFields", 0},    {"CacheMemoryMB", 2048},
+    {"UseGPU", 0},        {"ImageOverlay", 0},   {"MaskFilter", 4},
 };
 
 } // namespace

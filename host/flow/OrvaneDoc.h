@@ -41,6 +41,7 @@ enum PrefID : int {
     PREF_CacheMemoryMB,
     PREF_UseGPU,
     PREF_ImageOverlay,
+    PREF_MaskFilter, ///< default soft-edge filter of masks: 0 Box, 1 Bartlett, 2 Multi-box, 3 Gaussian, 4 Fast Gaussian
     PREF_Count
 };
 /// The name of a preference in documents.

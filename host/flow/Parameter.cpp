@@ -36,6 +36,12 @@ Ref<Parameter> Number::Interpolate(const Parameter &other, double t) const {
     if (!o) return Parameter::Interpolate(other, t);
     return MakeRef<Number>(value + (o->value - value) * t);
 }
+bool Number::BlendsWith(const Parameter &other) const { return dynamic_cast<const Number *>(&other) != nullptr; }
+Ref<Parameter> Number::WeightedSum(const Parameter *const *values, const double *weights, size_t count) const {
+    double sum = 0.0;
+    for (size_t i = 0; i < count; ++i) sum += weights[i] * static_cast<const Number *>(values[i])->value;
+    return MakeRef<Number>(sum);
+}
 
 OvID Point::DataType() const { return CLSID_DataType_Point; }
 ScriptVal Point::ToScript() const {
@@ -54,6 +60,16 @@ Ref<Parameter> Point::Interpolate(const Parameter &other, double t) const {
     auto *o = dynamic_cast<const Point *>(&other);
     if (!o) return Parameter::Interpolate(other, t);
     return MakeRef<Point>(x + (o->x - x) * t, y + (o->y - y) * t);
+}
+bool Point::BlendsWith(const Parameter &other) const { return dynamic_cast<const Point *>(&other) != nullptr; }
+Ref<Parameter> Point::WeightedSum(const Parameter *const *values, const double *weights, size_t count) const {
+    double sx = 0.0, sy = 0.0;
+    for (size_t i = 0; i < count; ++i) {
+        const auto *p = static_cast<const Point *>(values[i]);
+        sx += weights[i] * p->x;
+        sy += weights[i] * p->y;
+    }
+    return MakeRef<Point>(sx, sy);
 }
 
 OvID Text::DataType() const { return CLSID_DataType_Text; }

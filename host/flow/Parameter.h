@@ -30,6 +30,12 @@ public:
     /// The value blended with `other` (same type) at weight t in [0, 1], for
     /// animation; kinds that cannot blend return the nearer of the two.
     virtual Ref<Parameter> Interpolate(const Parameter &other, double t) const;
+    /// True when WeightedSum can take this value together with `other`.
+    virtual bool BlendsWith(const Parameter &) const { return false; }
+    /// weights[0] x values[0] + ... for values that BlendsWith this one, for
+    /// smooth animation; what does not blend (flags, marks) comes from this
+    /// value. Null for kinds that do not sum.
+    virtual Ref<Parameter> WeightedSum(const Parameter *const *, const double *, size_t) const { return nullptr; }
 };
 
 class ORVANE_API Number : public Parameter {
@@ -43,6 +49,8 @@ public:
     uint64_t Hash() const override;
     Ref<Parameter> Copy() const override;
     Ref<Parameter> Interpolate(const Parameter &other, double t) const override;
+    bool BlendsWith(const Parameter &other) const override;
+    Ref<Parameter> WeightedSum(const Parameter *const *values, const double *weights, size_t count) const override;
     size_t SizeOf() const override { return sizeof(*this); }
     operator double() const { return value; }
 };
@@ -58,6 +66,8 @@ public:
     uint64_t Hash() const override;
     Ref<Parameter> Copy() const override;
     Ref<Parameter> Interpolate(const Parameter &other, double t) const override;
+    bool BlendsWith(const Parameter &other) const override;
+    Ref<Parameter> WeightedSum(const Parameter *const *values, const double *weights, size_t count) const override;
     size_t SizeOf() const override { return sizeof(*this); }
 };
 

@@ -7,6 +7,7 @@
 // format as defaults, and works out the frame a request asks for.
 //
 // Thread safety: as Operator.
+#include "host/flow/ImageFormatInputs.h"
 #include "host/flow/Operator.h"
 
 namespace Orvane {
@@ -30,15 +31,15 @@ public:
     /// Reads the image-format controls and the request's proxy and field state.
     SourceFrame GetSourceFrame(Request *req) const;
 
-    Input *InWidth() const { return inWidth_; }
-    Input *InHeight() const { return inHeight_; }
-    Input *InPixelAspect() const { return inAspect_; }
-    Input *InDepth() const { return inDepth_; }
+    Input *InWidth() const { return formatInputs_.width; }
+    Input *InHeight() const { return formatInputs_.height; }
+    Input *InPixelAspect() const { return formatInputs_.aspect; }
+    Input *InDepth() const { return formatInputs_.depth; }
     Input *InGlobalIn() const { return inGlobalIn_; }
     Input *InGlobalOut() const { return inGlobalOut_; }
 
 private:
-    Input *inWidth_ = nullptr, *inHeight_ = nullptr, *inAspect_ = nullptr, *inDepth_ = nullptr;
+    ImageFormatInputs formatInputs_;
     Input *inGlobalIn_ = nullptr, *inGlobalOut_ = nullptr;
 };
 

@@ -31,6 +31,20 @@ void Image::SetDataWindow(const ImgRectI &r) {
 void Image::GetCanvasColor(Pixel &p) const { p = FltToPixel(canvas_); }
 void Image::SetCanvasColor(const Pixel &p) { canvas_ = PixelToFlt(p); }
 
+float Image::GetCanvasColorFltChan(int channel) const {
+    const float v[4] = {canvas_.R, canvas_.G, canvas_.B, canvas_.A};
+    return channel >= 0 && channel < 4 ? v[channel] : 0.f;
+}
+
+void Image::SetCanvasColorFltChan(int channel, float v) {
+    if (IsMask()) {
+        if (channel == 3) canvas_ = FltPixel{v, v, v, v};
+        return;
+    }
+    float *c[4] = {&canvas_.R, &canvas_.G, &canvas_.B, &canvas_.A};
+    if (channel >= 0 && channel < 4) *c[channel] = v;
+}
+
 void Image::NameRefusal() const {
     NamePixelRefusal("a " + DescribeImage(dataWindow_.Width(), dataWindow_.Height(), depth_));
 }

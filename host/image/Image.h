@@ -109,6 +109,11 @@ public:
     void SetCanvasColor(const Pixel &p);
     void CopyCanvasColor(const Image *from) { canvas_ = from->canvas_; }
     bool IsCanvasColorClear() const { return canvas_ == FltPixel{}; }
+    /// One channel of the canvas colour (0 R, 1 G, 2 B, 3 A). A single-channel
+    /// image reads its value into all four channels, so setting its channel 3
+    /// sets all four.
+    float GetCanvasColorFltChan(int channel) const;
+    void SetCanvasColorFltChan(int channel, float v);
 
     // ---- rows ----
     /// Makes the rows exist (zeroed). False when memory ran out or the

@@ -4,6 +4,7 @@
 #include "host/krom/kernels/ColorKernelParams.h"
 #include "host/krom/kernels/GeneratorKernelParams.h"
 #include "host/krom/kernels/KernelTexts.h"
+#include "host/krom/kernels/MaskKernelParams.h"
 #include "host/krom/kernels/MergeKernelParams.h"
 #include "host/krom/kernels/ResizeKernelParams.h"
 
@@ -23,6 +24,7 @@ const std::vector<CommonKernel> &CommonKernels() {
         {"BlurRows", BlurRowsParamsText, kBlurRowsKernel},
         {"BlurColumns", BlurColumnsParamsText, kBlurColumnsKernel},
         {"Merge", MergeParamsText, kMergeKernel},
+        {"MaskMerge", MaskMergeParamsText, kMaskMergeKernel},
         {"ResizeAcross", ResizeParamsText, kResizeKernels},
         {"ResizeDown", ResizeParamsText, kResizeKernels},
     };

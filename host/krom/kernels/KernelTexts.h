@@ -21,6 +21,8 @@ extern const char kBlurRowsKernel[];
 extern const char kBlurColumnsKernel[];
 /// "Merge".
 extern const char kMergeKernel[];
+/// "MaskMerge".
+extern const char kMaskMergeKernel[];
 /// "ResizeAcross" and "ResizeDown".
 extern const char kResizeKernels[];
 } // namespace Orvane
