@@ -232,6 +232,12 @@ Ref<Parameter> EvaluateValue(Output *out, double time, const EvalOptions &option
             Request::Slot &slot = req.SlotOf(in);
             if (slot.given || !in->Link() || !IsImageDataType(in->DataType())) continue;
             slot.roi = opt.roi;
+            // A mask is drawn in the frame of the image it limits: its request carries this tool's frame.
+            if (in->DataType() == CLSID_DataType_Mask && ownDoD && ownDoD->HasFrame()) {
+                ImageDomain framed = slot.roi ? *slot.roi : ImageDomain::Endless();
+                framed.frame = ownDoD->frame, framed.xScale = ownDoD->xScale, framed.yScale = ownDoD->yScale;
+                slot.roi = framed;
+            }
             EvalOptions pre = opt;
             pre.flags |= ReqFlagPreCalc;
             pre.roi.reset();

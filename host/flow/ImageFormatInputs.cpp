@@ -7,12 +7,14 @@
 
 namespace Orvane {
 
-void ImageFormatInputs::Add(Operator *op, int page, const FrameFormat &ff, bool size, bool pixelAspect,
-                            bool depthList) {
+void ImageFormatInputs::Add(Operator *op, int page, const FrameFormat &ff, bool size, bool pixelAspect, bool depthList,
+                            const char *const sizeIds[2]) {
     if (size) {
+        static const char *const plain[2] = {"Width", "Height"};
+        const char *const *ids = sizeIds ? sizeIds : plain;
         for (int axis = 0; axis < 2; ++axis)
             (axis ? height : width) =
-                op->AddInputTagList(axis ? "Height" : "Width", axis ? "Height" : "Width",
+                op->AddInputTagList(plain[axis], ids[axis],
                                     {{LinkDataType, CLSID_DataType_Number},
                                      {InputControl, CLSID_InputControl_Slider},
                                      {ControlPage, page},

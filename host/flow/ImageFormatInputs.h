@@ -19,8 +19,11 @@ struct ImageFormatInputs {
     Input *width = nullptr, *height = nullptr, *aspect = nullptr, *depth = nullptr;
 
     /// Adds the size (Width, Height), aspect (PixelAspect) and depth (Depth)
-    /// controls that are asked for, in that order, on page `page`.
-    void Add(Operator *op, int page, const FrameFormat &ff, bool size, bool pixelAspect, bool depthList);
+    /// controls that are asked for, in that order, on page `page`. `sizeIds`
+    /// replaces the IDs of the two size controls (masks: their shapes have a
+    /// Width and Height of their own); the labels stay "Width" and "Height".
+    void Add(Operator *op, int page, const FrameFormat &ff, bool size, bool pixelAspect, bool depthList,
+             const char *const sizeIds[2] = nullptr);
 
     struct Values {
         int width = 0, height = 0;

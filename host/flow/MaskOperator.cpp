@@ -232,7 +232,8 @@ MaskOperator::MaskOperator(const Registry *reg, const ScriptVal &args, const Tag
 void MaskOperator::FinishConstruction() {
     const FrameFormat ff = GetDoc() ? GetDoc()->GetFrameFormat() : FrameFormat();
     const int page = AddControlPageTagList("Image", {{PageIcon, static_cast<const void *>("Icons.Tools.Tabs.Image")}});
-    formatInputs_.Add(this, page, ff, true, true, true);
+    static const char *const sizeIds[2] = {"MaskWidth", "MaskHeight"}; // the shapes have a Width and Height
+    formatInputs_.Add(this, page, ff, true, true, true, sizeIds);
     ThreadedOperator::FinishConstruction();
 }
 
@@ -251,14 +252,20 @@ void MaskOperator::NotifyChanged(Input *in, Parameter *param, double time, TagLi
 MaskFormat MaskOperator::GetMaskFormat(Request *req) const {
     const FrameFormat ff = GetDoc() ? GetDoc()->GetFrameFormat() : FrameFormat();
     const ImageFormatInputs::Values v = formatInputs_.Read(req, ff);
-    const int proxy = std::max(1, req->ProxyScale());
     MaskFormat f;
+    // Default: the document's frame depth, as one channel.
+    f.depth = std::clamp(v.depthChoice > 0 ? v.depthChoice : MaskDepthOf(ff.depth), 1, 4);
+    // Limiting another tool's image, the mask takes that image's frame (already at the proxy scale).
+    if (const AutoImageRoI roi(req); roi && roi->HasFrame()) {
+        f.width = roi->FrameWidth(), f.height = roi->FrameHeight();
+        f.aspectX = roi->xScale, f.aspectY = roi->yScale;
+        return f;
+    }
+    const int proxy = std::max(1, req->ProxyScale());
     f.width = std::max(1, v.width / proxy);
     f.height = std::max(1, v.height / proxy);
     f.aspectX = v.aspectX;
     f.aspectY = v.aspectY;
-    // Default: the document's frame depth, as one channel.
-    f.depth = std::clamp(v.depthChoice > 0 ? v.depthChoice : MaskDepthOf(ff.depth), 1, 4);
     return f;
 }
 
