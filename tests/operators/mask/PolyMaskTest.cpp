@@ -16,6 +16,7 @@
 #include "host/flow/Request.h"
 #include "host/image/Image.h"
 #include "host/shape/PolyLine.h"
+#include "tests/operators/mask/MaskRig.h"
 #include "tests/support/TestSupport.h"
 
 namespace Orvane::PolyMaskTest {
@@ -23,7 +24,7 @@ namespace {
 namespace ts = ::Orvane::Test;
 using std::numbers::pi;
 
-constexpr int W = 256, H = 192;
+constexpr int W = ts::MaskRig::W, H = ts::MaskRig::H;
 
 struct Px {
     double x, y;
@@ -55,31 +56,12 @@ std::vector<Px> Square(double cx, double cy, double half) {
     return {{cx - half, cy - half}, {cx + half, cy - half}, {cx + half, cy + half}, {cx - half, cy + half}};
 }
 
-struct Rig {
-    Ref<OrvaneDoc> doc = MakeRef<OrvaneDoc>();
-    Operator *mask = nullptr;
-    explicit Rig(const char *cls = "PolylineMask") {
-        ts::LoadOperators();
-        doc->SetPref(PREF_FFWidth, W);
-        doc->SetPref(PREF_FFHeight, H);
-        mask = doc->AddTool(OvID(cls));
-        EXPECT_TRUE(mask) << cls;
-    }
+struct Rig : ts::MaskRig {
+    explicit Rig(const char *cls = "PolylineMask") : MaskRig(cls) {}
     void Set(const char *id, Ref<PolyLine> line) const { ASSERT_TRUE(mask->FindInput(id)->SetValue(line)); }
-    Ref<Image> Render() const {
-        EvalOptions opt;
-        opt.useCache = false;
-        return ts::EvalImage(mask, 0.0, opt);
-    }
 };
 
-/// The covered area in pixels over the frame (the canvas counts beyond the data window).
-double Area(const Image &m) {
-    double sum = 0;
-    for (int y = 0; y < H; ++y)
-        for (int x = 0; x < W; ++x) sum += m.GetFlt(x, y).A;
-    return sum;
-}
+double Area(const Image &m) { return ts::MaskRig::Area(m); }
 
 double Perimeter(const std::vector<Px> &p, bool closed) {
     double sum = 0;
