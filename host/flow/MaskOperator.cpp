@@ -113,22 +113,20 @@ bool Aborted(const Request *req, const Image *img) {
 
 using namespace maskop;
 
-MaskOperator::MaskOperator(const Registry *reg, const ScriptVal &args, const TagList &tags)
-    : ThreadedOperator(reg, args, tags) {
-    AddControlPageTagList("Controls", {{PageIcon, static_cast<const void *>("Icons.Tools.Tabs.Controls")}});
+void MaskControls::Add(Operator *op) {
     const TagList number{{LinkDataType, CLSID_DataType_Number}};
     auto with = [&number](std::initializer_list<TagItem> more) {
         TagList t = number;
         for (const TagItem &item : more) t.Add(item);
         return t;
     };
-    level_ = AddInputTagList("Level", "Level",
-                             with({{InputControl, CLSID_InputControl_Slider},
-                                   {InputDefault, 1.0},
-                                   {InputMinAllowed, 0.0},
-                                   {InputMaxAllowed, 1.0}}));
+    level = op->AddInputTagList("Level", "Level",
+                                with({{InputControl, CLSID_InputControl_Slider},
+                                      {InputDefault, 1.0},
+                                      {InputMinAllowed, 0.0},
+                                      {InputMaxAllowed, 1.0}}));
     // The default filter is the document's preference (Fast Gaussian unless set).
-    const long pref = GetDoc() ? GetDoc()->GetPrefLong(PREF_MaskFilter) : long{MaskFilterFastGaussian};
+    const long pref = op->GetDoc() ? op->GetDoc()->GetPrefLong(PREF_MaskFilter) : long{MaskFilterFastGaussian};
     const int defaultFilter = pref >= 0 && pref < MaskFilterCount ? static_cast<int>(pref) : MaskFilterFastGaussian;
     TagList filterTags{{LinkDataType, CLSID_DataType_OvID},
                        {InputControl, CLSID_InputControl_MultiButtonID},
@@ -142,32 +140,32 @@ MaskOperator::MaskOperator(const Registry *reg, const ScriptVal &args, const Tag
         filterTags.Add({ListItemId, OvID(id)});
     }
     filterTags.Add({ListAcceptedId, OvID("Soften")}); // older documents; read as Multi-box
-    filter_ = AddInputTagList("Filter", "Filter", filterTags);
-    softEdge_ = AddInputTagList("Soft Edge", "SoftEdge",
-                                with({{InputControl, CLSID_InputControl_Slider},
-                                      {InputDefault, 0.0},
-                                      {InputMinAllowed, 0.0},
-                                      {InputMaxAllowed, 1.0},
-                                      {InputSliderLow, 0.0},
-                                      {InputSliderHigh, 0.2},
-                                      {InputPriority, PriorityLast}}));
-    passes_ = AddInputTagList("Num Passes", "Passes",
-                              with({{InputControl, CLSID_InputControl_Slider},
-                                    {InputInteger, 1},
-                                    {InputDefault, 4.0},
-                                    {InputMinAllowed, 1.0},
-                                    {InputMaxAllowed, 64.0},
-                                    {InputSliderLow, 1.0},
-                                    {InputSliderHigh, 16.0},
-                                    {InputPriority, PriorityLast},
-                                    {ControlVisible, defaultFilter == MaskFilterMultiBox}}));
-    borderWidth_ = AddInputTagList("Border Width", "BorderWidth",
+    filter = op->AddInputTagList("Filter", "Filter", filterTags);
+    softEdge = op->AddInputTagList("Soft Edge", "SoftEdge",
                                    with({{InputControl, CLSID_InputControl_Slider},
                                          {InputDefault, 0.0},
-                                         {InputMinAllowed, -1.0},
+                                         {InputMinAllowed, 0.0},
                                          {InputMaxAllowed, 1.0},
-                                         {InputSliderLow, -0.2},
-                                         {InputSliderHigh, 0.2}}));
+                                         {InputSliderLow, 0.0},
+                                         {InputSliderHigh, 0.2},
+                                         {InputPriority, PriorityLast}}));
+    passes = op->AddInputTagList("Num Passes", "Passes",
+                                 with({{InputControl, CLSID_InputControl_Slider},
+                                       {InputInteger, 1},
+                                       {InputDefault, 4.0},
+                                       {InputMinAllowed, 1.0},
+                                       {InputMaxAllowed, 64.0},
+                                       {InputSliderLow, 1.0},
+                                       {InputSliderHigh, 16.0},
+                                       {InputPriority, PriorityLast},
+                                       {ControlVisible, defaultFilter == MaskFilterMultiBox}}));
+    borderWidth = op->AddInputTagList("Border Width", "BorderWidth",
+                                      with({{InputControl, CLSID_InputControl_Slider},
+                                            {InputDefault, 0.0},
+                                            {InputMinAllowed, -1.0},
+                                            {InputMaxAllowed, 1.0},
+                                            {InputSliderLow, -0.2},
+                                            {InputSliderHigh, 0.2}}));
     TagList modeTags{{LinkDataType, CLSID_DataType_OvID},
                      {InputControl, CLSID_InputControl_ComboID},
                      {InputDefaultId, OvID(PaintModeID[PaintMerge])}};
@@ -175,11 +173,11 @@ MaskOperator::MaskOperator(const Registry *reg, const ScriptVal &args, const Tag
         modeTags.Add({ListAddItem, PaintModeName[i]});
         modeTags.Add({ListItemId, OvID(PaintModeID[i])});
     }
-    paintMode_ = AddInputTagList("Paint Mode", "PaintMode", modeTags);
-    invert_ =
-        AddInputTagList("Invert", "Invert",
-                        with({{InputControl, CLSID_InputControl_Checkbox}, {InputDefault, 0.0}, {ControlWidth, 0.5}}));
-    solid_ = AddInputTagList(
+    paintMode = op->AddInputTagList("Paint Mode", "PaintMode", modeTags);
+    invert = op->AddInputTagList(
+        "Invert", "Invert",
+        with({{InputControl, CLSID_InputControl_Checkbox}, {InputDefault, 0.0}, {ControlWidth, 0.5}}));
+    solid = op->AddInputTagList(
         "Solid", "Solid",
         with(
             {{InputControl, CLSID_InputControl_Checkbox}, {InputDefault, 1.0}, {ControlWidth, 0.5}, {InputNotify, 1}}));
@@ -204,28 +202,34 @@ MaskOperator::MaskOperator(const Registry *reg, const ScriptVal &args, const Tag
                                 {"Miter Clip", "Icons.Outline.JoinMiterClip"}},
                                "Border Style");
     join.Set({InputNotify, 1});
-    joinStyle_ = AddInputTagList("Join Style", "JoinStyle", join);
-    miterLimit_ = AddInputTagList("Miter Limit", "MiterLimit",
-                                  with({{InputControl, CLSID_InputControl_Slider},
-                                        {InputDefault, 10.0},
-                                        {InputSliderLow, 0.0},
-                                        {InputSliderHigh, 10.0},
-                                        {SliderRest, 4.0}}));
-    capStyle_ = AddInputTagList("Cap Style", "CapStyle",
-                                iconButtons({{"Flat", "Icons.Outline.CapButt"},
-                                             {"Rounded", "Icons.Outline.CapRound"},
-                                             {"Square", "Icons.Outline.CapSquare"}},
-                                            nullptr));
+    joinStyle = op->AddInputTagList("Join Style", "JoinStyle", join);
+    miterLimit = op->AddInputTagList("Miter Limit", "MiterLimit",
+                                     with({{InputControl, CLSID_InputControl_Slider},
+                                           {InputDefault, 10.0},
+                                           {InputSliderLow, 0.0},
+                                           {InputSliderHigh, 10.0},
+                                           {SliderRest, 4.0}}));
+    capStyle = op->AddInputTagList("Cap Style", "CapStyle",
+                                   iconButtons({{"Flat", "Icons.Outline.CapButt"},
+                                                {"Rounded", "Icons.Outline.CapRound"},
+                                                {"Square", "Icons.Outline.CapSquare"}},
+                                               nullptr));
     for (int end = 0; end < 2; ++end)
-        (end ? writeLength_ : writePosition_) =
-            AddInputTagList(end ? "Length" : "Position", end ? "WriteLength" : "WritePosition",
-                            with({{InputControl, CLSID_InputControl_Range},
-                                  {ControlRowLabel, "WriteOnStart"},
-                                  {ControlGroup, 40},
-                                  {ControlMember, end},
-                                  {InputDefault, end ? 1.0 : 0.0},
-                                  {InputSliderLow, 0.0},
-                                  {InputSliderHigh, 1.0}}));
+        (end ? writeLength : writePosition) =
+            op->AddInputTagList(end ? "Length" : "Position", end ? "WriteLength" : "WritePosition",
+                                with({{InputControl, CLSID_InputControl_Range},
+                                      {ControlRowLabel, "WriteOnStart"},
+                                      {ControlGroup, 40},
+                                      {ControlMember, end},
+                                      {InputDefault, end ? 1.0 : 0.0},
+                                      {InputSliderLow, 0.0},
+                                      {InputSliderHigh, 1.0}}));
+}
+
+MaskOperator::MaskOperator(const Registry *reg, const ScriptVal &args, const TagList &tags)
+    : ThreadedOperator(reg, args, tags) {
+    AddControlPageTagList("Controls", {{PageIcon, static_cast<const void *>("Icons.Tools.Tabs.Controls")}});
+    controls_.Add(this);
     output_ = AddOutputTagList("Mask", "Mask", {{LinkDataType, CLSID_DataType_Mask}, {LinkMain, 1}});
 }
 
@@ -237,15 +241,19 @@ void MaskOperator::FinishConstruction() {
     ThreadedOperator::FinishConstruction();
 }
 
-void MaskOperator::NotifyChanged(Input *in, Parameter *param, double time, TagList *tags) {
-    if (in == filter_)
+void MaskControls::NotifyChanged(Input *in, Parameter *param) {
+    if (in == filter)
         if (const auto *id = dynamic_cast<const IDValue *>(param)) {
-            const int filter = MaskFilterOf(id->value);
-            passes_->SetAttrsTagList({{ControlVisible, filter == MaskFilterMultiBox}});
+            const int kind = MaskFilterOf(id->value);
+            passes->SetAttrsTagList({{ControlVisible, kind == MaskFilterMultiBox}});
             // An older document's "Soften" becomes the Multi-box it always was.
-            if (id->value == OvID("Soften") && !filter_->Link() && !filter_->IsAnimated())
-                filter_->SetValue(MakeRef<IDValue>(OvID(MaskFilterID[MaskFilterMultiBox])));
+            if (id->value == OvID("Soften") && !filter->Link() && !filter->IsAnimated())
+                filter->SetValue(MakeRef<IDValue>(OvID(MaskFilterID[MaskFilterMultiBox])));
         }
+}
+
+void MaskOperator::NotifyChanged(Input *in, Parameter *param, double time, TagList *tags) {
+    controls_.NotifyChanged(in, param);
     ThreadedOperator::NotifyChanged(in, param, time, tags);
 }
 
@@ -269,13 +277,18 @@ MaskFormat MaskOperator::GetMaskFormat(Request *req) const {
     return f;
 }
 
-MaskMergeSettings MaskOperator::GetMergeSettings(Request *req) const {
+MaskMergeSettings MaskControls::MergeSettings(Request *req) const {
     MaskMergeSettings s;
-    s.paintMode = PaintModeIndex(req->GetInputID(paintMode_, OvID(PaintModeID[PaintMerge])).Text());
-    s.level = req->GetInputNumber(level_, 1.0);
-    s.filter = MaskFilterOf(req->GetInputID(filter_, OvID(MaskFilterID[MaskFilterFastGaussian])));
-    s.softEdge = req->GetInputNumber(softEdge_, 0.0);
-    s.passes = static_cast<int>(req->GetInputNumber(passes_, 4.0));
+    s.paintMode = PaintModeIndex(req->GetInputID(paintMode, OvID(PaintModeID[PaintMerge])).Text());
+    s.level = req->GetInputNumber(level, 1.0);
+    s.filter = MaskFilterOf(req->GetInputID(filter, OvID(MaskFilterID[MaskFilterFastGaussian])));
+    s.softEdge = req->GetInputNumber(softEdge, 0.0);
+    s.passes = static_cast<int>(req->GetInputNumber(passes, 4.0));
+    return s;
+}
+
+MaskMergeSettings MaskOperator::GetMergeSettings(Request *req) const {
+    MaskMergeSettings s = controls_.MergeSettings(req);
     s.clipToFrame = GetClippingMode(req) == ClippingMode_Frame;
     return s;
 }

@@ -65,6 +65,23 @@ struct MaskFormat {
     ImgRectI Frame() const { return ImgRectI(0, 0, width, height); }
 };
 
+/// The common controls of a mask, Level to WriteLength in this order. A mask
+/// tool has one set; each layer of a multi-layer mask adds its own (under the
+/// layer's group, so its IDs read "Layer.Level").
+struct ORVANE_API MaskControls {
+    Input *level = nullptr, *filter = nullptr, *softEdge = nullptr, *passes = nullptr, *borderWidth = nullptr,
+          *paintMode = nullptr, *invert = nullptr, *solid = nullptr, *joinStyle = nullptr, *miterLimit = nullptr,
+          *capStyle = nullptr, *writePosition = nullptr, *writeLength = nullptr;
+
+    /// Adds the controls to `op` on its current page (and in its current group).
+    void Add(Operator *op);
+    /// Passes shows for Multi-box only; an older document's "Soften" becomes
+    /// Multi-box. Call from the owner's NotifyChanged.
+    void NotifyChanged(Input *in, Parameter *param);
+    /// The merge settings of a request (clipToFrame left false: the tool's).
+    MaskMergeSettings MergeSettings(Request *req) const;
+};
+
 class ORVANE_API MaskOperator : public ThreadedOperator {
 public:
     MaskOperator(const Registry *reg, const ScriptVal &args, const TagList &tags);
@@ -76,6 +93,13 @@ public:
     void PreProcess(Request *req) override;
     /// The finishing merge (MergeMasks), the mask-domain flag and the valid window.
     void PostProcess(Request *req) override;
+
+    /// Samples per pixel of curve length along the soft band between an inner
+    /// and an outer polyline: the longer line's length in pixels times this
+    /// gives the facing sample pairs, so 0.5 is a pair every 2 pixels. The
+    /// band is linear between samples; at that spacing a curve of radius r
+    /// pixels strays at most 0.5 / r pixels from its chords.
+    static constexpr double kBandTessellation = 0.5;
 
     // ---- the mask of a request ----
     /// The pixels the mask may be needed over: the consumer's region (the
@@ -114,20 +138,21 @@ public:
     static bool MergeGPU(Request *req, Image *mask, const Image *incoming, int mode, double level);
 
     // ---- inputs ----
-    Input *InLevel() const { return level_; }
-    Input *InFilter() const { return filter_; }
-    Input *InSoftEdge() const { return softEdge_; }
-    Input *InPasses() const { return passes_; }
-    Input *InBorderWidth() const { return borderWidth_; }
-    Input *InPaintMode() const { return paintMode_; }
-    Input *InInvert() const { return invert_; }
-    Input *InSolid() const { return solid_; }
-    Input *InJoinStyle() const { return joinStyle_; }
-    Input *InMiterLimit() const { return miterLimit_; }
-    Input *InCapStyle() const { return capStyle_; }
-    Input *InWritePosition() const { return writePosition_; }
-    Input *InWriteLength() const { return writeLength_; }
+    Input *InLevel() const { return controls_.level; }
+    Input *InFilter() const { return controls_.filter; }
+    Input *InSoftEdge() const { return controls_.softEdge; }
+    Input *InPasses() const { return controls_.passes; }
+    Input *InBorderWidth() const { return controls_.borderWidth; }
+    Input *InPaintMode() const { return controls_.paintMode; }
+    Input *InInvert() const { return controls_.invert; }
+    Input *InSolid() const { return controls_.solid; }
+    Input *InJoinStyle() const { return controls_.joinStyle; }
+    Input *InMiterLimit() const { return controls_.miterLimit; }
+    Input *InCapStyle() const { return controls_.capStyle; }
+    Input *InWritePosition() const { return controls_.writePosition; }
+    Input *InWriteLength() const { return controls_.writeLength; }
     Output *OutMask() const { return output_; }
+    const MaskControls &Controls() const { return controls_; }
 
 private:
     /// The consumer's region with endless sides cut to the frame, or the frame.
@@ -136,8 +161,7 @@ private:
     int SoftEdgeReach(const MaskMergeSettings &s, const MaskFormat &f) const;
     Ref<Image> SoftEdgeOf(Request *req, Image *mask, int depth, const MaskMergeSettings &s);
 
-    Input *level_, *filter_, *softEdge_, *passes_, *borderWidth_, *paintMode_, *invert_, *solid_, *joinStyle_,
-        *miterLimit_, *capStyle_, *writePosition_, *writeLength_;
+    MaskControls controls_;
     Output *output_;
     ImageFormatInputs formatInputs_;
     std::optional<ImgRectI> region_;

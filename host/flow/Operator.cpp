@@ -31,6 +31,12 @@ int Operator::AddControlPageTagList(const char *name, const TagList &tags) {
     return static_cast<int>(pages_.size()) - 1;
 }
 
+void Operator::SetControlPageTags(int page, const TagList &tags) {
+    if (page < 0 || page >= static_cast<int>(pages_.size())) return;
+    pages_[static_cast<size_t>(page)].tags.Merge(tags);
+    pages_[static_cast<size_t>(page)].tags.Persist();
+}
+
 Input *Operator::AddInputTagList(const char *name, const char *id, const TagList &tags) {
     const std::string fullId = group_.empty() ? std::string(id) : group_ + "." + id;
     if (FindInput(OvID(fullId))) return nullptr;

@@ -63,6 +63,8 @@ public:
 
     // ---- declaring (constructors) ----
     int AddControlPageTagList(const char *name, const TagList &tags);
+    /// Merges `tags` into page `page`'s (a tool changing the icon of a page its base made).
+    void SetControlPageTags(int page, const TagList &tags);
     Input *AddInputTagList(const char *name, const char *id, const TagList &tags);
     Output *AddOutputTagList(const char *name, const char *id, const TagList &tags);
     void BeginControlNestTagList(const char *name, const char *id, bool open, const TagList &tags);

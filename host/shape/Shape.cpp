@@ -181,18 +181,19 @@ void Shape::FlatTBSplineTo(const ShapePoint *points, const double *weights, int 
 void Shape::AppendRationalBSpline(const ShapePoint *points, const double *weights, int n, bool closed,
                                   const TagList &tags) {
     if (!points || n <= 0) return;
-    // Control points in homogeneous form; an open curve repeats its ends three
-    // times so that it starts and ends on them.
+    // Control points in homogeneous form. An open curve gets one more control
+    // point beyond each end, the next one mirrored through the end point (in
+    // homogeneous form), so that it starts and ends on its end points with
+    // n - 1 pieces: the curve PolyLine measures and samples.
     std::vector<HomPoint> ctl;
-    const int ends = closed ? 0 : 2;
-    ctl.reserve(static_cast<size_t>(n + 2 * ends + 3));
+    ctl.reserve(static_cast<size_t>(n + 3));
     auto hom = [&](int i) {
         const double w = weights ? std::max(weights[i], 1e-9) : 1.0;
         return HomPoint{points[i].x * w, points[i].y * w, w};
     };
-    for (int k = 0; k < ends; ++k) ctl.push_back(hom(0));
+    if (!closed && n > 1) ctl.push_back(hom(0) * 2.0 + hom(1) * -1.0);
     for (int i = 0; i < n; ++i) ctl.push_back(hom(i));
-    for (int k = 0; k < ends; ++k) ctl.push_back(hom(n - 1));
+    if (!closed && n > 1) ctl.push_back(hom(n - 1) * 2.0 + hom(n - 2) * -1.0);
     if (closed) {
         // Segment i uses points i-1 .. i+2: rotate so the list runs n-1, 0, .., n-1, 0, 1.
         ctl.insert(ctl.begin(), hom(n - 1));

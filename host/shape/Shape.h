@@ -68,9 +68,10 @@ public:
     /// Appends the uniform cubic B-spline of `n` control points, flattened
     /// with ShapeTolerance, to the open sub-path (joined by a line from its
     /// current point) or to a new one. Closed: the curve wraps around and
-    /// ends where it began (Close stays the caller's). Open: the end points
-    /// count three times, so the curve starts at the first control point and
-    /// ends at the last.
+    /// ends where it began (Close stays the caller's). Open: each end gets a
+    /// control point beyond it, the next one mirrored through the end (2 P0 -
+    /// P1), so the curve starts at the first control point and ends at the
+    /// last, in n - 1 pieces: the same curve as an open BSplinePolyLine.
     void FlatBSplineTo(const ShapePoint *points, int n, bool closed, const TagList &tags);
     /// The rational form: control point i has weight weights[i] (positive;
     /// smaller ones count as 1e-9). All weights 1 give FlatBSplineTo's curve.

@@ -1,5 +1,6 @@
 // Shape geometry: flattening against the true curves, B-splines against their basis functions, stroke and offset
 // areas against the areas of the figures they must make.
+#include "host/shape/PolyLine.h"
 #include "tests/host/shape/ShapeTestSupport.h"
 
 namespace Orvane::shapetest {
@@ -73,16 +74,20 @@ TEST(Shape, FlatteningKeepsEveryChordWithinToleranceOfItsCurve) {
         }
 }
 
-/// The uniform cubic B-spline basis at t of segment s (control points s..s+3), rational when weights are given.
-ShapePoint BSplineAt(const std::vector<ShapePoint> &p, const std::vector<double> &w, size_t s, double t) {
+/// A control point in homogeneous form: position times weight, and the weight.
+struct HomCtl {
+    double x, y, w;
+};
+
+/// The uniform cubic B-spline basis at t of segment s (control points s..s+3), in homogeneous form.
+ShapePoint BSplineAt(const std::vector<HomCtl> &p, size_t s, double t) {
     const double b[4] = {(1 - t) * (1 - t) * (1 - t) / 6, (3 * t * t * t - 6 * t * t + 4) / 6,
                          (-3 * t * t * t + 3 * t * t + 3 * t + 1) / 6, t * t * t / 6};
     double x = 0, y = 0, sum = 0;
     for (int k = 0; k < 4; ++k) {
-        const double wk = w.empty() ? 1.0 : w[s + k];
-        x += b[k] * wk * p[s + k].x;
-        y += b[k] * wk * p[s + k].y;
-        sum += b[k] * wk;
+        x += b[k] * p[s + k].x;
+        y += b[k] * p[s + k].y;
+        sum += b[k] * p[s + k].w;
     }
     return {x / sum, y / sum};
 }
@@ -112,22 +117,28 @@ TEST(Shape, BSplinesFollowTheirBasisFunctions) {
             s.FlatBSplineTo(p.data(), n, c.closed, {{ShapeTolerance, kTol}});
         else
             s.FlatTBSplineTo(p.data(), c.weights.data(), n, c.closed, {{ShapeTolerance, kTol}});
-        // The reference: control points wrapped round (closed) or with the ends counted three times (open).
-        std::vector<ShapePoint> ext;
-        std::vector<double> w;
-        for (int i = c.closed ? -1 : -2; i < (c.closed ? n + 2 : n + 2); ++i) {
-            const int k = c.closed ? (i + n) % n : std::clamp(i, 0, n - 1);
-            ext.push_back(p[k]);
-            if (!c.weights.empty()) w.push_back(c.weights[k]);
-        }
+        // The reference: control points wrapped round (closed), or (open) one more beyond each end, the next
+        // point mirrored through the end in homogeneous form (its weight 2 w0 - w1 may be 0 or less).
+        std::vector<HomCtl> ext;
+        auto hom = [&](int k) {
+            const double wk = c.weights.empty() ? 1.0 : c.weights[size_t(k)];
+            return HomCtl{p[size_t(k)].x * wk, p[size_t(k)].y * wk, wk};
+        };
+        auto mirrored = [&](int end, int next) {
+            const HomCtl e = hom(end), f = hom(next);
+            ext.push_back({2 * e.x - f.x, 2 * e.y - f.y, 2 * e.w - f.w});
+        };
+        if (!c.closed) mirrored(0, 1);
+        for (int i = c.closed ? -1 : 0; i < (c.closed ? n + 2 : n); ++i) ext.push_back(hom((i + n) % n));
+        if (!c.closed) mirrored(n - 1, n - 2);
         double worst = 0;
         for (size_t seg = 0; seg + 3 < ext.size(); ++seg)
             for (int i = 0; i <= 200; ++i)
-                worst = std::max(worst, DistanceToPolyline(BSplineAt(ext, w, seg, i / 200.0), s));
+                worst = std::max(worst, DistanceToPolyline(BSplineAt(ext, seg, i / 200.0), s));
         EXPECT_LE(worst, kTol * (1 + 1e-9));
         // Segment joints are on the polyline exactly (they are chord ends).
         for (size_t seg = 0; seg + 3 < ext.size(); ++seg)
-            EXPECT_LE(DistanceToPolyline(BSplineAt(ext, w, seg, 0), s), 1e-12);
+            EXPECT_LE(DistanceToPolyline(BSplineAt(ext, seg, 0), s), 1e-12);
         const auto &pts = s.SubPaths().at(0).points;
         if (!c.closed) {
             EXPECT_NEAR(pts.front().x, p.front().x, 1e-12);
@@ -149,6 +160,52 @@ TEST(Shape, BSplinesFollowTheirBasisFunctions) {
             plain.FlatBSplineTo(p.data(), n, true, {{ShapeTolerance, kTol}});
             EXPECT_LT(DistanceToPolyline(p[0], s), DistanceToPolyline(p[0], plain) - 0.05);
         }
+    }
+}
+
+TEST(Shape, BSplinesDrawTheCurvesPolyLinesMeasure) {
+    // One rule for both: the chords FlatBSplineTo / FlatTBSplineTo give lie on the curve BSplinePolyLine evaluates,
+    // and the line's evenly spaced samples lie on the chords, open and closed, plain and weighted, with 2 to 6 points.
+    struct Case {
+        std::vector<ShapePoint> pts;
+        std::vector<double> weights; // empty: plain
+        bool closed;
+    } cases[] = {
+        {{{0.1, 0.1}, {0.9, 0.3}}, {}, false},
+        {{{0.1, 0.1}, {0.4, 0.8}, {0.9, 0.2}}, {}, false},
+        {{{0.1, 0.1}, {0.4, 0.8}, {0.9, 0.2}}, {}, true},
+        {{{0, 0}, {0.2, 0.5}, {0.5, -0.3}, {0.7, 0.4}, {1, 0}}, {1, 3, 0.5, 2, 1}, false},
+        {{{0, 0}, {0.2, 0.5}, {0.5, -0.3}, {0.7, 0.4}, {1, 0}, {0.5, 0.9}}, {2, 1, 1, 0.5, 1, 3}, true},
+    };
+    constexpr double kTol = 1e-5;
+    for (const Case &c : cases) {
+        const int n = int(c.pts.size());
+        SCOPED_TRACE(std::to_string(n) + (c.closed ? " closed" : " open") + (c.weights.empty() ? "" : " weighted"));
+        BSplinePolyLine line({}, c.closed);
+        for (int i = 0; i < n; ++i) {
+            PolyPoint p;
+            p.x = c.pts[size_t(i)].x, p.y = c.pts[size_t(i)].y;
+            if (!c.weights.empty()) p.weight = c.weights[size_t(i)];
+            line.points.push_back(p);
+        }
+        Shape s;
+        if (c.weights.empty())
+            s.FlatBSplineTo(c.pts.data(), n, c.closed, {{ShapeTolerance, kTol}});
+        else
+            s.FlatTBSplineTo(c.pts.data(), c.weights.data(), n, c.closed, {{ShapeTolerance, kTol}});
+        // Chord ends against the line's own segments: each vertex is on the curve, so near some evaluated point.
+        Shape dense;
+        for (int seg = 0; seg < line.SegmentCount(); ++seg)
+            for (int k = 0; k <= 2000; ++k) {
+                const PolySample q = *line.PointAt(seg, k / 2000.0);
+                seg || k ? dense.LineTo(q.x, q.y) : dense.MoveTo(q.x, q.y);
+            }
+        for (const Shape::Vertex &v : s.SubPaths().at(0).points) EXPECT_LE(DistanceToPolyline({v.x, v.y}, dense), 1e-6);
+        std::vector<PolySample> samples(401);
+        ASSERT_EQ(line.GetSamplePoints(401, 1.0, samples.data(), nullptr, 0), 401);
+        for (const PolySample &q : samples) EXPECT_LE(DistanceToPolyline({q.x, q.y}, s), kTol * (1 + 1e-9));
+        EXPECT_NEAR(samples.front().x, s.SubPaths()[0].points.front().x, 1e-12);
+        EXPECT_NEAR(samples.back().y, s.SubPaths()[0].points.back().y, 1e-12);
     }
 }
 

@@ -11,6 +11,7 @@
 #include "host/core/Tags.h"
 #include "host/flow/OrvaneDoc.h"
 #include "host/image/Image.h"
+#include "tests/operators/mask/MaskRig.h"
 #include "tests/support/TestSupport.h"
 
 namespace Orvane::PrimitiveMaskTest {
@@ -18,33 +19,12 @@ namespace {
 namespace ts = ::Orvane::Test;
 using std::numbers::pi;
 
-constexpr int W = 256, H = 192;
+constexpr int W = ts::MaskRig::W, H = ts::MaskRig::H;
 constexpr double kAspect = double(H) / W;
 
-struct Rig {
-    Ref<OrvaneDoc> doc = MakeRef<OrvaneDoc>();
-    Operator *mask = nullptr;
-    explicit Rig(const char *cls) {
-        ts::LoadOperators();
-        doc->SetPref(PREF_FFWidth, W);
-        doc->SetPref(PREF_FFHeight, H);
-        mask = doc->AddTool(OvID(cls));
-        EXPECT_TRUE(mask) << cls;
-    }
-    Ref<Image> Render() const {
-        EvalOptions opt;
-        opt.useCache = false;
-        return ts::EvalImage(mask, 0.0, opt);
-    }
-};
+using Rig = ts::MaskRig;
 
-/// The covered area in pixels over the frame (the canvas counts beyond the data window).
-double Area(const Image &m) {
-    double sum = 0;
-    for (int y = 0; y < H; ++y)
-        for (int x = 0; x < W; ++x) sum += m.GetFlt(x, y).A;
-    return sum;
-}
+double Area(const Image &m) { return ts::MaskRig::Area(m); }
 
 /// The area of a rectangle of w x h pixels whose corners are quarter circles of radius r drawn as n chords each.
 double RoundedRectArea(double w, double h, double r, int n) {

@@ -1,0 +1,74 @@
+// The polygon masks at UHD, one-channel float, through the engine with the
+// cache off (the mask's own size controls set to 3840x2160):
+//   Poly200       a hard closed Bezier line of 200 smooth points, a wavy ring
+//                 0.3 of the width across its radius
+//   Poly200Band   the same with an outer line 0.05 of the width further out:
+//                 the inner fill and the soft band between the two (8 samples
+//                 a pixel side, written directly)
+//   Poly200BandHollow  the band of a hollow line (32 samples, band images)
+// Compare with BM_CopyFloorAFlt32 (CopyBench.cpp), the floor a hard fill is
+// held to (3x), and with BM_MaskBlurFastGaussian (PrimitiveMaskBench.cpp), the
+// blur of a soft edge of the same size, which the band is held to.
+#include <cmath>
+#include <numbers>
+
+#include "bench/BenchSupport.h"
+#include "host/flow/Engine.h"
+#include "host/image/Image.h"
+#include "host/shape/PolyLine.h"
+
+namespace Orvane::Bench {
+namespace {
+
+/// A closed smooth line of `n` points about the middle, radius `r` (widths)
+/// with a wave of 1/10 of it, handles along the tangent.
+Ref<PolyLine> WavyRing(int n, double r) {
+    auto line = MakeRef<PolyLine>();
+    line->closed = true;
+    const double aspect = double(kHeight) / kWidth;
+    for (int i = 0; i < n; ++i) {
+        const double a = 2 * std::numbers::pi * i / n, rad = r * (1 + 0.1 * std::sin(7 * a));
+        const double step = 2 * std::numbers::pi * rad / n / 3; // a third of the chord, along the tangent
+        PolyPoint p;
+        p.x = rad * std::cos(a), p.y = rad * std::sin(a) / aspect; // Y in heights
+        p.rightX = -step * std::sin(a), p.rightY = step * std::cos(a) / aspect;
+        p.leftX = -p.rightX, p.leftY = -p.rightY;
+        line->points.push_back(p);
+    }
+    return line;
+}
+
+void RunPolyMask(benchmark::State &state, bool band, bool hollow) {
+    if (!LoadLibrary(state)) return;
+    OrvaneDoc doc;
+    Operator *mask = doc.AddTool(OvID("PolylineMask"));
+    if (!mask) return state.SkipWithError("the PolylineMask class is not registered");
+    mask->FindInput("MaskWidth")->SetValue(MakeRef<Number>(kWidth));
+    mask->FindInput("MaskHeight")->SetValue(MakeRef<Number>(kHeight));
+    mask->FindInput("Polyline")->SetValue(WavyRing(200, 0.3));
+    if (band) mask->FindInput("Polyline2")->SetValue(WavyRing(200, 0.35));
+    if (hollow) mask->FindInput("Solid")->SetValue(MakeRef<Number>(0));
+    EvalOptions options;
+    options.useCache = false;
+    for (auto _ : state) benchmark::DoNotOptimize(Evaluate(mask->FindMainOutput(), 0.0, options).Get());
+    ReportPixels(state);
+    // What was drawn: the mask's window, its value inside the inner line and half way out to the outer one.
+    const Ref<Parameter> last = Evaluate(mask->FindMainOutput(), 0.0, options);
+    if (const auto *img = dynamic_cast<const Image *>(last.Get())) {
+        state.counters["window"] = double(img->DataWindow().Width()) * img->DataWindow().Height();
+        state.counters["inside"] = img->GetFlt(int(kWidth * 0.7), kHeight / 2).A;
+        state.counters["band"] = img->GetFlt(int(kWidth * (0.5 + 0.325)), kHeight / 2).A;
+    }
+}
+
+void BM_Mask_Poly200(benchmark::State &state) { RunPolyMask(state, false, false); }
+BENCHMARK(BM_Mask_Poly200)->UseRealTime()->Unit(benchmark::kMillisecond);
+
+void BM_Mask_Poly200Band(benchmark::State &state) { RunPolyMask(state, true, false); }
+BENCHMARK(BM_Mask_Poly200Band)->UseRealTime()->Unit(benchmark::kMillisecond);
+
+void BM_Mask_Poly200BandHollow(benchmark::State &state) { RunPolyMask(state, true, true); }
+BENCHMARK(BM_Mask_Poly200BandHollow)->UseRealTime()->Unit(benchmark::kMillisecond);
+
+} // namespace
+} // namespace Orvane::Bench
