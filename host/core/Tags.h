@@ -373,7 +373,7 @@ constexpr Tag ShapeJoin = 0x100b0000;       ///< ShapeJoinKind: 0 bevel, 1 miter
 constexpr Tag ShapeCap = 0x100b0001;        ///< ShapeCapKind: 0 flat, 1 square, 2 round
 constexpr Tag ShapeWriteStart = 0x200b0000; ///< write-on: fraction of the path length where the stroke starts
 constexpr Tag ShapeWriteEnd = 0x200b0001;   ///< write-on: fraction where it ends
-constexpr Tag ShapeTolerance = 0x200b0002;  ///< the largest distance of a chord from its curve
+constexpr Tag ShapeTolerance = 0x200b0002;  ///< the longest step of a flattened curve or arc
 constexpr Tag ShapeMiterLimit = 0x200b0003; ///< miter length over stroke width before a miter is cut
 
 // ---- Masks (host/flow/MaskOperator.h) ------------------------------------

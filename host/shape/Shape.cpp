@@ -26,19 +26,25 @@ double DistanceToSegment(const ShapePoint &p, const ShapePoint &a, const ShapePo
     const double dx = b.x - a.x, dy = b.y - a.y, len2 = dx * dx + dy * dy;
     double t = len2 > 0.0 ? ((p.x - a.x) * dx + (p.y - a.y) * dy) / len2 : 0.0;
     t = std::clamp(t, 0.0, 1.0);
-    return std::hypot(p.x - (a.x + t * dx), p.y - (a.y + t * dy));
+    const double ex = p.x - (a.x + t * dx), ey = p.y - (a.y + t * dy);
+    return std::sqrt(ex * ex + ey * ey); // lengths here are far from overflow; hypot costs several times more
 }
 
-/// Appends the chords of a rational cubic (c[0] excluded, c[3] included).
-/// With positive weights the curve lies in the hull of its projected control
-/// points, so when both inner ones are within `tol` of the chord, so is the
-/// whole piece of curve, and (as it runs from one end of the chord to the
-/// other) every point of the chord is within `tol` of the curve.
-void FlattenRationalCubic(const HomPoint c[4], double tol, int depth, std::vector<Shape::Vertex> &out) {
-    const ShapePoint p0 = c[0].Projected(), p3 = c[3].Projected();
-    const double err =
-        std::max(DistanceToSegment(c[1].Projected(), p0, p3), DistanceToSegment(c[2].Projected(), p0, p3));
-    if (err <= tol || depth >= kMaxSubdivision || !std::isfinite(err)) {
+/// Appends the chords of a rational cubic (c[0] excluded, c[3] included),
+/// each at most `step` long and within step / 16 of its curve. With positive
+/// weights the curve lies in the hull of its projected control points, so
+/// when both inner ones are within step / 16 of the chord, so is the whole
+/// piece of curve, and (as it runs from one end of the chord to the other)
+/// every point of the chord is within step / 16 of the curve; the control
+/// polygon's length bounds the chord's.
+void FlattenRationalCubic(const HomPoint c[4], double step, int depth, std::vector<Shape::Vertex> &out) {
+    const ShapePoint p0 = c[0].Projected(), p1 = c[1].Projected(), p2 = c[2].Projected(), p3 = c[3].Projected();
+    const double err = std::max(DistanceToSegment(p1, p0, p3), DistanceToSegment(p2, p0, p3));
+    auto dist = [](const ShapePoint &a, const ShapePoint &b) {
+        return std::sqrt((b.x - a.x) * (b.x - a.x) + (b.y - a.y) * (b.y - a.y));
+    };
+    const double length = dist(p0, p1) + dist(p1, p2) + dist(p2, p3);
+    if ((err <= step / 16 && length <= step) || depth >= kMaxSubdivision || !std::isfinite(err + length)) {
         out.push_back({p3.x, p3.y, false});
         return;
     }
@@ -46,8 +52,8 @@ void FlattenRationalCubic(const HomPoint c[4], double tol, int depth, std::vecto
     const HomPoint m01 = (c[0] + c[1]) * 0.5, m12 = (c[1] + c[2]) * 0.5, m23 = (c[2] + c[3]) * 0.5;
     const HomPoint m012 = (m01 + m12) * 0.5, m123 = (m12 + m23) * 0.5, mid = (m012 + m123) * 0.5;
     const HomPoint left[4] = {c[0], m01, m012, mid}, right[4] = {mid, m123, m23, c[3]};
-    FlattenRationalCubic(left, tol, depth + 1, out);
-    FlattenRationalCubic(right, tol, depth + 1, out);
+    FlattenRationalCubic(left, step, depth + 1, out);
+    FlattenRationalCubic(right, step, depth + 1, out);
 }
 
 double ToleranceOf(const TagList &tags) {

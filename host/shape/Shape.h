@@ -36,7 +36,7 @@ struct ShapeBox {
 enum ShapeJoinKind : int { ShapeJoinBevel = 0, ShapeJoinMiter = 1, ShapeJoinRound = 2, ShapeJoinMiterClip = 3 };
 enum ShapeCapKind : int { ShapeCapFlat = 0, ShapeCapSquare = 1, ShapeCapRound = 2 };
 
-/// Flattening tolerance when a tag list gives none.
+/// Flattening tolerance (the longest step) when a tag list gives none.
 constexpr double ShapeDefaultTolerance = 1.0 / 4096.0;
 /// Miter limit (miter length over stroke width) when a tag list gives none.
 constexpr double ShapeDefaultMiterLimit = 4.0;
@@ -92,7 +92,7 @@ public:
     const std::vector<SubPath> &SubPaths() const { return paths_; }
 
     // ---- new shapes ----
-    /// Curves replaced by chords, none further than ShapeTolerance from its
+    /// Curves replaced by chords of at most ShapeTolerance, none further than a sixteenth of it from its
     /// curve (adaptive subdivision). A flat shape comes back as a copy.
     Ref<Shape> FlattenOfShapeTagList(const TagList &tags) const;
     /// The stroke: a band of total width |width| centred on the path, with

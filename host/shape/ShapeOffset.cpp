@@ -80,11 +80,13 @@ class OffsetLoopBuilder {
 public:
     OffsetLoopBuilder(const OffsetStyle &style, double distance)
         : style_(style), d_(distance), side_(distance < 0.0 ? -1.0 : 1.0) {
-        // Chords of arcs keep within the tolerance of the circle, as curves do,
-        // but no coarser than a quarter of the radius and no finer than a unit.
+        // Chords of arcs as of curves: at most the tolerance long and within a
+        // sixteenth of it of the circle, but no coarser than a quarter of the
+        // radius away and no finer than a unit.
         const double r = std::abs(distance);
-        const double tol = std::clamp(style.tolerance, std::min(0.25, r * 0.25), std::max(r * 0.25, 0.25));
-        arcStep_ = r > 0.0 ? 2.0 * std::acos(1.0 - tol / r) : std::numbers::pi;
+        const double dev = std::clamp(style.tolerance / 16, std::min(0.25, r * 0.25), std::max(r * 0.25, 0.25));
+        arcStep_ =
+            r > 0.0 ? std::min(2.0 * std::acos(1.0 - dev / r), std::max(style.tolerance / r, 1e-3)) : std::numbers::pi;
     }
 
     /// The side of `pts` at the builder's distance, with joins at inner

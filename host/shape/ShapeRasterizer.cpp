@@ -6,8 +6,10 @@
 
 #include <algorithm>
 #include <atomic>
+#include <cmath>
 #include <cstdlib>
 #include <new>
+#include <utility>
 #include <vector>
 
 #include <agg_rasterizer_cells_aa.h>
@@ -39,9 +41,32 @@ using Cells = agg::rasterizer_cells_aa<agg::cell_aa>;
 
 /// The flattened shape in pixel coordinates; sub-path k is points
 /// [starts[k], starts[k + 1]).
+/// Segments are looked at in runs of this many: a band skips a run that lies
+/// wholly above or below it.
+constexpr size_t kRun = 32;
+
 struct PixelPath {
     std::vector<double> xy;
     std::vector<size_t> starts;
+    /// The lowest and highest y of each run of kRun segments of each sub-path
+    /// (the closing segment counted with the last run), in order.
+    std::vector<std::pair<double, double>> runs;
+
+    /// Finds the runs' extents once the points are in.
+    void MeasureRuns() {
+        runs.clear();
+        for (size_t k = 0; k + 1 < starts.size(); ++k) {
+            const size_t first = starts[k], count = starts[k + 1] - first;
+            for (size_t i = 0; i < count; i += kRun) {
+                double lo = HUGE_VAL, hi = -HUGE_VAL;
+                for (size_t j = i; j <= std::min(i + kRun, count); ++j) {
+                    const double y = xy[2 * (first + j % count) + 1];
+                    lo = std::min(lo, y), hi = std::max(hi, y);
+                }
+                runs.emplace_back(lo, hi);
+            }
+        }
+    }
 };
 
 class CoverageRule {
@@ -98,7 +123,7 @@ PixelPath PixelPathOf(const Shape &shape, double xScale, double yScale) {
     Ref<Shape> flat;
     const Shape *src = &shape;
     if (!shape.IsFlat()) {
-        flat = shape.FlattenOfShapeTagList({{ShapeTolerance, (1.0 / 32) / std::max(xScale, yScale)}});
+        flat = shape.FlattenOfShapeTagList({{ShapeTolerance, 1.0 / std::max(xScale, yScale)}}); // 1-pixel steps
         src = flat.Get();
     }
     PixelPath path;
@@ -112,6 +137,7 @@ PixelPath PixelPathOf(const Shape &shape, double xScale, double yScale) {
         }
     }
     path.starts.push_back(path.xy.size() / 2);
+    path.MeasureRuns();
     return path;
 }
 
@@ -119,12 +145,21 @@ PixelPath PixelPathOf(const Shape &shape, double xScale, double yScale) {
 void AddEdges(const PixelPath &path, const ImgRectI &box, Cells &cells) {
     agg::rasterizer_sl_clip_dbl clip;
     clip.clip_box(box.x0, box.y0, box.x1, box.y1);
+    const std::pair<double, double> *run = path.runs.data();
     for (size_t k = 0; k + 1 < path.starts.size(); ++k) {
         const double *p = path.xy.data() + 2 * path.starts[k];
         const size_t count = path.starts[k + 1] - path.starts[k];
         clip.move_to(p[0], p[1]);
-        for (size_t i = 1; i < count; ++i) clip.line_to(cells, p[2 * i], p[2 * i + 1]);
-        clip.line_to(cells, p[0], p[1]);
+        for (size_t i = 0; i < count; i += kRun, ++run) {
+            const size_t end =
+                std::min(i + kRun, count); // segments i -> i + 1 .. end - 1 -> end (end = count: back to 0)
+            if (run->second < box.y0 || run->first > box.y1) {
+                // Wholly above or below the band: its clipped edges add nothing; only the pen moves.
+                clip.move_to(p[2 * (end % count)], p[2 * (end % count) + 1]);
+                continue;
+            }
+            for (size_t j = i + 1; j <= end; ++j) clip.line_to(cells, p[2 * (j % count)], p[2 * (j % count) + 1]);
+        }
     }
     cells.sort_cells();
 }

@@ -70,10 +70,11 @@ double Perimeter(const std::vector<Px> &p, bool closed) {
     return sum;
 }
 
-/// The area a round end of radius r loses at most to its chords, each no further than min(2, r / 4) pixels (the
-/// stroke's tolerance of 2 / W, no coarser than a quarter of the radius) from the arc: a circle of such chords.
+/// The area a round end of radius r loses at most to its chords, each no further than min(1/8, r / 4) pixels (a
+/// sixteenth of the stroke's steps of 2 / W, no coarser than a quarter of the radius) from the arc: a circle of
+/// such chords.
 double RoundLoss(double r) {
-    const double s = std::min(2.0, r / 4);
+    const double s = std::min(0.125, r / 4);
     const int n = static_cast<int>(std::ceil(pi / std::acos(1 - s / r)));
     return pi * r * r - n / 2.0 * r * r * std::sin(2 * pi / n);
 }
@@ -162,8 +163,9 @@ TEST(PolyMask, DataWindowHoldsTheShapeAndItsOuterLine) {
 
 TEST(PolyMask, BSplineCoversTheAreaOfItsLinesSamples) {
     // The mask of a B-spline line against the shoelace of the line's own evenly spaced samples (open lines stroked,
-    // so their ends, where the two ways of ending a spline differ, count). Chords stay within the tolerance of 2
-    // pixels of the curve, so the area may differ by the outline's length times 2/3 of that.
+    // so their ends, where the two ways of ending a spline differ, count). Chords of at most 2 pixels stay within
+    // 1/8 pixel of the curve, so the area may differ by the outline's length times 2/3 of that, and by the outline
+    // over 512 for the vertex grid.
     const std::vector<Px> ring = {{60, 40}, {200, 50}, {220, 150}, {128, 120}, {40, 160}};
     for (const bool weighted : {false, true}) {
         SCOPED_TRACE(weighted ? "weighted" : "plain");
@@ -182,7 +184,7 @@ TEST(PolyMask, BSplineCoversTheAreaOfItsLinesSamples) {
             if (px.size() > 1)
                 perimeter += std::hypot(px.back().x - px[px.size() - 2].x, px.back().y - px[px.size() - 2].y);
         }
-        EXPECT_NEAR(Area(*m), Shoelace(px), perimeter * 2 * 2 / 3);
+        EXPECT_NEAR(Area(*m), Shoelace(px), perimeter * (0.125 * 2 / 3 + 1.0 / 512));
     }
     // Open: a stroke 0.02 wide along a curve through its two end points.
     Ref<BSplinePolyLine> open = LineThrough<BSplinePolyLine>({{40, 40}, {90, 160}, {160, 30}, {220, 150}}, false);
