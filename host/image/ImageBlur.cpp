@@ -102,9 +102,14 @@ struct Settings {
         return blend == 1.f;
     }
 
+    /// Channel c's result from its source value and its blurred value.
+    float MixChannel(int c, float base, float blurred) const {
+        return on[c] ? base + (blurred * scale[c] - base) * blend : base;
+    }
+
     /// A pixel's result from its source value and its blurred value.
     void Mix(const float *base, const float *blurred, float *out) const {
-        for (int c = 0; c < 4; ++c) out[c] = on[c] ? base[c] + (blurred[c] * scale[c] - base[c]) * blend : base[c];
+        for (int c = 0; c < 4; ++c) out[c] = MixChannel(c, base[c], blurred[c]);
     }
 };
 
@@ -327,8 +332,32 @@ void InputRange(const BlurAxis &axis, int lo, int hi, int srcLo, int srcHi, int 
 
 /// Per-strip scratch memory.
 struct Scratch {
-    AlignedFloats in, out, work[2];
+    AlignedFloats in, out, work[2], values;
 };
+
+/// Columns of one-channel rows converted and interleaved at a time: the
+/// strip's rows of a chunk stay in the first-level cache.
+constexpr int kChunk = 128;
+
+/// strip[i * kLanes + r] = rows[r][i] for i in [0, n), r in [0, kLanes): one
+/// value of each of 32 lines per sample, in blocks of eight samples so that
+/// reads and writes stay within a few cache lines.
+void Interleave(const float *const *rows, int n, float *strip) {
+    for (int i0 = 0; i0 < n; i0 += 8) {
+        const int i1 = std::min(n, i0 + 8);
+        for (int r = 0; r < kLanes; ++r)
+            for (int i = i0; i < i1; ++i) strip[static_cast<size_t>(i) * kLanes + r] = rows[r][i];
+    }
+}
+
+/// The reverse for the first `count` lanes: rows[r][i] = strip[i * kLanes + r].
+void Deinterleave(const float *strip, int n, float *const *rows, int count) {
+    for (int i0 = 0; i0 < n; i0 += 8) {
+        const int i1 = std::min(n, i0 + 8);
+        for (int r = 0; r < count; ++r)
+            for (int i = i0; i < i1; ++i) rows[r][i] = strip[static_cast<size_t>(i) * kLanes + r];
+    }
+}
 
 /// Runs an axis along a strip: `in` holds samples [inLo, inLo + nIn) as
 /// InputRange asked; `out` receives samples [lo, lo + nOut).
@@ -372,27 +401,38 @@ public:
     bool Run(const BlurAxis &ax, const BlurAxis &ay, const ImgRectI &have) {
         out_ = dst_.DataWindow();
         have_ = have;
+        // Mask to mask: only the value (alpha) reaches the output, so the
+        // strips carry one channel of 32 lines.
+        mask_ = src_.IsMask() && dst_.IsMask();
+        channels_ = mask_ ? 1 : 4;
+        lines_ = kLanes / channels_;
         const FltPixel c = src_.GetCanvasColor();
         for (int l = 0; l < kLanes; l += 4)
             canvas_[l] = c.R, canvas_[l + 1] = c.G, canvas_[l + 2] = c.B, canvas_[l + 3] = c.A;
+        if (mask_) std::fill(canvas_, canvas_ + kLanes, c.A);
         // Rows of the buffer: those the second pass reads that hold pixels.
         int needLo, needHi;
         InputRange(ay, out_.y0, out_.y1, have_.y0, have_.y1, needLo, needHi);
         ty0_ = std::max(needLo, have_.y0), ty1_ = std::min(needHi, have_.y1);
         if (have_.IsNull() || ty1_ < ty0_) ty0_ = ty1_ = 0;
         const int width = out_.Width();
-        if (ty1_ > ty0_ && !across_.Alloc(static_cast<size_t>(ty1_ - ty0_) * width * 4)) return false;
-        // The second pass stores finished float pixels straight into the
-        // output when it can; otherwise its blurred values wait in `down_`.
-        direct_ = dst_.Depth() == DepthRGBAFlt32 &&
-                  (set_.PlainResult() || (src_.Depth() == DepthRGBAFlt32 && src_.HasScanLineData()));
+        if (ty1_ > ty0_ && !across_.Alloc(static_cast<size_t>(ty1_ - ty0_) * width * channels_)) return false;
+        // The second pass stores finished pixels straight into the output
+        // when it can (masks always); otherwise its blurred values wait in `down_`.
+        direct_ = mask_ || (dst_.Depth() == DepthRGBAFlt32 &&
+                            (set_.PlainResult() || (src_.Depth() == DepthRGBAFlt32 && src_.HasScanLineData())));
         if (!direct_ && !down_.Alloc(static_cast<size_t>(out_.Height()) * width * 4)) return false;
 
-        const int rowStrips = (ty1_ - ty0_ + kStrip - 1) / kStrip;
-        Parallel(rowStrips, [&](int i) { AcrossStrip(ax, ty0_ + i * kStrip); });
+        const int rowStrips = (ty1_ - ty0_ + lines_ - 1) / lines_;
+        Parallel(rowStrips, [&](int i) {
+            if (mask_)
+                AcrossMaskStrip(ax, ty0_ + i * lines_);
+            else
+                AcrossStrip(ax, ty0_ + i * lines_);
+        });
         if (Stopped()) return false;
-        const int colStrips = (width + kStrip - 1) / kStrip;
-        Parallel(colStrips, [&](int i) { DownStrip(ay, out_.x0 + i * kStrip); });
+        const int colStrips = (width + lines_ - 1) / lines_;
+        Parallel(colStrips, [&](int i) { DownStrip(ay, out_.x0 + i * lines_); });
         if (Stopped()) return false;
         if (!direct_) {
             ParallelRows([&](int y0, int y1) { FinishRows(y0, y1); });
@@ -437,7 +477,7 @@ private:
             range(out_.y0, out_.y1);
     }
 
-    float *AcrossRow(int y) const { return across_.data + static_cast<size_t>(y - ty0_) * out_.Width() * 4; }
+    float *AcrossRow(int y) const { return across_.data + static_cast<size_t>(y - ty0_) * out_.Width() * channels_; }
     float *DownRow(int y) const { return down_.data + static_cast<size_t>(y - out_.y0) * out_.Width() * 4; }
 
     /// Up to eight rows from y0 blurred across into the buffer.
@@ -473,26 +513,70 @@ private:
         }
     }
 
+    /// Up to 32 rows of a mask from y0 blurred across into the buffer: one
+    /// lane per row, each row read at its depth once.
+    void AcrossMaskStrip(const BlurAxis &ax, int y0) {
+        Scratch &s = scratch();
+        int inLo, inHi;
+        InputRange(ax, out_.x0, out_.x1, have_.x0, have_.x1, inLo, inHi);
+        const int nIn = inHi - inLo, width = out_.Width();
+        float *in = s.in.Get(static_cast<size_t>(nIn) * kLanes);
+        float *out = s.out.Get(static_cast<size_t>(width) * kLanes);
+        // Pixels where the rows hold them; canvas elsewhere, and in lanes past the last row.
+        const int a = std::max(inLo, have_.x0), b = std::min(inHi, have_.x1);
+        for (int i = 0; i < nIn; ++i)
+            if (i + inLo < a || i + inLo >= b)
+                std::memcpy(in + static_cast<size_t>(i) * kLanes, canvas_, sizeof canvas_);
+        float *values = s.values.Get(static_cast<size_t>(kLanes + 1) * kChunk);
+        float *canvasRow = values + static_cast<size_t>(kLanes) * kChunk;
+        std::fill(canvasRow, canvasRow + kChunk, canvas_[0]);
+        const bool floats = src_.Depth() == DepthAFlt32;
+        const float *rows[kLanes];
+        for (int x = a; x < b; x += kChunk) {
+            const int n = std::min(kChunk, b - x);
+            for (int r = 0; r < kLanes; ++r) {
+                const int y = y0 + r;
+                const uint8_t *p = y < ty1_ ? src_.PixelAddress(x, y) : nullptr;
+                if (!p) {
+                    rows[r] = canvasRow;
+                } else if (floats) {
+                    rows[r] = reinterpret_cast<const float *>(p);
+                } else {
+                    float *v = values + static_cast<size_t>(r) * kChunk;
+                    LoadMaskFlt(src_.Depth(), p, n, v);
+                    rows[r] = v;
+                }
+            }
+            Interleave(rows, n, in + static_cast<size_t>(x - inLo) * kLanes);
+        }
+        RunAxis(ax, in, inLo, nIn, out, out_.x0, width, canvas_, s);
+        float *dst[kLanes];
+        const int count = std::min(kLanes, ty1_ - y0);
+        for (int r = 0; r < count; ++r) dst[r] = AcrossRow(y0 + r);
+        Deinterleave(out, width, dst, count);
+    }
+
     /// Up to eight columns from x0 blurred down and finished.
     void DownStrip(const BlurAxis &ay, int x0) {
         Scratch &s = scratch();
         int inLo, inHi;
         InputRange(ay, out_.y0, out_.y1, ty0_, ty1_, inLo, inHi);
         const int nIn = inHi - inLo, height = out_.Height();
-        const int cols = std::min(kStrip, out_.x1 - x0);
+        const int cols = std::min(lines_, out_.x1 - x0), used = cols * channels_;
         float *in = s.in.Get(static_cast<size_t>(nIn) * kLanes);
         float *out = s.out.Get(static_cast<size_t>(height) * kLanes);
         for (int i = 0; i < nIn; ++i) {
             const int y = inLo + i;
             float *q = in + static_cast<size_t>(i) * kLanes;
             if (y >= ty0_ && y < ty1_) {
-                std::memcpy(q, AcrossRow(y) + 4 * (x0 - out_.x0), static_cast<size_t>(cols) * 4 * sizeof(float));
-                std::memcpy(q + 4 * cols, canvas_, static_cast<size_t>(kStrip - cols) * 4 * sizeof(float));
+                std::memcpy(q, AcrossRow(y) + channels_ * (x0 - out_.x0), static_cast<size_t>(used) * sizeof(float));
+                std::memcpy(q + used, canvas_, static_cast<size_t>(kLanes - used) * sizeof(float));
             } else {
                 std::memcpy(q, canvas_, kLanes * sizeof(float));
             }
         }
         RunAxis(ay, in, inLo, nIn, out, out_.y0, height, canvas_, s);
+        if (mask_) return FinishMaskColumns(out, x0, cols);
         const size_t bytes = static_cast<size_t>(cols) * 4 * sizeof(float);
         if (!direct_) {
             for (int y = out_.y0; y < out_.y1; ++y)
@@ -517,6 +601,30 @@ private:
                 set_.Mix(base, blurred + 4 * i, mixed);
                 std::memcpy(dst + 4 * i, mixed, sizeof mixed);
             }
+        }
+    }
+
+    /// Up to 32 columns of a mask from x0: `out` holds their blurred values,
+    /// one lane per column; each row's piece is mixed with the source (read
+    /// just before it is overwritten, for blurs in place) and stored at the
+    /// output's depth.
+    void FinishMaskColumns(const float *out, int x0, int cols) {
+        const bool plain = set_.PlainResult();
+        const ImgRectI sw = src_.DataWindow();
+        const int a = std::max(x0, sw.x0), b = std::min(x0 + cols, sw.x1);
+        float base[kLanes], mixed[kLanes];
+        for (int y = out_.y0; y < out_.y1; ++y) {
+            const float *blurred = out + static_cast<size_t>(y - out_.y0) * kLanes;
+            uint8_t *dst = dst_.PixelAddress(x0, y);
+            if (plain) {
+                StoreMaskFlt(dst_.Depth(), blurred, cols, dst);
+                continue;
+            }
+            std::fill(base, base + cols, canvas_[0]);
+            const uint8_t *p = a < b && y >= sw.y0 && y < sw.y1 ? src_.PixelAddress(a, y) : nullptr;
+            if (p) LoadMaskFlt(src_.Depth(), p, b - a, base + (a - x0));
+            for (int i = 0; i < cols; ++i) mixed[i] = set_.MixChannel(3, base[i], blurred[i]);
+            StoreMaskFlt(dst_.Depth(), mixed, cols, dst);
         }
     }
 
@@ -548,7 +656,9 @@ private:
     std::atomic<bool> failed_{false};
     ImgRectI out_, have_;
     int ty0_ = 0, ty1_ = 0;
-    bool direct_ = false;
+    bool direct_ = false, mask_ = false;
+    int channels_ = 4;   ///< floats per pixel in the buffers: 1 for masks
+    int lines_ = kStrip; ///< rows (or columns) in a strip: kLanes / channels_
     alignas(32) float canvas_[kLanes];
     PixelFloats across_, down_;
     static thread_local std::vector<FltPixel> row_;

@@ -159,6 +159,27 @@ void StoreFlt(int depth, const FltPixel *src, int count, uint8_t *dst) {
     });
 }
 
+namespace {
+/// Bytes of one component, at compile time.
+constexpr int ComponentBytes(ComponentType t) {
+    return t == ComponentType::Int8 ? 1 : t == ComponentType::Flt32 ? 4 : 2;
+}
+} // namespace
+
+void LoadMaskFlt(int depth, const uint8_t *src, int count, float *dst) {
+    WithType(FormatOfDepth(depth).type, [&](auto t) {
+        constexpr ComponentType type = decltype(t)::value;
+        for (int i = 0; i < count; ++i) dst[i] = ComponentToFloat(type, src + i * ComponentBytes(type));
+    });
+}
+
+void StoreMaskFlt(int depth, const float *src, int count, uint8_t *dst) {
+    WithType(FormatOfDepth(depth).type, [&](auto t) {
+        constexpr ComponentType type = decltype(t)::value;
+        for (int i = 0; i < count; ++i) FloatToComponent(type, src[i], dst + i * ComponentBytes(type));
+    });
+}
+
 void LoadPixel(int depth, const uint8_t *src, int count, Pixel *dst) {
     const PixelFormat f = FormatOfDepth(depth);
     WithType(f.type, [&](auto t) {

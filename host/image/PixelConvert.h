@@ -17,6 +17,10 @@ ORVANE_API void LoadFlt(int depth, const uint8_t *src, int count, FltPixel *dst)
 ORVANE_API void StoreFlt(int depth, const FltPixel *src, int count, uint8_t *dst);
 ORVANE_API void LoadPixel(int depth, const uint8_t *src, int count, Pixel *dst);
 ORVANE_API void StorePixel(int depth, const Pixel *src, int count, uint8_t *dst);
+/// Single-channel depths only: one float per pixel, the value LoadFlt reads
+/// into each channel and StoreFlt writes from alpha.
+ORVANE_API void LoadMaskFlt(int depth, const uint8_t *src, int count, float *dst);
+ORVANE_API void StoreMaskFlt(int depth, const float *src, int count, uint8_t *dst);
 
 ORVANE_API Pixel FltToPixel(const FltPixel &f);
 ORVANE_API FltPixel PixelToFlt(const Pixel &p);
