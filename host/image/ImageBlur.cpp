@@ -339,24 +339,59 @@ struct Scratch {
 /// strip's rows of a chunk stay in the first-level cache.
 constexpr int kChunk = 128;
 
-/// strip[i * kLanes + r] = rows[r][i] for i in [0, n), r in [0, kLanes): one
-/// value of each of 32 lines per sample, in blocks of eight samples so that
-/// reads and writes stay within a few cache lines.
-void Interleave(const float *const *rows, int n, float *strip) {
-    for (int i0 = 0; i0 < n; i0 += 8) {
-        const int i1 = std::min(n, i0 + 8);
-        for (int r = 0; r < kLanes; ++r)
-            for (int i = i0; i < i1; ++i) strip[static_cast<size_t>(i) * kLanes + r] = rows[r][i];
+using V8Unaligned = float __attribute__((vector_size(32), aligned(4)));
+
+/// Transposes an 8 x 8 block in place: v[k][i] becomes v[i][k].
+__attribute__((always_inline)) inline void Transpose8(V8 (&v)[8]) {
+    V8 t[8], s[8];
+    for (int k = 0; k < 8; k += 2) {
+        t[k] = __builtin_shufflevector(v[k], v[k + 1], 0, 8, 1, 9, 4, 12, 5, 13);
+        t[k + 1] = __builtin_shufflevector(v[k], v[k + 1], 2, 10, 3, 11, 6, 14, 7, 15);
+    }
+    for (int k = 0; k < 8; k += 4)
+        for (int h = 0; h < 2; ++h) {
+            s[k + 2 * h] = __builtin_shufflevector(t[k + h], t[k + h + 2], 0, 1, 8, 9, 4, 5, 12, 13);
+            s[k + 2 * h + 1] = __builtin_shufflevector(t[k + h], t[k + h + 2], 2, 3, 10, 11, 6, 7, 14, 15);
+        }
+    for (int k = 0; k < 4; ++k) {
+        v[k] = __builtin_shufflevector(s[k], s[k + 4], 0, 1, 2, 3, 8, 9, 10, 11);
+        v[k + 4] = __builtin_shufflevector(s[k], s[k + 4], 4, 5, 6, 7, 12, 13, 14, 15);
     }
 }
 
+/// strip[i * kLanes + r] = rows[r][i] for i in [0, n), r in [0, kLanes): one
+/// value of each of 32 lines per sample, as 8 x 8 blocks. `strip` is 32-byte
+/// aligned.
+__attribute__((target_clones("arch=x86-64-v3", "default"))) void Interleave(const float *const *rows, int n,
+                                                                            float *strip) {
+    int i0 = 0;
+    for (; i0 + 8 <= n; i0 += 8)
+        for (int r0 = 0; r0 < kLanes; r0 += 8) {
+            V8 block[8];
+            for (int k = 0; k < 8; ++k) block[k] = *reinterpret_cast<const V8Unaligned *>(rows[r0 + k] + i0);
+            Transpose8(block);
+            for (int k = 0; k < 8; ++k)
+                *reinterpret_cast<V8 *>(strip + static_cast<size_t>(i0 + k) * kLanes + r0) = block[k];
+        }
+    for (int i = i0; i < n; ++i)
+        for (int r = 0; r < kLanes; ++r) strip[static_cast<size_t>(i) * kLanes + r] = rows[r][i];
+}
+
 /// The reverse for the first `count` lanes: rows[r][i] = strip[i * kLanes + r].
-void Deinterleave(const float *strip, int n, float *const *rows, int count) {
-    for (int i0 = 0; i0 < n; i0 += 8) {
-        const int i1 = std::min(n, i0 + 8);
-        for (int r = 0; r < count; ++r)
-            for (int i = i0; i < i1; ++i) rows[r][i] = strip[static_cast<size_t>(i) * kLanes + r];
-    }
+__attribute__((target_clones("arch=x86-64-v3", "default"))) void Deinterleave(const float *strip, int n,
+                                                                              float *const *rows, int count) {
+    const int whole = count / 8 * 8; // lanes moved as blocks
+    int i0 = 0;
+    for (; i0 + 8 <= n; i0 += 8)
+        for (int r0 = 0; r0 < whole; r0 += 8) {
+            V8 block[8];
+            for (int k = 0; k < 8; ++k)
+                block[k] = *reinterpret_cast<const V8 *>(strip + static_cast<size_t>(i0 + k) * kLanes + r0);
+            Transpose8(block);
+            for (int k = 0; k < 8; ++k) *reinterpret_cast<V8Unaligned *>(rows[r0 + k] + i0) = block[k];
+        }
+    for (int r = 0; r < count; ++r)
+        for (int i = r < whole ? i0 : 0; i < n; ++i) rows[r][i] = strip[static_cast<size_t>(i) * kLanes + r];
 }
 
 /// Runs an axis along a strip: `in` holds samples [inLo, inLo + nIn) as

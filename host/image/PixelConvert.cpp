@@ -167,6 +167,10 @@ constexpr int ComponentBytes(ComponentType t) {
 } // namespace
 
 void LoadMaskFlt(int depth, const uint8_t *src, int count, float *dst) {
+    if (depth == DepthAFlt32) {
+        std::memcpy(dst, src, sizeof(float) * count);
+        return;
+    }
     WithType(FormatOfDepth(depth).type, [&](auto t) {
         constexpr ComponentType type = decltype(t)::value;
         for (int i = 0; i < count; ++i) dst[i] = ComponentToFloat(type, src + i * ComponentBytes(type));
@@ -174,6 +178,10 @@ void LoadMaskFlt(int depth, const uint8_t *src, int count, float *dst) {
 }
 
 void StoreMaskFlt(int depth, const float *src, int count, uint8_t *dst) {
+    if (depth == DepthAFlt32) {
+        std::memcpy(dst, src, sizeof(float) * count);
+        return;
+    }
     WithType(FormatOfDepth(depth).type, [&](auto t) {
         constexpr ComponentType type = decltype(t)::value;
         for (int i = 0; i < count; ++i) FloatToComponent(type, src[i], dst + i * ComponentBytes(type));

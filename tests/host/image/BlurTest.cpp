@@ -328,5 +328,62 @@ TEST(BlurRequest, EveryDepthInPlaceAnyThreadsAbortsEmptyRequestsAndOiiotoolsBlur
     }
 }
 
+TEST(BlurRequest, MasksGiveTheBitsOfTheirFourChannelTwinAtEveryDepthKindWindowAndMix) {
+    // A mask blurs one channel, 32 lines to a strip; an RGBA float image holding the mask's values in all four
+    // channels blurs by eight pixels of four. Each value is the same arithmetic, so the mask's stored values are
+    // its twin's alpha as the mask's depth stores it, bit for bit. The data window overhangs the 140 x 70 frame
+    // and is 153 x 79: strips of 32 with a partial one, rows read in chunks of 128 columns with a tail.
+    const ImgRectI dw(-6, -4, 147, 75), source(-20, 10, 100, 90);
+    struct Window {
+        const ImgRectI *source; // BlurSourceWindow, or none
+        ImgRectI out;           // the output's data window
+        bool inPlace;
+    };
+    const Window windows[] = {
+        {nullptr, dw.Grown(9, 7), false}, {&source, ImgRectI(-30, 20, 130, 110), false}, {nullptr, dw, true}};
+    const TagList mixes[] = {{},
+                             {{BlurBlend, 0.6}, {BlurScale, 1.3}, {BlurAlphaScale, 0.8}, {BlurDoRed, 0}},
+                             {{BlurDoAlpha, 0}, {BlurRedScale, 3.0}},
+                             {{BlurBlend, 0.0}}};
+    for (int depth = DepthAInt8; depth <= DepthAFlt32; ++depth)
+        for (float canvasValue : {0.f, 1.f}) {
+            const FltPixel canvas{0.3f, 0.7f, 0.2f, canvasValue}; // the colour channels must not count
+            Ref<Image> mask = PatternAt(140, 70, depth, 5, &dw, canvas);
+            Ref<Image> twin = Filled(
+                140, 70, DepthRGBAFlt32,
+                [&](int x, int y) {
+                    const float v = mask->GetFlt(x, y).A;
+                    return FltPixel{v, v, v, v};
+                },
+                &dw, canvas);
+            for (int kind : kAllKinds)
+                for (auto [p, q] : {std::pair{0.6, 1.5}, std::pair{3.0, 2.2}, std::pair{9.5, 13.0}})
+                    for (const Window &w : windows)
+                        for (const TagList &mix : mixes) {
+                            SCOPED_TRACE(testing::Message()
+                                         << "depth " << depth << " canvas " << canvasValue << " kind " << kind << " p "
+                                         << p << " window " << (&w - windows) << " mix " << (&mix - mixes));
+                            TagList tags = mix;
+                            tags.Set({BlurFilterType, kind});
+                            tags.Set({BlurXSize, p / 140});
+                            tags.Set({BlurYSize, q / 140});
+                            if (w.source) tags.Set({BlurSourceWindow, w.source});
+                            Ref<Image> got = w.inPlace ? mask->CopyOfImageTagList({}) : Like(mask.Get(), w.out);
+                            Ref<Image> want = Like(twin.Get(), w.out);
+                            ASSERT_TRUE((w.inPlace ? got.Get() : mask.Get())->BlurTagList(got.Get(), tags) &&
+                                        twin->BlurTagList(want.Get(), tags));
+                            for (int y = w.out.y0; y < w.out.y1; ++y)
+                                for (int x = w.out.x0; x < w.out.x1; ++x) {
+                                    const FltPixel a = want->GetFlt(x, y);
+                                    FltPixel stored;
+                                    uint8_t bytes[16];
+                                    StoreFlt(depth, &a, 1, bytes);
+                                    LoadFlt(depth, bytes, 1, &stored);
+                                    ASSERT_EQ(got->GetFlt(x, y).A, stored.A) << x << "," << y;
+                                }
+                        }
+        }
+}
+
 } // namespace
 } // namespace Orvane::blurtest
