@@ -22,6 +22,13 @@
 // worker pool; each is computed the same way whatever thread takes it, so the
 // result does not depend on the thread count.
 //
+// Masks (a one-channel source and destination): only the value (alpha)
+// reaches the output, so a strip is 32 rows (or columns) of that one channel,
+// the buffer holds one float per pixel, rows are read and stored at their
+// depth once, and 8 x 8 block transposes move values between rows and strips.
+// Each lane sees the same arithmetic as the alpha lane of the four-channel
+// strips, so the results are the same bits.
+//
 // In place (dest == this): the first pass reads every source pixel it needs
 // before the second writes any, and the second reads a pixel's own source
 // value (for the mix) just before writing it.
@@ -459,12 +466,7 @@ public:
         if (!direct_ && !down_.Alloc(static_cast<size_t>(out_.Height()) * width * 4)) return false;
 
         const int rowStrips = (ty1_ - ty0_ + lines_ - 1) / lines_;
-        Parallel(rowStrips, [&](int i) {
-            if (mask_)
-                AcrossMaskStrip(ax, ty0_ + i * lines_);
-            else
-                AcrossStrip(ax, ty0_ + i * lines_);
-        });
+        Parallel(rowStrips, [&](int i) { AcrossStrip(ax, ty0_ + i * lines_); });
         if (Stopped()) return false;
         const int colStrips = (width + lines_ - 1) / lines_;
         Parallel(colStrips, [&](int i) { DownStrip(ay, out_.x0 + i * lines_); });
@@ -515,7 +517,7 @@ private:
     float *AcrossRow(int y) const { return across_.data + static_cast<size_t>(y - ty0_) * out_.Width() * channels_; }
     float *DownRow(int y) const { return down_.data + static_cast<size_t>(y - out_.y0) * out_.Width() * 4; }
 
-    /// Up to eight rows from y0 blurred across into the buffer.
+    /// A strip of rows from y0 (eight, or 32 of a mask) blurred across into the buffer.
     void AcrossStrip(const BlurAxis &ax, int y0) {
         Scratch &s = scratch();
         int inLo, inHi;
@@ -523,12 +525,34 @@ private:
         const int nIn = inHi - inLo, width = out_.Width();
         float *in = s.in.Get(static_cast<size_t>(nIn) * kLanes);
         float *out = s.out.Get(static_cast<size_t>(width) * kLanes);
-        row_.resize(nIn);
-        // Pixels are read where the row holds them; canvas elsewhere.
+        // Pixels are read where the rows hold them; canvas elsewhere.
         const int a = std::max(inLo, have_.x0), b = std::min(inHi, have_.x1);
+        if (mask_)
+            ReadMaskRows(y0, inLo, nIn, a, b, in, s);
+        else
+            ReadPixelRows(y0, inLo, nIn, a, b, in);
+        RunAxis(ax, in, inLo, nIn, out, out_.x0, width, canvas_, s);
+        const int count = std::min(lines_, ty1_ - y0);
+        if (mask_) {
+            float *dst[kLanes];
+            for (int r = 0; r < count; ++r) dst[r] = AcrossRow(y0 + r);
+            Deinterleave(out, width, dst, count);
+            return;
+        }
+        for (int r = 0; r < count; ++r) {
+            float *dst = AcrossRow(y0 + r);
+            const float *q = out + 4 * r;
+            for (int i = 0; i < width; ++i, q += kLanes) std::memcpy(dst + 4 * i, q, 4 * sizeof(float));
+        }
+    }
+
+    /// Eight rows from y0 into a strip of samples [inLo, inLo + nIn): their
+    /// pixels within [a, b) and rows, canvas elsewhere.
+    void ReadPixelRows(int y0, int inLo, int nIn, int a, int b, float *in) {
+        row_.resize(nIn);
+        const FltPixel canvas{canvas_[0], canvas_[1], canvas_[2], canvas_[3]};
         for (int r = 0; r < kStrip; ++r) {
             const int y = y0 + r;
-            const FltPixel canvas{canvas_[0], canvas_[1], canvas_[2], canvas_[3]};
             if (y < ty1_ && a < b) {
                 std::fill(row_.begin(), row_.begin() + (a - inLo), canvas);
                 ReadSpanFlt(src_, y, a, b, row_.data() + (a - inLo));
@@ -540,25 +564,11 @@ private:
             float *q = in + 4 * r;
             for (int i = 0; i < nIn; ++i, q += kLanes) std::memcpy(q, p + i, 4 * sizeof(float));
         }
-        RunAxis(ax, in, inLo, nIn, out, out_.x0, width, canvas_, s);
-        for (int r = 0; r < kStrip && y0 + r < ty1_; ++r) {
-            float *dst = AcrossRow(y0 + r);
-            const float *q = out + 4 * r;
-            for (int i = 0; i < width; ++i, q += kLanes) std::memcpy(dst + 4 * i, q, 4 * sizeof(float));
-        }
     }
 
-    /// Up to 32 rows of a mask from y0 blurred across into the buffer: one
-    /// lane per row, each row read at its depth once.
-    void AcrossMaskStrip(const BlurAxis &ax, int y0) {
-        Scratch &s = scratch();
-        int inLo, inHi;
-        InputRange(ax, out_.x0, out_.x1, have_.x0, have_.x1, inLo, inHi);
-        const int nIn = inHi - inLo, width = out_.Width();
-        float *in = s.in.Get(static_cast<size_t>(nIn) * kLanes);
-        float *out = s.out.Get(static_cast<size_t>(width) * kLanes);
-        // Pixels where the rows hold them; canvas elsewhere, and in lanes past the last row.
-        const int a = std::max(inLo, have_.x0), b = std::min(inHi, have_.x1);
+    /// The same for 32 rows of a mask, one lane each, read at their depth once
+    /// in chunks of columns.
+    void ReadMaskRows(int y0, int inLo, int nIn, int a, int b, float *in, Scratch &s) {
         for (int i = 0; i < nIn; ++i)
             if (i + inLo < a || i + inLo >= b)
                 std::memcpy(in + static_cast<size_t>(i) * kLanes, canvas_, sizeof canvas_);
@@ -584,14 +594,9 @@ private:
             }
             Interleave(rows, n, in + static_cast<size_t>(x - inLo) * kLanes);
         }
-        RunAxis(ax, in, inLo, nIn, out, out_.x0, width, canvas_, s);
-        float *dst[kLanes];
-        const int count = std::min(kLanes, ty1_ - y0);
-        for (int r = 0; r < count; ++r) dst[r] = AcrossRow(y0 + r);
-        Deinterleave(out, width, dst, count);
     }
 
-    /// Up to eight columns from x0 blurred down and finished.
+    /// A strip of columns from x0 (eight, or 32 of a mask) blurred down and finished.
     void DownStrip(const BlurAxis &ay, int x0) {
         Scratch &s = scratch();
         int inLo, inHi;
