@@ -6,11 +6,15 @@
 //                 the inner fill and the soft band between the two (8 samples
 //                 a pixel side, written directly)
 //   Poly200BandHollow  the band of a hollow line (32 samples, band images)
+//   MultiPoly10   a MultiPoly of 10 layers, each a hard 50-point ring 0.08 of
+//                 the width across its radius, along the frame's middle, all
+//                 merged (every other one subtracted over its neighbours)
 // Compare with BM_CopyFloorAFlt32 (CopyBench.cpp), the floor a hard fill is
 // held to (3x), and with BM_MaskBlurFastGaussian (PrimitiveMaskBench.cpp), the
 // blur of a soft edge of the same size, which the band is held to.
 #include <cmath>
 #include <numbers>
+#include <string>
 
 #include "bench/BenchSupport.h"
 #include "host/flow/Engine.h"
@@ -69,6 +73,32 @@ BENCHMARK(BM_Mask_Poly200Band)->UseRealTime()->Unit(benchmark::kMillisecond);
 
 void BM_Mask_Poly200BandHollow(benchmark::State &state) { RunPolyMask(state, true, true); }
 BENCHMARK(BM_Mask_Poly200BandHollow)->UseRealTime()->Unit(benchmark::kMillisecond);
+
+void BM_Mask_MultiPoly10(benchmark::State &state) {
+    if (!LoadLibrary(state)) return;
+    OrvaneDoc doc;
+    Operator *mask = doc.AddTool(OvID("MultiPolyMask"));
+    if (!mask) return state.SkipWithError("the MultiPolyMask class is not registered");
+    mask->FindInput("MaskWidth")->SetValue(MakeRef<Number>(kWidth));
+    mask->FindInput("MaskHeight")->SetValue(MakeRef<Number>(kHeight));
+    for (int i = 1; i <= 10; ++i) {
+        mask->FindInput("AddPolygon")->SetValue(MakeRef<Number>(1));
+        auto in = [&](const char *id) { return mask->FindInput(("PolyMask" + std::to_string(i) + "." + id).c_str()); };
+        in("Polyline")->SetValue(WavyRing(50, 0.08));
+        in("Center")->SetValue(MakeRef<Point>(0.05 + 0.09 * i, 0.5));
+        if (i % 2 == 0) in("PaintMode")->SetValue(MakeRef<IDValue>(OvID("Subtract")));
+    }
+    EvalOptions options;
+    options.useCache = false;
+    for (auto _ : state) benchmark::DoNotOptimize(Evaluate(mask->FindMainOutput(), 0.0, options).Get());
+    ReportPixels(state);
+    const Ref<Parameter> last = Evaluate(mask->FindMainOutput(), 0.0, options);
+    if (const auto *img = dynamic_cast<const Image *>(last.Get())) {
+        state.counters["window"] = double(img->DataWindow().Width()) * img->DataWindow().Height();
+        state.counters["first"] = img->GetFlt(int(kWidth * 0.14), kHeight / 2).A;
+    }
+}
+BENCHMARK(BM_Mask_MultiPoly10)->UseRealTime()->Unit(benchmark::kMillisecond);
 
 } // namespace
 } // namespace Orvane::Bench
