@@ -382,6 +382,9 @@ constexpr Tag ShapeMiterLimit = 0x200b0003; ///< miter length over stroke width 
 constexpr Tag MaskRegion = 0x60060000;
 /// CreateMaskImage: the mask's depth (1..4), instead of the tool's Depth control.
 constexpr Tag MaskDepth = 0x10060000;
+/// CreateMaskImage: pixels a soft edge reaches from the shape (a layer's own),
+/// instead of the reach of the tool's SoftEdge.
+constexpr Tag MaskReach = 0x10060001;
 /// Request flag: the mask is asked for in the mask domain (the consumer reads
 /// it over its own region). A finished mask records it in its metadata under
 /// MaskDomainKey. Bit 5, where other hosts keep it, is ReqFlagNoGPU here.

@@ -105,6 +105,7 @@ public:
     void Changed();
 
 private:
+    friend class Operator; // renumbers inputs when some are taken out
     Operator *owner_;
     std::string name_;
     OvID id_;

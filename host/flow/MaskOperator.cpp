@@ -288,7 +288,7 @@ MaskMergeSettings MaskControls::MergeSettings(Request *req) const {
 }
 
 MaskMergeSettings MaskOperator::GetMergeSettings(Request *req) const {
-    MaskMergeSettings s = controls_.MergeSettings(req);
+    MaskMergeSettings s = HoldsIncomingMask() ? MaskMergeSettings{} : controls_.MergeSettings(req);
     s.clipToFrame = GetClippingMode(req) == ClippingMode_Frame;
     return s;
 }
@@ -334,12 +334,11 @@ void MaskOperator::SetMaskImage(Request *, Ref<Image> mask) { mask_ = std::move(
 Ref<Image> MaskOperator::CreateMaskImage(Request *req, const TagList &tags) {
     const MaskFormat f = GetMaskFormat(req);
     ImgRectI window;
-    if (const std::optional<ImgRectI> dod = GetMaskDoD(req)) {
-        window = *dod;
-        if (const auto *region = static_cast<const ImgRectI *>(tags.GetPtr(MaskRegion))) {
-            const int reach = SoftEdgeReach(GetMergeSettings(req), f);
-            window = region->IsNull() ? ImgRectI() : region->Grown(reach, reach) & *dod;
-        }
+    if (const ImgRectI needed = NeededRect(req, f.Frame()); !needed.IsNull()) {
+        const int reach = static_cast<int>(tags.GetLong(MaskReach, SoftEdgeReach(GetMergeSettings(req), f)));
+        window = needed.Grown(reach, reach);
+        if (const auto *region = static_cast<const ImgRectI *>(tags.GetPtr(MaskRegion)))
+            window = region->IsNull() ? ImgRectI() : region->Grown(reach, reach) & window;
     }
     const bool noData = req->IsPreCalc();
     Ref<Image> mask = NewImageTagList({{ImgWidth, f.width},
@@ -376,6 +375,14 @@ void MaskOperator::PostProcess(Request *req) {
     if (!mask) mask = Ref<Image>(dynamic_cast<Image *>(req->GetOutputData(output_)));
     if (!mask) return;
     Image *incoming = Common().effectMask ? dynamic_cast<Image *>(req->GetInputData(Common().effectMask)) : nullptr;
+    // A tool that merged the incoming mask as it went hands it on as it came, or finishes its own without it.
+    if (HoldsIncomingMask()) {
+        if (mask.Get() == incoming) {
+            req->SetOutputData(output_, mask);
+            return;
+        }
+        incoming = nullptr;
+    }
     const ImgRectI valid = NeededRect(req, GetMaskFormat(req).Frame());
     Ref<Image> result = MergeMasks(req, std::move(mask), incoming, GetMergeSettings(req), valid);
     if (!result) {

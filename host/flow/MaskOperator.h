@@ -111,12 +111,17 @@ public:
     /// Makes a mask image (zeroed, rows allocated unless pre-calculating or
     /// empty) and makes it the request's mask. Tags: MaskRegion (the
     /// rectangle; it grows by the soft edge's reach and is cut to
-    /// GetMaskDoD; absent: all of GetMaskDoD), MaskDepth. Null when memory ran out.
+    /// GetMaskDoD; absent: all of GetMaskDoD), MaskDepth, MaskReach (the
+    /// reach to allow for, in place of the tool's). Null when memory ran out.
     Ref<Image> CreateMaskImage(Request *req, const TagList &tags);
     Image *GetMaskImage(Request *req) const;
     void SetMaskImage(Request *req, Ref<Image> mask);
     MaskFormat GetMaskFormat(Request *req) const;
+    /// The tool's merge settings; neutral (level 1, no soft edge) for a tool
+    /// whose mask already holds the incoming one.
     MaskMergeSettings GetMergeSettings(Request *req) const;
+    /// Pixels the soft edge of `s` reaches from a shape's edge (0 without one).
+    int SoftEdgeReach(const MaskMergeSettings &s, const MaskFormat &f) const;
 
     // ---- the finishing merge ----
     /// Joins `mask` (M, this tool's; consumed) with `incoming` (I, may be
@@ -154,11 +159,15 @@ public:
     Output *OutMask() const { return output_; }
     const MaskControls &Controls() const { return controls_; }
 
+protected:
+    /// True for a tool that merges the incoming mask into its own as it goes
+    /// (layer by layer): PostProcess then hands the mask on without merging
+    /// the incoming one again, and the tool's own merge settings are neutral.
+    virtual bool HoldsIncomingMask() const { return false; }
+
 private:
     /// The consumer's region with endless sides cut to the frame, or the frame.
     ImgRectI NeededRect(Request *req, const ImgRectI &frame) const;
-    /// Pixels the soft edge reaches from a shape's edge (0 without one).
-    int SoftEdgeReach(const MaskMergeSettings &s, const MaskFormat &f) const;
     Ref<Image> SoftEdgeOf(Request *req, Image *mask, int depth, const MaskMergeSettings &s);
 
     MaskControls controls_;

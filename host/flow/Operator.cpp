@@ -1,5 +1,6 @@
 #include "host/flow/Operator.h"
 
+#include <algorithm>
 #include <cstdio>
 
 #include "host/core/Parallel.h"
@@ -40,11 +41,37 @@ void Operator::SetControlPageTags(int page, const TagList &tags) {
 Input *Operator::AddInputTagList(const char *name, const char *id, const TagList &tags) {
     const std::string fullId = group_.empty() ? std::string(id) : group_ + "." + id;
     if (FindInput(OvID(fullId))) return nullptr;
-    const int page =
-        static_cast<int>(tags.GetLong(ControlPage, pages_.empty() ? 0 : static_cast<long long>(pages_.size()) - 1));
+    const long long last = page_ >= 0 ? page_ : pages_.empty() ? 0 : static_cast<long long>(pages_.size()) - 1;
+    const int page = static_cast<int>(tags.GetLong(ControlPage, last));
     inputs_.push_back(
         std::make_unique<Input>(this, name ? name : id, OvID(fullId), tags, static_cast<int>(inputs_.size()), page));
     return inputs_.back().get();
+}
+
+void Operator::RemoveInputs(const std::vector<Input *> &inputs) {
+    std::vector<int> keptBefore(inputs_.size() + 1, 0); // kept inputs ahead of each old index
+    std::vector<std::unique_ptr<Input>> kept;
+    for (size_t i = 0; i < inputs_.size(); ++i) {
+        keptBefore[i] = static_cast<int>(kept.size());
+        std::unique_ptr<Input> &in = inputs_[i];
+        if (std::find(inputs.begin(), inputs.end(), in.get()) == inputs.end()) {
+            in->index_ = static_cast<int>(kept.size());
+            kept.push_back(std::move(in));
+            continue;
+        }
+        in->Disconnect();
+        removed_.push_back(std::move(in));
+    }
+    keptBefore[inputs_.size()] = static_cast<int>(kept.size());
+    inputs_ = std::move(kept);
+    std::vector<ControlNest> nests;
+    for (ControlNest n : nests_) {
+        const bool wasEmpty = n.firstInput == n.endInput;
+        n.firstInput = keptBefore[static_cast<size_t>(n.firstInput)];
+        n.endInput = keptBefore[static_cast<size_t>(n.endInput)];
+        if (wasEmpty || n.firstInput != n.endInput) nests.push_back(std::move(n));
+    }
+    nests_ = std::move(nests);
 }
 
 Input *Operator::FindGroupInput(const char *id) const {

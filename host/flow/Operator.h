@@ -73,6 +73,14 @@ public:
     /// the options two file formats add to one tool never collide.
     void SetCurrentGroup(std::string group) { group_ = std::move(group); }
     const std::string &CurrentGroup() const { return group_; }
+    /// The page inputs go on when their tags name none (-1: the last page
+    /// added), for inputs a tool adds after construction.
+    void SetCurrentPage(int page) { page_ = page; }
+    /// Takes inputs out of the tool (a layer deleted): they are disconnected,
+    /// the others renumbered, and nests left empty dropped. The objects live
+    /// on, detached, until the tool goes, so a caller in the middle of one's
+    /// notification is safe. Main thread, between renders.
+    void RemoveInputs(const std::vector<Input *> &inputs);
 
     // ---- links ----
     Input *FindInput(OvID id) const;
@@ -168,11 +176,12 @@ protected:
 
 private:
     std::string name_, group_;
+    int page_ = -1;
     OrvaneDoc *doc_ = nullptr;
     std::vector<PanelPage> pages_;
     std::vector<ControlNest> nests_;
     std::vector<int> openNests_;
-    std::vector<std::unique_ptr<Input>> inputs_;
+    std::vector<std::unique_ptr<Input>> inputs_, removed_;
     std::vector<std::unique_ptr<Output>> outputs_;
     CommonInputs common_;
     std::recursive_mutex requestLock_;
