@@ -198,8 +198,13 @@ template <class Block> void BlockSpan(int depth, const uint8_t *src, uint8_t *ds
 /// CorrectBlock compiled, whole, for the machine's vector width: with AVX2
 /// the planes' stages run twice as wide, and multiply-adds fuse (so the two
 /// forms may differ in the last bit). The histogram modes keep one form: a
-/// last-bit difference there can move a value into the next bin.
+/// last-bit difference there can move a value into the next bin. (Clang does
+/// not take `flatten` with clones: its build keeps the calls.)
+#if defined(__clang__)
+__attribute__((target_clones("arch=x86-64-v3", "default"))) void
+#else
 __attribute__((flatten, target_clones("arch=x86-64-v3", "default"))) void
+#endif
 CorrectSpan(const cc::PixelSettings &s, const float (*from)[4], float (*p)[4], int n) {
     cc::CorrectBlock(s, from, p, n);
 }
