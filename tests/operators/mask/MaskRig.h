@@ -26,6 +26,20 @@ struct MaskRig {
         opt.useCache = false;
         return EvalImage(mask, 0.0, opt);
     }
+    /// A grey (0.25) plate of w x h pixels, `aspectY` tall each, through a Brightness/Contrast of gain 2 limited by
+    /// this mask: 0.5 where the mask is 1, 0.25 where it is 0. Null on failure.
+    Ref<Image> GainThroughMask(int w, int h, double aspectY = 1.0) const {
+        Ref<Image> plate = MakeRef<Image>(w, h, DepthRGBAFlt32);
+        if (!plate->AllocScanLineData()) return nullptr;
+        plate->FillWithin({0.25f, 0.25f, 0.25f, 1.f}, plate->DataWindow());
+        plate->SetScale(1.0, aspectY);
+        Operator *bc = doc->AddTool(OvID("BrightnessContrast"), "BC1");
+        if (!bc || !bc->FindInput("Input")->ConnectTo(AddImageSource(*doc, "Plate", plate)->Out()) ||
+            !bc->FindInput("EffectMask")->ConnectTo(mask->FindMainOutput()))
+            return nullptr;
+        SetNumber(bc, "Gain", 2.0);
+        return EvalImage(bc);
+    }
     /// The covered area in pixels over the W x H frame (the canvas counts beyond the data window).
     static double Area(const Image &m) {
         double sum = 0;

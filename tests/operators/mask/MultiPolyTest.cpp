@@ -169,7 +169,9 @@ TEST(MultiPoly, TakesTheIncomingMaskOnce) {
         if (withLayer) SetLayers(rig, {{a}});
         const Ref<Image> below = ts::EvalImage(rect), m = rig.Render();
         ASSERT_TRUE(below && m) << ts::ConsoleText(*rig.doc);
-        if (!withLayer) EXPECT_EQ(m->DataWindow(), below->DataWindow());
+        if (!withLayer) {
+            EXPECT_EQ(m->DataWindow(), below->DataWindow());
+        }
         ExpectMask(*m, [&](int x, int y) {
             return withLayer ? Expected({{a}}, x, y, below->GetFlt(x, y).A) : below->GetFlt(x, y).A;
         });

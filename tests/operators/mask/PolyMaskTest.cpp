@@ -338,14 +338,7 @@ TEST(PolyMask, LimitsAnotherToolToItsInside) {
     Rig rig;
     const std::vector<Px> tri = {{60, 30}, {220, 70}, {90, 170}};
     rig.Set("Polyline", LineThrough(tri, true));
-    Ref<Image> plate = MakeRef<Image>(W, H, DepthRGBAFlt32);
-    ASSERT_TRUE(plate->AllocScanLineData());
-    plate->FillWithin({0.25f, 0.25f, 0.25f, 1.f}, plate->DataWindow());
-    Operator *bc = rig.doc->AddTool(OvID("BrightnessContrast"), "BC1");
-    ASSERT_TRUE(bc && bc->FindInput("Input")->ConnectTo(ts::AddImageSource(*rig.doc, "Plate", plate)->Out()));
-    ts::SetNumber(bc, "Gain", 2.0);
-    ASSERT_TRUE(bc->FindInput("EffectMask")->ConnectTo(rig.mask->FindMainOutput()));
-    const Ref<Image> out = ts::EvalImage(bc);
+    const Ref<Image> out = rig.GainThroughMask(W, H);
     ASSERT_TRUE(out) << ts::ConsoleText(*rig.doc);
     // Pixels wholly inside the triangle doubled, wholly outside untouched; which is which by the edge functions.
     int inside = 0, outside = 0;

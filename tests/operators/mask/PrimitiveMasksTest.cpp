@@ -183,15 +183,7 @@ TEST(PrimitiveMasks, AMaskOnAnEffectMaskIsDrawnInTheFrameOfTheImageItLimits) {
     // aspect. The ellipse must land in the middle of that image, round on its display.
     Rig rig("EllipseMask");
     ts::SetNumbers(rig.mask, {{"Width", 0.5}, {"Height", 0.5}});
-    Ref<Image> plate = MakeRef<Image>(2 * W, 2 * H, DepthRGBAFlt32);
-    ASSERT_TRUE(plate->AllocScanLineData());
-    plate->FillWithin({0.25f, 0.25f, 0.25f, 1.f}, plate->DataWindow());
-    plate->SetScale(1.0, 2.0);
-    Operator *bc = rig.doc->AddTool(OvID("BrightnessContrast"), "BC1");
-    ASSERT_TRUE(bc && bc->FindInput("Input")->ConnectTo(ts::AddImageSource(*rig.doc, "Plate", plate)->Out()));
-    ts::SetNumber(bc, "Gain", 2.0);
-    ASSERT_TRUE(bc->FindInput("EffectMask")->ConnectTo(rig.mask->FindMainOutput()));
-    const Ref<Image> out = ts::EvalImage(bc);
+    const Ref<Image> out = rig.GainThroughMask(2 * W, 2 * H, 2.0);
     ASSERT_TRUE(out) << ts::ConsoleText(*rig.doc);
     // Radius 0.25 of the width: W/2 pixels across, W/4 pixels up (pixels twice as tall as wide).
     const int cx = W, cy = H;
