@@ -1,8 +1,9 @@
 // The soft band of a double-polyline mask: a strip between two concentric
 // circles of radii 0.3 and 0.35 of the width, one sample pair per pixel of
-// the outer circle's length, drawn into a UHD one-channel float mask at 8
-// (closed solid line) and 32 (otherwise) sub-samples per pixel side. Compare
-// with BM_CopyFloorAFlt32 in CopyBench.cpp.
+// the outer circle's length, drawn into a UHD one-channel float mask at 1
+// (preview), 8 (closed solid line) and 32 (otherwise) sub-samples per pixel
+// side. Compare with BM_CopyFloorAFlt32 in CopyBench.cpp and with the blur of
+// such a mask, BM_MaskBlurFastGaussian.
 #include <cmath>
 #include <vector>
 
@@ -34,7 +35,7 @@ void BM_StripBand(benchmark::State &state) {
     }
     ReportPixels(state);
 }
-BENCHMARK(BM_StripBand)->Arg(8)->Arg(32)->UseRealTime()->Unit(benchmark::kMillisecond);
+BENCHMARK(BM_StripBand)->Arg(1)->Arg(8)->Arg(32)->UseRealTime()->Unit(benchmark::kMillisecond);
 
 } // namespace
 } // namespace Orvane::Bench

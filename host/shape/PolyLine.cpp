@@ -49,9 +49,15 @@ PolySample Position(const CurveSegment &s, double t) {
     return {x / w, y / w};
 }
 
+/// sqrt(a^2 + b^2), through hypot only where the squares overflow or vanish.
+double Norm(double a, double b) {
+    const double r = std::sqrt(a * a + b * b);
+    return std::isfinite(r) && r > 1e-150 ? r : std::hypot(a, b);
+}
+
 /// |d position / dt|.
 double Speed(const CurveSegment &s, double t) {
-    if (s.line) return std::hypot(s.hx[3] - s.hx[0], s.hy[3] - s.hy[0]);
+    if (s.line) return Norm(s.hx[3] - s.hx[0], s.hy[3] - s.hy[0]);
     const double m = 1.0 - t;
     const double b[4] = {m * m * m, 3 * t * m * m, 3 * t * t * m, t * t * t};
     const double d[3] = {3 * m * m, 6 * t * m, 3 * t * t}; // derivative basis on control point differences
@@ -62,7 +68,7 @@ double Speed(const CurveSegment &s, double t) {
         dy += d[i] * (s.hy[i + 1] - s.hy[i]);
         dw += d[i] * (s.w[i + 1] - s.w[i]);
     }
-    return std::hypot(dx * w - x * dw, dy * w - y * dw) / (w * w);
+    return Norm(dx * w - x * dw, dy * w - y * dw) / (w * w);
 }
 
 /// Five-point Gauss-Legendre rule for the length between a and b.

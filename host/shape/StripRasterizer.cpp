@@ -16,6 +16,7 @@
 #include <climits>
 #include <cmath>
 #include <cstdint>
+#include <new>
 #include <vector>
 
 #include "host/core/Parallel.h"
@@ -36,7 +37,7 @@ constexpr int kMaxSubSamples = 256;
 constexpr double kMaxCoordinate = 524288.0; // 2^19 pixels: keeps edge functions inside 2^62
 constexpr int kTrianglesPerAbortPoll = 256;
 
-int64_t FloorDiv(int64_t a, int64_t b) { // b > 0
+inline int64_t FloorDiv(int64_t a, int64_t b) { // b > 0
     const int64_t q = a / b;
     return (a % b != 0 && a < 0) ? q - 1 : q;
 }
@@ -57,6 +58,96 @@ struct SampleGrid {
 SampleGrid GridOf(const StripRasterOptions &options) {
     return SampleGrid(std::clamp(options.subSamples, 1, kMaxSubSamples));
 }
+
+constexpr double kMarkMargin = 1.0 / 256; // beyond the 1/2048-pixel snap of the sample grids
+
+/// The pixel columns whose squares, grown by kMarkMargin, meet the segment or
+/// triangle of `count` (2 or 3) points in pixel row y; false when none do.
+bool SlabColumns(const StripPoint *p, int count, int y, int &first, int &last) {
+    const double lo = y - kMarkMargin, hi = y + 1 + kMarkMargin;
+    double xa = HUGE_VAL, xb = -HUGE_VAL;
+    const int edges = count == 2 ? 1 : count;
+    for (int e = 0; e < edges; ++e) {
+        const StripPoint &a = p[e], &b = p[(e + 1) % count];
+        if (a.y == b.y) {
+            if (a.y < lo || a.y > hi) continue;
+            xa = std::min({xa, a.x, b.x}), xb = std::max({xb, a.x, b.x});
+            continue;
+        }
+        double t0 = (lo - a.y) / (b.y - a.y), t1 = (hi - a.y) / (b.y - a.y);
+        if (t0 > t1) std::swap(t0, t1);
+        t0 = std::max(t0, 0.0), t1 = std::min(t1, 1.0);
+        if (t0 > t1) continue;
+        const double x0 = a.x + t0 * (b.x - a.x), x1 = a.x + t1 * (b.x - a.x);
+        xa = std::min({xa, x0, x1}), xb = std::max({xb, x0, x1});
+    }
+    if (xa > xb) return false;
+    first = static_cast<int>(std::floor(std::max(xa - kMarkMargin, -kMaxCoordinate)));
+    last = static_cast<int>(std::floor(std::min(xb + kMarkMargin, kMaxCoordinate)));
+    return true;
+}
+
+/// The pixels of one band where the strip's coverage or value can change
+/// abruptly inside the pixel, one bit per pixel: those a curve, an end of the
+/// strip, a fold or a degenerate triangle touches. Elsewhere every sample of a
+/// pixel falls in the same triangles, and the centre sample alone gives the
+/// pixel's sums.
+class RowMarks {
+public:
+    bool Alloc(const ImgRectI &band) {
+        band_ = band;
+        words_ = (band.Width() + 63) / 64;
+        try {
+            bits_.assign(static_cast<size_t>(words_) * band.Height(), 0);
+        } catch (const std::bad_alloc &) {
+            return false;
+        }
+        return true;
+    }
+
+    /// Marks every pixel whose square, grown by kMarkMargin, meets the segment or
+    /// triangle of `count` (2 or 3) points, in pixel space.
+    void MarkFootprint(const StripPoint *p, int count) {
+        double yMin = p[0].y, yMax = p[0].y;
+        for (int t = 1; t < count; ++t) yMin = std::min(yMin, p[t].y), yMax = std::max(yMax, p[t].y);
+        const int j0 = std::max(band_.y0, static_cast<int>(std::floor(yMin - kMarkMargin)));
+        const int j1 = std::min(band_.y1 - 1, static_cast<int>(std::floor(yMax + kMarkMargin)));
+        for (int j = j0; j <= j1; ++j) {
+            int c0, c1;
+            if (!SlabColumns(p, count, j, c0, c1)) continue;
+            for (int c = std::max(c0, band_.x0); c <= std::min(c1, band_.x1 - 1); ++c) Set(j, c);
+        }
+    }
+
+    /// Whether any pixel of row y in columns [x0, x1] is marked.
+    bool Any(int y, int x0, int x1) const { return Next(y, x0, x1) <= x1; }
+
+    /// The first marked column of row y in [x, last], or last + 1.
+    int Next(int y, int x, int last) const {
+        x = std::max(x, band_.x0);
+        last = std::min(last, band_.x1 - 1);
+        if (x > last) return last + 1;
+        const uint64_t *row = Row(y);
+        int word = (x - band_.x0) >> 6;
+        const int lastWord = (last - band_.x0) >> 6;
+        uint64_t bits = row[word] & (~uint64_t(0) << ((x - band_.x0) & 63));
+        while (bits == 0) {
+            if (++word > lastWord) return last + 1;
+            bits = row[word];
+        }
+        const int found = band_.x0 + word * 64 + __builtin_ctzll(bits);
+        return found <= last ? found : last + 1;
+    }
+
+private:
+    void Set(int y, int x) { Row(y)[(x - band_.x0) >> 6] |= uint64_t(1) << ((x - band_.x0) & 63); }
+    uint64_t *Row(int y) { return bits_.data() + static_cast<size_t>(y - band_.y0) * words_; }
+    const uint64_t *Row(int y) const { return bits_.data() + static_cast<size_t>(y - band_.y0) * words_; }
+
+    ImgRectI band_;
+    int words_ = 0;
+    std::vector<uint64_t> bits_;
+};
 
 struct Vertex {
     int64_t x, y;
@@ -166,9 +257,10 @@ struct BandSums {
 /// Scan-converts strip triangles into one band's sums.
 class BandRasterizer {
 public:
+    /// With `marks`, only the marked pixels take sums (`marked`), or only the others.
     BandRasterizer(const StripPoint *strip, const StripRasterOptions &options, const SampleGrid &grid,
-                   const ImgRectI &band, const BandSums &sums)
-        : strip_(strip), options_(options), grid_(grid), band_(band), buf_(sums) {
+                   const ImgRectI &band, const BandSums &sums, const RowMarks *marks = nullptr, bool marked = true)
+        : strip_(strip), options_(options), grid_(grid), band_(band), buf_(sums), marks_(marks), marked_(marked) {
         const int64_t n = grid.n;
         rowLo_ = band.y0 * n;
         rowHi_ = band.y1 * n - 1;
@@ -221,7 +313,10 @@ private:
         if (r0 > r1) return;
 
         EdgeBound edges[3];
-        for (int e = 0; e < 3; ++e) edges[e].Start(v[e], v[(e + 1) % 3], g, r0);
+        const auto startEdges = [&](int64_t r) {
+            for (int e = 0; e < 3; ++e) edges[e].Start(v[e], v[(e + 1) % 3], g, r);
+        };
+        startEdges(r0);
 
         // The value as a plane over unit positions, taken from the first vertex.
         const double dx1 = static_cast<double>(v[1].x - v[0].x), dy1 = static_cast<double>(v[1].y - v[0].y);
@@ -234,10 +329,35 @@ private:
         const int width = band_.Width();
         int row = static_cast<int>(FloorDiv(r0, n)) - band_.y0; // the pixel row of sample row r
         int64_t rowStep = r0 - (row + band_.y0) * n;
+        // With marks: pixel rows where no marked pixel lies under the triangle are skipped.
+        const bool skipRows = marks_ && marked_;
+        int boxFirst = 0, boxLast = -1;
+        StripPoint corners[3];
+        if (skipRows) {
+            boxFirst = static_cast<int>(FloorDiv(std::min({v[0].x, v[1].x, v[2].x}), g.units));
+            boxLast = static_cast<int>(FloorDiv(std::max({v[0].x, v[1].x, v[2].x}), g.units));
+            for (int t = 0; t < 3; ++t)
+                corners[t] = {static_cast<double>(v[t].x) / g.units, static_cast<double>(v[t].y) / g.units};
+        }
+        const auto rowHasMarks = [&](int y) {
+            if (!marks_->Any(y, boxFirst, boxLast)) return false;
+            int first, last;
+            return SlabColumns(corners, 3, y, first, last) && marks_->Any(y, first, last);
+        };
         for (int64_t r = r0; r <= r1; ++r, ++rowStep) {
             if (rowStep == n) {
                 rowStep = 0;
                 ++row;
+            }
+            if (skipRows && (r == r0 || rowStep == 0) && !rowHasMarks(row + band_.y0)) {
+                // On to the next pixel row with a mark under the box; the edges restart there.
+                const int lastRow = static_cast<int>(FloorDiv(r1, n)) - band_.y0;
+                do ++row;
+                while (row <= lastRow && !rowHasMarks(row + band_.y0));
+                if (row > lastRow) break;
+                r = (row + band_.y0) * n;
+                rowStep = 0;
+                startEdges(r);
             }
             int64_t lo = colLo_, hi = colHi_;
             for (const EdgeBound &e : edges) e.Limit(lo, hi);
@@ -245,18 +365,39 @@ private:
                 const double y = static_cast<double>((2 * r + 1) * g.k);
                 const double rowValue =
                     v[0].value + gy * (y - static_cast<double>(v[0].y)) - gx * static_cast<double>(v[0].x);
-                const int first = PixelOf(lo), last = PixelOf(hi);
+                int first = PixelOf(lo), last = PixelOf(hi);
                 float *value = buf_.value + static_cast<size_t>(row) * width - band_.x0;
                 float *coverage = buf_.coverage + static_cast<size_t>(row) * width - band_.x0;
-                for (int px = first; px <= last; ++px) {
+                const auto add = [&](int px) {
                     const int64_t a = std::max(lo, px * n), b = std::min(hi, px * n + n - 1);
                     const double covered = static_cast<double>(b - a + 1);
                     // The value is linear along the row: the run's sum is its count times the value at its middle.
                     const double sum = covered * (rowValue + gx * static_cast<double>(a + b + 1) * k);
                     value[px] += static_cast<float>(sum * weight_);
                     coverage[px] += static_cast<float>(covered * weight_);
+                };
+                if (!marks_) {
+                    for (int px = first; px <= last; ++px) add(px);
+                } else if (!marked_) {
+                    // Runs of unmarked pixels between the marked ones.
+                    const int y = row + band_.y0;
+                    for (int px = first; px <= last;) {
+                        const int mark = marks_->Next(y, px, last);
+                        for (; px < mark; ++px) add(px);
+                        px = mark + 1;
+                    }
+                } else {
+                    // The touched range narrows to the marked pixels added.
+                    const int y = row + band_.y0;
+                    int firstAdded = last + 1, lastAdded = first - 1;
+                    for (int px = marks_->Next(y, first, last); px <= last; px = marks_->Next(y, px + 1, last)) {
+                        add(px);
+                        firstAdded = std::min(firstAdded, px);
+                        lastAdded = px;
+                    }
+                    first = firstAdded, last = lastAdded;
                 }
-                if (buf_.rowFirst) {
+                if (buf_.rowFirst && first <= last) {
                     buf_.rowFirst[row] = std::min(buf_.rowFirst[row], first);
                     buf_.rowLast[row] = std::max(buf_.rowLast[row], last);
                 }
@@ -276,10 +417,80 @@ private:
     const SampleGrid &grid_;
     ImgRectI band_;
     BandSums buf_;
+    const RowMarks *marks_;
+    bool marked_;
     int64_t rowLo_, rowHi_, colLo_, colHi_;
     int shift_ = -1; ///< log2 n when n is a power of 2 (columns to pixels by a shift)
     double weight_;
 };
+
+/// Whether every point of the strip is finite and within reach of the grids.
+bool AllPointsUsable(const StripPoint *strip, size_t count) {
+    for (size_t i = 0; i < count; ++i)
+        if (!(std::fabs(strip[i].x) <= kMaxCoordinate && std::fabs(strip[i].y) <= kMaxCoordinate)) return false;
+    return true;
+}
+
+double TwiceArea(const StripPoint *p) {
+    return (p[1].x - p[0].x) * (p[2].y - p[0].y) - (p[2].x - p[0].x) * (p[1].y - p[0].y);
+}
+
+/// The strip's triangles alternate in orientation where they tile without
+/// folding; +1 when the even ones turn counter-clockwise over most of the
+/// strip's area, else -1.
+int StripOrientation(const StripPoint *strip, size_t count) {
+    double sum = 0.0;
+    for (size_t i = 0; i + 2 < count; ++i) sum += (i % 2 == 0 ? 1.0 : -1.0) * TwiceArea(strip + i);
+    return sum >= 0.0 ? 1 : -1;
+}
+
+/// Marks the pixels of a band where the band's boundary runs: both curves
+/// (every segment i, i + 2), the two ends (a closed strip's ends coincide and
+/// are marked all the same), and the whole of every triangle that folds back
+/// against the strip's orientation, has no area, or is steep: narrower than
+/// kSteepWidth pixels from its lone vertex to its side on the other curve, so
+/// that its value changes by more than 1/kSteepWidth across a pixel. Where
+/// the value bends between two shallow triangles inside a pixel, its centre
+/// is then off the mean of its samples by at most about 1/(4 kSteepWidth).
+void MarkEdgePixels(const StripPoint *strip, size_t count, RowMarks &marks) {
+    constexpr double kSteepWidth = 16.0;
+    const int orientation = StripOrientation(strip, count);
+    for (size_t i = 0; i + 2 < count; ++i) {
+        const StripPoint segment[2] = {strip[i], strip[i + 2]};
+        marks.MarkFootprint(segment, 2);
+        const double area = TwiceArea(strip + i) * (i % 2 == 0 ? 1.0 : -1.0) * orientation;
+        const double side = std::hypot(strip[i + 2].x - strip[i].x, strip[i + 2].y - strip[i].y);
+        if (!(area > 0.0) || area < kSteepWidth * side) marks.MarkFootprint(strip + i, 3);
+    }
+    marks.MarkFootprint(strip, 2);
+    marks.MarkFootprint(strip + count - 2, 2);
+}
+
+/// Adds the strip's triangles to one band's sums; false when `aborted()` said
+/// so. With `edgesOnly`, the pixels left unmarked take their centre sample and
+/// the marked ones all n x n samples.
+template <class AbortCheck> bool AccumulateBand(const StripPoint *strip, size_t count,
+                                                const StripRasterOptions &options, const SampleGrid &grid,
+                                                const ImgRectI &band, const BandSums &sums, const AbortCheck &aborted) {
+    const auto addAll = [&](BandRasterizer &raster) {
+        for (size_t i = 0; i + 2 < count; ++i) {
+            if (i % kTrianglesPerAbortPoll == 0 && aborted()) return false;
+            raster.AddTriangle(i);
+        }
+        return true;
+    };
+    RowMarks marks;
+    if (!options.edgesOnly || grid.n == 1 || !AllPointsUsable(strip, count) || !marks.Alloc(band)) {
+        BandRasterizer raster(strip, options, grid, band, sums);
+        return addAll(raster);
+    }
+    MarkEdgePixels(strip, count, marks);
+    const SampleGrid centreGrid(1);
+    BandRasterizer centres(strip, options, centreGrid, band, sums, &marks, false);
+    if (!addAll(centres)) return false;
+    BandRasterizer samples(strip, options, grid, band, sums, &marks);
+    return addAll(samples);
+}
 
 /// Coverage clamped to 1 and the value scaled with it, so overlapping folds
 /// give the mean of their layers.
@@ -292,21 +503,31 @@ inline void FoldedSample(float coverage, float value, float &c, float &v) {
     }
 }
 
-/// dst = dst x (1 - coverage) + value over columns first..last of one band row,
-/// where `valueRow` (if not null, from column first on) replaces the band's own values.
+/// dst = dst x (1 - coverage) + value over the covered columns among
+/// first..last of one band row, where `valueRow` (if not null, from column
+/// first on) replaces the band's own values.
 void BlendRow(Image &dst, int y, int first, int last, const float *coverage, const float *value,
               const FltPixel *valueRow, FltPixel *work) {
     const ImgRectI &w = dst.DataWindow();
-    const int count = last - first + 1;
-    uint8_t *row = dst.ScanLine(y) + static_cast<size_t>(first - w.x0) * dst.BytesPerPixel();
-    LoadFlt(dst.Depth(), row, count, work);
-    for (int i = 0; i < count; ++i) {
-        float c, v;
-        FoldedSample(coverage[first + i], value[first + i], c, v);
-        if (valueRow) v = valueRow[i].A;
-        work[i].A = work[i].A * (1.f - c) + v;
+    uint8_t *line = dst.ScanLine(y);
+    const size_t pixelBytes = dst.BytesPerPixel();
+    // Only the runs the band covers: a ring's hole is left alone.
+    for (int x = first; x <= last;) {
+        while (x <= last && coverage[x] == 0.f) ++x;
+        const int runFirst = x;
+        while (x <= last && coverage[x] != 0.f) ++x;
+        const int count = x - runFirst;
+        if (count == 0) break;
+        uint8_t *row = line + static_cast<size_t>(runFirst - w.x0) * pixelBytes;
+        LoadFlt(dst.Depth(), row, count, work);
+        for (int i = 0; i < count; ++i) {
+            float c, v;
+            FoldedSample(coverage[runFirst + i], value[runFirst + i], c, v);
+            if (valueRow) v = valueRow[runFirst - first + i].A;
+            work[i].A = work[i].A * (1.f - c) + v;
+        }
+        StoreFlt(dst.Depth(), work, count, row);
     }
-    StoreFlt(dst.Depth(), work, count, row);
 }
 
 BandOutcome RunBand(const StripJob &job, int k) {
@@ -319,11 +540,9 @@ BandOutcome RunBand(const StripJob &job, int k) {
     BandBuffers buf;
     if (!buf.Alloc(band.Width(), band.Height())) return BandOutcome::Dropped;
 
-    BandRasterizer raster(job.strip, job.options, job.grid, band, {buf.value, buf.coverage, buf.rowFirst, buf.rowLast});
-    for (size_t i = 0; i + 2 < job.count; ++i) {
-        if (i % kTrianglesPerAbortPoll == 0 && job.Aborted()) return BandOutcome::Aborted;
-        raster.AddTriangle(i);
-    }
+    if (!AccumulateBand(job.strip, job.count, job.options, job.grid, band,
+                        {buf.value, buf.coverage, buf.rowFirst, buf.rowLast}, [&job] { return job.Aborted(); }))
+        return BandOutcome::Aborted;
 
     // Through a band image: the band over a cleared 16-bit image first (its
     // own value, rounded to 16 bits), then that image into the mask.
@@ -364,8 +583,7 @@ void AccumulateStrip(const StripPoint *strip, size_t count, const ImgRectI &rect
                      float *value, float *coverage) {
     if (!strip || rect.IsNull()) return;
     const SampleGrid grid = GridOf(options);
-    BandRasterizer raster(strip, options, grid, rect, {value, coverage});
-    for (size_t i = 0; i + 2 < count; ++i) raster.AddTriangle(i);
+    AccumulateBand(strip, count, options, grid, rect, {value, coverage}, [] { return false; });
 }
 
 StripRasterResult RasterizeStrip(const StripPoint *strip, size_t count, Image *mask,

@@ -9,7 +9,8 @@
 // 1, those on the outer curve 0 (swapped by `invert`), and the value is
 // interpolated linearly across each triangle.
 //
-// Each pixel is sampled on an n x n grid; a sample belongs to exactly one of
+// Pixels that a curve, an end of the strip or a fold touches are sampled on
+// an n x n grid, the others at their centre; a sample belongs to exactly one of
 // the triangles that share an edge or vertex (the top-left rule with rows
 // counted upward), so a strip that tiles a region covers it exactly once.
 // The band's coverage c and value v meet the mask as
@@ -42,6 +43,10 @@ struct StripRasterOptions {
     bool innerOnEven = true; ///< the even slots of the strip hold the inner curve
     bool invert = false;     ///< 0 on the inner curve, 1 on the outer
     int subSamples = 32;     ///< n: samples per pixel side (1 preview, 8 closed solid, 32 otherwise)
+    /// Take all n x n samples only in the pixels a curve, an end of the strip
+    /// or a fold touches; elsewhere the pixel's centre sample stands for them
+    /// (the same sums wherever one triangle covers the whole pixel).
+    bool edgesOnly = true;
     /// Write into the mask directly (a closed solid line); otherwise each band
     /// draws into a temporary 16-bit band image first, then into the mask.
     bool direct = true;
@@ -64,7 +69,7 @@ ORVANE_API int StripBandCount(int height, int workers);
 /// The raw sums of the band over `rect` (row-major, rect.Width() floats per
 /// row, bottom row first) added to `value` and `coverage`, before the clamp
 /// and the blend: what one band of RasterizeStrip accumulates. Only the
-/// options' innerOnEven, invert and subSamples count here.
+/// options' innerOnEven, invert, subSamples and edgesOnly count here.
 ORVANE_API void AccumulateStrip(const StripPoint *strip, size_t count, const ImgRectI &rect,
                                 const StripRasterOptions &options, float *value, float *coverage);
 
