@@ -73,7 +73,9 @@ TEST(Shape, FlatteningTakesStepsOfAtMostTheToleranceCloseToTheCurve) {
             for (const ShapePoint &p : curve) dense.LineTo(p.x, p.y);
             for (size_t i = 0; i < pts.size(); ++i) {
                 EXPECT_LE(DistanceToPolyline({pts[i].x, pts[i].y}, dense), 1e-6);
-                if (i) EXPECT_LE(std::hypot(pts[i].x - pts[i - 1].x, pts[i].y - pts[i - 1].y), tol * (1 + 1e-9));
+                if (i) {
+                    EXPECT_LE(std::hypot(pts[i].x - pts[i - 1].x, pts[i].y - pts[i - 1].y), tol * (1 + 1e-9));
+                }
             }
             EXPECT_LT(pts.size(), 2 * length / tol + 160 / std::sqrt(tol))
                 << "far more chords than the tolerance needs";
