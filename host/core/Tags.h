@@ -391,6 +391,13 @@ constexpr Tag MaskReach = 0x10060001;
 constexpr uint32_t ReqFlagMaskDomain = 1u << 6;
 constexpr const char *MaskDomainKey = "MaskDomain";
 
+// ---- Matte levels (host/matte/MatteSteps.h: DoLevels, DoLevelsFlt) ---------
+constexpr Tag MatteLevelsChannel = 0x100c0000;  ///< int: 0 red, 1 green, 2 blue, 3 alpha (default)
+constexpr Tag MatteLevelsLow = 0x200c0000;      ///< low threshold over 0..1 (default 0)
+constexpr Tag MatteLevelsHigh = 0x200c0001;     ///< high threshold over 0..1 (default 1)
+constexpr Tag MatteLevelsContrast = 0x200c0002; ///< contract (< 0) / expand (> 0), -1..1 (default 0)
+constexpr Tag MatteLevelsGamma = 0x200c0003;    ///< gamma > 0 (default 1)
+
 // ---- Application attributes (GetApp()->GetAttrB) -------------------------
 /// Rows use fast true powers rather than gamma tables.
 constexpr Tag AppFastPower = 0x10010002;
