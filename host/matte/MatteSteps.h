@@ -20,8 +20,8 @@
 // Thread safety: every step may be called from any thread on images no other
 // thread writes at the same time.
 #include "host/core/Export.h"
-#include "host/core/TagList.h"
 #include "host/core/Object.h"
+#include "host/core/TagList.h"
 
 namespace Orvane {
 
