@@ -24,20 +24,20 @@ constexpr const char *kUsage = "usage: orvane_key_plates FOLDER [WIDTH HEIGHT [S
 /// Writes one image as float EXR (Zip); false, with a line on stderr, when it cannot.
 bool WriteExr(const Image &image, const std::string &path) {
     Ref<ImageFormat> exr = NewImageFormat(ClassRegistry->Find(OvID("OpenEXRFormat"), RegFamilyImageFormat));
-    std::string error;
+    std::string error; // the file's own errors name the file
     std::unique_ptr<FileIO> file = exr ? FileIO::Open(path, FileIO::Mode::Write, error) : nullptr;
     if (!exr) error = "no OpenEXR format in the tool library";
     if (file) {
         exr->SetupSave(nullptr, nullptr);
         Image *img = const_cast<Image *>(&image); // saving reads the image only
         if (!exr->SaveHeader(file.get(), img) || !exr->SaveFrame(0, img))
-            error = exr->Error();
+            error = path + ": " + exr->Error();
         else if (!file->Close())
-            error = "cannot finish writing";
+            error = path + ": cannot finish writing";
         else
             return true;
     }
-    std::fprintf(stderr, "orvane_key_plates: %s: %s\n", path.c_str(), error.c_str());
+    std::fprintf(stderr, "orvane_key_plates: %s\n", error.c_str());
     return false;
 }
 
