@@ -380,7 +380,7 @@ bool KeyerMatte::PostMultiply(Request *req, Image *img, const Values &v) {
 
 Ref<Image> KeyerMatte::Refine(Request *req, Image *img, const Image *src, const Values &v) const {
     Ref<Image> out(img);
-    if (!img->IsNoData()) {
+    if (!img->IsNoData() && !img->DataWindow().IsNull()) {
         if (!BlurMatte(req, img, v) || !Levels(req, img, v) || !Spill(req, img, v) || !Fringe(req, img, v) ||
             !Invert(req, img, v))
             return {};
