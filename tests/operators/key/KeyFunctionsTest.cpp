@@ -1,8 +1,9 @@
 // The keyers' per-pixel functions against models written here from the
 // arithmetic, in double: the chroma box with its soft edge, the channel
 // values of the luma key (hue of the primaries and secondaries, saturation of
-// grey), the threshold ramp with its inclusive ends, the difference key; and
-// the 16-bit forms against the float ones over a grid of 16-bit pixels.
+// grey), the threshold ramp with its inclusive ends; and the 16-bit forms
+// against the float ones over a grid of 16-bit pixels. The difference key is
+// checked through the tool (KeyerToolsTest.cpp).
 #include <gtest/gtest.h>
 
 #include <algorithm>
@@ -157,35 +158,6 @@ TEST(LumaKeyFunction, SixteenBitValuesWithinAStep) {
                     if (ch == LumaHue) d = std::min(d, 1.0 - d);
                     ASSERT_LE(d, 1.0 / 65535 + 1e-6) << "channel " << ch << " at " << r << "," << g << "," << b;
                 }
-}
-
-TEST(DifferenceKeyFunction, LargestComponentDifferenceThroughTheRamp) {
-    struct Case {
-        Rgb f, b;
-        double d;
-    };
-    const Case cases[] = {
-        {{0.5, 0.5, 0.5}, {0.5, 0.5, 0.5}, 0.0},   {{0.5, 0.5, 0.5}, {0.5, 0.51, 0.5}, 0.01},
-        {{0.1, 0.9, 0.3}, {0.2, 0.85, 0.6}, 0.3},  {{1.0, 0.0, 0.0}, {0.0, 0.0, 0.0}, 1.0},
-        {{0.0, 0.25, 0.0}, {0.0, 0.0, 0.0}, 0.25},
-    };
-    for (const Case &c : cases) {
-        const float f[3] = {float(c.f[0]), float(c.f[1]), float(c.f[2])};
-        const float b[3] = {float(c.b[0]), float(c.b[1]), float(c.b[2])};
-        EXPECT_NEAR(KeyDifference(f, b), c.d, 1e-6);
-        EXPECT_NEAR(KeyDifference(b, f), c.d, 1e-6) << "symmetric";
-        const uint16_t f16[3] = {uint16_t(std::lround(c.f[0] * 65535)), uint16_t(std::lround(c.f[1] * 65535)),
-                                 uint16_t(std::lround(c.f[2] * 65535))};
-        const uint16_t b16[3] = {uint16_t(std::lround(c.b[0] * 65535)), uint16_t(std::lround(c.b[1] * 65535)),
-                                 uint16_t(std::lround(c.b[2] * 65535))};
-        EXPECT_NEAR(KeyDifference16(f16, b16) / 65535.0, c.d, 1.0 / 65535);
-        // Through the default ramp 0..0.02.
-        const double want = c.d <= 0 ? 0.0 : c.d >= 0.02 ? 1.0 : c.d / 0.02;
-        EXPECT_NEAR(KeyThreshold(KeyDifference(f, b), 0.f, 0.02f, 1.f / 0.02f), want, 1e-4);
-        EXPECT_NEAR(KeyThreshold16(KeyDifference16(f16, b16), 0, KeySteps16(0.02)) / 65535.0, want,
-                    1.0 / 1310 + 1.0 / 65535)
-            << "a step of D is 1/1311 of the ramp";
-    }
 }
 
 } // namespace
