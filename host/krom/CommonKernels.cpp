@@ -7,6 +7,7 @@
 #include "host/krom/kernels/MaskKernelParams.h"
 #include "host/krom/kernels/MergeKernelParams.h"
 #include "host/krom/kernels/ResizeKernelParams.h"
+#include "host/krom/kernels/UltraKeyerKernelParams.h"
 
 namespace Orvane {
 
@@ -27,6 +28,10 @@ const std::vector<CommonKernel> &CommonKernels() {
         {"MaskMerge", MaskMergeParamsText, kMaskMergeKernel},
         {"ResizeAcross", ResizeParamsText, kResizeKernels},
         {"ResizeDown", ResizeParamsText, kResizeKernels},
+        {"UltraKeyer", UltraKeyerParamsText, kUltraKeyerKernel},
+        {"UltraKeyerSoft", UltraKeyerSoftParamsText, kUltraKeyerSoftKernel},
+        {"UltraKeyerCombine", UltraKeyerCombineParamsText, kUltraKeyerCombineKernel},
+        {"UltraKeyerSubtract", UltraKeyerSubtractParamsText, kUltraKeyerSubtractKernel},
     };
     return kernels;
 }

@@ -25,4 +25,9 @@ extern const char kMergeKernel[];
 extern const char kMaskMergeKernel[];
 /// "ResizeAcross" and "ResizeDown".
 extern const char kResizeKernels[];
+/// "UltraKeyer", "UltraKeyerSoft", "UltraKeyerCombine", "UltraKeyerSubtract".
+extern const char kUltraKeyerKernel[];
+extern const char kUltraKeyerSoftKernel[];
+extern const char kUltraKeyerCombineKernel[];
+extern const char kUltraKeyerSubtractKernel[];
 } // namespace Orvane
