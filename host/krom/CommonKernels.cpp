@@ -4,6 +4,7 @@
 #include "host/krom/kernels/ColorKernelParams.h"
 #include "host/krom/kernels/GeneratorKernelParams.h"
 #include "host/krom/kernels/KernelTexts.h"
+#include "host/krom/kernels/KeyKernelParams.h"
 #include "host/krom/kernels/MaskKernelParams.h"
 #include "host/krom/kernels/MergeKernelParams.h"
 #include "host/krom/kernels/ResizeKernelParams.h"
@@ -26,6 +27,9 @@ const std::vector<CommonKernel> &CommonKernels() {
         {"BlurColumns", BlurColumnsParamsText, kBlurColumnsKernel},
         {"Merge", MergeParamsText, kMergeKernel},
         {"MaskMerge", MaskMergeParamsText, kMaskMergeKernel},
+        {"ChromaKeyer", ChromaKeyerParamsText, kChromaKeyerKernel},
+        {"LumaKey", LumaKeyParamsText, kLumaKeyKernel},
+        {"DifferenceKeyer", DifferenceKeyerParamsText, kDifferenceKeyerKernel},
         {"ResizeAcross", ResizeParamsText, kResizeKernels},
         {"ResizeDown", ResizeParamsText, kResizeKernels},
         {"UltraKeyer", UltraKeyerParamsText, kUltraKeyerKernel},

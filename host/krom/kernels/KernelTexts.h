@@ -23,6 +23,12 @@ extern const char kBlurColumnsKernel[];
 extern const char kMergeKernel[];
 /// "MaskMerge".
 extern const char kMaskMergeKernel[];
+/// "ChromaKeyer".
+extern const char kChromaKeyerKernel[];
+/// "LumaKey".
+extern const char kLumaKeyKernel[];
+/// "DifferenceKeyer".
+extern const char kDifferenceKeyerKernel[];
 /// "ResizeAcross" and "ResizeDown".
 extern const char kResizeKernels[];
 /// "UltraKeyer", "UltraKeyerSoft", "UltraKeyerCombine", "UltraKeyerSubtract".
