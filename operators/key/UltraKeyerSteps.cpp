@@ -18,6 +18,7 @@
 #include "host/krom/KROMComputeNode.h"
 #include "host/krom/PointKernel.h"
 #include "host/krom/kernels/UltraKeyerKernelParams.h"
+#include "operators/key/KeyFunctions.h"
 
 namespace Orvane {
 
@@ -59,21 +60,6 @@ int64_t DivRound(int64_t a, int64_t b) {
 
 // ---- the pre-matte ----
 
-void PreMatteAxes(float r, float g, float b, float axes[4]) {
-    const float y = 0.299f * r + 0.587f * g + 0.114f * b;
-    axes[0] = (r - y) * 0.61035f + 0.5f;
-    axes[1] = (g - y) * 0.76294f + 0.5f;
-    axes[2] = (b - y) * 0.45776f + 0.5f;
-    axes[3] = y;
-}
-
-void PreMatteAxes16(int r, int g, int b, int axes[4]) {
-    const int y = (19235 * g + 9797 * r + 3736 * b) >> 15;
-    const int k[3] = {20000, 25000, 15000}, c[3] = {r, g, b};
-    for (int i = 0; i < 3; ++i) axes[i] = static_cast<int>(Clamp((((c[i] - y) * k[i]) >> 15) + 32768, 0, 65535));
-    axes[3] = y;
-}
-
 /// A limit of the box in 16-bit steps, rounded in float as the kernel does.
 int Code16(float v) { return static_cast<int>(std::floor(std::clamp(v * 65535.f + 0.5f, -1.f, 65536.f))); }
 
@@ -87,15 +73,15 @@ struct Box16 {
 
 float PreMatteAlpha(const PreMatteRanges &box, float r, float g, float b) {
     float v[4];
-    PreMatteAxes(r, g, b, v);
+    ChromaKeyAxes(0, r, g, b, v);
     const bool inside = v[0] >= box.low[0] && v[0] <= box.high[0] && v[1] >= box.low[1] && v[1] <= box.high[1] &&
                         v[2] >= box.low[2] && v[2] <= box.high[2] && v[3] >= box.low[3] && v[3] <= box.high[3];
     return inside ? 0.f : 1.f;
 }
 
 uint16_t PreMatteAlpha16(const Box16 &box, int r, int g, int b) {
-    int v[4];
-    PreMatteAxes16(r, g, b, v);
+    int32_t v[4];
+    ChromaKeyAxes16(0, r, g, b, v);
     for (int i = 0; i < 4; ++i)
         if (v[i] < box.low[i] || v[i] > box.high[i]) return 65535;
     return 0;
@@ -112,7 +98,7 @@ FltPixel SoftPixel(const UltraKeyerValues &v, const FltPixel &in) {
     const float src[3] = {in.R, in.G, in.B};
     float test[3] = {in.R, in.G, in.B};
     if (v.satr != 0.f) {
-        const float y = 0.299f * in.R + 0.587f * in.G + 0.114f * in.B;
+        const float y = KeyLuminance(in.R, in.G, in.B);
         for (float &t : test) t = v.sat * t - v.satr * y;
     }
     const int *o = kOrder[v.vlColor];
@@ -149,7 +135,7 @@ Pixel SoftPixel16(const UltraKeyerValues &v, const Pixel &in) {
     const int64_t src[3] = {in.R, in.G, in.B};
     int64_t test[3] = {in.R, in.G, in.B};
     if (v.satr1024 != 0) {
-        const int64_t y = (19235 * src[1] + 9797 * src[0] + 3736 * src[2]) >> 15;
+        const int64_t y = KeyLuminance16(in.R, in.G, in.B);
         for (int64_t &t : test) t = Clamp((v.sat1024 * t - v.satr1024 * y) >> 10, -kFixedLimit, kFixedLimit);
     }
     const int *o = kOrder[v.vlColor];
@@ -517,7 +503,7 @@ PreMatteRanges PickPreMatteRanges(const Image &img, const ImgRectI &rect, bool s
         LoadFlt(img.Depth(), img.PixelAddress(area.x0, y), area.Width(), row.data());
         for (const FltPixel &p : row) {
             float v[4];
-            PreMatteAxes(p.R, p.G, p.B, v);
+            ChromaKeyAxes(0, p.R, p.G, p.B, v);
             for (int i = 0; i < 4; ++i) {
                 if (!subtract) {
                     r.low[i] = std::min(r.low[i], v[i] - kPickMargin);
