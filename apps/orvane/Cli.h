@@ -74,5 +74,6 @@ int RunEval(const std::vector<std::string> &args);
 int RunInfo(const std::vector<std::string> &args);
 int RunRender(const std::vector<std::string> &args);
 int RunColorSpaces(const std::vector<std::string> &args);
+int RunPick(const std::vector<std::string> &args);
 
 } // namespace Orvane::Cli

@@ -76,6 +76,17 @@ const Command kCommands[] = {
     {"remove", RunRemove, R"(orvane remove FLOW TOOL...
   Removes tools (their links go with them) and saves the flow.
 )"},
+    {"pick", RunPick, R"(orvane pick FLOW TOOL X0,Y0,X1,Y1 [options]
+  Picks colours for TOOL (a keyer) from a rectangle of its image, as dragging
+  over the image in a viewer does, and saves the values the tool found into
+  the flow. X0,Y0 and X1,Y1 are the corner pixels, both included, columns from
+  the left and rows from the bottom.
+  --subtract            take the picked colours out of the ranges
+  --fractions           the corners are frame fractions (0..1) instead
+  --time T              the frame to pick from (default: the render range's start)
+  --device D, --lenient as for render
+  Exit: 0 picked and saved, 2 bad command line or document, 3 nothing picked.
+)"},
     {"tools", RunTools, R"(orvane tools [--search WORD] [--all]
   Lists the classes: ID, name, kind, attributes, category, whether built.
   --all adds abstract bases and hidden classes.

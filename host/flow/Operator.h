@@ -117,6 +117,14 @@ public:
     virtual void Process(Request *req);
     /// The host's common controls (blend, channels, effect mask).
     virtual void PostProcess(Request *req);
+    /// A command from a viewer or the command line (ControlCommand.h: CCMD_*),
+    /// on the main thread between renders. True when the tool took it; a tool
+    /// whose next result changes by it has its cached results dropped by the
+    /// caller.
+    virtual bool ControlCommand(int command, const TagList &tags) {
+        (void)command, (void)tags;
+        return false;
+    }
     virtual void PreCalcPreProcess(Request *req) { PreProcess(req); }
     virtual void PreCalcProcess(Request *req) { Process(req); }
     virtual void PreCalcPostProcess(Request *req) { PostProcess(req); }

@@ -124,6 +124,25 @@ void OrvaneDoc::SetConsoleListener(std::function<void(const ConsoleLine &)> list
     listener_ = std::move(listener);
 }
 
+void OrvaneDoc::DocExecute(std::function<void(OrvaneDoc &)> edit, std::string undoName) {
+    std::lock_guard<std::mutex> guard(deferredLock_);
+    deferred_.emplace_back(std::move(edit), std::move(undoName));
+}
+
+std::vector<std::string> OrvaneDoc::RunDeferred() {
+    std::vector<std::pair<std::function<void(OrvaneDoc &)>, std::string>> edits;
+    {
+        std::lock_guard<std::mutex> guard(deferredLock_);
+        edits.swap(deferred_);
+    }
+    std::vector<std::string> names;
+    for (auto &[edit, name] : edits) {
+        edit(*this);
+        names.push_back(std::move(name));
+    }
+    return names;
+}
+
 Operator *OrvaneDoc::AddTool(OvID classId, const std::string &name) {
     if (!ClassRegistry) return nullptr;
     const Registry *row = ClassRegistry->Find(classId);

@@ -7,12 +7,13 @@
 // come; tools write failures under ConsoleError (code 60).
 //
 // Thread safety: tools, links and preferences change on the main thread
-// between renders. PrintF may be called from any thread.
+// between renders. PrintF and DocExecute may be called from any thread.
 #include <cstdarg>
 #include <functional>
 #include <map>
 #include <mutex>
 #include <string>
+#include <utility>
 #include <vector>
 
 #include "host/core/Object.h"
@@ -154,6 +155,14 @@ public:
     /// The result cache shared by this document's renders.
     ResultCache &Cache() { return *cache_; }
 
+    /// Edits that a tool asks for while it renders (the values a pick found),
+    /// queued under a name an undo list would show, and run in order on the
+    /// main thread by RunDeferred once the render is over. DocExecute may be
+    /// called from any thread.
+    void DocExecute(std::function<void(OrvaneDoc &)> edit, std::string undoName);
+    /// Runs the queued edits in order; returns their names.
+    std::vector<std::string> RunDeferred();
+
     /// A write-protected document keeps its values as they are: tools that
     /// would write their own controls while rendering (a height kept in
     /// aspect, centred offsets) leave them alone.
@@ -173,6 +182,8 @@ private:
     std::string filePath_;
     ScriptVal keptTools_ = ScriptVal::Table(), keptFields_ = ScriptVal::Table(), keptPrefs_ = ScriptVal::Table();
     std::map<std::string, DocumentComments> comments_;
+    std::mutex deferredLock_;
+    std::vector<std::pair<std::function<void(OrvaneDoc &)>, std::string>> deferred_;
 };
 
 } // namespace Orvane
