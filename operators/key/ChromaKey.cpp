@@ -2,6 +2,7 @@
 
 #include <cstring>
 #include <memory>
+#include <string>
 
 #include "host/core/Tags.h"
 #include "host/flow/DataTypes.h"
@@ -44,20 +45,11 @@ ChromaKey::ChromaKey(const Registry *reg, const ScriptVal &args, const TagList &
     BeginControlNestTagList("Color Range", "ColorRangeNest", true, {});
     static const char *const axes[4] = {"Red", "Green", "Blue", "Luminance"};
     for (int i = 0; i < 4; ++i) {
-        auto range = [&](double def, int member) {
-            TagList t{{LinkDataType, CLSID_DataType_Number},
-                      {InputControl, CLSID_InputControl_Range},
-                      {ControlGroup, i + 1},
-                      {ControlMember, member},
-                      {InputDefault, def},
-                      {InputSliderLow, 0.0},
-                      {InputSliderHigh, 1.0}};
-            if (member == 0) t.Add({ControlRowLabel, axes[i]});
-            return t;
-        };
         const std::string axis = axes[i];
-        low_[i] = AddInputTagList((axis + " Low").c_str(), (axis + "Low").c_str(), range(0.0, 0));
-        high_[i] = AddInputTagList((axis + " High").c_str(), (axis + "High").c_str(), range(1.0, 1));
+        TagList low = RangeTags(i + 1, 0, 0.0);
+        low.Set({ControlRowLabel, axes[i]});
+        low_[i] = AddInputTagList((axis + " Low").c_str(), (axis + "Low").c_str(), low);
+        high_[i] = AddInputTagList((axis + " High").c_str(), (axis + "High").c_str(), RangeTags(i + 1, 1, 1.0));
     }
     EndControlNest();
     lock_ = AddInputTagList("Lock Color Picking", "LockColorPicking",
@@ -118,6 +110,7 @@ bool ChromaKey::RunDevice(Request *req, const Image *src, Image *dst) const {
     const FltPixel canvas = src->GetCanvasColor();
     const float defaultP[4] = {canvas.R, canvas.G, canvas.B, ChromaKeyAlpha(ranges_, canvas.R, canvas.G, canvas.B)};
     std::memcpy(p.defaultP, defaultP, sizeof defaultP);
+    dst->SetCanvasColor(FltPixel{defaultP[0], defaultP[1], defaultP[2], defaultP[3]});
     std::memcpy(p.lowRGBL, ranges_.low, sizeof p.lowRGBL);
     std::memcpy(p.highRGBL, ranges_.high, sizeof p.highRGBL);
     p.soft = ranges_.soft;

@@ -38,17 +38,8 @@ static ClassRegistration<DifferenceKey, ThreadedOperator>
 DifferenceKey::DifferenceKey(const Registry *reg, const ScriptVal &args, const TagList &tags)
     : SimpleKeyer(reg, args, tags, KeyerMatte::Flavour::Simple) {
     AddControlPageTagList("Controls", {});
-    auto range = [](double def, int member) {
-        return TagList{{LinkDataType, CLSID_DataType_Number},
-                       {InputControl, CLSID_InputControl_Range},
-                       {ControlGroup, 1},
-                       {ControlMember, member},
-                       {InputDefault, def},
-                       {InputSliderLow, 0.0},
-                       {InputSliderHigh, 1.0}};
-    };
-    lowIn_ = AddInputTagList("Low", "Low", range(0.0, 0));
-    highIn_ = AddInputTagList("High", "High", range(0.02, 1));
+    lowIn_ = AddInputTagList("Low", "Low", RangeTags(1, 0, 0.0));
+    highIn_ = AddInputTagList("High", "High", RangeTags(1, 1, 0.02));
     matte_.AddMatteInputs();
     input_ = AddImageInput("Background", "Background", 1, true);
     foregroundIn_ = AddImageInput("Foreground", "Foreground", 2, false);
@@ -71,6 +62,9 @@ bool DifferenceKey::RunDevice(Request *req, const Image *src, const Image *fg, I
     const FltPixel canvas = src->GetCanvasColor();
     const float sp[4] = {canvas.R, canvas.G, canvas.B, canvas.A};
     std::memcpy(p.sp, sp, sizeof sp);
+    const FltPixel fgCanvas = fg->GetCanvasColor();
+    const float fc[3] = {fgCanvas.R, fgCanvas.G, fgCanvas.B}, bc[3] = {canvas.R, canvas.G, canvas.B};
+    dst->SetCanvasColor(FltPixel{canvas.R, canvas.G, canvas.B, KeyThreshold(KeyDifference(fc, bc), p.lo, p.hi, p.dif)});
     const KeyKernelWindows w(*src, *dst);
     std::memcpy(p.inDataWindow, w.inDataWindow, sizeof p.inDataWindow);
     std::memcpy(p.outDataWindow, w.outDataWindow, sizeof p.outDataWindow);
@@ -100,6 +94,10 @@ template <class Px> void DifferenceKey::RunRows(const Image *src, const Image *f
         return out;
     };
     const Px canvasResult = key(canvas, canvas);
+    // Beyond every window both images are their canvas colours.
+    Px fgCanvas = canvas;
+    if (foreground_) CanvasKeyPixel(*foreground_, fgCanvas);
+    dst->SetCanvasColor(key(canvas, fgCanvas));
     const ImgRectI out = dst->DataWindow();
     RunKeyRows<Px>(*this, *src, *dst, [&](const Px *in, Px *res, int x, int y, int n) {
         if (!fg) { // the Background against its own canvas colour
@@ -127,20 +125,24 @@ bool DifferenceKey::DoDiffKeyFlt(Request *, const Image *src, const Image *fg, I
 bool DifferenceKey::FirstMatte(Request *req, const Image *src, Image *dst) {
     const Image *fg = foreground_;
     const ImgRectI window = dst->DataWindow();
-    // The Foreground is read over the output's window at the Background's
-    // depth; an image already of that shape is read as it is.
-    const bool aligned = fg && fg->DataWindow() == window && fg->Depth() == src->Depth() &&
-                         (fg->HasScanLineData() || fg->IsGPUMemDirty());
-    if (aligned && IsGPUEnabled(req, true) && RunDevice(req, src, fg, dst)) return true;
+    // The Foreground is read over the output's window: an image of another
+    // window is copied to it once, canvas beyond it, in float32 or 16-bit
+    // steps so that its canvas colour keeps its precision.
+    const bool aligned = fg && fg->DataWindow() == window && (fg->HasScanLineData() || fg->IsGPUMemDirty());
+    if (aligned && fg->Depth() == src->Depth() && IsGPUEnabled(req, true) && RunDevice(req, src, fg, dst)) return true;
     if (!src->DownloadGPUMem() || (fg && !fg->DownloadGPUMem())) return false;
     Ref<Image> copy;
     if (fg && !aligned) {
-        copy = NewImageTagList({{ImgLikeImage, src}, {ImgDataWindow, &window}, {ImgAbortFlag, dst->AbortFlag()}});
+        const int depth = fg->IsFloat() ? DepthRGBAFlt32 : DepthRGBAInt16;
+        copy = NewImageTagList(
+            {{ImgLikeImage, fg}, {ImgDepth, depth}, {ImgDataWindow, &window}, {ImgAbortFlag, dst->AbortFlag()}});
         if (!copy || !copy->AllocScanLineData()) return false;
         copy->ImageCopy(fg);
         fg = copy.Get();
     }
-    return src->IsFloat() ? DoDiffKeyFlt(req, src, fg, dst) : DoDiffKey(req, src, fg, dst);
+    // 16-bit steps when both images are integer, else float.
+    const bool integer = !src->IsFloat() && !(fg && fg->IsFloat());
+    return integer ? DoDiffKey(req, src, fg, dst) : DoDiffKeyFlt(req, src, fg, dst);
 }
 
 } // namespace Orvane

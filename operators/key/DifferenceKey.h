@@ -4,7 +4,8 @@
 // largest absolute difference of red, green and blue, D, gives alpha 0 at
 // D <= Low, 1 at D >= High and a straight ramp between. Beyond an image's
 // data window its canvas colour counts; without a Foreground the Background
-// is compared with its own canvas colour, so an empty frame keys to 0. The
+// is compared with its own canvas colour, so an empty frame keys to 0. Two
+// integer images are compared in 16-bit steps, any other pair in float. The
 // refining chain follows, without spill and fringe.
 //
 // Thread safety: as SimpleKeyer.
@@ -17,8 +18,8 @@ public:
     DifferenceKey(const Registry *reg, const ScriptVal &args, const TagList &tags);
     size_t SizeOf() const override { return sizeof(*this); }
 
-    /// The first matte of integer images in 16-bit steps, and of float
-    /// images; `fg` (may be null) covers `dst`'s data window at `src`'s depth.
+    /// The first matte in 16-bit steps (both images integer) and in float;
+    /// `fg` (may be null) covers `dst`'s data window, at any depth.
     bool DoDiffKey(Request *req, const Image *src, const Image *fg, Image *dst);
     bool DoDiffKeyFlt(Request *req, const Image *src, const Image *fg, Image *dst);
 

@@ -77,18 +77,21 @@ template <class Px, class Key> struct PointKeySpan {
 };
 
 /// Runs a point keyer at `src`'s depth: keyFlt(in, out, n) on float images,
-/// key16(in, out, n) on integer ones; the canvas colour goes through once.
+/// key16(in, out, n) on integer ones; the canvas colour goes through once and
+/// becomes `dst`'s, the matte beyond its window.
 template <class KeyFlt, class Key16>
 void RunPointKeyRows(ThreadedOperator &op, const Image &src, Image &dst, const KeyFlt &keyFlt, const Key16 &key16) {
     if (src.IsFloat()) {
         FltPixel canvas;
         CanvasKeyPixel(src, canvas);
         keyFlt(&canvas, &canvas, 1);
+        dst.SetCanvasColor(canvas);
         RunKeyRows<FltPixel>(op, src, dst, PointKeySpan<FltPixel, KeyFlt>{keyFlt, canvas});
     } else {
         Pixel canvas;
         CanvasKeyPixel(src, canvas);
         key16(&canvas, &canvas, 1);
+        dst.SetCanvasColor(canvas);
         RunKeyRows<Pixel>(op, src, dst, PointKeySpan<Pixel, Key16>{key16, canvas});
     }
 }

@@ -5,7 +5,6 @@
 
 #include "host/core/Tags.h"
 #include "host/flow/DataTypes.h"
-#include "host/flow/Engine.h"
 #include "host/flow/Operator.h"
 #include "host/flow/Request.h"
 #include "host/image/BlurFilters.h"
@@ -13,17 +12,10 @@
 #include "host/image/NewImage.h"
 #include "host/matte/MaskInputs.h"
 #include "host/matte/MatteSteps.h"
-#include "operators/filter/Blur.h"
-#include "operators/frame/IdChoices.h"
+#include "operators/filter/BlurControls.h"
 
 namespace Orvane {
 namespace {
-
-constexpr IdChoice kFilterButtons[] = {{"Box", "Box"},
-                                       {"Bartlett", "Bartlett"},
-                                       {"Multi-box", "Multi-box"},
-                                       {"Gaussian", "Gaussian"},
-                                       {"Fast Gaussian", "Fast Gaussian"}};
 
 /// Control values are lengths on a 720-wide frame.
 constexpr double kSizeUnit = 720.0;
@@ -47,29 +39,10 @@ TagList Checkbox() {
             {InputMaxAllowed, 1.0}};
 }
 
-/// A domain grown by whole pixels; endless sides stay endless.
-ImgRectI GrownKeepingEndless(ImgRectI r, int dx, int dy) {
-    auto move = [](int &side, int by) {
-        if (!IsEndlessSide(side)) side += by;
-    };
-    move(r.x0, -dx), move(r.x1, dx), move(r.y0, -dy), move(r.y1, dy);
-    return r;
-}
-
 /// The single-channel depth holding what one channel of `depth` holds.
 int MatteDepthOf(int depth) { return depth >= DepthRGBAInt8 ? depth - (DepthRGBAInt8 - DepthAInt8) : depth; }
 
 bool Neutral(double v, double neutral) { return std::fabs(v - neutral) <= kKeyerNoChange; }
-
-/// An input's value at this request: the fetched one, else (CheckRequest runs
-/// before the controls' level is fetched) asked for at the request's time.
-Ref<Parameter> AskValue(Request *req, Input *in) {
-    if (Parameter *fetched = req->GetInputData(in)) return Ref<Parameter>(fetched);
-    if (!in->Link()) return in->ValueAt(req->GetInputTime(in));
-    EvalOptions opt;
-    opt.task = req->GetTask();
-    return Evaluate(in->Link(), req->GetInputTime(in), opt);
-}
 
 } // namespace
 
@@ -123,37 +96,12 @@ void KeyerMatte::AddImageInputs(bool spillColor) {
 
 void KeyerMatte::AddMatteInputs() {
     const bool screen = flavour_ == Flavour::Screen;
-    filter_ = op_.AddInputTagList("Filter", "Filter",
-                                  WithIdChoices({{LinkDataType, CLSID_DataType_OvID},
-                                                 {InputControl, CLSID_InputControl_MultiButtonID},
-                                                 {ButtonsFillRow, 1},
-                                                 {InputDefaultId, OvID("Fast Gaussian")},
-                                                 {InputNotify, 1}},
-                                                kFilterButtons));
+    filter_ = op_.AddInputTagList("Filter", "Filter", BlurFilterTags());
     TagList blur = Slider(0.0, 51);
     blur.Add({InputMinAllowed, 0.0}), blur.Add({InputSliderLow, 0.0}), blur.Add({InputSliderHigh, 10.0});
     blur_ = op_.AddInputTagList("Blur", "MatteBlur", blur);
-    passes_ = op_.AddInputTagList("Num Passes", "Passes",
-                                  {{LinkDataType, CLSID_DataType_Number},
-                                   {InputControl, CLSID_InputControl_Slider},
-                                   {InputInteger, 1},
-                                   {InputDefault, 4.0},
-                                   {InputMinAllowed, 1.0},
-                                   {InputMaxAllowed, 64.0},
-                                   {InputSliderLow, 1.0},
-                                   {InputSliderHigh, 16.0},
-                                   {ControlVisible, 0}});
-    clipping_ = op_.AddInputTagList("Clipping Mode", "ClippingMode",
-                                    {{LinkDataType, CLSID_DataType_OvID},
-                                     {InputControl, CLSID_InputControl_MultiButtonID},
-                                     {ButtonsFillRow, 1},
-                                     {InputDefaultId, ClippingMode_Frame},
-                                     {ListAddItem, "None"},
-                                     {ListItemId, ClippingMode_None},
-                                     {ListAddItem, "Domain"},
-                                     {ListItemId, ClippingMode_Domain},
-                                     {ListAddItem, "Frame"},
-                                     {ListItemId, ClippingMode_Frame}});
+    passes_ = op_.AddInputTagList("Num Passes", "Passes", BlurPassesTags());
+    clipping_ = op_.AddInputTagList("Clipping Mode", "ClippingMode", ClippingModeTags(ClippingMode_Frame));
     TagList contrast = Slider(0.0, 101);
     contrast.Add({InputSliderLow, -1.0}), contrast.Add({InputSliderHigh, 1.0}), contrast.Add({SliderRest, 0.0});
     if (!screen) contrast.Add({InputMinAllowed, -1.0}), contrast.Add({InputMaxAllowed, 1.0});
@@ -198,7 +146,7 @@ void KeyerMatte::NotifyChanged(Input *in, Parameter *param) {
 KeyerMatte::Values KeyerMatte::Read(Request *req) const {
     Values v;
     auto num = [req](Input *in, double def) { return in ? req->GetInputNumber(in, def) : def; };
-    if (filter_) v.filter = Blur::FilterType(req->GetInputID(filter_, OvID("Fast Gaussian")));
+    if (filter_) v.filter = BlurTypeOfFilter(req->GetInputID(filter_, OvID("Fast Gaussian")));
     v.blur = num(blur_, 0.0);
     v.passes = static_cast<int>(std::floor(num(passes_, 4.0) + 0.5));
     v.contrast = num(contrast_, 0.0);
@@ -252,19 +200,9 @@ void KeyerMatte::CheckRequest(Request *req, Input *image, double extraSize) cons
     const AutoImageDoD inDoD(req, image), outDoD(req);
     if (!inDoD || !outDoD) return;
     Values v;
-    auto num = [req](Input *in, double def) {
-        if (!in) return def;
-        const Ref<Parameter> value = AskValue(req, in);
-        const auto *n = dynamic_cast<const Number *>(value.Get());
-        return n ? n->value : def;
-    };
-    auto id = [req](Input *in, OvID def) {
-        if (!in) return def;
-        const Ref<Parameter> value = AskValue(req, in);
-        const auto *i = dynamic_cast<const IDValue *>(value.Get());
-        return i ? i->value : def;
-    };
-    v.filter = Blur::FilterType(id(filter_, OvID("Fast Gaussian")));
+    auto num = [req](Input *in, double def) { return in ? AskInputNumber(req, in, def) : def; };
+    auto id = [req](Input *in, OvID def) { return in ? AskInputID(req, in, def) : def; };
+    v.filter = BlurTypeOfFilter(id(filter_, OvID("Fast Gaussian")));
     v.blur = num(blur_, 0.0);
     v.passes = static_cast<int>(std::floor(num(passes_, 4.0) + 0.5));
     v.fringeSize = num(fringeSize_, 0.0);

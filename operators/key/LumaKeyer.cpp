@@ -45,6 +45,35 @@ struct LumaKey {
     }
 };
 
+/// The depth key: the Z channel beside the pixels (0 beyond the window or
+/// without one), keyed in float at every depth; the canvas once.
+template <class Px> void DepthRows(ThreadedOperator &op, const Image &src, Image &dst, const LumaKey &key) {
+    auto alphaOf = [&key](float z) {
+        const float a = KeyThreshold(z, key.low, key.high, key.inverse);
+        if constexpr (std::is_same_v<Px, FltPixel>)
+            return a;
+        else
+            return static_cast<uint16_t>(std::lround(a * 65535.f));
+    };
+    Px canvas;
+    CanvasKeyPixel(src, canvas);
+    canvas.A = alphaOf(0.f);
+    dst.SetCanvasColor(canvas);
+    const ImgRectI dw = src.DataWindow();
+    const bool hasZ = src.HasAuxChannel(AuxChannelKind::Z);
+    RunKeyRows<Px>(op, src, dst, [&](const Px *in, Px *out, int x, int y, int n) {
+        if (!in) {
+            std::fill(out, out + n, canvas);
+            return;
+        }
+        const float *z = hasZ ? src.AuxRow(AuxChannelKind::Z, y) + (x - dw.x0) : nullptr;
+        for (int i = 0; i < n; ++i) {
+            out[i] = in[i];
+            out[i].A = alphaOf(z ? z[i] : 0.f);
+        }
+    });
+}
+
 } // namespace
 
 LumaKeyer::LumaKeyer(const Registry *reg, const ScriptVal &args, const TagList &tags)
@@ -65,17 +94,8 @@ LumaKeyer::LumaKeyer(const Registry *reg, const ScriptVal &args, const TagList &
                                   {ListAddItem, "Saturation"},
                                   {ListAddItem, "Hue"},
                                   {ListAddItem, "Depth"}});
-    auto range = [](double def, int member) {
-        return TagList{{LinkDataType, CLSID_DataType_Number},
-                       {InputControl, CLSID_InputControl_Range},
-                       {ControlGroup, 1},
-                       {ControlMember, member},
-                       {InputDefault, def},
-                       {InputSliderLow, 0.0},
-                       {InputSliderHigh, 1.0}};
-    };
-    highIn_ = AddInputTagList("High", "High", range(1.0, 1));
-    lowIn_ = AddInputTagList("Low", "Low", range(0.0, 0));
+    highIn_ = AddInputTagList("High", "High", RangeTags(1, 1, 1.0));
+    lowIn_ = AddInputTagList("Low", "Low", RangeTags(1, 0, 0.0));
     matte_.AddMatteInputs();
     input_ = AddImageInput("Input", "Input", 1, true);
     output_ = AddImageOutput();
@@ -97,6 +117,7 @@ bool LumaKeyer::RunDevice(Request *req, const Image *src, Image *dst) const {
     const FltPixel canvas = src->GetCanvasColor();
     const float defaultP[4] = {canvas.R, canvas.G, canvas.B, key(canvas, 0.f)};
     std::memcpy(p.p, defaultP, sizeof defaultP);
+    dst->SetCanvasColor(FltPixel{defaultP[0], defaultP[1], defaultP[2], defaultP[3]});
     p.low = key.low, p.high = key.high, p.diff = key.inverse, p.channelID = channel_;
     const KeyKernelWindows w(*src, *dst);
     std::memcpy(p.srcWindow, w.inDataWindow, sizeof p.srcWindow);
@@ -129,36 +150,10 @@ bool LumaKeyer::RunRows(const Image *src, Image *dst) {
             });
         return true;
     }
-    // Depth: the Z channel beside the pixels (0 beyond the window or without
-    // one), keyed in float at every depth; the canvas once per span.
-    const ImgRectI dw = src->DataWindow();
-    const bool hasZ = src->HasAuxChannel(AuxChannelKind::Z);
-    auto span = [&](const auto *in, auto *out, int x, int y, int n) {
-        using Px = std::remove_cv_t<std::remove_reference_t<decltype(*in)>>;
-        auto alphaOf = [&key](float z) {
-            const float a = KeyThreshold(z, key.low, key.high, key.inverse);
-            if constexpr (std::is_same_v<Px, FltPixel>)
-                return a;
-            else
-                return static_cast<uint16_t>(std::lround(a * 65535.f));
-        };
-        if (!in) {
-            Px canvas;
-            CanvasKeyPixel(*src, canvas);
-            canvas.A = alphaOf(0.f);
-            std::fill(out, out + n, canvas);
-            return;
-        }
-        const float *z = hasZ ? src->AuxRow(AuxChannelKind::Z, y) + (x - dw.x0) : nullptr;
-        for (int i = 0; i < n; ++i) {
-            out[i] = in[i];
-            out[i].A = alphaOf(z ? z[i] : 0.f);
-        }
-    };
     if (src->IsFloat())
-        RunKeyRows<FltPixel>(*this, *src, *dst, span);
+        DepthRows<FltPixel>(*this, *src, *dst, key);
     else
-        RunKeyRows<Pixel>(*this, *src, *dst, span);
+        DepthRows<Pixel>(*this, *src, *dst, key);
     return true;
 }
 

@@ -10,6 +10,16 @@ namespace Orvane {
 SimpleKeyer::SimpleKeyer(const Registry *reg, const ScriptVal &args, const TagList &tags, KeyerMatte::Flavour flavour)
     : ThreadedOperator(reg, args, tags), matte_(*this, flavour) {}
 
+TagList SimpleKeyer::RangeTags(int group, int member, double def) {
+    return {{LinkDataType, CLSID_DataType_Number},
+            {InputControl, CLSID_InputControl_Range},
+            {ControlGroup, group},
+            {ControlMember, member},
+            {InputDefault, def},
+            {InputSliderLow, 0.0},
+            {InputSliderHigh, 1.0}};
+}
+
 Input *SimpleKeyer::AddImageInput(const char *name, const char *id, int main, bool required) {
     return AddInputTagList(name, id,
                            {{LinkDataType, CLSID_DataType_Image},

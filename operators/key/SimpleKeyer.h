@@ -33,6 +33,9 @@ protected:
     /// memory ran out.
     virtual bool FirstMatte(Request *req, const Image *src, Image *dst) = 0;
 
+    /// A Range control's half: member 0 the low end, 1 the high end of the
+    /// pair `group`, slider 0 to 1.
+    static TagList RangeTags(int group, int member, double def);
     /// The main image link and the output; the tool adds them.
     Input *AddImageInput(const char *name, const char *id, int main, bool required);
     Output *AddImageOutput();

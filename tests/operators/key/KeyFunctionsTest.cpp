@@ -11,34 +11,12 @@
 #include <string>
 
 #include "operators/key/KeyFunctions.h"
+#include "tests/operators/key/KeyModels.h"
 
 namespace Orvane {
 namespace {
 
-using Rgb = std::array<double, 3>;
-
-double Luma(const Rgb &c) { return 0.299 * c[0] + 0.587 * c[1] + 0.114 * c[2]; }
-
-/// The chroma key of a colour: distance outside the box per axis, the largest
-/// over the soft range.
-double ChromaModel(const ChromaKeyRanges &k, const Rgb &c) {
-    const double y = Luma(c);
-    const double scale[3] = {0.61035, 0.76294, 0.45776};
-    double v[4];
-    for (int i = 0; i < 3; ++i) v[i] = k.keyType == 0 ? (c[i] - y) * scale[i] + 0.5 : c[i];
-    v[3] = y;
-    double outside = 0.0;
-    for (int i = 0; i < 4; ++i) outside = std::max({outside, v[i] - k.high[i], k.low[i] - v[i]});
-    if (outside <= 0.0) return 0.0;
-    return k.soft > 0.0 ? std::min(outside, double(k.soft)) / k.soft : 1.0;
-}
-
-ChromaKeyRanges Ranges(int keyType, std::array<float, 4> low, std::array<float, 4> high, float soft) {
-    ChromaKeyRanges k;
-    k.keyType = keyType, k.soft = soft;
-    for (int i = 0; i < 4; ++i) k.low[i] = low[i], k.high[i] = high[i];
-    return k;
-}
+using namespace keytest;
 
 TEST(ChromaKeyFunction, BoxEndsIncludedSoftEdgeAndHardBox) {
     const ChromaKeyRanges plain = Ranges(1, {0.25f, 0.5f, 0.f, 0.f}, {0.75f, 1.f, 0.5f, 1.f}, 0.f);
@@ -107,21 +85,6 @@ TEST(ChromaKeyFunction, SixteenBitFormFollowsTheFloatForm) {
     }
 }
 
-/// Hue as the hexcone's angle over a turn: the sector of the largest
-/// component and the position within it, in sixths.
-double HueModel(const Rgb &c) {
-    const double mx = std::max({c[0], c[1], c[2]}), mn = std::min({c[0], c[1], c[2]});
-    if (mx - mn <= 1e-6) return 0.0;
-    double sixths;
-    if (mx == c[0])
-        sixths = std::fmod((c[1] - c[2]) / (mx - mn) + 6.0, 6.0);
-    else if (mx == c[1])
-        sixths = (c[2] - c[0]) / (mx - mn) + 2.0;
-    else
-        sixths = (c[0] - c[1]) / (mx - mn) + 4.0;
-    return sixths / 6.0;
-}
-
 TEST(LumaKeyFunction, ChannelValues) {
     struct Case {
         Rgb c;
@@ -186,11 +149,7 @@ TEST(LumaKeyFunction, SixteenBitValuesWithinAStep) {
             for (int g = 0; g <= 65535; g += 4369)
                 for (int b = 0; b <= 65535; b += 5461) {
                     const Rgb c = {r / 65535.0, g / 65535.0, b / 65535.0};
-                    double want = ch == LumaHue ? HueModel(c) : ch == LumaLuminance ? Luma(c) : 0.0;
-                    if (ch == LumaSaturation) {
-                        const double mx = std::max({c[0], c[1], c[2]}), mn = std::min({c[0], c[1], c[2]});
-                        want = mx - mn <= 1e-6 ? 0.0 : (mx - mn) / mx;
-                    }
+                    double want = ch == LumaHue ? HueModel(c) : ch == LumaLuminance ? Luma(c) : SaturationModel(c);
                     if (ch <= LumaAlpha) want = std::array<double, 4>{c[2], c[1], c[0], 0.5}[ch];
                     const int32_t v = LumaKeyValue16(ch, r, g, b, 32768);
                     // Hue wraps: just below 1 and 0 are neighbours.
