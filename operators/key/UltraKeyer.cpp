@@ -4,12 +4,13 @@
 
 #include "host/core/Tags.h"
 #include "host/flow/DataTypes.h"
-#include "host/flow/Engine.h"
+#include "host/flow/OrvaneDoc.h"
 #include "host/flow/Request.h"
 #include "host/image/BlurFilters.h"
 #include "host/image/Image.h"
 #include "host/image/NewImage.h"
 #include "host/matte/MatteSteps.h"
+#include "operators/filter/BlurControls.h"
 #include "operators/frame/Registration.h"
 
 namespace Orvane {
@@ -31,6 +32,10 @@ static ClassRegistration<UltraKeyer, ThreadedOperator>
                     {RegSupportsGPUImages, 1}});
 
 namespace {
+
+/// The range inputs in the order of PreMatteRanges: low limits, then high.
+constexpr const char *kRangeIds[8] = {"RedLow",  "GreenLow",  "BlueLow",  "LuminanceLow",
+                                      "RedHigh", "GreenHigh", "BlueHigh", "LuminanceHigh"};
 
 /// The pre-matte's blur: passes, and the level its alpha is cut at.
 constexpr int kPreMattePasses = 2;
@@ -54,26 +59,6 @@ TagList Checkbox(double def, std::initializer_list<TagItem> more = {}) {
               {InputMaxAllowed, 1.0}};
     for (const TagItem &item : more) t.Add(item);
     return t;
-}
-
-/// A number input's value for this request. CheckRequest runs before the
-/// controls are fetched, so what is not fetched yet is asked for here.
-double AskNumber(Request *req, Input *in, double def) {
-    Ref<Parameter> value(req->GetInputData(in));
-    if (!value) {
-        EvalOptions opt;
-        opt.task = req->GetTask();
-        value = in->Link() ? Evaluate(in->Link(), req->GetInputTime(in), opt) : in->ValueAt(req->GetInputTime(in));
-    }
-    const auto *n = dynamic_cast<const Number *>(value.Get());
-    return n ? n->value : def;
-}
-
-/// Rows written by a host step leave a device copy of the image stale: it is
-/// dropped, so that the next kernel uploads the rows.
-bool OnHost(bool ok, Image *img) {
-    if (img) img->SetGPUMem(nullptr, false);
-    return ok;
 }
 
 } // namespace
@@ -107,8 +92,7 @@ UltraKeyer::UltraKeyer(const Registry *reg, const ScriptVal &args, const TagList
                                   Slider(0.0, 0.0, 1.0, {{InputMinAllowed, 0.0}, {InputMaxAllowed, 1.0}}));
     BeginControlNestTagList("Pre Matte Range", "PreMatteRangeNest", true, {});
     static const char *const kAxes[4] = {"Red", "Green", "Blue", "Luminance"};
-    for (int i = 0; i < 4; ++i) {
-        const std::string axis = kAxes[i];
+    for (int i = 0; i < 4; ++i)
         for (int member = 0; member < 2; ++member) {
             TagList t{{LinkDataType, CLSID_DataType_Number},
                       {InputControl, CLSID_InputControl_Range},
@@ -118,12 +102,11 @@ UltraKeyer::UltraKeyer(const Registry *reg, const ScriptVal &args, const TagList
                       {InputSliderLow, 0.0},
                       {InputSliderHigh, 1.0}};
             if (member == 0) t.Add({ControlRowLabel, kAxes[i]});
-            const std::string end = member ? "High" : "Low";
-            (member ? high_ : low_)[i] = AddInputTagList((axis + " " + end).c_str(), (axis + end).c_str(), t);
+            const std::string label = std::string(kAxes[i]) + (member ? " High" : " Low");
+            (member ? high_ : low_)[i] = AddInputTagList(label.c_str(), kRangeIds[4 * member + i], t);
         }
-    }
     EndControlNest();
-    AddInputTagList("Lock Color Picking", "LockColorPicking", Checkbox(0.0, {{InputPassive, 1}}));
+    lock_ = AddInputTagList("Lock Color Picking", "LockColorPicking", Checkbox(0.0, {{InputPassive, 1}}));
     preMatteSize_ =
         AddInputTagList("Pre Matte Size", "PreMatteSize",
                         Slider(0.0, 0.0, 50.0, {{SliderSteps, 51}, {InputMinAllowed, 0.0}, {InputMaxAllowed, 50.0}}));
@@ -164,7 +147,7 @@ void UltraKeyer::NotifyChanged(Input *in, Parameter *param, double time, TagList
 
 void UltraKeyer::CheckRequest(Request *req) {
     ThreadedOperator::CheckRequest(req);
-    if (req->GetPri() == input_->Priority()) matte_.CheckRequest(req, input_, AskNumber(req, preMatteSize_, 0.0));
+    if (req->GetPri() == input_->Priority()) matte_.CheckRequest(req, input_, AskInputNumber(req, preMatteSize_, 0.0));
 }
 
 UltraKeyer::Keying UltraKeyer::Read(Request *req) {
@@ -207,30 +190,27 @@ Ref<Image> UltraKeyer::Key(Request *req, const Image *src, Ref<Image> dst, const
     if (preMatte) {
         if (!DoUltraKeyer(req, src, w, k.ranges, k.device)) return {};
         if (k.preMatteSize > kKeyerNoChange &&
-            !OnHost(MatteCore_DoSoftenChannel(req, w, MatteAlpha, k.preMatteSize, kPreMattePasses, BlurGaussian) &&
-                        KeyerMatte::LevelsOn(req, w, MatteAlpha, kPreMatteLow, 1.0, 0.0, 1.0),
-                    w))
+            !(MatteCore_DoSoftenChannel(req, w, MatteAlpha, k.preMatteSize, kPreMattePasses, BlurGaussian) &&
+              KeyerMatte::LevelsOn(req, w, MatteAlpha, kPreMatteLow, 1.0, 0.0, 1.0)))
             return {};
         if (!DoCombine(req, w, dst.Get(), k.device)) return {};
-    } else if (v.sub && !OnHost(MatteCore_DoCopyChannel(req, dst.Get(), w, MatteAlpha, MatteAlpha), w)) {
+    } else if (v.sub && !MatteCore_DoCopyChannel(req, dst.Get(), w, MatteAlpha, MatteAlpha)) {
         return {};
     }
-    if (!OnHost(KeyerMatte::BlurMatte(req, dst.Get(), mv) && KeyerMatte::Levels(req, dst.Get(), mv), dst.Get()))
-        return {};
+    if (!KeyerMatte::BlurMatte(req, dst.Get(), mv) || !KeyerMatte::Levels(req, dst.Get(), mv)) return {};
     if (v.sub && !DoSubtract(req, src, dst.Get(), w, k.device)) return {};
     // A solid matte: the colour follows the alpha it gives; the alpha itself
     // is given with the other mattes below.
     bool inverted = false;
     if (const Image *solid = matte_.SolidMask(req, &inverted); solid && v.sub) {
-        if (!OnHost(MatteCore_DoCopyChannel(req, dst.Get(), w, MatteAlpha, MatteAlpha), w)) return {};
+        if (!MatteCore_DoCopyChannel(req, dst.Get(), w, MatteAlpha, MatteAlpha)) return {};
         dst = DoGarbageMatte(req, dst.Get(), solid, GarbageMatteSolid, false, inverted);
-        if (!dst || !OnHost(true, dst.Get()) || !DoSubtract(req, src, dst.Get(), w, k.device) ||
-            !OnHost(MatteCore_DoCopyChannel(req, w, dst.Get(), MatteAlpha, MatteAlpha), dst.Get()))
+        if (!dst || !DoSubtract(req, src, dst.Get(), w, k.device) ||
+            !MatteCore_DoCopyChannel(req, w, dst.Get(), MatteAlpha, MatteAlpha))
             return {};
     }
-    if (!OnHost(KeyerMatte::Spill(req, dst.Get(), mv) && KeyerMatte::Fringe(req, dst.Get(), mv) &&
-                    KeyerMatte::Invert(req, dst.Get(), mv),
-                dst.Get()))
+    if (!KeyerMatte::Spill(req, dst.Get(), mv) || !KeyerMatte::Fringe(req, dst.Get(), mv) ||
+        !KeyerMatte::Invert(req, dst.Get(), mv))
         return {};
     dst = matte_.ApplyMasks(req, dst.Get());
     if (!dst) return {};
@@ -240,8 +220,42 @@ Ref<Image> UltraKeyer::Key(Request *req, const Image *src, Ref<Image> dst, const
             dst = DoGarbageMatte(req, dst.Get(), legacy, GarbageMatteGarbage, false, invert);
             if (!dst) return {};
         }
-    if (!OnHost(KeyerMatte::PostMultiply(req, dst.Get(), mv), dst.Get())) return {};
+    if (!KeyerMatte::PostMultiply(req, dst.Get(), mv)) return {};
     return dst;
+}
+
+bool UltraKeyer::ControlCommand(int command, const TagList &tags) {
+    if (command != CCMD_Select) return ThreadedOperator::ControlCommand(command, tags);
+    const auto *locked = dynamic_cast<const Number *>(lock_->ValueAt(TimeUndefined).Get());
+    if (locked && locked->value >= 0.5) {
+        if (OrvaneDoc *doc = GetDoc()) doc->PrintF(ConsoleWarning, "%s: Lock Color Picking is on\n", Name().c_str());
+        return false;
+    }
+    const std::lock_guard<std::mutex> hold(pickLock_);
+    pick_ = PickRect::FromTags(tags);
+    return true;
+}
+
+void UltraKeyer::Pick(const Image &src, const PreMatteRanges &ranges) {
+    std::optional<PickRect> pick;
+    {
+        const std::lock_guard<std::mutex> hold(pickLock_);
+        pick.swap(pick_);
+    }
+    OrvaneDoc *doc = GetDoc();
+    if (!pick || !doc) return;
+    const ImgRectI rect = PickRectPixels(src, pick->left, pick->bottom, pick->right, pick->top);
+    const PreMatteRanges picked = PickPreMatteRanges(src, rect, pick->subtract, ranges);
+    float values[8];
+    for (int i = 0; i < 4; ++i) values[i] = picked.low[i], values[4 + i] = picked.high[i];
+    // The tool is found by name when the edit runs, so a tool deleted meanwhile is no harm.
+    doc->DocExecute(
+        [name = Name(), values](OrvaneDoc &d) {
+            if (Operator *tool = d.FindTool(name))
+                for (int i = 0; i < 8; ++i)
+                    if (Input *in = tool->FindInput(kRangeIds[i])) in->SetValue(MakeRef<Number>(values[i]));
+        },
+        "UltraKeyer Pick");
 }
 
 void UltraKeyer::Process(Request *req) {
@@ -251,6 +265,7 @@ void UltraKeyer::Process(Request *req) {
         return;
     }
     const Keying k = Read(req);
+    if (!req->IsPreCalc()) Pick(*src, k.ranges);
     Ref<Image> dst = matte_.NewMatteImage(req, input_, src, k.matte, k.preMatteSize);
     if (dst && dst->IsMask()) { // a one-channel source keys as grey: the result needs colour
         const ImgRectI window = dst->DataWindow(), valid = dst->ValidWindow();

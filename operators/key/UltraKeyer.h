@@ -26,18 +26,24 @@
 // the region asked for grown by the blurs' reach (CheckRequest asks the
 // source for it), so the blurs see past the region's edges.
 //
-// Picking. The host has no command path from a viewer to a tool yet, so the
-// pick is not wired: PickPreMatteRanges (UltraKeyerSteps.h) is the walk a
-// pick command will run over the source, with these rules: a pick is refused
-// while Lock Color Picking is on; a normal pick while every range stands at
-// its default starts from an empty box (the picked colours alone make the
-// pre-matte); the rectangle comes in frame fractions (PickRectPixels).
+// Picking. ControlCommand takes CCMD_Select unless Lock Color Picking is on:
+// it keeps the rectangle (frame fractions) until the next pixel request,
+// whose Process walks the source under it (PickPreMatteRanges: a normal pick
+// widens the ranges, starting from an empty box while every range stands at
+// its default; a subtracting pick narrows them) and queues the new ranges on
+// the document (DocExecute, "UltraKeyer Pick"). That render still keys with
+// the ranges it was asked with, so that its result matches its inputs; the
+// next one keys with the picked ranges.
 //
 // Failure: a missing input gives no output; memory refused fails the request
 // with the tool's line; an abandoned render gives no output silently.
 //
 // Thread safety: one request at a time (the tool's request lock); the steps
 // spread rows over the workers.
+#include <mutex>
+#include <optional>
+
+#include "host/flow/ControlCommand.h"
 #include "host/flow/Operator.h"
 #include "operators/key/KeyerMatte.h"
 #include "operators/key/UltraKeyerSteps.h"
@@ -52,6 +58,7 @@ public:
     void NotifyChanged(Input *in, Parameter *param, double time, TagList *tags) override;
     void CheckRequest(Request *req) override;
     void Process(Request *req) override;
+    bool ControlCommand(int command, const TagList &tags) override;
 
 private:
     /// What one request keys with.
@@ -63,14 +70,19 @@ private:
         bool device = false; ///< the steps try their kernels first
     };
     Keying Read(Request *req);
+    /// Runs a pending pick over `src`; its ranges go to the document.
+    void Pick(const Image &src, const PreMatteRanges &ranges);
     /// Steps 2 to 8 on `dst`, an image of the tool's own over the source;
     /// the result (dst or a widened image), null when a step failed.
     Ref<Image> Key(Request *req, const Image *src, Ref<Image> dst, const Keying &k) const;
 
     KeyerMatte matte_;
-    Input *background_[3], *weight_[2], *correction_, *separation_, *low_[4], *high_[4], *preMatteSize_, *reset_,
-        *subtract_, *legacyGarbage_, *garbageInverted_, *input_;
+    Input *background_[3], *weight_[2], *correction_, *separation_, *low_[4], *high_[4], *lock_, *preMatteSize_,
+        *reset_, *subtract_, *legacyGarbage_, *garbageInverted_, *input_;
     Output *output_;
+
+    std::mutex pickLock_;
+    std::optional<PickRect> pick_; ///< a select waiting for the next pixel request
 };
 
 } // namespace Orvane

@@ -487,7 +487,10 @@ bool DoSubtract(Request *req, const Image *src, Image *dst, const Image *old, bo
 }
 
 ImgRectI PickRectPixels(const Image &img, double left, double bottom, double right, double top) {
-    auto pixel = [](double f, int size) { return static_cast<int>(std::clamp(std::floor(f * size), -1e9, 1e9)); };
+    // A fraction made from a whole pixel may come back a hair below it.
+    auto pixel = [](double f, int size) {
+        return static_cast<int>(std::clamp(std::floor(f * size + 1e-6), -1e9, 1e9));
+    };
     return ImgRectI(pixel(left, img.Width()), pixel(bottom, img.Height()), pixel(right, img.Width()) + 1,
                     pixel(top, img.Height()) + 1);
 }
