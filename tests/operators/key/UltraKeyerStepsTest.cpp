@@ -132,7 +132,9 @@ TEST(UltraKeyerSoft, FloatAndFixedPointAgainstTheModel) {
     } depths[] = {
         {DepthRGBAFlt32, 2e-5}, {DepthRGBAFlt16, 2e-5}, {DepthRGBAInt16, 6e-4}, {DepthRGBAInt8, 0.5 / 255 + 6e-4}};
     for (const SoftCase &k : kSoftCases)
-        for (const auto &[depth, tol] : depths) {
+        for (const auto &d : depths) {
+            const int depth = d.depth;
+            const double tol = d.tol;
             SCOPED_TRACE(std::string(k.what) + ", depth " + std::to_string(depth));
             Ref<Image> src = Plate(k.bg, depth, dw);
             const ImgRectI out(-2, 0, 44, 32); // reaches the canvas on three sides
