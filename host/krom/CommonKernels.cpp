@@ -8,6 +8,7 @@
 #include "host/krom/kernels/MaskKernelParams.h"
 #include "host/krom/kernels/MergeKernelParams.h"
 #include "host/krom/kernels/ResizeKernelParams.h"
+#include "host/krom/kernels/UltraKeyerKernelParams.h"
 
 namespace Orvane {
 
@@ -31,6 +32,10 @@ const std::vector<CommonKernel> &CommonKernels() {
         {"DifferenceKeyer", DifferenceKeyerParamsText, kDifferenceKeyerKernel},
         {"ResizeAcross", ResizeParamsText, kResizeKernels},
         {"ResizeDown", ResizeParamsText, kResizeKernels},
+        {"UltraKeyer", UltraKeyerParamsText, kUltraKeyerKernel},
+        {"UltraKeyerSoft", UltraKeyerSoftParamsText, kUltraKeyerSoftKernel},
+        {"UltraKeyerCombine", UltraKeyerCombineParamsText, kUltraKeyerCombineKernel},
+        {"UltraKeyerSubtract", UltraKeyerSubtractParamsText, kUltraKeyerSubtractKernel},
     };
     return kernels;
 }

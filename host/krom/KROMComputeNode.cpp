@@ -127,26 +127,25 @@ bool KROMComputeNode::ExecKernelI(Request *req, const char *name, const char *so
     const bool ok = task->Execute(name, [&](IDeviceContext *ctx) {
         std::unique_ptr<KROMComputeNode> node = Create(ctx, name, source, paramStructText, false);
         std::vector<std::unique_ptr<KROMBuffer>> buffers;
-        Image *output = nullptr;
-        const KROMBuffer *outBuf = nullptr, *firstIn = nullptr;
+        std::vector<std::pair<Image *, const KROMBuffer *>> outputs;
+        const KROMBuffer *firstIn = nullptr;
         for (const auto &[argName, img] : images) {
             if (!argName) break;
-            const bool isOutput = std::string(argName) == "output";
+            const bool isOutput = std::strncmp(argName, "output", 6) == 0;
             buffers.push_back(KROMBuffer::CreateImage(ctx, img, isOutput ? KROMBufferWrite : KROMBufferRead));
             if (!buffers.back()->IsValid()) {
                 failure = "\"" + std::string(argName) + "\": " + buffers.back()->Error();
                 return false;
             }
             if (isOutput) {
-                output = img;
-                outBuf = buffers.back().get();
-                node->AddOutput(argName, outBuf);
+                outputs.emplace_back(img, buffers.back().get());
+                node->AddOutput(argName, buffers.back().get());
             } else {
                 if (!firstIn) firstIn = buffers.back().get();
                 node->AddInput(argName, buffers.back().get());
             }
         }
-        if (!node->IsValid() || !output) {
+        if (!node->IsValid() || outputs.empty()) {
             failure = node->IsValid() ? "no output image" : node->Error();
             return false;
         }
@@ -157,14 +156,14 @@ bool KROMComputeNode::ExecKernelI(Request *req, const char *name, const char *so
             std::memcpy(bytes + offset, &order, sizeof order);
         };
         fillOrder(srcCompOrderOffset, firstIn);
-        fillOrder(dstCompOrderOffset, outBuf);
+        fillOrder(dstCompOrderOffset, outputs.front().second);
         node->SetParamStruct(block, blockSize);
         if (!source) node->AddKernelOption(KROMCommonKernelOption, ScriptVal(1.0));
         if (!node->RunSession()) {
             failure = node->Error();
             return false;
         }
-        output->SetGPUMem(outBuf->GetGPUMemory(), true);
+        for (const auto &[img, buf] : outputs) img->SetGPUMem(buf->GetGPUMemory(), true);
         return true;
     });
     if (!ok) task->NoteDeviceFailure(name, failure.empty() ? "failed" : failure);

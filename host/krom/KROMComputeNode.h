@@ -72,7 +72,11 @@ public:
     const std::string &Error() const { return error_; }
 
     /// The short form; `images` are (name, image) pairs, "output" naming the
-    /// image to make. Offsets below 0 are not filled. False when there is no
+    /// image to make; further names beginning with "output" name further
+    /// images the kernel writes (the first output sets the launch's size and
+    /// dstCompOrder, the first input srcCompOrder). An image may be read and
+    /// made in one run: the output is new device memory. Offsets below 0 are
+    /// not filled. False when there is no
     /// device for the request or the run failed (the reason goes to the
     /// task's device log).
     static bool ExecKernelI(Request *req, const char *name, const char *source, const char *paramStructText,

@@ -31,4 +31,9 @@ extern const char kLumaKeyKernel[];
 extern const char kDifferenceKeyerKernel[];
 /// "ResizeAcross" and "ResizeDown".
 extern const char kResizeKernels[];
+/// "UltraKeyer", "UltraKeyerSoft", "UltraKeyerCombine", "UltraKeyerSubtract".
+extern const char kUltraKeyerKernel[];
+extern const char kUltraKeyerSoftKernel[];
+extern const char kUltraKeyerCombineKernel[];
+extern const char kUltraKeyerSubtractKernel[];
 } // namespace Orvane
