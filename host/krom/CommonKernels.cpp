@@ -2,6 +2,7 @@
 
 #include "host/krom/kernels/BlurKernelParams.h"
 #include "host/krom/kernels/ColorKernelParams.h"
+#include "host/krom/kernels/DeltaKeyerKernelParams.h"
 #include "host/krom/kernels/GeneratorKernelParams.h"
 #include "host/krom/kernels/KernelTexts.h"
 #include "host/krom/kernels/MaskKernelParams.h"
@@ -25,6 +26,14 @@ const std::vector<CommonKernel> &CommonKernels() {
         {"BlurColumns", BlurColumnsParamsText, kBlurColumnsKernel},
         {"Merge", MergeParamsText, kMergeKernel},
         {"MaskMerge", MaskMergeParamsText, kMaskMergeKernel},
+        {"DeltaKeyerScreen", DeltaKeyerParamsText, kDeltaKeyerKernels},
+        {"DeltaKeyerPreMatte", DeltaKeyerParamsText, kDeltaKeyerKernels},
+        {"DeltaKeyerPreMatteCombine", DeltaKeyerParamsText, kDeltaKeyerKernels},
+        {"DeltaKeyerThreshold", DeltaKeyerParamsText, kDeltaKeyerKernels},
+        {"DeltaKeyerRestoreFringe", DeltaKeyerParamsText, kDeltaKeyerKernels},
+        {"DeltaKeyerReplace", DeltaKeyerParamsText, kDeltaKeyerKernels},
+        {"DeltaKeyerMaskMerge", DeltaKeyerParamsText, kDeltaKeyerKernels},
+        {"DeltaKeyerColorMax", DeltaKeyerParamsText, kDeltaKeyerKernels},
         {"ResizeAcross", ResizeParamsText, kResizeKernels},
         {"ResizeDown", ResizeParamsText, kResizeKernels},
     };

@@ -23,6 +23,9 @@ extern const char kBlurColumnsKernel[];
 extern const char kMergeKernel[];
 /// "MaskMerge".
 extern const char kMaskMergeKernel[];
+/// "DeltaKeyerScreen", "DeltaKeyerPreMatte", "DeltaKeyerPreMatteCombine", "DeltaKeyerThreshold",
+/// "DeltaKeyerRestoreFringe", "DeltaKeyerReplace", "DeltaKeyerMaskMerge" and "DeltaKeyerColorMax".
+extern const char kDeltaKeyerKernels[];
 /// "ResizeAcross" and "ResizeDown".
 extern const char kResizeKernels[];
 } // namespace Orvane
