@@ -141,6 +141,19 @@ template <class P> bool Device(const DeltaKeyerRun &run, const char *name, const
 /// its place (the kernel does not read it then).
 Image *Arg(const Image *img, const Image *stand) { return const_cast<Image *>(img ? img : stand); }
 
+/// The curve table as one row of samples: shadows, midtones, highlights in red,
+/// green, blue, for a kernel to read.
+Ref<Image> TableImage(const ColorCurvesTable &table) {
+    auto img = MakeRef<Image>(ColorCurvesTable::kSamples, 1, DepthRGBAFlt32);
+    if (!img->AllocScanLineData()) return nullptr;
+    auto *row = img->Row<float>(0);
+    for (int i = 0; i < ColorCurvesTable::kSamples; ++i) {
+        std::memcpy(row + 4 * i, table.Sample(i), 3 * sizeof(float));
+        row[4 * i + 3] = 0.f;
+    }
+    return img;
+}
+
 template <class P> std::shared_ptr<P> NewBlock() {
     auto block = std::make_shared<P>();
     std::memset(block.get(), 0, sizeof(P));
@@ -282,6 +295,16 @@ float DeltaKeyerMatteValue(const DeltaKeyerScreenInfo &info, const float p[3]) {
     return (key - (r.midFactor * p[r.midIndex] + r.lowFactor * p[r.lowIndex])) * r.gain / d;
 }
 
+void DeltaKeyerPickValue(float v, bool subtract, float &low, float &high) {
+    constexpr float kMargin = 3.0517578e-5f;
+    if (!subtract) {
+        low = std::min(low, v - kMargin);
+        high = std::max(high, v + kMargin);
+    } else if (v > low && v < high) {
+        (low + high > 2.f * v ? low : high) = v;
+    }
+}
+
 // ---- steps ----
 
 bool ProcessScreen(const DeltaKeyerRun &run, const Image *src, Image *dst, const Image *clean,
@@ -298,16 +321,8 @@ bool ProcessScreen(const DeltaKeyerRun &run, const Image *src, Image *dst, const
     p.alphaInfo = same ? color.p : alpha.p;
     const ColorCurvesTable *table = color.table ? color.table : alpha.table;
     const bool tuning = table && (p.colorInfo.tuning || p.alphaInfo.tuning);
-    Ref<Image> tableImage;
-    if (tuning) {
-        // The curve table as one row of samples: shadows, midtones, highlights.
-        tableImage = MakeRef<Image>(ColorCurvesTable::kSamples, 1, DepthRGBAFlt32);
-        if (!tableImage->AllocScanLineData()) return false;
-        auto *row = tableImage->Row<float>(0);
-        for (int i = 0; i < ColorCurvesTable::kSamples; ++i) {
-            std::memcpy(row + 4 * i, table->Sample(i), 3 * sizeof(float));
-            row[4 * i + 3] = 0.f;
-        }
+    Ref<Image> tableImage = tuning && run.device ? TableImage(*table) : nullptr;
+    if (tableImage) {
         p.ccSampleCount = p.ccTableWidth = ColorCurvesTable::kSamples;
         p.ccInvSampleHeight = 1.f;
     }
@@ -318,7 +333,7 @@ bool ProcessScreen(const DeltaKeyerRun &run, const Image *src, Image *dst, const
     Window(p.cleanWindow, clean);
     p.dstLeftBtm[0] = dst->DataWindow().x0, p.dstLeftBtm[1] = dst->DataWindow().y0;
     // This block gives the destination by its corner alone, so the run is set up here.
-    if (run.device && run.req && !dst->DataWindow().IsNull()) {
+    if (run.device && run.req && !dst->DataWindow().IsNull() && (!tuning || tableImage)) {
         p.workSize[0] = dst->DataWindow().Width(), p.workSize[1] = dst->DataWindow().Height();
         Image *stand = const_cast<Image *>(src);
         if (KROMComputeNode::ExecKernelI(run.req, "DeltaKeyerScreen", nullptr, DeltaKeyerParamsText, sizeof p,
@@ -326,7 +341,7 @@ bool ProcessScreen(const DeltaKeyerRun &run, const Image *src, Image *dst, const
                                          offsetof(DeltaKeyerScreenParams, dstCompOrder), block,
                                          {{"input", stand},
                                           {"clean", Arg(clean, src)},
-                                          {"table", tuning ? tableImage.Get() : stand},
+                                          {"table", tableImage ? tableImage.Get() : stand},
                                           {"output", dst}})) {
             dst->SetCanvasColor(canvas);
             return true;
@@ -467,14 +482,32 @@ bool ProcessReplaceMask(const DeltaKeyerRun &run, int mode, const Image *src, co
                         bool invertMask, Image *img, const float replace[3]) {
     if (!src || !before || !mask || !img) return false;
     if (mode == DeltaKeyerReplaceNone) return true;
-    // No kernel of its own: the rows.
-    return Rows(run, img, Inputs<4>{src, before, mask, img}, [&](const PixelsIn<4> &in, FltPixel *out, int n) {
+    auto fn = [&](const PixelsIn<4> &in, FltPixel *out, int n) {
         for (int i = 0; i < n; ++i) {
             out[i] = in[3][i];
             const float s = invertMask ? 1.f - in[2][i].A : in[2][i].A;
             if (s > 0.f) ReplacePixel(mode, in[0][i], in[1][i].A, out[i].A, replace, out[i]);
         }
-    });
+    };
+    const Inputs<4> ins{src, before, mask, img};
+    auto block = NewBlock<DeltaKeyerReplaceMaskParams>();
+    DeltaKeyerReplaceMaskParams &p = *block;
+    Put(p.sp, src->GetCanvasColor());
+    Put(p.defaultF, img->GetCanvasColor());
+    p.key = before->GetCanvasColor().A, p.mask = mask->GetCanvasColor().A;
+    for (int c = 0; c < 3; ++c) p.colors[c] = replace[c];
+    p.isInvert = invertMask, p.mode = mode;
+    Window(p.srcWindow, src);
+    Window(p.preWindow, before);
+    Window(p.maskWindow, mask);
+    Window(p.colorWindow, img);
+    return Device(run, "DeltaKeyerReplaceMask", block, img, CanvasOf(ins, fn),
+                  {{"source", const_cast<Image *>(src)},
+                   {"before", const_cast<Image *>(before)},
+                   {"mask", const_cast<Image *>(mask)},
+                   {"input", img},
+                   {"output", img}}) ||
+           Rows(run, img, ins, fn);
 }
 
 bool ProcessMaskMerge(const DeltaKeyerRun &run, const Image *mask, Image *img, bool invert, bool invertMask) {
@@ -522,61 +555,104 @@ bool ProcessColorMax(const DeltaKeyerRun &run, const Image *key, Image *img) {
 
 bool ProcessRangesToColor(const DeltaKeyerRun &run, const Image *src, Image *dst, const ColorCurvesTable &table) {
     if (!src || !dst) return false;
-    return Rows(run, dst, Inputs<1>{src}, [&](const PixelsIn<1> &in, FltPixel *out, int n) {
+    auto fn = [&](const PixelsIn<1> &in, FltPixel *out, int n) {
         for (int i = 0; i < n; ++i) {
             const FltPixel &s = in[0][i];
             float w[3];
-            table.WeightsAt(std::fmax(s.R, std::fmax(s.G, s.B)), w[0], w[1], w[2]);
+            table.WeightsAt(std::fmax(std::fmax(s.R, s.G), s.B), w[0], w[1], w[2]);
             out[i] = {w[0], w[1], w[2], 1.f};
         }
-    });
+    };
+    const Inputs<1> ins{src};
+    Ref<Image> tableImage = run.device ? TableImage(table) : nullptr;
+    auto block = NewBlock<DeltaKeyerRangesToColorParams>();
+    DeltaKeyerRangesToColorParams &p = *block;
+    Put(p.defaultP, src->GetCanvasColor());
+    p.ccSampleCount = p.ccTableWidth = ColorCurvesTable::kSamples;
+    p.ccInvSampleHeight = 1.f;
+    p.maxChannels = 3;
+    Window(p.srcWindow, src);
+    return (tableImage &&
+            Device(run, "DeltaKeyerRangesToColor", block, dst, CanvasOf(ins, fn),
+                   {{"input", const_cast<Image *>(src)}, {"table", tableImage.Get()}, {"output", dst}})) ||
+           Rows(run, dst, ins, fn);
 }
 
 bool ProcessAlphaToColor(const DeltaKeyerRun &run, const Image *src, Image *dst, bool invert) {
     if (!src || !dst) return false;
-    return Rows(run, dst, Inputs<1>{src}, [&](const PixelsIn<1> &in, FltPixel *out, int n) {
+    auto fn = [&](const PixelsIn<1> &in, FltPixel *out, int n) {
         for (int i = 0; i < n; ++i) {
             const float a = in[0][i].A, v = invert ? 1.f - a : a;
             out[i] = {v, v, v, a};
         }
-    });
+    };
+    const Inputs<1> ins{src};
+    auto block = NewBlock<DeltaKeyerAlphaToColorParams>();
+    block->alpha = src->GetCanvasColor().A, block->isInvert = invert;
+    Window(block->srcWindow, src);
+    return Device(run, "DeltaKeyerAlphaToColor", block, dst, CanvasOf(ins, fn),
+                  {{"input", const_cast<Image *>(src)}, {"output", dst}}) ||
+           Rows(run, dst, ins, fn);
 }
 
 bool ProcessCopyColor(const DeltaKeyerRun &run, const Image *src, Image *dst) {
     if (!src || !dst) return false;
-    return Rows(run, dst, Inputs<2>{src, dst}, [&](const PixelsIn<2> &in, FltPixel *out, int n) {
+    auto fn = [&](const PixelsIn<2> &in, FltPixel *out, int n) {
         for (int i = 0; i < n; ++i) out[i] = {in[0][i].R, in[0][i].G, in[0][i].B, in[1][i].A};
-    });
+    };
+    const Inputs<2> ins{src, dst};
+    auto block = NewBlock<DeltaKeyerCopyColorParams>();
+    Put(block->defaultP, src->GetCanvasColor());
+    Put(block->defaultD, dst->GetCanvasColor());
+    Window(block->srcWindow, src);
+    Window(block->colorWindow, dst);
+    return Device(run, "DeltaKeyerCopyColor", block, dst, CanvasOf(ins, fn),
+                  {{"source", const_cast<Image *>(src)}, {"input", dst}, {"output", dst}}) ||
+           Rows(run, dst, ins, fn);
 }
 
 bool ProcessSourceAlpha(const DeltaKeyerRun &run, const Image *src, Image *dst, int mode) {
     if (!src || !dst) return false;
-    if (mode == DeltaKeyerSourceAlphaShow)
-        return Rows(run, dst, Inputs<1>{src}, [&](const PixelsIn<1> &in, FltPixel *out, int n) {
-            for (int i = 0; i < n; ++i) out[i] = {in[0][i].A, in[0][i].A, in[0][i].A, 1.f};
-        });
-    return Rows(run, dst, Inputs<2>{src, dst}, [&](const PixelsIn<2> &in, FltPixel *out, int n) {
+    const bool show = mode == DeltaKeyerSourceAlphaShow;
+    auto fn = [&](const PixelsIn<2> &in, FltPixel *out, int n) {
         for (int i = 0; i < n; ++i) {
-            const float k = 1.f - in[0][i].A;
+            const float a = in[0][i].A, k = 1.f - a;
             const FltPixel &d = in[1][i];
-            out[i] = {d.R * k, d.G * k, d.B * k, d.A * k};
+            out[i] = show ? FltPixel{a, a, a, 1.f} : FltPixel{d.R * k, d.G * k, d.B * k, d.A * k};
         }
-    });
+    };
+    const Inputs<2> ins{src, dst};
+    auto block = NewBlock<DeltaKeyerSourceAlphaParams>();
+    block->alpha = src->GetCanvasColor().A, block->mode = show ? 0 : 1;
+    Put(block->defaultD, dst->GetCanvasColor());
+    Window(block->srcWindow, src);
+    Window(block->colorWindow, dst);
+    return Device(run, "DeltaKeyerSourceAlpha", block, dst, CanvasOf(ins, fn),
+                  {{"source", const_cast<Image *>(src)}, {"input", dst}, {"output", dst}}) ||
+           Rows(run, dst, ins, fn);
 }
 
 bool ProcessStatusDiff(const DeltaKeyerRun &run, const Image *before, const Image *after, Image *diff) {
     if (!before || !after || !diff) return false;
-    return Rows(run, diff, Inputs<2>{before, after}, [&](const PixelsIn<2> &in, FltPixel *out, int n) {
+    auto fn = [&](const PixelsIn<2> &in, FltPixel *out, int n) {
         for (int i = 0; i < n; ++i) {
             const float d = in[1][i].A - in[0][i].A;
             out[i] = {d, d, d, d};
         }
-    });
+    };
+    const Inputs<2> ins{before, after};
+    auto block = NewBlock<DeltaKeyerStatusDiffParams>();
+    block->preMatte = before->GetCanvasColor().A, block->matte = after->GetCanvasColor().A;
+    Window(block->preWindow, before);
+    Window(block->matteWindow, after);
+    return Device(run, "DeltaKeyerStatusDiff", block, diff, CanvasOf(ins, fn),
+                  {{"before", const_cast<Image *>(before)}, {"after", const_cast<Image *>(after)}, {"output", diff}}) ||
+           Rows(run, diff, ins, fn);
 }
 
 bool ProcessStatus(const DeltaKeyerRun &run, Image *img, const Image *diff, bool invert) {
     if (!img) return false;
-    return Rows(run, img, Inputs<2>{img, diff}, [&](const PixelsIn<2> &in, FltPixel *out, int n) {
+    auto fn = [&](const PixelsIn<2> &in, FltPixel *out, int n) {
         for (int i = 0; i < n; ++i) {
             const float a = in[0][i].A, g = StatusLevel(invert ? 1.f - a : a);
             out[i] = {g, g, g, a};
@@ -584,29 +660,48 @@ bool ProcessStatus(const DeltaKeyerRun &run, Image *img, const Image *diff, bool
             if (w >= kStatusClear) Tint(out[i], 1.f, 1.f, 0.f);
             if (w <= -kStatusClear) Tint(out[i], 0.f, 0.f, 1.f);
         }
-    });
+    };
+    const Inputs<2> ins{img, diff};
+    auto block = NewBlock<DeltaKeyerStatusParams>();
+    Put(block->defaultP, img->GetCanvasColor());
+    block->isDiff = diff != nullptr, block->isInvert = invert;
+    block->diff = diff ? diff->GetCanvasColor().A : 0.f;
+    Window(block->srcWindow, img);
+    Window(block->diffWindow, diff);
+    return Device(run, "DeltaKeyerStatus", block, img, CanvasOf(ins, fn),
+                  {{"input", img}, {"diff", Arg(diff, img)}, {"output", img}}) ||
+           Rows(run, img, ins, fn);
+}
+
+/// The solid (adds m (1 - a), green) and garbage (takes m a, red) tints.
+template <class P>
+bool StatusMask(const DeltaKeyerRun &run, const char *kernel, bool solid, Image *img, const Image *mask, bool invert) {
+    if (!img || !mask) return false;
+    auto fn = [&](const PixelsIn<2> &in, FltPixel *out, int n) {
+        for (int i = 0; i < n; ++i) {
+            out[i] = in[0][i];
+            const float m = invert ? 1.f - in[1][i].A : in[1][i].A;
+            if (m * (solid ? 1.f - out[i].A : out[i].A) >= kStatusClear)
+                Tint(out[i], solid ? 0.f : 1.f, solid ? 1.f : 0.f, 0.f);
+        }
+    };
+    const Inputs<2> ins{img, mask};
+    auto block = NewBlock<P>();
+    Put(block->defaultP, img->GetCanvasColor());
+    block->isInvert = invert, block->mask = mask->GetCanvasColor().A;
+    Window(block->srcWindow, img);
+    Window(block->maskWindow, mask);
+    return Device(run, kernel, block, img, CanvasOf(ins, fn),
+                  {{"input", img}, {"mask", const_cast<Image *>(mask)}, {"output", img}}) ||
+           Rows(run, img, ins, fn);
 }
 
 bool ProcessStatusSolid(const DeltaKeyerRun &run, Image *img, const Image *mask, bool invert) {
-    if (!img || !mask) return false;
-    return Rows(run, img, Inputs<2>{img, mask}, [&](const PixelsIn<2> &in, FltPixel *out, int n) {
-        for (int i = 0; i < n; ++i) {
-            out[i] = in[0][i];
-            const float m = invert ? 1.f - in[1][i].A : in[1][i].A;
-            if (m * (1.f - out[i].A) >= kStatusClear) Tint(out[i], 0.f, 1.f, 0.f);
-        }
-    });
+    return StatusMask<DeltaKeyerStatusSolidParams>(run, "DeltaKeyerStatusSolid", true, img, mask, invert);
 }
 
 bool ProcessStatusGarbage(const DeltaKeyerRun &run, Image *img, const Image *mask, bool invert) {
-    if (!img || !mask) return false;
-    return Rows(run, img, Inputs<2>{img, mask}, [&](const PixelsIn<2> &in, FltPixel *out, int n) {
-        for (int i = 0; i < n; ++i) {
-            out[i] = in[0][i];
-            const float m = invert ? 1.f - in[1][i].A : in[1][i].A;
-            if (m * out[i].A >= kStatusClear) Tint(out[i], 1.f, 0.f, 0.f);
-        }
-    });
+    return StatusMask<DeltaKeyerStatusGarbageParams>(run, "DeltaKeyerStatusGarbage", false, img, mask, invert);
 }
 
 } // namespace Orvane

@@ -12,8 +12,8 @@
 //
 // With `device` set, a step first runs its kernel of the common library
 // ("DeltaKeyer" + the step's name, on the request's render task); when that
-// fails, or the step has no kernel, it brings its images to main memory and
-// runs its rows on the worker pool. A step returns false when abandoned or
+// fails it brings its images to main memory and runs its rows on the worker
+// pool. A step returns false when abandoned or
 // refused memory.
 //
 // Thread safety: the records are read-only while a step runs; steps may run
@@ -61,6 +61,11 @@ void DeltaKeyerAdjustForClean(DeltaKeyerScreenInfoParams &p, const float clean[3
 
 /// The matte value m of colour p (red, green, blue) under a record.
 float DeltaKeyerMatteValue(const DeltaKeyerScreenInfo &info, const float p[3]);
+
+/// The pick rule on one value: the range [low, high] widened to take v in
+/// (by 2^-15 on each side), or, subtracting, the nearer edge moved to a v
+/// strictly inside it (low when low + high > 2 v).
+void DeltaKeyerPickValue(float v, bool subtract, float &low, float &high);
 
 /// Where the steps run.
 struct DeltaKeyerRun {

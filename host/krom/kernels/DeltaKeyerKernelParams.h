@@ -17,9 +17,8 @@ namespace Orvane {
 
 #define ORVANE_DK_TEXT(...) #__VA_ARGS__
 #define ORVANE_DK_XTEXT(...) ORVANE_DK_TEXT(__VA_ARGS__)
-#define ORVANE_DK_STRUCT(Name, Fields)                                                                                 \
-    struct Name Fields;                                                                                                \
-    inline constexpr char Name##Text[] = "typedef struct " ORVANE_DK_XTEXT(Fields) " " #Name ";\n";
+#define ORVANE_DK_TYPEDEF(Name, ...) "typedef struct " ORVANE_DK_XTEXT(__VA_ARGS__) " " #Name ";\n"
+#define ORVANE_DK_STRUCT(Name, ...) struct Name __VA_ARGS__;
 
 // The screen record: how the key is measured against one background colour.
 // Indices are channels 0 red, 1 green, 2 blue. The matte of a pixel p is
@@ -194,27 +193,163 @@ ORVANE_DK_STRUCT(DeltaKeyerColorMaxParams, ORVANE_DK_COLOR_MAX_FIELDS)
 static_assert(sizeof(DeltaKeyerColorMaxParams) == 88);
 static_assert(offsetof(DeltaKeyerColorMaxParams, srcCompOrder) == 80);
 
+// DeltaKeyerReplaceMask: the replace rule for the solid matte: a0 from
+// `before` (`key` beyond it), a1 the alpha of the colour image, only where the
+// mask (`mask` beyond it; 1 - mask with isInvert) is above 0.
+#define ORVANE_DK_REPLACE_MASK_FIELDS                                                                                  \
+    {                                                                                                                  \
+        float sp[4];                                                                                                   \
+        float defaultF[4];                                                                                             \
+        float key, mask;                                                                                               \
+        float colors[4];                                                                                               \
+        int isInvert, mode;                                                                                            \
+        int srcWindow[4];                                                                                              \
+        int preWindow[4];                                                                                              \
+        int maskWindow[4];                                                                                             \
+        int colorWindow[4];                                                                                            \
+        int dstWindow[4];                                                                                              \
+        int workSize[2];                                                                                               \
+        int srcCompOrder, dstCompOrder;                                                                                \
+    }
+ORVANE_DK_STRUCT(DeltaKeyerReplaceMaskParams, ORVANE_DK_REPLACE_MASK_FIELDS)
+static_assert(sizeof(DeltaKeyerReplaceMaskParams) == 160);
+static_assert(offsetof(DeltaKeyerReplaceMaskParams, srcCompOrder) == 152);
+
+// DeltaKeyerStatusDiff: after minus before, the alphas (`matte` and `preMatte`
+// beyond their windows), in all four channels.
+#define ORVANE_DK_STATUS_DIFF_FIELDS                                                                                   \
+    {                                                                                                                  \
+        float preMatte, matte;                                                                                         \
+        int preWindow[4];                                                                                              \
+        int matteWindow[4];                                                                                            \
+        int dstWindow[4];                                                                                              \
+        int workSize[2];                                                                                               \
+        int srcCompOrder, dstCompOrder;                                                                                \
+    }
+ORVANE_DK_STRUCT(DeltaKeyerStatusDiffParams, ORVANE_DK_STATUS_DIFF_FIELDS)
+static_assert(sizeof(DeltaKeyerStatusDiffParams) == 72);
+static_assert(offsetof(DeltaKeyerStatusDiffParams, srcCompOrder) == 64);
+
+// DeltaKeyerStatus: the state of the alpha as grey, tinted by the diff's alpha
+// (`diff` beyond its window) when isDiff.
+#define ORVANE_DK_STATUS_FIELDS                                                                                        \
+    {                                                                                                                  \
+        float defaultP[4];                                                                                             \
+        int isDiff, isInvert;                                                                                          \
+        float diff;                                                                                                    \
+        int srcWindow[4];                                                                                              \
+        int diffWindow[4];                                                                                             \
+        int dstWindow[4];                                                                                              \
+        int workSize[2];                                                                                               \
+        int srcCompOrder, dstCompOrder;                                                                                \
+    }
+ORVANE_DK_STRUCT(DeltaKeyerStatusParams, ORVANE_DK_STATUS_FIELDS)
+static_assert(sizeof(DeltaKeyerStatusParams) == 92);
+static_assert(offsetof(DeltaKeyerStatusParams, srcCompOrder) == 84);
+
+// DeltaKeyerStatusSolid and DeltaKeyerStatusGarbage: the tint where a mask
+// (`mask` beyond its window, 1 - mask with isInvert) adds to or takes from alpha.
+#define ORVANE_DK_STATUS_MASK_FIELDS                                                                                   \
+    {                                                                                                                  \
+        float defaultP[4];                                                                                             \
+        int isInvert;                                                                                                  \
+        float mask;                                                                                                    \
+        int srcWindow[4];                                                                                              \
+        int maskWindow[4];                                                                                             \
+        int dstWindow[4];                                                                                              \
+        int workSize[2];                                                                                               \
+        int srcCompOrder, dstCompOrder;                                                                                \
+    }
+ORVANE_DK_STRUCT(DeltaKeyerStatusSolidParams, ORVANE_DK_STATUS_MASK_FIELDS)
+ORVANE_DK_STRUCT(DeltaKeyerStatusGarbageParams, ORVANE_DK_STATUS_MASK_FIELDS)
+static_assert(sizeof(DeltaKeyerStatusSolidParams) == 88 && sizeof(DeltaKeyerStatusGarbageParams) == 88);
+static_assert(offsetof(DeltaKeyerStatusSolidParams, srcCompOrder) == 80);
+
+// DeltaKeyerRangesToColor: the curve table (image `table`, ccTableWidth
+// samples) at the max of the first maxChannels channels.
+#define ORVANE_DK_RANGES_TO_COLOR_FIELDS                                                                               \
+    {                                                                                                                  \
+        float defaultP[4];                                                                                             \
+        int ccSampleCount, ccTableWidth;                                                                               \
+        float ccInvSampleHeight;                                                                                       \
+        int maxChannels;                                                                                               \
+        int srcWindow[4];                                                                                              \
+        int dstWindow[4];                                                                                              \
+        int workSize[2];                                                                                               \
+        int srcCompOrder, dstCompOrder;                                                                                \
+    }
+ORVANE_DK_STRUCT(DeltaKeyerRangesToColorParams, ORVANE_DK_RANGES_TO_COLOR_FIELDS)
+static_assert(sizeof(DeltaKeyerRangesToColorParams) == 80);
+static_assert(offsetof(DeltaKeyerRangesToColorParams, srcCompOrder) == 72);
+
+// DeltaKeyerAlphaToColor: the source's alpha (`alpha` beyond its window) as grey.
+#define ORVANE_DK_ALPHA_TO_COLOR_FIELDS                                                                                \
+    {                                                                                                                  \
+        float alpha;                                                                                                   \
+        int isInvert;                                                                                                  \
+        int srcWindow[4];                                                                                              \
+        int dstWindow[4];                                                                                              \
+        int workSize[2];                                                                                               \
+        int srcCompOrder, dstCompOrder;                                                                                \
+    }
+ORVANE_DK_STRUCT(DeltaKeyerAlphaToColorParams, ORVANE_DK_ALPHA_TO_COLOR_FIELDS)
+static_assert(sizeof(DeltaKeyerAlphaToColorParams) == 56);
+static_assert(offsetof(DeltaKeyerAlphaToColorParams, srcCompOrder) == 48);
+
+// DeltaKeyerCopyColor: the source's colour with the destination's alpha.
+#define ORVANE_DK_COPY_COLOR_FIELDS                                                                                    \
+    {                                                                                                                  \
+        float defaultP[4];                                                                                             \
+        float defaultD[4];                                                                                             \
+        int srcWindow[4];                                                                                              \
+        int colorWindow[4];                                                                                            \
+        int dstWindow[4];                                                                                              \
+        int workSize[2];                                                                                               \
+        int srcCompOrder, dstCompOrder;                                                                                \
+    }
+ORVANE_DK_STRUCT(DeltaKeyerCopyColorParams, ORVANE_DK_COPY_COLOR_FIELDS)
+static_assert(sizeof(DeltaKeyerCopyColorParams) == 96);
+static_assert(offsetof(DeltaKeyerCopyColorParams, srcCompOrder) == 88);
+
+// DeltaKeyerSourceAlpha: mode 0 shows the source's alpha (`alpha` beyond its
+// window) as grey; mode 1 scales the destination by 1 - that alpha.
+#define ORVANE_DK_SOURCE_ALPHA_FIELDS                                                                                  \
+    {                                                                                                                  \
+        float alpha;                                                                                                   \
+        int mode;                                                                                                      \
+        float defaultD[4];                                                                                             \
+        int srcWindow[4];                                                                                              \
+        int colorWindow[4];                                                                                            \
+        int dstWindow[4];                                                                                              \
+        int workSize[2];                                                                                               \
+        int srcCompOrder, dstCompOrder;                                                                                \
+    }
+ORVANE_DK_STRUCT(DeltaKeyerSourceAlphaParams, ORVANE_DK_SOURCE_ALPHA_FIELDS)
+static_assert(sizeof(DeltaKeyerSourceAlphaParams) == 88);
+static_assert(offsetof(DeltaKeyerSourceAlphaParams, srcCompOrder) == 80);
+
 /// The text of every block above, in order: what each Delta Keyer kernel is
 /// compiled with.
-inline constexpr char DeltaKeyerParamsText[] = "typedef struct " ORVANE_DK_XTEXT(
-    ORVANE_DK_SCREEN_INFO_FIELDS) " DeltaKeyerScreenInfoParams;\n"
-                                  "typedef struct " ORVANE_DK_XTEXT(
-                                      ORVANE_DK_SCREEN_FIELDS) " DeltaKeyerScreenParams;\n"
-                                                               "typedef struct " ORVANE_DK_XTEXT(
-                                                                   ORVANE_DK_PREMATTE_FIELDS) " DeltaKeyerPreMatteParam"
-                                                                                              "s;\n"
-                                                                                              "typedef "
-                                                                                              "struct " ORVANE_DK_XTEXT(
-                                                                                                  ORVANE_DK_PREMATTE_COMBINE_FIELDS) " DeltaKeyerPreMatteCombineParams;\n"
-                                                                                                                                     "typedef struct " ORVANE_DK_XTEXT(
-                                                                                                                                         ORVANE_DK_THRESHOLD_FIELDS) " DeltaKeyerThresholdParams;\n"
-                                                                                                                                                                     "typedef struct " ORVANE_DK_XTEXT(
-                                                                                                                                                                         ORVANE_DK_RESTORE_FRINGE_FIELDS) " DeltaKeyerRestoreFringeParams;\n"
-                                                                                                                                                                                                          "typedef struct " ORVANE_DK_XTEXT(
-                                                                                                                                                                                                              ORVANE_DK_REPLACE_FIELDS) " DeltaKeyerReplaceParams;\n"
-                                                                                                                                                                                                                                        "typedef struct " ORVANE_DK_XTEXT(
-                                                                                                                                                                                                                                            ORVANE_DK_MASK_MERGE_FIELDS) " DeltaKeyerMaskMergeParams;\n"
-                                                                                                                                                                                                                                                                         "typedef struct " ORVANE_DK_XTEXT(
-                                                                                                                                                                                                                                                                             ORVANE_DK_COLOR_MAX_FIELDS) " DeltaKeyerColorMaxParams;\n";
+// clang-format off
+inline constexpr char DeltaKeyerParamsText[] =
+    ORVANE_DK_TYPEDEF(DeltaKeyerScreenInfoParams, ORVANE_DK_SCREEN_INFO_FIELDS)
+    ORVANE_DK_TYPEDEF(DeltaKeyerScreenParams, ORVANE_DK_SCREEN_FIELDS)
+    ORVANE_DK_TYPEDEF(DeltaKeyerPreMatteParams, ORVANE_DK_PREMATTE_FIELDS)
+    ORVANE_DK_TYPEDEF(DeltaKeyerPreMatteCombineParams, ORVANE_DK_PREMATTE_COMBINE_FIELDS)
+    ORVANE_DK_TYPEDEF(DeltaKeyerThresholdParams, ORVANE_DK_THRESHOLD_FIELDS)
+    ORVANE_DK_TYPEDEF(DeltaKeyerRestoreFringeParams, ORVANE_DK_RESTORE_FRINGE_FIELDS)
+    ORVANE_DK_TYPEDEF(DeltaKeyerReplaceParams, ORVANE_DK_REPLACE_FIELDS)
+    ORVANE_DK_TYPEDEF(DeltaKeyerMaskMergeParams, ORVANE_DK_MASK_MERGE_FIELDS)
+    ORVANE_DK_TYPEDEF(DeltaKeyerColorMaxParams, ORVANE_DK_COLOR_MAX_FIELDS)
+    ORVANE_DK_TYPEDEF(DeltaKeyerReplaceMaskParams, ORVANE_DK_REPLACE_MASK_FIELDS)
+    ORVANE_DK_TYPEDEF(DeltaKeyerStatusDiffParams, ORVANE_DK_STATUS_DIFF_FIELDS)
+    ORVANE_DK_TYPEDEF(DeltaKeyerStatusParams, ORVANE_DK_STATUS_FIELDS)
+    ORVANE_DK_TYPEDEF(DeltaKeyerStatusSolidParams, ORVANE_DK_STATUS_MASK_FIELDS)
+    ORVANE_DK_TYPEDEF(DeltaKeyerStatusGarbageParams, ORVANE_DK_STATUS_MASK_FIELDS)
+    ORVANE_DK_TYPEDEF(DeltaKeyerRangesToColorParams, ORVANE_DK_RANGES_TO_COLOR_FIELDS)
+    ORVANE_DK_TYPEDEF(DeltaKeyerAlphaToColorParams, ORVANE_DK_ALPHA_TO_COLOR_FIELDS)
+    ORVANE_DK_TYPEDEF(DeltaKeyerCopyColorParams, ORVANE_DK_COPY_COLOR_FIELDS)
+    ORVANE_DK_TYPEDEF(DeltaKeyerSourceAlphaParams, ORVANE_DK_SOURCE_ALPHA_FIELDS);
+// clang-format on
 
 } // namespace Orvane

@@ -120,6 +120,24 @@ __KERNEL__ void DeltaKeyerRestoreFringe(__CONSTANTREF__ DeltaKeyerRestoreFringeP
     _tex2DVec4Write(output, x, y, s);
 }
 
+/// The colour f rebuilt from source s for alpha moving from a0 to a1 (mode 1
+/// Source, 2 Hard Color, 3 Soft Color with colour c).
+KROM_FN void dk_replace(int mode, const float *s, float a0, float a1, __CONSTANTREF__ float *c, float *f) {
+    const float da = a1 - a0;
+    if (!(da > 0.f)) {
+        const float k = a0 == 0.f ? 0.f : a1 / a0;
+        for (int i = 0; i < 3; ++i) f[i] = f[i] * k;
+    } else if (mode == 1) {
+        const float t = a0 >= 0.9999999f ? 0.f : da / (1.f - a0);
+        for (int i = 0; i < 3; ++i) f[i] = f[i] + (s[i] - f[i]) * t;
+    } else if (mode == 2) {
+        for (int i = 0; i < 3; ++i) f[i] = f[i] + da * c[i];
+    } else {
+        const float d = ((s[0] - f[0]) + (s[1] - f[1]) + (s[2] - f[2])) * da / 3.f;
+        for (int i = 0; i < 3; ++i) f[i] = f[i] + d * c[i];
+    }
+}
+
 __KERNEL__ void DeltaKeyerReplace(__CONSTANTREF__ DeltaKeyerReplaceParams *q, __TEXTURE2D__ source,
                                   __TEXTURE2D__ before, __TEXTURE2D__ after, __TEXTURE2D__ input,
                                   __TEXTURE2D_WRITE__ output) {
@@ -133,19 +151,7 @@ __KERNEL__ void DeltaKeyerReplace(__CONSTANTREF__ DeltaKeyerReplaceParams *q, __
         const float s[3] = {s4.x, s4.y, s4.z};
         const float a0 = dk_read(before, pos, q->preWindow, make_float4(0.f, 0.f, 0.f, q->preMatte)).w;
         const float a1 = dk_read(after, pos, q->matteWindow, make_float4(0.f, 0.f, 0.f, q->matte)).w;
-        const float da = a1 - a0;
-        if (!(da > 0.f)) {
-            const float k = a0 == 0.f ? 0.f : a1 / a0;
-            for (int i = 0; i < 3; ++i) f[i] = f[i] * k;
-        } else if (q->mode == 1) {
-            const float t = a0 >= 0.9999999f ? 0.f : da / (1.f - a0);
-            for (int i = 0; i < 3; ++i) f[i] = f[i] + (s[i] - f[i]) * t;
-        } else if (q->mode == 2) {
-            for (int i = 0; i < 3; ++i) f[i] = f[i] + da * q->replace[i];
-        } else {
-            const float d = ((s[0] - f[0]) + (s[1] - f[1]) + (s[2] - f[2])) * da / 3.f;
-            for (int i = 0; i < 3; ++i) f[i] = f[i] + d * q->replace[i];
-        }
+        dk_replace(q->mode, s, a0, a1, q->replace, f);
     }
     _tex2DVec4Write(output, x, y, make_float4(f[0], f[1], f[2], f4.w));
 }
@@ -172,6 +178,126 @@ __KERNEL__ void DeltaKeyerColorMax(__CONSTANTREF__ DeltaKeyerColorMaxParams *q, 
     if (q->isKey) k = dk_read(key, pos, q->keyWindow, make_float4(0.f, 0.f, 0.f, k)).w;
     d.w = dk_clamp01(_fmaxf(_fmaxf(d.w, k), _fmaxf(d.x, _fmaxf(d.y, d.z))));
     _tex2DVec4Write(output, x, y, d);
+}
+KROM_FN float dk_level(float a) { return a < 0.001f ? 0.f : (a > 0.9999f ? 1.f : 0.5f); }
+
+KROM_FN float4 dk_tint(float4 p, float r, float g, float b) {
+    return make_float4(0.5f * p.x + 0.5f * r, 0.5f * p.y + 0.5f * g, 0.5f * p.z + 0.5f * b, p.w);
+}
+
+__KERNEL__ void DeltaKeyerReplaceMask(__CONSTANTREF__ DeltaKeyerReplaceMaskParams *q, __TEXTURE2D__ source,
+                                      __TEXTURE2D__ before, __TEXTURE2D__ mask, __TEXTURE2D__ input,
+                                      __TEXTURE2D_WRITE__ output) {
+    DEFINE_KERNEL_ITERATORS_XY(x, y);
+    if (x >= q->workSize[0] || y >= q->workSize[1]) return;
+    const int2 pos = make_int2(x + q->dstWindow[0], y + q->dstWindow[2]);
+    const float4 f4 = dk_read(input, pos, q->colorWindow, to_float4_v(q->defaultF));
+    float f[3] = {f4.x, f4.y, f4.z};
+    float m = dk_read(mask, pos, q->maskWindow, make_float4(0.f, 0.f, 0.f, q->mask)).w;
+    if (q->isInvert) m = 1.f - m;
+    if (q->mode != 0 && m > 0.f) {
+        const float4 s4 = dk_read(source, pos, q->srcWindow, to_float4_v(q->sp));
+        const float s[3] = {s4.x, s4.y, s4.z};
+        const float a0 = dk_read(before, pos, q->preWindow, make_float4(0.f, 0.f, 0.f, q->key)).w;
+        dk_replace(q->mode, s, a0, f4.w, q->colors, f);
+    }
+    _tex2DVec4Write(output, x, y, make_float4(f[0], f[1], f[2], f4.w));
+}
+
+__KERNEL__ void DeltaKeyerStatusDiff(__CONSTANTREF__ DeltaKeyerStatusDiffParams *q, __TEXTURE2D__ before,
+                                     __TEXTURE2D__ after, __TEXTURE2D_WRITE__ output) {
+    DEFINE_KERNEL_ITERATORS_XY(x, y);
+    if (x >= q->workSize[0] || y >= q->workSize[1]) return;
+    const int2 pos = make_int2(x + q->dstWindow[0], y + q->dstWindow[2]);
+    const float a0 = dk_read(before, pos, q->preWindow, make_float4(0.f, 0.f, 0.f, q->preMatte)).w;
+    const float a1 = dk_read(after, pos, q->matteWindow, make_float4(0.f, 0.f, 0.f, q->matte)).w;
+    const float d = a1 - a0;
+    _tex2DVec4Write(output, x, y, make_float4(d, d, d, d));
+}
+
+__KERNEL__ void DeltaKeyerStatus(__CONSTANTREF__ DeltaKeyerStatusParams *q, __TEXTURE2D__ input, __TEXTURE2D__ diff,
+                                 __TEXTURE2D_WRITE__ output) {
+    DEFINE_KERNEL_ITERATORS_XY(x, y);
+    if (x >= q->workSize[0] || y >= q->workSize[1]) return;
+    const int2 pos = make_int2(x + q->dstWindow[0], y + q->dstWindow[2]);
+    const float a = dk_read(input, pos, q->srcWindow, to_float4_v(q->defaultP)).w;
+    const float g = dk_level(q->isInvert ? 1.f - a : a);
+    float4 o = make_float4(g, g, g, a);
+    const float w = q->isDiff ? dk_read(diff, pos, q->diffWindow, make_float4(0.f, 0.f, 0.f, q->diff)).w : 0.f;
+    if (w >= 0.001f) o = dk_tint(o, 1.f, 1.f, 0.f);
+    if (w <= -0.001f) o = dk_tint(o, 0.f, 0.f, 1.f);
+    _tex2DVec4Write(output, x, y, o);
+}
+
+// The solid (adds m (1 - a): green) and garbage (takes m a: red) tints; the
+// two blocks have the same fields.
+#define DK_STATUS_MASK(solid)                                                                                    \
+    DEFINE_KERNEL_ITERATORS_XY(x, y);                                                                            \
+    if (x >= q->workSize[0] || y >= q->workSize[1]) return;                                                      \
+    const int2 pos = make_int2(x + q->dstWindow[0], y + q->dstWindow[2]);                                        \
+    float4 o = dk_read(input, pos, q->srcWindow, to_float4_v(q->defaultP));                                      \
+    float m = dk_read(mask, pos, q->maskWindow, make_float4(0.f, 0.f, 0.f, q->mask)).w;                          \
+    if (q->isInvert) m = 1.f - m;                                                                                \
+    if (m * (solid ? 1.f - o.w : o.w) >= 0.001f) o = dk_tint(o, solid ? 0.f : 1.f, solid ? 1.f : 0.f, 0.f);      \
+    _tex2DVec4Write(output, x, y, o)
+
+__KERNEL__ void DeltaKeyerStatusSolid(__CONSTANTREF__ DeltaKeyerStatusSolidParams *q, __TEXTURE2D__ input,
+                                      __TEXTURE2D__ mask, __TEXTURE2D_WRITE__ output) {
+    DK_STATUS_MASK(1);
+}
+
+__KERNEL__ void DeltaKeyerStatusGarbage(__CONSTANTREF__ DeltaKeyerStatusGarbageParams *q, __TEXTURE2D__ input,
+                                        __TEXTURE2D__ mask, __TEXTURE2D_WRITE__ output) {
+    DK_STATUS_MASK(0);
+}
+
+__KERNEL__ void DeltaKeyerRangesToColor(__CONSTANTREF__ DeltaKeyerRangesToColorParams *q, __TEXTURE2D__ input,
+                                        __TEXTURE2D__ table, __TEXTURE2D_WRITE__ output) {
+    DEFINE_KERNEL_ITERATORS_XY(x, y);
+    if (x >= q->workSize[0] || y >= q->workSize[1]) return;
+    const int2 pos = make_int2(x + q->dstWindow[0], y + q->dstWindow[2]);
+    const float4 s = dk_read(input, pos, q->srcWindow, to_float4_v(q->defaultP));
+    const float c[4] = {s.x, s.y, s.z, s.w};
+    float v = c[0];
+    for (int i = 1; i < q->maxChannels; ++i) v = _fmaxf(v, c[i]);
+    const float t = v > 0.f ? (v < 1.f ? v : 1.f) : 0.f;
+    const float4 w = _tex2DVecN(table, (int)(t * (float)(q->ccSampleCount - 1) + 0.5f), 0, 0);
+    _tex2DVec4Write(output, x, y, make_float4(w.x, w.y, w.z, 1.f));
+}
+
+__KERNEL__ void DeltaKeyerAlphaToColor(__CONSTANTREF__ DeltaKeyerAlphaToColorParams *q, __TEXTURE2D__ input,
+                                       __TEXTURE2D_WRITE__ output) {
+    DEFINE_KERNEL_ITERATORS_XY(x, y);
+    if (x >= q->workSize[0] || y >= q->workSize[1]) return;
+    const int2 pos = make_int2(x + q->dstWindow[0], y + q->dstWindow[2]);
+    const float a = dk_read(input, pos, q->srcWindow, make_float4(0.f, 0.f, 0.f, q->alpha)).w;
+    const float v = q->isInvert ? 1.f - a : a;
+    _tex2DVec4Write(output, x, y, make_float4(v, v, v, a));
+}
+
+__KERNEL__ void DeltaKeyerCopyColor(__CONSTANTREF__ DeltaKeyerCopyColorParams *q, __TEXTURE2D__ source,
+                                    __TEXTURE2D__ input, __TEXTURE2D_WRITE__ output) {
+    DEFINE_KERNEL_ITERATORS_XY(x, y);
+    if (x >= q->workSize[0] || y >= q->workSize[1]) return;
+    const int2 pos = make_int2(x + q->dstWindow[0], y + q->dstWindow[2]);
+    const float4 s = dk_read(source, pos, q->srcWindow, to_float4_v(q->defaultP));
+    const float4 d = dk_read(input, pos, q->colorWindow, to_float4_v(q->defaultD));
+    _tex2DVec4Write(output, x, y, make_float4(s.x, s.y, s.z, d.w));
+}
+
+__KERNEL__ void DeltaKeyerSourceAlpha(__CONSTANTREF__ DeltaKeyerSourceAlphaParams *q, __TEXTURE2D__ source,
+                                      __TEXTURE2D__ input, __TEXTURE2D_WRITE__ output) {
+    DEFINE_KERNEL_ITERATORS_XY(x, y);
+    if (x >= q->workSize[0] || y >= q->workSize[1]) return;
+    const int2 pos = make_int2(x + q->dstWindow[0], y + q->dstWindow[2]);
+    const float a = dk_read(source, pos, q->srcWindow, make_float4(0.f, 0.f, 0.f, q->alpha)).w;
+    float4 o = make_float4(a, a, a, 1.f);
+    if (q->mode != 0) {
+        const float k = 1.f - a;
+        const float4 d = dk_read(input, pos, q->colorWindow, to_float4_v(q->defaultD));
+        o = make_float4(d.x * k, d.y * k, d.z * k, d.w * k);
+    }
+    _tex2DVec4Write(output, x, y, o);
 }
 )KROM";
 

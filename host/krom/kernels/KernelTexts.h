@@ -23,8 +23,9 @@ extern const char kBlurColumnsKernel[];
 extern const char kMergeKernel[];
 /// "MaskMerge".
 extern const char kMaskMergeKernel[];
-/// "DeltaKeyerScreen", "DeltaKeyerPreMatte", "DeltaKeyerPreMatteCombine", "DeltaKeyerThreshold",
-/// "DeltaKeyerRestoreFringe", "DeltaKeyerReplace", "DeltaKeyerMaskMerge" and "DeltaKeyerColorMax".
+/// The Delta Keyer's: "DeltaKeyer" followed by Screen, PreMatte, PreMatteCombine, Threshold, RestoreFringe,
+/// Replace, ReplaceMask, MaskMerge, ColorMax, Status, StatusDiff, StatusSolid, StatusGarbage, RangesToColor,
+/// AlphaToColor, CopyColor, SourceAlpha.
 extern const char kDeltaKeyerKernels[];
 /// "ResizeAcross" and "ResizeDown".
 extern const char kResizeKernels[];

@@ -410,7 +410,26 @@ TEST(DeltaKeyerSteps, TheKernelsGiveTheRowsValues) {
         {"merge inverted", [&](auto &r, Image *d) { return ProcessMaskMerge(r, mask.Get(), d, true, false); }},
         {"color max", [&](auto &r, Image *d) { return ProcessColorMax(r, mask.Get(), d); }},
     };
+    const std::vector<std::pair<std::string, Make>> views = {
+        {"screen tuned",
+         [&](auto &r, Image *d) { return ProcessScreen(r, src.Get(), d, nullptr, alpha, alpha, true); }},
+        {"status diff", [&](auto &r, Image *d) { return ProcessStatusDiff(r, before.Get(), after.Get(), d); }},
+        {"status", [&](auto &r, Image *d) { return ProcessStatus(r, d, mask.Get(), false); }},
+        {"status inverted", [&](auto &r, Image *d) { return ProcessStatus(r, d, nullptr, true); }},
+        {"status solid", [&](auto &r, Image *d) { return ProcessStatusSolid(r, d, mask.Get(), false); }},
+        {"status garbage", [&](auto &r, Image *d) { return ProcessStatusGarbage(r, d, mask.Get(), true); }},
+        {"ranges", [&](auto &r, Image *d) { return ProcessRangesToColor(r, src.Get(), d, table); }},
+        {"alpha to colour", [&](auto &r, Image *d) { return ProcessAlphaToColor(r, before.Get(), d, true); }},
+        {"copy colour", [&](auto &r, Image *d) { return ProcessCopyColor(r, clean.Get(), d); }},
+        {"source alpha", [&](auto &r, Image *d) { return ProcessSourceAlpha(r, mask.Get(), d, 0); }},
+        {"source alpha off", [&](auto &r, Image *d) { return ProcessSourceAlpha(r, mask.Get(), d, 1); }},
+    };
     std::vector<std::pair<std::string, Make>> all = steps;
+    all.insert(all.end(), views.begin(), views.end());
+    for (int mode = 1; mode < 4; ++mode)
+        all.push_back({"replace mask " + std::to_string(mode), [&, mode](auto &r, Image *d) {
+                           return ProcessReplaceMask(r, mode, src.Get(), before.Get(), mask.Get(), mode == 2, d, C);
+                       }});
     for (int mode = 0; mode < 4; ++mode)
         all.push_back({"replace " + std::to_string(mode), [&, mode](auto &r, Image *d) {
                            return ProcessReplace(r, mode, src.Get(), before.Get(), after.Get(), d, C);
