@@ -12,8 +12,11 @@
 //   rounded back once. Each step works in place over the image's data window,
 //   and computes the canvas colour's result once, by the same formula.
 // - Rows run on the worker pool; `req` (may be null) gives the abort flag,
-//   polled per row: a step that is abandoned or refused memory returns false
-//   and leaves rows it did not reach as they were.
+//   polled per row (as is the image's own): a step that is abandoned or
+//   refused memory returns false and leaves rows it did not reach, and the
+//   canvas, as they were.
+// - A null image, or a channel outside 0..3, gives false. The colour steps
+//   (spill, fringe, post-multiply) leave a single-channel image as it is.
 // - An image whose pixels are on the device is downloaded first
 //   (Image::DownloadGPUMem); a step that fails to do so returns false.
 //
@@ -61,7 +64,10 @@ struct ChromaValues {
 };
 
 /// Takes the spill off the key channel: k := max(0, k - amount x max(0, k - limit)).
-/// The other channels and alpha stay as they are.
+/// The other channels and alpha stay as they are. The key channel and the
+/// method are held to their ranges. For colours whose other two channels are
+/// not negative, each method takes at least as much as the one before it.
+/// The result is never below 0 (a negative key value becomes 0).
 ORVANE_API bool MatteCore_DoSpill(Request *req, Image *img, const ChromaValues &chroma);
 
 /// Colours the fringe of a matte. `edge` holds in its alpha the (blurred)
@@ -69,8 +75,9 @@ ORVANE_API bool MatteCore_DoSpill(Request *req, Image *img, const ChromaValues &
 /// at the half-transparent edge and 0 where the matte is solid or clear.
 /// Each colour channel C of `img` becomes C x (1 + w (shape - 1)) + w x shift,
 /// with the shifts red/cyan, green/magenta and blue/yellow added to red,
-/// green and blue. DoFringe is the 16-bit form, DoFringeFlt the float one;
-/// each refuses the other kind of image.
+/// green and blue. e is held to 0..1; a null `edge` gives false. DoFringe
+/// is the 16-bit form, DoFringeFlt the float one; each refuses the other kind
+/// of image.
 ORVANE_API bool MatteCore_DoFringe(Request *req, Image *img, const Image *edge, double shape, double redCyan,
                                    double greenMagenta, double blueYellow);
 ORVANE_API bool MatteCore_DoFringeFlt(Request *req, Image *img, const Image *edge, double shape, double redCyan,
@@ -85,8 +92,8 @@ ORVANE_API bool MatteCore_DoPostMultiply(Request *req, Image *img);
 /// Cleans a matte toward solid (amount > 0: a := min(1, a / (1 - amount)),
 /// the foreground's holes filled) or toward clear (amount < 0:
 /// a := max(0, (a + amount) / (1 + amount)), the background's haze taken
-/// off); amount is held to [-1, 1], where every value not 0 (or not 1) goes
-/// to 1 (or 0).
+/// off); amount is held to [-1, 1]: at 1 every value above 0 goes to 1, at
+/// -1 every value below 1 goes to 0. Amount 0 changes nothing.
 ORVANE_API bool MatteCore_DoInFill(Request *req, Image *img, double amount, int channel = MatteAlpha);
 
 /// Levels on one channel, under the tags (Tags.h, "Matte levels"):
@@ -96,7 +103,7 @@ ORVANE_API bool MatteCore_DoInFill(Request *req, Image *img, double amount, int 
 ///       1 from high on and 0 below
 ///   MatteLevelsContrast  contract/expand c in [-1, 1] (default 0): for
 ///       c >= 0 a2 = min(1, a1 / (1 - c)), for c < 0 a2 = max(0, (a1 + c) / (1 + c))
-///   MatteLevelsGamma  g > 0 (default 1): a3 = a2^(1 / g)
+///   MatteLevelsGamma  g > 0 (default 1; held to at least 1e-5): a3 = a2^(1 / g)
 /// DoLevels is the 16-bit form, DoLevelsFlt the float one; each refuses the
 /// other kind of image.
 ORVANE_API bool DoLevels(Request *req, Image *img, const TagList &tags);
@@ -109,10 +116,11 @@ enum GarbageMatteModes : int {
 };
 
 /// Applies `mask` (its alpha, or its one channel; its canvas beyond its
-/// window; 1 - m when `invert`) to `img`'s alpha by `mode`. With
-/// `premultiplied`, a garbage matte scales the colour with the alpha. When the
-/// mask's (inverted) canvas is not clear, the result's data window is widened
-/// to take in the mask's, by a new image, so the mask's region is not cut off.
+/// window; held to 0..1; 1 - m when `invert`) to `img`'s alpha by `mode`.
+/// With `premultiplied`, a garbage matte scales the colour with the alpha.
+/// When the mask's (inverted) canvas is not clear, or the mask changes the
+/// result on `img`'s canvas colour, the result's data window is widened to
+/// take in the mask's, by a new image, so the mask's region is not cut off.
 /// Returns the result (`img` itself, changed in place, or the new image); null
 /// when abandoned or out of memory. A null mask returns `img` unchanged.
 ORVANE_API Ref<Image> DoGarbageMatte(Request *req, Image *img, const Image *mask, int mode, bool premultiplied,
