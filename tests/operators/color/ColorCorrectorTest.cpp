@@ -612,9 +612,10 @@ TEST_F(ColorCorrector, MatchTakesTheReferencesHistogramWithinTheMatchRectangle) 
         Rig split(halves);
         split.Set(Parse(std::string("HistogramType=1 EqualizeRed=1 Precision=0 ") + controls));
         if (inRect) ts::SetPoint(split.cc, "MatchCenter", 0.25, 0.5);
-        if (masked)
+        if (masked) {
             ASSERT_TRUE(
                 split.cc->FindInput("MatchMask")->ConnectTo(ts::AddImageSource(split.doc, "Mask", leftMask)->Out()));
+        }
         Ref<Image> out = Render(split.cc);
         ASSERT_TRUE(out) << controls;
         const double off = Farthest(Cumulative(*out, left, 0), Flat());
