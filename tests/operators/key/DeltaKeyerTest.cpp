@@ -13,7 +13,9 @@
 #include "host/flow/ControlCommand.h"
 #include "host/flow/OrvaneDoc.h"
 #include "operators/key/DeltaKeyerSteps.h"
+#include "tests/host/krom/DeviceTestSupport.h"
 #include "tests/operators/color/ColorToolTestSupport.h"
+#include "tests/support/KeyPlates.h"
 
 namespace Orvane::deltakeyertest {
 namespace {
@@ -179,6 +181,80 @@ TEST_F(DeltaKeyerTool, APickSetsThePreMatteRangesAfterTheRender) {
     // A locked tool refuses the pick.
     Orvane::Test::SetNumber(rig.tool, "PreMatteLockPicking", 1);
     EXPECT_FALSE(rig.tool->ControlCommand(CCMD_Select, pick));
+}
+
+// The keying plates (grain, uneven screen, spill, hair, veils): a clean plate
+// beats the flat background colour, the threshold cleans the grain off the
+// screen, and restoring the fringe gives back the edges the threshold hardened.
+TEST_F(DeltaKeyerTool, CleanPlateThresholdAndFringeEachImproveThePlateScores) {
+    namespace kp = Orvane::Test;
+    for (kp::ScreenColor screen : {kp::ScreenColor::Green, kp::ScreenColor::Blue}) {
+        const kp::KeyPlate plate = kp::MakeKeyPlate(kp::KeyPlateKind::Everything, screen, 320, 180, 7);
+        SCOPED_TRACE(plate.name);
+        auto score = [&](bool clean, const std::vector<std::pair<const char *, double>> &settings) {
+            Rig rig("DeltaKeyer", plate.composite);
+            SetBackground(rig.tool, {plate.screenR, plate.screenG, plate.screenB});
+            kp::SetNumbers(rig.tool, settings);
+            if (clean) {
+                kp::ImageSourceTool *c = kp::AddImageSource(rig.doc, "Clean", plate.cleanScreen);
+                EXPECT_TRUE(rig.tool->FindInput("Clean")->ConnectTo(c->FindMainOutput()));
+            }
+            Ref<Image> out = Render(rig.tool);
+            EXPECT_TRUE(out);
+            return out ? kp::ScoreMatte(*out, *plate.trueAlpha) : kp::MatteScore{1, 1, 1};
+        };
+        const std::vector<std::pair<const char *, double>> threshold = {{"LowThreshold", 0.1}, {"HighThreshold", 0.9}};
+        std::vector<std::pair<const char *, double>> restore = threshold;
+        restore.push_back({"RestoreFringe", 0.003});
+        const kp::MatteScore flat = score(false, {}), clean = score(true, {}), hard = score(true, threshold),
+                             fringe = score(true, restore);
+        EXPECT_LT(clean.meanError, 0.8 * flat.meanError);
+        EXPECT_LT(hard.meanError, 0.8 * clean.meanError);
+        EXPECT_GT(hard.edgeMeanError, clean.edgeMeanError) << "the threshold hardens the edges";
+        EXPECT_LT(fringe.edgeMeanError, hard.edgeMeanError) << "restoring the fringe softens them again";
+        EXPECT_LT(fringe.meanError, 0.015);
+    }
+}
+
+// The whole chain on the device gives the rows' key: every step's kernel, the
+// host's blurs on the device, and the host steps between them on the rows.
+TEST_F(DeltaKeyerTool, TheDeviceChainGivesTheRowsKey) {
+    ORVANE_NEED_OPENCL(ctx);
+    namespace kp = Orvane::Test;
+    const kp::KeyPlate plate = kp::MakeKeyPlate(kp::KeyPlateKind::Everything, kp::ScreenColor::Green, 160, 90, 3);
+    Rig rig("DeltaKeyer", plate.composite);
+    SetBackground(rig.tool, {plate.screenR, plate.screenG, plate.screenB});
+    kp::ImageSourceTool *c = kp::AddImageSource(rig.doc, "Clean", plate.cleanScreen);
+    ASSERT_TRUE(rig.tool->FindInput("Clean")->ConnectTo(c->FindMainOutput()));
+    kp::SetNumbers(rig.tool, {{"PreMatteLowGreen", 0.5},
+                              {"PreMatteHighRed", 0.3},
+                              {"PreMatteSoftRange", 0.05},
+                              {"LowThreshold", 0.05},
+                              {"HighThreshold", 0.95},
+                              {"RestoreFringe", 0.004},
+                              {"CleanForeground", 0.1},
+                              {"SolidSourceAlpha", 2},
+                              {"AlphaMidtonesGain", 1.2},
+                              {"LockAlphaSpillTuning", 0}});
+    kp::SetID(rig.tool, "ReplaceMode", "HardColor");
+    for (const char *view : {"Final", "Status", "Intermediate", "Matte"}) {
+        SCOPED_TRACE(view);
+        kp::SetID(rig.tool, "ViewMode", view);
+        Ref<Image> cpu = Render(rig.tool);
+        RenderTask task;
+        task.SetDevice(ctx);
+        EvalOptions opt;
+        opt.task = &task, opt.useCache = false;
+        const int launches = ctx->LaunchCount();
+        Ref<Image> dev = kp::EvalImage(rig.tool, 0.0, opt);
+        ASSERT_TRUE(cpu && dev);
+        EXPECT_GT(ctx->LaunchCount(), launches + 4) << "the steps ran on the device";
+        ASSERT_EQ(cpu->DataWindow(), dev->DataWindow());
+        for (int y = cpu->DataWindow().y0; y < cpu->DataWindow().y1; ++y)
+            for (int x = cpu->DataWindow().x0; x < cpu->DataWindow().x1; ++x)
+                kp::ExpectPixelNear(dev->GetFlt(x, y), cpu->GetFlt(x, y), 1e-4,
+                                    std::to_string(x) + "," + std::to_string(y));
+    }
 }
 
 } // namespace
