@@ -61,6 +61,9 @@ enum SolidSourceAlpha { SolidIgnore, SolidAdd, SolidSubtract };
 constexpr double kNoChange = 1.1920928955078125e-7;
 /// Blur controls are lengths on a frame 720 wide; the blur takes frame fractions.
 constexpr double kSizeUnit = 720.0;
+/// The image inputs are fetched after the controls, so that CheckRequest can
+/// read the blur sizes.
+constexpr int kImagePriority = PriorityDefault + 1;
 /// The undo name of a pick's write-back.
 constexpr const char *kPickUndoName = "DeltaKeyer Pick Pre Matte";
 
@@ -253,7 +256,10 @@ DeltaKeyer::DeltaKeyer(const Registry *reg, const ScriptVal &args, const TagList
     garbage_ = std::make_unique<MaskInputs>(*this, "Garbage", "Garbage Matte");
 
     input_ = AddInputTagList("Input", "Input",
-                             {{LinkDataType, CLSID_DataType_Image}, {LinkMain, 1}, {ImageFromRequestOK, 1}});
+                             {{LinkDataType, CLSID_DataType_Image},
+                              {LinkMain, 1},
+                              {InputPriority, kImagePriority},
+                              {ImageFromRequestOK, 1}});
     clean_ = AddInputTagList(
         "Clean Plate", "Clean",
         {{LinkDataType, CLSID_DataType_Image}, {LinkMain, 3}, {InputRequired, 0}, {ImageFromRequestOK, 1}});
@@ -278,6 +284,38 @@ void DeltaKeyer::NotifyChanged(Input *in, Parameter *param, double time, TagList
         }
     }
     ThreadedOperator::NotifyChanged(in, param, time, tags);
+}
+
+void DeltaKeyer::Reach(const Settings &s, const ImageDomain *domain, int &rx, int &ry) {
+    // Each blur's size (frame fractions) and passes, in the chain's order.
+    const std::pair<double, int> blurs[] = {{s.preBlur / kSizeUnit, 1},
+                                            {s.preMatte ? s.preErode : 0.0, 1},
+                                            {s.preMatte ? s.preMatteBlur / kSizeUnit : 0.0, 1},
+                                            {s.restore, 1},
+                                            {std::fabs(s.erodeDilate), 1},
+                                            {s.blur / kSizeUnit, 1},
+                                            {s.fringeSize / kSizeUnit, 2}};
+    double x = 0, y = 0;
+    for (const auto &[size, passes] : blurs) {
+        double bx = size, by = size;
+        if (size > kNoChange && Image::GetBlurSupport(BlurGaussian, domain, bx, by, passes)) x += bx, y += by;
+    }
+    rx = static_cast<int>(std::ceil(x)), ry = static_cast<int>(std::ceil(y));
+}
+
+void DeltaKeyer::CheckRequest(Request *req) {
+    ThreadedOperator::CheckRequest(req);
+    if (req->GetPri() != kImagePriority || (req->GetFlags() & ReqFlagSkipRoI)) return;
+    const AutoImageRoI roi(req);
+    const AutoImageDoD inDoD(req, input_);
+    Settings s;
+    int rx = 0, ry = 0;
+    if (!roi || !inDoD || !ReadSettings(req, s)) return;
+    Reach(s, inDoD.Get(), rx, ry);
+    if (rx == 0 && ry == 0) return;
+    const ImageDomain region = roi->WithRect(roi->rect.Grown(rx, ry));
+    req->SetInputRoI(input_, &region);
+    req->SetInputRoI(clean_, &region);
 }
 
 bool DeltaKeyer::ControlCommand(int command, const TagList &tags) {
@@ -375,7 +413,16 @@ Ref<Image> DeltaKeyer::Key(Request *req, const Settings &s, const Image *src, co
                            bool solidInverted, const Image *garbage, bool garbageInverted) {
     const DeltaKeyerRun run{req, IsGPUEnabled(req, true) && !req->IsPreCalc()};
     const OvID clipping = GetClippingMode(req);
-    const ImgRectI dw = OutputDataWindow(req, input_, src, clipping);
+    const ImgRectI outWindow = OutputDataWindow(req, input_, src, clipping);
+    // Under a region of interest the work reaches beyond it by the blurs' reach,
+    // so that pixels at its edge see their neighbours; the result is cut back.
+    int rx = 0, ry = 0;
+    const AutoImageRoI roi(req);
+    if (roi) {
+        const ImageDomain frame = DomainOfImage(*src, src->DataWindow());
+        Reach(s, &frame, rx, ry);
+    }
+    const ImgRectI dw = outWindow.Grown(rx, ry);
     auto make = [&] {
         Ref<Image> img = NewImageTagList(
             {{ImgLikeImage, src}, {ImgDepth, DepthRGBAFlt32}, {ImgDataWindow, &dw}, {ImgForRequest, 1}});
@@ -527,7 +574,8 @@ Ref<Image> DeltaKeyer::Key(Request *req, const Settings &s, const Image *src, co
     if (intermediate && !ProcessCopyColor(run, intermediate.Get(), out.Get())) return {};
     if (s.view == ViewMatte && !ProcessAlphaToColor(run, out.Get(), out.Get(), false)) return {};
     if (clipping != ClippingMode_None) out->CopyCanvasColor(src);
-    return aborted() ? nullptr : out;
+    if (aborted()) return nullptr;
+    return rx == 0 && ry == 0 ? out : out->CopyOfImageTagList({{ImgDataWindow, &outWindow}});
 }
 
 void DeltaKeyer::Process(Request *req) {

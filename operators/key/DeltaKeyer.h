@@ -22,6 +22,7 @@ namespace Orvane {
 
 class Image;
 class MaskInputs;
+struct ImageDomain;
 
 class DeltaKeyer : public ThreadedOperator {
 public:
@@ -29,6 +30,9 @@ public:
     ~DeltaKeyer() override;
 
     void NotifyChanged(Input *in, Parameter *param, double time, TagList *tags) override;
+    /// Widens the region asked of the image inputs by the reach of the
+    /// chain's blurs. The images are fetched after the controls for it.
+    void CheckRequest(Request *req) override;
     void Process(Request *req) override;
     /// CCMD_Select picks the pre-matte ranges from the selected rectangle at
     /// the next render, unless Lock Color Picking is on.
@@ -37,6 +41,8 @@ public:
 private:
     struct Settings;
     bool ReadSettings(Request *req, Settings &s) const;
+    /// Pixels the chain's blurs reach on each axis, for `domain`'s frame.
+    static void Reach(const Settings &s, const ImageDomain *domain, int &rx, int &ry);
     Ref<Image> Key(Request *req, const Settings &s, const Image *src, const Image *clean, const Image *solid,
                    bool solidInverted, const Image *garbage, bool garbageInverted);
     void Pick(Request *req, const Image *src, const PickRect &rect);

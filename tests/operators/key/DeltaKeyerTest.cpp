@@ -257,5 +257,25 @@ TEST_F(DeltaKeyerTool, TheDeviceChainGivesTheRowsKey) {
     }
 }
 
+// A region of interest gives the same pixels as the whole frame: the image
+// inputs are asked for the blurs' reach around it.
+TEST_F(DeltaKeyerTool, ARegionGivesTheWholeFramesPixels) {
+    namespace kp = Orvane::Test;
+    const kp::KeyPlate plate = kp::MakeKeyPlate(kp::KeyPlateKind::Hair, kp::ScreenColor::Blue, 120, 80, 5);
+    Rig rig("DeltaKeyer", plate.composite);
+    SetBackground(rig.tool, {plate.screenR, plate.screenG, plate.screenB});
+    kp::SetNumbers(rig.tool, {{"LowThreshold", 0.1}, {"RestoreFringe", 0.01}, {"Blur", 2.0}, {"PreBlur", 1.0}});
+    Ref<Image> whole = Render(rig.tool);
+    const ImgRectI roi(40, 20, 80, 50);
+    rig.source->cutToRegion = true; // the source gives only what it is asked for
+    Ref<Image> part = Render(rig.tool, &roi);
+    ASSERT_TRUE(whole && part);
+    ASSERT_TRUE(part->DataWindow().Contains(roi));
+    for (int y = roi.y0; y < roi.y1; ++y)
+        for (int x = roi.x0; x < roi.x1; ++x)
+            kp::ExpectPixelNear(part->GetFlt(x, y), whole->GetFlt(x, y), 1e-6,
+                                std::to_string(x) + "," + std::to_string(y));
+}
+
 } // namespace
 } // namespace Orvane::deltakeyertest
