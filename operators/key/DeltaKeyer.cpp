@@ -423,13 +423,19 @@ Ref<Image> DeltaKeyer::Key(Request *req, const Settings &s, const Image *src, co
         Reach(s, &frame, rx, ry);
     }
     const ImgRectI dw = outWindow.Grown(rx, ry);
-    auto make = [&] {
-        Ref<Image> img = NewImageTagList(
-            {{ImgLikeImage, src}, {ImgDepth, DepthRGBAFlt32}, {ImgDataWindow, &dw}, {ImgForRequest, 1}});
+    // Working images: colour in RGBA float, mattes in one float channel.
+    auto make = [&](int depth = DepthRGBAFlt32) {
+        Ref<Image> img =
+            NewImageTagList({{ImgLikeImage, src}, {ImgDepth, depth}, {ImgDataWindow, &dw}, {ImgForRequest, 1}});
         if (img) img->SetAbortFlag(src->AbortFlag());
         return img;
     };
     auto copy = [](const Ref<Image> &img) { return CopyOfImage(img.Get()); };
+    auto alphaOf = [&](const Ref<Image> &img) {
+        Ref<Image> matte = make(DepthAFlt32);
+        if (matte && !MatteCore_DoCopyChannel(req, img.Get(), matte.Get(), MatteAlpha, MatteAlpha)) matte = nullptr;
+        return matte;
+    };
     auto aborted = [&] { return src->CheckAbort() || (req->GetTask() && req->GetTask()->IsAborted()); };
     const bool status = s.view == ViewStatus;
     Ref<Image> out = make();
@@ -450,7 +456,7 @@ Ref<Image> DeltaKeyer::Key(Request *req, const Settings &s, const Image *src, co
     // 3-4. The pre-matte and the image the screen pass sees.
     Ref<Image> screenIn;
     if (s.preMatte) {
-        Ref<Image> pre = make();
+        Ref<Image> pre = make(DepthAFlt32);
         if (!pre || !ProcessPreMatte(run, src, pre.Get(), s.ranges)) return {};
         if (s.preErode > kNoChange &&
             !(Blur(run, pre.Get(), s.preErode, BlurGaussian, 1) && ProcessThreshold(run, pre.Get(), 0.8f, 1.f)))
@@ -483,7 +489,7 @@ Ref<Image> DeltaKeyer::Key(Request *req, const Settings &s, const Image *src, co
     // 7. The matte stage; `before` keeps the screen's alpha.
     const bool stage = s.cleanForeground > kNoChange || s.cleanBackground > kNoChange || s.low > 0.f || s.high < 1.f ||
                        s.restore > kNoChange || std::fabs(s.erodeDilate) > kNoChange || s.blur > kNoChange;
-    Ref<Image> before = stage || status ? copy(out) : out;
+    Ref<Image> before = stage || status ? alphaOf(out) : out;
     if (!before) return {};
     if (stage) {
         if (s.cleanForeground > kNoChange &&
@@ -492,13 +498,13 @@ Ref<Image> DeltaKeyer::Key(Request *req, const Settings &s, const Image *src, co
         if (s.cleanBackground > kNoChange &&
             !RowsWritten(out.Get(), MatteCore_DoInFill(req, out.Get(), -s.cleanBackground)))
             return {};
-        Ref<Image> soft = s.restore > kNoChange ? copy(out) : nullptr;
+        Ref<Image> soft = s.restore > kNoChange ? alphaOf(out) : nullptr;
         if ((s.low > 0.f || s.high < 1.f) && !ProcessThreshold(run, out.Get(), s.low, s.high)) return {};
-        if (soft) {
+        if (s.restore > kNoChange) {
             // The threshold matte blurred, then shrunk and grown: the band between
             // them takes the soft alpha back.
-            Ref<Image> eroded = copy(out);
-            if (!eroded || !Blur(run, eroded.Get(), s.restore, BlurGaussian, 1)) return {};
+            Ref<Image> eroded = alphaOf(out);
+            if (!soft || !eroded || !Blur(run, eroded.Get(), s.restore, BlurGaussian, 1)) return {};
             Ref<Image> dilated = copy(eroded);
             if (!dilated || !ProcessThreshold(run, eroded.Get(), 0.5f, 1.f) ||
                 !ProcessThreshold(run, dilated.Get(), 0.f, 0.5f) ||
@@ -519,18 +525,19 @@ Ref<Image> DeltaKeyer::Key(Request *req, const Settings &s, const Image *src, co
     if (aborted()) return {};
     // 9. The status colours, or colour and alpha brought in step.
     if (status) {
-        Ref<Image> diff = make();
+        Ref<Image> diff = make(DepthAFlt32);
         if (!diff || !ProcessStatusDiff(run, before.Get(), out.Get(), diff.Get()) ||
             !ProcessStatus(run, out.Get(), diff.Get(), false))
             return {};
-    } else if (!ProcessColorMax(run, nullptr, out.Get())) {
+    } else if (stage && !ProcessColorMax(run, nullptr, out.Get())) {
+        // (Without the stage the screen's alpha already holds max(R, G, B).)
         return {};
     }
     Ref<Image> intermediate = s.view == ViewIntermediate ? copy(out) : nullptr;
 
     // 10. The solid matte and the source's own alpha.
     if (solid || s.solidSourceAlpha != SolidIgnore) {
-        Ref<Image> preSolid = copy(out);
+        Ref<Image> preSolid = alphaOf(out);
         if (!preSolid) return {};
         if (solid && status && !ProcessStatusSolid(run, out.Get(), solid, solidInverted)) return {};
         if (solid && !ProcessMaskMerge(run, solid, out.Get(), false, solidInverted)) return {};
@@ -553,7 +560,7 @@ Ref<Image> DeltaKeyer::Key(Request *req, const Settings &s, const Image *src, co
     const bool fringe = std::fabs(s.fringeShape - 1) > kNoChange || std::fabs(s.shift[0]) > kNoChange ||
                         std::fabs(s.shift[1]) > kNoChange || std::fabs(s.shift[2]) > kNoChange;
     if (!status && fringe) {
-        Ref<Image> edge = make();
+        Ref<Image> edge = make(DepthAFlt32);
         if (!edge || !MatteCore_DoCopyChannel(req, out.Get(), edge.Get(), MatteAlpha, MatteAlpha)) return {};
         if (s.fringeSize > kNoChange && !Blur(run, edge.Get(), s.fringeSize / kSizeUnit, BlurGaussian, 2)) return {};
         if (std::fabs(s.fringeGamma - 1) > kNoChange &&

@@ -26,7 +26,11 @@ constexpr int kBlock = 256;
 /// Below these the Status view counts alpha as clear, above them as solid.
 constexpr float kStatusClear = 0.001f, kStatusSolid = 0.9999f;
 
-float Clamp01(float v) { return std::fmin(std::fmax(v, 0.f), 1.f); }
+// fmin and fmax as the kernels have them (a NaN operand gives the other),
+// inline: the library calls cost more than the rest of a pixel.
+inline float FMax(float a, float b) { return (a >= b || b != b) ? a : b; }
+inline float FMin(float a, float b) { return (a <= b || b != b) ? a : b; }
+float Clamp01(float v) { return FMin(FMax(v, 0.f), 1.f); }
 
 /// Half-way toward colour (r, g, b).
 void Tint(FltPixel &p, float r, float g, float b) {
@@ -162,6 +166,20 @@ template <class P> std::shared_ptr<P> NewBlock() {
 
 // ---- per-pixel functions, shared by the rows and the canvas ----
 
+/// The matte of colour p under a record (DeltaKeyerMatteValue), inline for the rows.
+inline float MatteOf(const DeltaKeyerScreenInfo &info, const float p[3]) {
+    const DeltaKeyerScreenInfoParams &r = info.p;
+    float key = p[r.keyIndex];
+    if (r.tuning && info.table) {
+        float ws, wm, wh;
+        info.table->WeightsAt(key, ws, wm, wh);
+        key = key * r.shadowsGain * ws + key * r.midtonesGain * wm + key * r.highlightsGain * wh;
+    }
+    const float d = DeltaKeyerDenominator(r);
+    if (d == 0.f) return 0.f;
+    return (key - (r.midFactor * p[r.midIndex] + r.lowFactor * p[r.lowIndex])) * r.gain / d;
+}
+
 void ScreenPixels(const DeltaKeyerScreenInfo &color, const DeltaKeyerScreenInfo &alpha, bool same, const FltPixel *in,
                   const FltPixel *clean, FltPixel *out, int n) {
     DeltaKeyerScreenInfo c = color, a = alpha;
@@ -173,11 +191,11 @@ void ScreenPixels(const DeltaKeyerScreenInfo &color, const DeltaKeyerScreenInfo 
             DeltaKeyerAdjustForClean(c.p, cc);
             DeltaKeyerAdjustForClean(a.p, cc);
         }
-        const float m = DeltaKeyerMatteValue(c, p);
+        const float m = MatteOf(c, p);
         float o[3];
-        for (int k = 0; k < 3; ++k) o[k] = p[k] - std::fmin(std::fmax((c.p.background[k] + c.p.offset) * m, 0.f), p[k]);
-        const float al = same ? m * c.p.gain : DeltaKeyerMatteValue(a, p) * a.p.gain;
-        out[i] = {o[0], o[1], o[2], Clamp01(std::fmax(1.f - al, std::fmax(o[0], std::fmax(o[1], o[2]))))};
+        for (int k = 0; k < 3; ++k) o[k] = p[k] - FMin(FMax((c.p.background[k] + c.p.offset) * m, 0.f), p[k]);
+        const float al = same ? m * c.p.gain : MatteOf(a, p) * a.p.gain;
+        out[i] = {o[0], o[1], o[2], Clamp01(FMax(1.f - al, FMax(o[0], FMax(o[1], o[2]))))};
     }
 }
 
@@ -189,14 +207,14 @@ float PreMatteValue(const DeltaKeyerPreMatteRanges &r, const FltPixel &s) {
     if (!(r.soft > 0.f)) return 1.f;
     float e = 0.f;
     for (int i = 0; i < 4; ++i) {
-        const float out = std::fmax(std::fmax(v[i] - r.high[i], r.low[i] - v[i]), 0.f);
-        e = std::fmax(e, std::fmin(out, r.soft) / r.soft);
+        const float out = FMax(FMax(v[i] - r.high[i], r.low[i] - v[i]), 0.f);
+        e = FMax(e, FMin(out, r.soft) / r.soft);
     }
     return e;
 }
 
 float ThresholdValue(float a, float lo, float hi) {
-    return hi > lo ? std::fmin(std::fmax(a - lo, 0.f) / (hi - lo), 1.f) : (a > lo ? 1.f : 0.f);
+    return hi > lo ? FMin(FMax(a - lo, 0.f) / (hi - lo), 1.f) : (a > lo ? 1.f : 0.f);
 }
 
 /// The replace rule on colour f (red, green, blue) from source s.
@@ -282,18 +300,7 @@ void DeltaKeyerAdjustForClean(DeltaKeyerScreenInfoParams &p, const float clean[3
     p.offset = (m + k + l) * (p.gain - 1.f) / 3.f;
 }
 
-float DeltaKeyerMatteValue(const DeltaKeyerScreenInfo &info, const float p[3]) {
-    const DeltaKeyerScreenInfoParams &r = info.p;
-    float key = p[r.keyIndex];
-    if (r.tuning && info.table) {
-        float ws, wm, wh;
-        info.table->WeightsAt(key, ws, wm, wh);
-        key = key * r.shadowsGain * ws + key * r.midtonesGain * wm + key * r.highlightsGain * wh;
-    }
-    const float d = DeltaKeyerDenominator(r);
-    if (d == 0.f) return 0.f;
-    return (key - (r.midFactor * p[r.midIndex] + r.lowFactor * p[r.lowIndex])) * r.gain / d;
-}
+float DeltaKeyerMatteValue(const DeltaKeyerScreenInfo &info, const float p[3]) { return MatteOf(info, p); }
 
 void DeltaKeyerPickValue(float v, bool subtract, float &low, float &high) {
     constexpr float kMargin = 3.0517578e-5f;
@@ -423,7 +430,7 @@ bool ProcessRestoreFringe(const DeltaKeyerRun &run, const Image *soft, Image *im
         for (int i = 0; i < n; ++i) {
             const float ae = in[2] ? in[2][i].A : defaultErode, ad = in[3] ? in[3][i].A : defaultDilate;
             out[i] = in[0][i];
-            out[i].A = std::fmax(ae, std::fmin(in[1][i].A, ad));
+            out[i].A = FMax(ae, FMin(in[1][i].A, ad));
         }
     };
     const Inputs<4> ins{img, soft, eroded, dilated};
@@ -537,7 +544,7 @@ bool ProcessColorMax(const DeltaKeyerRun &run, const Image *key, Image *img) {
         for (int i = 0; i < n; ++i) {
             const float k = in[0] ? in[0][i].A : 0.f;
             FltPixel &d = out[i] = in[1][i];
-            d.A = Clamp01(std::fmax(std::fmax(d.A, k), std::fmax(d.R, std::fmax(d.G, d.B))));
+            d.A = Clamp01(FMax(FMax(d.A, k), FMax(d.R, FMax(d.G, d.B))));
         }
     };
     const Inputs<2> ins{key, img};
@@ -559,7 +566,7 @@ bool ProcessRangesToColor(const DeltaKeyerRun &run, const Image *src, Image *dst
         for (int i = 0; i < n; ++i) {
             const FltPixel &s = in[0][i];
             float w[3];
-            table.WeightsAt(std::fmax(std::fmax(s.R, s.G), s.B), w[0], w[1], w[2]);
+            table.WeightsAt(FMax(FMax(s.R, s.G), s.B), w[0], w[1], w[2]);
             out[i] = {w[0], w[1], w[2], 1.f};
         }
     };
