@@ -277,5 +277,43 @@ TEST_F(DeltaKeyerTool, ARegionGivesTheWholeFramesPixels) {
                                 std::to_string(x) + "," + std::to_string(y));
 }
 
+// The buttons reset the ranges and set the curves; a lock hides the spill
+// controls that follow the alpha's, and a tuning unlocked makes two records.
+TEST_F(DeltaKeyerTool, ButtonsAndLocks) {
+    OrvaneDoc doc;
+    Operator *dk = doc.AddTool(OvID("DeltaKeyer"));
+    ASSERT_TRUE(dk);
+    Orvane::Test::SetNumbers(dk, {{"PreMatteLowGreen", 0.4}, {"PreMatteHighLuminance", 0.8}});
+    dk->FindInput("ResetPreMatteRanges")->SetValue(MakeRef<Number>(1.0));
+    EXPECT_TRUE(dk->FindInput("PreMatteLowGreen")->IsDefault());
+    EXPECT_TRUE(dk->FindInput("PreMatteHighLuminance")->IsDefault());
+    Input *curves = dk->FindInput("TuningRanges");
+    dk->FindInput("PresetSmoothRanges")->SetValue(MakeRef<Number>(1.0));
+    EXPECT_TRUE(curves->Constant()->Equals(ColorCurvesTable(ColorCurvesTable::Preset::Smooth)));
+    dk->FindInput("PresetSimpleRanges")->SetValue(MakeRef<Number>(1.0));
+    EXPECT_TRUE(curves->Constant()->Equals(ColorCurvesTable()));
+    struct Case {
+        const char *lock, *follower;
+    } cases[] = {{"LockAlphaSpillReference", "SpillReferenceGreen"}, {"LockAlphaSpillTuning", "SpillMidtonesGain"}};
+    for (const Case &c : cases) {
+        EXPECT_FALSE(dk->FindInput(c.follower)->IsVisible()) << c.follower << " locked by default";
+        Orvane::Test::SetNumber(dk, c.lock, 0);
+        EXPECT_TRUE(dk->FindInput(c.follower)->IsVisible()) << c.follower;
+        Orvane::Test::SetNumber(dk, c.lock, 1);
+        EXPECT_FALSE(dk->FindInput(c.follower)->IsVisible()) << c.follower;
+    }
+    // With the tuning unlocked the spill gains key the colour: the alpha of a
+    // plate stays, its colour moves.
+    Rig rig("DeltaKeyer", Plate([](int) { return kGreen; }));
+    SetBackground(rig.tool, kGreen);
+    Ref<Image> locked = Render(rig.tool);
+    Orvane::Test::SetNumbers(rig.tool, {{"LockAlphaSpillTuning", 0}, {"SpillMidtonesGain", 1.5}});
+    Ref<Image> unlocked = Render(rig.tool);
+    ASSERT_TRUE(locked && unlocked);
+    const FltPixel a = locked->GetFlt(kW / 2, 0), b = unlocked->GetFlt(kW / 2, 0);
+    EXPECT_FLOAT_EQ(a.A, b.A);
+    EXPECT_GT(std::fabs(a.G - b.G), 1e-3);
+}
+
 } // namespace
 } // namespace Orvane::deltakeyertest
