@@ -87,7 +87,7 @@ Operator *AddToolOnFrame(benchmark::State &state, OrvaneDoc &doc, const char *cl
                          const std::vector<std::pair<const char *, double>> &numbers) {
     Output *source = AddFrameSource(doc);
     Operator *tool = doc.AddTool(OvID(classId));
-    if (!source || !tool || !tool->FindInput("Input")->ConnectTo(source)) {
+    if (!source || !tool || !tool->FindMainInput()->ConnectTo(source)) {
         state.SkipWithError("cannot make the tools");
         return nullptr;
     }

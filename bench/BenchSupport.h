@@ -23,8 +23,9 @@ bool LoadLibrary(benchmark::State &state);
 /// Adds a tool that outputs UhdFrame() (its windows only in pre-calculation).
 Output *AddFrameSource(OrvaneDoc &doc);
 
-/// Adds a tool of class `classId` reading the frame, with the number inputs
-/// `numbers` set; null, with the benchmark marked skipped, when it cannot.
+/// Adds a tool of class `classId` reading the frame on its first main input,
+/// with the number inputs `numbers` set; null, with the benchmark marked
+/// skipped, when it cannot.
 Operator *AddToolOnFrame(benchmark::State &state, OrvaneDoc &doc, const char *classId,
                          const std::vector<std::pair<const char *, double>> &numbers);
 

@@ -5,6 +5,7 @@
 #include "host/krom/kernels/DeltaKeyerKernelParams.h"
 #include "host/krom/kernels/GeneratorKernelParams.h"
 #include "host/krom/kernels/KernelTexts.h"
+#include "host/krom/kernels/KeyKernelParams.h"
 #include "host/krom/kernels/MaskKernelParams.h"
 #include "host/krom/kernels/MergeKernelParams.h"
 #include "host/krom/kernels/ResizeKernelParams.h"
@@ -43,6 +44,9 @@ const std::vector<CommonKernel> &CommonKernels() {
         {"DeltaKeyerAlphaToColor", DeltaKeyerParamsText, kDeltaKeyerKernels},
         {"DeltaKeyerCopyColor", DeltaKeyerParamsText, kDeltaKeyerKernels},
         {"DeltaKeyerSourceAlpha", DeltaKeyerParamsText, kDeltaKeyerKernels},
+        {"ChromaKeyer", ChromaKeyerParamsText, kChromaKeyerKernel},
+        {"LumaKey", LumaKeyParamsText, kLumaKeyKernel},
+        {"DifferenceKeyer", DifferenceKeyerParamsText, kDifferenceKeyerKernel},
         {"ResizeAcross", ResizeParamsText, kResizeKernels},
         {"ResizeDown", ResizeParamsText, kResizeKernels},
     };

@@ -12,7 +12,7 @@
 #include "host/image/BlurFilters.h"
 #include "host/image/Image.h"
 #include "host/image/NewImage.h"
-#include "operators/frame/IdChoices.h"
+#include "operators/filter/BlurControls.h"
 #include "operators/frame/Registration.h"
 
 namespace Orvane {
@@ -34,73 +34,19 @@ static ClassRegistration<Blur, ThreadedOperator> s_Registration(CLSID_Blur, &CLS
 
 namespace {
 
-/// The filter buttons, in order.
-constexpr IdChoice kFilterButtons[] = {{"Box", "Box"},
-                                       {"Bartlett", "Bartlett"},
-                                       {"Multi-box", "Multi-box"},
-                                       {"Gaussian", "Gaussian"},
-                                       {"Fast Gaussian", "Fast Gaussian"}};
-
-/// Every filter ID the tool knows, with its kernel: the buttons' and four
-/// that files and scripts may set. The entry just ahead of the table is the
-/// fallback for any other ID.
-struct FilterEntry {
-    const char *id;
-    int type;
-};
-constexpr FilterEntry kFilters[] = {
-    {nullptr, BlurSoften}, // fallback
-    {"Box", BlurBox},
-    {"Bartlett", BlurBartlett},
-    {"Multi-box", BlurMultiBox},
-    {"Gaussian", BlurGaussian},
-    {"Fast Gaussian", BlurFastGaussian},
-    {"YV Gaussian", BlurYvVGaussian},
-    {"VYV N=3 Gau", BlurVYV3Gaussian},
-    {"VYV N=5 Gau", BlurVYV5Gaussian},
-    {"VYV N=6 Gau", BlurVYV6Gaussian},
-    {nullptr, 0}, // end
-};
-
 /// Sizes below this (2^-23) on both axes leave nothing to do.
 constexpr double kNoSize = 1.1920928955078125e-7;
 /// Control values are lengths on a 720-wide frame.
 constexpr double kSizeUnit = 720.0;
 
-/// A domain grown by whole pixels; endless sides stay endless.
-ImageDomain Grown(ImageDomain d, int dx, int dy) {
-    auto move = [](int &side, int by) {
-        if (!IsEndlessSide(side)) side += by;
-    };
-    move(d.rect.x0, -dx), move(d.rect.x1, dx), move(d.rect.y0, -dy), move(d.rect.y1, dy);
-    return d;
-}
-
 } // namespace
 
-int Blur::FilterType(OvID id) {
-    const FilterEntry *e = kFilters + 1;
-    while (e->id && !(id == OvID(e->id))) ++e;
-    return e->id ? e->type : kFilters[0].type;
-}
+int Blur::FilterType(OvID id) { return BlurTypeOfFilter(id); }
 
 Blur::Blur(const Registry *reg, const ScriptVal &args, const TagList &tags) : ThreadedOperator(reg, args, tags) {
     AddControlPageTagList("Controls", {{PageIcon, static_cast<const void *>("Icons.Tools.Tabs.Blur")}});
 
-    TagList filterTags = WithIdChoices({{LinkDataType, CLSID_DataType_OvID},
-                                        {InputControl, CLSID_InputControl_MultiButtonID},
-                                        {ButtonsFillRow, 1},
-                                        {InputDefaultId, OvID("Fast Gaussian")},
-                                        {LinkForceSave, 1},
-                                        {InputNotify, 1}},
-                                       kFilterButtons);
-    // Filters without a button that documents and scripts may still name, "Soften" of old documents among them.
-    filterTags.Add({ListAcceptedId, OvID("Soften")});
-    for (const FilterEntry *f = kFilters + 1; f->id; ++f)
-        if (std::none_of(std::begin(kFilterButtons), std::end(kFilterButtons),
-                         [f](const IdChoice &button) { return std::strcmp(button.id, f->id) == 0; }))
-            filterTags.Add({ListAcceptedId, OvID(f->id)});
-    filter_ = AddInputTagList("Filter", "Filter", filterTags);
+    filter_ = AddInputTagList("Filter", "Filter", BlurFilterTags());
 
     // The channel buttons: one row (control group 12) under a blank heading.
     const char *const names[4] = {"Red", "Green", "Blue", "Alpha"};
@@ -137,27 +83,8 @@ Blur::Blur(const Registry *reg, const ScriptVal &args, const TagList &tags) : Th
                        {InputSendRequest, 0}};
     xSize_ = AddInputTagList("X Blur Size", "XBlurSize", size);
     ySize_ = AddInputTagList("Y Blur Size", "YBlurSize", size);
-    passes_ = AddInputTagList("Num Passes", "Passes",
-                              {{LinkDataType, CLSID_DataType_Number},
-                               {InputControl, CLSID_InputControl_Slider},
-                               {InputInteger, 1},
-                               {InputDefault, 4.0},
-                               {InputMinAllowed, 1.0},
-                               {InputMaxAllowed, 64.0},
-                               {InputSliderLow, 1.0},
-                               {InputSliderHigh, 16.0},
-                               {ControlVisible, 0}});
-    clipping_ = AddInputTagList("Clipping Mode", "ClippingMode",
-                                {{LinkDataType, CLSID_DataType_OvID},
-                                 {InputControl, CLSID_InputControl_MultiButtonID},
-                                 {ButtonsFillRow, 1},
-                                 {InputDefaultId, ClippingMode_Frame},
-                                 {ListAddItem, "None"},
-                                 {ListItemId, ClippingMode_None},
-                                 {ListAddItem, "Domain"},
-                                 {ListItemId, ClippingMode_Domain},
-                                 {ListAddItem, "Frame"},
-                                 {ListItemId, ClippingMode_Frame}});
+    passes_ = AddInputTagList("Num Passes", "Passes", BlurPassesTags());
+    clipping_ = AddInputTagList("Clipping Mode", "ClippingMode", ClippingModeTags(ClippingMode_Frame));
     // The common Blend shown on this page: the host cannot clone an input, so
     // this is an input of its own with the same description (see Blur.h).
     blendClone_ = AddInputTagList("Blend", "BlendClone",
@@ -197,25 +124,11 @@ void Blur::NotifyChanged(Input *in, Parameter *param, double time, TagList *tags
     ThreadedOperator::NotifyChanged(in, param, time, tags);
 }
 
-Ref<Parameter> Blur::Ask(Request *req, Input *in) const {
-    if (Parameter *fetched = req->GetInputData(in)) return Ref<Parameter>(fetched);
-    if (!in->Link()) return in->ValueAt(req->GetInputTime(in));
-    EvalOptions opt;
-    opt.task = req->GetTask();
-    return Evaluate(in->Link(), req->GetInputTime(in), opt);
-}
-
 double Blur::AskNumber(Request *req, Input *in) const {
-    const Ref<Parameter> value = Ask(req, in);
-    if (const auto *n = dynamic_cast<const Number *>(value.Get())) return n->value;
-    return req->GetInputNumber(in, 0.0); // the default
+    return AskInputNumber(req, in, req->GetInputNumber(in, 0.0)); // the default
 }
 
-OvID Blur::AskID(Request *req, Input *in) const {
-    const Ref<Parameter> value = Ask(req, in);
-    if (const auto *id = dynamic_cast<const IDValue *>(value.Get())) return id->value;
-    return req->GetInputID(in);
-}
+OvID Blur::AskID(Request *req, Input *in) const { return AskInputID(req, in, req->GetInputID(in)); }
 
 Blur::Sizes Blur::ReadSizes(Request *req) const {
     Sizes s;
@@ -238,8 +151,9 @@ void Blur::CheckRequest(Request *req) {
         return;
     }
     const AutoImageRoI roi(req);
-    ImageDomain region =
-        Grown(roi ? *roi.Get() : *outDoD.Get(), static_cast<int>(std::ceil(x)), static_cast<int>(std::ceil(y)));
+    const ImageDomain &around = roi ? *roi.Get() : *outDoD.Get();
+    ImageDomain region = around.WithRect(
+        GrownKeepingEndless(around.rect, static_cast<int>(std::ceil(x)), static_cast<int>(std::ceil(y))));
     const OvID mode = AskID(req, clipping_);
     if (mode == ClippingMode_Domain)
         region.ClipTo(inDoD->rect);

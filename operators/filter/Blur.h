@@ -50,10 +50,7 @@ private:
         int passes = 1;
     };
     Sizes ReadSizes(Request *req) const;
-    /// An input's value for this request: the fetched one, else (sizes are
-    /// not fetched with the request, and CheckRequest runs before the
-    /// controls' level is fetched) asked for here at the request's time.
-    Ref<Parameter> Ask(Request *req, Input *in) const;
+    /// An input's value for this request (BlurControls.h), else its default.
     double AskNumber(Request *req, Input *in) const;
     OvID AskID(Request *req, Input *in) const;
 

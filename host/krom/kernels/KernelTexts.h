@@ -27,6 +27,12 @@ extern const char kMaskMergeKernel[];
 /// Replace, ReplaceMask, MaskMerge, ColorMax, Status, StatusDiff, StatusSolid, StatusGarbage, RangesToColor,
 /// AlphaToColor, CopyColor, SourceAlpha.
 extern const char kDeltaKeyerKernels[];
+/// "ChromaKeyer".
+extern const char kChromaKeyerKernel[];
+/// "LumaKey".
+extern const char kLumaKeyKernel[];
+/// "DifferenceKeyer".
+extern const char kDifferenceKeyerKernel[];
 /// "ResizeAcross" and "ResizeDown".
 extern const char kResizeKernels[];
 } // namespace Orvane

@@ -1,0 +1,43 @@
+#pragma once
+// ChromaKey: keys a uniform coloured background by a box of colour ranges.
+// Each pixel is placed on four axes, red, green, blue and luminance (the
+// chroma axes of KeyFunctions.h with Key Type "Chroma", plain colour with
+// "Color"); inside the box of the four ranges, ends included, alpha is 0,
+// beyond it alpha rises over the Soft Range to 1. While every range stands
+// at its default (0 to 1) nothing has been chosen to key, and the matte is
+// solid (DoSolidAlpha). The refining chain follows, with spill and fringe.
+//
+// Colour picking on the viewer is not available: the host has no command
+// path from the viewer to a tool. The ranges are set as numbers.
+//
+// Thread safety: as SimpleKeyer.
+#include "operators/key/KeyFunctions.h"
+#include "operators/key/SimpleKeyer.h"
+
+namespace Orvane {
+
+class ChromaKey : public SimpleKeyer {
+public:
+    ChromaKey(const Registry *reg, const ScriptVal &args, const TagList &tags);
+    size_t SizeOf() const override { return sizeof(*this); }
+
+    void NotifyChanged(Input *in, Parameter *param, double time, TagList *tags) override;
+
+    /// The first matte: `src`'s colour, the range key in alpha (device or rows).
+    bool DoChromaKey(Request *req, const Image *src, Image *dst);
+    /// `src`'s colour with alpha 1, the canvas likewise.
+    bool DoSolidAlpha(Request *req, const Image *src, Image *dst);
+
+protected:
+    bool ReadKey(Request *req, KeyerMatte::Values &v) override;
+    bool FirstMatte(Request *req, const Image *src, Image *dst) override;
+
+private:
+    bool RunDevice(Request *req, const Image *src, Image *dst) const;
+
+    ChromaKeyRanges ranges_;
+    bool solid_ = true; ///< every range at its default
+    Input *keyType_, *low_[4], *high_[4], *lock_, *soft_, *reset_;
+};
+
+} // namespace Orvane
