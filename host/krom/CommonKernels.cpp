@@ -2,6 +2,7 @@
 
 #include "host/krom/kernels/BlurKernelParams.h"
 #include "host/krom/kernels/ColorKernelParams.h"
+#include "host/krom/kernels/DeltaKeyerKernelParams.h"
 #include "host/krom/kernels/GeneratorKernelParams.h"
 #include "host/krom/kernels/KernelTexts.h"
 #include "host/krom/kernels/KeyKernelParams.h"
@@ -27,6 +28,23 @@ const std::vector<CommonKernel> &CommonKernels() {
         {"BlurColumns", BlurColumnsParamsText, kBlurColumnsKernel},
         {"Merge", MergeParamsText, kMergeKernel},
         {"MaskMerge", MaskMergeParamsText, kMaskMergeKernel},
+        {"DeltaKeyerScreen", DeltaKeyerParamsText, kDeltaKeyerKernels},
+        {"DeltaKeyerPreMatte", DeltaKeyerParamsText, kDeltaKeyerKernels},
+        {"DeltaKeyerPreMatteCombine", DeltaKeyerParamsText, kDeltaKeyerKernels},
+        {"DeltaKeyerThreshold", DeltaKeyerParamsText, kDeltaKeyerKernels},
+        {"DeltaKeyerRestoreFringe", DeltaKeyerParamsText, kDeltaKeyerKernels},
+        {"DeltaKeyerReplace", DeltaKeyerParamsText, kDeltaKeyerKernels},
+        {"DeltaKeyerMaskMerge", DeltaKeyerParamsText, kDeltaKeyerKernels},
+        {"DeltaKeyerColorMax", DeltaKeyerParamsText, kDeltaKeyerKernels},
+        {"DeltaKeyerReplaceMask", DeltaKeyerParamsText, kDeltaKeyerKernels},
+        {"DeltaKeyerStatusDiff", DeltaKeyerParamsText, kDeltaKeyerKernels},
+        {"DeltaKeyerStatus", DeltaKeyerParamsText, kDeltaKeyerKernels},
+        {"DeltaKeyerStatusSolid", DeltaKeyerParamsText, kDeltaKeyerKernels},
+        {"DeltaKeyerStatusGarbage", DeltaKeyerParamsText, kDeltaKeyerKernels},
+        {"DeltaKeyerRangesToColor", DeltaKeyerParamsText, kDeltaKeyerKernels},
+        {"DeltaKeyerAlphaToColor", DeltaKeyerParamsText, kDeltaKeyerKernels},
+        {"DeltaKeyerCopyColor", DeltaKeyerParamsText, kDeltaKeyerKernels},
+        {"DeltaKeyerSourceAlpha", DeltaKeyerParamsText, kDeltaKeyerKernels},
         {"ChromaKeyer", ChromaKeyerParamsText, kChromaKeyerKernel},
         {"LumaKey", LumaKeyParamsText, kLumaKeyKernel},
         {"DifferenceKeyer", DifferenceKeyerParamsText, kDifferenceKeyerKernel},

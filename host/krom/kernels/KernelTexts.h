@@ -23,6 +23,10 @@ extern const char kBlurColumnsKernel[];
 extern const char kMergeKernel[];
 /// "MaskMerge".
 extern const char kMaskMergeKernel[];
+/// The Delta Keyer's: "DeltaKeyer" followed by Screen, PreMatte, PreMatteCombine, Threshold, RestoreFringe,
+/// Replace, ReplaceMask, MaskMerge, ColorMax, Status, StatusDiff, StatusSolid, StatusGarbage, RangesToColor,
+/// AlphaToColor, CopyColor, SourceAlpha.
+extern const char kDeltaKeyerKernels[];
 /// "ChromaKeyer".
 extern const char kChromaKeyerKernel[];
 /// "LumaKey".
