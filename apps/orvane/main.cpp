@@ -76,11 +76,13 @@ const Command kCommands[] = {
     {"remove", RunRemove, R"(orvane remove FLOW TOOL...
   Removes tools (their links go with them) and saves the flow.
 )"},
-    {"pick", RunPick, R"(orvane pick FLOW TOOL X0,Y0,X1,Y1 [options]
-  Picks colours for TOOL (a keyer) from a rectangle of its image, as dragging
-  over the image in a viewer does, and saves the values the tool found into
-  the flow. X0,Y0 and X1,Y1 are the corner pixels, both included, columns from
-  the left and rows from the bottom.
+    {"pick", RunPick, R"(orvane pick FLOW TOOL[.COLOR] X0,Y0,X1,Y1 [options]
+  Picks colours from a rectangle of an image, as dragging over it in a viewer
+  does, and saves them into the flow. TOOL alone: the tool (a keyer) picks its
+  colour ranges from its image. TOOL.COLOR: the colour control COLOR (inputs
+  COLORRed, COLORGreen, COLORBlue, e.g. Background) takes the mean colour of
+  the image on the tool's main input. X0,Y0 and X1,Y1 are the corner pixels,
+  both included, columns from the left and rows from the bottom.
   --subtract            take the picked colours out of the ranges
   --fractions           the corners are frame fractions (0..1) instead
   --time T              the frame to pick from (default: the render range's start)
