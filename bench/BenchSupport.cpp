@@ -19,7 +19,7 @@ public:
         output_ = AddOutputTagList("Output", "Output", {{LinkDataType, CLSID_DataType_Image}, {LinkMain, 1}});
     }
     void Process(Request *req) override {
-        const Image *frame = UhdFrame().Get();
+        const Image *frame = image_ ? image_.Get() : UhdFrame().Get();
         if (!req->IsPreCalc()) {
             req->SetOutputData(output_, const_cast<Image *>(frame));
             return;
@@ -29,9 +29,11 @@ public:
         req->SetOutputData(output_, shape.Get());
     }
     Output *Out() const { return output_; }
+    void SetImage(Ref<Image> image) { image_ = std::move(image); }
 
 private:
     Output *output_;
+    Ref<Image> image_; ///< null: the UHD frame
 };
 
 const OvID FrameSourceClass("BenchFrameSource");
@@ -67,7 +69,9 @@ bool LoadLibrary(benchmark::State &state) {
     return false;
 }
 
-Output *AddFrameSource(OrvaneDoc &doc) {
+Output *AddFrameSource(OrvaneDoc &doc) { return AddImageSource(doc, nullptr, "Frame"); }
+
+Output *AddImageSource(OrvaneDoc &doc, Ref<Image> image, const char *name) {
     static const Registry *row = [] {
         TagList tags{{RegConstructor, &MakeFrameSource},
                      {RegTypeFlags, static_cast<long long>(RegKindOperator | RegKindTool | RegKindSource)},
@@ -78,8 +82,9 @@ Output *AddFrameSource(OrvaneDoc &doc) {
                      {RegSupportsDoD, 1}};
         return Registry::_Init(&ClassRegistry, FrameSourceClass, tags);
     }();
-    UhdFrame(); // made before any timing starts
-    auto *source = row ? dynamic_cast<FrameSource *>(doc.AddTool(FrameSourceClass, "Frame")) : nullptr;
+    if (!image) UhdFrame(); // made before any timing starts
+    auto *source = row ? dynamic_cast<FrameSource *>(doc.AddTool(FrameSourceClass, name)) : nullptr;
+    if (source) source->SetImage(std::move(image));
     return source ? source->Out() : nullptr;
 }
 

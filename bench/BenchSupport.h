@@ -22,6 +22,8 @@ bool LoadLibrary(benchmark::State &state);
 
 /// Adds a tool that outputs UhdFrame() (its windows only in pre-calculation).
 Output *AddFrameSource(OrvaneDoc &doc);
+/// The same for any image (null: UhdFrame()), as the tool `name`.
+Output *AddImageSource(OrvaneDoc &doc, Ref<Image> image, const char *name);
 
 /// Adds a tool of class `classId` reading the frame on its first main input,
 /// with the number inputs `numbers` set; null, with the benchmark marked
