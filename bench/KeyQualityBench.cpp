@@ -8,6 +8,10 @@
 //   mean_err  mean |alpha - true alpha| over the frame
 //   edge_err  the same over the edge pixels (0 < true alpha < 1)
 //   worst_err the largest
+//   edge_colour  how far the keyed colour stays from the true unspilled
+//             foreground where the spill reaches (EdgeColourDistance; the
+//             Ultra and Chroma Keyers post-multiply for it), beside
+//             spilled, the same for the foreground as the screen lit it
 // Rows: Delta (the screen colour alone), DeltaClean (with the clean screen
 // as clean plate, threshold 0.1..0.9 and fringe restore), Ultra (screen
 // colour, background subtracted), Chroma (ranges 0.06 around the screen's
@@ -84,10 +88,12 @@ void BM_KeyQuality(benchmark::State &state, Keyer keyer, kp::ScreenColor screen)
         break;
     case Keyer::Ultra:
         settings = ScreenColour(plate);
+        settings.push_back({"PostMultiplyImage", 1.0});
         linked = tool->FindInput("Input")->ConnectTo(composite);
         break;
     case Keyer::Chroma:
         settings = ChromaRanges(plate);
+        settings.push_back({"PostMultiplyImage", 1.0});
         linked = tool->FindInput("Input")->ConnectTo(composite);
         break;
     case Keyer::Difference:
@@ -116,6 +122,10 @@ void BM_KeyQuality(benchmark::State &state, Keyer keyer, kp::ScreenColor screen)
     state.counters["mean_err"] = score.meanError;
     state.counters["edge_err"] = score.edgeMeanError;
     state.counters["worst_err"] = score.worstError;
+    if (keyer != Keyer::Difference) {
+        state.counters["edge_colour"] = kp::EdgeColourDistance(*matte, plate);
+        state.counters["spilled"] = kp::EdgeColourDistance(*plate.spilledForeground, plate);
+    }
 }
 
 void RegisterRows() {
