@@ -2,7 +2,6 @@
 
 #include <cstring>
 #include <memory>
-#include <string>
 
 #include "host/core/Tags.h"
 #include "host/flow/DataTypes.h"
@@ -12,10 +11,13 @@
 #include "host/krom/kernels/KeyKernelParams.h"
 #include "operators/frame/Registration.h"
 #include "operators/key/KeyRows.h"
+#include "operators/warp/SizingCommon.h"
 
 namespace Orvane {
 
 static const OvID CLSID_ChromaKeyer("ChromaKeyer");
+static constexpr const char *kRangeIds[8] = {"RedLow",  "GreenLow",  "BlueLow",  "LuminanceLow",
+                                             "RedHigh", "GreenHigh", "BlueHigh", "LuminanceHigh"};
 static ClassRegistration<ChromaKey, ThreadedOperator>
     s_Registration(CLSID_ChromaKeyer, &CLSID_ThreadedOperator,
                    {{RegTypeFlags, RegKindOperator | RegKindTool},
@@ -33,7 +35,8 @@ static ClassRegistration<ChromaKey, ThreadedOperator>
                     {RegSupportsGPUImages, 1}});
 
 ChromaKey::ChromaKey(const Registry *reg, const ScriptVal &args, const TagList &tags)
-    : SimpleKeyer(reg, args, tags, KeyerMatte::Flavour::Screen) {
+    : SimpleKeyer(reg, args, tags, KeyerMatte::Flavour::Screen),
+      picker_(*this, "LockColorPicking", kRangeIds, "ChromaKeyer Pick") {
     AddControlPageTagList("Chroma", {});
     keyType_ = AddInputTagList("Key Type", "KeyType",
                                {{LinkDataType, CLSID_DataType_Number},
@@ -43,20 +46,13 @@ ChromaKey::ChromaKey(const Registry *reg, const ScriptVal &args, const TagList &
                                 {ListAddItem, "Chroma"},
                                 {ListAddItem, "Color"}});
     BeginControlNestTagList("Color Range", "ColorRangeNest", true, {});
-    static const char *const axes[4] = {"Red", "Green", "Blue", "Luminance"};
-    for (int i = 0; i < 4; ++i) {
-        const std::string axis = axes[i];
-        TagList low = RangeTags(i + 1, 0, 0.0);
-        low.Set({ControlRowLabel, axes[i]});
-        low_[i] = AddInputTagList((axis + " Low").c_str(), (axis + "Low").c_str(), low);
-        high_[i] = AddInputTagList((axis + " High").c_str(), (axis + "High").c_str(), RangeTags(i + 1, 1, 1.0));
-    }
+    rangeInputs_.Add(*this, kRangeIds, 1);
     EndControlNest();
-    lock_ = AddInputTagList("Lock Color Picking", "LockColorPicking",
-                            {{LinkDataType, CLSID_DataType_Number},
-                             {InputControl, CLSID_InputControl_Checkbox},
-                             {InputDefault, 0.0},
-                             {InputPassive, 1}});
+    AddInputTagList("Lock Color Picking", "LockColorPicking",
+                    {{LinkDataType, CLSID_DataType_Number},
+                     {InputControl, CLSID_InputControl_Checkbox},
+                     {InputDefault, 0.0},
+                     {InputPassive, 1}});
     soft_ = AddInputTagList("Soft Range", "SoftRange",
                             {{LinkDataType, CLSID_DataType_Number},
                              {InputControl, CLSID_InputControl_Slider},
@@ -65,14 +61,7 @@ ChromaKey::ChromaKey(const Registry *reg, const ScriptVal &args, const TagList &
                              {InputMaxAllowed, 1.0},
                              {InputSliderLow, 0.0},
                              {InputSliderHigh, 0.2}});
-    reset_ = AddInputTagList("Reset Color Ranges", "ResetColorRanges",
-                             {{LinkDataType, CLSID_DataType_Number},
-                              {InputControl, CLSID_InputControl_Button},
-                              {InputExternal, 0},
-                              {InputPassive, 1},
-                              {InputNotify, 1},
-                              {InputInitialNotify, 0},
-                              {LinkNotSaved, 1}});
+    reset_ = AddButton(this, "Reset Color Ranges", "ResetColorRanges");
     AddControlPageTagList("Image", {});
     matte_.AddImageInputs(true);
     AddControlPageTagList("Matte", {});
@@ -82,19 +71,24 @@ ChromaKey::ChromaKey(const Registry *reg, const ScriptVal &args, const TagList &
 }
 
 void ChromaKey::NotifyChanged(Input *in, Parameter *param, double time, TagList *tags) {
-    if (in == reset_ && param)
-        for (int i = 0; i < 4; ++i) low_[i]->ResetValue(), high_[i]->ResetValue();
+    if (in == reset_ && param) rangeInputs_.Reset();
     SimpleKeyer::NotifyChanged(in, param, time, tags);
+}
+
+bool ChromaKey::ControlCommand(int command, const TagList &tags) {
+    if (command != CCMD_Select) return SimpleKeyer::ControlCommand(command, tags);
+    return picker_.Select(tags);
+}
+
+void ChromaKey::Process(Request *req) {
+    SimpleKeyer::Process(req); // ReadKey reads the ranges this render keys with
+    const auto *src = dynamic_cast<const Image *>(req->GetInputData(input_));
+    if (src && !req->IsPreCalc()) picker_.Apply(*src, ranges_.keyType, ranges_.low, ranges_.high);
 }
 
 bool ChromaKey::ReadKey(Request *req, KeyerMatte::Values &) {
     ranges_.keyType = req->GetInputNumber(keyType_, 0.0) >= 0.5 ? 1 : 0;
-    solid_ = true;
-    for (int i = 0; i < 4; ++i) {
-        ranges_.low[i] = static_cast<float>(req->GetInputNumber(low_[i], 0.0));
-        ranges_.high[i] = static_cast<float>(req->GetInputNumber(high_[i], 1.0));
-        solid_ = solid_ && ranges_.low[i] == 0.f && ranges_.high[i] == 1.f;
-    }
+    solid_ = rangeInputs_.Read(req, ranges_.low, ranges_.high);
     ranges_.soft = static_cast<float>(req->GetInputNumber(soft_, 0.0));
     return true;
 }

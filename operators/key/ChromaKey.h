@@ -7,11 +7,14 @@
 // at its default (0 to 1) nothing has been chosen to key, and the matte is
 // solid (DoSolidAlpha). The refining chain follows, with spill and fringe.
 //
-// Colour picking on the viewer is not available: the host has no command
-// path from the viewer to a tool. The ranges are set as numbers.
+// Picking (RangePicker.h): ControlCommand takes CCMD_Select unless Lock
+// Color Picking is on; the next pixel request walks the source under the
+// rectangle on the Key Type's axes and writes the ranges back as one edit,
+// "ChromaKeyer Pick".
 //
-// Thread safety: as SimpleKeyer.
+// Thread safety: as SimpleKeyer; ControlCommand runs on the main thread.
 #include "operators/key/KeyFunctions.h"
+#include "operators/key/RangePicker.h"
 #include "operators/key/SimpleKeyer.h"
 
 namespace Orvane {
@@ -22,6 +25,8 @@ public:
     size_t SizeOf() const override { return sizeof(*this); }
 
     void NotifyChanged(Input *in, Parameter *param, double time, TagList *tags) override;
+    void Process(Request *req) override;
+    bool ControlCommand(int command, const TagList &tags) override;
 
     /// The first matte: `src`'s colour, the range key in alpha (device or rows).
     bool DoChromaKey(Request *req, const Image *src, Image *dst);
@@ -37,7 +42,9 @@ private:
 
     ChromaKeyRanges ranges_;
     bool solid_ = true; ///< every range at its default
-    Input *keyType_, *low_[4], *high_[4], *lock_, *soft_, *reset_;
+    RangeInputs rangeInputs_;
+    Input *keyType_, *soft_, *reset_;
+    RangePicker picker_;
 };
 
 } // namespace Orvane

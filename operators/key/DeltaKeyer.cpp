@@ -2,23 +2,19 @@
 
 #include <algorithm>
 #include <cmath>
-#include <limits>
 #include <string>
-#include <vector>
 
 #include "host/color/ColorCurvesTable.h"
 #include "host/core/Tags.h"
 #include "host/flow/DataTypes.h"
 #include "host/flow/InputValue.h"
 #include "host/flow/Link.h"
-#include "host/flow/OrvaneDoc.h"
 #include "host/flow/RenderTask.h"
 #include "host/flow/Request.h"
 #include "host/flow/ToolFrame.h"
 #include "host/image/BlurFilters.h"
 #include "host/image/Image.h"
 #include "host/image/NewImage.h"
-#include "host/image/PixelConvert.h"
 #include "host/matte/MaskInputs.h"
 #include "host/matte/MatteSteps.h"
 #include "operators/frame/IdChoices.h"
@@ -64,8 +60,10 @@ constexpr double kSizeUnit = 720.0;
 /// The image inputs are fetched after the controls, so that CheckRequest can
 /// read the blur sizes.
 constexpr int kImagePriority = PriorityDefault + 1;
-/// The undo name of a pick's write-back.
-constexpr const char *kPickUndoName = "DeltaKeyer Pick Pre Matte";
+/// The pre-matte's range inputs: the four lows, then the four highs.
+constexpr const char *kPreMatteRangeIds[8] = {"PreMatteLowRed",       "PreMatteLowGreen",     "PreMatteLowBlue",
+                                              "PreMatteLowLuminance", "PreMatteHighRed",      "PreMatteHighGreen",
+                                              "PreMatteHighBlue",     "PreMatteHighLuminance"};
 
 TagList Slider(double def, double low, double high) {
     return {{LinkDataType, CLSID_DataType_Number},
@@ -137,7 +135,8 @@ struct DeltaKeyer::Settings {
 };
 
 DeltaKeyer::DeltaKeyer(const Registry *reg, const ScriptVal &args, const TagList &tags)
-    : ThreadedOperator(reg, args, tags) {
+    : ThreadedOperator(reg, args, tags),
+      picker_(*this, "PreMatteLockPicking", kPreMatteRangeIds, "DeltaKeyer Pick Pre Matte") {
     view_ = AddInputTagList("View Mode", "ViewMode",
                             WithIdChoices({{LinkDataType, CLSID_DataType_OvID},
                                            {InputControl, CLSID_InputControl_ComboID},
@@ -176,20 +175,8 @@ DeltaKeyer::DeltaKeyer(const Registry *reg, const ScriptVal &args, const TagList
     preBlurMatte_ = AddInputTagList("Blur", "PreMatteBlur", Hard(Slider(0.0, 0.0, 10.0), 0.0, 1000.0));
     TagList pickLock = Checkbox(0.0);
     pickLock.Add({InputExternal, 0}), pickLock.Add({InputPassive, 1});
-    lockPicking_ = AddInputTagList("Lock Color Picking", "PreMatteLockPicking", pickLock);
-    static const char *const kAxes[4] = {"Red", "Green", "Blue", "Luminance"};
-    for (int i = 0; i < 4; ++i) {
-        auto range = [&](double def, int member) {
-            TagList t = Slider(def, 0.0, 1.0);
-            t.Set({InputControl, CLSID_InputControl_Range});
-            t.Add({ControlGroup, 4 + i}), t.Add({ControlMember, member});
-            if (member == 0) t.Add({ControlRowLabel, kAxes[i]});
-            return t;
-        };
-        const std::string axis = kAxes[i];
-        preLow_[i] = AddInputTagList((axis + " Low").c_str(), ("PreMatteLow" + axis).c_str(), range(0.0, 0));
-        preHigh_[i] = AddInputTagList((axis + " High").c_str(), ("PreMatteHigh" + axis).c_str(), range(1.0, 1));
-    }
+    AddInputTagList("Lock Color Picking", "PreMatteLockPicking", pickLock);
+    preRanges_.Add(*this, kPreMatteRangeIds, 4);
     resetRanges_ = AddButton(this, "Reset Pre Matte Ranges", "ResetPreMatteRanges");
 
     AddControlPageTagList("Matte", Page("Icons.Tools.Tabs.Matte"));
@@ -270,8 +257,7 @@ DeltaKeyer::~DeltaKeyer() = default;
 
 void DeltaKeyer::NotifyChanged(Input *in, Parameter *param, double time, TagList *tags) {
     if (param) {
-        if (in == resetRanges_)
-            for (int i = 0; i < 4; ++i) preLow_[i]->ResetValue(), preHigh_[i]->ResetValue();
+        if (in == resetRanges_) preRanges_.Reset();
         if (in == presetSimple_) tuningRanges_->SetValue(MakeRef<ColorCurvesTable>(ColorCurvesTable::Preset::Simple));
         if (in == presetSmooth_) tuningRanges_->SetValue(MakeRef<ColorCurvesTable>(ColorCurvesTable::Preset::Smooth));
     }
@@ -319,46 +305,7 @@ void DeltaKeyer::CheckRequest(Request *req) {
 }
 
 bool DeltaKeyer::ControlCommand(int command, const TagList &tags) {
-    if (command != CCMD_Select || Checked(lockPicking_)) return false;
-    std::lock_guard<std::mutex> guard(pickLock_);
-    pick_ = PickRect::FromTags(tags);
-    return true;
-}
-
-void DeltaKeyer::Pick(Request *req, const Image *src, const PickRect &rect) {
-    const int w = src->Width(), h = src->Height();
-    const ImgRectI r =
-        ImgRectI(static_cast<int>(std::floor(rect.left * w)), static_cast<int>(std::floor(rect.bottom * h)),
-                 static_cast<int>(std::floor(rect.right * w)) + 1, static_cast<int>(std::floor(rect.top * h)) + 1) &
-        src->DataWindow();
-    OrvaneDoc *doc = GetDoc();
-    if (r.IsNull() || !doc || !src->DownloadGPUMem()) return;
-    float low[4], high[4];
-    bool defaults = true;
-    for (int i = 0; i < 4; ++i) {
-        low[i] = static_cast<float>(req->GetInputNumber(preLow_[i], 0.0));
-        high[i] = static_cast<float>(req->GetInputNumber(preHigh_[i], 1.0));
-        defaults = defaults && low[i] == 0.f && high[i] == 1.f;
-    }
-    // Ranges at their defaults hold everything: a pick then starts them afresh.
-    if (defaults && !rect.subtract)
-        std::fill(low, low + 4, std::numeric_limits<float>::max()),
-            std::fill(high, high + 4, std::numeric_limits<float>::lowest());
-    std::vector<FltPixel> row(static_cast<size_t>(r.Width()));
-    for (int y = r.y0; y < r.y1; ++y) {
-        ReadSpanFlt(*src, y, r.x0, r.x1, row.data());
-        for (const FltPixel &p : row) {
-            const float v[4] = {p.R, p.G, p.B, 0.299f * p.R + 0.587f * p.G + 0.114f * p.B};
-            for (int i = 0; i < 4; ++i) DeltaKeyerPickValue(v[i], rect.subtract, low[i], high[i]);
-        }
-    }
-    std::vector<std::pair<Input *, double>> values;
-    for (int i = 0; i < 4; ++i) values.push_back({preLow_[i], low[i]}), values.push_back({preHigh_[i], high[i]});
-    doc->DocExecute(
-        [values](OrvaneDoc &) {
-            for (const auto &[in, v] : values) in->SetValue(MakeRef<Number>(v));
-        },
-        kPickUndoName);
+    return command == CCMD_Select && picker_.Select(tags);
 }
 
 bool DeltaKeyer::ReadSettings(Request *req, Settings &s) const {
@@ -390,10 +337,7 @@ bool DeltaKeyer::ReadSettings(Request *req, Settings &s) const {
     s.same = std::equal(s.alpha.reference, s.alpha.reference + 3, s.color.reference) &&
              std::equal(s.alpha.rangeGains, s.alpha.rangeGains + 3, s.color.rangeGains);
     s.preBlur = num(preBlur_, 0.0);
-    for (int i = 0; i < 4; ++i) {
-        s.ranges.low[i] = flt(preLow_[i], 0.0), s.ranges.high[i] = flt(preHigh_[i], 1.0);
-        s.preMatte = s.preMatte || s.ranges.low[i] != 0.f || s.ranges.high[i] != 1.f;
-    }
+    s.preMatte = !preRanges_.Read(req, s.ranges.low, s.ranges.high);
     s.ranges.soft = flt(preSoft_, 0.0);
     s.preErode = num(preErode_, 0.0), s.preMatteBlur = num(preBlurMatte_, 0.0);
     s.low = flt(lowThreshold_, 0.0), s.high = flt(highThreshold_, 1.0);
@@ -601,12 +545,7 @@ void DeltaKeyer::Process(Request *req) {
                                                      {ImgForRequest, 1}}));
         return;
     }
-    std::optional<PickRect> pick;
-    {
-        std::lock_guard<std::mutex> guard(pickLock_);
-        pick.swap(pick_);
-    }
-    if (pick) Pick(req, src, *pick);
+    picker_.Apply(*src, 1, s.ranges.low, s.ranges.high); // the R, G, B and luminance axes
     bool solidInverted = false, garbageInverted = false;
     Image *solid = solid_->GetMask(req, &solidInverted), *garbage = garbage_->GetMask(req, &garbageInverted);
     auto *clean = dynamic_cast<Image *>(req->GetInputData(clean_));

@@ -10,13 +10,11 @@
 // Thread safety: inputs are made in the constructor; NotifyChanged and
 // ControlCommand run on the main thread between renders, Process on the
 // render thread (its steps spread rows over the workers). The pick rectangle
-// is the one thing kept between them, under its own lock.
+// is the one thing kept between them, under the picker's lock.
 #include <memory>
-#include <mutex>
-#include <optional>
 
-#include "host/flow/ControlCommand.h"
 #include "host/flow/Operator.h"
+#include "operators/key/RangePicker.h"
 
 namespace Orvane {
 
@@ -45,13 +43,13 @@ private:
     static void Reach(const Settings &s, const ImageDomain *domain, int &rx, int &ry);
     Ref<Image> Key(Request *req, const Settings &s, const Image *src, const Image *clean, const Image *solid,
                    bool solidInverted, const Image *garbage, bool garbageInverted);
-    void Pick(Request *req, const Image *src, const PickRect &rect);
 
     Input *view_ = nullptr;
     Input *background_[3] = {}, *preBlur_ = nullptr, *gain_ = nullptr, *balance_ = nullptr;
     Input *lockReference_ = nullptr, *alphaReference_[3] = {}, *spillReference_[3] = {};
-    Input *preSoft_ = nullptr, *preErode_ = nullptr, *preBlurMatte_ = nullptr, *lockPicking_ = nullptr;
-    Input *preLow_[4] = {}, *preHigh_[4] = {}, *resetRanges_ = nullptr;
+    Input *preSoft_ = nullptr, *preErode_ = nullptr, *preBlurMatte_ = nullptr;
+    RangeInputs preRanges_;
+    Input *resetRanges_ = nullptr;
     Input *lowThreshold_ = nullptr, *highThreshold_ = nullptr, *restoreFringe_ = nullptr, *erodeDilate_ = nullptr;
     Input *blur_ = nullptr, *cleanForeground_ = nullptr, *cleanBackground_ = nullptr;
     Input *replaceMode_ = nullptr, *replace_[3] = {};
@@ -63,9 +61,7 @@ private:
     Input *input_ = nullptr, *clean_ = nullptr;
     Output *output_ = nullptr;
     std::unique_ptr<MaskInputs> solid_, garbage_;
-
-    std::mutex pickLock_;
-    std::optional<PickRect> pick_; ///< a select waiting for the next render
+    RangePicker picker_;
 };
 
 } // namespace Orvane

@@ -302,16 +302,6 @@ void DeltaKeyerAdjustForClean(DeltaKeyerScreenInfoParams &p, const float clean[3
 
 float DeltaKeyerMatteValue(const DeltaKeyerScreenInfo &info, const float p[3]) { return MatteOf(info, p); }
 
-void DeltaKeyerPickValue(float v, bool subtract, float &low, float &high) {
-    constexpr float kMargin = 3.0517578e-5f;
-    if (!subtract) {
-        low = std::min(low, v - kMargin);
-        high = std::max(high, v + kMargin);
-    } else if (v > low && v < high) {
-        (low + high > 2.f * v ? low : high) = v;
-    }
-}
-
 // ---- steps ----
 
 bool ProcessScreen(const DeltaKeyerRun &run, const Image *src, Image *dst, const Image *clean,

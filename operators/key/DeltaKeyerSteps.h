@@ -62,11 +62,6 @@ void DeltaKeyerAdjustForClean(DeltaKeyerScreenInfoParams &p, const float clean[3
 /// The matte value m of colour p (red, green, blue) under a record.
 float DeltaKeyerMatteValue(const DeltaKeyerScreenInfo &info, const float p[3]);
 
-/// The pick rule on one value: the range [low, high] widened to take v in
-/// (by 2^-15 on each side), or, subtracting, the nearer edge moved to a v
-/// strictly inside it (low when low + high > 2 v).
-void DeltaKeyerPickValue(float v, bool subtract, float &low, float &high);
-
 /// Where the steps run.
 struct DeltaKeyerRun {
     Request *req = nullptr; ///< abort flag and render task; may be null

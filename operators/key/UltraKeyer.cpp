@@ -4,7 +4,6 @@
 
 #include "host/core/Tags.h"
 #include "host/flow/DataTypes.h"
-#include "host/flow/OrvaneDoc.h"
 #include "host/flow/Request.h"
 #include "host/image/BlurFilters.h"
 #include "host/image/Image.h"
@@ -12,6 +11,7 @@
 #include "host/matte/MatteSteps.h"
 #include "operators/filter/BlurControls.h"
 #include "operators/frame/Registration.h"
+#include "operators/warp/SizingCommon.h"
 
 namespace Orvane {
 
@@ -64,7 +64,8 @@ TagList Checkbox(double def, std::initializer_list<TagItem> more = {}) {
 } // namespace
 
 UltraKeyer::UltraKeyer(const Registry *reg, const ScriptVal &args, const TagList &tags)
-    : ThreadedOperator(reg, args, tags), matte_(*this, KeyerMatte::Flavour::Screen) {
+    : ThreadedOperator(reg, args, tags), matte_(*this, KeyerMatte::Flavour::Screen),
+      picker_(*this, "LockColorPicking", kRangeIds, "UltraKeyer Pick") {
     AddControlPageTagList("PreMatte", {});
     static const char *const kColours[3] = {"Red", "Green", "Blue"};
     static const int kChannels[3] = {ColorChannelRed, ColorChannelGreen, ColorChannelBlue};
@@ -91,33 +92,13 @@ UltraKeyer::UltraKeyer(const Registry *reg, const ScriptVal &args, const TagList
     separation_ = AddInputTagList("Matte Separation", "MatteSeparation",
                                   Slider(0.0, 0.0, 1.0, {{InputMinAllowed, 0.0}, {InputMaxAllowed, 1.0}}));
     BeginControlNestTagList("Pre Matte Range", "PreMatteRangeNest", true, {});
-    static const char *const kAxes[4] = {"Red", "Green", "Blue", "Luminance"};
-    for (int i = 0; i < 4; ++i)
-        for (int member = 0; member < 2; ++member) {
-            TagList t{{LinkDataType, CLSID_DataType_Number},
-                      {InputControl, CLSID_InputControl_Range},
-                      {ControlGroup, i + 1},
-                      {ControlMember, member},
-                      {InputDefault, member ? 1.0 : 0.0},
-                      {InputSliderLow, 0.0},
-                      {InputSliderHigh, 1.0}};
-            if (member == 0) t.Add({ControlRowLabel, kAxes[i]});
-            const std::string label = std::string(kAxes[i]) + (member ? " High" : " Low");
-            (member ? high_ : low_)[i] = AddInputTagList(label.c_str(), kRangeIds[4 * member + i], t);
-        }
+    ranges_.Add(*this, kRangeIds, 1);
     EndControlNest();
-    lock_ = AddInputTagList("Lock Color Picking", "LockColorPicking", Checkbox(0.0, {{InputPassive, 1}}));
+    AddInputTagList("Lock Color Picking", "LockColorPicking", Checkbox(0.0, {{InputPassive, 1}}));
     preMatteSize_ =
         AddInputTagList("Pre Matte Size", "PreMatteSize",
                         Slider(0.0, 0.0, 50.0, {{SliderSteps, 51}, {InputMinAllowed, 0.0}, {InputMaxAllowed, 50.0}}));
-    reset_ = AddInputTagList("Reset Pre Matte Ranges", "ResetPreMatteRanges",
-                             {{LinkDataType, CLSID_DataType_Number},
-                              {InputControl, CLSID_InputControl_Button},
-                              {InputExternal, 0},
-                              {InputPassive, 1},
-                              {InputNotify, 1},
-                              {InputInitialNotify, 0},
-                              {LinkNotSaved, 1}});
+    reset_ = AddButton(this, "Reset Pre Matte Ranges", "ResetPreMatteRanges");
     AddControlPageTagList("Image", {});
     matte_.AddImageInputs(false);
     AddControlPageTagList("Matte", {});
@@ -139,8 +120,7 @@ UltraKeyer::UltraKeyer(const Registry *reg, const ScriptVal &args, const TagList
 }
 
 void UltraKeyer::NotifyChanged(Input *in, Parameter *param, double time, TagList *tags) {
-    if (in == reset_ && param)
-        for (int i = 0; i < 4; ++i) low_[i]->ResetValue(), high_[i]->ResetValue();
+    if (in == reset_ && param) ranges_.Reset();
     matte_.NotifyChanged(in, param);
     ThreadedOperator::NotifyChanged(in, param, time, tags);
 }
@@ -162,10 +142,7 @@ UltraKeyer::Keying UltraKeyer::Read(Request *req) {
     s.subtractBackground = num(subtract_, 1.0) >= 0.5;
     k.values = DeriveUltraKeyerValues(s);
     k.matte.keyChannel = k.values.vlColor; // the spill is taken off the screen's channel
-    for (int i = 0; i < 4; ++i) {
-        k.ranges.low[i] = static_cast<float>(num(low_[i], 0.0));
-        k.ranges.high[i] = static_cast<float>(num(high_[i], 1.0));
-    }
+    ranges_.Read(req, k.ranges.low, k.ranges.high);
     k.preMatteSize = num(preMatteSize_, 0.0);
     k.device = IsGPUEnabled(req, true);
     return k;
@@ -226,36 +203,7 @@ Ref<Image> UltraKeyer::Key(Request *req, const Image *src, Ref<Image> dst, const
 
 bool UltraKeyer::ControlCommand(int command, const TagList &tags) {
     if (command != CCMD_Select) return ThreadedOperator::ControlCommand(command, tags);
-    const auto *locked = dynamic_cast<const Number *>(lock_->ValueAt(TimeUndefined).Get());
-    if (locked && locked->value >= 0.5) {
-        if (OrvaneDoc *doc = GetDoc()) doc->PrintF(ConsoleWarning, "%s: Lock Color Picking is on\n", Name().c_str());
-        return false;
-    }
-    const std::lock_guard<std::mutex> hold(pickLock_);
-    pick_ = PickRect::FromTags(tags);
-    return true;
-}
-
-void UltraKeyer::Pick(const Image &src, const PreMatteRanges &ranges) {
-    std::optional<PickRect> pick;
-    {
-        const std::lock_guard<std::mutex> hold(pickLock_);
-        pick.swap(pick_);
-    }
-    OrvaneDoc *doc = GetDoc();
-    if (!pick || !doc) return;
-    const ImgRectI rect = PickRectPixels(src, pick->left, pick->bottom, pick->right, pick->top);
-    const PreMatteRanges picked = PickPreMatteRanges(src, rect, pick->subtract, ranges);
-    float values[8];
-    for (int i = 0; i < 4; ++i) values[i] = picked.low[i], values[4 + i] = picked.high[i];
-    // The tool is found by name when the edit runs, so a tool deleted meanwhile is no harm.
-    doc->DocExecute(
-        [name = Name(), values](OrvaneDoc &d) {
-            if (Operator *tool = d.FindTool(name))
-                for (int i = 0; i < 8; ++i)
-                    if (Input *in = tool->FindInput(kRangeIds[i])) in->SetValue(MakeRef<Number>(values[i]));
-        },
-        "UltraKeyer Pick");
+    return picker_.Select(tags);
 }
 
 void UltraKeyer::Process(Request *req) {
@@ -265,7 +213,7 @@ void UltraKeyer::Process(Request *req) {
         return;
     }
     const Keying k = Read(req);
-    if (!req->IsPreCalc()) Pick(*src, k.ranges);
+    if (!req->IsPreCalc()) picker_.Apply(*src, 0, k.ranges.low, k.ranges.high);
     Ref<Image> dst = matte_.NewMatteImage(req, input_, src, k.matte, k.preMatteSize);
     if (dst && dst->IsMask()) { // a one-channel source keys as grey: the result needs colour
         const ImgRectI window = dst->DataWindow(), valid = dst->ValidWindow();

@@ -26,26 +26,19 @@
 // the region asked for grown by the blurs' reach (CheckRequest asks the
 // source for it), so the blurs see past the region's edges.
 //
-// Picking. ControlCommand takes CCMD_Select unless Lock Color Picking is on:
-// it keeps the rectangle (frame fractions) until the next pixel request,
-// whose Process walks the source under it (PickPreMatteRanges: a normal pick
-// widens the ranges, starting from an empty box while every range stands at
-// its default; a subtracting pick narrows them) and queues the new ranges on
-// the document (DocExecute, "UltraKeyer Pick"). That render still keys with
-// the ranges it was asked with, so that its result matches its inputs; the
-// next one keys with the picked ranges.
+// Picking (RangePicker.h): ControlCommand takes CCMD_Select unless Lock
+// Color Picking is on; the next pixel request walks the source under the
+// rectangle on the chroma axes and writes the pre-matte ranges back as one
+// edit, "UltraKeyer Pick".
 //
 // Failure: a missing input gives no output; memory refused fails the request
 // with the tool's line; an abandoned render gives no output silently.
 //
 // Thread safety: one request at a time (the tool's request lock); the steps
 // spread rows over the workers.
-#include <mutex>
-#include <optional>
-
-#include "host/flow/ControlCommand.h"
 #include "host/flow/Operator.h"
 #include "operators/key/KeyerMatte.h"
+#include "operators/key/RangePicker.h"
 #include "operators/key/UltraKeyerSteps.h"
 
 namespace Orvane {
@@ -70,19 +63,16 @@ private:
         bool device = false; ///< the steps try their kernels first
     };
     Keying Read(Request *req);
-    /// Runs a pending pick over `src`; its ranges go to the document.
-    void Pick(const Image &src, const PreMatteRanges &ranges);
     /// Steps 2 to 8 on `dst`, an image of the tool's own over the source;
     /// the result (dst or a widened image), null when a step failed.
     Ref<Image> Key(Request *req, const Image *src, Ref<Image> dst, const Keying &k) const;
 
     KeyerMatte matte_;
-    Input *background_[3], *weight_[2], *correction_, *separation_, *low_[4], *high_[4], *lock_, *preMatteSize_,
-        *reset_, *subtract_, *legacyGarbage_, *garbageInverted_, *input_;
+    RangeInputs ranges_;
+    Input *background_[3], *weight_[2], *correction_, *separation_, *preMatteSize_, *reset_, *subtract_,
+        *legacyGarbage_, *garbageInverted_, *input_;
     Output *output_;
-
-    std::mutex pickLock_;
-    std::optional<PickRect> pick_; ///< a select waiting for the next pixel request
+    RangePicker picker_;
 };
 
 } // namespace Orvane

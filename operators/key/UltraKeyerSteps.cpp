@@ -4,7 +4,6 @@
 #include <cmath>
 #include <cstddef>
 #include <cstring>
-#include <limits>
 #include <memory>
 #include <type_traits>
 #include <vector>
@@ -28,8 +27,6 @@ namespace {
 constexpr double kEps = 1.1920928955078125e-7;
 /// Pixels a row step takes at a time.
 constexpr int kBlock = 256;
-/// What a pick adds on each side of a picked value.
-constexpr float kPickMargin = 3.0517578e-5f;
 /// The largest magnitude the 16-bit forms carry through raw, m and the
 /// factors: beyond it every clamp that follows has long saturated.
 constexpr int64_t kFixedLimit = int64_t(1) << 40;
@@ -484,40 +481,6 @@ bool DoSubtract(Request *req, const Image *src, Image *dst, const Image *old, bo
     const bool ok = dst->IsFloat() ? SubtractRows<FltPixel>(*src, *dst, *old) : SubtractRows<Pixel>(*src, *dst, *old);
     dst->SetGPUMem(nullptr, false); // the rows hold the result now
     return finish(ok);
-}
-
-ImgRectI PickRectPixels(const Image &img, double left, double bottom, double right, double top) {
-    // A fraction made from a whole pixel may come back a hair below it.
-    auto pixel = [](double f, int size) {
-        return static_cast<int>(std::clamp(std::floor(f * size + 1e-6), -1e9, 1e9));
-    };
-    return ImgRectI(pixel(left, img.Width()), pixel(bottom, img.Height()), pixel(right, img.Width()) + 1,
-                    pixel(top, img.Height()) + 1);
-}
-
-PreMatteRanges PickPreMatteRanges(const Image &img, const ImgRectI &rect, bool subtract, const PreMatteRanges &ranges) {
-    PreMatteRanges r = ranges;
-    const ImgRectI area = rect & img.DataWindow();
-    if (area.IsNull() || !img.DownloadGPUMem() || !img.HasScanLineData()) return r;
-    if (!subtract && r.AtDefaults())
-        for (int i = 0; i < 4; ++i) r.low[i] = std::numeric_limits<float>::infinity(), r.high[i] = -r.low[i];
-    std::vector<FltPixel> row(static_cast<size_t>(area.Width()));
-    for (int y = area.y0; y < area.y1; ++y) {
-        LoadFlt(img.Depth(), img.PixelAddress(area.x0, y), area.Width(), row.data());
-        for (const FltPixel &p : row) {
-            float v[4];
-            ChromaKeyAxes(0, p.R, p.G, p.B, v);
-            for (int i = 0; i < 4; ++i) {
-                if (!subtract) {
-                    r.low[i] = std::min(r.low[i], v[i] - kPickMargin);
-                    r.high[i] = std::max(r.high[i], v[i] + kPickMargin);
-                } else if (v[i] > r.low[i] && v[i] < r.high[i]) {
-                    (r.low[i] + r.high[i] > 2.f * v[i] ? r.low[i] : r.high[i]) = v[i];
-                }
-            }
-        }
-    }
-    return r;
 }
 
 } // namespace Orvane

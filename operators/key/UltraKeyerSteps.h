@@ -31,7 +31,6 @@
 #include <cstdint>
 
 #include "host/image/Pixel.h"
-#include "host/image/Rect.h"
 
 namespace Orvane {
 
@@ -116,18 +115,5 @@ bool DoCombine(Request *req, Image *work, Image *dst, bool device);
 /// t = (a1 - a0) / (1 - a0) (1 when a0 >= 1); where a1 < a0, C := C a1 / a0
 /// (0 when a0 is 0). `old` shares dst's data window.
 bool DoSubtract(Request *req, const Image *src, Image *dst, const Image *old, bool device);
-
-/// A pick over the pixels of `img` within `rect` (cut to its data window):
-/// normally each pixel widens each range to take in its axis value with
-/// 3.0517578e-5 to spare; `subtract`ing, a pixel strictly inside a range moves
-/// the nearer limit onto its value. A normal pick while the ranges stand at
-/// their defaults starts from an empty box, so that the picked colours alone
-/// make the pre-matte (widening the default box would change nothing). The
-/// caller refuses picks while Lock Color Picking is on.
-PreMatteRanges PickPreMatteRanges(const Image &img, const ImgRectI &rect, bool subtract, const PreMatteRanges &ranges);
-
-/// The pixels of a pick rectangle given in frame fractions (left, bottom,
-/// right, top): the right and top edges take in the pixel they fall on.
-ImgRectI PickRectPixels(const Image &img, double left, double bottom, double right, double top);
 
 } // namespace Orvane

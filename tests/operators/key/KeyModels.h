@@ -14,14 +14,21 @@ using Rgb = std::array<double, 3>;
 
 inline double Luma(const Rgb &c) { return 0.299 * c[0] + 0.587 * c[1] + 0.114 * c[2]; }
 
+/// A colour on the chroma box's four axes: key type 0 the chroma axes, 1
+/// plain colour; luminance fourth.
+inline std::array<double, 4> ChromaAxesModel(int keyType, const Rgb &c) {
+    const double y = Luma(c);
+    const double scale[3] = {0.61035, 0.76294, 0.45776};
+    std::array<double, 4> v;
+    for (int i = 0; i < 3; ++i) v[i] = keyType == 0 ? (c[i] - y) * scale[i] + 0.5 : c[i];
+    v[3] = y;
+    return v;
+}
+
 /// The chroma key of a colour: the distance outside the box on the worst
 /// axis, over the soft range.
 inline double ChromaModel(const ChromaKeyRanges &k, const Rgb &c) {
-    const double y = Luma(c);
-    const double scale[3] = {0.61035, 0.76294, 0.45776};
-    double v[4];
-    for (int i = 0; i < 3; ++i) v[i] = k.keyType == 0 ? (c[i] - y) * scale[i] + 0.5 : c[i];
-    v[3] = y;
+    const std::array<double, 4> v = ChromaAxesModel(k.keyType, c);
     double outside = 0.0;
     for (int i = 0; i < 4; ++i) outside = std::max({outside, v[i] - k.high[i], k.low[i] - v[i]});
     if (outside <= 0.0) return 0.0;
@@ -31,13 +38,9 @@ inline double ChromaModel(const ChromaKeyRanges &k, const Rgb &c) {
 /// How near a colour lies to a limit of the box (on any axis): keys of
 /// colours this near may fall either side after rounding.
 inline double ChromaEdgeDistance(const ChromaKeyRanges &k, const Rgb &c) {
-    const double y = Luma(c);
-    const double scale[3] = {0.61035, 0.76294, 0.45776};
+    const std::array<double, 4> v = ChromaAxesModel(k.keyType, c);
     double d = 1e9;
-    for (int i = 0; i < 4; ++i) {
-        const double v = i == 3 ? y : k.keyType == 0 ? (c[i] - y) * scale[i] + 0.5 : c[i];
-        d = std::min({d, std::fabs(v - k.low[i]), std::fabs(v - k.high[i])});
-    }
+    for (int i = 0; i < 4; ++i) d = std::min({d, std::fabs(v[i] - k.low[i]), std::fabs(v[i] - k.high[i])});
     return d;
 }
 

@@ -255,32 +255,6 @@ TEST(UltraKeyerCombineSubtract, CutMatteKeepOldAndRestoreColour) {
         }
 }
 
-TEST(UltraKeyerPick, WidensNarrowsAndStartsFromAnEmptyBox) {
-    // Two colours inside the rectangle (its right and top edges take in the pixel they fall on), a third beyond it.
-    const FltPixel a{0.1f, 0.8f, 0.2f, 1}, b{0.2f, 0.6f, 0.3f, 1}, far{0.9f, 0.1f, 0.1f, 1};
-    Ref<Image> img = Filled(20, 10, DepthRGBAFlt32, [&](int x, int) { return x < 5 ? a : x < 10 ? b : far; });
-    const ImgRectI rect = PickRectPixels(*img, 0.0, 0.0, 0.45, 0.95);
-    EXPECT_EQ(rect, ImgRectI(0, 0, 10, 10));
-    auto axes = [](const FltPixel &p) {
-        const double y = 0.299 * p.R + 0.587 * p.G + 0.114 * p.B;
-        return std::array<double, 4>{(p.R - y) * 0.61035 + 0.5, (p.G - y) * 0.76294 + 0.5, (p.B - y) * 0.45776 + 0.5,
-                                     y};
-    };
-    const auto va = axes(a), vb = axes(b);
-    const PreMatteRanges picked = PickPreMatteRanges(*img, rect, false, PreMatteRanges());
-    // Subtracting colour b moves, on each axis where it lies strictly inside, the nearer limit onto it.
-    const PreMatteRanges narrowed = PickPreMatteRanges(*img, ImgRectI(7, 3, 8, 4), true, picked);
-    for (int i = 0; i < 4; ++i) {
-        EXPECT_NEAR(picked.low[i], std::min(va[i], vb[i]) - 3.0517578e-5, 1e-6) << i;
-        EXPECT_NEAR(picked.high[i], std::max(va[i], vb[i]) + 3.0517578e-5, 1e-6) << i;
-        const bool lowNearer = picked.low[i] + picked.high[i] > 2 * vb[i];
-        EXPECT_NEAR(lowNearer ? narrowed.low[i] : narrowed.high[i], vb[i], 1e-6) << i;
-        EXPECT_EQ(lowNearer ? narrowed.high[i] : narrowed.low[i], lowNearer ? picked.high[i] : picked.low[i]) << i;
-    }
-    EXPECT_TRUE(PreMatteRanges().AtDefaults());
-    EXPECT_FALSE(picked.AtDefaults());
-}
-
 TEST(UltraKeyerDevice, KernelsGiveTheRowsResults) {
     ORVANE_NEED_OPENCL(ctx);
     const SoftCase &k = kSoftCases[1];

@@ -3,7 +3,6 @@
 #include <cmath>
 #include <limits>
 
-#include "host/flow/ControlCommand.h"
 #include "operators/key/UltraKeyerSteps.h"
 #include "tests/host/image/ImageTestSupport.h"
 #include "tests/host/krom/DeviceTestSupport.h"
@@ -142,49 +141,6 @@ TEST_F(UltraKeyerTool, ARegionIsTheCropOfTheFrameAndTheDeviceGivesTheRowsResult)
             EXPECT_LE(MaxDiff(*dev, *whole, whole->DataWindow()), depth == DepthRGBAFlt32 ? 1e-6 : 32.0 / 65535)
                 << s.front().first << " " << depth;
         }
-}
-
-TEST_F(UltraKeyerTool, PicksWriteTheRangesBackUnlessLocked) {
-    Ref<Image> src = Plate();
-    Rig rig("UltraKeyer", src);
-    SetNumbers(rig.tool, kScreen);
-    auto ranges = [&] {
-        PreMatteRanges r;
-        for (int i = 0; i < 8; ++i)
-            (i < 4 ? r.low : r.high)[i % 4] =
-                static_cast<float>(dynamic_cast<const Number &>(*rig.tool->FindInput(kRangeIds[i])->Constant()).value);
-        return r;
-    };
-    auto select = [](double x0, double y0, double x1, double y1, int modifiers) {
-        return TagList{{CCMD_SelectLeft, x0 / 48},
-                       {CCMD_SelectBottom, y0 / 32},
-                       {CCMD_SelectRight, x1 / 48},
-                       {CCMD_SelectTop, y1 / 32},
-                       {CCMD_Modifiers, modifiers}};
-    };
-    // Pixels 4..9 by 5..8 (both corners included), given corners swapped; then one pixel taken out.
-    const struct {
-        TagList tags;
-        ImgRectI pixels;
-        bool subtract;
-    } picks[] = {{select(9, 8, 4, 5, 0), ImgRectI(4, 5, 10, 9), false},
-                 {select(6, 6, 6, 6, CCMD_ModSubtract), ImgRectI(6, 6, 7, 7), true}};
-    for (const auto &p : picks) {
-        const PreMatteRanges want = PickPreMatteRanges(*src, p.pixels, p.subtract, ranges());
-        ASSERT_TRUE(rig.tool->ControlCommand(CCMD_Select, p.tags));
-        ASSERT_TRUE(RenderOn(rig.tool, nullptr));
-        EXPECT_EQ(rig.doc.RunDeferred(), std::vector<std::string>{"UltraKeyer Pick"});
-        const PreMatteRanges got = ranges();
-        for (int i = 0; i < 4; ++i) {
-            EXPECT_EQ(got.low[i], want.low[i]) << p.subtract << " " << i;
-            EXPECT_EQ(got.high[i], want.high[i]) << p.subtract << " " << i;
-        }
-    }
-    SetNumber(rig.tool, "LockColorPicking", 1);
-    EXPECT_FALSE(rig.tool->ControlCommand(CCMD_Select, select(0, 0, 47, 31, 0)));
-    ASSERT_TRUE(RenderOn(rig.tool, nullptr));
-    EXPECT_TRUE(rig.doc.RunDeferred().empty());
-    EXPECT_NE(ConsoleText(rig.doc).find("Lock Color Picking is on"), std::string::npos) << ConsoleText(rig.doc);
 }
 
 TEST_F(UltraKeyerTool, TheOldGarbageLinkActsAsTheGarbageMatte) {
