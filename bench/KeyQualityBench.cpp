@@ -16,8 +16,8 @@
 // as clean plate, threshold 0.1..0.9 and fringe restore), Ultra (screen
 // colour, background subtracted), Chroma (ranges 0.06 around the screen's
 // chroma axes, any luminance, soft range 0.1), Difference (against the clean
-// screen, Low 0.02, High 0.25). No open peer keyer is installed by the
-// project's scripts, so there are no peer rows.
+// screen, Low 0.02, High 0.25). The comparison with an open peer keyer is
+// scripts/key-quality.sh (a whole program against a whole program).
 #include <cmath>
 #include <map>
 #include <string>
