@@ -9,6 +9,8 @@ packages=(
   libopencolorio-dev
   # Masks and shapes: polygon offsetting and stroking, anti-aliased scan conversion.
   libpolyclipping-dev libagg-dev
+  # Scripts and expressions: LuaJIT with ffi and jit (the maintained 2.1 branch).
+  libluajit2-5.1-dev
   # The device path: OpenCL headers and loader, and PoCL, which runs OpenCL
   # kernels on the CPU so that every machine exercises the device path.
   ocl-icd-opencl-dev opencl-headers pocl-opencl-icd
