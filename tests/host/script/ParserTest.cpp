@@ -126,6 +126,7 @@ TEST_F(ParserTest, ExpressionsEvaluateToHandWorkedValues) {
         {"(getr1b(x - 0.01, y) + getr1b(x + 0.01, y)) / 2",
          (Sample(1, 0, 0, 0.24, 0.75) + Sample(1, 0, 0, 0.26, 0.75)) / 2},
         {"r1 * (1 - smoothstep(0.3, 0.8, sqrt((x - 0.5)^2 + (y - 0.5)^2)))", vignette},
+        {"if(max(r1, g1, b1) > n1, c1, 0) + if(max(r1, g1, b1) > n1 - 1, c1, 0)", 0.1},
     };
     // clang-format on
     for (const auto &c : cases) EXPECT_NEAR(Evaluate(c.text, c.context), c.value, 1e-9) << c.text;
