@@ -3,7 +3,6 @@
 #include <fmt/format.h>
 
 #include <algorithm>
-#include <cctype>
 #include <charconv>
 #include <cmath>
 #include <numbers>
@@ -208,9 +207,10 @@ private:
 
     [[noreturn]] static void Fail(int position, std::string message) { throw Failure{position, std::move(message)}; }
 
-    static bool IsNameStart(char c) { return std::isalpha(static_cast<unsigned char>(c)) || c == '_'; }
-    static bool IsNameChar(char c) { return IsNameStart(c) || std::isdigit(static_cast<unsigned char>(c)); }
-    static bool IsDigit(char c) { return std::isdigit(static_cast<unsigned char>(c)); }
+    // ASCII only, whatever the locale.
+    static bool IsDigit(char c) { return c >= '0' && c <= '9'; }
+    static bool IsNameStart(char c) { return (c >= 'a' && c <= 'z') || (c >= 'A' && c <= 'Z') || c == '_'; }
+    static bool IsNameChar(char c) { return IsNameStart(c) || IsDigit(c); }
 
     void Next() {
         while (at_ < text_.size() &&

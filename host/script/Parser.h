@@ -91,10 +91,11 @@ struct ParseError {
 
 class ORVANE_API Parser {
 public:
-    /// Translates one expression. On success sets `luaText` to a Lua expression
-    /// (a number) and adds to the flags; on failure sets `error` and leaves
-    /// `luaText` and the flags unchanged. The caller then uses its default: the
-    /// Custom tool writes one console line with Describe() and uses "0".
+    /// Translates one expression. On success sets `luaText` (not null) to a Lua
+    /// expression giving a number, and adds to the flags; on failure sets
+    /// `error` (when given) and leaves `luaText` and the flags unchanged. The
+    /// caller then uses its default: the Custom tool writes one console line
+    /// with Describe() and uses "0".
     bool Parse(std::string_view text, ExpressionContext context, std::string *luaText, ParseError *error);
 
     /// The flags of every successful Parse since construction or ClearFlags().

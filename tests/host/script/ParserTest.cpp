@@ -145,10 +145,10 @@ TEST_F(ParserTest, DeepestAcceptedExpressionsRunInLua) {
         minus = "-" + minus;
         parens = "(" + parens + ")";
     }
-    for (int k = 0; k < 400; ++k) sum += "+getr1b(x, y)-r1";
+    for (int k = 0; k < 1200; ++k) sum += "+getr1b(x, y)-r1"; // near the longest text allowed
     for (const std::string &text : {compares, ifs, calls, parens}) EXPECT_EQ(Evaluate(text), 1) << text;
     EXPECT_EQ(Evaluate(minus), -1);
-    EXPECT_NEAR(Evaluate(sum), 400 * (Sample(1, 0, 0, 0.25, 0.75) - 1), 1e-6);
+    EXPECT_NEAR(Evaluate(sum), 1200 * (Sample(1, 0, 0, 0.25, 0.75) - 1), 1e-6);
 }
 
 TEST(Parser, FlagsNameWhatWasUsed) {
