@@ -133,7 +133,7 @@ TEST(ScriptPool, AbortAndErrorsStopTheWorkers) {
 
     // Every worker that meets the bad line says so once; the others stop at the abort word.
     abort = 0;
-    const std::string failed = pool.Dispatch("function chunkfunc(y) count = (count or 0) + 1\n"
+    const std::string failed = pool.Dispatch("function chunkfunc(y)\n"
                                              "if y >= 5 then error('bad line') end end",
                                              0, 1000, &abort, {}, 4);
     EXPECT_EQ(failed, "pixel script:2: bad line");
