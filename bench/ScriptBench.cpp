@@ -10,11 +10,15 @@ namespace Orvane::Bench {
 namespace {
 
 const char *kPixelScript = R"(
-local pin, pout, pix
-function initfunc() pin, pout, pix = PixPtr(src, nil), PixPtr(out, nil), FltPixel() end
+local width, pin, pout, pix = 0, nil, nil, nil
+function initfunc()
+    width, pix = out.Width, FltPixel()
+    pin, pout = PixPtr(src, pix), PixPtr(out, pix)
+end
 function chunkfunc(y)
-    pin:GotoXY(0, y) pout:GotoXY(0, y)
-    for x = 0, out.Width - 1 do
+    pin:GotoXY(0, y)
+    pout:GotoXY(0, y)
+    for _ = 1, width do
         pin:GetNextPixel(pix)
         pix.R, pix.G, pix.B = pix.G * 0.5 + pix.B, math.min(1, pix.R * 2), pix.B * pix.A
         pout:SetNextPixel(pix)
