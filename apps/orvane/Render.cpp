@@ -41,6 +41,7 @@
 #include "host/image/PixelMemory.h"
 #include "host/media/ImageFormatList.h"
 #include "host/media/OutputFile.h"
+#include "host/script/ScriptPermission.h"
 
 namespace Orvane::Cli {
 namespace {
@@ -50,7 +51,7 @@ struct RenderArgs {
     std::vector<std::string> savers, sets;
     int threads = 0, proxy = 1;
     size_t memoryLimit = 0;
-    bool skipExisting = false, json = false, lenient = false;
+    bool skipExisting = false, json = false, lenient = false, allowScripts = false;
 };
 
 size_t ParseSize(const std::string &text) {
@@ -108,6 +109,8 @@ RenderArgs ParseArgs(const std::vector<std::string> &args) {
             a.skipExisting = true;
         } else if (arg == "--lenient") {
             a.lenient = true;
+        } else if (arg == "--allow-scripts") {
+            a.allowScripts = true;
         } else if (arg == "--log-format") {
             const std::string &f = value();
             if (f != "text" && f != "json") throw CliError(ExitUsage, "render: --log-format is text or json");
@@ -354,6 +357,7 @@ double PeakMemoryMiB() {
 int RunRender(const std::vector<std::string> &rawArgs) {
     const RenderArgs a = ParseArgs(rawArgs);
     if (a.threads) SetWorkerCount(a.threads);
+    SetAllowScripts(a.allowScripts);
     LoadLibrary();
 
     OrvaneDoc doc;

@@ -38,6 +38,7 @@ const Command kCommands[] = {
   --proxy N             render at 1/N size
   --skip-existing       leave frames whose file exists
   --lenient             render a document with problems, taking them as warnings
+  --allow-scripts       let the document's raw scripts run (with the full Lua library)
   --log-format text|json  one line per event; json: one object per event
   Ctrl-C stops after the frame in hand; a second Ctrl-C stops at once.
   Exit: 0 all written, 2 bad command line or document, 3 a frame failed, 130 interrupted.

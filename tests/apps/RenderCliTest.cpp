@@ -75,9 +75,9 @@ TEST(CliRender, WritesEveryFrameAndReportsIt) {
     EXPECT_TRUE(Has(r.out, "SUMMARY written=3 failed=0 skipped=0"));
     for (const char *f : {"f.0001.png", "f.0002.png", "f.0003.png"}) EXPECT_TRUE(fs::exists(dir.Path() / "out" / f));
 
-    // Existing files are left alone with --skip-existing; JSON lines say so.
+    // Existing files are left alone with --skip-existing; JSON lines say so. (--allow-scripts is accepted.)
     const auto before = fs::last_write_time(dir.Path() / "out/f.0001.png");
-    const CliRun again = Render(flow, " --skip-existing --log-format json");
+    const CliRun again = Render(flow, " --skip-existing --allow-scripts --log-format json");
     EXPECT_EQ(again.exitCode, 0) << again.err;
     EXPECT_TRUE(Has(again.out, "{\"event\": \"render\", \"saver\": \"Out\", \"files\": \"" +
                                    (dir.Path() / "out/f.####.png").string() +

@@ -1,0 +1,187 @@
+#include "host/script/ScriptImageApi.h"
+
+#include <algorithm>
+#include <atomic>
+#include <cmath>
+
+#include "host/image/Image.h"
+#include "host/image/PixelConvert.h"
+#include "host/image/ResizeFilters.h"
+
+using Orvane::FltPixel;
+using Orvane::Image;
+
+static_assert(sizeof(OrvanePixPtr) == 6 * sizeof(uint64_t), "scripts see a cursor as 6 opaque words");
+static_assert(sizeof(FltPixel) == 4 * sizeof(float), "scripts see FltPixel as four floats");
+static_assert(static_cast<int>(OrvaneEdgeWrap) == Orvane::EdgeWrap &&
+                  static_cast<int>(OrvaneEdgeDuplicate) == Orvane::EdgeDuplicate &&
+                  static_cast<int>(OrvaneEdgeMirror) == Orvane::EdgeMirror,
+              "sample edge rules share the resampler's numbers");
+
+namespace {
+
+void PointCursorAtRow(OrvanePixPtr *p) {
+    p->row = p->img && p->img->HasScanLineData() ? p->img->ScanLine(p->y) : nullptr;
+}
+
+bool CursorInWindow(const OrvanePixPtr *p) { return p->row && p->x >= p->x0 && p->x < p->x1; }
+
+uint8_t *CursorAddress(const OrvanePixPtr *p) {
+    return p->row + static_cast<ptrdiff_t>(p->x - p->x0) * p->bytesPerPixel;
+}
+
+/// Pixel (x, y) of the frame under the edge rule, or null when the rule gives a clear pixel.
+bool FramePixel(const Image *img, int64_t x, int64_t y, int32_t edges, FltPixel &out) {
+    const int w = img->Width(), h = img->Height();
+    const int mx = Orvane::MapEdge(static_cast<int>(x), 0, w, edges);
+    const int my = Orvane::MapEdge(static_cast<int>(y), 0, h, edges);
+    if (mx < 0 || mx >= w || my < 0 || my >= h) return false;
+    out = img->GetFlt(mx, my);
+    return true;
+}
+
+} // namespace
+
+extern "C" {
+
+void ovs_PixPtrInit(OrvanePixPtr *p, Image *img) {
+    if (!p) return;
+    *p = OrvanePixPtr{};
+    p->img = img;
+    if (!img) return;
+    p->x0 = img->DataWindow().x0;
+    p->x1 = img->DataWindow().x1;
+    p->bytesPerPixel = img->BytesPerPixel();
+    p->depth = img->Depth();
+    p->writable = !img->IsReadOnly();
+    PointCursorAtRow(p);
+}
+
+void ovs_PixPtrGotoXY(OrvanePixPtr *p, int32_t x, int32_t y) {
+    if (!p) return;
+    p->x = x;
+    if (y != p->y || !p->row) {
+        p->y = y;
+        PointCursorAtRow(p);
+    }
+}
+
+void ovs_PixPtrNextPixel(OrvanePixPtr *p) {
+    if (p) ++p->x;
+}
+
+void ovs_PixPtrGetPixel(const OrvanePixPtr *p, FltPixel *out) {
+    if (!p || !out) return;
+    if (CursorInWindow(p))
+        Orvane::LoadFlt(p->depth, CursorAddress(p), 1, out);
+    else
+        *out = p->img ? p->img->GetCanvasColor() : FltPixel{};
+}
+
+void ovs_PixPtrSetPixel(const OrvanePixPtr *p, const FltPixel *in) {
+    if (p && in && p->writable && CursorInWindow(p)) Orvane::StoreFlt(p->depth, in, 1, CursorAddress(p));
+}
+
+void ovs_PixPtrGetNextPixel(OrvanePixPtr *p, FltPixel *out) {
+    ovs_PixPtrGetPixel(p, out);
+    ovs_PixPtrNextPixel(p);
+}
+
+void ovs_PixPtrSetNextPixel(OrvanePixPtr *p, const FltPixel *in) {
+    ovs_PixPtrSetPixel(p, in);
+    ovs_PixPtrNextPixel(p);
+}
+
+int32_t ovs_ImageWidth(const Image *img) { return img ? img->Width() : 0; }
+int32_t ovs_ImageHeight(const Image *img) { return img ? img->Height() : 0; }
+double ovs_ImageXScale(const Image *img) { return img ? img->XScale() : 1.0; }
+double ovs_ImageYScale(const Image *img) { return img ? img->YScale() : 1.0; }
+
+void ovs_ImageSample(const Image *img, double x, double y, int32_t edges, FltPixel *out) {
+    if (!out) return;
+    *out = FltPixel{};
+    if (!img || std::isnan(x) || std::isnan(y)) return;
+    // Far positions all map alike under every rule once clamped well past any frame.
+    constexpr double kFar = 1 << 30;
+    x = std::clamp(x, -kFar, kFar);
+    y = std::clamp(y, -kFar, kFar);
+    const double fx = std::floor(x), fy = std::floor(y);
+    const double wx[2] = {1 - (x - fx), x - fx}, wy[2] = {1 - (y - fy), y - fy};
+    double sum[4] = {0, 0, 0, 0};
+    for (int j = 0; j < 2; ++j)
+        for (int i = 0; i < 2; ++i) {
+            const double w = wx[i] * wy[j];
+            FltPixel px;
+            // Taps of weight 0 are skipped, so a whole position reads its pixel exactly.
+            if (w == 0 || !FramePixel(img, static_cast<int64_t>(fx) + i, static_cast<int64_t>(fy) + j, edges, px))
+                continue;
+            sum[0] += w * px.R;
+            sum[1] += w * px.G;
+            sum[2] += w * px.B;
+            sum[3] += w * px.A;
+        }
+    *out = FltPixel{float(sum[0]), float(sum[1]), float(sum[2]), float(sum[3])};
+}
+
+void ovs_ImageGetCanvasColorFlt(const Image *img, FltPixel *out) {
+    if (out) *out = img ? img->GetCanvasColor() : FltPixel{};
+}
+
+int32_t ovs_NextLine(int32_t *counter) {
+    if (!counter) return INT32_MAX;
+    return std::atomic_ref<int32_t>(*counter).fetch_add(1, std::memory_order_relaxed);
+}
+
+int32_t ovs_Aborted(const int32_t *abort) {
+    return abort && std::atomic_ref<const int32_t>(*abort).load(std::memory_order_relaxed) != 0;
+}
+
+} // extern "C"
+
+namespace Orvane {
+
+const OrvaneScriptApi &ScriptImageApi() {
+    static const OrvaneScriptApi api{ovs_PixPtrInit,
+                                     ovs_PixPtrGotoXY,
+                                     ovs_PixPtrNextPixel,
+                                     ovs_PixPtrGetPixel,
+                                     ovs_PixPtrSetPixel,
+                                     ovs_PixPtrGetNextPixel,
+                                     ovs_PixPtrSetNextPixel,
+                                     ovs_ImageWidth,
+                                     ovs_ImageHeight,
+                                     ovs_ImageXScale,
+                                     ovs_ImageYScale,
+                                     ovs_ImageSample,
+                                     ovs_ImageGetCanvasColorFlt,
+                                     ovs_NextLine,
+                                     ovs_Aborted};
+    return api;
+}
+
+const char *ScriptImageDeclarations() {
+    return R"(
+typedef struct FltPixel { float R, G, B, A; } FltPixel;
+typedef struct Image Image;
+typedef struct PixPtr { const uint64_t opaque_[6]; } PixPtr;
+typedef struct OrvaneScriptApi {
+    void (*PixPtrInit)(PixPtr *p, Image *img);
+    void (*PixPtrGotoXY)(PixPtr *p, int32_t x, int32_t y);
+    void (*PixPtrNextPixel)(PixPtr *p);
+    void (*PixPtrGetPixel)(const PixPtr *p, FltPixel *out);
+    void (*PixPtrSetPixel)(const PixPtr *p, const FltPixel *in);
+    void (*PixPtrGetNextPixel)(PixPtr *p, FltPixel *out);
+    void (*PixPtrSetNextPixel)(PixPtr *p, const FltPixel *in);
+    int32_t (*ImageWidth)(const Image *img);
+    int32_t (*ImageHeight)(const Image *img);
+    double (*ImageXScale)(const Image *img);
+    double (*ImageYScale)(const Image *img);
+    void (*ImageSample)(const Image *img, double x, double y, int32_t edges, FltPixel *out);
+    void (*ImageGetCanvasColorFlt)(const Image *img, FltPixel *out);
+    int32_t (*NextLine)(int32_t *counter);
+    int32_t (*Aborted)(const int32_t *abort);
+} OrvaneScriptApi;
+)";
+}
+
+} // namespace Orvane
