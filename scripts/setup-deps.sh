@@ -1,7 +1,9 @@
 #!/usr/bin/env bash
 # Installs the Debian packages Orvane builds and tests with. Safe to run again.
+#   scripts/setup-deps.sh [PACKAGE ...]   the packages named instead of the list below
 set -euo pipefail
-packages=(
+packages=("$@")
+[ $# -gt 0 ] || packages=(
   build-essential cmake ninja-build pkg-config ccache
   libtbb-dev libfmt-dev libgtest-dev libgmock-dev libbenchmark-dev
   libjpeg62-turbo-dev libpng-dev zlib1g-dev libopenexr-dev

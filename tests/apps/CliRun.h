@@ -12,6 +12,8 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include "host/image/Image.h"
+#include "host/media/Clip.h"
 #include "tests/support/TestSupport.h"
 
 namespace Orvane::clitest {
@@ -55,6 +57,14 @@ inline CliRun Orvane(const std::string &args) {
     r.out = ReadFile(outFile);
     r.err = ReadFile(errFile);
     return r;
+}
+
+/// The first frame of an image file a render wrote (a failed expectation, and null, when it cannot be read).
+inline Ref<Image> ReadFrame(const std::filesystem::path &file) {
+    std::string error;
+    Ref<Image> img = Clip(file.string()).GetFrameTagList(0, {}, error);
+    EXPECT_TRUE(img) << file << ": " << error;
+    return img;
 }
 
 inline bool Contains(const std::string &text, const std::string &part) { return text.find(part) != std::string::npos; }

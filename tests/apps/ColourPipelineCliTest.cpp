@@ -64,13 +64,6 @@ CliRun RenderExample(const fs::path &dir, const std::string &more) {
     return r;
 }
 
-Ref<Image> Read(const fs::path &file) {
-    std::string error;
-    Ref<Image> img = Clip(file.string()).GetFrameTagList(0, {}, error);
-    EXPECT_TRUE(img) << file << ": " << error;
-    return img;
-}
-
 /// The largest channel difference between `a` and `want(x, y, channel)` over a's data window, with where it is.
 struct Worst {
     double diff = 0.0;
@@ -100,8 +93,8 @@ TEST_F(ColourPipeline, TheGradedFrameFollowsTheLogCurveTheCorrectionAndTheLUT) {
     TempDir dir;
     const CliRun r = RenderExample(dir.Path(), " --device cpu");
     ASSERT_EQ(r.exitCode, 0) << r.out << r.err;
-    const Ref<Image> plate = Read(dir.Path() / "out/colour/log-plate.0001.png"),
-                     graded = Read(dir.Path() / "out/colour/graded.0001.exr");
+    const Ref<Image> plate = ReadFrame(dir.Path() / "out/colour/log-plate.0001.png"),
+                     graded = ReadFrame(dir.Path() / "out/colour/graded.0001.exr");
     ASSERT_TRUE(plate && graded);
     ASSERT_FALSE(plate->IsFloat()) << "the plate is 16-bit codes";
     ASSERT_TRUE(graded->IsFloat());
@@ -145,7 +138,7 @@ TEST_F(ColourPipeline, OpenCLWritesTheSameFramesAsTheCPU) {
     // The kernels do the rows' arithmetic; only the highlights' gamma power (the device's powf against the rows'
     // vectorised power) may differ, by float rounding: a float step or two (1.2e-7 measured).
     for (const char *name : {"out/colour/log-plate.0001.png", "out/colour/graded.0001.exr"}) {
-        const Ref<Image> a = Read(cpuDir.Path() / name), b = Read(devDir.Path() / name);
+        const Ref<Image> a = ReadFrame(cpuDir.Path() / name), b = ReadFrame(devDir.Path() / name);
         ASSERT_TRUE(a && b) << name;
         ASSERT_EQ(a->DataWindow(), b->DataWindow()) << name;
         const Worst w = Compare(*b, [&](int x, int y, int c) {

@@ -24,13 +24,6 @@ namespace {
 
 namespace fs = std::filesystem;
 
-Ref<Image> Read(const fs::path &file) {
-    std::string error;
-    Ref<Image> img = Clip(file.string()).GetFrameTagList(0, {}, error);
-    EXPECT_TRUE(img) << file << ": " << error;
-    return img;
-}
-
 Ref<OrvaneDoc> Load(const fs::path &flow) {
     Ref<OrvaneDoc> doc = MakeRef<OrvaneDoc>();
     EXPECT_TRUE(LoadDocument(ReadFile(flow), *doc).ok) << flow;
@@ -107,7 +100,7 @@ TEST_F(GreenKey, KeysOverTheNewBackgroundAndOpenCLRendersTheSame) {
     const Ref<Image> back = Orvane::Test::EvalImage(doc->FindTool("NewBack"), 1.0);
     ASSERT_TRUE(back);
     for (const char *name : {"out/key/delta.0001.exr", "out/key/ultra.0001.exr"}) {
-        const Ref<Image> comp = Read(cpuDir.Path() / name);
+        const Ref<Image> comp = ReadFrame(cpuDir.Path() / name);
         ASSERT_TRUE(comp) << name;
         // The actor's middle is its own colour; bare screen and the stand behind the garbage mask show the new
         // background (the screen's grain-free gradient keys to within 0.02).
@@ -127,7 +120,7 @@ TEST_F(GreenKey, KeysOverTheNewBackgroundAndOpenCLRendersTheSame) {
         EXPECT_LE(screen, 0.02) << name;
         EXPECT_LE(stand, 1e-6) << name;
         if (!haveDevice) continue;
-        const Ref<Image> onDevice = Read(devDir.Path() / name);
+        const Ref<Image> onDevice = ReadFrame(devDir.Path() / name);
         ASSERT_TRUE(onDevice) << name;
         double worst = 0;
         for (int y = 0; y < 180; ++y)

@@ -19,13 +19,6 @@ namespace {
 
 namespace fs = std::filesystem;
 
-Ref<Image> Read(const fs::path &file) {
-    std::string error;
-    Ref<Image> img = Clip(file.string()).GetFrameTagList(0, {}, error);
-    EXPECT_TRUE(img) << file << ": " << error;
-    return img;
-}
-
 /// Where the vignette ellipse (centre (160, 90), radii 120 and 72 pixels) leaves the plate sharp: well inside it,
 /// beyond the reach of its soft edge.
 bool Sharp(int x, int y) { return std::pow((x + 0.5 - 160) / 120, 2) + std::pow((y + 0.5 - 90) / 72, 2) < 0.3; }
@@ -44,8 +37,8 @@ TEST(MaskedGradeExample, GradesInsideTheMovingPolygonAndBlursOutsideTheEllipse) 
     Ref<OrvaneDoc> doc = MakeRef<OrvaneDoc>();
     ASSERT_TRUE(LoadDocument(ReadFile(flow), *doc).ok);
     const Ref<Image> lift = Orvane::Test::EvalImage(doc->FindTool("Lift"), 1.0);
-    const Ref<Image> first = Read(dir.Path() / "out/masks/graded.0001.exr"),
-                     last = Read(dir.Path() / "out/masks/graded.0012.exr");
+    const Ref<Image> first = ReadFrame(dir.Path() / "out/masks/graded.0001.exr"),
+                     last = ReadFrame(dir.Path() / "out/masks/graded.0012.exr");
     ASSERT_TRUE(lift && first && last);
 
     // Frame 1: the polygon covers (130, 90) well inside its soft edge: the corrector's gains, Master RGB 1.3 times
