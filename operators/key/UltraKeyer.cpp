@@ -104,23 +104,31 @@ UltraKeyer::UltraKeyer(const Registry *reg, const ScriptVal &args, const TagList
     AddControlPageTagList("Matte", {});
     matte_.AddMatteInputs();
     subtract_ = AddInputTagList("Subtract Background", "SubtractBackground", Checkbox(1.0));
-    garbageInverted_ = FindInput("Garbage.MaskInverted");
     input_ = AddInputTagList("Input", "Input",
                              {{LinkDataType, CLSID_DataType_Image},
                               {LinkMain, 1},
                               {InputPriority, PriorityImage},
                               {InputRequired, 1},
                               {ImageFromRequestOK, 1}});
-    // Older flows connect their garbage matte here; it is read when
-    // Garbage.Mask has none, and not written back.
-    legacyGarbage_ = AddInputTagList(
-        "LegacyGarbageMatte", "GarbageMatte",
-        {{LinkDataType, CLSID_DataType_Mask}, {InputPriority, PriorityMask}, {LinkNotSaved, 1}, {ControlVisible, 0}});
+    // Older flows connect their garbage matte here: the link moves to
+    // Garbage.Mask as it is made (unless that has one), so it is saved there.
+    legacyGarbage_ = AddInputTagList("LegacyGarbageMatte", "GarbageMatte",
+                                     {{LinkDataType, CLSID_DataType_Mask},
+                                      {InputPriority, PriorityMask},
+                                      {LinkNotSaved, 1},
+                                      {ControlVisible, 0},
+                                      {InputNotify, 1},
+                                      {InputInitialNotify, 0}});
     output_ = AddOutputTagList("Output", "Output", {{LinkDataType, CLSID_DataType_Image}, {LinkMain, 1}});
 }
 
 void UltraKeyer::NotifyChanged(Input *in, Parameter *param, double time, TagList *tags) {
     if (in == reset_ && param) ranges_.Reset();
+    if (in == legacyGarbage_ && in->Link()) {
+        Output *link = in->Link();
+        in->Disconnect();
+        if (Input *garbage = FindInput("Garbage.Mask"); garbage && !garbage->Link()) garbage->ConnectTo(link);
+    }
     matte_.NotifyChanged(in, param);
     ThreadedOperator::NotifyChanged(in, param, time, tags);
 }
@@ -191,12 +199,6 @@ Ref<Image> UltraKeyer::Key(Request *req, const Image *src, Ref<Image> dst, const
         return {};
     dst = matte_.ApplyMasks(req, dst.Get());
     if (!dst) return {};
-    if (!matte_.GarbageMask(req, nullptr))
-        if (const auto *legacy = dynamic_cast<const Image *>(req->GetInputData(legacyGarbage_))) {
-            const bool invert = garbageInverted_ && req->GetInputNumber(garbageInverted_, 0.0) >= 0.5;
-            dst = DoGarbageMatte(req, dst.Get(), legacy, GarbageMatteGarbage, false, invert);
-            if (!dst) return {};
-        }
     if (!KeyerMatte::PostMultiply(req, dst.Get(), mv)) return {};
     return dst;
 }

@@ -19,8 +19,8 @@
 //      give, which step 8 applies
 //   6. spill on the key channel, the fringe colour
 //   7. invert
-//   8. the solid and garbage mattes (the old LegacyGarbageMatte link serves
-//      as the garbage matte when Garbage.Mask has none), post-multiply
+//   8. the solid and garbage mattes (an older flow's GarbageMatte link is
+//      moved to Garbage.Mask as it is made), post-multiply
 //   9. the source's canvas colour
 // Sizes below 1.1920928955078125e-7 skip their step. The result image covers
 // the region asked for grown by the blurs' reach (CheckRequest asks the
@@ -70,7 +70,7 @@ private:
     KeyerMatte matte_;
     RangeInputs ranges_;
     Input *background_[3], *weight_[2], *correction_, *separation_, *preMatteSize_, *reset_, *subtract_,
-        *legacyGarbage_, *garbageInverted_, *input_;
+        *legacyGarbage_, *input_;
     Output *output_;
     RangePicker picker_;
 };

@@ -3,6 +3,7 @@
 #include <cmath>
 #include <limits>
 
+#include "host/flow/DocumentIO.h"
 #include "operators/key/UltraKeyerSteps.h"
 #include "tests/host/image/ImageTestSupport.h"
 #include "tests/host/krom/DeviceTestSupport.h"
@@ -143,20 +144,25 @@ TEST_F(UltraKeyerTool, ARegionIsTheCropOfTheFrameAndTheDeviceGivesTheRowsResult)
         }
 }
 
-TEST_F(UltraKeyerTool, TheOldGarbageLinkActsAsTheGarbageMatte) {
+TEST_F(UltraKeyerTool, TheOldGarbageLinkMovesToTheGarbageMatteAndIsSavedThere) {
     Rig rig("UltraKeyer", Plate());
     SetNumbers(rig.tool, kScreen);
-    Operator *mask = rig.doc.AddTool(OvID("EllipseMask"));
-    ASSERT_TRUE(mask);
+    Operator *mask = rig.doc.AddTool(OvID("EllipseMask"), "Matte");
+    Operator *other = rig.doc.AddTool(OvID("RectangleMask"), "Other");
+    ASSERT_TRUE(mask && other);
+    Input *legacy = rig.tool->FindInput("GarbageMatte"), *garbage = rig.tool->FindInput("Garbage.Mask");
     Ref<Image> none = RenderOn(rig.tool, nullptr);
-    ASSERT_TRUE(rig.tool->FindInput("GarbageMatte")->ConnectTo(mask->FindMainOutput()));
-    Ref<Image> legacy = RenderOn(rig.tool, nullptr);
-    rig.tool->FindInput("GarbageMatte")->Disconnect();
-    ASSERT_TRUE(rig.tool->FindInput("Garbage.Mask")->ConnectTo(mask->FindMainOutput()));
-    Ref<Image> current = RenderOn(rig.tool, nullptr);
-    ASSERT_TRUE(none && legacy && current);
-    EXPECT_TRUE(SameBits(*legacy, *current));
-    EXPECT_GT(MaxDiff(*none, *current, current->DataWindow()), 0.5) << "the mask took part of the matte away";
+    ASSERT_TRUE(legacy->ConnectTo(mask->FindMainOutput()));
+    EXPECT_EQ(legacy->Link(), nullptr);
+    EXPECT_EQ(garbage->Link(), mask->FindMainOutput());
+    Ref<Image> keyed = RenderOn(rig.tool, nullptr);
+    ASSERT_TRUE(none && keyed);
+    EXPECT_GT(MaxDiff(*none, *keyed, keyed->DataWindow()), 0.5) << "the mask took part of the matte away";
+    EXPECT_NE(SaveDocument(rig.doc).find("[\"Garbage.Mask\"] = Matte.Mask"), std::string::npos);
+    // A garbage matte already connected stays.
+    ASSERT_TRUE(legacy->ConnectTo(other->FindMainOutput()));
+    EXPECT_EQ(garbage->Link(), mask->FindMainOutput());
+    EXPECT_EQ(legacy->Link(), nullptr);
 }
 
 TEST_F(UltraKeyerTool, KeysPlatesCloseToTheirTrueMattesAndTakesTheScreenOffTheColour) {
