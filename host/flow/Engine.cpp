@@ -9,6 +9,7 @@
 #include "host/app/Application.h"
 #include "host/core/Tags.h"
 #include "host/flow/DataTypes.h"
+#include "host/flow/InputAt.h"
 #include "host/flow/MotionBlur.h"
 #include "host/flow/Operator.h"
 #include "host/flow/OrvaneDoc.h"
@@ -261,6 +262,7 @@ Ref<Parameter> EvaluateValue(Output *out, double time, const EvalOptions &option
                 EvalOptions up = opt;
                 up.roi = slot.roi;
                 if (slot.flags & InputFlagPreCalc) up.flags |= ReqFlagPreCalc;
+                up.flags |= slot.flags & ReqFlagTimeShifted;
                 const bool reuse =
                     (up.flags & ReqFlagPreCalc) && shapes[in->Index()] && shapeTimes[in->Index()] == slot.time;
                 slot.data = reuse ? shapes[in->Index()] : EvaluateValue(in->Link(), slot.time, up);
