@@ -6,6 +6,12 @@
 // (ScriptState.cpp); the functions are handed over as the table
 // OrvaneScriptApi, so no symbol lookup is needed.
 //
+// A script pixel (FltPixel in scripts, OrvaneScriptPixel here) holds the four
+// colour channels first, as the host's FltPixel, then the background colour
+// channels and the auxiliary channels. Cursors and samplers read and write the
+// auxiliary channels an image has and leave the other fields as they are; the
+// background colour channels are scratch for scripts (images do not carry them).
+//
 // Safety: a script holds a cursor only as opaque constant bytes and makes one
 // only through ovs_PixPtrInit, so it cannot aim it at other memory; every read
 // and write checks the cursor against the image's data window; writes to a
@@ -17,11 +23,21 @@
 #include <cstdint>
 
 #include "host/core/Export.h"
-#include "host/image/Pixel.h"
 
 namespace Orvane {
 class Image;
 }
+
+/// A pixel as scripts see it: colour, background colour, auxiliary channels.
+struct OrvaneScriptPixel {
+    float R, G, B, A;
+    float BgR, BgG, BgB, BgA;
+    float Z, Coverage, U, V, NX, NY, NZ, VectX, VectY, BackVectX, BackVectY, PositionX, PositionY, PositionZ,
+        DisparityX, DisparityY;
+};
+
+/// The auxiliary channels of a script pixel, in field order from Z.
+inline constexpr int kScriptAuxFields = 16;
 
 /// A cursor over one image's pixels (scripts see it as opaque bytes).
 struct OrvanePixPtr {
@@ -30,7 +46,8 @@ struct OrvanePixPtr {
     int32_t x, y;
     int32_t x0, x1; ///< the data window's columns
     int32_t bytesPerPixel, depth;
-    int32_t writable, unused;
+    int32_t writable;
+    uint32_t auxFields; ///< bit k: the image has the script pixel's auxiliary field k
 };
 
 /// Edge rules of ovs_ImageSample beyond the image frame.
@@ -48,12 +65,12 @@ ORVANE_API void ovs_PixPtrGotoXY(OrvanePixPtr *p, int32_t x, int32_t y);
 /// One pixel to the right.
 ORVANE_API void ovs_PixPtrNextPixel(OrvanePixPtr *p);
 /// The pixel at the cursor, or the canvas colour outside the data window.
-ORVANE_API void ovs_PixPtrGetPixel(const OrvanePixPtr *p, Orvane::FltPixel *out);
+ORVANE_API void ovs_PixPtrGetPixel(const OrvanePixPtr *p, OrvaneScriptPixel *out);
 /// Writes at the cursor (in the image's depth); nothing outside the window or on a read-only image.
-ORVANE_API void ovs_PixPtrSetPixel(const OrvanePixPtr *p, const Orvane::FltPixel *in);
+ORVANE_API void ovs_PixPtrSetPixel(const OrvanePixPtr *p, const OrvaneScriptPixel *in);
 /// Get/Set, then one pixel to the right.
-ORVANE_API void ovs_PixPtrGetNextPixel(OrvanePixPtr *p, Orvane::FltPixel *out);
-ORVANE_API void ovs_PixPtrSetNextPixel(OrvanePixPtr *p, const Orvane::FltPixel *in);
+ORVANE_API void ovs_PixPtrGetNextPixel(OrvanePixPtr *p, OrvaneScriptPixel *out);
+ORVANE_API void ovs_PixPtrSetNextPixel(OrvanePixPtr *p, const OrvaneScriptPixel *in);
 
 ORVANE_API int32_t ovs_ImageWidth(const Orvane::Image *img);
 ORVANE_API int32_t ovs_ImageHeight(const Orvane::Image *img);
@@ -62,8 +79,8 @@ ORVANE_API double ovs_ImageYScale(const Orvane::Image *img);
 /// Bilinear sample at (x, y) in pixels, pixel centres at whole numbers (rows from the bottom): exactly
 /// Image::GetFlt at whole positions. Inside the frame pixels outside the data window have the canvas
 /// colour; beyond the frame `edges` (OrvaneSampleEdges) decides. NaN positions give a clear pixel.
-ORVANE_API void ovs_ImageSample(const Orvane::Image *img, double x, double y, int32_t edges, Orvane::FltPixel *out);
-ORVANE_API void ovs_ImageGetCanvasColorFlt(const Orvane::Image *img, Orvane::FltPixel *out);
+ORVANE_API void ovs_ImageSample(const Orvane::Image *img, double x, double y, int32_t edges, OrvaneScriptPixel *out);
+ORVANE_API void ovs_ImageGetCanvasColorFlt(const Orvane::Image *img, OrvaneScriptPixel *out);
 
 /// Takes the next line from a shared counter (atomic fetch-and-add of 1).
 ORVANE_API int32_t ovs_NextLine(int32_t *counter);

@@ -26,10 +26,11 @@ local ffi = require("ffi")
 ffi.cdef(declarations)
 local api = ffi.cast("const OrvaneScriptApi *", apiAddress)
 local FltPixelType, PixPtrType = ffi.typeof("FltPixel"), ffi.typeof("PixPtr")
+local pixelBytes = ffi.sizeof(FltPixelType)
 
 ffi.metatype(FltPixelType, { __index = {
-    Clear = function(p) p.R, p.G, p.B, p.A = 0, 0, 0, 0 end,
-    Set = function(p, q) p.R, p.G, p.B, p.A = q.R, q.G, q.B, q.A end,
+    Clear = function(p) ffi.fill(p, pixelBytes) end,
+    Set = function(p, q) ffi.copy(p, q, pixelBytes) end,
 } })
 ffi.metatype(PixPtrType, { __index = {
     GotoXY = function(pp, x, y) api.PixPtrGotoXY(pp, x, y) end,

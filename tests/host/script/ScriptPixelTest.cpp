@@ -56,8 +56,9 @@ TEST(ScriptImageApi, SamplingFollowsGetFltAndTheEdgeRules) {
     state.SetImage(ScriptEnv::Trusted, "img", img.Get());
     const char *letters = "BWDM";
     for (const Case &c : cases) {
-        FltPixel got;
-        ovs_ImageSample(img.Get(), c.x, c.y, c.edges, &got);
+        OrvaneScriptPixel sampled;
+        ovs_ImageSample(img.Get(), c.x, c.y, c.edges, &sampled);
+        const FltPixel got{sampled.R, sampled.G, sampled.B, sampled.A};
         for (int ch = 0; ch < 4; ++ch)
             EXPECT_NEAR(Channel(got, ch), Channel(c.want, ch), 1e-6) << c.x << "," << c.y << " edges " << c.edges;
         // The same through the FFI binding.
