@@ -15,6 +15,23 @@ uint64_t s_nextId = 1;
 
 } // namespace
 
+void RenderTask::Abort() {
+    abort_.store(true, std::memory_order_relaxed);
+    std::lock_guard<std::mutex> hold(abortLock_);
+    for (int32_t *word : abortWords_) std::atomic_ref<int32_t>(*word).store(1, std::memory_order_relaxed);
+}
+
+void RenderTask::LinkAbortWord(int32_t *word) {
+    std::lock_guard<std::mutex> hold(abortLock_);
+    abortWords_.push_back(word);
+    if (IsAborted()) std::atomic_ref<int32_t>(*word).store(1, std::memory_order_relaxed);
+}
+
+void RenderTask::UnlinkAbortWord(int32_t *word) {
+    std::lock_guard<std::mutex> hold(abortLock_);
+    std::erase(abortWords_, word);
+}
+
 RenderTask::RenderTask() {
     std::lock_guard<std::mutex> lock(s_tasksLock);
     id_ = s_nextId++;

@@ -47,9 +47,15 @@ public:
     RenderTask(const RenderTask &) = delete;
     RenderTask &operator=(const RenderTask &) = delete;
 
-    void Abort() { abort_.store(true, std::memory_order_relaxed); }
+    /// Stops the render: sets the abort flag and every abort word linked to the task.
+    void Abort();
     bool IsAborted() const { return abort_.load(std::memory_order_relaxed); }
     const std::atomic<bool> *AbortFlag() const { return &abort_; }
+    /// Links a 32-bit abort word (read atomically by scripts and other code that polls a
+    /// word rather than the task) so that Abort sets it to 1; set at once when the task is
+    /// already aborted. Unlink before the word goes away.
+    void LinkAbortWord(int32_t *word);
+    void UnlinkAbortWord(int32_t *word);
 
     uint64_t ID() const { return id_; }
     /// The live task with this ID, or null.
@@ -95,6 +101,8 @@ public:
 
 private:
     std::atomic<bool> abort_{false};
+    std::mutex abortLock_;
+    std::vector<int32_t *> abortWords_;
     uint64_t id_;
     IDeviceContext *device_ = nullptr;
     mutable std::mutex logLock_;

@@ -13,6 +13,7 @@ extern "C" {
 #include <lualib.h>
 }
 
+#include "host/image/Pixel.h"
 #include "host/script/ScriptImageApi.h"
 
 namespace Orvane {
@@ -21,9 +22,14 @@ namespace Orvane {
 // the C declarations. It binds the FFI types, puts the pixel API into both
 // environments, builds the sandbox table and returns the helpers the host calls.
 static const char *const kScriptBinding = R"(
-local apiAddress, declarations, limited = ...
+local apiAddress, declarations, limited, floatDepth = ...
 local ffi = require("ffi")
 ffi.cdef(declarations)
+-- The cursor's fields, for this binding only: scripts hold cursors as opaque constant bytes.
+ffi.cdef[[typedef struct PixPtrView {
+    void *img; uint8_t *row; int32_t x, y, x0, x1, bytesPerPixel, depth, writable; uint32_t auxFields;
+} PixPtrView;]]
+local PixPtrView, FloatRow = ffi.typeof("PixPtrView *"), ffi.typeof("float *")
 local api = ffi.cast("const OrvaneScriptApi *", apiAddress)
 local FltPixelType, PixPtrType = ffi.typeof("FltPixel"), ffi.typeof("PixPtr")
 local pixelBytes = ffi.sizeof(FltPixelType)
@@ -32,13 +38,34 @@ ffi.metatype(FltPixelType, { __index = {
     Clear = function(p) ffi.fill(p, pixelBytes) end,
     Set = function(p, q) ffi.copy(p, q, pixelBytes) end,
 } })
+-- Stepping through float RGBA rows without auxiliary channels stays in Lua (the compiler turns it into
+-- plain loads and stores); every other case, and every check that fails, goes to the host's functions.
+local function FloatPixelAt(v)
+    local x = v.x
+    if v.depth == floatDepth and v.auxFields == 0 and v.row ~= nil and x >= v.x0 and x < v.x1 then
+        return ffi.cast(FloatRow, v.row) + (x - v.x0) * 4
+    end
+    return nil
+end
 ffi.metatype(PixPtrType, { __index = {
     GotoXY = function(pp, x, y) api.PixPtrGotoXY(pp, x, y) end,
     NextPixel = function(pp) api.PixPtrNextPixel(pp) end,
     GetPixel = function(pp, p) api.PixPtrGetPixel(pp, p) end,
     SetPixel = function(pp, p) api.PixPtrSetPixel(pp, p) end,
-    GetNextPixel = function(pp, p) api.PixPtrGetNextPixel(pp, p) end,
-    SetNextPixel = function(pp, p) api.PixPtrSetNextPixel(pp, p) end,
+    GetNextPixel = function(pp, p)
+        local v = ffi.cast(PixPtrView, pp)
+        local f = FloatPixelAt(v)
+        if f == nil or not ffi.istype(FltPixelType, p) then return api.PixPtrGetNextPixel(pp, p) end
+        p.R, p.G, p.B, p.A = f[0], f[1], f[2], f[3]
+        v.x = v.x + 1
+    end,
+    SetNextPixel = function(pp, p)
+        local v = ffi.cast(PixPtrView, pp)
+        local f = FloatPixelAt(v)
+        if f == nil or v.writable == 0 or not ffi.istype(FltPixelType, p) then return api.PixPtrSetNextPixel(pp, p) end
+        f[0], f[1], f[2], f[3] = p.R, p.G, p.B, p.A
+        v.x = v.x + 1
+    end,
 } })
 local imageFields = { Width = api.ImageWidth, Height = api.ImageHeight, XScale = api.ImageXScale, YScale = api.ImageYScale }
 local imageMethods = {
@@ -82,6 +109,20 @@ for _, name in ipairs({ "assert", "error", "ipairs", "next", "pairs", "select", 
     sandbox[name] = _G[name]
 end
 for name, value in pairs(pixelApi) do sandbox[name] = value; _G[name] = value end
+-- Pixel templates size and copy pixels and tune the compiler; the sandbox gets those calls alone.
+sandbox.ffi = {
+    sizeof = function(t)
+        if t == "FltPixel" or ffi.istype(FltPixelType, t) then return pixelBytes end
+        error("ffi.sizeof takes FltPixel only here", 2)
+    end,
+    copy = function(to, from)
+        if not (ffi.istype(FltPixelType, to) and ffi.istype(FltPixelType, from)) then
+            error("ffi.copy copies pixels only here", 2)
+        end
+        ffi.copy(to, from, pixelBytes)
+    end,
+}
+sandbox.jit = { flush = function() jit.flush() end, opt = { start = function(...) jit.opt.start(...) end } }
 _G.ffi = ffi
 if limited then jit.on = function() error("the JIT compiler stays off in a state with limits", 2) end end
 
@@ -213,7 +254,8 @@ ScriptState::ScriptState(const ScriptLimits &limits) : impl_(std::make_unique<Im
 
     if (luaL_loadbuffer(L, kScriptBinding, std::char_traits<char>::length(kScriptBinding), "=binding") != 0 ||
         (lua_pushlightuserdata(L, const_cast<OrvaneScriptApi *>(&ScriptImageApi())),
-         lua_pushstring(L, ScriptImageDeclarations()), lua_pushboolean(L, !limits.jit), lua_pcall(L, 3, 1, 0) != 0)) {
+         lua_pushstring(L, ScriptImageDeclarations()), lua_pushboolean(L, !limits.jit),
+         lua_pushnumber(L, DepthRGBAFlt32), lua_pcall(L, 4, 1, 0) != 0)) {
         lua_close(L);
         throw std::bad_alloc();
     }

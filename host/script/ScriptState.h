@@ -3,9 +3,10 @@
 //
 //   Sandbox   expression code: math, bit, string (without dump), table, the
 //             plain value functions (type, tonumber, pairs, ...), the pixel
-//             API (FltPixel, PixPtr, Image methods, _MPDispatch), _ALERT and
-//             what the caller sets. No os, io, require, load, dofile, ffi,
-//             jit, debug, package, getfenv/setfenv, rawget/rawset,
+//             API (FltPixel, PixPtr, Image methods, _MPDispatch), _ALERT,
+//             what the caller sets, and for pixel templates ffi.sizeof and
+//             ffi.copy of FltPixel only, jit.flush and jit.opt.start. No os,
+//             io, require, load, dofile, the rest of ffi and jit, debug, package, getfenv/setfenv, rawget/rawset,
 //             getmetatable, collectgarbage, pcall.
 //   Trusted   raw scripts the user allowed (ScriptPermission.h): the full
 //             standard library, ffi and jit, the pixel API and _ALERT.
