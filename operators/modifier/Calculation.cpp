@@ -21,6 +21,7 @@ static ClassRegistration<Calculation, ThreadedOperator>
                     {RegClassName, "Calculation"},
                     {RegPath, "Tools/Modifiers/Calculation"},
                     {RegName, "Calculation"},
+                    {RegHelp, "Drives a number from two others by an arithmetic operation"},
                     {RegKeepsTimeState, 1},
                     {RegOutputType, "Number"}});
 

@@ -27,6 +27,7 @@ static ClassRegistration<Expression, ThreadedOperator>
                     {RegClassName, "Expression"},
                     {RegPath, "Tools/Modifiers/Expression"},
                     {RegName, "Expression"},
+                    {RegHelp, "Drives a number and a point from expressions over its inputs"},
                     {RegOutputType, "Number"}});
 
 namespace {

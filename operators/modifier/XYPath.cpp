@@ -19,6 +19,7 @@ static ClassRegistration<XYPath, ThreadedOperator> s_Registration(CLSID_XYPath, 
                                                                    {RegClassName, "XYPath"},
                                                                    {RegPath, "Tools/Modifiers/XYPath"},
                                                                    {RegName, "XY Path"},
+                    {RegHelp, "Drives a point from two animated numbers, and gives its heading"},
                                                                    {RegHasOperatorControl, 1},
                                                                    {RegOutputType, "Point"}});
 
