@@ -115,22 +115,20 @@ Expression::Expression(const Registry *reg, const ScriptVal &args, const TagList
                        {InputExternal, 0},
                        {InputNotify, 1},
                        {InputPassive, 1}};
-    BeginControlNestTagList("Number Controls", "NumberControls", false, {});
-    for (int k = 1; k <= kInputs; ++k) {
-        numberName_[k - 1] = AddInputTagList(fmt::format("Name for Number {}", k).c_str(),
-                                             fmt::format("NameforNumber{}", k).c_str(), TextTags());
-        showNumber_[k - 1] =
-            AddInputTagList(fmt::format("Show Number {}", k).c_str(), fmt::format("ShowNumber{}", k).c_str(), show);
-    }
-    EndControlNest();
-    BeginControlNestTagList("Point Controls", "PointControls", false, {});
-    for (int k = 1; k <= kInputs; ++k) {
-        pointName_[k - 1] = AddInputTagList(fmt::format("Name for Point {}", k).c_str(),
-                                            fmt::format("NameforPoint{}", k).c_str(), TextTags());
-        showPoint_[k - 1] =
-            AddInputTagList(fmt::format("Show Point {}", k).c_str(), fmt::format("ShowPoint{}", k).c_str(), show);
-    }
-    EndControlNest();
+    // Per input kind, a fold of the name and show fields: "Name for Number 1", "ShowNumber1" ...
+    auto fields = [&](const char *kind, Input **names, Input **shows) {
+        BeginControlNestTagList(fmt::format("{} Controls", kind).c_str(), fmt::format("{}Controls", kind).c_str(),
+                                false, {});
+        for (int k = 1; k <= kInputs; ++k) {
+            names[k - 1] = AddInputTagList(fmt::format("Name for {} {}", kind, k).c_str(),
+                                           fmt::format("Namefor{}{}", kind, k).c_str(), TextTags());
+            shows[k - 1] = AddInputTagList(fmt::format("Show {} {}", kind, k).c_str(),
+                                           fmt::format("Show{}{}", kind, k).c_str(), show);
+        }
+        EndControlNest();
+    };
+    fields("Number", numberName_, showNumber_);
+    fields("Point", pointName_, showPoint_);
 
     numberResult_ = AddOutputTagList("Number Result", "NumberResult", {{LinkDataType, CLSID_DataType_Number}});
     pointResult_ = AddOutputTagList("Point Result", "PointResult", {{LinkDataType, CLSID_DataType_Point}});
@@ -157,29 +155,14 @@ void Expression::NotifyChanged(Input *in, Parameter *param, double time, TagList
     ThreadedOperator::NotifyChanged(in, param, time, tags);
 }
 
-double Expression::NumberAt(void *self, const double *args, int count) {
+template <int Axis> double Expression::InputAt(void *self, const double *args, int count) {
     auto *tool = static_cast<Expression *>(self);
     const int k = count == 2 ? static_cast<int>(args[0]) : 0;
     if (k < 1 || k > kInputs) return 0.0;
-    return InputNumberAt(tool->current_, tool->numberIn_[k - 1], args[1], 0.0);
-}
-
-double Expression::PointXAt(void *self, const double *args, int count) {
-    auto *tool = static_cast<Expression *>(self);
-    const int k = count == 2 ? static_cast<int>(args[0]) : 0;
-    if (k < 1 || k > kInputs) return 0.0;
-    double x, y;
-    InputPointAt(tool->current_, tool->pointIn_[k - 1], args[1], x, y);
-    return x;
-}
-
-double Expression::PointYAt(void *self, const double *args, int count) {
-    auto *tool = static_cast<Expression *>(self);
-    const int k = count == 2 ? static_cast<int>(args[0]) : 0;
-    if (k < 1 || k > kInputs) return 0.0;
-    double x, y;
-    InputPointAt(tool->current_, tool->pointIn_[k - 1], args[1], x, y);
-    return y;
+    if (Axis < 0) return InputNumberAt(tool->current_, tool->numberIn_[k - 1], args[1], 0.0);
+    double xy[2];
+    InputPointAt(tool->current_, tool->pointIn_[k - 1], args[1], xy[0], xy[1]);
+    return xy[Axis];
 }
 
 bool Expression::Prepare(Request *req) {
@@ -207,9 +190,9 @@ bool Expression::Prepare(Request *req) {
             Fail(req, "%s: no script state could be made for the expressions\n", Name().c_str());
             return false;
         }
-        state_->SetFunction(ScriptEnv::Sandbox, "_numat", &Expression::NumberAt, this);
-        state_->SetFunction(ScriptEnv::Sandbox, "_ptxat", &Expression::PointXAt, this);
-        state_->SetFunction(ScriptEnv::Sandbox, "_ptyat", &Expression::PointYAt, this);
+        state_->SetFunction(ScriptEnv::Sandbox, "_numat", &Expression::InputAt<-1>, this);
+        state_->SetFunction(ScriptEnv::Sandbox, "_ptxat", &Expression::InputAt<0>, this);
+        state_->SetFunction(ScriptEnv::Sandbox, "_ptyat", &Expression::InputAt<1>, this);
     } else if (key == loaded_) {
         return true;
     }

@@ -37,9 +37,8 @@ private:
     /// Translates and loads the expressions when their text or the names changed; false when the state cannot be
     /// had (its console line written).
     bool Prepare(Request *req);
-    static double NumberAt(void *self, const double *args, int count);
-    static double PointXAt(void *self, const double *args, int count);
-    static double PointYAt(void *self, const double *args, int count);
+    /// _numat(k, t) (Axis -1), _ptxat(k, t) (0) and _ptyat(k, t) (1): input k at time t.
+    template <int Axis> static double InputAt(void *self, const double *args, int count);
 
     Input *numberIn_[kInputs], *pointIn_[kInputs];
     Input *numberName_[kInputs], *pointName_[kInputs], *showNumber_[kInputs], *showPoint_[kInputs];

@@ -14,14 +14,15 @@
 namespace Orvane {
 
 static const OvID CLSID_XYPath("XYPath");
-static ClassRegistration<XYPath, ThreadedOperator> s_Registration(CLSID_XYPath, &CLSID_ThreadedOperator,
-                                                                  {{RegTypeFlags, RegKindOperator | RegKindModifier},
-                                                                   {RegClassName, "XYPath"},
-                                                                   {RegPath, "Tools/Modifiers/XYPath"},
-                                                                   {RegName, "XY Path"},
+static ClassRegistration<XYPath, ThreadedOperator>
+    s_Registration(CLSID_XYPath, &CLSID_ThreadedOperator,
+                   {{RegTypeFlags, RegKindOperator | RegKindModifier},
+                    {RegClassName, "XYPath"},
+                    {RegPath, "Tools/Modifiers/XYPath"},
+                    {RegName, "XY Path"},
                     {RegHelp, "Drives a point from two animated numbers, and gives its heading"},
-                                                                   {RegHasOperatorControl, 1},
-                                                                   {RegOutputType, "Point"}});
+                    {RegHasOperatorControl, 1},
+                    {RegOutputType, "Point"}});
 
 namespace {
 
