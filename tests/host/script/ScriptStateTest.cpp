@@ -2,7 +2,6 @@
 // environments, _ALERT, and error positions.
 #include <gtest/gtest.h>
 
-#include <cmath>
 #include <string>
 #include <vector>
 
@@ -137,44 +136,6 @@ TEST(ScriptState, ScriptsAreRefusedUntilAllowed) {
     SetAllowScripts(true);
     EXPECT_TRUE(ScriptsAllowed());
     SetAllowScripts(false);
-}
-
-} // namespace
-} // namespace Orvane::scriptstatetest
-
-namespace Orvane::scriptstatetest {
-namespace {
-
-// A host function gets its data and the call's numbers; anything else, or too many, is a script error.
-TEST(ScriptState, HostFunctionsTakeNumbersAndTheirData) {
-    ScriptState state;
-    double scale = 10;
-    state.SetFunction(
-        ScriptEnv::Sandbox, "weigh",
-        [](void *data, const double *args, int count) {
-            double sum = 0;
-            for (int i = 0; i < count; ++i) sum += args[i] * (i + 1);
-            return sum * *static_cast<double *>(data);
-        },
-        &scale);
-    const struct {
-        const char *code;
-        double want; // NAN: an error
-    } cases[] = {{"r = weigh()", 0},
-                 {"r = weigh(1, 2, 3)", 140},
-                 {"r = weigh('2')", 20}, // Lua turns numeric text into a number
-                 {"r = weigh(1, 1, 1, 1, 1, 1, 1, 1)", 360},
-                 {"r = weigh(1, 1, 1, 1, 1, 1, 1, 1, 1)", NAN},
-                 {"r = weigh({})", NAN},
-                 {"r = weigh(nil)", NAN}};
-    for (const auto &c : cases) {
-        const std::string error = state.Run(ScriptEnv::Sandbox, c.code, "call");
-        EXPECT_EQ(error.empty(), !std::isnan(c.want)) << c.code << ": " << error;
-        if (!std::isnan(c.want)) {
-            EXPECT_EQ(state.GetNumber(ScriptEnv::Sandbox, "r"), c.want) << c.code;
-        }
-    }
-    EXPECT_NE(state.Run(ScriptEnv::Trusted, "r = weigh(1)", "other"), ""); // set in the sandbox only
 }
 
 } // namespace
