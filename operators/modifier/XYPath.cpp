@@ -8,7 +8,9 @@
 #include "host/flow/AnimCurve.h"
 #include "host/flow/DataTypes.h"
 #include "host/flow/InputAt.h"
+#include "host/flow/OrvaneDoc.h"
 #include "host/flow/Request.h"
+#include "host/flow/ResultCache.h"
 #include "operators/frame/Registration.h"
 
 namespace Orvane {
@@ -90,7 +92,11 @@ double XYPath::Aspect() const {
     return r && r->IsNumber() && std::isfinite(r->AsNumber()) && r->AsNumber() > 0 ? r->AsNumber() : 1.0;
 }
 
-void XYPath::SetAspect(double r) { KeptFields().Set(kAspectField, r); }
+void XYPath::SetAspect(double r) {
+    KeptFields().Set(kAspectField, r);
+    // The aspect is no input, so cached results do not know of it: everything made before goes.
+    if (GetDoc()) GetDoc()->Cache().Clear();
+}
 
 void XYPath::Process(Request *req) {
     const double t = req->Time(), r = Aspect();

@@ -30,7 +30,7 @@ public:
 
     /// The path's aspect `r` (1 when the document gives none, or none usable).
     double Aspect() const;
-    /// Sets `r`, kept in the document; main thread, between renders.
+    /// Sets `r`, kept in the document, and drops the document's cached results; main thread, between renders.
     void SetAspect(double r);
 
 private:
