@@ -191,7 +191,8 @@ constexpr size_t maxLength = 20000;
 
 class ExpressionReader {
 public:
-    ExpressionReader(std::string_view text, ExpressionContext context) : text_(text), context_(context) {}
+    ExpressionReader(std::string_view text, ExpressionContext context, const NameAliases *aliases)
+        : text_(text), context_(context), aliases_(aliases) {}
 
     Node ReadAll() {
         if (text_.size() > maxLength) Fail(1, fmt::format("expression longer than {} characters", maxLength));
@@ -386,6 +387,13 @@ private:
             if (found->second.contexts & here) return found->second;
             Fail(position, fmt::format("'{}' is not available in {}", name, ContextWords(context_)));
         }
+        if (aliases_)
+            if (auto alias = aliases_->find(name); alias != aliases_->end()) {
+                auto found = names.find(alias->second);
+                if (found != names.end() && (found->second.contexts & here)) return found->second;
+                Fail(position, fmt::format("'{}' stands for '{}', which is not available in {}", name, alias->second,
+                                           ContextWords(context_)));
+            }
         std::vector<std::string> known;
         for (const auto &[candidate, info] : names)
             if (info.contexts & here) known.push_back(candidate);
@@ -406,6 +414,7 @@ private:
 
     std::string_view text_;
     ExpressionContext context_;
+    const NameAliases *aliases_;
     size_t at_ = 0;
     Token token_ = Token::End;
     std::string_view tokenText_;
@@ -477,9 +486,10 @@ using namespace expression_parser;
 
 std::string ParseError::Describe() const { return fmt::format("column {}: {}", position, message); }
 
-bool Parser::Parse(std::string_view text, ExpressionContext context, std::string *luaText, ParseError *error) {
+bool Parser::Parse(std::string_view text, ExpressionContext context, std::string *luaText, ParseError *error,
+                   const NameAliases *aliases) {
     try {
-        ExpressionReader reader(text, context);
+        ExpressionReader reader(text, context, aliases);
         const Node root = reader.ReadAll();
         *luaText = LuaNumber(root);
         flags_ |= reader.Flags();

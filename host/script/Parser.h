@@ -16,6 +16,7 @@
 #include <cstdint>
 #include <string>
 #include <string_view>
+#include <unordered_map>
 
 #include "host/core/Export.h"
 
@@ -89,14 +90,20 @@ struct ParseError {
     ORVANE_API std::string Describe() const;
 };
 
+/// Extra names for names of the language ("speed" for "n1"): a name the
+/// language does not know is looked up here and read as the name it stands
+/// for. Names of the language always keep their own meaning.
+using NameAliases = std::unordered_map<std::string, std::string>;
+
 class ORVANE_API Parser {
 public:
     /// Translates one expression. On success sets `luaText` (not null) to a Lua
     /// expression giving a number, and adds to the flags; on failure sets
     /// `error` (when given) and leaves `luaText` and the flags unchanged. The
     /// caller then uses its default: the Custom tool writes one console line
-    /// with Describe() and uses "0".
-    bool Parse(std::string_view text, ExpressionContext context, std::string *luaText, ParseError *error);
+    /// with Describe() and uses "0". `aliases`, when given, adds names.
+    bool Parse(std::string_view text, ExpressionContext context, std::string *luaText, ParseError *error,
+               const NameAliases *aliases = nullptr);
 
     /// The flags of every successful Parse since construction or ClearFlags().
     uint64_t GetFlags() const { return flags_; }

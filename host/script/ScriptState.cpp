@@ -199,6 +199,29 @@ struct ScriptState::Impl {
         return p;
     }
 
+    /// The body of every SetFunction closure; upvalue 1 is its HostFunction.
+    struct HostFunction {
+        NumberFunction fn;
+        void *data;
+    };
+    static int CallHostFunction(lua_State *L) {
+        const auto *f = static_cast<const HostFunction *>(lua_touserdata(L, lua_upvalueindex(1)));
+        const int count = lua_gettop(L);
+        if (count > kMaxFunctionArgs) return luaL_error(L, "too many arguments (at most %d)", kMaxFunctionArgs);
+        double args[kMaxFunctionArgs] = {};
+        for (int i = 0; i < count; ++i) args[i] = luaL_checknumber(L, i + 1);
+        double result = 0;
+        bool failed = false;
+        try {
+            result = f->fn(f->data, args, count);
+        } catch (...) {
+            failed = true; // luaL_error is raised outside the handler, so no C++ frame is skipped
+        }
+        if (failed) return luaL_error(L, "a host function failed");
+        lua_pushnumber(L, result);
+        return 1;
+    }
+
     static int Alert(lua_State *L) {
         Impl *s = static_cast<Impl *>(lua_touserdata(L, lua_upvalueindex(1)));
         const char *text = lua_isstring(L, 1) ? lua_tostring(L, 1) : luaL_typename(L, 1);
@@ -316,6 +339,16 @@ void ScriptState::SetNumber(ScriptEnv env, const char *name, double value) {
     lua_pushnumber(impl_->L, value);
     lua_setfield(impl_->L, -2, name);
     lua_pop(impl_->L, 1);
+}
+
+void ScriptState::SetFunction(ScriptEnv env, const char *name, NumberFunction fn, void *data) {
+    lua_State *L = impl_->L;
+    PushEnv(env);
+    auto *f = static_cast<Impl::HostFunction *>(lua_newuserdata(L, sizeof(Impl::HostFunction)));
+    *f = {fn, data};
+    lua_pushcclosure(L, Impl::CallHostFunction, 1);
+    lua_setfield(L, -2, name);
+    lua_pop(L, 1);
 }
 
 void ScriptState::SetString(ScriptEnv env, const char *name, std::string_view value) {

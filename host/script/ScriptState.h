@@ -59,6 +59,11 @@ public:
     /// Instructions between two calls of the count hook.
     static constexpr int kHookPeriod = 1000;
     using AlertFn = std::function<void(const std::string &)>;
+    /// A host function of numbers: `args` holds the call's `count` arguments (at most
+    /// kMaxFunctionArgs); the result goes back to the script. It must not throw: a C++
+    /// exception that escapes becomes a script error.
+    using NumberFunction = double (*)(void *data, const double *args, int count);
+    static constexpr int kMaxFunctionArgs = 8;
 
     /// Throws std::bad_alloc when the state cannot be made.
     explicit ScriptState(const ScriptLimits &limits = {});
@@ -81,6 +86,10 @@ public:
     /// script keeps the pointer: the caller sets it to null before the object goes away.
     void SetPointer(ScriptEnv env, const char *name, const char *ctype, void *ptr);
     void SetImage(ScriptEnv env, const char *name, Image *img) { SetPointer(env, name, "Image *", img); }
+    /// Sets `name` to a Lua function that calls `fn` with `data` and its arguments, all
+    /// numbers (a script error otherwise). The state keeps `data` as given: the caller keeps
+    /// it valid while scripts may call the function (or sets the name again).
+    void SetFunction(ScriptEnv env, const char *name, NumberFunction fn, void *data);
     /// The number `name` holds, or `fallback` when it holds none.
     double GetNumber(ScriptEnv env, const char *name, double fallback = 0) const;
 
