@@ -298,6 +298,7 @@ bool EXRIO::ReadPart(int part, Image **imgs) {
             fb.insert(e.name, Imf::Slice::Make(type, reads.back().pixels.data(), dw, size,
                                                size * static_cast<size_t>(w), 1, 1, e.fill));
         }
+        if (reads.empty()) return true; // every channel skipped: nothing to read
         Imf::InputPart in(*input, part - 1);
         in.setFrameBuffer(fb);
         in.readPixels(dw.min.y, dw.max.y);
@@ -405,6 +406,12 @@ Imf::Header *PartHeader(lua_State *L, EXRIO *self, int index) {
     Imf::Header *h = self ? self->Header(part) : nullptr;
     if (self && !h) self->lastError = "no part " + std::to_string(part);
     return h;
+}
+
+/// Nil as a Lua C function's one result.
+int PushNil(lua_State *L) {
+    lua_pushnil(L);
+    return 1;
 }
 
 void PushValue(lua_State *L, const Orvane::ScriptVal &v) {
@@ -525,7 +532,7 @@ ImgRectI *ffi_EXRIODisplayWindow(EXRIO *self, int partnum) { return WindowOf(sel
 
 int olcf_func_EXRIOGetPartNames(lua_State *L) {
     EXRIO *self = TakeSelf(L);
-    if (!self) return 0;
+    if (!self) return PushNil(L);
     lua_createtable(L, static_cast<int>(self->headers.size()), 0);
     for (size_t i = 0; i < self->headers.size(); ++i) {
         lua_pushstring(L, self->headers[i].hasName() ? self->headers[i].name().c_str() : "");
@@ -537,7 +544,7 @@ int olcf_func_EXRIOGetPartNames(lua_State *L) {
 int olcf_func_EXRIOGetChannels(lua_State *L) {
     EXRIO *self = TakeSelf(L);
     Imf::Header *h = PartHeader(L, self, 1);
-    if (!h) return 0;
+    if (!h) return PushNil(L);
     lua_newtable(L);
     int i = 0;
     for (auto c = h->channels().begin(); c != h->channels().end(); ++c) {
@@ -554,7 +561,7 @@ int olcf_func_EXRIOGetChannels(lua_State *L) {
 int olcf_func_EXRIOGetAttributeNames(lua_State *L) {
     EXRIO *self = TakeSelf(L);
     Imf::Header *h = PartHeader(L, self, 1);
-    if (!h) return 0;
+    if (!h) return PushNil(L);
     lua_newtable(L);
     int i = 0;
     for (auto a = h->begin(); a != h->end(); ++a) {
@@ -568,11 +575,11 @@ int olcf_func_EXRIOGetAttribute(lua_State *L) {
     EXRIO *self = TakeSelf(L);
     Imf::Header *h = PartHeader(L, self, 1);
     const char *name = lua_tostring(L, 2);
-    if (!h || !name) return 0;
+    if (!h || !name) return PushNil(L);
     const Imf::Attribute *a = h->findTypedAttribute<Imf::Attribute>(name);
     if (!a) {
         self->lastError = std::string("no attribute ") + name;
-        return 0;
+        return PushNil(L);
     }
     if (const auto *c = dynamic_cast<const Imf::CompressionAttribute *>(a)) {
         lua_pushinteger(L, static_cast<int>(c->value()));
@@ -581,7 +588,7 @@ int olcf_func_EXRIOGetAttribute(lua_State *L) {
         const Orvane::ScriptVal v = Orvane::exrfmt::AttributeValue(*a, hint);
         if (v.IsNil()) {
             self->lastError = std::string("attribute ") + name + " of type " + a->typeName() + " has no script form";
-            return 0;
+            return PushNil(L);
         }
         PushValue(L, v);
     }
@@ -640,7 +647,7 @@ int olcf_func_EXRIORemoveAttribute(lua_State *L) {
 int olcf_func_EXRIOPixelAspectRatio(lua_State *L) {
     EXRIO *self = TakeSelf(L);
     Imf::Header *h = PartHeader(L, self, 1);
-    if (!h) return 0;
+    if (!h) return PushNil(L);
     lua_pushnumber(L, h->pixelAspectRatio());
     return 1;
 }
