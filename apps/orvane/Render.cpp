@@ -14,7 +14,8 @@
 // two frames or two Savers writing one file, or a file that exists and is
 // not a regular one, stop it with exit 2 and nothing written.
 // Exit: 0 every requested frame written (or skipped as existing), 2 bad
-// command line or document, 3 a frame failed, 130 interrupted.
+// command line or document, 3 a frame failed (or, with --strict-scripts, a
+// raw script was refused for want of permission), 130 interrupted.
 #include <algorithm>
 #include <atomic>
 #include <chrono>
@@ -51,7 +52,7 @@ struct RenderArgs {
     std::vector<std::string> savers, sets;
     int threads = 0, proxy = 1;
     size_t memoryLimit = 0;
-    bool skipExisting = false, json = false, lenient = false, allowScripts = false;
+    bool skipExisting = false, json = false, lenient = false, allowScripts = false, strictScripts = false;
 };
 
 size_t ParseSize(const std::string &text) {
@@ -111,6 +112,8 @@ RenderArgs ParseArgs(const std::vector<std::string> &args) {
             a.lenient = true;
         } else if (arg == "--allow-scripts") {
             a.allowScripts = true;
+        } else if (arg == "--strict-scripts") {
+            a.strictScripts = true;
         } else if (arg == "--log-format") {
             const std::string &f = value();
             if (f != "text" && f != "json") throw CliError(ExitUsage, "render: --log-format is text or json");
@@ -357,7 +360,8 @@ double PeakMemoryMiB() {
 int RunRender(const std::vector<std::string> &rawArgs) {
     const RenderArgs a = ParseArgs(rawArgs);
     if (a.threads) SetWorkerCount(a.threads);
-    SetAllowScripts(a.allowScripts);
+    SetAllowScripts(a.allowScripts || AllowScriptsPreference());
+    const long long refusedBefore = ScriptRefusals();
     LoadLibrary();
 
     OrvaneDoc doc;
@@ -552,6 +556,12 @@ int RunRender(const std::vector<std::string> &rawArgs) {
     if (interrupted) {
         log.Message("ERROR", "interrupted", "interrupted; frames written before the stop are listed above");
         return ExitInterrupted;
+    }
+    if (a.strictScripts && ScriptRefusals() > refusedBefore) {
+        log.Message(
+            "ERROR", "scripts_refused",
+            "scripts of the flow were not run (not allowed; use --allow-scripts) and --strict-scripts was given");
+        return ExitFailed;
     }
     return nFailed ? ExitFailed : ExitOk;
 }

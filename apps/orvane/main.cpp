@@ -38,10 +38,13 @@ const Command kCommands[] = {
   --proxy N             render at 1/N size
   --skip-existing       leave frames whose file exists
   --lenient             render a document with problems, taking them as warnings
-  --allow-scripts       let the document's raw scripts run (with the full Lua library)
+  --allow-scripts       let the document's raw scripts run (with the full Lua library);
+                        ORVANE_ALLOW_SCRIPTS=1 in the environment does the same
+  --strict-scripts      a raw script not run for want of permission fails the render
   --log-format text|json  one line per event; json: one object per event
   Ctrl-C stops after the frame in hand; a second Ctrl-C stops at once.
-  Exit: 0 all written, 2 bad command line or document, 3 a frame failed, 130 interrupted.
+  Exit: 0 all written, 2 bad command line or document, 3 a frame failed (or, with
+  --strict-scripts, a script was not run), 130 interrupted.
 )"},
     {"eval", RunEval, R"(orvane eval FLOW TOOL[.OUTPUT] [options]
   Evaluates one output of a flow and prints its size, windows, depth, channel
@@ -89,6 +92,15 @@ const Command kCommands[] = {
   --time T              the frame to pick from (default: the render range's start)
   --device D, --lenient as for render
   Exit: 0 picked and saved, 2 bad command line or document, 3 nothing picked.
+)"},
+    {"script", RunScript, R"(orvane script [options] FILE.lua [ARGS...]
+  Runs a Lua script with the full Lua library, the script classes (EXRIO: OpenEXR
+  files with several parts) and images (Image.New); arg[0] is FILE, arg[1]...
+  the ARGS. Raw scripts reach files and processes: they run only with
+  permission, --allow-scripts or ORVANE_ALLOW_SCRIPTS=1 in the environment.
+  --allow-scripts       run the script
+  --instruction-limit N stop the script after N Lua instructions (default 1e10; 0: none)
+  Exit: 0 the script ran, 2 bad command line or not allowed, 3 the script failed.
 )"},
     {"tools", RunTools, R"(orvane tools [--search WORD] [--all]
   Lists the classes: ID, name, kind, attributes, category, whether built.
@@ -201,7 +213,14 @@ int main(int argc, char **argv) {
     if (command == "--version") command = "version";
     for (const Command &c : kCommands) {
         if (command != c.name) continue;
-        if (AsksForHelp(args)) {
+        // A script's own arguments (after its file) are the script's, --help among them.
+        std::vector<std::string> own = args;
+        if (command == "script") {
+            const auto file =
+                std::find_if(own.begin(), own.end(), [](const std::string &a) { return a.rfind("-", 0) != 0; });
+            own.erase(file, own.end());
+        }
+        if (AsksForHelp(own)) {
             std::fputs(c.usage, stdout);
             return ExitOk;
         }

@@ -199,6 +199,8 @@ constexpr Tag ButtonIconOff = 0x68050001;
 constexpr Tag ButtonIconOn = 0x68050003;
 constexpr Tag ButtonIcon = 0x68050005;
 constexpr Tag ControlKindValue = 0x10050000;
+/// TextEdit: the language of its text ("lua"), for the editor's highlighting.
+constexpr Tag TextEditLanguage = 0x30050003;
 constexpr Tag SliderLowLabel = 0x30050000;
 constexpr Tag SliderHighLabel = 0x30050002;
 constexpr Tag OffsetXLabel = 0x30050000;

@@ -6,6 +6,7 @@
 #include <cstddef>
 
 #include "host/image/Image.h"
+#include "host/image/NewImage.h"
 #include "host/image/PixelConvert.h"
 #include "host/image/ResizeFilters.h"
 
@@ -187,6 +188,18 @@ int32_t ovs_Aborted(const int32_t *abort) {
     return abort && std::atomic_ref<const int32_t>(*abort).load(std::memory_order_relaxed) != 0;
 }
 
+Orvane::Image *ovs_ImageNew(int32_t width, int32_t height, int32_t depth) {
+    using namespace Orvane;
+    if (width < 1 || height < 1 || width > MaxImageSide || height > MaxImageSide) return nullptr;
+    Ref<Image> img = NewImageTagList({{ImgWidth, width}, {ImgHeight, height}, {ImgDepth, depth}});
+    if (!img || !img->AllocScanLineData()) return nullptr;
+    return img.Release();
+}
+
+void ovs_ImageFree(Orvane::Image *img) {
+    if (img) img->Recycle();
+}
+
 } // extern "C"
 
 namespace Orvane {
@@ -206,7 +219,9 @@ const OrvaneScriptApi &ScriptImageApi() {
                                      ovs_ImageSample,
                                      ovs_ImageGetCanvasColorFlt,
                                      ovs_NextLine,
-                                     ovs_Aborted};
+                                     ovs_Aborted,
+                                     ovs_ImageNew,
+                                     ovs_ImageFree};
     return api;
 }
 
@@ -234,7 +249,13 @@ typedef struct OrvaneScriptApi {
     void (*ImageGetCanvasColorFlt)(const Image *img, FltPixel *out);
     int32_t (*NextLine)(int32_t *counter);
     int32_t (*Aborted)(const int32_t *abort);
+    Image *(*ImageNew)(int32_t width, int32_t height, int32_t depth);
+    void (*ImageFree)(Image *img);
 } OrvaneScriptApi;
+typedef struct ImgRectI { int32_t x0, y0, x1, y1; } ImgRectI;
+typedef double float64;
+typedef struct Request Request;
+typedef struct ScriptObject ScriptObject;
 )";
 }
 

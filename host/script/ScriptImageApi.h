@@ -82,6 +82,13 @@ ORVANE_API double ovs_ImageYScale(const Orvane::Image *img);
 ORVANE_API void ovs_ImageSample(const Orvane::Image *img, double x, double y, int32_t edges, OrvaneScriptPixel *out);
 ORVANE_API void ovs_ImageGetCanvasColorFlt(const Orvane::Image *img, OrvaneScriptPixel *out);
 
+/// A new image of `width` x `height` pixels in `depth` (ImageDepthValue; 8 is RGBA float32), its rows
+/// allocated and cleared, holding one reference for the caller; null for an impossible format or when
+/// memory ran out. Trusted scripts only (the script frees it with ovs_ImageFree).
+ORVANE_API Orvane::Image *ovs_ImageNew(int32_t width, int32_t height, int32_t depth);
+/// Drops the reference ovs_ImageNew gave.
+ORVANE_API void ovs_ImageFree(Orvane::Image *img);
+
 /// Takes the next line from a shared counter (atomic fetch-and-add of 1).
 ORVANE_API int32_t ovs_NextLine(int32_t *counter);
 /// True when the abort word is non-zero (atomic read).
@@ -105,11 +112,14 @@ struct OrvaneScriptApi {
     decltype(&ovs_ImageGetCanvasColorFlt) ImageGetCanvasColorFlt;
     decltype(&ovs_NextLine) NextLine;
     decltype(&ovs_Aborted) Aborted;
+    decltype(&ovs_ImageNew) ImageNew;
+    decltype(&ovs_ImageFree) ImageFree;
 };
 
 namespace Orvane {
 /// The one table of the functions.
 ORVANE_API const OrvaneScriptApi &ScriptImageApi();
-/// The ffi.cdef text declaring FltPixel, Image, PixPtr and OrvaneScriptApi.
+/// The ffi.cdef text declaring FltPixel, Image, PixPtr, OrvaneScriptApi, and the opaque types
+/// scripts pass on (ImgRectI, Request, ScriptObject).
 ORVANE_API const char *ScriptImageDeclarations();
 } // namespace Orvane

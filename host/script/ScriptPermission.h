@@ -16,5 +16,11 @@ namespace Orvane {
 ORVANE_API void SetAllowScripts(bool allow);
 /// True when raw scripts may run in this process.
 ORVANE_API bool ScriptsAllowed();
+/// The user's preference outside any document: ORVANE_ALLOW_SCRIPTS=1 in the environment.
+ORVANE_API bool AllowScriptsPreference();
+/// Counts a raw script not run because scripts are not allowed.
+ORVANE_API void NoteScriptRefused();
+/// The scripts refused since the process began.
+ORVANE_API long long ScriptRefusals();
 
 } // namespace Orvane

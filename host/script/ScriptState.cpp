@@ -124,6 +124,18 @@ sandbox.ffi = {
 }
 sandbox.jit = { flush = function() jit.flush() end, opt = { start = function(...) jit.opt.start(...) end } }
 _G.ffi = ffi
+-- Images a trusted script makes itself (to fill and hand to a script class): released when the
+-- script drops them, or at once with Image.Free.
+_G.Image = {
+    New = function(width, height, depth)
+        local img = api.ImageNew(width, height, depth or 8)
+        if img == nil then return nil end
+        return ffi.gc(img, api.ImageFree)
+    end,
+    Free = function(img)
+        if img ~= nil then ffi.gc(img, nil); api.ImageFree(img) end
+    end,
+}
 if limited then jit.on = function() error("the JIT compiler stays off in a state with limits", 2) end end
 
 return {
@@ -356,6 +368,18 @@ void ScriptState::SetString(ScriptEnv env, const char *name, std::string_view va
     lua_pushlstring(impl_->L, value.data(), value.size());
     lua_setfield(impl_->L, -2, name);
     lua_pop(impl_->L, 1);
+}
+
+void ScriptState::SetStringList(ScriptEnv env, const char *name, const std::vector<std::string> &values) {
+    lua_State *L = impl_->L;
+    PushEnv(env);
+    lua_createtable(L, static_cast<int>(values.size()), 1);
+    for (size_t i = 0; i < values.size(); ++i) {
+        lua_pushlstring(L, values[i].data(), values[i].size());
+        lua_rawseti(L, -2, static_cast<int>(i));
+    }
+    lua_setfield(L, -2, name);
+    lua_pop(L, 1);
 }
 
 void ScriptState::SetPointer(ScriptEnv env, const char *name, const char *ctype, void *ptr) {

@@ -30,6 +30,7 @@
 #include <memory>
 #include <string>
 #include <string_view>
+#include <vector>
 
 #include "host/core/Export.h"
 
@@ -82,6 +83,8 @@ public:
     /// Globals of an environment.
     void SetNumber(ScriptEnv env, const char *name, double value);
     void SetString(ScriptEnv env, const char *name, std::string_view value);
+    /// Sets `name` to a table of texts: values[0] at index 0, the others from 1 on (a script's `arg`).
+    void SetStringList(ScriptEnv env, const char *name, const std::vector<std::string> &values);
     /// Sets `name` to a cdata pointer of C type `ctype` ("Image *", "int32_t *"); null sets nil. The
     /// script keeps the pointer: the caller sets it to null before the object goes away.
     void SetPointer(ScriptEnv env, const char *name, const char *ctype, void *ptr);

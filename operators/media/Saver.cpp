@@ -14,6 +14,9 @@
 #include "host/image/NewImage.h"
 #include "host/media/ImageFormatList.h"
 #include "host/media/OutputFile.h"
+#include "host/script/ScriptClasses.h"
+#include "host/script/ScriptPermission.h"
+#include "host/script/ScriptState.h"
 #include "operators/frame/IdChoices.h"
 #include "operators/frame/Registration.h"
 
@@ -166,6 +169,14 @@ Saver::Saver(const Registry *reg, const ScriptVal &args, const TagList &tags) : 
                                    {InputMinAllowed, 0.0},
                                    {InputMaxAllowed, 1.0}});
 
+    AddControlPageTagList("Common", {});
+    inFrameScript_ = AddInputTagList("Frame Saved Script", "FrameSavedScript",
+                                     {{LinkDataType, CLSID_DataType_Text},
+                                      {InputControl, CLSID_InputControl_TextEdit},
+                                      {TextEditLanguage, "lua"},
+                                      {ControlKindValue, 8},
+                                      {InputExternal, 0}});
+
     AddControlPageTagList("Format", {});
     inInput_ =
         AddInputTagList("Input", "Input", {{LinkDataType, CLSID_DataType_Image}, {LinkMain, 1}, {InputRequired, 1}});
@@ -242,6 +253,7 @@ void Saver::NotifyChanged(Input *in, Parameter *param, double time, TagList *tag
 void Saver::OnStartRender() {
     firstFrame_ = true;
     audioWarned_ = false;
+    scriptRefused_ = false;
     // Temporary files of renders of this output that were killed.
     auto *clip = dynamic_cast<const Clip *>(inClip_->Constant().Get());
     if (clip && !clip->FileName().empty()) {
@@ -353,7 +365,8 @@ bool Saver::SaveFrame(Request *req, Ref<Image> image) {
     // A clip of the file this frame goes to.
     const SequenceName name = OutputName(t, req->GetTask());
     Clip clip(SequenceDisplayName(name));
-    clip.SetStartFrame(FileNumber(t, req->GetTask() ? req->GetTask()->startTime : -2e9));
+    const int64_t number = FileNumber(t, req->GetTask() ? req->GetTask()->startTime : -2e9);
+    clip.SetStartFrame(number);
     const OvID format = req->GetInputID(inOutputFormat_);
     if (!format.IsNull()) clip.SetSaveFormat(format);
     const bool makeFolders = req->GetInputNumber(inCreateDir_) >= 0.5;
@@ -370,7 +383,56 @@ bool Saver::SaveFrame(Request *req, Ref<Image> image) {
         return false;
     }
     if (RenderTask *task = req->GetTask()) task->NoteFileWritten(Name(), clip.FramePath(0));
+    RunFrameScript(req, number, clip.FramePath(0));
     return true;
+}
+
+void Saver::RunFrameScript(Request *req, int64_t frame, const std::string &filename) {
+    auto *text = dynamic_cast<Text *>(req->GetInputData(inFrameScript_));
+    if (!text || text->value.empty()) return;
+    if (!ScriptsAllowed()) {
+        if (!scriptRefused_) {
+            scriptRefused_ = true;
+            NoteScriptRefused();
+            GetDoc()->PrintF(req, ConsoleWarning,
+                             "%s: frame saved script not run: scripts are not allowed (use --allow-scripts)",
+                             Name().c_str());
+        }
+        return;
+    }
+    std::lock_guard<std::mutex> guard(scriptLock_);
+    OrvaneDoc *doc = GetDoc();
+    auto alert = [&](const std::string &line) {
+        doc->PrintF(req, ConsoleWarning, "%s: %s", Name().c_str(), line.c_str());
+    };
+    if (!script_) {
+        try {
+            auto state = std::make_unique<ScriptState>();
+            if (std::string error = InstallScriptClasses(*state); !error.empty()) {
+                alert("frame saved script not run: " + error);
+                return;
+            }
+            script_ = std::move(state);
+        } catch (const std::exception &) {
+            alert("frame saved script not run: out of memory");
+            return;
+        }
+    }
+    ScriptState &s = *script_;
+    s.SetAlert(alert);
+    constexpr ScriptEnv env = ScriptEnv::Trusted;
+    s.SetNumber(env, "time", req->Time());
+    s.SetNumber(env, "basetime", req->Time()); // the request's own time: frames are saved unshifted
+    s.SetPointer(env, "req", "Request *", req);
+    s.SetPointer(env, "OrvaneScriptReq", "Request *", req);
+    s.SetNumber(env, "OrvaneScriptReqFlags", req->GetFlags());
+    s.SetNumber(env, "frame", static_cast<double>(frame));
+    s.SetString(env, "filename", filename);
+    if (std::string error = s.Run(env, text->value, Name()); !error.empty())
+        alert("frame saved script failed: " + error);
+    s.SetPointer(env, "req", "Request *", nullptr);
+    s.SetPointer(env, "OrvaneScriptReq", "Request *", nullptr);
+    s.SetAlert(nullptr);
 }
 
 void Saver::Process(Request *req) {

@@ -18,8 +18,18 @@
 // written is noted on the render task. A render's start removes the
 // temporaries killed renders of the same output left.
 //
+// Frame Saved Script: Lua text run after each frame written (never after a
+// failed write), in the trusted environment of a state the tool keeps, with
+// the globals time, basetime, req and OrvaneScriptReq (the request, a
+// "Request *"), OrvaneScriptReqFlags, frame (the file's number) and
+// filename (the file written). Its failures, and what it passes to _ALERT,
+// become console lines under the tool's name. Raw scripts run only when the
+// user allowed them (host/script/ScriptPermission.h); otherwise the frame is
+// still written and the render gets one line saying the script was not run.
+//
 // Thread safety: as Operator; one request at a time per tool.
 #include <memory>
+#include <mutex>
 #include <set>
 #include <string>
 
@@ -30,6 +40,7 @@ namespace Orvane {
 
 class GamutInputs;
 class Image;
+class ScriptState;
 
 class Saver : public ThreadedOperator {
 public:
@@ -57,11 +68,14 @@ private:
     /// with `error` set when the colour space cannot be found.
     Ref<Image> GamutAndLegal(Request *req, Ref<Image> image, std::string *error);
     void AddFormatInputs(OvID format);
+    /// Runs the Frame Saved Script for the file `filename`, number `frame`, just written.
+    void RunFrameScript(Request *req, int64_t frame, const std::string &filename);
 
     Input *inClip_, *inCreateDir_, *inCreateDirNow_, *inOutputFormat_, *inSaveFrames_, *inRelative_, *inOffset_;
     Input *inProcessMode_, *inExportMode_, *inPullType_, *inFirstFrame_, *inClipping_, *inAlphaToColor_;
     Input *inSound_, *inSoundOffset_;
     Input *inVideoType_, *inAction_, *inAdjust_, *inSoftClip_;
+    Input *inFrameScript_;
     Input *inInput_;
     Output *outImage_;
     std::unique_ptr<GamutInputs> gamut_;
@@ -70,6 +84,11 @@ private:
     /// The Output Format was set to one other than the file extension names.
     bool formatChosen_ = false;
     bool firstFrame_ = true, audioWarned_ = false;
+    /// The state frame scripts run in, made at the first one.
+    std::unique_ptr<ScriptState> script_;
+    std::mutex scriptLock_;
+    /// The render was told once that the frame script may not run.
+    bool scriptRefused_ = false;
 };
 
 } // namespace Orvane

@@ -42,6 +42,7 @@
 #include "host/image/PixelConvert.h"
 #include "host/media/IOClass.h"
 #include "operators/frame/Registration.h"
+#include "operators/media/formats/ExrAttributes.h"
 #include "operators/media/formats/ExrHeaderScan.h"
 #include "operators/media/formats/ExrStreams.h"
 
