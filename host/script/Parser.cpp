@@ -3,6 +3,7 @@
 #include <fmt/format.h>
 
 #include <algorithm>
+#include <cctype>
 #include <charconv>
 #include <cmath>
 #include <numbers>
@@ -525,6 +526,35 @@ const std::string &Parser::LuaPrelude() {
                "local function _rand(a, b) if a then return a + (b - a) * _random() end return _random() end\n";
     }();
     return prelude;
+}
+
+namespace {
+bool IsWord(const std::string &s) {
+    if (s.empty() || !std::isalpha(static_cast<unsigned char>(s[0]))) return false;
+    return std::all_of(s.begin(), s.end(),
+                       [](char c) { return std::isalnum(static_cast<unsigned char>(c)) || c == '_'; });
+}
+} // namespace
+
+NameAliases InputNameAliases(const std::vector<std::string> &numberNames, const std::vector<std::string> &pointNames,
+                             bool timedForms, bool withZ) {
+    NameAliases aliases;
+    for (size_t k = 1; k <= numberNames.size(); ++k) {
+        const std::string &name = numberNames[k - 1];
+        if (!IsWord(name)) continue;
+        aliases[name] = fmt::format("n{}", k);
+        if (timedForms) aliases[name + "_at"] = fmt::format("n{}_at", k);
+    }
+    for (size_t k = 1; k <= pointNames.size(); ++k) {
+        const std::string &name = pointNames[k - 1];
+        if (!IsWord(name)) continue;
+        for (const char *axis : {"x", "y", "z"}) {
+            if (*axis == 'z' && !withZ) continue;
+            aliases[name + axis] = fmt::format("p{}{}", k, axis);
+            if (timedForms && *axis != 'z') aliases[name + axis + "_at"] = fmt::format("p{}{}_at", k, axis);
+        }
+    }
+    return aliases;
 }
 
 } // namespace Orvane

@@ -17,6 +17,7 @@
 #include <string>
 #include <string_view>
 #include <unordered_map>
+#include <vector>
 
 #include "host/core/Export.h"
 
@@ -94,6 +95,13 @@ struct ParseError {
 /// language does not know is looked up here and read as the name it stands
 /// for. Names of the language always keep their own meaning.
 using NameAliases = std::unordered_map<std::string, std::string>;
+
+/// The extra names a tool's "Name for Number/Point" fields give: numberNames[k - 1]
+/// names n<k> (and n<k>_at with `timedForms`); pointNames[k - 1] followed by x or y
+/// (and z with `withZ`) names p<k>x .. (and their _at forms). Empty names and
+/// texts that are not names (a letter, then letters, digits, '_') are skipped.
+ORVANE_API NameAliases InputNameAliases(const std::vector<std::string> &numberNames,
+                                        const std::vector<std::string> &pointNames, bool timedForms, bool withZ);
 
 class ORVANE_API Parser {
 public:

@@ -428,8 +428,15 @@ void Saver::RunFrameScript(Request *req, int64_t frame, const std::string &filen
     s.SetNumber(env, "OrvaneScriptReqFlags", req->GetFlags());
     s.SetNumber(env, "frame", static_cast<double>(frame));
     s.SetString(env, "filename", filename);
-    if (std::string error = s.Run(env, text->value, Name()); !error.empty())
-        alert("frame saved script failed: " + error);
+    // A render stopped while the script runs stops the script too.
+    int32_t abortWord = 0;
+    RenderTask *task = req->GetTask();
+    if (task) task->LinkAbortWord(&abortWord);
+    s.SetAbortWord(&abortWord);
+    const std::string error = s.Run(env, text->value, Name());
+    s.SetAbortWord(nullptr);
+    if (task) task->UnlinkAbortWord(&abortWord);
+    if (!error.empty()) alert("frame saved script failed: " + error);
     s.SetPointer(env, "req", "Request *", nullptr);
     s.SetPointer(env, "OrvaneScriptReq", "Request *", nullptr);
     s.SetAlert(nullptr);

@@ -248,6 +248,10 @@ const CustomScript &Custom::ScriptFor(Request *req, const std::array<bool, 4> &i
     };
     for (int k = 0; k < 8; ++k) take(setup_[k], in.setup[k]), take(intermediate_[k], in.intermediate[k]);
     for (int c = 0; c < kCustomChannels; ++c) take(channels_[c], in.channel[c]);
+    std::vector<std::string> numberNames(8), pointNames(4);
+    for (int k = 0; k < 8; ++k) take(numberNames_[k], numberNames[k]);
+    for (int k = 0; k < 4; ++k) take(pointNames_[k], pointNames[k]);
+    in.aliases = InputNameAliases(numberNames, pointNames, false, true);
     if (key == scriptKey_) return script_;
     script_ = GenerateCustomScript(in);
     scriptKey_ = std::move(key);

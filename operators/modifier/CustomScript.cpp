@@ -98,7 +98,7 @@ CustomScript GenerateCustomScript(const CustomScriptInput &in) {
         if (text.find_first_not_of(" \t\r\n") == std::string::npos) return std::string("0");
         std::string lua;
         ParseError error;
-        if (parser.Parse(text, context, &lua, &error)) return lua;
+        if (parser.Parse(text, context, &lua, &error, &in.aliases)) return lua;
         out.errors.push_back(fmt::format("{} expression, {}", label, error.Describe()));
         return std::string("0");
     };

@@ -24,6 +24,8 @@
 #include <string>
 #include <vector>
 
+#include "host/script/Parser.h"
+
 namespace Orvane {
 
 /// The channels the Custom tool writes, in stanza order.
@@ -64,6 +66,8 @@ struct CustomScriptInput {
     uint32_t outputChannels = 0xf;
     /// The output stores integers: colour is clamped to [0, 1] before it is written.
     bool integerOutput = false;
+    /// Extra names of the number and point inputs (the tool's name fields).
+    NameAliases aliases;
 };
 
 struct CustomScript {

@@ -43,13 +43,6 @@ std::string TextOf(const Request *req, const Input *in) {
     return text ? text->value : std::string();
 }
 
-bool IsName(const std::string &s) {
-    if (s.empty() || !std::isalpha(static_cast<unsigned char>(s[0]))) return false;
-    for (char c : s)
-        if (!std::isalnum(static_cast<unsigned char>(c)) && c != '_') return false;
-    return true;
-}
-
 bool Pressed(const Parameter *param) {
     const auto *n = dynamic_cast<const Number *>(param);
     return n && n->value >= 0.5;
@@ -168,21 +161,14 @@ template <int Axis> double Expression::InputAt(void *self, const double *args, i
 bool Expression::Prepare(Request *req) {
     const std::string texts[3] = {TextOf(req, numberExpr_), TextOf(req, pointExprX_), TextOf(req, pointExprY_)};
     std::string key;
-    NameAliases aliases;
     for (const std::string &t : texts) key += t + '\x1f';
+    std::vector<std::string> numberNames, pointNames;
     for (int k = 1; k <= kInputs; ++k) {
-        const std::string number = TextOf(req, numberName_[k - 1]), point = TextOf(req, pointName_[k - 1]);
-        key += number + '\x1f' + point + '\x1f';
-        if (IsName(number)) {
-            aliases[number] = fmt::format("n{}", k);
-            aliases[number + "_at"] = fmt::format("n{}_at", k);
-        }
-        if (IsName(point))
-            for (const char *axis : {"x", "y"}) {
-                aliases[point + axis] = fmt::format("p{}{}", k, axis);
-                aliases[point + axis + "_at"] = fmt::format("p{}{}_at", k, axis);
-            }
+        numberNames.push_back(TextOf(req, numberName_[k - 1]));
+        pointNames.push_back(TextOf(req, pointName_[k - 1]));
+        key += numberNames.back() + '\x1f' + pointNames.back() + '\x1f';
     }
+    const NameAliases aliases = InputNameAliases(numberNames, pointNames, true, false);
     if (!state_) {
         try {
             state_ = std::make_unique<ScriptState>();

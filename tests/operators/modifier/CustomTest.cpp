@@ -119,9 +119,13 @@ TEST(Custom, PixelsFollowTheExpressions) {
          [&](int x, int y) {
              return FltPixel{0, p2(x, y).G, 0, f(W)};
          }},
-        {"setup, intermediates and numbers",
+        {"setup, intermediates and numbers, one by its name",
          {one},
-         {{"Setup1", "n1 * 2"}, {"Intermediate1", "r1 + s1"}, {"RedExpression", "i1 * 2"}, {"AlphaExpression", "n2"}},
+         {{"Setup1", "n1 * 2"},
+          {"Intermediate1", "r1 + s1"},
+          {"RedExpression", "i1 * 2"},
+          {"NameforNumber2", "depth"},
+          {"AlphaExpression", "depth"}},
          {{"NumberIn1", 0.25}, {"NumberIn2", -3}},
          [&](int x, int y) {
              const FltPixel a = p1(x, y);
