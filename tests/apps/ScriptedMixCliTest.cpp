@@ -58,8 +58,8 @@ TEST(ScriptedMixExample, MixesByExpressionAndTurnsAndSizesByModifiers) {
         for (int y = 0; y < 180; ++y)
             for (int x = 0; x < 320; ++x) {
                 const FltPixel a = got->GetFlt(x, y), b = want->GetFlt(x, y);
-                worst = std::max({worst, double(std::fabs(a.R - b.R)), double(std::fabs(a.G - b.G)),
-                                  double(std::fabs(a.B - b.B))});
+                worst = std::max(
+                    {worst, double(std::fabs(a.R - b.R)), double(std::fabs(a.G - b.G)), double(std::fabs(a.B - b.B))});
             }
         EXPECT_LT(worst, 1e-5) << "frame " << frame;
     }
