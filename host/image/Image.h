@@ -172,6 +172,8 @@ public:
     /// Adds a float plane for `kind` over the data window (zeroed).
     bool AddAuxChannel(AuxChannelKind kind);
     bool HasAuxChannel(AuxChannelKind kind) const;
+    /// True when the image has any auxiliary channel.
+    bool HasAuxChannels() const { return !aux_.empty(); }
     float *AuxRow(AuxChannelKind kind, int y) const;
 
     // ---- pixel access (slow path: per call dispatch on depth) ----

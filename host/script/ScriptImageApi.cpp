@@ -37,7 +37,7 @@ const float *AuxFields(const OrvaneScriptPixel *px) { return &px->Z; }
 
 uint32_t AuxFieldsOf(const Image *img) {
     uint32_t mask = 0;
-    if (img)
+    if (img && img->HasAuxChannels())
         for (int k = 0; k < kScriptAuxFields; ++k)
             if (img->HasAuxChannel(kAuxKinds[k])) mask |= 1u << k;
     return mask;
@@ -149,12 +149,29 @@ void ovs_ImageSample(const Image *img, double x, double y, int32_t edges, Orvane
     const double wx[2] = {1 - (x - fx), x - fx}, wy[2] = {1 - (y - fy), y - fy};
     const Orvane::ImgRectI &dw = img->DataWindow();
     double sum[4 + kScriptAuxFields] = {};
+    const int64_t x0 = static_cast<int64_t>(fx), y0 = static_cast<int64_t>(fy);
+    // Float rows, all four taps inside the frame and the data window: read the rows directly.
+    if (!auxFields && img->Depth() == Orvane::DepthRGBAFlt32 && img->HasScanLineData() &&
+        (img->Frame() & dw).Contains(Orvane::ImgRectI(static_cast<int>(x0), static_cast<int>(y0),
+                                                      static_cast<int>(x0) + 2, static_cast<int>(y0) + 2))) {
+        for (int j = 0; j < 2; ++j) {
+            const auto *row = reinterpret_cast<const float *>(img->ScanLine(static_cast<int>(y0) + j)) +
+                              (x0 - dw.x0) * 4;
+            for (int i = 0; i < 2; ++i) {
+                const double w = wx[i] * wy[j];
+                if (w == 0) continue;
+                for (int c = 0; c < 4; ++c) sum[c] += w * row[i * 4 + c];
+            }
+        }
+        SetColour(out, FltPixel{float(sum[0]), float(sum[1]), float(sum[2]), float(sum[3])});
+        return;
+    }
     for (int j = 0; j < 2; ++j)
         for (int i = 0; i < 2; ++i) {
             const double w = wx[i] * wy[j];
             int mx, my;
             // Taps of weight 0 are skipped, so a whole position reads its pixel exactly.
-            if (w == 0 || !FramePixel(img, static_cast<int64_t>(fx) + i, static_cast<int64_t>(fy) + j, edges, mx, my))
+            if (w == 0 || !FramePixel(img, x0 + i, y0 + j, edges, mx, my))
                 continue;
             const FltPixel px = img->GetFlt(mx, my);
             sum[0] += w * px.R;
