@@ -152,11 +152,12 @@ void ovs_ImageSample(const Image *img, double x, double y, int32_t edges, Orvane
     const int64_t x0 = static_cast<int64_t>(fx), y0 = static_cast<int64_t>(fy);
     // Float rows, all four taps inside the frame and the data window: read the rows directly.
     if (!auxFields && img->Depth() == Orvane::DepthRGBAFlt32 && img->HasScanLineData() &&
-        (img->Frame() & dw).Contains(Orvane::ImgRectI(static_cast<int>(x0), static_cast<int>(y0),
-                                                      static_cast<int>(x0) + 2, static_cast<int>(y0) + 2))) {
+        (img->Frame() & dw)
+            .Contains(Orvane::ImgRectI(static_cast<int>(x0), static_cast<int>(y0), static_cast<int>(x0) + 2,
+                                       static_cast<int>(y0) + 2))) {
         for (int j = 0; j < 2; ++j) {
-            const auto *row = reinterpret_cast<const float *>(img->ScanLine(static_cast<int>(y0) + j)) +
-                              (x0 - dw.x0) * 4;
+            const auto *row =
+                reinterpret_cast<const float *>(img->ScanLine(static_cast<int>(y0) + j)) + (x0 - dw.x0) * 4;
             for (int i = 0; i < 2; ++i) {
                 const double w = wx[i] * wy[j];
                 if (w == 0) continue;
@@ -171,8 +172,7 @@ void ovs_ImageSample(const Image *img, double x, double y, int32_t edges, Orvane
             const double w = wx[i] * wy[j];
             int mx, my;
             // Taps of weight 0 are skipped, so a whole position reads its pixel exactly.
-            if (w == 0 || !FramePixel(img, x0 + i, y0 + j, edges, mx, my))
-                continue;
+            if (w == 0 || !FramePixel(img, x0 + i, y0 + j, edges, mx, my)) continue;
             const FltPixel px = img->GetFlt(mx, my);
             sum[0] += w * px.R;
             sum[1] += w * px.G;
@@ -220,6 +220,8 @@ void ovs_ImageFree(Orvane::Image *img) {
 } // extern "C"
 
 namespace Orvane {
+
+AuxChannelKind ScriptAuxChannel(int k) { return kAuxKinds[k]; }
 
 const OrvaneScriptApi &ScriptImageApi() {
     static const OrvaneScriptApi api{ovs_PixPtrInit,

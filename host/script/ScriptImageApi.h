@@ -117,6 +117,9 @@ struct OrvaneScriptApi {
 };
 
 namespace Orvane {
+enum class AuxChannelKind : uint8_t;
+/// The image channel behind auxiliary field `k` of a script pixel (0: Z, 1: Coverage .. 15: DisparityY).
+ORVANE_API AuxChannelKind ScriptAuxChannel(int k);
 /// The one table of the functions.
 ORVANE_API const OrvaneScriptApi &ScriptImageApi();
 /// The ffi.cdef text declaring FltPixel, Image, PixPtr, OrvaneScriptApi, and the opaque types

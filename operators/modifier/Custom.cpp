@@ -13,6 +13,7 @@
 #include "host/flow/Request.h"
 #include "host/image/Image.h"
 #include "host/image/NewImage.h"
+#include "host/script/ScriptImageApi.h"
 #include "host/script/ScriptPool.h"
 #include "operators/frame/Registration.h"
 
@@ -60,12 +61,8 @@ constexpr ExpressionRow kExpressions[kCustomChannels] = {
     {"YDisparityExpression", "Y Disparity", "dy1"},
 };
 
-/// The image's auxiliary channel behind each auxiliary output channel (from Z on).
-constexpr AuxChannelKind kAuxOfChannel[kCustomChannels - 4] = {
-    AuxChannelKind::Z,         AuxChannelKind::Coverage,    AuxChannelKind::U,           AuxChannelKind::V,
-    AuxChannelKind::NormalX,   AuxChannelKind::NormalY,     AuxChannelKind::NormalZ,     AuxChannelKind::VectorX,
-    AuxChannelKind::VectorY,   AuxChannelKind::BackVectorX, AuxChannelKind::BackVectorY, AuxChannelKind::PositionX,
-    AuxChannelKind::PositionY, AuxChannelKind::PositionZ,   AuxChannelKind::DisparityX,  AuxChannelKind::DisparityY};
+/// The image's auxiliary channel behind output channel `c` (Z and after): the script pixel's fields in order.
+AuxChannelKind AuxOfChannel(int c) { return ScriptAuxChannel(c - static_cast<int>(CustomChannel::Z)); }
 
 TagList TextTags(int page, const char *def) {
     return {{LinkDataType, CLSID_DataType_Text},
@@ -88,11 +85,6 @@ TagList CheckboxTags(int page, double def) {
 double ScriptSeed(double randomSeed) {
     const auto seed = static_cast<uint32_t>(static_cast<int64_t>(randomSeed) * int64_t{572662306});
     return static_cast<double>(seed ^ 0xe7a891f3u);
-}
-
-const char *TextOf(const Request *req, const Input *in) {
-    const auto *text = dynamic_cast<const Text *>(req->GetInputData(in));
-    return text ? text->value.c_str() : "";
 }
 
 } // namespace
@@ -139,28 +131,6 @@ Custom::Custom(const Registry *reg, const ScriptVal &args, const TagList &tags) 
 Custom::~Custom() = default;
 
 void Custom::AddVariableInputs(int page) {
-    BeginControlNestTagList("Number Controls", "NumberControls", false, {{ControlPage, page}});
-    for (int k = 1; k <= 8; ++k) {
-        showNumbers_[k - 1] = AddInputTagList(fmt::format("Show Number {}", k).c_str(),
-                                              fmt::format("ShowNumber{}", k).c_str(), CheckboxTags(page, 1.0));
-        numberNames_[k - 1] = AddInputTagList(fmt::format("Name for Number {}", k).c_str(),
-                                              fmt::format("NameforNumber{}", k).c_str(), [&] {
-                                                  TagList t = TextTags(page, "");
-                                                  t.Set({InputNotify, 1});
-                                                  return t;
-                                              }());
-    }
-    EndControlNest();
-    BeginControlNestTagList("Point Controls", "PointControls", false, {{ControlPage, page}});
-    for (int k = 1; k <= 4; ++k) {
-        showPoints_[k - 1] = AddInputTagList(fmt::format("Show Point {}", k).c_str(),
-                                             fmt::format("ShowPoint{}", k).c_str(), CheckboxTags(page, 1.0));
-        TagList name = TextTags(page, "");
-        name.Set({InputNotify, 1});
-        pointNames_[k - 1] = AddInputTagList(fmt::format("Name for Point {}", k).c_str(),
-                                             fmt::format("NameforPoint{}", k).c_str(), name);
-    }
-    EndControlNest();
     for (int k = 1; k <= 8; ++k)
         numbers_[k - 1] = AddInputTagList(fmt::format("Number In {}", k).c_str(), fmt::format("NumberIn{}", k).c_str(),
                                           {{LinkDataType, CLSID_DataType_Number},
@@ -176,6 +146,8 @@ void Custom::AddVariableInputs(int page) {
                                           {ControlPage, page},
                                           {InputDefaultX, 0.5},
                                           {InputDefaultY, 0.5}});
+    numberFields_.Add(this, "Number", {numbers_.begin(), numbers_.end()}, page);
+    pointFields_.Add(this, "Point", {points_.begin(), points_.end()}, page);
     BeginControlNestTagList("LUT Controls", "LUTControlsNest", false, {{ControlPage, page}});
     for (int k = 1; k <= 4; ++k) {
         editLuts_[k - 1] = AddInputTagList(fmt::format("Edit LUT In {}", k).c_str(),
@@ -201,32 +173,14 @@ void Custom::AddExpressionInputs() {
 }
 
 void Custom::NotifyChanged(Input *in, Parameter *param, double time, TagList *tags) {
-    auto number = [&] { return param ? dynamic_cast<Number *>(param) : nullptr; };
-    auto text = [&] { return param ? dynamic_cast<Text *>(param) : nullptr; };
-    for (int k = 0; k < 8; ++k) {
-        if (in == showNumbers_[k] && number()) numbers_[k]->SetAttrsTagList({{ControlVisible, number()->value >= 0.5}});
-        if (in == numberNames_[k] && text()) {
-            const std::string label = fmt::format("Number In {}", k + 1);
-            numbers_[k]->SetAttrsTagList(
-                {{ControlLabel,
-                  text()->value.empty() ? label.c_str() : fmt::format("{}: {}", label, text()->value).c_str()}});
-        }
-    }
-    for (int k = 0; k < 4; ++k) {
-        if (in == showPoints_[k] && number()) points_[k]->SetAttrsTagList({{ControlVisible, number()->value >= 0.5}});
-        if (in == pointNames_[k] && text()) {
-            const std::string label = fmt::format("Point In {}", k + 1);
-            points_[k]->SetAttrsTagList(
-                {{ControlLabel,
-                  text()->value.empty() ? label.c_str() : fmt::format("{}: {}", label, text()->value).c_str()}});
-        }
-        if (in == editLuts_[k] && number())
+    const auto *number = dynamic_cast<const Number *>(param);
+    numberFields_.Notify(in, param) || pointFields_.Notify(in, param);
+    for (int k = 0; k < 4; ++k)
+        if (in == editLuts_[k] && number)
             editLuts_[k]->SetAttrsTagList({{ControlLabel, fmt::format("Edit {}", luts_[k]->Name()).c_str()}});
-    }
-    if (in == reseed_ && number() && number()->value != 0) {
-        // A fixed step through the seed range, so that reseeding repeats.
+    if (in == reseed_ && number && number->value != 0) {
         const auto *current = dynamic_cast<const Number *>(randomSeed_->Constant().Get());
-        randomSeed_->SetValue(MakeRef<Number>(std::fmod((current ? current->value : 0.0) + 7919.0, 32768.0)));
+        randomSeed_->SetValue(MakeRef<Number>(NewRandomSeed(current ? current->value : -1)));
     }
     ThreadedOperator::NotifyChanged(in, param, time, tags);
 }
@@ -234,7 +188,7 @@ void Custom::NotifyChanged(Input *in, Parameter *param, double time, TagList *ta
 const CustomScript &Custom::ScriptFor(Request *req, const std::array<bool, 4> &images, const Image &out) {
     uint32_t channels = 0xf;
     for (int c = 4; c < kCustomChannels; ++c)
-        if (out.HasAuxChannel(kAuxOfChannel[c - 4])) channels |= 1u << c;
+        if (out.HasAuxChannel(AuxOfChannel(c))) channels |= 1u << c;
     CustomScriptInput in;
     in.images = images;
     in.outputChannels = channels;
@@ -248,9 +202,9 @@ const CustomScript &Custom::ScriptFor(Request *req, const std::array<bool, 4> &i
     };
     for (int k = 0; k < 8; ++k) take(setup_[k], in.setup[k]), take(intermediate_[k], in.intermediate[k]);
     for (int c = 0; c < kCustomChannels; ++c) take(channels_[c], in.channel[c]);
-    std::vector<std::string> numberNames(8), pointNames(4);
-    for (int k = 0; k < 8; ++k) take(numberNames_[k], numberNames[k]);
-    for (int k = 0; k < 4; ++k) take(pointNames_[k], pointNames[k]);
+    const std::vector<std::string> numberNames = numberFields_.Names(req), pointNames = pointFields_.Names(req);
+    for (const std::string &name : numberNames) key += '\x1f' + name;
+    for (const std::string &name : pointNames) key += '\x1f' + name;
     in.aliases = InputNameAliases(numberNames, pointNames, false, true);
     if (key == scriptKey_) return script_;
     script_ = GenerateCustomScript(in);
@@ -335,7 +289,7 @@ void Custom::Process(Request *req) {
     }
     bool ok = out->AllocScanLineData();
     for (int c = 4; ok && like && c < kCustomChannels; ++c)
-        if (like->HasAuxChannel(kAuxOfChannel[c - 4])) ok = out->AddAuxChannel(kAuxOfChannel[c - 4]);
+        if (like->HasAuxChannel(AuxOfChannel(c))) ok = out->AddAuxChannel(AuxOfChannel(c));
     if (!ok) {
         FailOutOfMemory(req);
         req->SetOutputData(output_, nullptr);

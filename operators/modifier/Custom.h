@@ -29,6 +29,7 @@
 #include "host/color/SplineCurve.h"
 #include "host/flow/Operator.h"
 #include "operators/modifier/CustomScript.h"
+#include "operators/modifier/VariableFields.h"
 
 namespace Orvane {
 
@@ -57,8 +58,9 @@ private:
     const CustomScript &ScriptFor(Request *req, const std::array<bool, 4> &images, const Image &out);
     void SetFrameGlobals(ScriptState &state, Request *req, const std::array<Image *, 4> &images, Image *out);
 
-    std::array<Input *, 8> numbers_{}, showNumbers_{}, numberNames_{};
-    std::array<Input *, 4> points_{}, showPoints_{}, pointNames_{};
+    std::array<Input *, 8> numbers_{};
+    std::array<Input *, 4> points_{};
+    VariableFields numberFields_, pointFields_;
     std::array<Input *, 4> luts_{}, editLuts_{};
     std::array<Input *, 8> setup_{}, intermediate_{};
     std::array<Input *, kCustomChannels> channels_{};

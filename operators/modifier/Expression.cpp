@@ -6,7 +6,6 @@
 #include <cmath>
 #include <cstring>
 #include <new>
-#include <random>
 
 #include "host/core/Tags.h"
 #include "host/flow/DataTypes.h"
@@ -17,6 +16,7 @@
 #include "host/script/ScriptState.h"
 #include "operators/frame/Registration.h"
 #include "operators/modifier/Modifier.h"
+#include "operators/modifier/VariableFields.h"
 
 namespace Orvane {
 
@@ -36,11 +36,6 @@ TagList Page(const char *icon) { return {{PageIcon, static_cast<const void *>(ic
 
 TagList TextTags() {
     return {{LinkDataType, CLSID_DataType_Text}, {InputControl, CLSID_InputControl_TextEdit}, {InputDefaultText, ""}};
-}
-
-std::string TextOf(const Request *req, const Input *in) {
-    const auto *text = dynamic_cast<const Text *>(req->GetInputData(in));
-    return text ? text->value : std::string();
 }
 
 bool Pressed(const Parameter *param) {
@@ -100,28 +95,8 @@ Expression::Expression(const Registry *reg, const ScriptVal &args, const TagList
                                   {InputNotify, 1},
                                   {InputInitialNotify, 0},
                                   {InputPassive, 1}});
-    const TagList show{{LinkDataType, CLSID_DataType_Number},
-                       {InputControl, CLSID_InputControl_Checkbox},
-                       {InputMinAllowed, 0.0},
-                       {InputMaxAllowed, 1.0},
-                       {InputDefault, 1.0},
-                       {InputExternal, 0},
-                       {InputNotify, 1},
-                       {InputPassive, 1}};
-    // Per input kind, a fold of the name and show fields: "Name for Number 1", "ShowNumber1" ...
-    auto fields = [&](const char *kind, Input **names, Input **shows) {
-        BeginControlNestTagList(fmt::format("{} Controls", kind).c_str(), fmt::format("{}Controls", kind).c_str(),
-                                false, {});
-        for (int k = 1; k <= kInputs; ++k) {
-            names[k - 1] = AddInputTagList(fmt::format("Name for {} {}", kind, k).c_str(),
-                                           fmt::format("Namefor{}{}", kind, k).c_str(), TextTags());
-            shows[k - 1] = AddInputTagList(fmt::format("Show {} {}", kind, k).c_str(),
-                                           fmt::format("Show{}{}", kind, k).c_str(), show);
-        }
-        EndControlNest();
-    };
-    fields("Number", numberName_, showNumber_);
-    fields("Point", pointName_, showPoint_);
+    numberFields_.Add(this, "Number", {numberIn_, numberIn_ + kInputs});
+    pointFields_.Add(this, "Point", {pointIn_, pointIn_ + kInputs});
 
     numberResult_ = AddOutputTagList("Number Result", "NumberResult", {{LinkDataType, CLSID_DataType_Number}});
     pointResult_ = AddOutputTagList("Point Result", "PointResult", {{LinkDataType, CLSID_DataType_Point}});
@@ -134,17 +109,9 @@ void Expression::NotifyChanged(Input *in, Parameter *param, double time, TagList
         // A new seed, never the one in use, so that every press changes the draws.
         const Ref<Parameter> current = randomSeed_->ValueAt(time);
         const auto *old = dynamic_cast<const Number *>(current.Get());
-        std::random_device device;
-        int seed = static_cast<int>(device() % (kMaxSeed + 1));
-        if (old && seed == static_cast<int>(old->value)) seed = (seed + 1) % (kMaxSeed + 1);
-        randomSeed_->SetValue(MakeRef<Number>(seed));
+        randomSeed_->SetValue(MakeRef<Number>(NewRandomSeed(old ? old->value : -1)));
     }
-    for (int k = 0; k < kInputs; ++k) {
-        const auto *n = dynamic_cast<const Number *>(param);
-        if (!n) break;
-        if (in == showNumber_[k]) numberIn_[k]->SetAttrsTagList({{ControlVisible, n->value >= 0.5 ? 1 : 0}});
-        if (in == showPoint_[k]) pointIn_[k]->SetAttrsTagList({{ControlVisible, n->value >= 0.5 ? 1 : 0}});
-    }
+    numberFields_.Notify(in, param) || pointFields_.Notify(in, param);
     ThreadedOperator::NotifyChanged(in, param, time, tags);
 }
 
@@ -162,12 +129,8 @@ bool Expression::Prepare(Request *req) {
     const std::string texts[3] = {TextOf(req, numberExpr_), TextOf(req, pointExprX_), TextOf(req, pointExprY_)};
     std::string key;
     for (const std::string &t : texts) key += t + '\x1f';
-    std::vector<std::string> numberNames, pointNames;
-    for (int k = 1; k <= kInputs; ++k) {
-        numberNames.push_back(TextOf(req, numberName_[k - 1]));
-        pointNames.push_back(TextOf(req, pointName_[k - 1]));
-        key += numberNames.back() + '\x1f' + pointNames.back() + '\x1f';
-    }
+    const std::vector<std::string> numberNames = numberFields_.Names(req), pointNames = pointFields_.Names(req);
+    for (int k = 0; k < kInputs; ++k) key += numberNames[k] + '\x1f' + pointNames[k] + '\x1f';
     const NameAliases aliases = InputNameAliases(numberNames, pointNames, true, false);
     if (!state_) {
         try {

@@ -16,6 +16,7 @@
 #include <string>
 
 #include "host/flow/Operator.h"
+#include "operators/modifier/VariableFields.h"
 
 namespace Orvane {
 
@@ -41,7 +42,7 @@ private:
     template <int Axis> static double InputAt(void *self, const double *args, int count);
 
     Input *numberIn_[kInputs], *pointIn_[kInputs];
-    Input *numberName_[kInputs], *pointName_[kInputs], *showNumber_[kInputs], *showPoint_[kInputs];
+    VariableFields numberFields_, pointFields_;
     Input *numberExpr_, *pointExprX_, *pointExprY_, *randomSeed_, *randomize_;
     Output *numberResult_, *pointResult_;
 
