@@ -13,6 +13,7 @@
 
 #include "host/color/SplineCurve.h"
 #include "host/core/Parallel.h"
+#include "host/core/Tags.h"
 #include "host/flow/Engine.h"
 #include "host/flow/OrvaneDoc.h"
 #include "host/flow/RenderTask.h"
@@ -191,18 +192,27 @@ TEST(Custom, IntegerOutputClampsAndAuxiliaryChannelsFollow) {
         },
         0.5 / 255 + 1e-6, "8-bit output");
 
+    // A proxy at half size (full width 2 W, proxy factor 0.5): what an expression writes to a vector channel is
+    // divided by the factor, so "vx1 + 1" gives (v + 1) * 2.
     Ref<Image> withZ = Support::PatternImage(W, H, DepthRGBAFlt32, 6);
-    ASSERT_TRUE(withZ->AddAuxChannel(AuxChannelKind::Z));
+    withZ->SetAttrsTagList({{ImgFullWidth, 2 * W}, {ImgFullHeight, 2 * H}});
+    ASSERT_TRUE(withZ->AddAuxChannel(AuxChannelKind::Z) && withZ->AddAuxChannel(AuxChannelKind::VectorX));
     for (int y = 0; y < H; ++y)
-        for (int x = 0; x < W; ++x) withZ->AuxRow(AuxChannelKind::Z, y)[x] = float(x * 100 + y);
+        for (int x = 0; x < W; ++x) {
+            withZ->AuxRow(AuxChannelKind::Z, y)[x] = float(x * 100 + y);
+            withZ->AuxRow(AuxChannelKind::VectorX, y)[x] = float(x - y);
+        }
     CustomRig aux({withZ});
     Support::SetText(aux.tool, "ZExpression", "z1 * 2 + getz1b(x + 1/w, y)");
+    Support::SetText(aux.tool, "XVectorExpression", "vx1 + 1");
     const Ref<Image> zOut = aux.Render();
-    ASSERT_TRUE(zOut && zOut->HasAuxChannel(AuxChannelKind::Z));
+    ASSERT_TRUE(zOut && zOut->HasAuxChannel(AuxChannelKind::Z) && zOut->HasAuxChannel(AuxChannelKind::VectorX));
     for (int y = 0; y < H; ++y)
-        for (int x = 0; x < W; ++x)
+        for (int x = 0; x < W; ++x) {
             ASSERT_EQ(zOut->AuxRow(AuxChannelKind::Z, y)[x], 2.f * (x * 100 + y) + (x + 1 < W ? (x + 1) * 100 + y : 0))
                 << x << "," << y;
+            ASSERT_EQ(zOut->AuxRow(AuxChannelKind::VectorX, y)[x], (float(x - y) + 1) * 2) << x << "," << y;
+        }
 }
 
 TEST(Custom, NoiseRepeatsAtAnyWorkerCountAndFollowsTheSeed) {
