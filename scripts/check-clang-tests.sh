@@ -8,7 +8,7 @@ set -euo pipefail
 cd "$(dirname "$0")/.."
 jobs="${ORVANE_JOBS:-2}"
 # shellcheck disable=SC2207 # pkg-config's flags are words
-flags=(-fsyntax-only -std=c++20 -I. $(pkg-config --cflags luajit) -DORVANE_HAVE_CUDA -DORVANE_HAVE_OPENCL -DGTEST_HAS_PTHREAD=1
+flags=(-fsyntax-only -std=c++20 -I. $(pkg-config --cflags luajit OpenEXR) -DORVANE_HAVE_CUDA -DORVANE_HAVE_OPENCL -DGTEST_HAS_PTHREAD=1
        "-DORVANE_SOURCE_DIR=\"$PWD\"" "-DORVANE_BINARY_DIR=\"$PWD/build/bin\"")
 failed=$(find tests -name '*.cpp' -not -path 'tests/fuzz/*' | sort |
   xargs -P "$jobs" -I{} sh -c 'clang++ "$@" {} >/dev/null 2>&1 || echo {}' sh "${flags[@]}")
