@@ -73,8 +73,12 @@ void Operator::FinishConstruction() {
     // the mask; their clipping mode bounds the soft edge.
     const uint32_t kind = GetRegistry() ? static_cast<uint32_t>(GetRegistry()->Tags().GetLong(RegTypeFlags, 0)) : 0;
     const bool maskTool = (kind & (RegKindOperator | RegKindMask)) == (RegKindOperator | RegKindMask);
-    const bool blend = !RegAttrB(RegNoBlendControls) && !maskTool;
-    const bool mask = !RegAttrB(RegNoEffectMask);
+    // Blend, channel switches and the effect mask act on images: a tool whose outputs are numbers or points (a
+    // modifier) has none.
+    const bool imageOutput = std::any_of(Outputs().begin(), Outputs().end(),
+                                         [](const auto &out) { return IsImageDataType(out->DataType()); });
+    const bool blend = imageOutput && !RegAttrB(RegNoBlendControls) && !maskTool;
+    const bool mask = imageOutput && !RegAttrB(RegNoEffectMask);
     const Input *mainIn = FindMainInput(1);
     const bool clipping = (maskTool || (mainIn && mainIn->DataType() == CLSID_DataType_Image)) &&
                           RegAttrB(RegSupportsDoD) && !FindInput("ClippingMode");

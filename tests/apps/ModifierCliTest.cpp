@@ -37,6 +37,9 @@ TEST(ModifierCli, EvalPrintsModifierValuesAndDescribeListsTheOperations) {
     EXPECT_NE(describe.out.find("\"Divide   (First / Second)\" (3), \"Divide   (Second / First)\" (4)"),
               std::string::npos)
         << describe.out;
+    // A modifier makes a number: no blend, channel switches or effect mask, which act on images.
+    EXPECT_EQ(describe.out.find("Blend"), std::string::npos) << describe.out;
+    EXPECT_EQ(describe.out.find("EffectMask"), std::string::npos) << describe.out;
 }
 
 } // namespace
