@@ -36,8 +36,10 @@ constexpr int kCoarseSpan = 24;
 /// Coarse levels keep at least this many pattern pixels per side.
 constexpr int kMinCoarsePattern = 6;
 constexpr int kRefineIterations = 12;
-/// BestMatch: the pattern is taken again once a step matches this much worse than the best since it was taken.
-constexpr double kBestMatchFactor = 2.0, kBestMatchSlack = 0.002;
+/// BestMatch: the pattern is taken again once a step matches this much worse than the best since it was taken,
+/// or once its fitted turn or scale has left the pattern's by kBestMatchShape (about 6 degrees or 10 %), before
+/// the whole-pixel search, which does not turn the pattern, loses it.
+constexpr double kBestMatchFactor = 2.0, kBestMatchSlack = 0.002, kBestMatchShape = 0.1;
 
 constexpr double kLumR = 0.2126, kLumG = 0.7152, kLumB = 0.0722;
 
@@ -345,7 +347,9 @@ TrackResult TrackPoint::Track(const Image *img, double time, double x, double y,
     case TrackSettings::Adaptive::None: break;
     case TrackSettings::Adaptive::EveryFrame: retake = !weak; break;
     case TrackSettings::Adaptive::BestMatch:
-        retake = !weak && result.match > kBestMatchFactor * s.bestSinceTaken + kBestMatchSlack;
+        retake = !weak && (result.match > kBestMatchFactor * s.bestSinceTaken + kBestMatchSlack ||
+                           std::max({std::abs(fit.m00 - 1.0), std::abs(fit.m01), std::abs(fit.m10),
+                                     std::abs(fit.m11 - 1.0)}) > kBestMatchShape);
         s.bestSinceTaken = std::min(s.bestSinceTaken, result.match);
         break;
     }
