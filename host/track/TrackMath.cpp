@@ -258,7 +258,7 @@ Placement Refine(const Plane &plane, const Pattern &pat, int qx, int qy, const P
             at.m11 += b[7];
         }
         if (!Plausible(at)) return failed;
-        if (std::abs(b[0]) < 1e-4 && std::abs(b[1]) < 1e-4) break;
+        if (std::abs(b[0]) < 1e-3 && std::abs(b[1]) < 1e-3) break;
     }
     at.ncc = SampledNcc(plane, pat, qx, qy, at);
     return at;

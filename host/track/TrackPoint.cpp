@@ -35,7 +35,7 @@ constexpr int kCoarsePeaks = 3;
 constexpr int kCoarseSpan = 24;
 /// Coarse levels keep at least this many pattern pixels per side.
 constexpr int kMinCoarsePattern = 6;
-constexpr int kRefineIterations = 12;
+constexpr int kRefineIterations = 6;
 /// BestMatch: the pattern is taken again once a step matches this much worse than the best since it was taken,
 /// or once its fitted turn or scale has left the pattern's by kBestMatchShape (about 6 degrees or 10 %), before
 /// the whole-pixel search, which does not turn the pattern, loses it.
@@ -148,7 +148,6 @@ struct TrackPoint::State {
     double centreX = 0.0, centreY = 0.0; ///< normalised, as last set
     double width = 0.0, height = 0.0;    ///< normalised pattern size
     double searchW = 0.0, searchH = 0.0; ///< normalised; 0: twice the pattern
-    double time = 0.0;
     Pattern pattern;                     ///< whole pixels of the image it came from
     double offsetX = 0.0, offsetY = 0.0; ///< the point minus the pattern's grid centre, in pixels
     double bestSinceTaken = std::numeric_limits<double>::infinity();
@@ -186,10 +185,11 @@ struct TrackPoint::State {
         pattern.w = PixelSide(width, W);
         pattern.h = PixelSide(height, H);
         const double sx = x * W - 0.5, sy = y * H - 0.5;
+        if (!(std::abs(sx) < 1e8 && std::abs(sy) < 1e8) || img.IsNoData()) return false;
         int gx, gy;
         GridOrigin(sx, sy, gx, gy);
         const ImgRectI rect(gx, gy, gx + pattern.w, gy + pattern.h);
-        if (!std::isfinite(sx) || !std::isfinite(sy) || !img.Frame().Contains(rect) || img.IsNoData()) return false;
+        if (!img.Frame().Contains(rect)) return false;
         Plane plane;
         ReadChannel(img, rect, channel, plane);
         return Take(plane, gx, gy, sx, sy);
@@ -219,7 +219,7 @@ bool TrackPoint::SetPattern(const Image *img, double x, double y, double width, 
     s.centreY = y;
     s.width = width;
     s.height = height;
-    s.time = time;
+    (void)time; // a pattern is pixels: when it was taken does not change how it is found
     s.invalid = false;
     s.hasPattern = img && s.TakeFromImage(*img, x, y);
     return s.hasPattern;
@@ -247,9 +247,11 @@ ImgRectI TrackPoint::GetSearchRect(int width, int height, double x, double y) co
     const State &s = *state_;
     const int pw = s.hasPattern ? s.pattern.w : PixelSide(s.width, width);
     const int ph = s.hasPattern ? s.pattern.h : PixelSide(s.height, height);
-    const int rx = Travel(PixelSide(s.SearchW(), width), pw), ry = Travel(PixelSide(s.SearchH(), height), ph);
+    // Travel beyond the image's size finds nothing more, and would only make the area huge.
+    const int rx = std::min(Travel(PixelSide(s.SearchW(), width), pw), width);
+    const int ry = std::min(Travel(PixelSide(s.SearchH(), height), ph), height);
     const double sx = x * width - 0.5 - s.offsetX, sy = y * height - 0.5 - s.offsetY;
-    if (!std::isfinite(sx) || !std::isfinite(sy) || std::abs(sx) > 1e8 || std::abs(sy) > 1e8) return ImgRectI();
+    if (!(std::abs(sx) < 1e8 && std::abs(sy) < 1e8)) return ImgRectI();
     const int gx = static_cast<int>(std::lround(sx - 0.5 * (pw - 1)));
     const int gy = static_cast<int>(std::lround(sy - 0.5 * (ph - 1)));
     return ImgRectI(gx - rx - kMargin, gy - ry - kMargin, gx + pw + rx + kMargin, gy + ph + ry + kMargin);
@@ -273,12 +275,14 @@ TrackResult TrackPoint::Track(const Image *img, double time, double x, double y,
 
     const int W = img->Width(), H = img->Height();
     const Pattern &pat = s.pattern;
-    const ImgRectI area = GetSearchRect(W, H, x, y);
-    if (area.IsNull()) return result;
-    // Offsets of the pattern's origin, in image pixels: inside the search area and the image.
-    const int ox0 = std::max(area.x0 + kMargin, 0), ox1 = std::min(area.x1 - kMargin - pat.w, W - pat.w);
-    const int oy0 = std::max(area.y0 + kMargin, 0), oy1 = std::min(area.y1 - kMargin - pat.h, H - pat.h);
+    const ImgRectI search = GetSearchRect(W, H, x, y);
+    if (search.IsNull()) return result;
+    // Offsets of the pattern's origin, in image pixels: inside the search area and the image. What is read is
+    // those and the margin around them.
+    const int ox0 = std::max(search.x0 + kMargin, 0), ox1 = std::min(search.x1 - kMargin - pat.w, W - pat.w);
+    const int oy0 = std::max(search.y0 + kMargin, 0), oy1 = std::min(search.y1 - kMargin - pat.h, H - pat.h);
     if (ox1 < ox0 || oy1 < oy0) return result;
+    const ImgRectI area(ox0 - kMargin, oy0 - kMargin, ox1 + pat.w + kMargin, oy1 + pat.h + kMargin);
 
     // Level 0 is the search area read from the image; each further level halves it.
     s.levels.resize(1);
