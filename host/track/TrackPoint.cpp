@@ -1,7 +1,8 @@
 // The pattern matcher: zero-mean normalised cross-correlation over every
 // integer offset of the search area (coarse to fine on a pyramid when the
 // area is large), then a sub-pixel fit of the correlation peak refined by
-// Gauss-Newton steps on the cubic-interpolated image with a gain and an
+// Gauss-Newton steps on the cubic-interpolated image: a translation, a 2 x 2
+// linear part that follows mild turns and scale changes, and a gain and an
 // offset, so brightness and contrast changes do not move the answer.
 //
 // Pixel coordinates here are "sample" coordinates: sample (i, j) is the
