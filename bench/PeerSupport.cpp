@@ -73,6 +73,8 @@ double VipsCopySeconds() {
 
 } // namespace
 
+int CapturePeer(const std::string &command, std::string &output) { return Capture(command, output); }
+
 bool PeerAvailable(const char *program) {
     std::string out;
     return Capture(std::string("command -v ") + program, out) == 0;

@@ -22,6 +22,8 @@ bool PeerAvailable(const char *program);
 const std::string &PeerUHDFrame(const char *ext);
 /// A temporary output path with the given extension, removed at exit.
 std::string PeerOutput(const char *ext);
+/// Runs a shell command, giving its exit status and what it printed (stdout and stderr).
+int CapturePeer(const std::string &command, std::string &output);
 /// Wall seconds of a shell command, negative when it failed.
 double RunPeerSeconds(const std::string &command);
 

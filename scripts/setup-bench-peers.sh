@@ -1,7 +1,8 @@
 #!/usr/bin/env bash
-# Installs the Debian packages of the open programs that only the keying
-# quality comparison runs beside ours (scripts/key-quality.sh): Blender, whose
-# compositor has a keying node. Not needed to build, test or render; safe to
-# run again.
+# Installs the Debian packages of the open programs that only the quality
+# comparisons run beside ours: Blender, whose compositor has a keying node
+# (scripts/key-quality.sh), and OpenCV's Python module, whose pyramidal
+# Lucas-Kanade tracker runs beside the pattern matcher (bench/TrackBench.cpp).
+# Not needed to build, test or render; safe to run again.
 set -euo pipefail
-exec "$(dirname "$0")/setup-deps.sh" blender
+exec "$(dirname "$0")/setup-deps.sh" blender python3-opencv
