@@ -1,0 +1,416 @@
+#include "operators/track/TrackerDeluxe.h"
+
+#include <algorithm>
+#include <cmath>
+#include <cstdarg>
+#include <string>
+
+#include "host/core/Tags.h"
+#include "host/flow/ControlCommand.h"
+#include "host/flow/DataTypes.h"
+#include "host/flow/Engine.h"
+#include "host/flow/InputValue.h"
+#include "host/flow/OrvaneDoc.h"
+#include "host/flow/RenderTask.h"
+#include "host/flow/Request.h"
+#include "host/image/Image.h"
+#include "operators/frame/Registration.h"
+
+namespace Orvane {
+
+static const OvID CLSID_TrackerDeluxe("Tracker");
+static ClassRegistration<TrackerDeluxe, ThreadedOperator> s_Registration(CLSID_TrackerDeluxe, &CLSID_ThreadedOperator,
+                                                                         {{RegTypeFlags, RegKindOperator | RegKindTool},
+                                                                          {RegClassName, "TrackerDeluxe"},
+                                                                          {RegPath, "Tools/Tracking/Tracker"},
+                                                                          {RegName, "Tracker"},
+                                                                          {RegCategory, "Tracking"},
+                                                                          {RegAbbreviation, "Tra"},
+                                                                          {RegAlias, "Stabilize"},
+                                                                          {RegHelp, "Plenty of trackers"},
+                                                                          {RegIcon, "Icons.Tools.Icons.TrackerDeluxe"},
+                                                                          {RegNoAutoProxy, 1},
+                                                                          {RegUnpredictable, 1},
+                                                                          {RegSupportsRoI, 1},
+                                                                          {RegSupportsDoD, 1},
+                                                                          {RegKeepsTimeState, 1},
+                                                                          {RegOwnCacheValidity, 1}});
+
+namespace {
+
+enum Operation { OpNone, OpMatchMove, OpCorner, OpPerspective };
+enum PivotType { PivotAverage, PivotSelected, PivotManual };
+enum Reference { RefSelectTime, RefStart, RefStartEnd, RefEnd };
+
+TagList Choice(int page, std::initializer_list<const char *> items, double def, OvID control) {
+    TagList tags{{LinkDataType, CLSID_DataType_Number},
+                 {InputControl, control},
+                 {ControlPage, page},
+                 {InputInteger, 1},
+                 {InputMinAllowed, 0.0},
+                 {InputMaxAllowed, static_cast<double>(items.size() - 1)},
+                 {InputDefault, def},
+                 {InputNotify, 1}};
+    for (const char *item : items) tags.Add({ListAddItem, item});
+    return tags;
+}
+
+TagList Checkbox(int page, double def) {
+    return {{LinkDataType, CLSID_DataType_Number},
+            {InputControl, CLSID_InputControl_Checkbox},
+            {ControlPage, page},
+            {InputDefault, def}};
+}
+
+TagList Slider(int page, double low, double high, double def, TagList extra = {}) {
+    TagList tags{{LinkDataType, CLSID_DataType_Number},
+                 {InputControl, CLSID_InputControl_Slider},
+                 {ControlPage, page},
+                 {InputSliderLow, low},
+                 {InputSliderHigh, high},
+                 {InputDefault, def}};
+    tags.Merge(extra);
+    return tags;
+}
+
+std::vector<int> NumbersOf(const Parameter *value) {
+    std::vector<int> numbers;
+    const auto *table = dynamic_cast<const ScriptValue *>(value);
+    if (!table || !table->value.IsTable()) return numbers;
+    for (const auto &[key, v] : table->value.Entries()) {
+        if (!v.IsNumber()) continue;
+        const int n = static_cast<int>(std::floor(v.AsNumber() + 0.5));
+        if (n > 0 && std::find(numbers.begin(), numbers.end(), n) == numbers.end()) numbers.push_back(n);
+    }
+    return numbers;
+}
+
+int Whole(const Parameter *p, int def) {
+    const auto *n = dynamic_cast<const Number *>(p);
+    return n ? static_cast<int>(std::lround(n->value)) : def;
+}
+
+} // namespace
+
+TrackerDeluxe::TrackerDeluxe(const Registry *reg, const ScriptVal &args, const TagList &tags)
+    : ThreadedOperator(reg, args, tags), shared_(this) {
+    trackersPage_ = shared_.Page();
+    trackerList_ = AddInputTagList("Tracker List", "TrackerList",
+                                   {{LinkDataType, CLSID_DataType_ScriptVal},
+                                    {InputControl, CLSID_InputControl_CheckList},
+                                    {ControlPage, trackersPage_},
+                                    {ControlVisible, 0},
+                                    {InputExternal, 0},
+                                    {InputNotify, 1}});
+    input_ = AddInputTagList("Input", "Input",
+                             {{LinkDataType, CLSID_DataType_Image}, {LinkMain, 1}, {ImageFromRequestOK, 1}});
+    foreground_ = AddInputTagList("Foreground", "Foreground",
+                                  {{LinkDataType, CLSID_DataType_Image},
+                                   {LinkSecondDataType, CLSID_DataType_TransformMatrix},
+                                   {LinkMain, 2},
+                                   {InputRequired, 0},
+                                   {ImageForeground, 1}});
+
+    operationPage_ =
+        AddControlPageTagList("Operation", {{PageIcon, static_cast<const void *>("Icons.Tools.Tabs.Operation")}});
+    operation_ =
+        AddInputTagList("Operation", "Operation",
+                        Choice(operationPage_, {"None", "Match Move", "Corner Positioning", "Perspective Positioning"},
+                               0.0, CLSID_InputControl_MultiButton));
+    merge_ = AddInputTagList(
+        "Merge", "Merge",
+        Choice(operationPage_, {"BG only", "FG only", "FG over BG", "BG over FG"}, 2.0, CLSID_InputControl_Combo));
+    SetCurrentPage(operationPage_);
+    mergeInputs_ = std::make_unique<MergeInputs>(this, foreground_, 0);
+    mappingType_ = AddInputTagList("Mapping type", "MappingType",
+                                   Choice(operationPage_, {"Bi-Linear", "Perspective"}, 1.0, CLSID_InputControl_Combo));
+    auto button = [&](const char *name, const char *id) {
+        return AddInputTagList(name, id,
+                               {{LinkDataType, CLSID_DataType_Number},
+                                {InputControl, CLSID_InputControl_Button},
+                                {ControlPage, operationPage_},
+                                {InputExternal, 0},
+                                {InputNotify, 1},
+                                {InputInitialNotify, 0},
+                                {InputPassive, 1}});
+    };
+    rotateCw_ = button("Rotate Clockwise", "RotateClockwise");
+    rotateCcw_ = button("Rotate Counter-Clockwise", "RotateCounterClockwise");
+    position_ = AddInputTagList("Position", "Position", Checkbox(operationPage_, 1.0));
+    rotation_ = AddInputTagList("Rotation", "Rotation", Checkbox(operationPage_, 1.0));
+    scaling_ = AddInputTagList("Scaling", "Scaling", Checkbox(operationPage_, 1.0));
+    flatten_ = AddInputTagList("Flatten Transform", "FlattenTransform", Checkbox(operationPage_, 0.0));
+    pivotType_ = AddInputTagList(
+        "Pivot type", "PivotType",
+        Choice(operationPage_, {"Tracker average", "Selected tracker", "Manual"}, 0.0, CLSID_InputControl_Combo));
+    tracker_ = AddInputTagList("Tracker", "Tracker",
+                               {{LinkDataType, CLSID_DataType_Number},
+                                {InputControl, CLSID_InputControl_Combo},
+                                {ControlPage, operationPage_},
+                                {InputInteger, 1},
+                                {InputMinAllowed, 0.0},
+                                {InputDefault, 0.0}});
+    pivot_ = AddInputTagList("Pivot", "Pivot",
+                             {{LinkDataType, CLSID_DataType_Point},
+                              {InputControl, CLSID_InputControl_Offset},
+                              {PreviewControl, CLSID_PreviewControl_Crosshair},
+                              {ControlPage, operationPage_},
+                              {InputDefaultX, 0.5},
+                              {InputDefaultY, 0.5}});
+    reference_ = AddInputTagList(
+        "Reference", "Reference",
+        Choice(operationPage_, {"Select time", "Start", "Start & end", "End"}, 1.0, CLSID_InputControl_MultiButton));
+    intermediate_ =
+        AddInputTagList("Reference Intermediate Points", "ReferenceIntermediatePoints",
+                        Slider(operationPage_, 0.0, 10.0, 0.0, {{InputMinAllowed, 0.0}, {InputInteger, 1}}));
+    fadeFrames_ = AddInputTagList("Incomplete Tracker Fade In/Out Frames", "IncompleteTrackerFadeInOutFrames",
+                                  Slider(operationPage_, 0.0, 50.0, 25.0, {{InputMinAllowed, 0.0}, {InputInteger, 1}}));
+    // Documents of older versions name the pivot controls AxisType and Axis: their values go to the new ones.
+    auto old = [&](const char *id, OvID type) {
+        return AddInputTagList(id, id,
+                               {{LinkDataType, type},
+                                {ControlPage, operationPage_},
+                                {ControlVisible, 0},
+                                {InputExternal, 0},
+                                {InputNotify, 1},
+                                {InputInitialNotify, 0},
+                                {LinkNotSaved, 1}});
+    };
+    oldPivotType_ = old("AxisType", CLSID_DataType_Number);
+    oldPivot_ = old("Axis", CLSID_DataType_Point);
+
+    const int options = AddControlPageTagList("Options", {});
+    AddInputTagList("Show Pattern Names", "ShowPatternNamesInPreview",
+                    {{LinkDataType, CLSID_DataType_Number},
+                     {InputControl, CLSID_InputControl_Checkbox},
+                     {ControlPage, options},
+                     {InputDefault, 1.0},
+                     {InputExternal, 0},
+                     {InputPassive, 1}});
+    AddInputTagList("Enlarge Pattern on Dragging", "ShowEnlargedPatternOnDragging",
+                    {{LinkDataType, CLSID_DataType_Number},
+                     {InputControl, CLSID_InputControl_Checkbox},
+                     {ControlPage, options},
+                     {InputDefault, 1.0},
+                     {InputExternal, 0},
+                     {InputPassive, 1}});
+    AddInputTagList("Enlargement Scale", "EnlargementScale",
+                    Slider(options, 0.0, 15.0, 5.0, {{InputInteger, 1}, {InputExternal, 0}, {InputPassive, 1}}));
+    AddInputTagList("Search Area Scale", "SearchScale",
+                    Slider(options, 0.0, 5.0, 1.0, {{InputMinAllowed, 0.001}, {InputExternal, 0}, {InputPassive, 1}}));
+    SetCurrentPage(-1);
+
+    output_ = AddOutputTagList("Output", "Output", {{LinkDataType, CLSID_DataType_Image}, {LinkMain, 1}});
+    auto out = [&](const char *name, const char *id, OvID type) {
+        return AddOutputTagList(name, id, {{LinkDataType, type}});
+    };
+    steadyPosition_ = out("Steady Position", "SteadyPosition", CLSID_DataType_Point);
+    unsteadyPosition_ = out("Unsteady Position", "UnsteadyPosition", CLSID_DataType_Point);
+    steadyAxis_ = out("Steady Axis", "SteadyAxis", CLSID_DataType_Point);
+    steadySize_ = out("Steady Size", "SteadySize", CLSID_DataType_Number);
+    unsteadySize_ = out("Unsteady Size", "UnsteadySize", CLSID_DataType_Number);
+    steadyAngle_ = out("Steady Angle", "SteadyAngle", CLSID_DataType_Number);
+    unsteadyAngle_ = out("Unsteady Angle", "UnsteadyAngle", CLSID_DataType_Number);
+
+    SetTrackerList({1});
+    ShowForOperation(OpNone, PivotAverage, RefStart);
+}
+
+TrackerDeluxe::~TrackerDeluxe() = default;
+
+std::vector<int> TrackerDeluxe::TrackerNumbers() const { return NumbersOf(trackerList_->Constant().Get()); }
+
+void TrackerDeluxe::SetTrackerList(const std::vector<int> &numbers) {
+    ScriptVal table = ScriptVal::Table();
+    for (int n : numbers) table.Append(n);
+    trackerList_->SetValue(MakeRef<ScriptValue>(table));
+    FollowList(numbers); // also when the input does not notify (a value equal to the last)
+}
+
+TrackerData *TrackerDeluxe::EnsureTracker(int n) {
+    if (n <= 0) return nullptr;
+    if (auto it = trackers_.find(n); it != trackers_.end()) return it->second.get();
+    auto made = std::make_unique<TrackerData>(this, n, trackersPage_);
+    TrackerData *tracker = made.get();
+    trackers_.emplace(n, std::move(made));
+    // Values a document gave before the tracker existed.
+    if (GetDoc() && KeptInputs().Size() != 0)
+        for (Input *in : tracker->AllInputs()) {
+            const ScriptVal key(in->ID().Text());
+            const ScriptVal *kept = KeptInputs().Find(key);
+            if (!kept) continue;
+            const ScriptVal value = *kept;
+            if (ApplyInputValue(*GetDoc(), in, value, {.keepUnknownLinks = true}).empty()) KeptInputs().Remove(key);
+        }
+    return tracker;
+}
+
+void TrackerDeluxe::FollowList(const std::vector<int> &numbers) {
+    if (followingList_) return;
+    followingList_ = true;
+    for (auto it = trackers_.begin(); it != trackers_.end();) {
+        if (std::find(numbers.begin(), numbers.end(), it->first) != numbers.end()) {
+            ++it;
+            continue;
+        }
+        RemoveInputs(it->second->AllInputs());
+        it = trackers_.erase(it);
+    }
+    for (int n : numbers) EnsureTracker(n);
+    followingList_ = false;
+    RefreshTrackerChoices();
+}
+
+void TrackerDeluxe::RefreshTrackerChoices() {
+    std::vector<std::string> names;
+    for (int n : TrackerNumbers())
+        if (auto it = trackers_.find(n); it != trackers_.end()) names.push_back(it->second->DisplayName());
+    tracker_->SetChoices(names);
+}
+
+void TrackerDeluxe::ShowForOperation(int operation, int pivotType, int reference) {
+    const bool matchMove = operation == OpMatchMove, corners = operation == OpCorner || operation == OpPerspective;
+    const bool merging = operation != OpNone;
+    std::vector<Input *> mergeControls = mergeInputs_->AllInputs();
+    mergeControls.push_back(merge_);
+    for (Input *in : mergeControls)
+        if (in != foreground_) in->SetAttrsTagList({{ControlVisible, merging}});
+    for (Input *in : {mappingType_, rotateCw_, rotateCcw_}) in->SetAttrsTagList({{ControlVisible, corners}});
+    for (Input *in : {position_, rotation_, scaling_, flatten_, pivotType_, reference_})
+        in->SetAttrsTagList({{ControlVisible, matchMove}});
+    tracker_->SetAttrsTagList({{ControlVisible, matchMove && pivotType == PivotSelected}});
+    pivot_->SetAttrsTagList({{ControlVisible, matchMove && pivotType == PivotManual}});
+    intermediate_->SetAttrsTagList({{ControlVisible, matchMove && reference == RefStartEnd}});
+}
+
+void TrackerDeluxe::Report(const char *fmt, ...) {
+    char line[512];
+    va_list ap;
+    va_start(ap, fmt);
+    std::vsnprintf(line, sizeof line, fmt, ap);
+    va_end(ap);
+    if (GetDoc()) GetDoc()->PrintF(ConsoleError, "%s: %s\n", Name().c_str(), line);
+}
+
+void TrackerDeluxe::NotifyChanged(Input *in, Parameter *param, double time, TagList *tags) {
+    if (param) {
+        if (in == trackerList_) {
+            FollowList(NumbersOf(param));
+        } else if (in == oldPivotType_) {
+            pivotType_->SetValue(Ref<Parameter>(param));
+        } else if (in == oldPivot_) {
+            pivot_->SetValue(Ref<Parameter>(param));
+        } else if (in == operation_ || in == pivotType_ || in == reference_) {
+            ShowForOperation(Whole(operation_->Constant().Get(), 0), Whole(pivotType_->Constant().Get(), 0),
+                             Whole(reference_->Constant().Get(), RefStart));
+        } else if (const TrackRun run = shared_.RunOf(in); run != TrackRun::None) {
+            if (run == TrackRun::Stop) {
+                stop_ = true;
+            } else if (GetDoc()) {
+                const double start = GetDoc()->RenderStart(), end = GetDoc()->RenderEnd();
+                RenderTask task;
+                if (run == TrackRun::Forward) RunTracking(time, end, &task);
+                if (run == TrackRun::Reverse) RunTracking(time, start, &task);
+                if (run == TrackRun::ForwardOneFrame) RunTracking(time, time + 1.0, &task);
+                if (run == TrackRun::ReverseOneFrame) RunTracking(time, time - 1.0, &task);
+                if (run == TrackRun::Bidirectional && RunTracking(time, end, &task) && !task.IsAborted())
+                    RunTracking(time, start, &task);
+            }
+        } else {
+            for (auto &[n, tracker] : trackers_) {
+                if (in == tracker->DeleteInput()) {
+                    std::vector<int> numbers = TrackerNumbers();
+                    numbers.erase(std::remove(numbers.begin(), numbers.end(), n), numbers.end());
+                    SetTrackerList(numbers);
+                    break; // the tracker is gone
+                }
+                if (in == tracker->NameInput()) {
+                    RefreshTrackerChoices();
+                    break;
+                }
+            }
+        }
+        mergeInputs_->NotifyChanged(in, param, time);
+    }
+    ThreadedOperator::NotifyChanged(in, param, time, tags);
+}
+
+bool TrackerDeluxe::ControlCommand(int command, const TagList &tags) {
+    if (command != CCMD_Track) return false;
+    return RunTracking(tags.GetDouble(CCMD_TrackFrom, 0.0), tags.GetDouble(CCMD_TrackTo, 0.0),
+                       tags.GetPtrAs<RenderTask>(CCMD_TrackTask));
+}
+
+bool TrackerDeluxe::RunTracking(double from, double to, RenderTask *task) {
+    std::vector<TrackerData *> enabled;
+    for (int n : TrackerNumbers())
+        if (auto it = trackers_.find(n); it != trackers_.end() && it->second->IsEnabled(from))
+            enabled.push_back(it->second.get());
+    if (enabled.empty()) {
+        Report("No trackers are selected.");
+        return false;
+    }
+    if (!std::isfinite(from) || !std::isfinite(to)) {
+        Report("a run needs finite frames");
+        return false;
+    }
+    RenderTask own;
+    if (!task) task = &own;
+    stop_ = false;
+    for (TrackerData *t : enabled) t->BeginRun();
+    const double step = to >= from ? 1.0 : -1.0;
+    const long frames = std::lround(std::fabs(to - from)) + 1;
+    EvalOptions options;
+    options.flags = ReqFlagTrackStep;
+    options.task = task;
+    options.useCache = false;
+    for (long i = 0; i < frames && !task->IsAborted() && !stop_; ++i) {
+        if (!Evaluate(output_, from + step * static_cast<double>(i), options)) break;
+        for (TrackerData *t : enabled) t->ShowLastMatch();
+    }
+    int points = 0;
+    for (TrackerData *t : enabled) {
+        points += static_cast<int>(t->Points().size());
+        t->WritePath(from, static_cast<int>(std::lround(
+                               dynamic_cast<const Number &>(*shared_.FramesPerPoint()->ValueAt(from)).value)));
+    }
+    if (points == 0) {
+        Report("nothing was tracked from frame %g", from);
+        return false;
+    }
+    return true;
+}
+
+void TrackerDeluxe::CheckRequest(Request *req) {
+    ThreadedOperator::CheckRequest(req);
+    if (!(req->GetFlags() & ReqFlagTrackStep) || req->GetPri() != input_->Priority() || req->IsPreCalc()) return;
+    req->SetInputData(foreground_, nullptr); // a tracking step reads the Input only
+    if (req->GetFlags() & ReqFlagSkipRoI) return;
+    const AutoImageDoD dod(req, input_);
+    if (!dod || !dod->HasFrame()) return;
+    const int W = static_cast<int>(dod->FrameWidth()), H = static_cast<int>(dod->FrameHeight());
+    ImgRectI need;
+    for (auto &[n, tracker] : trackers_)
+        if (tracker->IsEnabled(req->Time())) need = need | tracker->NeededRect(req, W, H);
+    if (need.IsNull()) return;
+    const ImageDomain region = dod->WithRect(need);
+    req->SetInputRoI(input_, &region);
+}
+
+void TrackerDeluxe::Process(Request *req) {
+    auto *img = dynamic_cast<Image *>(req->GetInputData(input_));
+    if ((req->GetFlags() & ReqFlagTrackStep) && !req->IsPreCalc()) {
+        TrackSettings settings = shared_.Settings(req, !(req->GetFlags() & ReqFlagInteractive));
+        for (auto &[n, tracker] : trackers_)
+            if (tracker->IsEnabled(req->Time())) tracker->Step(req, img, req->Time(), settings);
+    }
+    for (auto &[n, tracker] : trackers_) tracker->SetOutputs(req);
+    if (!img) {
+        Fail(req, "%s: no input image at time %g\n", Name().c_str(), req->Time());
+        req->SetOutputData(output_, nullptr);
+        return;
+    }
+    req->SetOutputData(output_, img);
+}
+
+} // namespace Orvane

@@ -1,0 +1,85 @@
+#pragma once
+// TrackerDeluxe, the Tracker tool: any number of trackers (TrackerData) that
+// follow patterns of the Input image over time into paths, and the use of
+// those paths on the image (Operation).
+//
+// Trackers: the hidden input TrackerList is the table of tracker numbers
+// ({ 1 } in a new tool); setting it makes and removes trackers, so a
+// document's list brings its trackers back before their values are read.
+// Delete<n> takes tracker n out of the list.
+//
+// Runs: CCMD_Track (ControlCommand.h) steps every enabled tracker frame by
+// frame from one frame to another, rendering the tool at each frame with
+// ReqFlagTrackStep: CheckRequest narrows the Input to the trackers' search
+// areas, Process has each tracker step on the image. After the last frame,
+// or when the render is stopped, each tracker's points become keys of its
+// TrackedCenter<n> path. The track buttons run the same from the time they
+// are pressed at to the end or the start of the render range (one frame for
+// the one-frame buttons); with no tracker enabled they and CCMD_Track write
+// "No trackers are selected." and do nothing.
+//
+// Operation: "None" gives the Input unchanged; "Match Move" moves the image
+// by the trackers' motion (TrackerDeluxe.cpp); the corner operations are not
+// built and give the Input unchanged with a console line.
+//
+// Thread safety: trackers are made and removed, and runs started, on the
+// main thread between renders; CheckRequest and Process run on the render
+// thread and change a tracker only under its lock.
+#include <atomic>
+#include <map>
+#include <memory>
+#include <vector>
+
+#include "host/flow/MergeInputs.h"
+#include "host/flow/Operator.h"
+#include "operators/track/TrackerData.h"
+#include "operators/track/TrackerInputs.h"
+
+namespace Orvane {
+
+class RenderTask;
+
+class TrackerDeluxe : public ThreadedOperator {
+public:
+    TrackerDeluxe(const Registry *reg, const ScriptVal &args, const TagList &tags);
+    ~TrackerDeluxe() override;
+    size_t SizeOf() const override { return sizeof(*this); }
+
+    void NotifyChanged(Input *in, Parameter *param, double time, TagList *tags) override;
+    void CheckRequest(Request *req) override;
+    void Process(Request *req) override;
+    bool ControlCommand(int command, const TagList &tags) override;
+
+    /// The tracker numbers of TrackerList, in its order.
+    std::vector<int> TrackerNumbers() const;
+    const std::map<int, std::unique_ptr<TrackerData>> &Trackers() const { return trackers_; }
+
+    /// Tracks every enabled tracker from frame `from` to frame `to` (either way) in `task` and writes the paths.
+    /// False, with a console line, when no tracker is enabled or nothing could be tracked; an abort keeps what was
+    /// tracked before it.
+    bool RunTracking(double from, double to, RenderTask *task);
+
+private:
+    TrackerData *EnsureTracker(int n);
+    /// Makes the trackers the list names and takes out the others.
+    void FollowList(const std::vector<int> &numbers);
+    void SetTrackerList(const std::vector<int> &numbers);
+    void ShowForOperation(int operation, int pivotType, int reference);
+    void RefreshTrackerChoices();
+    void Report(const char *fmt, ...) __attribute__((format(printf, 2, 3)));
+
+    TrackerInputs shared_;
+    Input *trackerList_, *input_, *foreground_, *operation_, *merge_;
+    std::unique_ptr<MergeInputs> mergeInputs_;
+    Input *mappingType_, *rotateCw_, *rotateCcw_, *position_, *rotation_, *scaling_, *flatten_;
+    Input *pivotType_, *tracker_, *pivot_, *reference_, *intermediate_, *fadeFrames_;
+    Input *oldPivotType_, *oldPivot_;
+    Output *output_, *steadyPosition_, *unsteadyPosition_, *steadyAxis_, *steadySize_, *unsteadySize_;
+    Output *steadyAngle_, *unsteadyAngle_;
+    int trackersPage_ = 0, operationPage_ = 0;
+    std::map<int, std::unique_ptr<TrackerData>> trackers_;
+    bool followingList_ = false;
+    std::atomic<bool> stop_{false}; ///< Stop Tracking was pressed: the run ends after its current frame
+};
+
+} // namespace Orvane
