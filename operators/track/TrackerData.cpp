@@ -7,8 +7,10 @@
 #include "host/core/Tags.h"
 #include "host/flow/AnimCurve.h"
 #include "host/flow/DataTypes.h"
+#include "host/flow/Engine.h"
 #include "host/flow/InputAt.h"
 #include "host/flow/Operator.h"
+#include "host/flow/RenderTask.h"
 #include "host/flow/Request.h"
 #include "host/image/Image.h"
 
@@ -211,6 +213,48 @@ void TrackerData::SetOutputs(Request *req) const {
     for (Output *out : {position_, perspective_}) req->SetOutputData(out, MakeRef<Point>(x, y));
     for (Output *out : {positionX_, perspectiveX_}) req->SetOutputData(out, MakeRef<Orvane::Number>(x));
     for (Output *out : {positionY_, perspectiveY_}) req->SetOutputData(out, MakeRef<Orvane::Number>(y));
+}
+
+std::vector<TrackerData *> EnabledTrackers(const std::vector<TrackerData *> &trackers, double time) {
+    std::vector<TrackerData *> enabled;
+    for (TrackerData *t : trackers)
+        if (t->IsEnabled(time)) enabled.push_back(t);
+    return enabled;
+}
+
+void AskSearchAreas(Request *req, Input *image, const std::vector<TrackerData *> &trackers) {
+    if (req->GetFlags() & ReqFlagSkipRoI) return;
+    const AutoImageDoD dod(req, image);
+    if (!dod || !dod->HasFrame()) return;
+    const int W = dod->FrameWidth(), H = dod->FrameHeight();
+    ImgRectI need;
+    for (TrackerData *t : EnabledTrackers(trackers, req->Time())) need = need | t->NeededRect(req, W, H);
+    if (need.IsNull()) return;
+    const ImageDomain region = dod->WithRect(need);
+    req->SetInputRoI(image, &region);
+}
+
+int TrackFrames(Output *out, const std::vector<TrackerData *> &trackers, double from, double to, RenderTask *task,
+                int framesPerPoint, const std::atomic<bool> &stop) {
+    RenderTask own;
+    if (!task) task = &own;
+    for (TrackerData *t : trackers) t->BeginRun();
+    const double step = to >= from ? 1.0 : -1.0;
+    const long frames = std::lround(std::fabs(to - from)) + 1;
+    EvalOptions options;
+    options.flags = ReqFlagTrackStep;
+    options.task = task;
+    options.useCache = false;
+    for (long i = 0; i < frames && !task->IsAborted() && !stop; ++i) {
+        if (!Evaluate(out, from + step * static_cast<double>(i), options)) break;
+        for (TrackerData *t : trackers) t->ShowLastMatch();
+    }
+    int points = 0;
+    for (TrackerData *t : trackers) {
+        points += static_cast<int>(t->Points().size());
+        t->WritePath(from, framesPerPoint);
+    }
+    return points;
 }
 
 } // namespace Orvane

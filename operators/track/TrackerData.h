@@ -23,6 +23,7 @@
 // Thread safety: inputs are made on the main thread; Step and the
 // rectangles run on the tool's render thread under the tracker's lock (the
 // matcher's); WritePath runs on the main thread after a run.
+#include <atomic>
 #include <memory>
 #include <string>
 #include <vector>
@@ -36,6 +37,7 @@ class Image;
 class Input;
 class Operator;
 class Output;
+class RenderTask;
 class Request;
 
 class TrackerData {
@@ -104,5 +106,17 @@ private:
     bool active_ = false; ///< the run has taken its pattern
     std::vector<tracking::PathPoint> points_;
 };
+
+/// The trackers of `trackers` that are enabled at `time`.
+std::vector<TrackerData *> EnabledTrackers(const std::vector<TrackerData *> &trackers, double time);
+
+/// CheckRequest of a tracking step at the image level: asks `image` for the union of the trackers' search areas.
+void AskSearchAreas(Request *req, Input *image, const std::vector<TrackerData *> &trackers);
+
+/// A run of `trackers` (enabled ones) from frame `from` to frame `to`: renders `out` of their tool at each frame
+/// with ReqFlagTrackStep in `task`, until the last frame, an abort of the task or `stop`; then writes each tracker's
+/// points into its path with `framesPerPoint`. The number of points tracked.
+int TrackFrames(Output *out, const std::vector<TrackerData *> &trackers, double from, double to, RenderTask *task,
+                int framesPerPoint, const std::atomic<bool> &stop);
 
 } // namespace Orvane

@@ -19,22 +19,23 @@
 namespace Orvane {
 
 static const OvID CLSID_TrackerDeluxe("Tracker");
-static ClassRegistration<TrackerDeluxe, ThreadedOperator> s_Registration(CLSID_TrackerDeluxe, &CLSID_ThreadedOperator,
-                                                                         {{RegTypeFlags, RegKindOperator | RegKindTool},
-                                                                          {RegClassName, "TrackerDeluxe"},
-                                                                          {RegPath, "Tools/Tracking/Tracker"},
-                                                                          {RegName, "Tracker"},
-                                                                          {RegCategory, "Tracking"},
-                                                                          {RegAbbreviation, "Tra"},
-                                                                          {RegAlias, "Stabilize"},
-                                                                          {RegHelp, "Plenty of trackers"},
-                                                                          {RegIcon, "Icons.Tools.Icons.TrackerDeluxe"},
-                                                                          {RegNoAutoProxy, 1},
-                                                                          {RegUnpredictable, 1},
-                                                                          {RegSupportsRoI, 1},
-                                                                          {RegSupportsDoD, 1},
-                                                                          {RegKeepsTimeState, 1},
-                                                                          {RegOwnCacheValidity, 1}});
+static ClassRegistration<TrackerDeluxe, ThreadedOperator>
+    s_TrackerRegistration(CLSID_TrackerDeluxe, &CLSID_ThreadedOperator,
+                          {{RegTypeFlags, RegKindOperator | RegKindTool},
+                           {RegClassName, "TrackerDeluxe"},
+                           {RegPath, "Tools/Tracking/Tracker"},
+                           {RegName, "Tracker"},
+                           {RegCategory, "Tracking"},
+                           {RegAbbreviation, "Tra"},
+                           {RegAlias, "Stabilize"},
+                           {RegHelp, "Plenty of trackers"},
+                           {RegIcon, "Icons.Tools.Icons.TrackerDeluxe"},
+                           {RegNoAutoProxy, 1},
+                           {RegUnpredictable, 1},
+                           {RegSupportsRoI, 1},
+                           {RegSupportsDoD, 1},
+                           {RegKeepsTimeState, 1},
+                           {RegOwnCacheValidity, 1}});
 
 namespace {
 
@@ -341,11 +342,15 @@ bool TrackerDeluxe::ControlCommand(int command, const TagList &tags) {
                        tags.GetPtrAs<RenderTask>(CCMD_TrackTask));
 }
 
-bool TrackerDeluxe::RunTracking(double from, double to, RenderTask *task) {
-    std::vector<TrackerData *> enabled;
+std::vector<TrackerData *> TrackerDeluxe::ListedTrackers() const {
+    std::vector<TrackerData *> listed;
     for (int n : TrackerNumbers())
-        if (auto it = trackers_.find(n); it != trackers_.end() && it->second->IsEnabled(from))
-            enabled.push_back(it->second.get());
+        if (auto it = trackers_.find(n); it != trackers_.end()) listed.push_back(it->second.get());
+    return listed;
+}
+
+bool TrackerDeluxe::RunTracking(double from, double to, RenderTask *task) {
+    const std::vector<TrackerData *> enabled = EnabledTrackers(ListedTrackers(), from);
     if (enabled.empty()) {
         Report("No trackers are selected.");
         return false;
@@ -354,27 +359,9 @@ bool TrackerDeluxe::RunTracking(double from, double to, RenderTask *task) {
         Report("a run needs finite frames");
         return false;
     }
-    RenderTask own;
-    if (!task) task = &own;
     stop_ = false;
-    for (TrackerData *t : enabled) t->BeginRun();
-    const double step = to >= from ? 1.0 : -1.0;
-    const long frames = std::lround(std::fabs(to - from)) + 1;
-    EvalOptions options;
-    options.flags = ReqFlagTrackStep;
-    options.task = task;
-    options.useCache = false;
-    for (long i = 0; i < frames && !task->IsAborted() && !stop_; ++i) {
-        if (!Evaluate(output_, from + step * static_cast<double>(i), options)) break;
-        for (TrackerData *t : enabled) t->ShowLastMatch();
-    }
-    int points = 0;
-    for (TrackerData *t : enabled) {
-        points += static_cast<int>(t->Points().size());
-        t->WritePath(from, static_cast<int>(std::lround(
-                               dynamic_cast<const Number &>(*shared_.FramesPerPoint()->ValueAt(from)).value)));
-    }
-    if (points == 0) {
+    const int every = Whole(shared_.FramesPerPoint()->ValueAt(from).Get(), 1);
+    if (TrackFrames(output_, enabled, from, to, task, every, stop_) == 0) {
         Report("nothing was tracked from frame %g", from);
         return false;
     }
@@ -385,24 +372,14 @@ void TrackerDeluxe::CheckRequest(Request *req) {
     ThreadedOperator::CheckRequest(req);
     if (!(req->GetFlags() & ReqFlagTrackStep) || req->GetPri() != input_->Priority() || req->IsPreCalc()) return;
     req->SetInputData(foreground_, nullptr); // a tracking step reads the Input only
-    if (req->GetFlags() & ReqFlagSkipRoI) return;
-    const AutoImageDoD dod(req, input_);
-    if (!dod || !dod->HasFrame()) return;
-    const int W = static_cast<int>(dod->FrameWidth()), H = static_cast<int>(dod->FrameHeight());
-    ImgRectI need;
-    for (auto &[n, tracker] : trackers_)
-        if (tracker->IsEnabled(req->Time())) need = need | tracker->NeededRect(req, W, H);
-    if (need.IsNull()) return;
-    const ImageDomain region = dod->WithRect(need);
-    req->SetInputRoI(input_, &region);
+    AskSearchAreas(req, input_, ListedTrackers());
 }
 
 void TrackerDeluxe::Process(Request *req) {
     auto *img = dynamic_cast<Image *>(req->GetInputData(input_));
     if ((req->GetFlags() & ReqFlagTrackStep) && !req->IsPreCalc()) {
         TrackSettings settings = shared_.Settings(req, !(req->GetFlags() & ReqFlagInteractive));
-        for (auto &[n, tracker] : trackers_)
-            if (tracker->IsEnabled(req->Time())) tracker->Step(req, img, req->Time(), settings);
+        for (TrackerData *t : EnabledTrackers(ListedTrackers(), req->Time())) t->Step(req, img, req->Time(), settings);
     }
     for (auto &[n, tracker] : trackers_) tracker->SetOutputs(req);
     if (!img) {

@@ -61,6 +61,8 @@ public:
 
 private:
     TrackerData *EnsureTracker(int n);
+    /// The trackers of TrackerList, in its order.
+    std::vector<TrackerData *> ListedTrackers() const;
     /// Makes the trackers the list names and takes out the others.
     void FollowList(const std::vector<int> &numbers);
     void SetTrackerList(const std::vector<int> &numbers);

@@ -10,6 +10,7 @@
 #include "host/flow/DataTypes.h"
 #include "host/flow/DocumentIO.h"
 #include "host/flow/Engine.h"
+#include "host/flow/InputAt.h"
 #include "host/flow/OrvaneDoc.h"
 #include "host/flow/RenderTask.h"
 #include "host/flow/Request.h"
@@ -314,6 +315,24 @@ TEST_F(Tracker, AppendModeContinuesThePathAndAbortsKeepWhatWasTracked) {
         EXPECT_EQ(keys[i][0], t);
         EXPECT_NEAR(keys[i][1], x + 0.1, 1e-12) << t;
         EXPECT_NEAR(keys[i][2], y, 1e-12) << t;
+    }
+}
+
+TEST_F(Tracker, ModifierDrivesAPointInputByItsTrack) {
+    Operator *mod = doc.AddTool(OvID("TrackerModifier"), "TrackerModifier1");
+    Operator *xf = doc.AddTool(OvID("Transform"), "Transform1");
+    ASSERT_TRUE(mod && xf);
+    ASSERT_TRUE(mod->FindInput("Input")->ConnectTo(source->FindMainOutput()));
+    ASSERT_TRUE(xf->FindInput("Center")->ConnectTo(mod->FindOutput("Position1")));
+    const auto [x0, y0] = At(20, 40);
+    T::SetPoint(mod, "PatternCenter1", x0, y0);
+    ASSERT_TRUE(mod->ControlCommand(CCMD_Track, {{CCMD_TrackFrom, 0.0}, {CCMD_TrackTo, 3.0}})) << T::ConsoleText(doc);
+    for (int t = 0; t <= 3; ++t) {
+        double x = 0, y = 0;
+        InputPointAt(nullptr, xf->FindInput("Center"), t, x, y);
+        const auto [wx, wy] = At(20 + MovingTexture::DX * t, 40 + MovingTexture::DY * t);
+        EXPECT_NEAR(x, wx, 1e-12) << t;
+        EXPECT_NEAR(y, wy, 1e-12) << t;
     }
 }
 
