@@ -201,18 +201,53 @@ void TrackerData::ShowLastMatch() {
     bestMatch_->SetValue(MakeRef<Orvane::Number>(match));
 }
 
-void TrackerData::SetOutputs(Request *req) const {
+bool TrackerData::PositionAt(const Request *req, double time, double &x, double &y) const {
+    if (!path_->Curve() || path_->Curve()->Empty()) return false;
+    InputPointAt(req, path_, time, x, y, 0.5, 0.5);
+    x += InputNumberAt(req, xOffset_, time, 0.0);
+    y += InputNumberAt(req, yOffset_, time, 0.0);
+    return true;
+}
+
+bool TrackerData::ReferenceAt(const Request *req, int reference, double selectTime, double time, double &x,
+                              double &y) const {
+    const AnimCurve *curve = path_->Curve();
+    if (!curve || curve->Empty()) return false;
+    const double first = curve->Keys().front().time, last = curve->Keys().back().time;
+    switch (reference) {
+    case 0: return PositionAt(req, selectTime, x, y);
+    case 2: {
+        double x0 = 0, y0 = 0, x1 = 0, y1 = 0;
+        PositionAt(req, first, x0, y0);
+        PositionAt(req, last, x1, y1);
+        const double f = last > first ? std::clamp((time - first) / (last - first), 0.0, 1.0) : 0.0;
+        x = x0 + (x1 - x0) * f, y = y0 + (y1 - y0) * f;
+        return true;
+    }
+    case 3: return PositionAt(req, last, x, y);
+    default: return PositionAt(req, first, x, y);
+    }
+}
+
+void TrackerData::SetOutputs(Request *req, int reference, double selectTime) const {
     const double t = req->Time();
-    double x = 0.5, y = 0.5;
+    double x = 0.5, y = 0.5, rx = 0.5, ry = 0.5;
     if (IsEnabled(t)) {
-        InputPointAt(req, path_, t, x, y, 0.5, 0.5);
-        x += InputNumberAt(req, xOffset_, t, 0.0);
-        y += InputNumberAt(req, yOffset_, t, 0.0);
+        if (!PositionAt(req, t, x, y)) {
+            InputPointAt(req, path_, t, x, y, 0.5, 0.5);
+            x += InputNumberAt(req, xOffset_, t, 0.0);
+            y += InputNumberAt(req, yOffset_, t, 0.0);
+            rx = x, ry = y;
+        } else {
+            ReferenceAt(req, reference, selectTime, t, rx, ry);
+        }
     }
     // Without a corner transform the perspective position is the offset position itself.
     for (Output *out : {position_, perspective_}) req->SetOutputData(out, MakeRef<Point>(x, y));
     for (Output *out : {positionX_, perspectiveX_}) req->SetOutputData(out, MakeRef<Orvane::Number>(x));
     for (Output *out : {positionY_, perspectiveY_}) req->SetOutputData(out, MakeRef<Orvane::Number>(y));
+    req->SetOutputData(steady_, MakeRef<Point>(0.5 - (x - rx), 0.5 - (y - ry)));
+    req->SetOutputData(unsteady_, MakeRef<Point>(0.5 + (x - rx), 0.5 + (y - ry)));
 }
 
 std::vector<TrackerData *> EnabledTrackers(const std::vector<TrackerData *> &trackers, double time) {

@@ -77,9 +77,17 @@ public:
     /// Shows the last step's match value in Tracker<n>BestMatch; main thread, between the frames of a run.
     void ShowLastMatch();
 
+    /// Where the tracker is at `time`: its path plus (XOffset<n>, YOffset<n>); false when the path has no keys.
+    bool PositionAt(const Request *req, double time, double &x, double &y) const;
+    /// Where the tracker was at the reference for `time` (Reference: 0 "Select time": at `selectTime`; 1 "Start":
+    /// at the path's first key; 2 "Start & end": on the straight line from the first key's position to the last's,
+    /// by time; 3 "End": at the last key); false when the path has no keys.
+    bool ReferenceAt(const Request *req, int reference, double selectTime, double time, double &x, double &y) const;
+
     /// The outputs' values at the request's time (the defaults, the frame's centre, for a disabled tracker):
-    /// TrackedCenter<n> plus (XOffset<n>, YOffset<n>).
-    void SetOutputs(Request *req) const;
+    /// TrackedCenter<n> plus (XOffset<n>, YOffset<n>); the steady and unsteady positions are 0.5 minus and plus the
+    /// tracker's movement since the reference.
+    void SetOutputs(Request *req, int reference, double selectTime) const;
 
 private:
     struct Pattern {

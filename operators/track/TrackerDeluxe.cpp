@@ -14,6 +14,7 @@
 #include "host/flow/RenderTask.h"
 #include "host/flow/Request.h"
 #include "host/image/Image.h"
+#include "host/image/TransformMatrix.h"
 #include "operators/frame/Registration.h"
 
 namespace Orvane {
@@ -375,19 +376,132 @@ void TrackerDeluxe::CheckRequest(Request *req) {
     AskSearchAreas(req, input_, ListedTrackers());
 }
 
+tracking::Motion TrackerDeluxe::MotionAt(Request *req, double aspect) const {
+    const double t = req->Time();
+    const int reference = static_cast<int>(std::lround(req->GetInputNumber(reference_, RefStart)));
+    const double selectTime = GetDoc() ? GetDoc()->RenderStart() : 0.0;
+    tracking::MotionOptions o;
+    o.position = req->GetInputNumber(position_, 1.0) >= 0.5;
+    o.rotation = req->GetInputNumber(rotation_, 1.0) >= 0.5;
+    o.scaling = req->GetInputNumber(scaling_, 1.0) >= 0.5;
+    const int pivotType = static_cast<int>(std::lround(req->GetInputNumber(pivotType_, PivotAverage)));
+    o.pivot = pivotType == PivotSelected ? tracking::Pivot::Selected
+              : pivotType == PivotManual ? tracking::Pivot::Manual
+                                         : tracking::Pivot::Average;
+    if (const auto *p = dynamic_cast<const Point *>(req->GetInputData(pivot_))) o.manualX = p->x, o.manualY = p->y;
+    o.aspect = aspect;
+    const std::vector<TrackerData *> listed = ListedTrackers();
+    const size_t selected = static_cast<size_t>(std::max(0L, std::lround(req->GetInputNumber(tracker_, 0.0))));
+    std::vector<tracking::TrackPair> pairs;
+    for (size_t i = 0; i < listed.size(); ++i) {
+        tracking::TrackPair p{};
+        if (!listed[i]->IsEnabled(t) || !listed[i]->PositionAt(req, t, p.x, p.y) ||
+            !listed[i]->ReferenceAt(req, reference, selectTime, t, p.rx, p.ry))
+            continue;
+        if (i == selected) o.selected = pairs.size();
+        pairs.push_back(p);
+    }
+    return tracking::FitMotion(pairs, o);
+}
+
 void TrackerDeluxe::Process(Request *req) {
-    auto *img = dynamic_cast<Image *>(req->GetInputData(input_));
+    Parameter *value = req->GetInputData(input_);
+    auto *img = dynamic_cast<Image *>(value);
     if ((req->GetFlags() & ReqFlagTrackStep) && !req->IsPreCalc()) {
         TrackSettings settings = shared_.Settings(req, !(req->GetFlags() & ReqFlagInteractive));
         for (TrackerData *t : EnabledTrackers(ListedTrackers(), req->Time())) t->Step(req, img, req->Time(), settings);
     }
-    for (auto &[n, tracker] : trackers_) tracker->SetOutputs(req);
-    if (!img) {
+    const int reference = static_cast<int>(std::lround(req->GetInputNumber(reference_, RefStart)));
+    for (auto &[n, tracker] : trackers_) tracker->SetOutputs(req, reference, GetDoc() ? GetDoc()->RenderStart() : 0.0);
+
+    auto bg = MakeRef<TransformMatrix>(value, req, input_, 0u, TimeUndefined);
+    const double aspect = bg->IsValid() && bg->Width() > 0 && bg->XScale() > 0
+                              ? bg->Height() * bg->YScale() / (bg->Width() * bg->XScale())
+                              : 1.0;
+    const tracking::Motion m = MotionAt(req, aspect);
+    req->SetOutputData(steadyPosition_, MakeRef<Point>(0.5 - m.moveX, 0.5 - m.moveY));
+    req->SetOutputData(unsteadyPosition_, MakeRef<Point>(0.5 + m.moveX, 0.5 + m.moveY));
+    req->SetOutputData(steadyAxis_, MakeRef<Point>(m.pivotRefX + m.moveX, m.pivotRefY + m.moveY));
+    req->SetOutputData(steadySize_, MakeRef<Number>(m.scale != 0.0 ? 1.0 / m.scale : 1.0));
+    req->SetOutputData(unsteadySize_, MakeRef<Number>(m.scale));
+    req->SetOutputData(steadyAngle_, MakeRef<Number>(-m.angle));
+    req->SetOutputData(unsteadyAngle_, MakeRef<Number>(m.angle));
+    if (req->AskedOutput() != output_) return;
+
+    if (!bg->IsValid()) {
         Fail(req, "%s: no input image at time %g\n", Name().c_str(), req->Time());
         req->SetOutputData(output_, nullptr);
         return;
     }
-    req->SetOutputData(output_, img);
+    const int operation = static_cast<int>(std::lround(req->GetInputNumber(operation_, OpNone)));
+    if (operation == OpNone || (req->GetFlags() & ReqFlagTrackStep)) {
+        req->SetOutputData(output_, value);
+        return;
+    }
+    if (operation != OpMatchMove) {
+        Fail(req, "%s: corner and perspective positioning are not available yet; choose None or Match Move\n",
+             Name().c_str());
+        req->SetOutputData(output_, nullptr);
+        return;
+    }
+    MatchMove(req, bg.Get(), m);
 }
 
+void TrackerDeluxe::MatchMove(Request *req, TransformMatrix *bg, const tracking::Motion &m) {
+    auto choice = [req](const Input *in, int def) {
+        return static_cast<int>(std::lround(req->GetInputNumber(in, def)));
+    };
+    // The motion as a Transform step: steady takes the shot back to the reference, unsteady follows it.
+    const auto step = [&](bool steady) {
+        const double size = steady ? (m.scale != 0.0 ? 1.0 / m.scale : 1.0) : m.scale;
+        return TagList{{XfPivotX, steady ? m.pivotRefX + m.moveX : m.pivotRefX},
+                       {XfPivotY, steady ? m.pivotRefY + m.moveY : m.pivotRefY},
+                       {XfCenterX, steady ? 0.5 - m.moveX : 0.5 + m.moveX},
+                       {XfCenterY, steady ? 0.5 - m.moveY : 0.5 + m.moveY},
+                       {XfXSize, size},
+                       {XfYSize, size},
+                       {XfAngle, steady ? -m.angle : m.angle}};
+    };
+    TagList resample{{XfEdges, choice(FindInput("Edges"), EdgeCanvas)},
+                     {XfFilter, choice(FindInput("FilterMethod"), RszLinear - RszFirst) + RszFirst},
+                     {XfWindow, choice(FindInput("WindowMethod"), 0) + RszWindowHanning},
+                     {XfFlatten, req->GetInputNumber(flatten_, 0.0) >= 0.5},
+                     {XfGPUEnabled, IsGPUEnabled(req, false)},
+                     {XfRequest, static_cast<const void *>(req)}};
+    const auto moved = [&](Ref<TransformMatrix> tm, bool steady) {
+        TagList tags = step(steady);
+        tags.Merge(resample);
+        return tm->IsValid() && tm->ImageConcatenateTagList(tags) ? tm : Ref<TransformMatrix>();
+    };
+    const auto fail = [&](const char *why) {
+        if (!(req->GetTask() && req->GetTask()->IsAborted()))
+            Fail(req, "%s: %s (time = %g)\n", Name().c_str(), why, req->Time());
+        req->SetOutputData(output_, nullptr);
+    };
+    Parameter *bgValue = req->GetInputData(input_), *fgValue = req->GetInputData(foreground_);
+    const int merge = choice(merge_, 2);
+    Ref<TransformMatrix> result;
+    if (merge == 0 || !fgValue) {
+        // The background alone, steadied: the shot held still at its reference.
+        result = moved(Ref<TransformMatrix>(bg), true);
+    } else if (merge == 1) {
+        result = moved(MakeRef<TransformMatrix>(fgValue, req, foreground_, 0u, TimeUndefined), false);
+    } else {
+        // One layer follows the shot and goes over or under the other; the merge resamples it once.
+        Ref<TransformMatrix> fg = moved(MakeRef<TransformMatrix>(fgValue, req, foreground_, 0u, TimeUndefined), false);
+        if (!fg) return fail("the foreground could not be moved");
+        Ref<TransformMatrix> base = merge == 2 ? Ref<TransformMatrix>(bg) : fg;
+        Ref<Parameter> keep(fgValue);
+        req->SetInputData(foreground_, merge == 2 ? static_cast<Parameter *>(fg.Get()) : bgValue);
+        const bool merged = mergeInputs_->Merge(req, base.Get(), TagList());
+        req->SetInputData(foreground_, keep.Get());
+        if (!merged) {
+            req->SetOutputData(output_, nullptr);
+            return;
+        }
+        result = base;
+    }
+    if (!result) return fail("out of memory");
+    req->SetOutputData(output_, result.Get());
+}
 } // namespace Orvane

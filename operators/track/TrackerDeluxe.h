@@ -18,9 +18,18 @@
 // the one-frame buttons); with no tracker enabled they and CCMD_Track write
 // "No trackers are selected." and do nothing.
 //
-// Operation: "None" gives the Input unchanged; "Match Move" moves the image
-// by the trackers' motion (TrackerDeluxe.cpp); the corner operations are not
-// built and give the Input unchanged with a console line.
+// Operation: "None" gives the Input unchanged. "Match Move" takes the
+// trackers' motion since their reference (MatchMove.h) as one Transform
+// step: "BG only" steadies the Input (the shot held at its reference), "FG
+// only" moves the Foreground with the shot, "FG over BG" lays the moving
+// Foreground over the Input and "BG over FG" the Input over it, through the
+// merge controls; each image is resampled once. The corner operations are not
+// built: they fail with a console line saying so.
+//
+// Outputs: SteadyPosition, SteadyAxis, SteadySize and SteadyAngle are the
+// Center, Pivot, Size and Angle of a Transform that steadies the shot;
+// UnsteadyPosition, UnsteadySize and UnsteadyAngle (with the pivot at the
+// reference) put the motion back.
 //
 // Thread safety: trackers are made and removed, and runs started, on the
 // main thread between renders; CheckRequest and Process run on the render
@@ -32,12 +41,14 @@
 
 #include "host/flow/MergeInputs.h"
 #include "host/flow/Operator.h"
+#include "operators/track/MatchMove.h"
 #include "operators/track/TrackerData.h"
 #include "operators/track/TrackerInputs.h"
 
 namespace Orvane {
 
 class RenderTask;
+class TransformMatrix;
 
 class TrackerDeluxe : public ThreadedOperator {
 public:
@@ -68,6 +79,10 @@ private:
     void SetTrackerList(const std::vector<int> &numbers);
     void ShowForOperation(int operation, int pivotType, int reference);
     void RefreshTrackerChoices();
+    /// The motion of the enabled trackers from their reference to the request's time.
+    tracking::Motion MotionAt(Request *req, double aspect) const;
+    /// Operation "Match Move": the Merge choice with the motion, one resampling.
+    void MatchMove(Request *req, TransformMatrix *bg, const tracking::Motion &m);
     void Report(const char *fmt, ...) __attribute__((format(printf, 2, 3)));
 
     TrackerInputs shared_;

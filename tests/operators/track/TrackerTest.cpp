@@ -2,8 +2,10 @@
 // through documents, and tracking runs over a texture that moves by a known number of pixels per frame.
 #include <gtest/gtest.h>
 
+#include <algorithm>
 #include <cmath>
 #include <string>
+#include <tuple>
 #include <vector>
 
 #include "host/flow/ControlCommand.h"
@@ -16,6 +18,7 @@
 #include "host/flow/Request.h"
 #include "host/image/Image.h"
 #include "host/image/NewImage.h"
+#include "operators/track/MatchMove.h"
 #include "operators/track/TrackerStep.h"
 #include "tests/support/TestSupport.h"
 
@@ -116,6 +119,77 @@ TEST(TrackerStep, KeysEveryFewFramesFromTheRunsStartAndAtItsEnd) {
         for (const PathPoint &p : tracking::KeyPoints(run(c.from, c.to), c.from, c.every)) times.push_back(p.time);
         EXPECT_EQ(times, c.times) << c.from << ".." << c.to << " every " << c.every;
     }
+}
+
+TEST(MatchMove, FitRecoversAKnownMotionAndHonoursTheSwitches) {
+    // Three trackers moved by a similarity worked in square units (y times the aspect 0.5): 10 degrees about
+    // (0.4, 0.3), scale 1.25, then (0.05, -0.02) across.
+    const double aspect = 0.5, angle = 10.0, scale = 1.25, tx = 0.05, ty = -0.02, cx = 0.4, cy = 0.3;
+    const double c = std::cos(angle * M_PI / 180), sn = std::sin(angle * M_PI / 180);
+    const auto move = [&](double x, double y) {
+        const double ux = x - cx, uy = (y - cy) * aspect;
+        return std::pair{cx + scale * (c * ux - sn * uy) + tx, cy + scale * (sn * ux + c * uy) / aspect + ty};
+    };
+    std::vector<tracking::TrackPair> pairs;
+    for (auto [x, y] : {std::pair{0.2, 0.3}, {0.7, 0.4}, {0.5, 0.8}}) {
+        const auto [mx, my] = move(x, y);
+        pairs.push_back({x, y, mx, my});
+    }
+    const auto mean = [&](bool now) {
+        double x = 0, y = 0;
+        for (const auto &p : pairs) x += now ? p.x : p.rx, y += now ? p.y : p.ry;
+        return std::pair{x / 3, y / 3};
+    };
+    const auto [mrx, mry] = mean(false);
+    const auto [mx, my] = mean(true);
+    const auto [manualX, manualY] = move(0.9, 0.1);
+    const struct {
+        const char *what;
+        tracking::MotionOptions o;
+        double angle, scale, pivotX, pivotY, moveX, moveY;
+    } cases[] = {
+        {"average", {.aspect = aspect}, angle, scale, mrx, mry, mx - mrx, my - mry},
+        {"selected",
+         {.pivot = tracking::Pivot::Selected, .selected = 1, .aspect = aspect},
+         angle,
+         scale,
+         0.7,
+         0.4,
+         pairs[1].x - 0.7,
+         pairs[1].y - 0.4},
+        {"manual",
+         {.pivot = tracking::Pivot::Manual, .manualX = 0.9, .manualY = 0.1, .aspect = aspect},
+         angle,
+         scale,
+         0.9,
+         0.1,
+         manualX - 0.9,
+         manualY - 0.1},
+        {"no rotation, no scale",
+         {.rotation = false, .scaling = false, .aspect = aspect},
+         0.0,
+         1.0,
+         mrx,
+         mry,
+         mx - mrx,
+         my - mry},
+        {"no position", {.position = false, .aspect = aspect}, angle, scale, mrx, mry, 0.0, 0.0},
+    };
+    for (const auto &k : cases) {
+        const tracking::Motion m = tracking::FitMotion(pairs, k.o);
+        EXPECT_NEAR(m.angle, k.angle, 1e-9) << k.what;
+        EXPECT_NEAR(m.scale, k.scale, 1e-12) << k.what;
+        EXPECT_NEAR(m.pivotRefX, k.pivotX, 1e-12) << k.what;
+        EXPECT_NEAR(m.pivotRefY, k.pivotY, 1e-12) << k.what;
+        EXPECT_NEAR(m.moveX, k.moveX, 1e-12) << k.what;
+        EXPECT_NEAR(m.moveY, k.moveY, 1e-12) << k.what;
+    }
+    // One tracker gives a translation only; none, no motion.
+    const tracking::Motion one = tracking::FitMotion({pairs[2]}, {.aspect = aspect});
+    EXPECT_EQ(std::tuple(one.angle, one.scale), std::tuple(0.0, 1.0));
+    EXPECT_DOUBLE_EQ(one.moveX, pairs[2].x - 0.5);
+    const tracking::Motion none = tracking::FitMotion({}, {});
+    EXPECT_EQ(std::tuple(none.moveX, none.moveY, none.angle, none.scale), std::tuple(0.0, 0.0, 0.0, 1.0));
 }
 
 /// A 96 x 64 texture that moves by (2, -1) pixels a frame (wrapping around), and that aborts its render at
@@ -334,6 +408,38 @@ TEST_F(Tracker, ModifierDrivesAPointInputByItsTrack) {
         EXPECT_NEAR(x, wx, 1e-12) << t;
         EXPECT_NEAR(y, wy, 1e-12) << t;
     }
+}
+
+TEST_F(Tracker, MatchMoveSteadiesTheShotAtItsReference) {
+    // Two trackers over frames 0..4; "BG only" at frame 3 is frame 0 again where frame 3 covers it.
+    ScriptVal list = ScriptVal::Table();
+    for (int n : {1, 2}) list.Append(n);
+    ASSERT_TRUE(tracker->FindInput("TrackerList")->SetValue(MakeRef<ScriptValue>(list)));
+    const auto [ax, ay] = At(30, 20);
+    const auto [bx, by] = At(60, 40);
+    T::SetPoint(tracker, "PatternCenter1", ax, ay);
+    T::SetPoint(tracker, "PatternCenter2", bx, by);
+    ASSERT_TRUE(Run(0, 4)) << T::ConsoleText(doc);
+    T::SetNumbers(tracker, {{"Operation", 1}, {"Merge", 0}});
+    EvalOptions o;
+    o.useCache = false;
+    const Ref<Parameter> steady = Evaluate(tracker->FindOutput("SteadyPosition"), 3.0, o);
+    ASSERT_TRUE(dynamic_cast<const Point *>(steady.Get())) << T::ConsoleText(doc);
+    EXPECT_NEAR(dynamic_cast<const Point &>(*steady).x, 0.5 - 3.0 * MovingTexture::DX / MovingTexture::W, 1e-12);
+    EXPECT_NEAR(dynamic_cast<const Point &>(*steady).y, 0.5 - 3.0 * MovingTexture::DY / MovingTexture::H, 1e-12);
+    const Ref<Parameter> size = Evaluate(tracker->FindOutput("SteadySize"), 3.0, o);
+    EXPECT_NEAR(dynamic_cast<const Number &>(*size).value, 1.0, 1e-12);
+    const Ref<Image> frame3 = T::EvalImage(tracker, 3.0, o);
+    const Ref<Image> frame0 = T::EvalImage(source, 0.0, o);
+    ASSERT_TRUE(frame3 && frame0) << T::ConsoleText(doc);
+    double worst = 0.0;
+    for (int y = 8; y < MovingTexture::H - 8; ++y)
+        for (int x = 8; x < MovingTexture::W - 8; ++x) {
+            const FltPixel a = frame3->GetFlt(x, y), b = frame0->GetFlt(x, y);
+            worst = std::max(
+                {worst, std::fabs(double(a.R) - b.R), std::fabs(double(a.G) - b.G), std::fabs(double(a.A) - b.A)});
+        }
+    EXPECT_LT(worst, 1e-5);
 }
 
 TEST_F(Tracker, NoEnabledTrackerRefusesTheRun) {
