@@ -1,5 +1,6 @@
-// The Tracker tool: the step's adaptive gate and the path keys against values worked out here, the tracker list
-// through documents, and tracking runs over a texture that moves by a known number of pixels per frame.
+// The Tracker tool: the step's adaptive gate and the fitted motion against values worked out here, the tracker list
+// through documents, and tracking runs (path keys, append mode, aborts, Match Move) over a texture that moves by a
+// known number of pixels per frame.
 #include <gtest/gtest.h>
 
 #include <algorithm>
@@ -13,6 +14,7 @@
 #include "host/flow/DocumentIO.h"
 #include "host/flow/Engine.h"
 #include "host/flow/InputAt.h"
+#include "host/flow/InputValue.h"
 #include "host/flow/OrvaneDoc.h"
 #include "host/flow/RenderTask.h"
 #include "host/flow/Request.h"
@@ -63,61 +65,6 @@ TEST(TrackerStep, AdaptiveGateKeepsOrDropsAsTheRunsMeanSays) {
         }
         EXPECT_EQ(stats.count, c.count + (c.counted ? 1 : 0));
         EXPECT_FLOAT_EQ(stats.sum, c.sum + (c.counted ? static_cast<float>(c.match) : 0.0f));
-    }
-}
-
-TEST(TrackerStep, SettingsFollowTheControls) {
-    const struct {
-        int adaptive;
-        double pathCenter, framesPerPoint;
-        float low, high;
-        TrackSettings::Adaptive mode;
-        bool pathFlag;
-        int frames;
-    } cases[] = {
-        {0, 0.0, 1.0, 0.0f, 0.0f, TrackSettings::Adaptive::None, false, 1},
-        {1, 0.5, 2.6, 0.3f, 0.8f, TrackSettings::Adaptive::EveryFrame, true, 3},
-        {2, 0.49, 0.0, 0.3f, 0.8f, TrackSettings::Adaptive::BestMatch, false, 1},
-    };
-    for (const auto &c : cases) {
-        const TrackSettings s = tracking::MakeSettings(true, 0.2, c.adaptive, c.pathCenter, c.framesPerPoint);
-        EXPECT_EQ(s.first, 64);
-        EXPECT_TRUE(s.tracking);
-        EXPECT_FLOAT_EQ(s.matchTolerance, 0.2f);
-        EXPECT_FLOAT_EQ(s.adaptiveLow, c.low) << c.adaptive;
-        EXPECT_FLOAT_EQ(s.adaptiveHigh, c.high) << c.adaptive;
-        EXPECT_EQ(s.adaptive, c.mode) << c.adaptive;
-        EXPECT_EQ(s.pathCenter, c.pathFlag) << c.pathCenter;
-        EXPECT_EQ(s.framesPerPoint, c.frames) << c.framesPerPoint;
-        EXPECT_TRUE(s.fixedFlag);
-        EXPECT_EQ(s.fixedNumber, 2);
-    }
-}
-
-TEST(TrackerStep, KeysEveryFewFramesFromTheRunsStartAndAtItsEnd) {
-    const auto run = [](double from, double to) {
-        std::vector<PathPoint> points;
-        for (double t = from;; t += to >= from ? 1 : -1) {
-            points.push_back({t / 100, 0.0, t});
-            if (t == to) break;
-        }
-        return points;
-    };
-    const struct {
-        double from, to;
-        int every;
-        std::vector<double> times;
-    } cases[] = {
-        {10, 20, 3, {10, 13, 16, 19, 20}},
-        {20, 10, 4, {20, 16, 12, 10}},
-        {5, 8, 1, {5, 6, 7, 8}},
-        {5, 5, 10, {5}},
-        {0, 9, 0, {0, 1, 2, 3, 4, 5, 6, 7, 8, 9}}, // fewer than one frame per point counts as one
-    };
-    for (const auto &c : cases) {
-        std::vector<double> times;
-        for (const PathPoint &p : tracking::KeyPoints(run(c.from, c.to), c.from, c.every)) times.push_back(p.time);
-        EXPECT_EQ(times, c.times) << c.from << ".." << c.to << " every " << c.every;
     }
 }
 
@@ -294,9 +241,9 @@ TEST_F(Tracker, TrackerListMakesAndRemovesTrackersAndRoundTripsThroughDocuments)
     EXPECT_FALSE(tracker->FindInput("Name2"));
     EXPECT_EQ(dynamic_cast<const Text &>(*tracker->FindInput("Name1")->ValueAt(0)).value, "Point 1");
 
-    ScriptVal list = ScriptVal::Table();
-    for (int n : {1, 2, 3}) list.Append(n);
-    ASSERT_TRUE(tracker->FindInput("TrackerList")->SetValue(MakeRef<ScriptValue>(list)));
+    // As `orvane set` gives it.
+    Input *list = tracker->FindInput("TrackerList");
+    ASSERT_EQ(ApplyInputValue(doc, list, InputValueFromText(doc, list, "{ 1, 2, 3 }")), "");
     ASSERT_TRUE(tracker->FindInput("Name3"));
     EXPECT_EQ(dynamic_cast<const Text &>(*tracker->FindInput("Name3")->ValueAt(0)).value, "Point 3");
     T::SetNumber(tracker, "Delete1", 1.0);
