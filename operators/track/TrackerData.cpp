@@ -13,6 +13,7 @@
 #include "host/flow/RenderTask.h"
 #include "host/flow/Request.h"
 #include "host/image/Image.h"
+#include "operators/track/TrackerInputs.h"
 
 namespace Orvane {
 namespace {
@@ -47,9 +48,7 @@ TrackerData::TrackerData(Operator *tool, int number, int page) : tool_(tool), nu
                  {InputExternal, 0}});
     enabled_ = add(Numbered("Enabled %d", number), Numbered("Enabled%d", number),
                    number_tags(CLSID_InputControl_Checkbox, 1.0));
-    delete_ = add(Numbered("Delete %d", number), Numbered("Delete%d", number),
-                  number_tags(CLSID_InputControl_Button, 0.0,
-                              {{InputExternal, 0}, {InputNotify, 1}, {InputInitialNotify, 0}, {InputPassive, 1}}));
+    delete_ = add(Numbered("Delete %d", number), Numbered("Delete%d", number), tracking::ButtonTags(page));
     bestMatch_ = add(point + " Best Match", prefix + "BestMatch",
                      number_tags(CLSID_InputControl_Slider, 0.0, {{InputExternal, 0}, {InputPassive, 1}}));
     TagList channel =

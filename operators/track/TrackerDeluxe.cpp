@@ -44,19 +44,6 @@ enum Operation { OpNone, OpMatchMove, OpCorner, OpPerspective };
 enum PivotType { PivotAverage, PivotSelected, PivotManual };
 enum Reference { RefSelectTime, RefStart, RefStartEnd, RefEnd };
 
-TagList Choice(int page, std::initializer_list<const char *> items, double def, OvID control) {
-    TagList tags{{LinkDataType, CLSID_DataType_Number},
-                 {InputControl, control},
-                 {ControlPage, page},
-                 {InputInteger, 1},
-                 {InputMinAllowed, 0.0},
-                 {InputMaxAllowed, static_cast<double>(items.size() - 1)},
-                 {InputDefault, def},
-                 {InputNotify, 1}};
-    for (const char *item : items) tags.Add({ListAddItem, item});
-    return tags;
-}
-
 TagList Checkbox(int page, double def) {
     return {{LinkDataType, CLSID_DataType_Number},
             {InputControl, CLSID_InputControl_Checkbox},
@@ -115,36 +102,28 @@ TrackerDeluxe::TrackerDeluxe(const Registry *reg, const ScriptVal &args, const T
 
     operationPage_ =
         AddControlPageTagList("Operation", {{PageIcon, static_cast<const void *>("Icons.Tools.Tabs.Operation")}});
-    operation_ =
-        AddInputTagList("Operation", "Operation",
-                        Choice(operationPage_, {"None", "Match Move", "Corner Positioning", "Perspective Positioning"},
-                               0.0, CLSID_InputControl_MultiButton));
-    merge_ = AddInputTagList(
-        "Merge", "Merge",
-        Choice(operationPage_, {"BG only", "FG only", "FG over BG", "BG over FG"}, 2.0, CLSID_InputControl_Combo));
+    operation_ = AddInputTagList(
+        "Operation", "Operation",
+        tracking::ChoiceTags(operationPage_, {"None", "Match Move", "Corner Positioning", "Perspective Positioning"},
+                             0.0, CLSID_InputControl_MultiButton));
+    merge_ = AddInputTagList("Merge", "Merge",
+                             tracking::ChoiceTags(operationPage_, {"BG only", "FG only", "FG over BG", "BG over FG"},
+                                                  2.0, CLSID_InputControl_Combo));
     SetCurrentPage(operationPage_);
     mergeInputs_ = std::make_unique<MergeInputs>(this, foreground_, 0);
-    mappingType_ = AddInputTagList("Mapping type", "MappingType",
-                                   Choice(operationPage_, {"Bi-Linear", "Perspective"}, 1.0, CLSID_InputControl_Combo));
-    auto button = [&](const char *name, const char *id) {
-        return AddInputTagList(name, id,
-                               {{LinkDataType, CLSID_DataType_Number},
-                                {InputControl, CLSID_InputControl_Button},
-                                {ControlPage, operationPage_},
-                                {InputExternal, 0},
-                                {InputNotify, 1},
-                                {InputInitialNotify, 0},
-                                {InputPassive, 1}});
-    };
-    rotateCw_ = button("Rotate Clockwise", "RotateClockwise");
-    rotateCcw_ = button("Rotate Counter-Clockwise", "RotateCounterClockwise");
+    mappingType_ = AddInputTagList(
+        "Mapping type", "MappingType",
+        tracking::ChoiceTags(operationPage_, {"Bi-Linear", "Perspective"}, 1.0, CLSID_InputControl_Combo));
+    rotateCw_ = AddInputTagList("Rotate Clockwise", "RotateClockwise", tracking::ButtonTags(operationPage_));
+    rotateCcw_ =
+        AddInputTagList("Rotate Counter-Clockwise", "RotateCounterClockwise", tracking::ButtonTags(operationPage_));
     position_ = AddInputTagList("Position", "Position", Checkbox(operationPage_, 1.0));
     rotation_ = AddInputTagList("Rotation", "Rotation", Checkbox(operationPage_, 1.0));
     scaling_ = AddInputTagList("Scaling", "Scaling", Checkbox(operationPage_, 1.0));
     flatten_ = AddInputTagList("Flatten Transform", "FlattenTransform", Checkbox(operationPage_, 0.0));
-    pivotType_ = AddInputTagList(
-        "Pivot type", "PivotType",
-        Choice(operationPage_, {"Tracker average", "Selected tracker", "Manual"}, 0.0, CLSID_InputControl_Combo));
+    pivotType_ = AddInputTagList("Pivot type", "PivotType",
+                                 tracking::ChoiceTags(operationPage_, {"Tracker average", "Selected tracker", "Manual"},
+                                                      0.0, CLSID_InputControl_Combo));
     tracker_ = AddInputTagList("Tracker", "Tracker",
                                {{LinkDataType, CLSID_DataType_Number},
                                 {InputControl, CLSID_InputControl_Combo},
@@ -159,9 +138,9 @@ TrackerDeluxe::TrackerDeluxe(const Registry *reg, const ScriptVal &args, const T
                               {ControlPage, operationPage_},
                               {InputDefaultX, 0.5},
                               {InputDefaultY, 0.5}});
-    reference_ = AddInputTagList(
-        "Reference", "Reference",
-        Choice(operationPage_, {"Select time", "Start", "Start & end", "End"}, 1.0, CLSID_InputControl_MultiButton));
+    reference_ = AddInputTagList("Reference", "Reference",
+                                 tracking::ChoiceTags(operationPage_, {"Select time", "Start", "Start & end", "End"},
+                                                      1.0, CLSID_InputControl_MultiButton));
     intermediate_ =
         AddInputTagList("Reference Intermediate Points", "ReferenceIntermediatePoints",
                         Slider(operationPage_, 0.0, 10.0, 0.0, {{InputMinAllowed, 0.0}, {InputInteger, 1}}));

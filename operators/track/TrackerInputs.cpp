@@ -7,47 +7,49 @@
 #include "operators/track/TrackerStep.h"
 
 namespace Orvane {
-namespace {
+namespace tracking {
 
-Input *AddButton(Operator *tool, int page, const char *name, const char *id, const char *icon) {
-    return tool->AddInputTagList(name, id,
-                                 {{LinkDataType, CLSID_DataType_Number},
-                                  {InputControl, CLSID_InputControl_Button},
-                                  {ButtonIcon, icon},
-                                  {ControlPage, page},
-                                  {InputExternal, 0},
-                                  {InputNotify, 1},
-                                  {InputInitialNotify, 0},
-                                  {InputPassive, 1}});
+TagList ButtonTags(int page, const char *icon) {
+    TagList tags{{LinkDataType, CLSID_DataType_Number},
+                 {InputControl, CLSID_InputControl_Button},
+                 {ControlPage, page},
+                 {InputExternal, 0},
+                 {InputNotify, 1},
+                 {InputInitialNotify, 0},
+                 {InputPassive, 1}};
+    if (icon) tags.Add({ButtonIcon, icon});
+    return tags;
 }
 
-Input *AddChoice(Operator *tool, int page, const char *name, const char *id, std::initializer_list<const char *> items,
-                 double def = 0.0) {
+TagList ChoiceTags(int page, std::initializer_list<const char *> items, double def, OvID control) {
     TagList tags{{LinkDataType, CLSID_DataType_Number},
-                 {InputControl, CLSID_InputControl_MultiButton},
+                 {InputControl, control},
                  {ControlPage, page},
                  {InputInteger, 1},
                  {InputMinAllowed, 0.0},
                  {InputMaxAllowed, static_cast<double>(items.size() - 1)},
-                 {InputDefault, def}};
+                 {InputDefault, def},
+                 {InputNotify, 1}};
     for (const char *item : items) tags.Add({ListAddItem, item});
-    return tool->AddInputTagList(name, id, tags);
+    return tags;
 }
 
-} // namespace
+} // namespace tracking
 
 TrackerInputs::TrackerInputs(Operator *tool) {
     page_ =
         tool->AddControlPageTagList("Trackers", {{PageIcon, static_cast<const void *>("Icons.Tools.Tabs.Tracker")}});
-    reverse_ = AddButton(tool, page_, "Track Reverse", "TrackReverse", "Icons.Tracker.ReverseTime");
-    bidirectional_ =
-        AddButton(tool, page_, "Track Fwd Then Reverse", "TrackBidirectional", "Icons.Tracker.TrackBidirectional");
-    forward_ = AddButton(tool, page_, "Track Forward", "TrackForward", "Icons.Tracker.ForwardTime");
-    reverseOne_ =
-        AddButton(tool, page_, "Track Reverse One Frame", "TrackReverseFromCurrentTime", "Icons.Tracker.ReverseFrame");
-    stop_ = AddButton(tool, page_, "Stop Tracking", "StopTracking", "Icons.Tracker.Stop");
-    forwardOne_ =
-        AddButton(tool, page_, "Track Forward One Frame", "TrackForwardFromCurrentTime", "Icons.Tracker.ForwardFrame");
+    reverse_ = tool->AddInputTagList("Track Reverse", "TrackReverse",
+                                     tracking::ButtonTags(page_, "Icons.Tracker.ReverseTime"));
+    bidirectional_ = tool->AddInputTagList("Track Fwd Then Reverse", "TrackBidirectional",
+                                           tracking::ButtonTags(page_, "Icons.Tracker.TrackBidirectional"));
+    forward_ = tool->AddInputTagList("Track Forward", "TrackForward",
+                                     tracking::ButtonTags(page_, "Icons.Tracker.ForwardTime"));
+    reverseOne_ = tool->AddInputTagList("Track Reverse One Frame", "TrackReverseFromCurrentTime",
+                                        tracking::ButtonTags(page_, "Icons.Tracker.ReverseFrame"));
+    stop_ = tool->AddInputTagList("Stop Tracking", "StopTracking", tracking::ButtonTags(page_, "Icons.Tracker.Stop"));
+    forwardOne_ = tool->AddInputTagList("Track Forward One Frame", "TrackForwardFromCurrentTime",
+                                        tracking::ButtonTags(page_, "Icons.Tracker.ForwardFrame"));
     framesPerPoint_ = tool->AddInputTagList("Frames Per Point", "FramesPerPathPoint",
                                             {{LinkDataType, CLSID_DataType_Number},
                                              {InputControl, CLSID_InputControl_Slider},
@@ -57,7 +59,9 @@ TrackerInputs::TrackerInputs(Operator *tool) {
                                              {InputSliderLow, 1.0},
                                              {InputSliderHigh, 10.0},
                                              {InputDefault, 1.0}});
-    adaptiveMode_ = AddChoice(tool, page_, "Adaptive Mode", "AdaptiveMode", {"None", "Every Frame", "Best match"});
+    adaptiveMode_ = tool->AddInputTagList(
+        "Adaptive Mode", "AdaptiveMode",
+        tracking::ChoiceTags(page_, {"None", "Every Frame", "Best match"}, 0.0, CLSID_InputControl_MultiButton));
     matchTolerance_ = tool->AddInputTagList("Match Tolerance", "MatchTolerance",
                                             {{LinkDataType, CLSID_DataType_Number},
                                              {InputControl, CLSID_InputControl_Slider},
@@ -68,7 +72,9 @@ TrackerInputs::TrackerInputs(Operator *tool) {
                                              {InputSliderHigh, 0.25},
                                              {InputDefault, 0.1},
                                              {ControlVisible, 0}});
-    pathCenter_ = AddChoice(tool, page_, "Path Center", "PathCenter", {"Pattern Center", "Track Center (Append)"});
+    pathCenter_ = tool->AddInputTagList(
+        "Path Center", "PathCenter",
+        tracking::ChoiceTags(page_, {"Pattern Center", "Track Center (Append)"}, 0.0, CLSID_InputControl_MultiButton));
 }
 
 TrackSettings TrackerInputs::Settings(const Request *req, bool tracking) const {

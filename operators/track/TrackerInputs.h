@@ -6,6 +6,9 @@
 //
 // Thread safety: made on the main thread in the tool's constructor; the
 // settings are read on the tool's render thread.
+#include <initializer_list>
+
+#include "host/core/TagList.h"
 #include "host/track/TrackPoint.h"
 
 namespace Orvane {
@@ -16,6 +19,13 @@ class Request;
 
 /// The runs the buttons start.
 enum class TrackRun { None, Forward, Reverse, Bidirectional, ForwardOneFrame, ReverseOneFrame, Stop };
+
+namespace tracking {
+/// The tags of a push button on `page` (with `icon` when given): it notifies and is not saved.
+TagList ButtonTags(int page, const char *icon = nullptr);
+/// The tags of a whole-number list control of `items` on `page`, default `def`.
+TagList ChoiceTags(int page, std::initializer_list<const char *> items, double def, OvID control);
+} // namespace tracking
 
 class TrackerInputs {
 public:
