@@ -350,9 +350,24 @@ bool TrackerDeluxe::RunTracking(double from, double to, RenderTask *task) {
 
 void TrackerDeluxe::CheckRequest(Request *req) {
     ThreadedOperator::CheckRequest(req);
-    if (!(req->GetFlags() & ReqFlagTrackStep) || req->GetPri() != input_->Priority() || req->IsPreCalc()) return;
+    if (req->GetPri() != input_->Priority() || req->IsPreCalc()) return;
+    const Output *asked = req->AskedOutput();
+    if (asked != output_ && !(req->GetFlags() & ReqFlagTrackStep) && !IsToolMotionOutput(asked)) {
+        // A tracker's own outputs come from its path alone.
+        req->SetInputData(input_, nullptr);
+        req->SetInputData(foreground_, nullptr);
+        return;
+    }
+    if (!(req->GetFlags() & ReqFlagTrackStep)) return;
     req->SetInputData(foreground_, nullptr); // a tracking step reads the Input only
     AskSearchAreas(req, input_, ListedTrackers());
+}
+
+bool TrackerDeluxe::IsToolMotionOutput(const Output *out) const {
+    for (const Output *o :
+         {steadyPosition_, unsteadyPosition_, steadyAxis_, steadySize_, unsteadySize_, steadyAngle_, unsteadyAngle_})
+        if (out == o) return true;
+    return false;
 }
 
 tracking::Motion TrackerDeluxe::MotionAt(Request *req, double aspect) const {

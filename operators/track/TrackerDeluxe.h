@@ -79,6 +79,8 @@ private:
     void SetTrackerList(const std::vector<int> &numbers);
     void ShowForOperation(int operation, int pivotType, int reference);
     void RefreshTrackerChoices();
+    /// Whether `out` is one of the tool's steady or unsteady outputs (they need the Input's frame).
+    bool IsToolMotionOutput(const Output *out) const;
     /// The motion of the enabled trackers from their reference to the request's time.
     tracking::Motion MotionAt(Request *req, double aspect) const;
     /// Operation "Match Move": the Merge choice with the motion, one resampling.

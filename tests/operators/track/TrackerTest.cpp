@@ -387,6 +387,20 @@ TEST_F(Tracker, MatchMoveSteadiesTheShotAtItsReference) {
                 {worst, std::fabs(double(a.R) - b.R), std::fabs(double(a.G) - b.G), std::fabs(double(a.A) - b.A)});
         }
     EXPECT_LT(worst, 1e-5);
+    // "FG only": a still Foreground moves with the shot, (2, -1) pixels a frame since frame 0.
+    const Ref<Image> still = T::PatternImage(MovingTexture::W, MovingTexture::H, 8, 9);
+    ASSERT_TRUE(tracker->FindInput("Foreground")->ConnectTo(T::AddImageSource(doc, "Still1", still)->Out()));
+    T::SetNumber(tracker, "Merge", 1);
+    const Ref<Image> moved = T::EvalImage(tracker, 3.0, o);
+    ASSERT_TRUE(moved) << T::ConsoleText(doc);
+    worst = 0.0;
+    for (int y = 8; y < MovingTexture::H - 8; ++y)
+        for (int x = 8; x < MovingTexture::W - 8; ++x) {
+            const FltPixel a = moved->GetFlt(x, y),
+                           b = still->GetFlt(x - 3 * MovingTexture::DX, y - 3 * MovingTexture::DY);
+            worst = std::max({worst, std::fabs(double(a.R) - b.R), std::fabs(double(a.B) - b.B)});
+        }
+    EXPECT_LT(worst, 1e-5);
 }
 
 TEST_F(Tracker, NoEnabledTrackerRefusesTheRun) {
