@@ -139,9 +139,15 @@ ImgRectI TrackerData::NeededRect(const Request *req, int width, int height) {
     std::lock_guard<std::recursive_mutex> lock(matcher_.Lock());
     const Pattern p = PatternAt(req, req->Time());
     if (!active_) {
-        // The pattern is taken from this frame and tracked in it: the search area around the pattern's centre.
+        // The pattern is taken from this frame and tracked in it: the search area around the pattern's centre, and
+        // the pattern itself with a pixel to spare (the matcher learns the pattern's size only when it takes it).
         matcher_.SetSearchArea(p.searchWidth, p.searchHeight);
-        return matcher_.GetSearchRect(width, height, p.x, p.y);
+        const double halfW = p.width * width / 2 + 1, halfH = p.height * height / 2 + 1;
+        const ImgRectI pattern(static_cast<int>(std::floor(p.x * width - halfW)),
+                               static_cast<int>(std::floor(p.y * height - halfH)),
+                               static_cast<int>(std::ceil(p.x * width + halfW)) + 1,
+                               static_cast<int>(std::ceil(p.y * height + halfH)) + 1);
+        return matcher_.GetSearchRect(width, height, p.x, p.y) | pattern;
     }
     return matcher_.GetSearchRect(width, height, last_.x, last_.y);
 }

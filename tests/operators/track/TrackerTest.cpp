@@ -139,8 +139,8 @@ TEST(MatchMove, FitRecoversAKnownMotionAndHonoursTheSwitches) {
     EXPECT_EQ(std::tuple(none.moveX, none.moveY, none.angle, none.scale), std::tuple(0.0, 0.0, 0.0, 1.0));
 }
 
-/// A 96 x 64 texture that moves by (2, -1) pixels a frame (wrapping around), and that aborts its render at
-/// `abortAt`; it notes the region asked of it on each pixel request.
+/// A 96 x 64 texture that moves by (2, -1) pixels a frame (wrapping around) within the region asked of it, and that
+/// aborts its render at `abortAt`; it notes the region asked of it on each pixel request.
 class MovingTexture : public ThreadedOperator {
 public:
     MovingTexture(const Registry *reg, const ScriptVal &args, const TagList &tags) : ThreadedOperator(reg, args, tags) {
@@ -158,8 +158,10 @@ public:
         Ref<Image> img = NewImageTagList({{ImgWidth, W}, {ImgHeight, H}, {ImgDepth, 8}});
         img->AllocScanLineData();
         const int sx = static_cast<int>(req->Time()) * DX, sy = static_cast<int>(req->Time()) * DY;
-        for (int y = 0; y < H; ++y)
-            for (int x = 0; x < W; ++x)
+        // Only the region asked for has the texture (the rest stays 0), so a tracker that asks too little fails.
+        const ImgRectI r = asked.back() & ImgRectI(0, 0, W, H);
+        for (int y = r.y0; y < r.y1; ++y)
+            for (int x = r.x0; x < r.x1; ++x)
                 img->PutFlt(x, y, texture->GetFlt(((x - sx) % W + W) % W, ((y - sy) % H + H) % H));
         req->SetOutputData(out_, img);
     }
