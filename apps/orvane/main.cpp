@@ -93,6 +93,22 @@ const Command kCommands[] = {
   --device D, --lenient as for render
   Exit: 0 picked and saved, 2 bad command line or document, 3 nothing picked.
 )"},
+    {"track", RunTrack, R"(orvane track FLOW TOOL [options]
+  Runs the trackers of a Tracker tool frame by frame, as its track buttons do,
+  and saves the flow with their paths (TrackedCenter<n> keys). Each enabled
+  tracker takes its pattern at the first frame of the run and follows it.
+  --frames SPEC         the frames to track over, as for render (default: the
+                        render range); the run covers its first to its last
+  --reverse             track backwards, from the last frame to the first
+  --bidirectional       track forwards to the last frame, then from the
+                        same start back to the first
+  --from T              the frame the run starts at (default: the first, or
+                        the last with --reverse)
+  --device D, --lenient as for render
+  Exit: 0 tracked and saved, 2 bad command line or document, 3 nothing
+  tracked (no tracker enabled, or no pattern found), 130 interrupted (what
+  was tracked is saved).
+)"},
     {"script", RunScript, R"(orvane script [options] FILE.lua [ARGS...]
   Runs a Lua script with the full Lua library, the script classes (EXRIO: OpenEXR
   files with several parts) and images (Image.New); arg[0] is FILE, arg[1]...

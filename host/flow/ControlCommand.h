@@ -1,7 +1,7 @@
 #pragma once
 // Commands that a viewer, or the command line, sends to a tool
-// (Operator::ControlCommand): today the select of a rectangle of the frame,
-// with which a keyer picks its colour ranges.
+// (Operator::ControlCommand): the select of a rectangle of the frame, with
+// which a keyer picks its colour ranges, and a tracking run.
 //
 // A select names its rectangle in frame fractions, x to the right and y up
 // from the frame's bottom-left corner, so that it means the same at any
@@ -18,6 +18,7 @@ namespace Orvane {
 
 enum ControlCommands : int {
     CCMD_Select = 1, ///< a rectangle of the frame was selected (picked)
+    CCMD_Track = 2,  ///< track frame by frame from CCMD_TrackFrom to CCMD_TrackTo and write the paths
 };
 
 /// CCMD_Select: the rectangle's edges in frame fractions (double).
@@ -29,6 +30,12 @@ constexpr Tag CCMD_SelectTop = 0x200d0003;
 constexpr Tag CCMD_Modifiers = 0x100d0000;
 /// The subtracting pick: the picked colours are taken out of the ranges.
 constexpr int CCMD_ModSubtract = 1;
+
+/// CCMD_Track: the run's first and last frames (double; the run goes backwards when To is before From).
+constexpr Tag CCMD_TrackFrom = 0x200d0010;
+constexpr Tag CCMD_TrackTo = 0x200d0011;
+/// CCMD_Track: the RenderTask the frames render in (pointer; its abort stops the run, keeping what was tracked).
+constexpr Tag CCMD_TrackTask = 0x600d0010;
 
 /// A selected rectangle in frame fractions.
 struct PickRect {

@@ -31,6 +31,7 @@ constexpr uint32_t ReqFlagPreCalc = 1u << 3;      ///< windows and domains only,
 constexpr uint32_t ReqFlagNoGPU = 1u << 5;        ///< the device must not be used
 constexpr uint32_t ReqFlagInteractive = 1u << 17; ///< an interactive view asks: Savers write only when armed
 constexpr uint32_t ReqFlagPreview = 1u << 18;     ///< a preview render: Savers never write
+constexpr uint32_t ReqFlagTrackStep = 1u << 19;   ///< a frame of a tracking run: trackers step on it
 constexpr uint32_t ReqFlagSkipRoI = 1u << 31;     ///< CheckRequest must leave regions alone
 /// Per-input flag: fetch this input for pre-calculation only.
 constexpr uint32_t InputFlagPreCalc = 8;
