@@ -138,7 +138,9 @@ int RunTrack(const std::vector<std::string> &args) {
         } else if (console.size() == seen) {
             throw CliError(ExitUsage, "track: " + a.tool + " (" + op->ClassID().Text() + ") has no trackers");
         } else {
-            std::fprintf(stderr, "ERROR: track: %s", console.back().c_str());
+            // Every line of the leg: a failing upstream tool says why before the tracker says it tracked nothing.
+            for (size_t i = seen; i < console.size(); ++i)
+                std::fprintf(stderr, "ERROR: track: %s", console[i].c_str());
         }
     }
     sigaction(SIGINT, &oldInt, nullptr);
