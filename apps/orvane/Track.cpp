@@ -139,8 +139,11 @@ int RunTrack(const std::vector<std::string> &args) {
             throw CliError(ExitUsage, "track: " + a.tool + " (" + op->ClassID().Text() + ") has no trackers");
         } else {
             // Every line of the leg: a failing upstream tool says why before the tracker says it tracked nothing.
-            for (size_t i = seen; i < console.size(); ++i)
-                std::fprintf(stderr, "ERROR: track: %s", console[i].c_str());
+            for (size_t i = seen; i < console.size(); ++i) {
+                const std::string &line = console[i];
+                std::fprintf(stderr, "ERROR: track: %s%s", line.c_str(),
+                             !line.empty() && line.back() == '\n' ? "" : "\n");
+            }
         }
     }
     sigaction(SIGINT, &oldInt, nullptr);
