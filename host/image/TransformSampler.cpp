@@ -5,6 +5,7 @@
 #include <cmath>
 #include <cstring>
 #include <new>
+#include <type_traits>
 #include <vector>
 
 #include "host/core/Parallel.h"
@@ -395,6 +396,22 @@ bool FixedWeights(const Kernel &k, double u, int k0, int n, float *w) {
     return true;
 }
 
+/// One output pixel from the taps at source position (u, v) with stretches
+/// (sx, sy), each tap mapped by the edge policy. Each thread reuses its tap
+/// buffers.
+template <ComponentType CT, int C>
+void SampleAt(Job &job, double u, double v, double sx, double sy, const float *canvas, FltPixel &out) {
+    thread_local std::vector<int> xi, yi;
+    thread_local std::vector<float> xw, yw;
+    xi.clear(), xw.clear(), yi.clear(), yw.clear();
+    const float xc = BuildTaps(u, sx, job.kernel, job.ax, xi, xw);
+    const float yc = BuildTaps(v, sy, job.kernel, job.ay, yi, yw);
+    float acc[C];
+    Gather<CT, C>::Pixel(job.rows.data(), xi.data(), xw.data(), static_cast<int>(xi.size()), xc, yi.data(), yw.data(),
+                         static_cast<int>(yi.size()), yc, canvas, acc);
+    Store<CT, C>(acc, out);
+}
+
 /// Any affine mapping: taps per output pixel. Where the filter is not
 /// stretched and every tap lies inside the data window (and the frame, for
 /// folding edges), the taps are a fixed run of ceil(2 x radius) columns and
@@ -416,14 +433,11 @@ template <ComponentType CT, int C> void RunGeneral(Job &job) {
     const std::pair<int, int> xs = inside(job.ax), ys = inside(job.ay);
     const int xLo = xs.first, xHi = xs.second, yLo = ys.first, yHi = ys.second;
     ForRows(job, [&](int y, FltPixel *out) {
-        thread_local std::vector<int> xi, yi;
-        thread_local std::vector<float> xw, yw;
         const double cy = y + 0.5;
         for (int i = 0; i < dw.Width(); ++i) {
             const double cx = dw.x0 + i + 0.5;
             const double u = m(0, 0) * cx + m(0, 1) * cy + m(0, 2);
             const double v = m(1, 0) * cx + m(1, 1) * cy + m(1, 2);
-            float acc[C];
             if (n > 0) {
                 // Taps k with |k + 0.5 - u| < radius: k0 .. k0 + n - 1.
                 const int k0 = static_cast<int>(std::floor(u - 0.5 - radius)) + 1;
@@ -444,12 +458,7 @@ template <ComponentType CT, int C> void RunGeneral(Job &job) {
                     continue;
                 }
             }
-            xi.clear(), xw.clear(), yi.clear(), yw.clear();
-            const float xc = BuildTaps(u, job.stretchX, job.kernel, job.ax, xi, xw);
-            const float yc = BuildTaps(v, job.stretchY, job.kernel, job.ay, yi, yw);
-            Gather<CT, C>::Pixel(job.rows.data(), xi.data(), xw.data(), static_cast<int>(xi.size()), xc, yi.data(),
-                                 yw.data(), static_cast<int>(yi.size()), yc, canvas, acc);
-            Store<CT, C>(acc, out[i]);
+            SampleAt<CT, C>(job, u, v, job.stretchX, job.stretchY, canvas, out[i]);
         }
     });
 }
@@ -500,6 +509,27 @@ void RunCopy(Job &job) {
         8);
 }
 
+/// Calls fn(CT, C) with the source's component type and channel count as
+/// integral constants, so that one templated path serves every format.
+template <class Fn> void ForFormat(const Image &src, const Fn &fn) {
+    using I8 = std::integral_constant<ComponentType, ComponentType::Int8>;
+    using I16 = std::integral_constant<ComponentType, ComponentType::Int16>;
+    using F16 = std::integral_constant<ComponentType, ComponentType::Flt16>;
+    using F32 = std::integral_constant<ComponentType, ComponentType::Flt32>;
+    const auto channels = [&](auto ct) {
+        if (src.Format().channels == 4)
+            fn(ct, std::integral_constant<int, 4>{});
+        else
+            fn(ct, std::integral_constant<int, 1>{});
+    };
+    switch (src.Format().type) {
+    case ComponentType::Int8: channels(I8{}); break;
+    case ComponentType::Int16: channels(I16{}); break;
+    case ComponentType::Flt16: channels(F16{}); break;
+    default: channels(F32{}); break;
+    }
+}
+
 /// Smallest w a projective mapping accepts: nearer the horizon, positions
 /// run off beyond any image.
 constexpr double kMinW = 1e-12;
@@ -516,8 +546,6 @@ template <ComponentType CT, int C> void RunMapped(Job &job, const PointMapping &
         return std::isfinite(s) ? std::clamp(s, 1.0, MaxTransformStretch) : MaxTransformStretch;
     };
     ForRows(job, [&](int y, FltPixel *out) {
-        thread_local std::vector<int> xi, yi;
-        thread_local std::vector<float> xw, yw;
         const double cy = y + 0.5;
         for (int i = 0; i < dw.Width(); ++i) {
             const double cx = dw.x0 + i + 0.5;
@@ -539,32 +567,13 @@ template <ComponentType CT, int C> void RunMapped(Job &job, const PointMapping &
                 sx = stretch(dudx, dudy);
                 sy = stretch(dvdx, dvdy);
             }
-            xi.clear(), xw.clear(), yi.clear(), yw.clear();
-            const float xc = BuildTaps(u, sx, job.kernel, job.ax, xi, xw);
-            const float yc = BuildTaps(v, sy, job.kernel, job.ay, yi, yw);
-            float acc[C];
-            Gather<CT, C>::Pixel(job.rows.data(), xi.data(), xw.data(), static_cast<int>(xi.size()), xc, yi.data(),
-                                 yw.data(), static_cast<int>(yi.size()), yc, canvas, acc);
-            Store<CT, C>(acc, out[i]);
+            SampleAt<CT, C>(job, u, v, sx, sy, canvas, out[i]);
         }
     });
 }
 
 void RunMapped(Job &job, const PointMapping &map) {
-    const PixelFormat &f = job.src->Format();
-    const bool rgba = f.channels == 4;
-    switch (f.type) {
-    case ComponentType::Int8:
-        rgba ? RunMapped<ComponentType::Int8, 4>(job, map) : RunMapped<ComponentType::Int8, 1>(job, map);
-        break;
-    case ComponentType::Int16:
-        rgba ? RunMapped<ComponentType::Int16, 4>(job, map) : RunMapped<ComponentType::Int16, 1>(job, map);
-        break;
-    case ComponentType::Flt16:
-        rgba ? RunMapped<ComponentType::Flt16, 4>(job, map) : RunMapped<ComponentType::Flt16, 1>(job, map);
-        break;
-    default: rgba ? RunMapped<ComponentType::Flt32, 4>(job, map) : RunMapped<ComponentType::Flt32, 1>(job, map); break;
-    }
+    ForFormat(*job.src, [&](auto ct, auto c) { RunMapped<decltype(ct)::value, decltype(c)::value>(job, map); });
 }
 
 /// The w of (x, y) through a matrix.
@@ -606,20 +615,7 @@ template <ComponentType CT, int C> void RunFiltered(Job &job) {
 }
 
 void RunFiltered(Job &job) {
-    const PixelFormat &f = job.src->Format();
-    const bool rgba = f.channels == 4;
-    switch (f.type) {
-    case ComponentType::Int8:
-        rgba ? RunFiltered<ComponentType::Int8, 4>(job) : RunFiltered<ComponentType::Int8, 1>(job);
-        break;
-    case ComponentType::Int16:
-        rgba ? RunFiltered<ComponentType::Int16, 4>(job) : RunFiltered<ComponentType::Int16, 1>(job);
-        break;
-    case ComponentType::Flt16:
-        rgba ? RunFiltered<ComponentType::Flt16, 4>(job) : RunFiltered<ComponentType::Flt16, 1>(job);
-        break;
-    default: rgba ? RunFiltered<ComponentType::Flt32, 4>(job) : RunFiltered<ComponentType::Flt32, 1>(job); break;
-    }
+    ForFormat(*job.src, [&](auto ct, auto c) { RunFiltered<decltype(ct)::value, decltype(c)::value>(job); });
 }
 
 } // namespace xfsampler
