@@ -9,6 +9,7 @@
 #include "host/flow/ControlCommand.h"
 #include "host/flow/DataTypes.h"
 #include "host/flow/Engine.h"
+#include "host/flow/InputAt.h"
 #include "host/flow/InputValue.h"
 #include "host/flow/OrvaneDoc.h"
 #include "host/flow/RenderTask.h"
@@ -394,7 +395,15 @@ void TrackerDeluxe::CheckRequest(Request *req) {
         req->SetInputData(foreground_, nullptr);
         return;
     }
-    if (!(req->GetFlags() & ReqFlagTrackStep)) return;
+    if (!(req->GetFlags() & ReqFlagTrackStep)) {
+        // The corner maps may read any part of either image, whatever region is asked: whole frames.
+        const int operation = static_cast<int>(std::lround(InputNumberAt(req, operation_, req->Time(), OpNone)));
+        if ((operation == OpCorner || operation == OpPerspective) && !(req->GetFlags() & ReqFlagSkipRoI)) {
+            req->SetInputRoI(input_, nullptr);
+            req->SetInputRoI(foreground_, nullptr);
+        }
+        return;
+    }
     req->SetInputData(foreground_, nullptr); // a tracking step reads the Input only
     AskSearchAreas(req, input_, ListedTrackers());
 }

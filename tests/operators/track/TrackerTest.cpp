@@ -520,6 +520,22 @@ TEST_F(Tracker, CornerPositioningPinsTheForegroundAndPerspectiveTakesItBack) {
         }
     EXPECT_LT(worst, 5e-3); // foreground pixels: linear filtering twice of a linear ramp
 
+    // Un-warping a corner of the frame reads the Input far from that corner: a small region asked of the tool gives
+    // the same pixels as the whole frame (the texture renders only what is asked of it).
+    T::SetNumbers(tracker, {{"Operation", 3}, {"Merge", 0}});
+    const ImgRectI corner(0, 0, 12, 12);
+    EvalOptions small = o;
+    small.roi = ImageDomain(corner);
+    const Ref<Image> whole = T::EvalImage(tracker, 0.0, o), part = T::EvalImage(tracker, 0.0, small);
+    ASSERT_TRUE(whole && part) << T::ConsoleText(doc);
+    worst = 0.0;
+    for (int y = 0; y < 12; ++y)
+        for (int x = 0; x < 12; ++x) {
+            const FltPixel a = whole->GetFlt(x, y), b = part->GetFlt(x, y);
+            worst = std::max({worst, std::fabs(double(a.R) - b.R), std::fabs(double(a.G) - b.G), double(a.A == 0)});
+        }
+    EXPECT_EQ(worst, 0.0);
+
     // Fewer than four trackers with paths: one console line, no picture.
     undo->FindInput("TrackedCenter4")->ResetValue();
     EXPECT_FALSE(T::EvalImage(undo, 0.0, o));
