@@ -687,13 +687,12 @@ ImgRectI TransformSourceWindow(const ImgRectI &outWindow, const Matrix3 &sourceT
         // reach at the largest stretch among them (the stretch of a
         // projective map peaks at a corner of a region in front of its
         // horizon). A corner at or beyond the horizon reads without bound.
-        Matrix3 m;
+        // Scaled so that the window's centre has w > 0: all four corners
+        // then have w > 0 unless the horizon crosses the window.
+        Matrix3 m = inv;
+        if (WOf(m, 0.5 * (outWindow.x0 + outWindow.x1), 0.5 * (outWindow.y0 + outWindow.y1)) < 0.0)
+            for (double &e : m.m) e = -e;
         double X0, Y0, X1, Y1;
-        if (!ProjectiveMapping::Facing(inv, 0.5 * (outWindow.x0 + outWindow.x1), 0.5 * (outWindow.y0 + outWindow.y1),
-                                       m))
-            return ImgRectI();
-        // Facing chose the side of the window's centre as seen from the
-        // source; what matters here is that the corners lie in front.
         if (!ProjectiveBox(m, outWindow.x0, outWindow.y0, outWindow.x1, outWindow.y1, X0, Y0, X1, Y1)) return kEndless;
         double sMax = 1.0;
         const double xs[2] = {static_cast<double>(outWindow.x0), static_cast<double>(outWindow.x1)};
