@@ -8,6 +8,10 @@
 //                                    diagonal path), the filter stretched by 2.
 //   Transform/UHDMove                moved by whole pixels (the copy path).
 //   Transform/UHDRotateInt8/Linear   the rotation of an 8-bit frame.
+//   Transform/UHDKeystone/<filter>   a projective matrix (the top edge
+//                                    narrowed to 80 %): taps per pixel with
+//                                    the divide by w and the stretch from the
+//                                    local Jacobian (the mapped path).
 //   Transform/ToolChain              two Transform tools in a flow (15 and 10
 //                                    degrees, linear) rendered from outside,
 //                                    cache off: one resampling for the chain.
@@ -23,6 +27,7 @@
 #include "bench/PeerSupport.h"
 #include "host/core/Tags.h"
 #include "host/image/NewImage.h"
+#include "host/image/QuadMap.h"
 #include "host/image/TransformMatrix.h"
 
 namespace Orvane::Bench {
@@ -36,14 +41,9 @@ const char *FilterName(int filter) {
     }
 }
 
-void Apply(benchmark::State &state, Image *src, const TagList &geometry) {
-    const int filter = static_cast<int>(state.range(0));
-    state.SetLabel(FilterName(filter));
-    TagList tags = geometry;
-    tags.Set({XfFilter, filter});
-    auto tm = MakeRef<TransformMatrix>(src);
-    tm->ImageConcatenateTagList(tags);
-    const ImgRectI frame(0, 0, src->Width(), src->Height());
+/// Makes the pixels of `tm` over its frame in each round.
+void Render(benchmark::State &state, const TransformMatrix *tm) {
+    const ImgRectI frame(0, 0, tm->Width(), tm->Height());
     for (auto _ : state) {
         Ref<Image> out = tm->ApplyTransformTagList({{ImgDataWindow, &frame}});
         if (!out) {
@@ -53,6 +53,34 @@ void Apply(benchmark::State &state, Image *src, const TagList &geometry) {
         benchmark::DoNotOptimize(out.Get());
     }
     ReportPixels(state);
+}
+
+void Apply(benchmark::State &state, Image *src, const TagList &geometry) {
+    const int filter = static_cast<int>(state.range(0));
+    state.SetLabel(FilterName(filter));
+    TagList tags = geometry;
+    tags.Set({XfFilter, filter});
+    auto tm = MakeRef<TransformMatrix>(src);
+    tm->ImageConcatenateTagList(tags);
+    Render(state, tm.Get());
+}
+
+void BM_Keystone(benchmark::State &state) {
+    const int filter = static_cast<int>(state.range(0));
+    state.SetLabel(FilterName(filter));
+    Image *src = UhdFrame().Get();
+    const double W = src->Width(), H = src->Height();
+    const QuadPoint frame[4] = {{0, 0}, {W, 0}, {W, H}, {0, H}};
+    const QuadPoint keystone[4] = {{0, 0}, {W, 0}, {0.9 * W, H}, {0.1 * W, H}};
+    Matrix3 m;
+    if (!HomographyFromPoints(frame, keystone, m)) {
+        state.SkipWithError("no homography");
+        return;
+    }
+    auto tm = MakeRef<TransformMatrix>(src);
+    tm->ImageConcatenateTagList({{XfFilter, filter}});
+    tm->SetSourceToOutput(m);
+    Render(state, tm.Get());
 }
 
 void BM_Rotate(benchmark::State &state) { Apply(state, UhdFrame().Get(), {{XfAngle, 15.0}}); }
@@ -90,6 +118,7 @@ XF_ROW(BM_Rotate, "Transform/UHDRotate")->Arg(RszLinear)->Arg(RszCatmullRom)->Ar
 XF_ROW(BM_Shrink, "Transform/UHDShrink")->Arg(RszLinear)->Arg(RszLanczos);
 XF_ROW(BM_Move, "Transform/UHDMove")->Arg(RszLinear);
 XF_ROW(BM_RotateInt8, "Transform/UHDRotateInt8")->Arg(RszLinear);
+XF_ROW(BM_Keystone, "Transform/UHDKeystone")->Arg(RszLinear)->Arg(RszLanczos);
 BENCHMARK(BM_ToolChain)->Name("Transform/ToolChain")->UseRealTime()->Unit(benchmark::kMillisecond);
 
 const bool kPeersRegistered = [] {

@@ -1,8 +1,8 @@
 #pragma once
 // Matrix3: a 3x3 matrix acting on column vectors (x, y, 1), the geometry of
 // the transform chain (TransformMatrix) and of the transform sampler.
-// Affine in practice; the last row is kept so that a projective step can
-// join later. Composition reads right to left: (A * B) maps by B, then by A.
+// Affine or projective (a last row other than (0, 0, 1): Apply divides by
+// w). Composition reads right to left: (A * B) maps by B, then by A.
 //
 // Thread safety: a plain value.
 #include <array>

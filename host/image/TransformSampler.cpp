@@ -5,12 +5,14 @@
 #include <cmath>
 #include <cstring>
 #include <new>
+#include <type_traits>
 #include <vector>
 
 #include "host/core/Parallel.h"
 #include "host/image/Half.h"
 #include "host/image/Image.h"
 #include "host/image/PixelConvert.h"
+#include "host/image/PointMapping.h"
 
 namespace Orvane {
 namespace xfsampler {
@@ -394,6 +396,22 @@ bool FixedWeights(const Kernel &k, double u, int k0, int n, float *w) {
     return true;
 }
 
+/// One output pixel from the taps at source position (u, v) with stretches
+/// (sx, sy), each tap mapped by the edge policy. Each thread reuses its tap
+/// buffers.
+template <ComponentType CT, int C>
+void SampleAt(Job &job, double u, double v, double sx, double sy, const float *canvas, FltPixel &out) {
+    thread_local std::vector<int> xi, yi;
+    thread_local std::vector<float> xw, yw;
+    xi.clear(), xw.clear(), yi.clear(), yw.clear();
+    const float xc = BuildTaps(u, sx, job.kernel, job.ax, xi, xw);
+    const float yc = BuildTaps(v, sy, job.kernel, job.ay, yi, yw);
+    float acc[C];
+    Gather<CT, C>::Pixel(job.rows.data(), xi.data(), xw.data(), static_cast<int>(xi.size()), xc, yi.data(), yw.data(),
+                         static_cast<int>(yi.size()), yc, canvas, acc);
+    Store<CT, C>(acc, out);
+}
+
 /// Any affine mapping: taps per output pixel. Where the filter is not
 /// stretched and every tap lies inside the data window (and the frame, for
 /// folding edges), the taps are a fixed run of ceil(2 x radius) columns and
@@ -415,14 +433,11 @@ template <ComponentType CT, int C> void RunGeneral(Job &job) {
     const std::pair<int, int> xs = inside(job.ax), ys = inside(job.ay);
     const int xLo = xs.first, xHi = xs.second, yLo = ys.first, yHi = ys.second;
     ForRows(job, [&](int y, FltPixel *out) {
-        thread_local std::vector<int> xi, yi;
-        thread_local std::vector<float> xw, yw;
         const double cy = y + 0.5;
         for (int i = 0; i < dw.Width(); ++i) {
             const double cx = dw.x0 + i + 0.5;
             const double u = m(0, 0) * cx + m(0, 1) * cy + m(0, 2);
             const double v = m(1, 0) * cx + m(1, 1) * cy + m(1, 2);
-            float acc[C];
             if (n > 0) {
                 // Taps k with |k + 0.5 - u| < radius: k0 .. k0 + n - 1.
                 const int k0 = static_cast<int>(std::floor(u - 0.5 - radius)) + 1;
@@ -443,12 +458,7 @@ template <ComponentType CT, int C> void RunGeneral(Job &job) {
                     continue;
                 }
             }
-            xi.clear(), xw.clear(), yi.clear(), yw.clear();
-            const float xc = BuildTaps(u, job.stretchX, job.kernel, job.ax, xi, xw);
-            const float yc = BuildTaps(v, job.stretchY, job.kernel, job.ay, yi, yw);
-            Gather<CT, C>::Pixel(job.rows.data(), xi.data(), xw.data(), static_cast<int>(xi.size()), xc, yi.data(),
-                                 yw.data(), static_cast<int>(yi.size()), yc, canvas, acc);
-            Store<CT, C>(acc, out[i]);
+            SampleAt<CT, C>(job, u, v, job.stretchX, job.stretchY, canvas, out[i]);
         }
     });
 }
@@ -499,6 +509,104 @@ void RunCopy(Job &job) {
         8);
 }
 
+/// Calls fn(CT, C) with the source's component type and channel count as
+/// integral constants, so that one templated path serves every format.
+template <class Fn> void ForFormat(const Image &src, const Fn &fn) {
+    using I8 = std::integral_constant<ComponentType, ComponentType::Int8>;
+    using I16 = std::integral_constant<ComponentType, ComponentType::Int16>;
+    using F16 = std::integral_constant<ComponentType, ComponentType::Flt16>;
+    using F32 = std::integral_constant<ComponentType, ComponentType::Flt32>;
+    const auto channels = [&](auto ct) {
+        if (src.Format().channels == 4)
+            fn(ct, std::integral_constant<int, 4>{});
+        else
+            fn(ct, std::integral_constant<int, 1>{});
+    };
+    switch (src.Format().type) {
+    case ComponentType::Int8: channels(I8{}); break;
+    case ComponentType::Int16: channels(I16{}); break;
+    case ComponentType::Flt16: channels(F16{}); break;
+    default: channels(F32{}); break;
+    }
+}
+
+/// Smallest w a projective mapping accepts: nearer the horizon, positions
+/// run off beyond any image.
+constexpr double kMinW = 1e-12;
+
+/// Any point mapping: per output pixel the source position, the stretch from
+/// the mapping's differences over one output pixel, then taps as the general
+/// path builds them.
+template <ComponentType CT, int C> void RunMapped(Job &job, const PointMapping &map) {
+    const ImgRectI dw = job.dst->DataWindow();
+    const float canvas[4] = {C == 4 ? job.canvas.R : job.canvas.A, job.canvas.G, job.canvas.B, job.canvas.A};
+    const bool nearest = job.kernel.Filter() == RszNearest;
+    auto stretch = [](double a, double b) {
+        const double s = std::hypot(a, b);
+        return std::isfinite(s) ? std::clamp(s, 1.0, MaxTransformStretch) : MaxTransformStretch;
+    };
+    ForRows(job, [&](int y, FltPixel *out) {
+        const double cy = y + 0.5;
+        for (int i = 0; i < dw.Width(); ++i) {
+            const double cx = dw.x0 + i + 0.5;
+            double u, v;
+            if (!map.Map(cx, cy, u, v) || !std::isfinite(u) || !std::isfinite(v)) {
+                Store<CT, C>(canvas, out[i]);
+                continue;
+            }
+            double sx = 1.0, sy = 1.0;
+            if (!nearest) {
+                // Central differences over one output pixel; one-sided where a neighbour has no source.
+                double ux0, vx0, ux1, vx1, uy0, vy0, uy1, vy1;
+                const bool l = map.Map(cx - 0.5, cy, ux0, vx0), r = map.Map(cx + 0.5, cy, ux1, vx1);
+                const bool d = map.Map(cx, cy - 0.5, uy0, vy0), t = map.Map(cx, cy + 0.5, uy1, vy1);
+                const double dudx = l && r ? ux1 - ux0 : r ? 2 * (ux1 - u) : l ? 2 * (u - ux0) : 0.0;
+                const double dvdx = l && r ? vx1 - vx0 : r ? 2 * (vx1 - v) : l ? 2 * (v - vx0) : 0.0;
+                const double dudy = d && t ? uy1 - uy0 : t ? 2 * (uy1 - u) : d ? 2 * (u - uy0) : 0.0;
+                const double dvdy = d && t ? vy1 - vy0 : t ? 2 * (vy1 - v) : d ? 2 * (v - vy0) : 0.0;
+                sx = stretch(dudx, dudy);
+                sy = stretch(dvdx, dvdy);
+            }
+            SampleAt<CT, C>(job, u, v, sx, sy, canvas, out[i]);
+        }
+    });
+}
+
+void RunMapped(Job &job, const PointMapping &map) {
+    ForFormat(*job.src, [&](auto ct, auto c) { RunMapped<decltype(ct)::value, decltype(c)::value>(job, map); });
+}
+
+/// The w of (x, y) through a matrix.
+double WOf(const Matrix3 &m, double x, double y) { return m(2, 0) * x + m(2, 1) * y + m(2, 2); }
+
+/// For a projective `m`: the bounding box of the corners of [x0, x1] x
+/// [y0, y1] mapped through it, or false when a corner is endless or at or
+/// beyond the horizon (the box then has no bound).
+bool ProjectiveBox(const Matrix3 &m, double x0, double y0, double x1, double y1, double &ox0, double &oy0, double &ox1,
+                   double &oy1) {
+    const double big = static_cast<double>(DomainEndless);
+    if (std::fabs(x0) >= big || std::fabs(x1) >= big || std::fabs(y0) >= big || std::fabs(y1) >= big) return false;
+    const double xs[2] = {x0, x1}, ys[2] = {y0, y1};
+    ox0 = oy0 = HUGE_VAL;
+    ox1 = oy1 = -HUGE_VAL;
+    for (double x : xs)
+        for (double y : ys) {
+            if (WOf(m, x, y) <= kMinW) return false;
+            double u, v;
+            m.Apply(x, y, u, v);
+            ox0 = std::min(ox0, u), ox1 = std::max(ox1, u);
+            oy0 = std::min(oy0, v), oy1 = std::max(oy1, v);
+        }
+    return true;
+}
+
+/// The whole pixels covering a real box grown by g on each side (endless
+/// past the int range).
+ImgRectI CoverBox(double x0, double y0, double x1, double y1, double g) {
+    return ImgRectI(ClampToInt(std::floor(x0 - g)), ClampToInt(std::floor(y0 - g)), ClampToInt(std::ceil(x1 + g)),
+                    ClampToInt(std::ceil(y1 + g)));
+}
+
 template <ComponentType CT, int C> void RunFiltered(Job &job) {
     if (job.map(0, 1) == 0.0 && job.map(1, 0) == 0.0)
         RunDiagonal<CT, C>(job);
@@ -507,20 +615,7 @@ template <ComponentType CT, int C> void RunFiltered(Job &job) {
 }
 
 void RunFiltered(Job &job) {
-    const PixelFormat &f = job.src->Format();
-    const bool rgba = f.channels == 4;
-    switch (f.type) {
-    case ComponentType::Int8:
-        rgba ? RunFiltered<ComponentType::Int8, 4>(job) : RunFiltered<ComponentType::Int8, 1>(job);
-        break;
-    case ComponentType::Int16:
-        rgba ? RunFiltered<ComponentType::Int16, 4>(job) : RunFiltered<ComponentType::Int16, 1>(job);
-        break;
-    case ComponentType::Flt16:
-        rgba ? RunFiltered<ComponentType::Flt16, 4>(job) : RunFiltered<ComponentType::Flt16, 1>(job);
-        break;
-    default: rgba ? RunFiltered<ComponentType::Flt32, 4>(job) : RunFiltered<ComponentType::Flt32, 1>(job); break;
-    }
+    ForFormat(*job.src, [&](auto ct, auto c) { RunFiltered<decltype(ct)::value, decltype(c)::value>(job); });
 }
 
 } // namespace xfsampler
@@ -556,6 +651,21 @@ ImgRectI TransformedWindow(const ImgRectI &srcWindow, const Matrix3 &sourceToOut
     Matrix3 inv;
     if (!sourceToOutput.Invert(inv)) return ImgRectI();
     if (sampling.edges != EdgeCanvas) return kEndless;
+    if (!sourceToOutput.IsAffine()) {
+        // The source window grown by the filter's reach in source pixels,
+        // mapped, plus the reach in output pixels where the map shrinks.
+        // With a corner beyond the horizon the image runs off without end.
+        Matrix3 m;
+        if (srcWindow.IsNull()) return ImgRectI();
+        const double reach = ResizeFilterSupport(ValidResizeFilter(sampling.filter)) + 1.0;
+        double X0, Y0, X1, Y1;
+        if (!ProjectiveMapping::Facing(sourceToOutput, 0.5 * (srcWindow.x0 + srcWindow.x1),
+                                       0.5 * (srcWindow.y0 + srcWindow.y1), m) ||
+            !ProjectiveBox(m, srcWindow.x0 - reach, srcWindow.y0 - reach, srcWindow.x1 + reach, srcWindow.y1 + reach,
+                           X0, Y0, X1, Y1))
+            return kEndless;
+        return CoverBox(X0, Y0, X1, Y1, reach);
+    }
     // The copy path moves pixel centres onto pixel centres.
     if (IsPixelPermutation(inv)) return MapCentres(srcWindow, sourceToOutput, 0.0, 0.0, true);
     // A tap at k carries weight while |k + 0.5 - u| < radius (nearest and
@@ -572,6 +682,37 @@ ImgRectI TransformSourceWindow(const ImgRectI &outWindow, const Matrix3 &sourceT
     using namespace xfsampler;
     Matrix3 inv;
     if (!sourceToOutput.Invert(inv) || outWindow.IsNull()) return ImgRectI();
+    if (!inv.IsAffine()) {
+        // The output window's corners in the source, grown by the filter's
+        // reach at the largest stretch among them (the stretch of a
+        // projective map peaks at a corner of a region in front of its
+        // horizon). A corner at or beyond the horizon reads without bound.
+        // Scaled so that the window's centre has w > 0: all four corners
+        // then have w > 0 unless the horizon crosses the window.
+        Matrix3 m = inv;
+        if (WOf(m, 0.5 * (outWindow.x0 + outWindow.x1), 0.5 * (outWindow.y0 + outWindow.y1)) < 0.0)
+            for (double &e : m.m) e = -e;
+        double X0, Y0, X1, Y1;
+        if (!ProjectiveBox(m, outWindow.x0, outWindow.y0, outWindow.x1, outWindow.y1, X0, Y0, X1, Y1)) return kEndless;
+        double sMax = 1.0;
+        const double xs[2] = {static_cast<double>(outWindow.x0), static_cast<double>(outWindow.x1)};
+        const double ys[2] = {static_cast<double>(outWindow.y0), static_cast<double>(outWindow.y1)};
+        for (double x : xs)
+            for (double y : ys) {
+                const double w = WOf(m, x, y);
+                Matrix3 local = m; // the Jacobian at (x, y): (A - p c^T) / w
+                double u, v;
+                m.Apply(x, y, u, v);
+                for (int c = 0; c < 2; ++c) {
+                    local(0, c) = (m(0, c) - u * m(2, c)) / w;
+                    local(1, c) = (m(1, c) - v * m(2, c)) / w;
+                }
+                double sx, sy;
+                TransformStretch(local, sampling.filter, sx, sy);
+                sMax = std::max({sMax, sx, sy});
+            }
+        return CoverBox(X0, Y0, X1, Y1, ResizeFilterSupport(sampling.filter) * sMax + 0.5);
+    }
     if (IsPixelPermutation(inv)) return MapCentres(outWindow, inv, 0.0, 0.0, true);
     double sx, sy;
     TransformStretch(inv, sampling.filter, sx, sy);
@@ -593,7 +734,13 @@ ImgRectI TransformSourceWindow(const ImgRectI &outWindow, const Matrix3 &sourceT
 bool TransformImage(const Image &src, Image &dst, const Matrix3 &outputToSource, const TransformSampling &sampling,
                     const std::atomic<bool> *abort) {
     using namespace xfsampler;
-    if (!outputToSource.IsAffine()) return false;
+    if (!outputToSource.IsAffine()) {
+        // Projective: the side of the source frame's centre is in front.
+        Matrix3 facing;
+        const ImgRectI f = src.Frame();
+        if (!ProjectiveMapping::Facing(outputToSource, 0.5 * (f.x0 + f.x1), 0.5 * (f.y0 + f.y1), facing)) return false;
+        return MapImage(src, dst, ProjectiveMapping(facing), sampling, abort);
+    }
     dst.SetCanvasColor(src.GetCanvasColor());
     if (src.IsNoData() || dst.IsNoData() || dst.DataWindow().IsNull()) return true;
     if (!dst.AllocScanLineData()) return false;
@@ -603,6 +750,45 @@ bool TransformImage(const Image &src, Image &dst, const Matrix3 &outputToSource,
             RunCopy(job);
         else
             RunFiltered(job);
+        return !job.stopped.load();
+    } catch (const std::bad_alloc &) {
+        return false;
+    }
+}
+
+bool ProjectiveMapping::Map(double x, double y, double &u, double &v) const {
+    const double w = xfsampler::WOf(m_, x, y);
+    if (!(w > xfsampler::kMinW)) return false;
+    u = (m_(0, 0) * x + m_(0, 1) * y + m_(0, 2)) / w;
+    v = (m_(1, 0) * x + m_(1, 1) * y + m_(1, 2)) / w;
+    return true;
+}
+
+bool ProjectiveMapping::Facing(const Matrix3 &outputToSource, double sx, double sy, Matrix3 &out) {
+    // An output point o maps to H o / w; through the inverse that source
+    // point comes back with w' = 1 / w. So the output points whose source
+    // lies on the side of (sx, sy) are those where w has the sign of the
+    // inverse's w at (sx, sy).
+    Matrix3 inv;
+    out = outputToSource;
+    if (!outputToSource.Invert(inv)) return false;
+    const double w = xfsampler::WOf(inv, sx, sy);
+    if (w == 0.0 || !std::isfinite(w)) return false;
+    if (w < 0.0)
+        for (double &e : out.m) e = -e;
+    return true;
+}
+
+bool MapImage(const Image &src, Image &dst, const PointMapping &outputToSource, const TransformSampling &sampling,
+              const std::atomic<bool> *abort) {
+    using namespace xfsampler;
+    dst.SetCanvasColor(src.GetCanvasColor());
+    if (src.IsNoData() || dst.IsNoData() || dst.DataWindow().IsNull()) return true;
+    if (!dst.AllocScanLineData()) return false;
+    try {
+        // The matrix is unused by the mapped path (the Job's stretch is per pixel there).
+        Job job(src, dst, Matrix3::Identity(), sampling, abort);
+        RunMapped(job, outputToSource);
         return !job.stopped.load();
     } catch (const std::bad_alloc &) {
         return false;

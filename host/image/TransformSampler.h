@@ -1,7 +1,10 @@
 #pragma once
 // The general transform sampler: fills an image's data window from a source
-// image through an affine mapping of output positions to source positions,
-// with the reconstruction filters of ResizeFilters.h.
+// image through an affine or projective mapping of output positions to
+// source positions, with the reconstruction filters of ResizeFilters.h.
+// Projective mappings resample through PointMapping.h (per pixel divide by
+// w, stretch from the local Jacobian); the rest of this comment is about
+// the affine paths.
 //
 // Coordinates. Pixel (i, j) covers [i, i + 1) x [j, j + 1), rows counted from
 // the bottom, in both images. Output pixel (i, j) takes the source position
@@ -68,21 +71,25 @@ ORVANE_API void TransformStretch(const Matrix3 &outputToSource, int filter, doub
 /// path. Endless sides stay endless where the mapping keeps the axes apart
 /// (any rotation makes every side endless); edges other than Canvas define
 /// every position, so the result is endless then. A singular mapping gives
-/// a null window.
+/// a null window. Projective: the moved corners of the grown window plus the
+/// filter's reach; endless when a corner reaches the horizon.
 ORVANE_API ImgRectI TransformedWindow(const ImgRectI &srcWindow, const Matrix3 &sourceToOutput,
                                       const TransformSampling &sampling);
 
 /// The source window that output pixels of `outWindow` read through
 /// `sourceToOutput` with `sampling` (Canvas edges; other edges may read the
-/// whole frame). Null for a singular mapping.
+/// whole frame). Null for a singular mapping. Projective: the corners'
+/// box grown by the reach at the largest stretch among the corners; endless
+/// when a corner lies at or beyond the horizon.
 ORVANE_API ImgRectI TransformSourceWindow(const ImgRectI &outWindow, const Matrix3 &sourceToOutput,
                                           const TransformSampling &sampling);
 
 /// Fills `dst`'s data window from `src` (any depth; `dst` any depth, though
 /// the copy path keeps bytes only when both depths agree) through
-/// `outputToSource`, which must be affine. Sets dst's canvas to src's.
-/// False on abort (`abort`, or either image's flag), for a projective
-/// mapping, or when memory ran out; an image without rows on either side
+/// `outputToSource`. A projective mapping shows the side of its horizon
+/// where the source frame's centre lies; beyond it is canvas. Sets dst's
+/// canvas to src's. False on abort (`abort`, or either image's flag), for a
+/// singular projective mapping, or when memory ran out; an image without rows on either side
 /// (pre-calculation) does nothing and succeeds.
 ORVANE_API bool TransformImage(const Image &src, Image &dst, const Matrix3 &outputToSource,
                                const TransformSampling &sampling, const std::atomic<bool> *abort = nullptr);

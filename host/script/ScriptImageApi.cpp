@@ -5,6 +5,7 @@
 #include <cmath>
 #include <cstddef>
 
+#include "host/core/Tags.h"
 #include "host/image/Image.h"
 #include "host/image/NewImage.h"
 #include "host/image/PixelConvert.h"

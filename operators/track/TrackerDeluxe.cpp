@@ -9,11 +9,15 @@
 #include "host/flow/ControlCommand.h"
 #include "host/flow/DataTypes.h"
 #include "host/flow/Engine.h"
+#include "host/flow/InputAt.h"
 #include "host/flow/InputValue.h"
 #include "host/flow/OrvaneDoc.h"
 #include "host/flow/RenderTask.h"
 #include "host/flow/Request.h"
 #include "host/image/Image.h"
+#include "host/image/NewImage.h"
+#include "host/image/PointMapping.h"
+#include "host/image/QuadMap.h"
 #include "host/image/TransformMatrix.h"
 #include "operators/frame/Registration.h"
 
@@ -79,6 +83,29 @@ int Whole(const Parameter *p, int def) {
     return n ? static_cast<int>(std::lround(n->value)) : def;
 }
 
+/// Output pixel -> the warped layer's source through the bilinear quad map:
+/// in Corner Positioning the quad is on the output (its inverse gives the
+/// unit square), in Perspective Positioning on the layer (the output frame
+/// is the unit square); then the layer's pending transform undone.
+struct BilinearPin : PointMapping {
+    BilinearQuad quad;
+    bool quadOnOutput = true;
+    double outW = 1, outH = 1, layerW = 1, layerH = 1;
+    Matrix3 layerToSource;
+    bool Map(double x, double y, double &u, double &v) const override {
+        double lx, ly;
+        if (quadOnOutput) {
+            double s, t;
+            if (!quad.Inverse(x, y, s, t)) return false;
+            lx = s * layerW, ly = t * layerH;
+        } else {
+            quad.Forward(x / outW, y / outH, lx, ly);
+        }
+        layerToSource.Apply(lx, ly, u, v);
+        return true;
+    }
+};
+
 } // namespace
 
 TrackerDeluxe::TrackerDeluxe(const Registry *reg, const ScriptVal &args, const TagList &tags)
@@ -117,6 +144,12 @@ TrackerDeluxe::TrackerDeluxe(const Registry *reg, const ScriptVal &args, const T
     rotateCw_ = AddInputTagList("Rotate Clockwise", "RotateClockwise", tracking::ButtonTags(operationPage_));
     rotateCcw_ =
         AddInputTagList("Rotate Counter-Clockwise", "RotateCounterClockwise", tracking::ButtonTags(operationPage_));
+    cornerTurns_ = AddInputTagList("Corner Turns", "CornerTurns",
+                                   {{LinkDataType, CLSID_DataType_Number},
+                                    {ControlPage, operationPage_},
+                                    {ControlVisible, 0},
+                                    {InputExternal, 0},
+                                    {InputDefault, 0.0}});
     position_ = AddInputTagList("Position", "Position", Checkbox(operationPage_, 1.0));
     rotation_ = AddInputTagList("Rotation", "Rotation", Checkbox(operationPage_, 1.0));
     scaling_ = AddInputTagList("Scaling", "Scaling", Checkbox(operationPage_, 1.0));
@@ -281,6 +314,10 @@ void TrackerDeluxe::NotifyChanged(Input *in, Parameter *param, double time, TagL
             pivotType_->SetValue(Ref<Parameter>(param));
         } else if (in == oldPivot_) {
             pivot_->SetValue(Ref<Parameter>(param));
+        } else if (in == rotateCw_ || in == rotateCcw_) {
+            // A clockwise quarter turn gives each corner the point of the corner after it, anticlockwise.
+            const int turns = Whole(cornerTurns_->Constant().Get(), 0);
+            cornerTurns_->SetValue(MakeRef<Number>(((turns + (in == rotateCw_ ? 3 : 1)) % 4 + 4) % 4));
         } else if (in == operation_ || in == pivotType_ || in == reference_) {
             ShowForOperation(Whole(operation_->Constant().Get(), 0), Whole(pivotType_->Constant().Get(), 0),
                              Whole(reference_->Constant().Get(), RefStart));
@@ -358,7 +395,15 @@ void TrackerDeluxe::CheckRequest(Request *req) {
         req->SetInputData(foreground_, nullptr);
         return;
     }
-    if (!(req->GetFlags() & ReqFlagTrackStep)) return;
+    if (!(req->GetFlags() & ReqFlagTrackStep)) {
+        // The corner maps may read any part of either image, whatever region is asked: whole frames.
+        const int operation = static_cast<int>(std::lround(InputNumberAt(req, operation_, req->Time(), OpNone)));
+        if ((operation == OpCorner || operation == OpPerspective) && !(req->GetFlags() & ReqFlagSkipRoI)) {
+            req->SetInputRoI(input_, nullptr);
+            req->SetInputRoI(foreground_, nullptr);
+        }
+        return;
+    }
     req->SetInputData(foreground_, nullptr); // a tracking step reads the Input only
     AskSearchAreas(req, input_, ListedTrackers());
 }
@@ -432,13 +477,127 @@ void TrackerDeluxe::Process(Request *req) {
         req->SetOutputData(output_, value);
         return;
     }
-    if (operation != OpMatchMove) {
-        Fail(req, "%s: corner and perspective positioning are not available yet; choose None or Match Move\n",
-             Name().c_str());
+    if (operation == OpMatchMove)
+        MatchMove(req, bg.Get(), m);
+    else
+        CornerPin(req, bg.Get(), operation == OpPerspective);
+}
+
+TransformSampling TrackerDeluxe::SamplingOf(Request *req) const {
+    auto choice = [req](const Input *in, int def) {
+        return in ? static_cast<int>(std::lround(req->GetInputNumber(in, def))) : def;
+    };
+    return {choice(FindInput("FilterMethod"), RszLinear - RszFirst) + RszFirst,
+            choice(FindInput("WindowMethod"), 0) + RszWindowHanning, choice(FindInput("Edges"), EdgeCanvas)};
+}
+
+void TrackerDeluxe::CornerPin(Request *req, TransformMatrix *bg, bool perspective) {
+    const auto fail = [&](const char *why) {
+        if (!(req->GetTask() && req->GetTask()->IsAborted()))
+            Fail(req, "%s: %s (time = %g)\n", Name().c_str(), why, req->Time());
+        req->SetOutputData(output_, nullptr);
+    };
+    // The first four enabled trackers with a path, in Input frame pixels.
+    const double t = req->Time();
+    const double W = bg->Width(), H = bg->Height();
+    std::vector<QuadPoint> found;
+    for (TrackerData *tracker : ListedTrackers()) {
+        double x, y;
+        if (found.size() < 4 && tracker->IsEnabled(t) && tracker->PositionAt(req, t, x, y))
+            found.push_back({x * W, y * H});
+    }
+    if (found.size() < 4) return fail("corner positioning needs four enabled trackers with paths");
+    const int turns = static_cast<int>(std::lround(req->GetInputNumber(cornerTurns_, 0.0))) & 3;
+    QuadPoint quad[4];
+    for (int c = 0; c < 4; ++c) quad[c] = found[(c + turns) % 4];
+    if (!IsConvexQuad(quad)) return fail("the four trackers do not make a convex four-sided shape");
+
+    Parameter *bgValue = req->GetInputData(input_), *fgValue = req->GetInputData(foreground_);
+    const int merge = static_cast<int>(std::lround(req->GetInputNumber(merge_, 2)));
+    if (!perspective && (!fgValue || merge == 0)) {
+        req->SetOutputData(output_, bgValue); // nothing to pin, or the plate alone
+        return;
+    }
+    if (perspective && merge == 1 && fgValue) {
+        req->SetOutputData(output_, fgValue);
+        return;
+    }
+    // The warped layer: its source, and the map of output pixels to that source.
+    Ref<TransformMatrix> layer =
+        perspective ? Ref<TransformMatrix>(bg) : MakeRef<TransformMatrix>(fgValue, req, foreground_, 0u, TimeUndefined);
+    if (!layer->IsValid()) return fail("the foreground is not an image");
+    const Image &src = *layer->Source();
+    Matrix3 layerToSource;
+    if (!layer->SourceToOutput().Invert(layerToSource)) return fail("the layer's transform is singular");
+    const double LW = layer->Width(), LH = layer->Height();
+    const QuadPoint frame[4] = {{0, 0}, {LW, 0}, {LW, LH}, {0, LH}};
+    const TransformSampling sampling = SamplingOf(req);
+    const bool homography = std::lround(req->GetInputNumber(mappingType_, 1.0)) == 1;
+    std::unique_ptr<PointMapping> mapping;
+    if (homography) {
+        Matrix3 toLayer, faced;
+        if (!(perspective ? HomographyFromPoints(frame, quad, toLayer) : HomographyFromPoints(quad, frame, toLayer)))
+            return fail("the four trackers do not make a usable mapping");
+        const ImgRectI sf = src.Frame();
+        if (!ProjectiveMapping::Facing(layerToSource * toLayer, 0.5 * (sf.x0 + sf.x1), 0.5 * (sf.y0 + sf.y1), faced))
+            return fail("the four trackers do not make a usable mapping");
+        mapping = std::make_unique<ProjectiveMapping>(faced);
+    } else {
+        auto pin = std::make_unique<BilinearPin>();
+        pin->quad.Set(quad);
+        pin->quadOnOutput = !perspective;
+        pin->outW = W, pin->outH = H, pin->layerW = LW, pin->layerH = LH;
+        pin->layerToSource = layerToSource;
+        mapping = std::move(pin);
+    }
+    // Pinned, only the quad and the filter's reach around it show; un-warped, the whole frame.
+    ImgRectI dw(0, 0, bg->Width(), bg->Height());
+    if (!perspective && sampling.edges == EdgeCanvas) {
+        const int reach = static_cast<int>(std::ceil(ResizeFilterSupport(sampling.filter))) + 2;
+        double x0 = quad[0].x, y0 = quad[0].y, x1 = x0, y1 = y0;
+        for (const QuadPoint &p : quad)
+            x0 = std::min(x0, p.x), y0 = std::min(y0, p.y), x1 = std::max(x1, p.x), y1 = std::max(y1, p.y);
+        dw &= ImgRectI(static_cast<int>(std::floor(x0)) - reach, static_cast<int>(std::floor(y0)) - reach,
+                       static_cast<int>(std::ceil(x1)) + reach, static_cast<int>(std::ceil(y1)) + reach);
+    }
+    const std::atomic<bool> *abort = req->GetTask() ? req->GetTask()->AbortFlag() : nullptr;
+    const FltPixel canvas = src.GetCanvasColor();
+    Ref<Image> warped = NewImageTagList({{ImgLikeImage, &src},
+                                         {ImgWidth, bg->Width()},
+                                         {ImgHeight, bg->Height()},
+                                         {ImgXScale, bg->XScale()},
+                                         {ImgYScale, bg->YScale()},
+                                         {ImgDataWindow, &dw},
+                                         {ImgValidWindow, &dw},
+                                         {ImgNoData, src.IsNoData()},
+                                         {ImgCanvasColor, &canvas}});
+    if (!warped) return fail("out of memory");
+    if (!warped->IsNoData() && !dw.IsNull() &&
+        (!const_cast<Image &>(src).DownloadGPUMem() || !MapImage(src, *warped, *mapping, sampling, abort)))
+        return fail("the layer could not be resampled");
+
+    // Merge as Match Move does: the warped layer is the FG when pinned, the BG when un-warped.
+    Parameter *under = perspective ? static_cast<Parameter *>(warped.Get()) : bgValue;
+    Parameter *over = perspective ? fgValue : static_cast<Parameter *>(warped.Get());
+    if (merge == 0 || merge == 1 || !over) {
+        req->SetOutputData(output_, merge == 1 && over ? over : under);
+        return;
+    }
+    // "FG over BG" lays the FG onto the BG, "BG over FG" the BG onto the FG; the layer merged onto carries on.
+    Parameter *onto = merge == 2 ? under : over, *laid = merge == 2 ? over : under;
+    Ref<TransformMatrix> base = onto == warped.Get() ? MakeRef<TransformMatrix>(warped.Get())
+                                : onto == bgValue
+                                    ? Ref<TransformMatrix>(bg)
+                                    : MakeRef<TransformMatrix>(fgValue, req, foreground_, 0u, TimeUndefined);
+    Ref<Parameter> keep(fgValue);
+    req->SetInputData(foreground_, laid);
+    const bool merged = mergeInputs_->Merge(req, base.Get(), TagList());
+    req->SetInputData(foreground_, keep.Get());
+    if (!merged) {
         req->SetOutputData(output_, nullptr);
         return;
     }
-    MatchMove(req, bg.Get(), m);
+    req->SetOutputData(output_, base.Get());
 }
 
 void TrackerDeluxe::MatchMove(Request *req, TransformMatrix *bg, const tracking::Motion &m) {
@@ -456,9 +615,10 @@ void TrackerDeluxe::MatchMove(Request *req, TransformMatrix *bg, const tracking:
                        {XfYSize, size},
                        {XfAngle, steady ? -m.angle : m.angle}};
     };
-    TagList resample{{XfEdges, choice(FindInput("Edges"), EdgeCanvas)},
-                     {XfFilter, choice(FindInput("FilterMethod"), RszLinear - RszFirst) + RszFirst},
-                     {XfWindow, choice(FindInput("WindowMethod"), 0) + RszWindowHanning},
+    const TransformSampling sampling = SamplingOf(req);
+    TagList resample{{XfEdges, sampling.edges},
+                     {XfFilter, sampling.filter},
+                     {XfWindow, sampling.window},
                      {XfFlatten, req->GetInputNumber(flatten_, 0.0) >= 0.5},
                      {XfGPUEnabled, IsGPUEnabled(req, false)},
                      {XfRequest, static_cast<const void *>(req)}};

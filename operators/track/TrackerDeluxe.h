@@ -23,8 +23,21 @@
 // step: "BG only" steadies the Input (the shot held at its reference), "FG
 // only" moves the Foreground with the shot, "FG over BG" lays the moving
 // Foreground over the Input and "BG over FG" the Input over it, through the
-// merge controls; each image is resampled once. The corner operations are not
-// built: they fail with a console line saying so.
+// merge controls; each image is resampled once.
+//
+// "Corner Positioning" pins the Foreground's frame corners onto the first
+// four enabled trackers' positions at the request's time (the Foreground
+// moves onto the plate); "Perspective Positioning" maps those four points of
+// the Input back to the frame's corners (the plate is un-warped). Trackers
+// 1..4 of that choice are the bottom-left, bottom-right, top-right and
+// top-left corners; each Rotate Clockwise press turns the picture a quarter
+// clockwise on its corners (the hidden CornerTurns counts the turns).
+// MappingType "Perspective" maps through the homography of the four pairs,
+// "Bi-Linear" through the bilinear quad map (QuadMap.h). The warped layer is
+// resampled once, through its pending transform and the quad map together,
+// then merged as Match Move merges: in Corner Positioning the warped
+// Foreground is the FG, in Perspective Positioning the un-warped Input is
+// the BG. Fewer than four usable trackers: a console line and no output.
 //
 // Outputs: SteadyPosition, SteadyAxis, SteadySize and SteadyAngle are the
 // Center, Pivot, Size and Angle of a Transform that steadies the shot;
@@ -41,6 +54,7 @@
 
 #include "host/flow/MergeInputs.h"
 #include "host/flow/Operator.h"
+#include "host/image/TransformSampler.h"
 #include "operators/track/MatchMove.h"
 #include "operators/track/TrackerData.h"
 #include "operators/track/TrackerInputs.h"
@@ -85,12 +99,16 @@ private:
     tracking::Motion MotionAt(Request *req, double aspect) const;
     /// Operation "Match Move": the Merge choice with the motion, one resampling.
     void MatchMove(Request *req, TransformMatrix *bg, const tracking::Motion &m);
+    /// Operations "Corner Positioning" and "Perspective Positioning".
+    void CornerPin(Request *req, TransformMatrix *bg, bool perspective);
+    /// The sampling the Filter, Window and Edges controls choose.
+    TransformSampling SamplingOf(Request *req) const;
     void Report(const char *fmt, ...) __attribute__((format(printf, 2, 3)));
 
     TrackerInputs shared_;
     Input *trackerList_, *input_, *foreground_, *operation_, *merge_;
     std::unique_ptr<MergeInputs> mergeInputs_;
-    Input *mappingType_, *rotateCw_, *rotateCcw_, *position_, *rotation_, *scaling_, *flatten_;
+    Input *mappingType_, *rotateCw_, *rotateCcw_, *cornerTurns_, *position_, *rotation_, *scaling_, *flatten_;
     Input *pivotType_, *tracker_, *pivot_, *reference_, *intermediate_, *fadeFrames_;
     Input *oldPivotType_, *oldPivot_;
     Output *output_, *steadyPosition_, *unsteadyPosition_, *steadyAxis_, *steadySize_, *unsteadySize_;

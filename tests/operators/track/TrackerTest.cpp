@@ -20,6 +20,8 @@
 #include "host/flow/Request.h"
 #include "host/image/Image.h"
 #include "host/image/NewImage.h"
+#include "host/image/QuadMap.h"
+#include "host/image/ResizeFilters.h"
 #include "operators/track/MatchMove.h"
 #include "operators/track/TrackerStep.h"
 #include "tests/support/TestSupport.h"
@@ -406,6 +408,139 @@ TEST_F(Tracker, MatchMoveSteadiesTheShotAtItsReference) {
             worst = std::max({worst, std::fabs(double(a.R) - b.R), std::fabs(double(a.B) - b.B)});
         }
     EXPECT_LT(worst, 1e-5);
+}
+
+TEST_F(Tracker, CornerPositioningPinsTheForegroundAndPerspectiveTakesItBack) {
+    // Four trackers on a quad of the 96 x 64 Input (pixels): bottom-left, bottom-right, top-right, top-left.
+    const QuadPoint quad[4] = {{10, 6}, {86, 10}, {80, 58}, {14, 54}};
+    ScriptVal list = ScriptVal::Table();
+    for (int n : {1, 2, 3, 4}) list.Append(n);
+    ASSERT_TRUE(tracker->FindInput("TrackerList")->SetValue(MakeRef<ScriptValue>(list)));
+    for (int n = 1; n <= 4; ++n) {
+        AnimCurve path;
+        path.SetKey(0.0, MakeRef<Point>(quad[n - 1].x / MovingTexture::W, quad[n - 1].y / MovingTexture::H));
+        ASSERT_TRUE(tracker->FindInput(("TrackedCenter" + std::to_string(n)).c_str())->SetCurve(path));
+    }
+    // A 40 x 30 Foreground whose pixel (x, y) holds (x, y): where a sample came from.
+    const int fw = 40, fh = 30;
+    Ref<Image> fg = NewImageTagList({{ImgWidth, fw}, {ImgHeight, fh}, {ImgDepth, DepthRGBAFlt32}});
+    ASSERT_TRUE(fg->AllocScanLineData());
+    for (int y = 0; y < fh; ++y)
+        for (int x = 0; x < fw; ++x) fg->PutFlt(x, y, {float(x), float(y), 0, 1});
+    ASSERT_TRUE(tracker->FindInput("Foreground")->ConnectTo(T::AddImageSource(doc, "Still1", fg)->Out()));
+    const QuadPoint frame[4] = {{0, 0}, {double(fw), 0}, {double(fw), double(fh)}, {0, double(fh)}};
+    EvalOptions o;
+    o.useCache = false;
+
+    struct Case {
+        const char *name;
+        int mapping; ///< 0 bilinear, 1 perspective
+        int turns;   ///< Rotate Clockwise presses
+    } cases[] = {{"perspective", 1, 0}, {"bilinear", 0, 0}, {"perspective, turned clockwise", 1, 1}};
+    for (const Case &c : cases) {
+        SCOPED_TRACE(c.name);
+        // Nearest, so that each output pixel holds the coordinates of the one foreground pixel it took.
+        T::SetNumbers(
+            tracker,
+            {{"Operation", 2}, {"Merge", 1}, {"MappingType", c.mapping}, {"FilterMethod", RszNearest - RszFirst}});
+        for (int k = 0; k < c.turns; ++k) T::SetNumber(tracker, "RotateClockwise", 1);
+        // Foreground corner i goes to the point i + turns around the quad, a turn being a quarter clockwise.
+        QuadPoint target[4];
+        for (int i = 0; i < 4; ++i) target[i] = quad[(i + 4 - c.turns) % 4];
+        Matrix3 toFg, toOut;
+        ASSERT_TRUE(HomographyFromPoints(target, frame, toFg));
+        ASSERT_TRUE(HomographyFromPoints(frame, target, toOut));
+        BilinearQuad bilinear;
+        ASSERT_TRUE(bilinear.Set(target));
+        const auto forward = [&](double fx, double fy, double &x, double &y) {
+            if (c.mapping == 1)
+                toOut.Apply(fx, fy, x, y);
+            else
+                bilinear.Forward(fx / fw, fy / fh, x, y);
+        };
+        const auto back = [&](double x, double y, double &fx, double &fy) {
+            if (c.mapping == 1) return toFg.Apply(x, y, fx, fy);
+            double s, t;
+            ASSERT_TRUE(bilinear.Inverse(x, y, s, t));
+            fx = s * fw, fy = t * fh;
+        };
+        const Ref<Image> pinned = T::EvalImage(tracker, 0.0, o);
+        ASSERT_TRUE(pinned) << T::ConsoleText(doc);
+        EXPECT_EQ(pinned->Width(), MovingTexture::W);
+        // Each corner pixel of the foreground lands on its point, and inner pixels where the map sends them.
+        int checked = 0;
+        for (double s : {0.0, 0.2, 0.5, 0.8, 1.0})
+            for (double t : {0.0, 0.35, 0.5, 1.0}) {
+                const double fx = std::clamp(s * fw, 0.5, fw - 0.5), fy = std::clamp(t * fh, 0.5, fh - 0.5);
+                double x, y, bx, by;
+                forward(fx, fy, x, y);
+                const int i = int(std::floor(x)), j = int(std::floor(y));
+                back(i + 0.5, j + 0.5, bx, by);
+                if (std::fabs(bx - std::round(bx)) < 1e-6 || std::fabs(by - std::round(by)) < 1e-6) continue;
+                const FltPixel p = pinned->GetFlt(i, j);
+                EXPECT_EQ(p.R, std::floor(bx)) << s << "," << t;
+                EXPECT_EQ(p.G, std::floor(by)) << s << "," << t;
+                ++checked;
+            }
+        EXPECT_GE(checked, 15);
+        for (int i = 0; i < 4; ++i) {
+            // The centre of the foreground's corner pixel lies within a pixel of the tracked point.
+            const double fx = frame[i].x == 0 ? 0.5 : fw - 0.5, fy = frame[i].y == 0 ? 0.5 : fh - 0.5;
+            double x, y;
+            forward(fx, fy, x, y);
+            double cx, cy;
+            forward(frame[i].x, frame[i].y, cx, cy);
+            EXPECT_LT(std::hypot(cx - target[i].x, cy - target[i].y), 1e-9) << i;
+            const FltPixel p = pinned->GetFlt(int(x), int(y));
+            EXPECT_EQ(std::tuple(p.R, p.G), std::tuple(float(fx - 0.5), float(fy - 0.5))) << i;
+        }
+        for (int k = 0; k < c.turns; ++k) T::SetNumber(tracker, "RotateCounterClockwise", 1);
+    }
+
+    // Perspective Positioning of the pinned picture gives the foreground back, stretched to the Input's frame.
+    Operator *undo = doc.AddTool(OvID("Tracker"), "Tracker2");
+    ASSERT_TRUE(undo && undo->FindInput("Input")->ConnectTo(tracker->FindMainOutput()));
+    ASSERT_TRUE(undo->FindInput("TrackerList")->SetValue(MakeRef<ScriptValue>(list)));
+    for (int n = 1; n <= 4; ++n) {
+        const std::string id = "TrackedCenter" + std::to_string(n);
+        ASSERT_TRUE(undo->FindInput(id.c_str())->SetCurve(*tracker->FindInput(id.c_str())->Curve()));
+    }
+    T::SetNumbers(tracker,
+                  {{"Operation", 2}, {"Merge", 1}, {"MappingType", 1}, {"FilterMethod", RszLinear - RszFirst}});
+    T::SetNumbers(undo, {{"Operation", 3}, {"Merge", 0}, {"MappingType", 1}, {"FilterMethod", RszLinear - RszFirst}});
+    const Ref<Image> back = T::EvalImage(undo, 0.0, o);
+    ASSERT_TRUE(back) << T::ConsoleText(doc);
+    double worst = 0.0;
+    const double sx = double(fw) / MovingTexture::W, sy = double(fh) / MovingTexture::H;
+    for (int y = 4; y < MovingTexture::H - 4; ++y)
+        for (int x = 4; x < MovingTexture::W - 4; ++x) {
+            const FltPixel p = back->GetFlt(x, y);
+            const double e = std::max(std::fabs(p.R - ((x + 0.5) * sx - 0.5)), std::fabs(p.G - ((y + 0.5) * sy - 0.5)));
+            worst = std::max(worst, e);
+        }
+    EXPECT_LT(worst, 5e-3); // foreground pixels: linear filtering twice of a linear ramp
+
+    // Un-warping a corner of the frame reads the Input far from that corner: a small region asked of the tool gives
+    // the same pixels as the whole frame (the texture renders only what is asked of it).
+    T::SetNumbers(tracker, {{"Operation", 3}, {"Merge", 0}});
+    const ImgRectI corner(0, 0, 12, 12);
+    EvalOptions small = o;
+    small.roi = ImageDomain(corner);
+    const Ref<Image> whole = T::EvalImage(tracker, 0.0, o), part = T::EvalImage(tracker, 0.0, small);
+    ASSERT_TRUE(whole && part) << T::ConsoleText(doc);
+    worst = 0.0;
+    for (int y = 0; y < 12; ++y)
+        for (int x = 0; x < 12; ++x) {
+            const FltPixel a = whole->GetFlt(x, y), b = part->GetFlt(x, y);
+            worst = std::max({worst, std::fabs(double(a.R) - b.R), std::fabs(double(a.G) - b.G), double(a.A == 0)});
+        }
+    EXPECT_EQ(worst, 0.0);
+
+    // Fewer than four trackers with paths: one console line, no picture.
+    undo->FindInput("TrackedCenter4")->ResetValue();
+    EXPECT_FALSE(T::EvalImage(undo, 0.0, o));
+    EXPECT_NE(T::ConsoleText(doc).find("Tracker2: corner positioning needs four enabled trackers"), std::string::npos)
+        << T::ConsoleText(doc);
 }
 
 TEST_F(Tracker, NoEnabledTrackerRefusesTheRun) {
