@@ -62,7 +62,7 @@ constexpr ExpressionRow kExpressions[kCustomChannels] = {
 };
 
 /// The image's auxiliary channel behind output channel `c` (Z and after): the script pixel's fields in order.
-AuxChannelKind AuxOfChannel(int c) { return ScriptAuxChannel(c - static_cast<int>(CustomChannel::Z)); }
+AuxChannelKind AuxOfChannel(int c) { return ScriptAuxChannel(c - kFirstAuxChannel); }
 
 TagList TextTags(int page, const char *def) {
     return {{LinkDataType, CLSID_DataType_Text},
@@ -165,7 +165,8 @@ void Custom::AddExpressionInputs() {
     const int page =
         AddControlPageTagList("Channels", {{PageIcon, static_cast<const void *>("Icons.Tools.Tabs.ColorChannels")}});
     for (int c = 0; c < kCustomChannels; ++c) {
-        if (c == 4) BeginControlNestTagList("Aux Channel Expressions", "AuxChannelNest", false, {{ControlPage, page}});
+        if (c == kFirstAuxChannel)
+            BeginControlNestTagList("Aux Channel Expressions", "AuxChannelNest", false, {{ControlPage, page}});
         const ExpressionRow &row = kExpressions[c];
         channels_[c] = AddInputTagList(row.label, row.id, TextTags(page, row.def));
     }
@@ -187,7 +188,7 @@ void Custom::NotifyChanged(Input *in, Parameter *param, double time, TagList *ta
 
 const CustomScript &Custom::ScriptFor(Request *req, const std::array<bool, 4> &images, const Image &out) {
     uint32_t channels = 0xf;
-    for (int c = 4; c < kCustomChannels; ++c)
+    for (int c = kFirstAuxChannel; c < kCustomChannels; ++c)
         if (out.HasAuxChannel(AuxOfChannel(c))) channels |= 1u << c;
     CustomScriptInput in;
     in.images = images;
@@ -288,7 +289,7 @@ void Custom::Process(Request *req) {
         return;
     }
     bool ok = out->AllocScanLineData();
-    for (int c = 4; ok && like && c < kCustomChannels; ++c)
+    for (int c = kFirstAuxChannel; ok && like && c < kCustomChannels; ++c)
         if (like->HasAuxChannel(AuxOfChannel(c))) ok = out->AddAuxChannel(AuxOfChannel(c));
     if (!ok) {
         FailOutOfMemory(req);

@@ -88,8 +88,6 @@ std::string SizeSuffix(int k) { return k == 4 ? "m" : std::to_string(k); }
 
 } // namespace
 
-const char *CustomChannelField(CustomChannel c) { return kChannels[static_cast<int>(c)].field; }
-
 CustomScript GenerateCustomScript(const CustomScriptInput &in) {
     CustomScript out;
     Parser parser;

@@ -28,41 +28,18 @@
 
 namespace Orvane {
 
-/// The channels the Custom tool writes, in stanza order.
-enum class CustomChannel {
-    R,
-    G,
-    B,
-    A,
-    Z,
-    Coverage,
-    U,
-    V,
-    NX,
-    NY,
-    NZ,
-    VectX,
-    VectY,
-    BackVectX,
-    BackVectY,
-    PositionX,
-    PositionY,
-    PositionZ,
-    DisparityX,
-    DisparityY,
-    Count
-};
-inline constexpr int kCustomChannels = static_cast<int>(CustomChannel::Count);
-
-/// A channel's field name in script pixels ("R", "VectX").
-const char *CustomChannelField(CustomChannel c);
+/// The channels the Custom tool writes, in stanza order: R, G, B, A, then the script pixel's sixteen auxiliary
+/// channels from Z (ScriptImageApi.h) in their order.
+inline constexpr int kCustomChannels = 20;
+/// The first auxiliary channel (Z) among them.
+inline constexpr int kFirstAuxChannel = 4;
 
 struct CustomScriptInput {
     std::array<std::string, 8> setup, intermediate;
     std::array<std::string, kCustomChannels> channel;
     /// Images 1 to 3 and the effect mask (4) present.
     std::array<bool, 4> images{};
-    /// Bit per CustomChannel that the output image has; stanzas only for these.
+    /// Bit per channel (stanza order) that the output image has; stanzas only for these.
     uint32_t outputChannels = 0xf;
     /// The output stores integers: colour is clamped to [0, 1] before it is written.
     bool integerOutput = false;
