@@ -9,40 +9,34 @@ namespace {
 
 /// Windows whose variance per sample is below this count as flat (no structure to correlate).
 constexpr double kFlatVariance = 1e-12;
+/// The refinement stops once a step moves less than kSettledStep pixels, or less than kSettledFraction of the
+/// translation's standard error.
+constexpr double kSettledStep = 1e-3, kSettledFraction = 0.05;
 
-/// Catmull-Rom weights of the four taps around a fraction t (taps at -1, 0, 1, 2) and their derivatives.
-void CubicWeights(double t, double w[4], double d[4]) {
+/// Catmull-Rom weights of the four taps around a fraction t (taps at -1, 0, 1, 2).
+void CubicWeights(double t, double w[4]) {
     const double t2 = t * t, t3 = t2 * t;
     w[0] = 0.5 * (-t3 + 2.0 * t2 - t);
     w[1] = 0.5 * (3.0 * t3 - 5.0 * t2 + 2.0);
     w[2] = 0.5 * (-3.0 * t3 + 4.0 * t2 + t);
     w[3] = 0.5 * (t3 - t2);
-    d[0] = 0.5 * (-3.0 * t2 + 4.0 * t - 1.0);
-    d[1] = 0.5 * (9.0 * t2 - 10.0 * t);
-    d[2] = 0.5 * (-9.0 * t2 + 8.0 * t + 1.0);
-    d[3] = 0.5 * (3.0 * t2 - 2.0 * t);
 }
 
-/// Value and gradient of the plane at (x, y); taps beyond the edges repeat the edge samples.
-void Sample(const Plane &p, double x, double y, double &v, double &gx, double &gy) {
+/// The plane's value at (x, y); taps beyond the edges repeat the edge samples.
+double Sample(const Plane &p, double x, double y) {
     const double fx = std::floor(x), fy = std::floor(y);
-    double wx[4], dx[4], wy[4], dy[4];
-    CubicWeights(x - fx, wx, dx);
-    CubicWeights(y - fy, wy, dy);
+    double wx[4], wy[4];
+    CubicWeights(x - fx, wx);
+    CubicWeights(y - fy, wy);
     const int ix = static_cast<int>(fx) - 1, iy = static_cast<int>(fy) - 1;
-    v = gx = gy = 0.0;
+    double v = 0.0;
     for (int j = 0; j < 4; ++j) {
         const float *row = p.Row(std::clamp(iy + j, 0, p.h - 1));
-        double rv = 0.0, rd = 0.0;
-        for (int i = 0; i < 4; ++i) {
-            const double s = row[std::clamp(ix + i, 0, p.w - 1)];
-            rv += wx[i] * s;
-            rd += dx[i] * s;
-        }
+        double rv = 0.0;
+        for (int i = 0; i < 4; ++i) rv += wx[i] * row[std::clamp(ix + i, 0, p.w - 1)];
         v += wy[j] * rv;
-        gx += wy[j] * rd;
-        gy += dy[j] * rv;
     }
+    return v;
 }
 
 double Correlation(double cross, double norm, double s, double s2, int n) {
@@ -52,7 +46,7 @@ double Correlation(double cross, double norm, double s, double s2, int n) {
 }
 
 /// Solves the first n x n of a x = b in place (partial pivoting); false when singular.
-bool Solve(double a[8][8], double b[8], int n) {
+bool Solve(double a[6][6], double b[6], int n) {
     for (int c = 0; c < n; ++c) {
         int pivot = c;
         for (int r = c + 1; r < n; ++r)
@@ -175,17 +169,23 @@ template <class Fn> void ForPlaced(const Pattern &pat, int qx, int qy, const Pla
         }
 }
 
-bool Plausible(const Placement &p) {
-    return std::isfinite(p.tx) && std::isfinite(p.ty) && std::abs(p.tx) <= 1.5 && std::abs(p.ty) <= 1.5 &&
-           p.m00 > 0.7 && p.m00 < 1.4 && p.m11 > 0.7 && p.m11 < 1.4 && std::abs(p.m01) < 0.5 && std::abs(p.m10) < 0.5;
+/// A placement the refinement may stand on: a mild turn and scale, with every pattern sample and its cubic taps
+/// inside the plane (so the fit never reads repeated edge samples).
+bool Plausible(const Plane &plane, const Pattern &pat, int qx, int qy, const Placement &p) {
+    if (!(std::isfinite(p.tx) && std::isfinite(p.ty) && p.m00 > 0.7 && p.m00 < 1.4 && p.m11 > 0.7 && p.m11 < 1.4 &&
+          std::abs(p.m01) < 0.5 && std::abs(p.m10) < 0.5))
+        return false;
+    const double cx = 0.5 * (pat.w - 1), cy = 0.5 * (pat.h - 1);
+    const double rx = std::abs(p.m00) * cx + std::abs(p.m01) * cy, ry = std::abs(p.m10) * cx + std::abs(p.m11) * cy;
+    const double x = qx + cx + p.tx, y = qy + cy + p.ty;
+    return x - rx >= 1.0 && y - ry >= 1.0 && x + rx <= plane.w - 3.0 && y + ry <= plane.h - 3.0;
 }
 } // namespace
 
 double SampledNcc(const Plane &plane, const Pattern &pat, int qx, int qy, const Placement &at) {
     double cross = 0.0, s = 0.0, s2 = 0.0;
     ForPlaced(pat, qx, qy, at, [&](size_t k, double, double, double x, double y) {
-        double v, gx, gy;
-        Sample(plane, x, y, v, gx, gy);
+        const double v = Sample(plane, x, y);
         cross += pat.zero[k] * v;
         s += v;
         s2 += v * v;
@@ -193,15 +193,14 @@ double SampledNcc(const Plane &plane, const Pattern &pat, int qx, int qy, const 
     return Correlation(cross, pat.norm, s, s2, pat.w * pat.h);
 }
 
-Placement Refine(const Plane &plane, const Pattern &pat, int qx, int qy, const Placement &start, int iterations) {
+Placement Refine(const Plane &plane, const Pattern &pat, int qx, int qy, const Placement &start, int iterations,
+                 bool turns) {
     const int n = pat.w * pat.h;
     Placement at = start;
     // Gain and bias from the least-squares fit of the window at the start to the pattern.
     double sv = 0.0, svp = 0.0, sp = 0.0, spp = 0.0;
     ForPlaced(pat, qx, qy, at, [&](size_t k, double, double, double x, double y) {
-        double v, gx, gy;
-        Sample(plane, x, y, v, gx, gy);
-        const double p = pat.v[k];
+        const double v = Sample(plane, x, y), p = pat.v[k];
         sv += v;
         svp += v * p;
         sp += p;
@@ -212,9 +211,10 @@ Placement Refine(const Plane &plane, const Pattern &pat, int qx, int qy, const P
     failed.ncc = -2.0;
     if (!(varP > 0.0)) return failed;
     double gain = (svp - sv * sp / n) / varP, bias = (sv - gain * sp) / n;
-    // Unknowns: translation, the linear part (affine patterns only), gain and bias.
-    const bool affine = pat.w >= 9 && pat.h >= 9;
-    const int count = affine ? 8 : 4;
+    // Unknowns: translation, gain and bias, and with `turns` a turn and a uniform scale. A free 2 x 2 part
+    // (shear, scale per axis) was tried: on small patterns of smooth texture its extra freedom trades against the
+    // translation and lets the point wander by tenths of a pixel.
+    const int count = turns ? 6 : 4;
     // The image's gradient comes from the pattern's (central differences): gain * M^-T * grad P. Unlike the
     // gradient of the interpolated image it shares no noise with the residual, which would pull the answer
     // towards whole and half pixels on noisy frames.
@@ -229,16 +229,16 @@ Placement Refine(const Plane &plane, const Pattern &pat, int qx, int qy, const P
                 (pat.v[static_cast<size_t>(u) * pat.w + i] - pat.v[static_cast<size_t>(d) * pat.w + i]) / float(u - d);
         }
     for (int it = 0; it < iterations; ++it) {
-        double a[8][8] = {}, b[8] = {};
+        double a[6][6] = {}, b[6] = {}, sumSq = 0.0;
         const double det = at.m00 * at.m11 - at.m01 * at.m10;
         const double i00 = at.m11 / det, i01 = -at.m10 / det, i10 = -at.m01 / det, i11 = at.m00 / det; // M^-T
         ForPlaced(pat, qx, qy, at, [&](size_t k, double u, double v, double x, double y) {
-            double val, sgx, sgy;
-            Sample(plane, x, y, val, sgx, sgy);
+            const double val = Sample(plane, x, y);
             const double p = pat.v[k];
             const double r = val - gain * p - bias;
+            sumSq += r * r;
             const double gx = gain * (i00 * pgx[k] + i01 * pgy[k]), gy = gain * (i10 * pgx[k] + i11 * pgy[k]);
-            double jac[8] = {gx, gy, -p, -1.0, gx * u, gx * v, gy * u, gy * v};
+            const double jac[6] = {gx, gy, -p, -1.0, gx * u + gy * v, gy * u - gx * v};
             for (int c = 0; c < count; ++c) {
                 b[c] -= jac[c] * r;
                 for (int d = c; d < count; ++d) a[c][d] += jac[c] * jac[d];
@@ -246,21 +246,35 @@ Placement Refine(const Plane &plane, const Pattern &pat, int qx, int qy, const P
         });
         for (int c = 1; c < count; ++c)
             for (int d = 0; d < c; ++d) a[c][d] = a[d][c];
+        // Steps far below the translation's own uncertainty under the residual's noise change nothing that
+        // matters: on noisy frames they would go on without settling.
+        const double noise = sumSq / std::max(1, n - count);
+        const double enough = std::max(kSettledStep, kSettledFraction * std::sqrt(noise / std::min(a[0][0], a[1][1])));
         if (!Solve(a, b, count)) break;
         at.tx += b[0];
         at.ty += b[1];
         gain += b[2];
         bias += b[3];
-        if (affine) {
+        if (turns) {
             at.m00 += b[4];
-            at.m01 += b[5];
-            at.m10 += b[6];
-            at.m11 += b[7];
+            at.m11 += b[4];
+            at.m01 -= b[5];
+            at.m10 += b[5];
         }
-        if (!Plausible(at)) return failed;
-        if (std::abs(b[0]) < 1e-3 && std::abs(b[1]) < 1e-3) break;
+        if (!Plausible(plane, pat, qx, qy, at)) return failed;
+        if (std::abs(b[0]) < enough && std::abs(b[1]) < enough) break;
     }
-    at.ncc = SampledNcc(plane, pat, qx, qy, at);
+    double cross = 0.0, wv = 0.0, wv2 = 0.0, residual = 0.0;
+    ForPlaced(pat, qx, qy, at, [&](size_t k, double, double, double x, double y) {
+        const double val = Sample(plane, x, y);
+        cross += pat.zero[k] * val;
+        wv += val;
+        wv2 += val * val;
+        const double r = val - gain * pat.v[k] - bias;
+        residual += r * r;
+    });
+    at.ncc = Correlation(cross, pat.norm, wv, wv2, n);
+    at.residual = residual;
     return at;
 }
 

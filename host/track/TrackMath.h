@@ -53,11 +53,13 @@ double Ncc(const PlaneStats &img, const Pattern &pat, int x, int y);
 
 /// Where the pattern lies over a plane, to a fraction of a pixel: pattern sample (i, j), at (u, v) from the
 /// pattern's centre, lies at (qx + cx + tx + m00 u + m01 v, qy + cy + ty + m10 u + m11 v), with (cx, cy) the
-/// pattern's centre ((w - 1) / 2, (h - 1) / 2). The linear part follows mild turns and scale changes.
+/// pattern's centre ((w - 1) / 2, (h - 1) / 2). The linear part follows mild turns and scale changes; the
+/// refinement keeps it a turn with a uniform scale.
 struct Placement {
     double tx = 0.0, ty = 0.0;
     double m00 = 1.0, m01 = 0.0, m10 = 0.0, m11 = 1.0;
-    double ncc = -2.0; ///< the correlation there
+    double ncc = -2.0;     ///< the correlation there
+    double residual = 0.0; ///< after a refinement: the sum of squares of the fit's residual
 };
 
 /// The correlation of `pat` placed at `at` relative to whole offset (qx, qy), the plane read by Catmull-Rom
@@ -65,9 +67,11 @@ struct Placement {
 double SampledNcc(const Plane &plane, const Pattern &pat, int qx, int qy, const Placement &at);
 
 /// Gauss-Newton refinement of a placement relative to whole offset (qx, qy), fitting the interpolated plane to
-/// gain * pattern + bias (so brightness and contrast changes do not move it). Patterns of fewer than 9 x 9 pixels
-/// keep the linear part of `start` and refine the translation only. Gives `start` with ncc -2 when it does not
-/// converge within 1.5 pixels of (qx, qy) or the linear part leaves 0.7..1.4 in scale or 0.5 off-diagonal.
-Placement Refine(const Plane &plane, const Pattern &pat, int qx, int qy, const Placement &start, int iterations);
+/// gain * pattern + bias (so brightness and contrast changes do not move it). With `turns` (patterns of at least 9 x 9)
+/// it fits a turn and a uniform scale as well; without, it keeps the linear part of `start`. Gives `start` with ncc -2
+/// when the pattern would leave the plane (with the taps of the interpolation) or the linear part leaves 0.7..1.4 in
+/// scale or 0.5 off-diagonal.
+Placement Refine(const Plane &plane, const Pattern &pat, int qx, int qy, const Placement &start, int iterations,
+                 bool turns);
 
 } // namespace Orvane

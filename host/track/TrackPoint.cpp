@@ -37,6 +37,11 @@ constexpr int kCoarseSpan = 24;
 /// Coarse levels keep at least this many pattern pixels per side.
 constexpr int kMinCoarsePattern = 6;
 constexpr int kRefineIterations = 6;
+/// Patterns from this size on a side fit turns and scale changes.
+constexpr int kMinTurningSide = 9;
+/// How many noise variances the turn and scale must take off the residual to be kept (two unknowns on pure
+/// noise take off more than 16 about once in 3000 steps).
+constexpr double kTurnEvidence = 16.0;
 /// BestMatch: the pattern is taken again once a step matches this much worse than the best since it was taken,
 /// or once its fitted turn or scale has left the pattern's by kBestMatchShape (about 6 degrees or 10 %), before
 /// the whole-pixel search, which does not turn the pattern, loses it.
@@ -333,7 +338,16 @@ TrackResult TrackPoint::Track(const Image *img, double time, double x, double y,
     fit.tx = ParabolaPeak(score(-1, 0), best.score, score(1, 0));
     fit.ty = ParabolaPeak(score(0, -1), best.score, score(0, 1));
     fit.ncc = SampledNcc(base.plane, pat, best.x, best.y, fit);
-    const Placement refined = Refine(base.plane, pat, best.x, best.y, fit, kRefineIterations);
+    Placement refined = Refine(base.plane, pat, best.x, best.y, fit, kRefineIterations, false);
+    if (pat.w >= kMinTurningSide && pat.h >= kMinTurningSide) {
+        // A turn and a scale are kept only where they explain clearly more of the window than noise would: two
+        // more unknowns fitted to noise alone lower the residual by about two noise variances.
+        const Placement turned =
+            Refine(base.plane, pat, best.x, best.y, refined.ncc > -2.0 ? refined : fit, kRefineIterations, true);
+        const double noise = turned.residual / std::max(1, pat.w * pat.h - 6);
+        if (turned.ncc > -2.0 && (refined.ncc <= -2.0 || refined.residual - turned.residual > kTurnEvidence * noise))
+            refined = turned;
+    }
     if (refined.ncc >= fit.ncc) fit = refined;
 
     // The point keeps its place relative to the pattern as the pattern turns and scales.
