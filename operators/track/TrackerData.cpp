@@ -214,27 +214,36 @@ bool TrackerData::PositionAt(const Request *req, double time, double &x, double 
     return true;
 }
 
-bool TrackerData::ReferenceAt(const Request *req, int reference, double selectTime, double time, double &x,
+bool TrackerData::ReferenceAt(const Request *req, const tracking::ReferenceMode &ref, double time, double &x,
                               double &y) const {
     const AnimCurve *curve = path_->Curve();
     if (!curve || curve->Empty()) return false;
     const double first = curve->Keys().front().time, last = curve->Keys().back().time;
-    switch (reference) {
-    case 0: return PositionAt(req, selectTime, x, y);
-    case 2: {
-        double x0 = 0, y0 = 0, x1 = 0, y1 = 0;
-        PositionAt(req, first, x0, y0);
-        PositionAt(req, last, x1, y1);
-        const double f = last > first ? std::clamp((time - first) / (last - first), 0.0, 1.0) : 0.0;
-        x = x0 + (x1 - x0) * f, y = y0 + (y1 - y0) * f;
+    switch (ref.mode) {
+    case 0: return PositionAt(req, ref.selectTime, x, y);
+    case 2:
+        tracking::SmoothReference(
+            first, last, ref.intermediate + 2, time,
+            [&](double t, double &px, double &py) { PositionAt(req, t, px, py); }, x, y);
         return true;
-    }
     case 3: return PositionAt(req, last, x, y);
     default: return PositionAt(req, first, x, y);
     }
 }
 
-void TrackerData::SetOutputs(Request *req, int reference, double selectTime) const {
+double TrackerData::Weight(double time, double rangeStart, double rangeEnd, int fadeFrames) const {
+    const AnimCurve *curve = path_->Curve();
+    if (!curve || curve->Empty()) return 0.0;
+    const double first = curve->Keys().front().time, last = curve->Keys().back().time;
+    const double ramp = std::max(fadeFrames, 0) + 1.0;
+    double w = 1.0;
+    if (first > rangeStart && time < first) w = 1.0 - (first - time) / ramp;
+    if (last < rangeEnd && time > last) w = 1.0 - (time - last) / ramp;
+    return std::clamp(w, 0.0, 1.0);
+}
+
+void TrackerData::SetOutputs(Request *req, const tracking::ReferenceMode &ref,
+                             const std::function<bool(double &, double &)> &flatten) const {
     const double t = req->Time();
     double x = 0.5, y = 0.5, rx = 0.5, ry = 0.5;
     if (IsEnabled(t)) {
@@ -244,13 +253,17 @@ void TrackerData::SetOutputs(Request *req, int reference, double selectTime) con
             y += InputNumberAt(req, yOffset_, t, 0.0);
             rx = x, ry = y;
         } else {
-            ReferenceAt(req, reference, selectTime, t, rx, ry);
+            ReferenceAt(req, ref, t, rx, ry);
         }
     }
-    // Without a corner transform the perspective position is the offset position itself.
-    for (Output *out : {position_, perspective_}) req->SetOutputData(out, MakeRef<Point>(x, y));
-    for (Output *out : {positionX_, perspectiveX_}) req->SetOutputData(out, MakeRef<Orvane::Number>(x));
-    for (Output *out : {positionY_, perspectiveY_}) req->SetOutputData(out, MakeRef<Orvane::Number>(y));
+    double fx = x, fy = y;
+    if (flatten && !flatten(fx, fy)) fx = x, fy = y;
+    req->SetOutputData(position_, MakeRef<Point>(x, y));
+    req->SetOutputData(positionX_, MakeRef<Orvane::Number>(x));
+    req->SetOutputData(positionY_, MakeRef<Orvane::Number>(y));
+    req->SetOutputData(perspective_, MakeRef<Point>(fx, fy));
+    req->SetOutputData(perspectiveX_, MakeRef<Orvane::Number>(fx));
+    req->SetOutputData(perspectiveY_, MakeRef<Orvane::Number>(fy));
     req->SetOutputData(steady_, MakeRef<Point>(0.5 - (x - rx), 0.5 - (y - ry)));
     req->SetOutputData(unsteady_, MakeRef<Point>(0.5 + (x - rx), 0.5 + (y - ry)));
 }

@@ -24,11 +24,13 @@
 // rectangles run on the tool's render thread under the tracker's lock (the
 // matcher's); WritePath runs on the main thread after a run.
 #include <atomic>
+#include <functional>
 #include <memory>
 #include <string>
 #include <vector>
 
 #include "host/track/TrackPoint.h"
+#include "operators/track/MatchMove.h"
 #include "operators/track/TrackerStep.h"
 
 namespace Orvane {
@@ -79,15 +81,20 @@ public:
 
     /// Where the tracker is at `time`: its path plus (XOffset<n>, YOffset<n>); false when the path has no keys.
     bool PositionAt(const Request *req, double time, double &x, double &y) const;
-    /// Where the tracker was at the reference for `time` (Reference: 0 "Select time": at `selectTime`; 1 "Start":
-    /// at the path's first key; 2 "Start & end": on the straight line from the first key's position to the last's,
-    /// by time; 3 "End": at the last key); false when the path has no keys.
-    bool ReferenceAt(const Request *req, int reference, double selectTime, double time, double &x, double &y) const;
+    /// Where the tracker was at the reference for `time`; false when the path has no keys.
+    bool ReferenceAt(const Request *req, const tracking::ReferenceMode &ref, double time, double &x, double &y) const;
+    /// How much the tracker counts at `time`, 0..1: 1 from its path's first key to its last; where the path
+    /// starts after `rangeStart` (ends before `rangeEnd`), rising from 0 over the `fadeFrames` frames before its
+    /// first key (falling to 0 over those after its last), so a tracker that joins or leaves mid-shot eases in
+    /// and out rather than jerking the result; 0 for a path without keys.
+    double Weight(double time, double rangeStart, double rangeEnd, int fadeFrames) const;
 
     /// The outputs' values at the request's time (the defaults, the frame's centre, for a disabled tracker):
     /// TrackedCenter<n> plus (XOffset<n>, YOffset<n>); the steady and unsteady positions are 0.5 minus and plus the
-    /// tracker's movement since the reference.
-    void SetOutputs(Request *req, int reference, double selectTime) const;
+    /// tracker's movement since the reference. The perspective positions are the position taken through
+    /// `flatten` (frame fractions to frame fractions) where it is given and succeeds, else the position.
+    void SetOutputs(Request *req, const tracking::ReferenceMode &ref,
+                    const std::function<bool(double &, double &)> &flatten = {}) const;
 
 private:
     struct Pattern {

@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <cmath>
 #include <cstdarg>
+#include <functional>
 #include <string>
 
 #include "host/core/Tags.h"
@@ -415,10 +416,22 @@ bool TrackerDeluxe::IsToolMotionOutput(const Output *out) const {
     return false;
 }
 
+tracking::ReferenceMode TrackerDeluxe::ReferenceOf(Request *req) const {
+    return {static_cast<int>(std::lround(req->GetInputNumber(reference_, RefStart))),
+            GetDoc() ? GetDoc()->RenderStart() : 0.0,
+            static_cast<int>(std::lround(req->GetInputNumber(intermediate_, 0.0)))};
+}
+
+double TrackerDeluxe::WeightOf(Request *req, const TrackerData &tracker) const {
+    const double start = GetDoc() ? GetDoc()->RenderStart() : -HUGE_VAL,
+                 end = GetDoc() ? GetDoc()->RenderEnd() : HUGE_VAL;
+    return tracker.Weight(req->Time(), start, end,
+                          static_cast<int>(std::lround(req->GetInputNumber(fadeFrames_, 25.0))));
+}
+
 tracking::Motion TrackerDeluxe::MotionAt(Request *req, double aspect) const {
     const double t = req->Time();
-    const int reference = static_cast<int>(std::lround(req->GetInputNumber(reference_, RefStart)));
-    const double selectTime = GetDoc() ? GetDoc()->RenderStart() : 0.0;
+    const tracking::ReferenceMode ref = ReferenceOf(req);
     tracking::MotionOptions o;
     o.position = req->GetInputNumber(position_, 1.0) >= 0.5;
     o.rotation = req->GetInputNumber(rotation_, 1.0) >= 0.5;
@@ -432,15 +445,37 @@ tracking::Motion TrackerDeluxe::MotionAt(Request *req, double aspect) const {
     const std::vector<TrackerData *> listed = ListedTrackers();
     const size_t selected = static_cast<size_t>(std::max(0L, std::lround(req->GetInputNumber(tracker_, 0.0))));
     std::vector<tracking::TrackPair> pairs;
+    double strongest = 0.0;
     for (size_t i = 0; i < listed.size(); ++i) {
         tracking::TrackPair p{};
-        if (!listed[i]->IsEnabled(t) || !listed[i]->PositionAt(req, t, p.x, p.y) ||
-            !listed[i]->ReferenceAt(req, reference, selectTime, t, p.rx, p.ry))
+        p.weight = WeightOf(req, *listed[i]);
+        if (!(p.weight > 0.0) || !listed[i]->IsEnabled(t) || !listed[i]->PositionAt(req, t, p.x, p.y) ||
+            !listed[i]->ReferenceAt(req, ref, t, p.rx, p.ry))
             continue;
         if (i == selected) o.selected = pairs.size();
+        strongest = std::max(strongest, p.weight);
         pairs.push_back(p);
     }
-    return tracking::FitMotion(pairs, o);
+    // Where every tracker is fading, the motion fades with them rather than jumping to none.
+    return tracking::FadeMotion(tracking::FitMotion(pairs, o), strongest);
+}
+
+const char *TrackerDeluxe::CornerQuad(Request *req, double w, double h, QuadPoint quad[4], double &weight) const {
+    const double t = req->Time();
+    std::vector<QuadPoint> found;
+    weight = 1.0;
+    for (TrackerData *tracker : ListedTrackers()) {
+        double x, y;
+        if (found.size() < 4 && tracker->IsEnabled(t) && tracker->PositionAt(req, t, x, y)) {
+            found.push_back({x * w, y * h});
+            weight = std::min(weight, WeightOf(req, *tracker));
+        }
+    }
+    if (found.size() < 4) return "corner positioning needs four enabled trackers with paths";
+    const int turns = static_cast<int>(std::lround(req->GetInputNumber(cornerTurns_, 0.0))) & 3;
+    for (int c = 0; c < 4; ++c) quad[c] = found[(c + turns) % 4];
+    if (!IsConvexQuad(quad)) return "the four trackers do not make a convex four-sided shape";
+    return nullptr;
 }
 
 void TrackerDeluxe::Process(Request *req) {
@@ -450,8 +485,28 @@ void TrackerDeluxe::Process(Request *req) {
         TrackSettings settings = shared_.Settings(req, !(req->GetFlags() & ReqFlagInteractive));
         for (TrackerData *t : EnabledTrackers(ListedTrackers(), req->Time())) t->Step(req, img, req->Time(), settings);
     }
-    const int reference = static_cast<int>(std::lround(req->GetInputNumber(reference_, RefStart)));
-    for (auto &[n, tracker] : trackers_) tracker->SetOutputs(req, reference, GetDoc() ? GetDoc()->RenderStart() : 0.0);
+    // In the corner modes the perspective positions are the trackers' places in the plane of the four corners,
+    // 0..1 across the rectangle they stand for.
+    const int operation = static_cast<int>(std::lround(req->GetInputNumber(operation_, OpNone)));
+    std::function<bool(double &, double &)> flatten;
+    QuadPoint quad[4];
+    double quadWeight = 1.0;
+    Matrix3 toPlane;
+    BilinearQuad bilinear;
+    if ((operation == OpCorner || operation == OpPerspective) && !CornerQuad(req, 1.0, 1.0, quad, quadWeight)) {
+        const QuadPoint unit[4] = {{0, 0}, {1, 0}, {1, 1}, {0, 1}};
+        if (std::lround(req->GetInputNumber(mappingType_, 1.0)) == 1) {
+            if (HomographyFromPoints(quad, unit, toPlane))
+                flatten = [&](double &x, double &y) {
+                    toPlane.Apply(x, y, x, y);
+                    return std::isfinite(x) && std::isfinite(y);
+                };
+        } else if (bilinear.Set(quad)) {
+            flatten = [&](double &x, double &y) { return bilinear.Inverse(x, y, x, y); };
+        }
+    }
+    const tracking::ReferenceMode ref = ReferenceOf(req);
+    for (auto &[n, tracker] : trackers_) tracker->SetOutputs(req, ref, flatten);
 
     auto bg = MakeRef<TransformMatrix>(value, req, input_, 0u, TimeUndefined);
     const double aspect = bg->IsValid() && bg->Width() > 0 && bg->XScale() > 0
@@ -472,7 +527,6 @@ void TrackerDeluxe::Process(Request *req) {
         req->SetOutputData(output_, nullptr);
         return;
     }
-    const int operation = static_cast<int>(std::lround(req->GetInputNumber(operation_, OpNone)));
     if (operation == OpNone || (req->GetFlags() & ReqFlagTrackStep)) {
         req->SetOutputData(output_, value);
         return;
@@ -497,20 +551,11 @@ void TrackerDeluxe::CornerPin(Request *req, TransformMatrix *bg, bool perspectiv
             Fail(req, "%s: %s (time = %g)\n", Name().c_str(), why, req->Time());
         req->SetOutputData(output_, nullptr);
     };
-    // The first four enabled trackers with a path, in Input frame pixels.
-    const double t = req->Time();
+    // The corners in Input frame pixels.
     const double W = bg->Width(), H = bg->Height();
-    std::vector<QuadPoint> found;
-    for (TrackerData *tracker : ListedTrackers()) {
-        double x, y;
-        if (found.size() < 4 && tracker->IsEnabled(t) && tracker->PositionAt(req, t, x, y))
-            found.push_back({x * W, y * H});
-    }
-    if (found.size() < 4) return fail("corner positioning needs four enabled trackers with paths");
-    const int turns = static_cast<int>(std::lround(req->GetInputNumber(cornerTurns_, 0.0))) & 3;
     QuadPoint quad[4];
-    for (int c = 0; c < 4; ++c) quad[c] = found[(c + turns) % 4];
-    if (!IsConvexQuad(quad)) return fail("the four trackers do not make a convex four-sided shape");
+    double weight = 1.0;
+    if (const char *why = CornerQuad(req, W, H, quad, weight)) return fail(why);
 
     Parameter *bgValue = req->GetInputData(input_), *fgValue = req->GetInputData(foreground_);
     const int merge = static_cast<int>(std::lround(req->GetInputNumber(merge_, 2)));
@@ -589,9 +634,11 @@ void TrackerDeluxe::CornerPin(Request *req, TransformMatrix *bg, bool perspectiv
                                 : onto == bgValue
                                     ? Ref<TransformMatrix>(bg)
                                     : MakeRef<TransformMatrix>(fgValue, req, foreground_, 0u, TimeUndefined);
+    // A corner tracker that joins or leaves mid-shot fades the merge in or out rather than freezing its corner.
     Ref<Parameter> keep(fgValue);
     req->SetInputData(foreground_, laid);
-    const bool merged = mergeInputs_->Merge(req, base.Get(), TagList());
+    const bool merged = mergeInputs_->Merge(
+        req, base.Get(), TagList{{MrgBlend, weight * req->GetInputNumber(FindInput("MergeBlend"), 1.0)}});
     req->SetInputData(foreground_, keep.Get());
     if (!merged) {
         req->SetOutputData(output_, nullptr);

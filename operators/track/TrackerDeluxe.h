@@ -63,6 +63,7 @@ namespace Orvane {
 
 class RenderTask;
 class TransformMatrix;
+struct QuadPoint;
 
 class TrackerDeluxe : public ThreadedOperator {
 public:
@@ -97,6 +98,14 @@ private:
     bool IsToolMotionOutput(const Output *out) const;
     /// The motion of the enabled trackers from their reference to the request's time.
     tracking::Motion MotionAt(Request *req, double aspect) const;
+    /// Reference and ReferenceIntermediatePoints at the request's time.
+    tracking::ReferenceMode ReferenceOf(Request *req) const;
+    /// How much `tracker` counts at the request's time (its fade in and out within the render range).
+    double WeightOf(Request *req, const TrackerData &tracker) const;
+    /// The corners of the corner modes at the request's time, in a w x h frame: the first four enabled trackers
+    /// with paths, turned by CornerTurns, and how much the least of them counts; null with the reason when there
+    /// is no convex quad.
+    const char *CornerQuad(Request *req, double w, double h, QuadPoint quad[4], double &weight) const;
     /// Operation "Match Move": the Merge choice with the motion, one resampling.
     void MatchMove(Request *req, TransformMatrix *bg, const tracking::Motion &m);
     /// Operations "Corner Positioning" and "Perspective Positioning".

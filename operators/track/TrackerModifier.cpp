@@ -85,7 +85,7 @@ void TrackerModifier::Process(Request *req) {
         TrackSettings settings = shared_.Settings(req, !(req->GetFlags() & ReqFlagInteractive));
         tracker_->Step(req, dynamic_cast<Image *>(req->GetInputData(input_)), req->Time(), settings);
     }
-    tracker_->SetOutputs(req, 1, 0.0); // movement since the path's first key
+    tracker_->SetOutputs(req, tracking::ReferenceMode{}); // movement since the path's first key
 }
 
 } // namespace Orvane

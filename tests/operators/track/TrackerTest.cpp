@@ -141,6 +141,57 @@ TEST(MatchMove, FitRecoversAKnownMotionAndHonoursTheSwitches) {
     EXPECT_EQ(std::tuple(none.moveX, none.moveY, none.angle, none.scale), std::tuple(0.0, 0.0, 0.0, 1.0));
 }
 
+TEST(MatchMove, WeightsFadingAndTheSmoothReference) {
+    // A pair of weight 0 changes nothing; a pair of weight 2 counts as that pair twice.
+    const std::vector<tracking::TrackPair> base = {
+        {0.2, 0.3, 0.25, 0.28}, {0.7, 0.4, 0.71, 0.47}, {0.5, 0.8, 0.6, 0.8}};
+    std::vector<tracking::TrackPair> ignored = base, doubled = base, twice = base;
+    ignored.push_back({0.1, 0.1, 0.9, 0.9, 0.0});
+    doubled[1].weight = 2.0;
+    twice.push_back(base[1]);
+    const auto same = [](const tracking::Motion &a, const tracking::Motion &b) {
+        return std::abs(a.moveX - b.moveX) + std::abs(a.moveY - b.moveY) + std::abs(a.angle - b.angle) +
+                   std::abs(a.scale - b.scale) + std::abs(a.pivotRefX - b.pivotRefX) <
+               1e-12;
+    };
+    EXPECT_TRUE(same(tracking::FitMotion(ignored, {}), tracking::FitMotion(base, {})));
+    EXPECT_TRUE(same(tracking::FitMotion(doubled, {}), tracking::FitMotion(twice, {})));
+    EXPECT_FALSE(same(tracking::FitMotion(doubled, {}), tracking::FitMotion(base, {})));
+
+    // Fading: none at 0, the motion itself at 1, half the way (in log scale) at 0.5.
+    const tracking::Motion m{0.4, 0.3, 0.1, -0.06, 12.0, 1.44};
+    EXPECT_TRUE(same(tracking::FadeMotion(m, 1.0), m));
+    const tracking::Motion none = tracking::FadeMotion(m, 0.0), half = tracking::FadeMotion(m, 0.5);
+    EXPECT_EQ(std::tuple(none.moveX, none.moveY, none.angle, none.scale), std::tuple(0.0, 0.0, 0.0, 1.0));
+    EXPECT_NEAR(half.moveX, 0.05, 1e-15);
+    EXPECT_NEAR(half.angle, 6.0, 1e-15);
+    EXPECT_NEAR(half.scale, 1.2, 1e-15);
+
+    // The reference through knots of a path x = t^2 / 100, y = sin(t / 4) on 10..20: with two knots the straight line
+    // between the ends, with more it passes through the path at the knots and stays near it between, and holds
+    // beyond the ends.
+    const auto path = [](double t, double &x, double &y) { x = t * t / 100, y = std::sin(t / 4); };
+    double x, y, px, py;
+    tracking::SmoothReference(10, 20, 2, 12.5, path, x, y);
+    EXPECT_NEAR(x, 1.0 + 0.25 * 3.0, 1e-12);
+    EXPECT_NEAR(y, 0.75 * std::sin(2.5) + 0.25 * std::sin(5.0), 1e-12);
+    for (double t : {10.0, 12.5, 15.0, 17.5, 20.0}) {
+        tracking::SmoothReference(10, 20, 5, t, path, x, y);
+        path(t, px, py);
+        EXPECT_NEAR(x, px, 1e-12) << t;
+        EXPECT_NEAR(y, py, 1e-12) << t;
+    }
+    // Between knots 2.5 apart the cubic follows the parabola x exactly (its central tangents are exact inside)
+    // and the sine to within the cubic's error (1.0e-3 here).
+    tracking::SmoothReference(10, 20, 5, 13.75, path, x, y);
+    path(13.75, px, py);
+    EXPECT_NEAR(x, px, 1e-12);
+    EXPECT_NEAR(y, py, 2e-3);
+    tracking::SmoothReference(10, 20, 5, 25, path, x, y);
+    path(20, px, py);
+    EXPECT_EQ(std::tuple(x, y), std::tuple(px, py));
+}
+
 /// A 96 x 64 texture that moves by (2, -1) pixels a frame (wrapping around) within the region asked of it, and that
 /// aborts its render at `abortAt`; it notes the region asked of it on each pixel request.
 class MovingTexture : public ThreadedOperator {
@@ -541,6 +592,106 @@ TEST_F(Tracker, CornerPositioningPinsTheForegroundAndPerspectiveTakesItBack) {
     EXPECT_FALSE(T::EvalImage(undo, 0.0, o));
     EXPECT_NE(T::ConsoleText(doc).find("Tracker2: corner positioning needs four enabled trackers"), std::string::npos)
         << T::ConsoleText(doc);
+}
+
+TEST_F(Tracker, IncompleteTrackersFadeAndIntermediatePointsShapeTheReference) {
+    // One tracker tracked on frames 10..20 of a shot of 0..100, x = 0.3 + (t - 10)^2 / 1000 (0.3 to 0.4), y 0.5.
+    AnimCurve path;
+    for (int t = 10; t <= 20; ++t) path.SetKey(t, MakeRef<Point>(0.3 + (t - 10) * (t - 10) / 1000.0, 0.5));
+    ASSERT_TRUE(tracker->FindInput("TrackedCenter1")->SetCurve(path));
+    T::SetNumbers(tracker, {{"Operation", 1}, {"Merge", 0}, {"Position", 1}, {"Rotation", 0}, {"Scaling", 0}});
+    EvalOptions o;
+    o.useCache = false;
+    const auto steadyX = [&](double t) {
+        const Ref<Parameter> p = Evaluate(tracker->FindOutput("SteadyPosition"), t, o);
+        return p ? dynamic_cast<const Point &>(*p).x : NAN;
+    };
+    const struct {
+        const char *name;
+        int reference, intermediate, fade;
+        double time, expected; ///< 0.5 less the tracker's movement since its reference, faded
+    } cases[] = {
+        {"inside", 1, 0, 25, 15, 0.5 - 0.025},
+        {"13 of 25 + 1 frames after the end: half", 1, 0, 25, 33, 0.5 - 0.1 * 0.5},
+        {"26 frames after: none", 1, 0, 25, 46, 0.5},
+        {"no fade frames: none after the end", 1, 0, 0, 21, 0.5},
+        {"before the start, from the End reference", 3, 0, 25, 10 - 13, 0.5 + 0.1 * 0.5},
+        {"start & end: the straight line", 2, 0, 25, 15, 0.5 - (0.325 - 0.35)},
+        {"start & end through the middle: on the path there", 2, 1, 25, 15, 0.5},
+        {"start & end, two points: on the path at a third", 2, 2, 25, 10 + 10.0 / 3, 0.5},
+    };
+    for (const auto &c : cases) {
+        T::SetNumbers(tracker, {{"Reference", c.reference},
+                                {"ReferenceIntermediatePoints", c.intermediate},
+                                {"IncompleteTrackerFadeInOutFrames", c.fade}});
+        EXPECT_NEAR(steadyX(c.time), c.expected, 1e-9) << c.name;
+    }
+    // A track over the whole shot has no end to fade from: its held movement applies in full.
+    doc.SetRenderRange(10, 20);
+    T::SetNumbers(tracker, {{"Reference", 1}, {"IncompleteTrackerFadeInOutFrames", 0}});
+    EXPECT_NEAR(steadyX(30), 0.4, 1e-9);
+}
+
+TEST_F(Tracker, PerspectivePositionsLieInThePlaneOfTheCorners) {
+    // Trackers 1..4 on a quad, tracker 5 where the mapping puts (0.25, 0.75) of the rectangle they stand for.
+    const QuadPoint quad[4] = {{0.1, 0.1}, {0.9, 0.15}, {0.8, 0.9}, {0.15, 0.85}};
+    const QuadPoint unit[4] = {{0, 0}, {1, 0}, {1, 1}, {0, 1}};
+    ScriptVal list = ScriptVal::Table();
+    for (int n : {1, 2, 3, 4, 5}) list.Append(n);
+    ASSERT_TRUE(tracker->FindInput("TrackerList")->SetValue(MakeRef<ScriptValue>(list)));
+    EvalOptions o;
+    o.useCache = false;
+    for (int mapping : {0, 1}) {
+        double x5, y5;
+        if (mapping == 1) {
+            Matrix3 h;
+            ASSERT_TRUE(HomographyFromPoints(unit, quad, h));
+            h.Apply(0.25, 0.75, x5, y5);
+        } else {
+            BilinearQuad b;
+            ASSERT_TRUE(b.Set(quad));
+            b.Forward(0.25, 0.75, x5, y5);
+        }
+        for (int n = 1; n <= 5; ++n) {
+            AnimCurve path;
+            path.SetKey(0.0, n < 5 ? MakeRef<Point>(quad[n - 1].x, quad[n - 1].y) : MakeRef<Point>(x5, y5));
+            ASSERT_TRUE(tracker->FindInput(("TrackedCenter" + std::to_string(n)).c_str())->SetCurve(path));
+        }
+        for (int operation : {0, 2, 3}) {
+            T::SetNumbers(tracker, {{"Operation", operation}, {"MappingType", mapping}});
+            const auto at = [&](int n) {
+                const Ref<Parameter> p =
+                    Evaluate(tracker->FindOutput(("PerspectivePosition" + std::to_string(n)).c_str()), 0.0, o);
+                const auto *pt = dynamic_cast<const Point *>(p.Get());
+                return pt ? std::pair{pt->x, pt->y} : std::pair{double(NAN), double(NAN)};
+            };
+            // Without corners the perspective position is the position itself.
+            const auto [x, y] = at(5);
+            const auto [cornerX, cornerY] = at(3);
+            EXPECT_NEAR(x, operation ? 0.25 : x5, 1e-9) << mapping << " " << operation;
+            EXPECT_NEAR(y, operation ? 0.75 : y5, 1e-9) << mapping << " " << operation;
+            EXPECT_NEAR(cornerX, operation ? 1.0 : quad[2].x, 1e-9) << mapping << " " << operation;
+            EXPECT_NEAR(cornerY, operation ? 1.0 : quad[2].y, 1e-9) << mapping << " " << operation;
+        }
+    }
+    // The paths hold one key, at frame 0, of a shot of 0..100: a card pinned "FG over BG" shows at frame 0, fades
+    // over the 25 frames after it, and is gone by frame 26, where the output is the plate.
+    ASSERT_TRUE(
+        tracker->FindInput("Foreground")->ConnectTo(T::AddImageSource(doc, "Card1", T::PatternImage(40, 30))->Out()));
+    T::SetNumbers(tracker, {{"Operation", 2}, {"Merge", 2}});
+    const auto differs = [&](double t) {
+        const Ref<Image> out = T::EvalImage(tracker, t, o), plate = T::EvalImage(source, t, o);
+        double worst = 0;
+        for (int y = 0; y < MovingTexture::H; ++y)
+            for (int x = 0; x < MovingTexture::W; ++x)
+                worst = std::max(worst, std::fabs(double(out->GetFlt(x, y).R) - plate->GetFlt(x, y).R));
+        return worst;
+    };
+    const double full = differs(0), half = differs(13);
+    EXPECT_GT(full, 0.1);
+    EXPECT_GT(half, 0.2 * full);
+    EXPECT_LT(half, 0.8 * full);
+    EXPECT_EQ(differs(26), 0.0);
 }
 
 TEST_F(Tracker, NoEnabledTrackerRefusesTheRun) {
