@@ -459,6 +459,25 @@ TEST_F(Tracker, MatchMoveSteadiesTheShotAtItsReference) {
             worst = std::max({worst, std::fabs(double(a.R) - b.R), std::fabs(double(a.B) - b.B)});
         }
     EXPECT_LT(worst, 1e-5);
+    // "FG over BG" and "BG over FG": the moving Foreground and the Input, one laid over the other.
+    const Ref<Image> plate = T::EvalImage(source, 3.0, o);
+    for (int merge : {2, 3}) {
+        T::SetNumber(tracker, "Merge", merge);
+        const Ref<Image> out = T::EvalImage(tracker, 3.0, o);
+        ASSERT_TRUE(out && plate) << T::ConsoleText(doc);
+        worst = 0.0;
+        for (int y = 8; y < MovingTexture::H - 8; ++y)
+            for (int x = 8; x < MovingTexture::W - 8; ++x) {
+                const FltPixel fg = still->GetFlt(x - 3 * MovingTexture::DX, y - 3 * MovingTexture::DY),
+                               bg = plate->GetFlt(x, y), got = out->GetFlt(x, y);
+                const FltPixel &top = merge == 2 ? fg : bg, &under = merge == 2 ? bg : fg;
+                const double keep = 1.0 - top.A;
+                worst = std::max({worst, std::fabs(got.R - (top.R + keep * under.R)),
+                                  std::fabs(got.G - (top.G + keep * under.G)),
+                                  std::fabs(got.A - (top.A + keep * under.A))});
+            }
+        EXPECT_LT(worst, 1e-5) << "merge " << merge;
+    }
 }
 
 TEST_F(Tracker, CornerPositioningPinsTheForegroundAndPerspectiveTakesItBack) {
