@@ -155,6 +155,7 @@ struct TrackPoint::State {
     double width = 0.0, height = 0.0;    ///< normalised pattern size
     double searchW = 0.0, searchH = 0.0; ///< normalised; 0: twice the pattern
     Pattern pattern;                     ///< whole pixels of the image it came from
+    int sourceW = 0, sourceH = 0;        ///< that image's size
     double offsetX = 0.0, offsetY = 0.0; ///< the point minus the pattern's grid centre, in pixels
     double bestSinceTaken = std::numeric_limits<double>::infinity();
     Placement shape; ///< the pattern's turn and scale at the last good step (its translation unused)
@@ -198,6 +199,7 @@ struct TrackPoint::State {
         if (!img.Frame().Contains(rect)) return false;
         Plane plane;
         ReadChannel(img, rect, channel, plane);
+        sourceW = W, sourceH = H;
         return Take(plane, gx, gy, sx, sy);
     }
 };
@@ -270,11 +272,13 @@ TrackResult TrackPoint::Track(const Image *img, double time, double x, double y,
     result.x = x;
     result.y = y;
     if (!img || img->IsNoData()) return result;
-    if (s.invalid) {
+    // A frame at another size (another proxy scale) cannot be matched against the pattern's pixels: the pattern is
+    // taken again from it at the expected position, as after Invalidate.
+    if (s.invalid || (s.hasPattern && (img->Width() != s.sourceW || img->Height() != s.sourceH))) {
         // The pattern is taken here, at the expected position: that is this step's answer.
         s.invalid = false;
         s.hasPattern = s.TakeFromImage(*img, x, y);
-        result.found = s.hasPattern;
+        result.found = s.hasPattern && !s.pattern.Flat();
         return result;
     }
     if (!s.hasPattern || s.pattern.Flat()) return result;

@@ -71,7 +71,9 @@ public:
     /// Pixels of an image of `width` x `height` a Track around (x, y) needs.
     ImgRectI GetSearchRect(int width, int height, double x, double y) const;
 
-    /// Looks for the pattern in `img` around (x, y) within the search area.
+    /// Looks for the pattern in `img` around (x, y) within the search area. An image of another size than the
+    /// one the pattern came from (another proxy scale) has the pattern taken again at (x, y), as after
+    /// Invalidate: that step answers (x, y), and the next steps match at the new size.
     TrackResult Track(const Image *img, double time, double x, double y, TrackSettings &settings);
 
     std::recursive_mutex &Lock() { return lock_; }

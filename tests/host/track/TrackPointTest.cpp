@@ -197,6 +197,38 @@ TEST(TrackPoint, SmallPatternsHoldOnSmoothTexture) {
     }
 }
 
+TEST(TrackPoint, AnotherProxyScaleTakesThePatternAgain) {
+    // Frames 1 and 2 at half size (2 x 2 averages): the first takes the pattern again where it is asked to look,
+    // the second is tracked at the new size against the truth.
+    const Texture tex(7);
+    const Path path = MakePath(0, 0, 0, 0);
+    const auto half = [&](int k) {
+        const Ref<Image> full = Frame(tex, path[k], 1);
+        Ref<Image> small = MakeImage(kW / 2, kH / 2, DepthRGBAFlt32);
+        for (int j = 0; j < kH / 2; ++j)
+            for (int i = 0; i < kW / 2; ++i) {
+                const float v = 0.25f * (full->GetFlt(2 * i, 2 * j).R + full->GetFlt(2 * i + 1, 2 * j).R +
+                                         full->GetFlt(2 * i, 2 * j + 1).R + full->GetFlt(2 * i + 1, 2 * j + 1).R);
+                small->PutFlt(i, j, {v, v, v, 1.f});
+            }
+        return small;
+    };
+    TrackPoint tp;
+    tp.SetSearchArea(kSearch / kW, kSearch / kH);
+    const double x = kPoints[0][0], y = kPoints[0][1];
+    ASSERT_TRUE(tp.SetPattern(Frame(tex, path[0], 1).Get(), x / kW, y / kH, kPattern / kW, kPattern / kH, 0));
+    TrackSettings settings;
+    double tx, ty;
+    Truth(path[1], x, y, tx, ty);
+    const TrackResult taken = tp.Track(half(1).Get(), 1, tx / kW, ty / kH, settings);
+    EXPECT_TRUE(taken.found);
+    EXPECT_EQ(std::pair(taken.x, taken.y), std::pair(tx / kW, ty / kH));
+    const TrackResult next = tp.Track(half(2).Get(), 2, taken.x, taken.y, settings);
+    Truth(path[2], x, y, tx, ty);
+    ASSERT_TRUE(next.found);
+    EXPECT_LT(std::hypot(next.x * kW - tx, next.y * kH - ty), 0.1); // full-size pixels
+}
+
 TEST(TrackPoint, ReverseRetracesForwardPath) {
     const Texture tex(11);
     const Path path = MakePath(0, 0, 0, 0);
@@ -317,7 +349,7 @@ TEST(TrackPoint, FailuresGiveNotFound) {
 
     ASSERT_TRUE(tp.SetPattern(img.Get(), 0.5, 0.5, w, h, 0));
     EXPECT_FALSE(tp.Track(nullptr, 1, 0.5, 0.5, s).found) << "null image";
-    EXPECT_FALSE(tp.Track(tiny.Get(), 1, 0.5, 0.5, s).found) << "image smaller than the pattern";
+    EXPECT_FALSE(tp.Track(tiny.Get(), 1, 0.5, 0.5, s).found) << "a blank frame of another size: nothing to take";
     EXPECT_FALSE(tp.Track(img.Get(), 1, 3.0, 0.5, s).found) << "search area outside the image";
     EXPECT_FALSE(tp.Track(img.Get(), 1, 0.5, std::numeric_limits<double>::quiet_NaN(), s).found);
     tp.Reset();
