@@ -5,11 +5,12 @@
 // filters and edge policies of the transform sampler (TransformSampler.h).
 //
 // Footprint. The filter's stretch along each source axis comes from the
-// mapping's local Jacobian at each output pixel, taken by finite
-// differences over one output pixel: the stretch along source x is
-// |(du/dx, du/dy)|, along source y |(dv/dx, dv/dy)|, at least 1 and at most
-// MaxTransformStretch, as the affine sampler computes it from its matrix.
-// Nearest never stretches.
+// mapping's local Jacobian at each output pixel: the stretch along source x
+// is |(du/dx, du/dy)|, along source y |(dv/dx, dv/dy)|, at least 1 and at
+// most MaxTransformStretch, as the affine sampler computes it from its
+// matrix. Nearest never stretches. A mapping gives the Jacobian itself
+// where it knows it (a projective matrix does); otherwise it is taken by
+// central differences over one output pixel.
 //
 // An output position the mapping does not reach (Map returns false: beyond
 // a projective horizon, outside a quad's solutions) takes the source's
@@ -28,6 +29,16 @@ namespace Orvane {
 
 class Image;
 
+/// Where an output pixel centre samples the source: the position and the
+/// filter's stretch along source x and y; `ok` false where it has none.
+struct MappedSample {
+    double u = 0.0, v = 0.0, sx = 1.0, sy = 1.0;
+    bool ok = false;
+};
+
+/// The filter stretch of a local Jacobian (du/dx, du/dy; dv/dx, dv/dy).
+ORVANE_API void FootprintStretch(double dudx, double dudy, double dvdx, double dvdy, double &sx, double &sy);
+
 /// Output pixel position -> source pixel position (both in the pixel
 /// coordinates of TransformSampler.h: pixel (i, j) covers [i, i + 1) x
 /// [j, j + 1), rows counted from the bottom).
@@ -36,6 +47,11 @@ public:
     virtual ~PointMapping() = default;
     /// False when (x, y) has no source position.
     virtual bool Map(double x, double y, double &u, double &v) const = 0;
+    /// The samples of `count` output positions (x0 + i, y), i = 0..count-1;
+    /// with `stretch` false every sx and sy is 1. The default calls Map,
+    /// four more times per position for the Jacobian (one-sided where a
+    /// neighbour has no source).
+    virtual void MapSpan(double x0, double y, int count, MappedSample *out, bool stretch) const;
 };
 
 /// A 3x3 matrix as a point mapping, projective included: positions where
@@ -46,6 +62,8 @@ class ORVANE_API ProjectiveMapping : public PointMapping {
 public:
     explicit ProjectiveMapping(const Matrix3 &outputToSource) : m_(outputToSource) {}
     bool Map(double x, double y, double &u, double &v) const override;
+    /// The exact Jacobian, (A - p c^T) / w, with no further mapping.
+    void MapSpan(double x0, double y, int count, MappedSample *out, bool stretch) const override;
     /// `outputToSource` scaled by -1 when needed so that positions whose
     /// source lies in front (on the side of source point (sx, sy)) have w > 0.
     /// False for a singular matrix.

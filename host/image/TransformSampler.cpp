@@ -5,6 +5,7 @@
 #include <cmath>
 #include <cstring>
 #include <new>
+#include <tuple>
 #include <type_traits>
 #include <vector>
 
@@ -155,7 +156,7 @@ struct Taps {
 /// Builds the taps of source position u along an axis; appends to `index`
 /// and `weight` and returns the canvas weight. Weights are normalised.
 float BuildTaps(double u, double stretch, const Kernel &k, const AxisRange &axis, std::vector<int> &index,
-                std::vector<float> &weight) {
+                std::vector<float> &weight, std::vector<double> &raw) {
     const size_t first = index.size();
     if (k.Filter() == RszNearest) {
         const int s = axis.Map(static_cast<int>(std::floor(u + kSnap)));
@@ -169,8 +170,7 @@ float BuildTaps(double u, double stretch, const Kernel &k, const AxisRange &axis
     const int k1 = static_cast<int>(std::floor(u + radius - 0.5));
     double total = 0.0, canvas = 0.0;
     // The weights in double until normalised, rounded once, as the fixed-tap
-    // path of RunGeneral rounds them: both give the same bits.
-    thread_local std::vector<double> raw;
+    // path rounds them: both give the same bits.
     raw.clear();
     for (int j = k0; j <= k1; ++j) {
         const double w = k((j + 0.5 - u) / stretch);
@@ -303,9 +303,10 @@ struct TapTable {
     std::vector<float> weight, canvas;
     void Build(int n, double first, double step, double stretch, const Kernel &k, const AxisRange &axis) {
         start.resize(n), count.resize(n), canvas.resize(n);
+        std::vector<double> raw;
         for (int i = 0; i < n; ++i) {
             start[i] = static_cast<int>(index.size());
-            canvas[i] = BuildTaps(first + step * i, stretch, k, axis, index, weight);
+            canvas[i] = BuildTaps(first + step * i, stretch, k, axis, index, weight, raw);
             count[i] = static_cast<int>(index.size()) - start[i];
         }
     }
@@ -396,69 +397,84 @@ bool FixedWeights(const Kernel &k, double u, int k0, int n, float *w) {
     return true;
 }
 
+/// The tap lists of one pixel, reused from pixel to pixel of a row.
+struct TapBuffers {
+    std::vector<int> xi, yi;
+    std::vector<float> xw, yw;
+    std::vector<double> raw;
+};
+
 /// One output pixel from the taps at source position (u, v) with stretches
-/// (sx, sy), each tap mapped by the edge policy. Each thread reuses its tap
-/// buffers.
+/// (sx, sy), each tap mapped by the edge policy.
 template <ComponentType CT, int C>
-void SampleAt(Job &job, double u, double v, double sx, double sy, const float *canvas, FltPixel &out) {
-    thread_local std::vector<int> xi, yi;
-    thread_local std::vector<float> xw, yw;
-    xi.clear(), xw.clear(), yi.clear(), yw.clear();
-    const float xc = BuildTaps(u, sx, job.kernel, job.ax, xi, xw);
-    const float yc = BuildTaps(v, sy, job.kernel, job.ay, yi, yw);
+void SampleAt(Job &job, double u, double v, double sx, double sy, const float *canvas, TapBuffers &b, FltPixel &out) {
+    b.xi.clear(), b.xw.clear(), b.yi.clear(), b.yw.clear();
+    const float xc = BuildTaps(u, sx, job.kernel, job.ax, b.xi, b.xw, b.raw);
+    const float yc = BuildTaps(v, sy, job.kernel, job.ay, b.yi, b.yw, b.raw);
     float acc[C];
-    Gather<CT, C>::Pixel(job.rows.data(), xi.data(), xw.data(), static_cast<int>(xi.size()), xc, yi.data(), yw.data(),
-                         static_cast<int>(yi.size()), yc, canvas, acc);
+    Gather<CT, C>::Pixel(job.rows.data(), b.xi.data(), b.xw.data(), static_cast<int>(b.xi.size()), xc, b.yi.data(),
+                         b.yw.data(), static_cast<int>(b.yi.size()), yc, canvas, acc);
     Store<CT, C>(acc, out);
 }
+
+/// The fixed-tap fast path of an unstretched filter (Box excluded): n = ceil(2 x radius) columns and rows read
+/// directly where they all lie inside the data window (and the frame, for folding edges). False, leaving `out`,
+/// where they do not: the caller maps each tap by the edge policy (SampleAt).
+template <ComponentType CT, int C> struct FixedTaps {
+    using T = typename Comp<CT>::T;
+    int n = 0, xLo = 0, xHi = 0, yLo = 0, yHi = 0;
+    double radius = 0.0;
+    explicit FixedTaps(const Job &job) : radius(job.kernel.Support()) {
+        n = job.kernel.Filter() > RszBox ? static_cast<int>(std::ceil(2.0 * radius)) : 0;
+        auto inside = [](const AxisRange &a) {
+            return a.edges == EdgeCanvas ? std::pair{a.dataLo, a.dataHi}
+                                         : std::pair{std::max(a.dataLo, a.frameLo), std::min(a.dataHi, a.frameHi)};
+        };
+        std::tie(xLo, xHi) = inside(job.ax);
+        std::tie(yLo, yHi) = inside(job.ay);
+    }
+    bool Pixel(const Job &job, double u, double v, FltPixel &out) const {
+        if (n == 0) return false;
+        // Taps k with |k + 0.5 - u| < radius: k0 .. k0 + n - 1.
+        const int k0 = static_cast<int>(std::floor(u - 0.5 - radius)) + 1;
+        const int l0 = static_cast<int>(std::floor(v - 0.5 - radius)) + 1;
+        float wx[kMaxFixedTaps], wy[kMaxFixedTaps];
+        if (!(k0 >= xLo && k0 + n <= xHi && l0 >= yLo && l0 + n <= yHi && FixedWeights(job.kernel, u, k0, n, wx) &&
+              FixedWeights(job.kernel, v, l0, n, wy)))
+            return false;
+        float sum[C] = {};
+        for (int t = 0; t < n; ++t) {
+            const T *p = reinterpret_cast<const T *>(job.rows[l0 + t - job.ay.dataLo]) +
+                         static_cast<size_t>(k0 - job.ax.dataLo) * C;
+            float s[C] = {};
+            for (int q = 0; q < n; ++q)
+                for (int c = 0; c < C; ++c) s[c] += wx[q] * Comp<CT>::Get(p + q * C + c);
+            for (int c = 0; c < C; ++c) sum[c] += wy[t] * s[c];
+        }
+        Store<CT, C>(sum, out);
+        return true;
+    }
+};
 
 /// Any affine mapping: taps per output pixel. Where the filter is not
 /// stretched and every tap lies inside the data window (and the frame, for
 /// folding edges), the taps are a fixed run of ceil(2 x radius) columns and
 /// rows read directly; elsewhere each tap is mapped by the edge policy.
 template <ComponentType CT, int C> void RunGeneral(Job &job) {
-    using T = typename Comp<CT>::T;
     const ImgRectI dw = job.dst->DataWindow();
     const Matrix3 &m = job.map;
     const float canvas[4] = {C == 4 ? job.canvas.R : job.canvas.A, job.canvas.G, job.canvas.B, job.canvas.A};
-    const double radius = job.kernel.Support();
-    const int n = job.kernel.Filter() > RszBox && job.stretchX == 1.0 && job.stretchY == 1.0
-                      ? static_cast<int>(std::ceil(2.0 * radius))
-                      : 0;
-    auto inside = [](const AxisRange &a) {
-        return a.edges == EdgeCanvas ? std::pair{a.dataLo, a.dataHi}
-                                     : std::pair{std::max(a.dataLo, a.frameLo), std::min(a.dataHi, a.frameHi)};
-    };
-    // Plain variables rather than structured bindings: the row lambda captures them.
-    const std::pair<int, int> xs = inside(job.ax), ys = inside(job.ay);
-    const int xLo = xs.first, xHi = xs.second, yLo = ys.first, yHi = ys.second;
+    const bool unstretched = job.stretchX == 1.0 && job.stretchY == 1.0;
+    const FixedTaps<CT, C> fixed(job);
     ForRows(job, [&](int y, FltPixel *out) {
+        TapBuffers taps;
         const double cy = y + 0.5;
         for (int i = 0; i < dw.Width(); ++i) {
             const double cx = dw.x0 + i + 0.5;
             const double u = m(0, 0) * cx + m(0, 1) * cy + m(0, 2);
             const double v = m(1, 0) * cx + m(1, 1) * cy + m(1, 2);
-            if (n > 0) {
-                // Taps k with |k + 0.5 - u| < radius: k0 .. k0 + n - 1.
-                const int k0 = static_cast<int>(std::floor(u - 0.5 - radius)) + 1;
-                const int l0 = static_cast<int>(std::floor(v - 0.5 - radius)) + 1;
-                float wx[kMaxFixedTaps], wy[kMaxFixedTaps];
-                if (k0 >= xLo && k0 + n <= xHi && l0 >= yLo && l0 + n <= yHi &&
-                    FixedWeights(job.kernel, u, k0, n, wx) && FixedWeights(job.kernel, v, l0, n, wy)) {
-                    float sum[C] = {};
-                    for (int t = 0; t < n; ++t) {
-                        const T *p = reinterpret_cast<const T *>(job.rows[l0 + t - job.ay.dataLo]) +
-                                     static_cast<size_t>(k0 - job.ax.dataLo) * C;
-                        float s[C] = {};
-                        for (int q = 0; q < n; ++q)
-                            for (int c = 0; c < C; ++c) s[c] += wx[q] * Comp<CT>::Get(p + q * C + c);
-                        for (int c = 0; c < C; ++c) sum[c] += wy[t] * s[c];
-                    }
-                    Store<CT, C>(sum, out[i]);
-                    continue;
-                }
-            }
-            SampleAt<CT, C>(job, u, v, job.stretchX, job.stretchY, canvas, out[i]);
+            if (!(unstretched && fixed.Pixel(job, u, v, out[i])))
+                SampleAt<CT, C>(job, u, v, job.stretchX, job.stretchY, canvas, taps, out[i]);
         }
     });
 }
@@ -540,34 +556,22 @@ constexpr double kMinW = 1e-12;
 template <ComponentType CT, int C> void RunMapped(Job &job, const PointMapping &map) {
     const ImgRectI dw = job.dst->DataWindow();
     const float canvas[4] = {C == 4 ? job.canvas.R : job.canvas.A, job.canvas.G, job.canvas.B, job.canvas.A};
-    const bool nearest = job.kernel.Filter() == RszNearest;
-    auto stretch = [](double a, double b) {
-        const double s = std::hypot(a, b);
-        return std::isfinite(s) ? std::clamp(s, 1.0, MaxTransformStretch) : MaxTransformStretch;
-    };
+    const bool stretch = job.kernel.Filter() != RszNearest;
+    const FixedTaps<CT, C> fixed(job);
+    constexpr int kSpan = 128; // positions mapped per call: one virtual call per span, on the stack
     ForRows(job, [&](int y, FltPixel *out) {
-        const double cy = y + 0.5;
-        for (int i = 0; i < dw.Width(); ++i) {
-            const double cx = dw.x0 + i + 0.5;
-            double u, v;
-            if (!map.Map(cx, cy, u, v) || !std::isfinite(u) || !std::isfinite(v)) {
-                Store<CT, C>(canvas, out[i]);
-                continue;
+        MappedSample span[kSpan];
+        TapBuffers taps;
+        for (int i0 = 0; i0 < dw.Width(); i0 += kSpan) {
+            const int n = std::min(kSpan, dw.Width() - i0);
+            map.MapSpan(dw.x0 + i0 + 0.5, y + 0.5, n, span, stretch);
+            for (int k = 0; k < n; ++k) {
+                const MappedSample &m = span[k];
+                if (!m.ok)
+                    Store<CT, C>(canvas, out[i0 + k]);
+                else if (!(m.sx == 1.0 && m.sy == 1.0 && fixed.Pixel(job, m.u, m.v, out[i0 + k])))
+                    SampleAt<CT, C>(job, m.u, m.v, m.sx, m.sy, canvas, taps, out[i0 + k]);
             }
-            double sx = 1.0, sy = 1.0;
-            if (!nearest) {
-                // Central differences over one output pixel; one-sided where a neighbour has no source.
-                double ux0, vx0, ux1, vx1, uy0, vy0, uy1, vy1;
-                const bool l = map.Map(cx - 0.5, cy, ux0, vx0), r = map.Map(cx + 0.5, cy, ux1, vx1);
-                const bool d = map.Map(cx, cy - 0.5, uy0, vy0), t = map.Map(cx, cy + 0.5, uy1, vy1);
-                const double dudx = l && r ? ux1 - ux0 : r ? 2 * (ux1 - u) : l ? 2 * (u - ux0) : 0.0;
-                const double dvdx = l && r ? vx1 - vx0 : r ? 2 * (vx1 - v) : l ? 2 * (v - vx0) : 0.0;
-                const double dudy = d && t ? uy1 - uy0 : t ? 2 * (uy1 - u) : d ? 2 * (u - uy0) : 0.0;
-                const double dvdy = d && t ? vy1 - vy0 : t ? 2 * (vy1 - v) : d ? 2 * (v - vy0) : 0.0;
-                sx = stretch(dudx, dudy);
-                sy = stretch(dvdx, dvdy);
-            }
-            SampleAt<CT, C>(job, u, v, sx, sy, canvas, out[i]);
         }
     });
 }
@@ -639,10 +643,7 @@ bool IsPixelPermutation(const Matrix3 &m) {
 void TransformStretch(const Matrix3 &m, int filter, double &sx, double &sy) {
     sx = sy = 1.0;
     if (ValidResizeFilter(filter) == RszNearest) return;
-    sx = std::clamp(std::hypot(m(0, 0), m(0, 1)), 1.0, MaxTransformStretch);
-    sy = std::clamp(std::hypot(m(1, 0), m(1, 1)), 1.0, MaxTransformStretch);
-    if (!std::isfinite(sx)) sx = MaxTransformStretch;
-    if (!std::isfinite(sy)) sy = MaxTransformStretch;
+    FootprintStretch(m(0, 0), m(0, 1), m(1, 0), m(1, 1), sx, sy);
 }
 
 ImgRectI TransformedWindow(const ImgRectI &srcWindow, const Matrix3 &sourceToOutput,
@@ -762,6 +763,50 @@ bool ProjectiveMapping::Map(double x, double y, double &u, double &v) const {
     u = (m_(0, 0) * x + m_(0, 1) * y + m_(0, 2)) / w;
     v = (m_(1, 0) * x + m_(1, 1) * y + m_(1, 2)) / w;
     return true;
+}
+
+void ProjectiveMapping::MapSpan(double x0, double y, int count, MappedSample *out, bool stretch) const {
+    for (int i = 0; i < count; ++i) {
+        MappedSample &s = out[i];
+        const double x = x0 + i, w = xfsampler::WOf(m_, x, y);
+        s.sx = s.sy = 1.0;
+        s.ok = w > xfsampler::kMinW;
+        if (!s.ok) continue;
+        s.u = (m_(0, 0) * x + m_(0, 1) * y + m_(0, 2)) / w;
+        s.v = (m_(1, 0) * x + m_(1, 1) * y + m_(1, 2)) / w;
+        s.ok = std::isfinite(s.u) && std::isfinite(s.v);
+        if (s.ok && stretch)
+            FootprintStretch((m_(0, 0) - s.u * m_(2, 0)) / w, (m_(0, 1) - s.u * m_(2, 1)) / w,
+                             (m_(1, 0) - s.v * m_(2, 0)) / w, (m_(1, 1) - s.v * m_(2, 1)) / w, s.sx, s.sy);
+    }
+}
+
+void FootprintStretch(double dudx, double dudy, double dvdx, double dvdy, double &sx, double &sy) {
+    const auto along = [](double a, double b) {
+        const double s = std::sqrt(a * a + b * b);
+        return std::isfinite(s) ? std::clamp(s, 1.0, MaxTransformStretch) : MaxTransformStretch;
+    };
+    sx = along(dudx, dudy);
+    sy = along(dvdx, dvdy);
+}
+
+void PointMapping::MapSpan(double x0, double y, int count, MappedSample *out, bool stretch) const {
+    for (int i = 0; i < count; ++i) {
+        MappedSample &s = out[i];
+        const double x = x0 + i;
+        s.sx = s.sy = 1.0;
+        s.ok = Map(x, y, s.u, s.v) && std::isfinite(s.u) && std::isfinite(s.v);
+        if (!s.ok || !stretch) continue;
+        // Central differences over one output pixel; one-sided where a neighbour has no source.
+        double ux0, vx0, ux1, vx1, uy0, vy0, uy1, vy1;
+        const bool l = Map(x - 0.5, y, ux0, vx0), r = Map(x + 0.5, y, ux1, vx1);
+        const bool d = Map(x, y - 0.5, uy0, vy0), t = Map(x, y + 0.5, uy1, vy1);
+        const double dudx = l && r ? ux1 - ux0 : r ? 2 * (ux1 - s.u) : l ? 2 * (s.u - ux0) : 0.0;
+        const double dvdx = l && r ? vx1 - vx0 : r ? 2 * (vx1 - s.v) : l ? 2 * (s.v - vx0) : 0.0;
+        const double dudy = d && t ? uy1 - uy0 : t ? 2 * (uy1 - s.u) : d ? 2 * (s.u - uy0) : 0.0;
+        const double dvdy = d && t ? vy1 - vy0 : t ? 2 * (vy1 - s.v) : d ? 2 * (s.v - vy0) : 0.0;
+        FootprintStretch(dudx, dudy, dvdx, dvdy, s.sx, s.sy);
+    }
 }
 
 bool ProjectiveMapping::Facing(const Matrix3 &outputToSource, double sx, double sy, Matrix3 &out) {
