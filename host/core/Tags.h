@@ -371,8 +371,10 @@ constexpr Tag MrgBurnIn = 0x20090003;
 constexpr Tag MrgPlacement = 0x60090000;
 
 // ---- Shapes (Shape::FlattenOfShapeTagList, OutlineOfShapeTagList, ExpandOfShapeTagList) ----
-constexpr Tag ShapeJoin = 0x100b0000;       ///< ShapeJoinKind: 0 bevel, 1 miter, 2 round, 3 miter clip
-constexpr Tag ShapeCap = 0x100b0001;        ///< ShapeCapKind: 0 flat, 1 square, 2 round
+constexpr Tag ShapeJoin = 0x100b0000; ///< ShapeJoinKind: 0 bevel, 1 miter, 2 round, 3 miter clip
+constexpr Tag ShapeCap = 0x100b0001;  ///< ShapeCapKind: 0 flat, 1 square, 2 round
+/// ShapeStyle::CanCombine: compare only what filling needs (the line may differ).
+constexpr Tag ShapeCombineFillOnly = 0x100b0002;
 constexpr Tag ShapeWriteStart = 0x200b0000; ///< write-on: fraction of the path length where the stroke starts
 constexpr Tag ShapeWriteEnd = 0x200b0001;   ///< write-on: fraction where it ends
 constexpr Tag ShapeTolerance = 0x200b0002;  ///< the longest step of a flattened curve or arc

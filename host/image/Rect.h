@@ -59,6 +59,35 @@ struct ORVANE_API ImgRectI {
     constexpr ImgRectI Grown(int dx, int dy) const { return ImgRectI(x0 - dx, y0 - dy, x1 + dx, y1 + dy); }
 };
 
+/// A rectangle in real coordinates (the bounds of vector shapes), closed: x0 <= x <= x1, y0 <= y <= y1, so a
+/// single point has bounds. Empty when x1 < x0 or y1 < y0 (the default).
+struct ImgRectF {
+    double x0 = 0.0, y0 = 0.0, x1 = -1.0, y1 = -1.0;
+
+    constexpr ImgRectF() = default;
+    constexpr ImgRectF(double ax0, double ay0, double ax1, double ay1) : x0(ax0), y0(ay0), x1(ax1), y1(ay1) {}
+
+    constexpr bool IsEmpty() const { return !(x1 >= x0 && y1 >= y0); }
+    constexpr double Width() const { return IsEmpty() ? 0.0 : x1 - x0; }
+    constexpr double Height() const { return IsEmpty() ? 0.0 : y1 - y0; }
+    /// Intersection; disjoint rectangles give an empty one.
+    constexpr ImgRectF operator&(const ImgRectF &o) const {
+        if (IsEmpty() || o.IsEmpty()) return ImgRectF();
+        const ImgRectF r(std::max(x0, o.x0), std::max(y0, o.y0), std::min(x1, o.x1), std::min(y1, o.y1));
+        return r.IsEmpty() ? ImgRectF() : r;
+    }
+    /// The smallest rectangle holding both; an empty one contributes nothing.
+    constexpr ImgRectF operator|(const ImgRectF &o) const {
+        if (IsEmpty()) return o;
+        if (o.IsEmpty()) return *this;
+        return ImgRectF(std::min(x0, o.x0), std::min(y0, o.y0), std::max(x1, o.x1), std::max(y1, o.y1));
+    }
+    constexpr ImgRectF &operator|=(const ImgRectF &o) { return *this = *this | o; }
+    /// Whether the two share a point.
+    constexpr bool Overlaps(const ImgRectF &o) const { return !(*this & o).IsEmpty(); }
+    constexpr bool operator==(const ImgRectF &) const = default;
+};
+
 constexpr bool IsEndlessSide(int v) { return v <= -DomainEndless || v >= DomainEndless; }
 
 struct ORVANE_API ImageDomain {

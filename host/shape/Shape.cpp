@@ -153,6 +153,18 @@ size_t Shape::SizeOf() const {
     return sizeof(*this) + paths_.capacity() * sizeof(SubPath) + static_cast<size_t>(GetCount()) * sizeof(Vertex);
 }
 
+Ref<Shape> Shape::TransformOfShape(const Matrix3 &m) const {
+    Ref<Shape> out = MakeRef<Shape>();
+    out->paths_ = paths_;
+    for (SubPath &sp : out->paths_)
+        for (Vertex &v : sp.points) {
+            const double x = v.x, y = v.y;
+            v.x = m(0, 0) * x + m(0, 1) * y + m(0, 2);
+            v.y = m(1, 0) * x + m(1, 1) * y + m(1, 2);
+        }
+    return out;
+}
+
 Ref<Shape> Shape::FlattenOfShapeTagList(const TagList &tags) const {
     const double tol = ToleranceOf(tags);
     Ref<Shape> flat = MakeRef<Shape>();

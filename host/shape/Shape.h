@@ -18,6 +18,7 @@
 
 #include "host/core/Object.h"
 #include "host/core/TagList.h"
+#include "host/image/Matrix3.h"
 
 namespace Orvane {
 
@@ -92,6 +93,10 @@ public:
     const std::vector<SubPath> &SubPaths() const { return paths_; }
 
     // ---- new shapes ----
+    /// Every point, control points too, through the affine part of `m`: an affine map takes a Bezier curve to
+    /// the curve of its mapped control points, so the result is exact. A singular `m` gives a flattened shape
+    /// (all points on a line or one point), not an error.
+    Ref<Shape> TransformOfShape(const Matrix3 &m) const;
     /// Curves replaced by chords of at most ShapeTolerance, none further than a sixteenth of it from its
     /// curve (adaptive subdivision). A flat shape comes back as a copy.
     Ref<Shape> FlattenOfShapeTagList(const TagList &tags) const;

@@ -12,9 +12,8 @@
 #include <cmath>
 #include <numbers>
 
-#include <clipper.hpp>
-
 #include "host/core/Tags.h"
+#include "host/shape/ClipperUnits.h"
 #include "host/shape/Shape.h"
 
 namespace Orvane {
@@ -22,11 +21,9 @@ namespace Orvane {
 namespace {
 
 namespace CL = ClipperLib;
-
-/// Shape units to Clipper's integers: 2^24. See docs/SHAPES.md.
-constexpr double kClipperScale = 16777216.0;
-/// Clipper refuses coordinates beyond this.
-constexpr double kClipperRange = 4.0e18;
+using clipperunits::kScale;
+using clipperunits::ShapeOfPaths;
+using clipperunits::ToInt;
 
 struct Vec {
     double x, y;
@@ -45,13 +42,6 @@ Vec UnitDirection(const Vec &from, const Vec &to) {
     return len > 0.0 ? d * (1.0 / len) : Vec{1.0, 0.0};
 }
 
-CL::IntPoint ToInt(double x, double y) {
-    auto one = [](double v) {
-        return static_cast<CL::cInt>(std::llround(std::clamp(v * kClipperScale, -kClipperRange, kClipperRange)));
-    };
-    return {one(x), one(y)};
-}
-
 /// A flattened sub-path in Clipper units, without repeated points.
 struct Polyline {
     std::vector<Vec> points;
@@ -63,14 +53,14 @@ struct OffsetStyle {
     int join = ShapeJoinRound;
     int cap = ShapeCapFlat;
     double miterLimit = ShapeDefaultMiterLimit;
-    double tolerance = ShapeDefaultTolerance * kClipperScale; ///< Clipper units
+    double tolerance = ShapeDefaultTolerance * kScale; ///< Clipper units
 
     explicit OffsetStyle(const TagList &tags) {
         join = static_cast<int>(tags.GetLong(ShapeJoin, ShapeJoinRound));
         cap = static_cast<int>(tags.GetLong(ShapeCap, ShapeCapFlat));
         miterLimit = std::max(tags.GetDouble(ShapeMiterLimit, ShapeDefaultMiterLimit), 1.0);
         const double tol = tags.GetDouble(ShapeTolerance, ShapeDefaultTolerance);
-        tolerance = (tol > 0.0 && std::isfinite(tol) ? tol : ShapeDefaultTolerance) * kClipperScale;
+        tolerance = (tol > 0.0 && std::isfinite(tol) ? tol : ShapeDefaultTolerance) * kScale;
     }
 };
 
@@ -130,8 +120,7 @@ public:
 
 private:
     void Emit(const Vec &p, CL::Path &out) const {
-        out.push_back({static_cast<CL::cInt>(std::llround(std::clamp(p.x, -kClipperRange, kClipperRange))),
-                       static_cast<CL::cInt>(std::llround(std::clamp(p.y, -kClipperRange, kClipperRange)))});
+        out.push_back({clipperunits::Round(p.x), clipperunits::Round(p.y)});
     }
 
     /// Points from p + v, turning by `angle` (radians, counter-clockwise) about p.
@@ -294,22 +283,11 @@ CL::Paths Union(const CL::Paths &loops, CL::PolyFillType rule) {
     return result;
 }
 
-Ref<Shape> ShapeOfPaths(const CL::Paths &paths) {
-    Ref<Shape> shape = MakeRef<Shape>();
-    for (const CL::Path &path : paths) {
-        if (path.size() < 3) continue;
-        shape->MoveTo(path[0].X / kClipperScale, path[0].Y / kClipperScale);
-        for (size_t i = 1; i < path.size(); ++i) shape->LineTo(path[i].X / kClipperScale, path[i].Y / kClipperScale);
-        shape->Close();
-    }
-    return shape;
-}
-
 } // namespace
 
 Ref<Shape> Shape::OutlineOfShapeTagList(double width, const TagList &tags) const {
     const OffsetStyle style(tags);
-    const double half = std::abs(width) * 0.5 * kClipperScale;
+    const double half = std::abs(width) * 0.5 * kScale;
     if (!(half >= 0.5) || !std::isfinite(half)) return MakeRef<Shape>();
     std::vector<Polyline> lines = PolylinesOf(*FlattenOfShapeTagList(tags));
     const double start = std::clamp(tags.GetDouble(ShapeWriteStart, 0.0), 0.0, 1.0);
@@ -364,7 +342,7 @@ Ref<Shape> Shape::ExpandOfShapeTagList(double amount, bool solid, const TagList 
         // The filled region as clean contours: outer ones counter-clockwise,
         // holes clockwise, so the right side of each is outside the region.
         region = Union(region, CL::pftNonZero);
-        const double d = amount * kClipperScale;
+        const double d = amount * kScale;
         if (!std::isfinite(d) || std::abs(d) < 0.5) return solid ? ShapeOfPaths(region) : MakeRef<Shape>();
         const OffsetLoopBuilder builder(style, d);
         CL::Paths loops;
