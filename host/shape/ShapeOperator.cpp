@@ -152,11 +152,14 @@ VarianceInput *ShapeOperator::AddVarianceInputTagList(const char *name, const ch
     if (const long long page = tags.GetLong(ControlPage, -1); page >= 0) partTags.Add({ControlPage, page});
     const std::string stepId = std::string(id) + "Step", randomId = std::string(id) + "Random";
     const std::string stepName = std::string(name) + " Step", randomName = std::string(name) + " Random";
+    // The parts' sliders follow the value's: a step of up to a quarter of its range, a spread of up to half.
+    const double span = tags.GetDouble(InputSliderHigh, 1.0) - tags.GetDouble(InputSliderLow, 0.0);
+    const double reach = span > 0.0 && std::isfinite(span) ? span : 1.0;
     Input *step = AddInputTagList(stepName.c_str(), stepId.c_str(),
-                                  With(partTags, {{InputSliderLow, -1.0}, {InputSliderHigh, 1.0}}));
-    Input *random =
-        AddInputTagList(randomName.c_str(), randomId.c_str(),
-                        With(partTags, {{InputSliderLow, 0.0}, {InputSliderHigh, 1.0}, {InputMinAllowed, 0.0}}));
+                                  With(partTags, {{InputSliderLow, -0.25 * reach}, {InputSliderHigh, 0.25 * reach}}));
+    Input *random = AddInputTagList(
+        randomName.c_str(), randomId.c_str(),
+        With(partTags, {{InputSliderLow, 0.0}, {InputSliderHigh, 0.5 * reach}, {InputMinAllowed, 0.0}}));
     variance_.push_back(std::make_unique<VarianceInput>(value, step, random));
     return variance_.back().get();
 }
