@@ -39,23 +39,24 @@ constexpr long long kFullArea = 2LL << (2 * agg::poly_subpixel_shift);
 
 using Cells = agg::rasterizer_cells_aa<agg::cell_aa>;
 
-/// The flattened shape in pixel coordinates; sub-path k is points
-/// [starts[k], starts[k + 1]).
 /// Segments are looked at in runs of this many: a band skips a run that lies
 /// wholly above or below it.
 constexpr size_t kRun = 32;
 
-struct PixelPath {
+} // namespace
+
+/// The flattened shapes in pixel coordinates; sub-path k is points
+/// [starts[k], starts[k + 1]). (Outside the unnamed namespace: ShapeCoverage holds one.)
+struct ShapeCoveragePixelPath {
     std::vector<double> xy;
     std::vector<size_t> starts;
     /// The lowest and highest y of each run of kRun segments of each sub-path
     /// (the closing segment counted with the last run), in order.
     std::vector<std::pair<double, double>> runs;
 
-    /// Finds the runs' extents once the points are in.
-    void MeasureRuns() {
-        runs.clear();
-        for (size_t k = 0; k + 1 < starts.size(); ++k) {
+    /// Finds the runs' extents of sub-paths `first` on, once their points are in.
+    void MeasureRuns(size_t fromPath) {
+        for (size_t k = fromPath; k + 1 < starts.size(); ++k) {
             const size_t first = starts[k], count = starts[k + 1] - first;
             for (size_t i = 0; i < count; i += kRun) {
                 double lo = HUGE_VAL, hi = -HUGE_VAL;
@@ -68,6 +69,8 @@ struct PixelPath {
         }
     }
 };
+
+namespace {
 
 class CoverageRule {
 public:
@@ -119,30 +122,8 @@ void SweepRow(const Cells &cells, int y, int x0, int x1, const CoverageRule &val
     if (pos < x1) fill(x1);
 }
 
-PixelPath PixelPathOf(const Shape &shape, double xScale, double yScale) {
-    Ref<Shape> flat;
-    const Shape *src = &shape;
-    if (!shape.IsFlat()) {
-        flat = shape.FlattenOfShapeTagList({{ShapeTolerance, 1.0 / std::max(xScale, yScale)}}); // 1-pixel steps
-        src = flat.Get();
-    }
-    PixelPath path;
-    path.xy.reserve(2 * static_cast<size_t>(src->GetCount()));
-    for (const Shape::SubPath &sp : src->SubPaths()) {
-        if (sp.points.size() < 3) continue; // no area
-        path.starts.push_back(path.xy.size() / 2);
-        for (const Shape::Vertex &v : sp.points) {
-            path.xy.push_back(v.x * xScale);
-            path.xy.push_back(v.y * yScale);
-        }
-    }
-    path.starts.push_back(path.xy.size() / 2);
-    path.MeasureRuns();
-    return path;
-}
-
 /// Adds the path's edges, clipped to `box`, to the cells; every sub-path is closed.
-void AddEdges(const PixelPath &path, const ImgRectI &box, Cells &cells) {
+void AddEdges(const ShapeCoveragePixelPath &path, const ImgRectI &box, Cells &cells) {
     agg::rasterizer_sl_clip_dbl clip;
     clip.clip_box(box.x0, box.y0, box.x1, box.y1);
     const std::pair<double, double> *run = path.runs.data();
@@ -166,6 +147,95 @@ void AddEdges(const PixelPath &path, const ImgRectI &box, Cells &cells) {
 
 } // namespace
 
+// ---- ShapeCoverage ----
+
+struct ShapeCoverage::Path : ShapeCoveragePixelPath {
+    double xScale = 1.0, yScale = 1.0;
+    double x0 = HUGE_VAL, y0 = HUGE_VAL, x1 = -HUGE_VAL, y1 = -HUGE_VAL;
+};
+
+struct ShapeCoverage::Band::Cells {
+    Cells() : cells(kCellBlockLimit) {}
+    agg::rasterizer_cells_aa<agg::cell_aa> cells;
+};
+
+ShapeCoverage::ShapeCoverage(double xScale, double yScale) : path_(std::make_unique<Path>()) {
+    path_->xScale = xScale;
+    path_->yScale = yScale;
+    path_->starts.push_back(0);
+}
+
+ShapeCoverage::~ShapeCoverage() = default;
+ShapeCoverage::ShapeCoverage(ShapeCoverage &&) noexcept = default;
+ShapeCoverage &ShapeCoverage::operator=(ShapeCoverage &&) noexcept = default;
+
+void ShapeCoverage::Add(const Shape &shape, bool oriented) {
+    Path &path = *path_;
+    Ref<Shape> flat;
+    const Shape *src = &shape;
+    if (!shape.IsFlat()) {
+        flat =
+            shape.FlattenOfShapeTagList({{ShapeTolerance, 1.0 / std::max(path.xScale, path.yScale)}}); // 1-pixel steps
+        src = flat.Get();
+    }
+    bool reverse = false;
+    if (oriented) {
+        double twiceArea = 0.0;
+        for (const Shape::SubPath &sp : src->SubPaths())
+            for (size_t i = 0, n = sp.points.size(); i < n; ++i) {
+                const Shape::Vertex &p = sp.points[i], &q = sp.points[(i + 1) % n];
+                twiceArea += p.x * q.y - q.x * p.y;
+            }
+        reverse = twiceArea * path.xScale * path.yScale < 0.0;
+    }
+    const size_t firstPath = path.starts.size() - 1;
+    path.xy.reserve(path.xy.size() + 2 * static_cast<size_t>(src->GetCount()));
+    for (const Shape::SubPath &sp : src->SubPaths()) {
+        if (sp.points.size() < 3) continue; // no area
+        // A sub-path with a point at no finite place has no area anyone can draw.
+        if (!std::all_of(sp.points.begin(), sp.points.end(), [&](const Shape::Vertex &v) {
+                return std::isfinite(v.x * path.xScale) && std::isfinite(v.y * path.yScale);
+            }))
+            continue;
+        const size_t n = sp.points.size();
+        for (size_t i = 0; i < n; ++i) {
+            const Shape::Vertex &v = sp.points[reverse ? n - 1 - i : i];
+            const double x = v.x * path.xScale, y = v.y * path.yScale;
+            path.xy.push_back(x);
+            path.xy.push_back(y);
+            path.x0 = std::min(path.x0, x), path.x1 = std::max(path.x1, x);
+            path.y0 = std::min(path.y0, y), path.y1 = std::max(path.y1, y);
+        }
+        path.starts.push_back(path.xy.size() / 2);
+    }
+    path.MeasureRuns(firstPath);
+}
+
+bool ShapeCoverage::IsEmpty() const { return path_->starts.size() < 2; }
+
+ImgRectI ShapeCoverage::PixelBox() const {
+    const Path &p = *path_;
+    if (IsEmpty() || !std::isfinite(p.x0 + p.x1 + p.y0 + p.y1)) return ImgRectI();
+    // A vertex moves by up to half a step of the 1/256 pixel grid; the box takes the whole pixels around.
+    const auto lo = [](double v) { return static_cast<int>(std::clamp(std::floor(v), -2e9, 2e9)); };
+    const auto hi = [](double v) { return static_cast<int>(std::clamp(std::floor(v) + 1.0, -2e9, 2e9)); };
+    return ImgRectI(lo(p.x0), lo(p.y0), hi(p.x1), hi(p.y1));
+}
+
+ShapeCoverage::Band::Band() : cells_(std::make_unique<Cells>()) {}
+ShapeCoverage::Band::~Band() = default;
+
+bool ShapeCoverage::Band::Build(const ShapeCoverage &coverage, const ImgRectI &box) {
+    Cells &c = *cells_;
+    c.cells.reset();
+    AddEdges(*coverage.path_, box, c.cells);
+    return c.cells.total_cells() < kCellBlockLimit * 4096u;
+}
+
+void ShapeCoverage::Band::Sweep(int y, int x0, int x1, int windingRule, bool invert, float *out) const {
+    SweepRow(cells_->cells, y, x0, x1, CoverageRule(windingRule == ShapeWindingEvenOdd, invert), out);
+}
+
 bool ShapeRasterizerInputs::Rasterize(Request *req, const Shape &shape, Image *mask, bool invert,
                                       int windingRule) const {
     if (!mask || !mask->IsMask()) return false;
@@ -173,23 +243,20 @@ bool ShapeRasterizerInputs::Rasterize(Request *req, const Shape &shape, Image *m
     if (mask->IsNoData() || win.IsNull()) return true;
     if (!mask->AllocScanLineData()) return false;
     const double xScale = mask->Width();
-    const double yScale = xScale * mask->XScale() / mask->YScale();
-    PixelPath path;
+    ShapeCoverage coverage(xScale, xScale * mask->XScale() / mask->YScale());
     try {
-        path = PixelPathOf(shape, xScale, yScale);
+        coverage.Add(shape, false);
     } catch (const std::bad_alloc &) {
         return false;
     }
     const RenderTask *task = req ? req->GetTask() : nullptr;
-    const CoverageRule value(windingRule == ShapeWindingEvenOdd, invert);
     const int depth = mask->Depth(), width = win.Width();
     std::atomic<bool> failed{false};
     auto band = [&](int b) {
         const ImgRectI box(win.x0, win.y0 + b * kBandRows, win.x1, std::min(win.y0 + (b + 1) * kBandRows, win.y1));
         try {
-            Cells cells(kCellBlockLimit);
-            AddEdges(path, box, cells);
-            if (cells.total_cells() >= kCellBlockLimit * 4096u) {
+            ShapeCoverage::Band cells;
+            if (!cells.Build(coverage, box)) {
                 failed = true;
                 return;
             }
@@ -201,7 +268,7 @@ bool ShapeRasterizerInputs::Rasterize(Request *req, const Shape &shape, Image *m
                     return;
                 }
                 float *out = depth == DepthAFlt32 ? mask->Row<float>(y) : values.data();
-                SweepRow(cells, y, win.x0, win.x1, value, out);
+                cells.Sweep(y, win.x0, win.x1, windingRule, invert, out);
                 if (depth == DepthAFlt32) continue;
                 for (int i = 0; i < width; ++i) pixels[i].A = values[i];
                 StoreFlt(depth, pixels.data(), width, mask->ScanLine(y));

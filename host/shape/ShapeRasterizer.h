@@ -11,9 +11,18 @@
 // A tool makes one in its constructor. It adds no inputs to the tool: the
 // coverage is exact area, so there is no sample count or filter to choose.
 //
+// ShapeCoverage is the scan converter underneath, for callers that put the
+// coverage to other uses (the shape tree renderer composites colours with it):
+// one or more shapes placed in pixels once, then swept band by band.
+//
 // Thread safety: Rasterize may run from any number of threads at once (each
-// into its own image); it spreads its own work over the worker pool.
+// into its own image); it spreads its own work over the worker pool. A
+// ShapeCoverage is built by one thread, then read by any number; each thread
+// sweeps with its own ShapeCoverage::Band.
+#include <memory>
+
 #include "host/core/Export.h"
+#include "host/image/Rect.h"
 
 namespace Orvane {
 
@@ -24,6 +33,53 @@ class Shape;
 
 /// Fill rules of Rasterize.
 enum ShapeWindingRule : int { ShapeWindingEvenOdd = 0, ShapeWindingNonZero = 1 };
+
+/// Shapes flattened and placed in pixels (the mapping above), from which the
+/// exact-area coverage of any band of rows is swept.
+class ORVANE_API ShapeCoverage {
+public:
+    /// `xScale`, `yScale`: pixels per shape unit along each axis (the image
+    /// width, and the width times XScale over YScale).
+    ShapeCoverage(double xScale, double yScale);
+    ~ShapeCoverage();
+    ShapeCoverage(ShapeCoverage &&) noexcept;
+    ShapeCoverage &operator=(ShapeCoverage &&) noexcept;
+
+    /// Adds the shape's sub-paths, curves flattened to 1-pixel steps.
+    /// `oriented`: the shape is turned, where its signed area is negative, so
+    /// that shapes added this way fill their union under the non-zero rule
+    /// rather than cancelling where they wind opposite ways. Throws
+    /// std::bad_alloc.
+    void Add(const Shape &shape, bool oriented);
+    /// Nothing with area was added.
+    bool IsEmpty() const;
+    /// The pixels the added paths may cover (null when empty).
+    ImgRectI PixelBox() const;
+
+    /// The cells of one band of rows, reused band after band.
+    class ORVANE_API Band {
+    public:
+        Band();
+        ~Band();
+        Band(const Band &) = delete;
+        Band &operator=(const Band &) = delete;
+        /// Gathers the edges of `coverage` inside `box` (pixels); the rows and
+        /// columns of `box` may then be swept. False when the band needs more
+        /// cells than one band may hold. Throws std::bad_alloc.
+        bool Build(const ShapeCoverage &coverage, const ImgRectI &box);
+        /// Writes the coverage of row `y` over columns [x0, x1) (inside the
+        /// built box) to `out` under `windingRule`, 1 - coverage when `invert`.
+        void Sweep(int y, int x0, int x1, int windingRule, bool invert, float *out) const;
+
+    private:
+        struct Cells;
+        std::unique_ptr<Cells> cells_;
+    };
+
+private:
+    struct Path;
+    std::unique_ptr<Path> path_;
+};
 
 class ORVANE_API ShapeRasterizerInputs {
 public:

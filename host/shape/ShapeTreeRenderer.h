@@ -1,0 +1,51 @@
+#pragma once
+// ShapeTreeRenderer: draws a ShapeTree into a premultiplied RGBA image.
+//
+// Nodes are drawn in tree order (a node's own shape, then its children): its
+// fill (non-zero rule) in the fill colour, then its line (the stroke of the
+// shape with the style's width, join, cap and miter limit) in the line
+// colour, each alpha times the opacity, composited "over" what is drawn
+// already. Coverage is the exact area of the shape in each pixel (the
+// scan converter of ShapeRasterizer.h, with its mapping of shape units to
+// pixels, so one unit is the image width).
+//
+// Combining (on by default): consecutive nodes whose styles CanCombine are
+// drawn as one shape: the union of their fills, then the union of their
+// lines, one pass each. Where such nodes overlap, a translucent colour is
+// laid once rather than twice, and the line of an earlier node is not hidden
+// by the fill of a later one. docs/SHAPE_RENDER.md has the measurements.
+//
+// Work: the shapes are flattened and stroked once (nodes in parallel); the
+// image is then drawn in bands of rows on the worker pool, each band visiting
+// only the pixels each drawing's box touches. The bands are fixed, so the
+// bits never depend on the number of workers.
+//
+// Thread safety: Render may run from any number of threads at once, each into
+// its own image; the tree is only read.
+#include "host/core/Export.h"
+
+namespace Orvane {
+
+class Image;
+class Request;
+class ShapeTree;
+
+class ORVANE_API ShapeTreeRenderer {
+public:
+    /// Draw consecutive nodes of combinable styles as one (the default), or each by itself.
+    void SetCombine(bool combine) { combine_ = combine; }
+    bool Combine() const { return combine_; }
+
+    /// Draws `tree` into `image`'s data window (an RGBA image of any depth):
+    /// over transparent black when `clear`, else over the pixels it holds.
+    /// `req` (may be null) gives the render whose abort stops the work. False
+    /// on abort, a mask image, or when memory ran out (the rows are then
+    /// partly drawn). An image without pixels (pre-calculation) succeeds at
+    /// once.
+    bool Render(Request *req, const ShapeTree &tree, Image *image, bool clear = true) const;
+
+private:
+    bool combine_ = true;
+};
+
+} // namespace Orvane

@@ -1,0 +1,104 @@
+#include "operators/shape/sRender.h"
+
+#include <algorithm>
+
+#include "host/core/Tags.h"
+#include "host/flow/DataTypes.h"
+#include "host/flow/RenderTask.h"
+#include "host/flow/Request.h"
+#include "host/image/Image.h"
+#include "host/image/NewImage.h"
+#include "host/shape/ShapeTree.h"
+#include "operators/frame/Registration.h"
+
+namespace Orvane {
+
+static ClassRegistration<sRender, SourceOperator>
+    s_Registration(OvID("sRender"), &CLSID_SourceOperator,
+                   {{RegTypeFlags, RegFamilyShape | RegKindOperator | RegKindTool},
+                    {RegClassName, "sRender"},
+                    {RegPath, "Tools/Shape/sRender"},
+                    {RegName, "sRender"},
+                    {RegCategory, "Shape"},
+                    {RegAbbreviation, "sRdr"},
+                    {RegHelp, "Renders shapes into an image"},
+                    {RegIcon, "Icons.Tools.Icons.sRender"},
+                    {RegNoObjectMaterialControls, 1},
+                    {RegNoMotionBlurControls, 1},
+                    {RegSourceRangeControls, 1},
+                    {RegSourceSizeControls, 1},
+                    {RegSourceAspectControls, 1},
+                    {RegSourceDepthControls, 1},
+                    {RegSupportsRoI, 1},
+                    {RegOutputType2, "ShapeTree"}});
+
+sRender::sRender(const Registry *reg, const ScriptVal &args, const TagList &tags) : SourceOperator(reg, args, tags) {
+    // Like every shape tool, the tree input sits on page "Controls". Its priority comes after the frame
+    // controls': CheckRequest knows the frame before the tree is asked for.
+    AddControlPageTagList("Controls", {});
+    input_ = AddInputTagList("Input", "Input",
+                             {{LinkDataType, CLSID_DataType_ShapeTree},
+                              {LinkMain, 1},
+                              {InputRequired, 0},
+                              {InputPriority, PriorityDefault + 1}});
+    output_ = AddOutputTagList("Output", "Output", {{LinkDataType, CLSID_DataType_Image}, {LinkMain, 1}});
+}
+
+ImgRectI sRender::FrameOf(Request *req) const {
+    const SourceFrame f = GetSourceFrame(req);
+    const int scale = std::max(f.proxyScale, 1);
+    return ImgRectI(0, 0, std::max(f.width / scale, 1), std::max(f.height / scale, 1));
+}
+
+void sRender::CheckRequest(Request *req) {
+    const SourceFrame f = GetSourceFrame(req);
+    ImageDomain domain(FrameOf(req));
+    domain.frame = domain.rect;
+    domain.xScale = f.aspectX, domain.yScale = f.aspectY;
+    req->SetInputRoI(input_, &domain);
+    SourceOperator::CheckRequest(req);
+}
+
+void sRender::Process(Request *req) {
+    const SourceFrame f = GetSourceFrame(req);
+    ImgRectI frame = FrameOf(req), window = frame;
+    {
+        const AutoImageRoI roi(req);
+        if (roi) window &= roi->rect;
+    }
+    TagList imgTags{{ImgDocument, static_cast<const void *>(GetDoc())},
+                    {ImgWidth, frame.Width()},
+                    {ImgHeight, frame.Height()},
+                    {ImgXScale, f.aspectX},
+                    {ImgYScale, f.aspectY},
+                    {ImgProxyScale, f.proxyScale},
+                    {ImgDataWindow, &window},
+                    {ImgValidWindow, &window},
+                    {ImgNoData, req->IsPreCalc()},
+                    {ImgForRequest, 1},
+                    {ImgTakeWindows, 1}};
+    if (f.depth != 0) imgTags.Add({ImgDepth, f.depth});
+    if (f.proxyScale > 1) {
+        imgTags.Add({ImgFullWidth, std::max(f.width, 1)});
+        imgTags.Add({ImgFullHeight, std::max(f.height, 1)});
+    }
+    if (const RenderTask *task = req->GetTask())
+        imgTags.Add({ImgAbortFlag, static_cast<const void *>(task->AbortFlag())});
+    Ref<Image> img = NewImageTagList(imgTags);
+    if (!img) {
+        FailOutOfMemory(req);
+        return req->SetOutputData(output_, nullptr);
+    }
+    if (!req->IsPreCalc()) {
+        static const ShapeTree empty;
+        const auto *tree = dynamic_cast<const ShapeTree *>(req->GetInputData(input_));
+        if (!renderer_.Render(req, tree ? *tree : empty, img.Get())) {
+            const RenderTask *task = req->GetTask();
+            if (!(task && task->IsAborted()) && !img->CheckAbort()) FailOutOfMemory(req);
+            return req->SetOutputData(output_, nullptr);
+        }
+    }
+    req->SetOutputData(output_, img.Get());
+}
+
+} // namespace Orvane
