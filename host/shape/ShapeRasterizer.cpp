@@ -92,12 +92,13 @@ private:
     bool evenOdd_, invert_;
 };
 
-/// Writes row y's values over columns [x0, x1) into out.
-void SweepRow(const Cells &cells, int y, int x0, int x1, const CoverageRule &value, float *out) {
+/// Walks row y over columns [x0, x1) from left to right, calling emit(from, to, value) for each stretch of one
+/// value (a cell's pixel, or the constant run up to the next cell).
+template <class Emit> void WalkRow(const Cells &cells, int y, int x0, int x1, const CoverageRule &value, Emit &&emit) {
     int pos = x0;
     long long cover = 0;
     auto fill = [&](int to) {
-        std::fill(out + (pos - x0), out + (to - x0), value(cover << (agg::poly_subpixel_shift + 1)));
+        emit(pos, to, value(cover << (agg::poly_subpixel_shift + 1)));
         pos = to;
     };
     if (cells.total_cells() && y >= cells.min_y() && y <= cells.max_y()) {
@@ -114,7 +115,7 @@ void SweepRow(const Cells &cells, int y, int x0, int x1, const CoverageRule &val
                 ++c;
             } while (--n && (*c)->x == cx);
             if (area != 0 && cx >= x0) {
-                out[cx - x0] = value((cover << (agg::poly_subpixel_shift + 1)) - area);
+                emit(cx, cx + 1, value((cover << (agg::poly_subpixel_shift + 1)) - area));
                 pos = cx + 1;
             }
         }
@@ -233,7 +234,22 @@ bool ShapeCoverage::Band::Build(const ShapeCoverage &coverage, const ImgRectI &b
 }
 
 void ShapeCoverage::Band::Sweep(int y, int x0, int x1, int windingRule, bool invert, float *out) const {
-    SweepRow(cells_->cells, y, x0, x1, CoverageRule(windingRule == ShapeWindingEvenOdd, invert), out);
+    WalkRow(cells_->cells, y, x0, x1, CoverageRule(windingRule == ShapeWindingEvenOdd, invert),
+            [&](int from, int to, float v) { std::fill(out + (from - x0), out + (to - x0), v); });
+}
+
+void ShapeCoverage::Band::SweepSpans(int y, int x0, int x1, int windingRule, float *out,
+                                     std::vector<std::pair<int, int>> &spans) const {
+    spans.clear();
+    WalkRow(cells_->cells, y, x0, x1, CoverageRule(windingRule == ShapeWindingEvenOdd, false),
+            [&](int from, int to, float v) {
+                if (v <= 0.0f) return;
+                std::fill(out + (from - x0), out + (to - x0), v);
+                if (!spans.empty() && spans.back().second == from)
+                    spans.back().second = to;
+                else
+                    spans.emplace_back(from, to);
+            });
 }
 
 bool ShapeRasterizerInputs::Rasterize(Request *req, const Shape &shape, Image *mask, bool invert,

@@ -20,6 +20,8 @@
 // ShapeCoverage is built by one thread, then read by any number; each thread
 // sweeps with its own ShapeCoverage::Band.
 #include <memory>
+#include <utility>
+#include <vector>
 
 #include "host/core/Export.h"
 #include "host/image/Rect.h"
@@ -70,6 +72,10 @@ public:
         /// Writes the coverage of row `y` over columns [x0, x1) (inside the
         /// built box) to `out` under `windingRule`, 1 - coverage when `invert`.
         void Sweep(int y, int x0, int x1, int windingRule, bool invert, float *out) const;
+        /// The same without invert, for callers that skip what is not covered: only the pixels of non-zero
+        /// coverage are written, and `spans` (replaced) lists their stretches of columns [begin, end), in order.
+        void SweepSpans(int y, int x0, int x1, int windingRule, float *out,
+                        std::vector<std::pair<int, int>> &spans) const;
 
     private:
         struct Cells;

@@ -8,6 +8,7 @@
 #include <algorithm>
 #include <atomic>
 #include <cmath>
+#include <functional>
 #include <memory>
 #include <new>
 #include <vector>
@@ -35,9 +36,15 @@ struct NodeDrawing {
     ImgRectI box; ///< the pixels it may touch, within the data window
 };
 
-/// A run of consecutive nodes drawn together (one node when not combining).
+/// A drawn node and what its drawings cover: its shape flattened (with a fill) and its stroke (with a line).
+struct NodeShapes {
+    const ShapeNode *node;
+    Ref<const Shape> fill, line;
+};
+
+/// A run of consecutive nodes drawn together (one node when not combining): nodes [first, first + count).
 struct DrawRun {
-    std::vector<const ShapeNode *> nodes;
+    size_t first, count;
     NodeDrawing fill, line;
 };
 
@@ -67,32 +74,35 @@ bool NodeTouchesWindow(const ShapeNode &node, const ImgRectI &win, double xScale
     return x1 >= win.x0 && x0 <= win.x1 && y1 >= win.y0 && y0 <= win.y1;
 }
 
-/// Makes the run's fill and line drawings.
-void PrepareDrawRun(DrawRun &run, const ImgRectI &win, double xScale, double yScale) {
-    const ShapeStyle &style = run.nodes.front()->Style();
-    const auto finish = [&](NodeDrawing &d, const float *rgba) {
+/// Flattens and strokes the node's shape, in steps of one pixel (what the coverage would flatten to).
+void ShapesOfNode(NodeShapes &ns, double xScale, double yScale) {
+    const Shape &shape = *ns.node->GetShape();
+    const ShapeStyle &style = ns.node->Style();
+    const double tolerance = 1.0 / std::max(xScale, yScale);
+    if (style.fill)
+        ns.fill = shape.IsFlat() ? ns.node->ShapeRef()
+                                 : Ref<const Shape>(shape.FlattenOfShapeTagList({{ShapeTolerance, tolerance}}));
+    if (style.line && style.lineWidth > 0.0 && std::isfinite(style.lineWidth))
+        ns.line = shape.OutlineOfShapeTagList(style.lineWidth, {{ShapeJoin, style.join},
+                                                                {ShapeCap, style.cap},
+                                                                {ShapeMiterLimit, style.miterLimit},
+                                                                {ShapeTolerance, tolerance}});
+}
+
+/// Makes the run's fill and line drawings from its nodes' shapes.
+void PrepareDrawRun(DrawRun &run, const NodeShapes *nodes, const ImgRectI &win, double xScale, double yScale) {
+    const ShapeStyle &style = nodes[run.first].node->Style();
+    const auto make = [&](NodeDrawing &d, Ref<const Shape> NodeShapes::*part, const float *rgba) {
         d.colour = PremultipliedColour(rgba, style.opacity);
+        if (d.colour.A <= 0.0f) return; // draws nothing
+        d.coverage = std::make_unique<ShapeCoverage>(xScale, yScale);
+        for (size_t i = run.first; i < run.first + run.count; ++i)
+            if (const Shape *shape = (nodes[i].*part).Get()) d.coverage->Add(*shape, run.count > 1);
         d.box = d.coverage->PixelBox() & win;
-        if (d.colour.A <= 0.0f || d.box.IsNull()) d.coverage.reset(); // draws nothing
+        if (d.box.IsNull()) d.coverage.reset();
     };
-    if (style.fill) {
-        run.fill.coverage = std::make_unique<ShapeCoverage>(xScale, yScale);
-        for (const ShapeNode *node : run.nodes) run.fill.coverage->Add(*node->GetShape(), run.nodes.size() > 1);
-        finish(run.fill, style.fillColor);
-    }
-    if (style.line && style.lineWidth > 0.0 && std::isfinite(style.lineWidth)) {
-        // The stroke flattened as the fill is: steps of one pixel.
-        const TagList tags{{ShapeJoin, style.join},
-                           {ShapeCap, style.cap},
-                           {ShapeMiterLimit, style.miterLimit},
-                           {ShapeTolerance, 1.0 / std::max(xScale, yScale)}};
-        run.line.coverage = std::make_unique<ShapeCoverage>(xScale, yScale);
-        for (const ShapeNode *node : run.nodes) {
-            const Ref<Shape> stroke = node->GetShape()->OutlineOfShapeTagList(style.lineWidth, tags);
-            if (stroke) run.line.coverage->Add(*stroke, run.nodes.size() > 1);
-        }
-        finish(run.line, style.lineColor);
-    }
+    make(run.fill, &NodeShapes::fill, style.fillColor);
+    make(run.line, &NodeShapes::line, style.lineColor);
 }
 
 /// Lays `d` over `n` pixels whose coverage is `cov`.
@@ -100,7 +110,6 @@ void CompositeOver(const NodeDrawing &d, const float *cov, int n, FltPixel *px) 
     const FltPixel c = d.colour;
     for (int i = 0; i < n; ++i) {
         const float k = cov[i];
-        if (k <= 0.0f) continue;
         const float keep = 1.0f - c.A * k;
         FltPixel &p = px[i];
         p.R = c.R * k + p.R * keep;
@@ -116,6 +125,8 @@ bool ShapeTreeRenderer::Render(Request *req, const ShapeTree &tree, Image *image
     if (!image || image->IsMask()) return false;
     const ImgRectI win = image->DataWindow();
     if (image->IsNoData() || win.IsNull()) return true;
+    // Fresh rows come zeroed (PixelMemory.h): clearing them again would cost a pass over the frame.
+    const bool zeroed = !image->HasScanLineData();
     if (!image->AllocScanLineData()) return false;
     const double xScale = image->Width();
     const double yScale = xScale * image->XScale() / image->YScale();
@@ -127,28 +138,35 @@ bool ShapeTreeRenderer::Render(Request *req, const ShapeTree &tree, Image *image
         return failed.load(std::memory_order_relaxed);
     };
 
+    std::vector<NodeShapes> nodes;
     std::vector<DrawRun> runs;
     try {
         std::vector<const ShapeNode *> drawn;
         GatherDrawnNodes(tree.Root(), drawn);
         for (const ShapeNode *node : drawn) {
             if (!NodeTouchesWindow(*node, win, xScale, yScale)) continue;
-            if (combine_ && !runs.empty() && node->Style().CanCombine(runs.back().nodes.front()->Style()))
-                runs.back().nodes.push_back(node);
+            if (combine_ && !runs.empty() && node->Style().CanCombine(nodes[runs.back().first].node->Style()))
+                ++runs.back().count;
             else
-                runs.emplace_back().nodes.push_back(node);
+                runs.push_back({nodes.size(), 1, {}, {}});
+            nodes.push_back({node, nullptr, nullptr});
         }
     } catch (const std::bad_alloc &) {
         return false;
     }
-    ParallelFor(static_cast<int>(runs.size()), [&](int i) {
-        if (stop()) return;
-        try {
-            PrepareDrawRun(runs[static_cast<size_t>(i)], win, xScale, yScale);
-        } catch (const std::bad_alloc &) {
-            failed = true;
-        }
-    });
+    // Nodes first, each by itself, so that a long run of combined nodes still spreads over the workers.
+    const auto inParallel = [&](size_t count, const std::function<void(size_t)> &fn) {
+        ParallelFor(static_cast<int>(count), [&](int i) {
+            if (stop()) return;
+            try {
+                fn(static_cast<size_t>(i));
+            } catch (const std::bad_alloc &) {
+                failed = true;
+            }
+        });
+    };
+    inParallel(nodes.size(), [&](size_t i) { ShapesOfNode(nodes[i], xScale, yScale); });
+    inParallel(runs.size(), [&](size_t i) { PrepareDrawRun(runs[i], nodes.data(), win, xScale, yScale); });
     if (failed) return false;
     std::vector<const NodeDrawing *> drawings;
     for (const DrawRun &run : runs)
@@ -165,13 +183,15 @@ bool ShapeTreeRenderer::Render(Request *req, const ShapeTree &tree, Image *image
             const auto row = [&](int y) {
                 return direct ? image->Row<FltPixel>(y) : buffer.data() + static_cast<size_t>(y - band.y0) * width;
             };
+            // The band buffer starts transparent; the image's own rows may need clearing.
             for (int y = band.y0; y < band.y1; ++y) {
-                if (clear)
+                if (direct && clear && !zeroed)
                     std::fill_n(row(y), width, FltPixel{});
-                else if (!direct)
+                else if (!direct && !clear)
                     LoadFlt(depth, image->ScanLine(y), width, row(y));
             }
             std::vector<float> cov(static_cast<size_t>(width));
+            std::vector<std::pair<int, int>> spans;
             ShapeCoverage::Band cells;
             for (const NodeDrawing *d : drawings) {
                 const ImgRectI box = d->box & band;
@@ -181,8 +201,9 @@ bool ShapeTreeRenderer::Render(Request *req, const ShapeTree &tree, Image *image
                     return;
                 }
                 for (int y = box.y0; y < box.y1; ++y) {
-                    cells.Sweep(y, box.x0, box.x1, ShapeWindingNonZero, false, cov.data());
-                    CompositeOver(*d, cov.data(), box.Width(), row(y) + (box.x0 - win.x0));
+                    cells.SweepSpans(y, box.x0, box.x1, ShapeWindingNonZero, cov.data(), spans);
+                    for (const auto &[from, to] : spans)
+                        CompositeOver(*d, cov.data() + (from - box.x0), to - from, row(y) + (from - win.x0));
                 }
             }
             if (!direct)

@@ -9,11 +9,14 @@
 // scan converter of ShapeRasterizer.h, with its mapping of shape units to
 // pixels, so one unit is the image width).
 //
-// Combining (on by default): consecutive nodes whose styles CanCombine are
-// drawn as one shape: the union of their fills, then the union of their
+// Combining (off by default): consecutive nodes whose styles CanCombine may
+// be drawn as one shape: the union of their fills, then the union of their
 // lines, one pass each. Where such nodes overlap, a translucent colour is
-// laid once rather than twice, and the line of an earlier node is not hidden
-// by the fill of a later one. docs/SHAPE_RENDER.md has the measurements.
+// then laid once rather than twice, and the line of an earlier node is not
+// hidden by the fill of a later one. Off, every node is drawn by itself, so
+// that the picture of a node never depends on whether its neighbours happen
+// to share its style; it is also the faster way for shapes spread over the
+// frame (docs/SHAPE_RENDER.md has the measurements).
 //
 // Work: the shapes are flattened and stroked once (nodes in parallel); the
 // image is then drawn in bands of rows on the worker pool, each band visiting
@@ -32,7 +35,7 @@ class ShapeTree;
 
 class ORVANE_API ShapeTreeRenderer {
 public:
-    /// Draw consecutive nodes of combinable styles as one (the default), or each by itself.
+    /// Draw consecutive nodes of combinable styles as one, or each by itself (the default).
     void SetCombine(bool combine) { combine_ = combine; }
     bool Combine() const { return combine_; }
 
@@ -45,7 +48,7 @@ public:
     bool Render(Request *req, const ShapeTree &tree, Image *image, bool clear = true) const;
 
 private:
-    bool combine_ = true;
+    bool combine_ = false;
 };
 
 } // namespace Orvane

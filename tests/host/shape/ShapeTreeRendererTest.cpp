@@ -52,7 +52,7 @@ Ref<ShapeTree> Scene() {
     return t;
 }
 
-Ref<Image> Draw(const ShapeTree &tree, bool combine = true, int depth = DepthRGBAFlt32,
+Ref<Image> Draw(const ShapeTree &tree, bool combine = false, int depth = DepthRGBAFlt32,
                 const ImgRectI &window = ImgRectI(0, 0, kW, kH)) {
     Ref<Image> img = Frame(depth, window);
     ShapeTreeRenderer r;
@@ -108,7 +108,7 @@ TEST(ShapeTreeRenderer, DepthsWindowsAndWorkerCountsAgreeWithTheFloatFrame) {
     for (const Case &c : cases) {
         SCOPED_TRACE(testing::Message() << "depth " << c.depth << " workers " << c.workers);
         SetWorkerCount(c.workers);
-        const Ref<Image> img = Draw(*tree, true, c.depth, c.window);
+        const Ref<Image> img = Draw(*tree, false, c.depth, c.window);
         SetWorkerCount(workers);
         for (int y = c.window.y0; y < c.window.y1; ++y)
             for (int x = c.window.x0; x < c.window.x1; ++x) {
