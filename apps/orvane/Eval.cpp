@@ -19,9 +19,9 @@
 #include "host/flow/RenderTask.h"
 #include "host/flow/Request.h"
 #include "host/image/Image.h"
-#include "host/shape/ShapeTree.h"
 #include "host/image/Pixel.h"
 #include "host/image/PixelConvert.h"
+#include "host/shape/ShapeTree.h"
 
 namespace Orvane::Cli {
 namespace {
