@@ -9,6 +9,7 @@
 #include <vector>
 
 #include "host/core/Tags.h"
+#include "host/flow/DocumentIO.h"
 #include "host/flow/Engine.h"
 #include "host/flow/OrvaneDoc.h"
 #include "host/flow/Request.h"
@@ -193,6 +194,14 @@ TEST_F(ShapeTools, MergeDrawsInInputOrderWithoutCopies) {
     const std::vector<ShapeNode *> want{n1.Get(), n2.Get(), n3.Get()};
     ASSERT_EQ(out->Root().Children().size(), want.size());
     for (size_t i = 0; i < want.size(); ++i) EXPECT_EQ(out->Root().Children()[i].Get(), want[i]) << i;
+    // A document keeps the links, the free input opening again as they are read back.
+    Operator *c = Source("C", {});
+    ASSERT_TRUE(merge->FindInput("Input3")->ConnectTo(c->FindMainOutput()));
+    OrvaneDoc loaded;
+    ASSERT_TRUE(LoadDocument(SaveDocument(doc), loaded).ok);
+    Operator *back = loaded.FindTool("Merge");
+    ASSERT_TRUE(back && back->FindInput("Input4"));
+    for (const char *id : {"Input1", "Input2", "Input3"}) EXPECT_TRUE(back->FindInput(id)->Link()) << id;
     // Override Axis: every node turns about the centre of the whole (0.45, 0.25); shapes still shared.
     T::SetNumber(merge, "OverrideAxis", 1);
     out = Eval(merge);
