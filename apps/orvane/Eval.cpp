@@ -21,6 +21,7 @@
 #include "host/image/Image.h"
 #include "host/image/Pixel.h"
 #include "host/image/PixelConvert.h"
+#include "host/shape/ShapeTree.h"
 
 namespace Orvane::Cli {
 namespace {
@@ -238,6 +239,14 @@ int RunEval(const std::vector<std::string> &rawArgs) {
                 for (float f : vals) text += " " + ShortestFloat(f);
                 std::printf("  pixel %d,%d  %s\n", x, y, text.c_str());
             }
+        } else if (const auto *tree = dynamic_cast<const ShapeTree *>(result.Get())) {
+            const ImgRectF b = tree->Bounds();
+            std::printf("  nodes         %d\n", tree->NodeCount());
+            if (!b.IsEmpty()) std::printf("  bounds        %g,%g - %g,%g\n", b.x0, b.y0, b.x1, b.y1);
+            const ScriptVal summary = tree->ToScript();
+            if (const ScriptVal *styles = summary.Find("Styles"))
+                for (size_t i = 1; i <= styles->ArrayLength(); ++i)
+                    std::printf("  style %-7zu %s\n", i, styles->At(i)->ToText().c_str());
         } else if (result) {
             std::printf("  value         %s\n", result->ToScript().ToText().c_str());
         }
