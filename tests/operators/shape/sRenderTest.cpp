@@ -241,20 +241,24 @@ TEST_F(SRender, NoTreeOrAnEmptyOneGivesATransparentFrame) {
     }
 }
 
-TEST_F(SRender, ProxyScaleAndTheFrameAskedOfTheTree) {
+TEST_F(SRender, ProxyScalePixelAspectAndTheFrameAskedOfTheTree) {
     Add(Box(20, 20, 120, 100), Style(1, 1, 1, 1));
     struct Case {
         int width, proxy;
-    } cases[] = {{kW, 1}, {kW, 2}, {4 * kW, 1}, {4 * kW, 4}};
+        double aspectX; ///< pixel aspect X (Y is 1)
+    } cases[] = {{kW, 1, 1.0}, {kW, 2, 1.0}, {4 * kW, 1, 1.0}, {4 * kW, 4, 1.0}, {kW, 1, 2.0}, {kW, 2, 0.5}};
     for (const Case &c : cases) {
-        SCOPED_TRACE(testing::Message() << c.width << " / " << c.proxy);
-        T::SetNumbers(render, {{"Width", c.width}, {"Height", c.width * 3 / 4}});
+        SCOPED_TRACE(testing::Message() << c.width << " / " << c.proxy << ", aspect " << c.aspectX);
+        T::SetNumbers(render, {{"Width", c.width}, {"Height", c.width * 3 / 2}}); // tall enough for every aspect
+        T::SetPoint(render, "PixelAspect", c.aspectX, 1.0);
         const Ref<Image> img = Render(c.proxy);
         ASSERT_TRUE(img);
         const double pixels = double(c.width) / c.proxy;
         EXPECT_EQ(img->Width(), c.width / c.proxy);
-        // The box is 0.5 x 0.4 of the frame width: its area scales with the square of the width rendered.
-        EXPECT_NEAR(SumAlpha(*img), 0.5 * 0.4 * pixels * pixels, 1e-6 * pixels * pixels);
+        // The box is 0.5 x 0.4 of the frame width; a unit spans the width across and width x aspect X / aspect Y
+        // rows up, so the area goes with the square of the width rendered, times the pixel aspect.
+        const double area = 0.5 * 0.4 * pixels * pixels * c.aspectX;
+        EXPECT_NEAR(SumAlpha(*img), area, 1e-6 * area);
         EXPECT_DOUBLE_EQ(source->tolerance, 2.0 / pixels);
     }
 }
