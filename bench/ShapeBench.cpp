@@ -57,16 +57,18 @@ Ref<Shape> Ellipse() {
     return s;
 }
 
-/// A wavy closed curve of 200 Bezier points with smooth handles.
-Ref<Shape> BezierPolygon() {
-    constexpr int n = 200;
-    auto point = [](int i, double &x, double &y, double &tx, double &ty) {
-        const double a = 2 * std::numbers::pi * i / n, r = 0.22 + 0.04 * std::sin(7 * a);
-        const double dr = 0.28 * std::cos(7 * a); // d r / d a
-        x = 0.5 + r * std::cos(a);
+/// A closed curve of `n` Bezier pieces through the points (0.5 + sx r cos a, aspect / 2 + r sin a) at
+/// a = turns x 2 pi i / n, with handles along the tangent a third of a step long; radius(a, r, dr) gives r and
+/// dr / da.
+template <class Radius> Ref<Shape> PolarBezierCurve(int n, double turns, double sx, Radius radius) {
+    auto point = [&](int i, double &x, double &y, double &tx, double &ty) {
+        const double a = turns * 2 * std::numbers::pi * i / n;
+        double r, dr;
+        radius(a, r, dr);
+        x = 0.5 + sx * r * std::cos(a);
         y = kAspect / 2 + r * std::sin(a);
-        const double step = 2 * std::numbers::pi / n / 3;
-        tx = (dr * std::cos(a) - r * std::sin(a)) * step;
+        const double step = turns * 2 * std::numbers::pi / n / 3;
+        tx = sx * (dr * std::cos(a) - r * std::sin(a)) * step;
         ty = (dr * std::sin(a) + r * std::cos(a)) * step;
     };
     Ref<Shape> s = MakeRef<Shape>();
@@ -81,6 +83,14 @@ Ref<Shape> BezierPolygon() {
     }
     s->Close();
     return s;
+}
+
+/// A wavy closed curve of 200 Bezier points with smooth handles.
+Ref<Shape> BezierPolygon() {
+    return PolarBezierCurve(200, 1, 1, [](double a, double &r, double &dr) {
+        r = 0.22 + 0.04 * std::sin(7 * a);
+        dr = 0.28 * std::cos(7 * a);
+    });
 }
 
 void RasterizeLoop(benchmark::State &state, const Shape &shape) {
@@ -222,30 +232,11 @@ Object *MakeTreeSource(const Registry *reg, const ScriptVal &args, const TagList
 /// A long closed path of 2,000 Bezier curves: three turns of a wavy loop about the centre, so that it crosses
 /// itself and the non-zero rule has windings up to 3. Points in shape units.
 Ref<Shape> LongBezierPath() {
-    constexpr int n = 2000;
-    constexpr double turns = 3;
-    auto point = [](int i, double &x, double &y, double &tx, double &ty) {
-        const double a = turns * 2 * std::numbers::pi * i / n;
-        const double r = 0.12 + 0.05 * std::sin(a * 17.0 / 3) + 0.03 * i / n;
-        const double dr = 0.05 * 17.0 / 3 * std::cos(a * 17.0 / 3) + 0.03 / (turns * 2 * std::numbers::pi);
-        x = 0.5 + 1.6 * r * std::cos(a);
-        y = kAspect / 2 + r * std::sin(a);
-        const double step = turns * 2 * std::numbers::pi / n / 3;
-        tx = 1.6 * (dr * std::cos(a) - r * std::sin(a)) * step;
-        ty = (dr * std::sin(a) + r * std::cos(a)) * step;
-    };
-    Ref<Shape> s = MakeRef<Shape>();
-    double x, y, tx, ty;
-    point(0, x, y, tx, ty);
-    s->MoveTo(x, y);
-    for (int i = 1; i <= n; ++i) {
-        double x1, y1, tx1, ty1;
-        point(i % n, x1, y1, tx1, ty1);
-        s->BezierTo(x + tx, y + ty, x1 - tx1, y1 - ty1, x1, y1);
-        x = x1, y = y1, tx = tx1, ty = ty1;
-    }
-    s->Close();
-    return s;
+    constexpr double turns = 3, grow = 0.03 / (turns * 2 * std::numbers::pi); // 0.03 over the three turns
+    return PolarBezierCurve(2000, turns, 1.6, [](double a, double &r, double &dr) {
+        r = 0.12 + 0.05 * std::sin(a * 17.0 / 3) + grow * a;
+        dr = 0.05 * 17.0 / 3 * std::cos(a * 17.0 / 3) + grow;
+    });
 }
 
 /// The path for the peer in its pixels (rows from the top): "M x y", "C x1 y1 x2 y2 x y" and "Z" lines.
