@@ -89,8 +89,9 @@ void ShapesOfNode(NodeShapes &ns, double xScale, double yScale) {
                                                                 {ShapeTolerance, tolerance}});
 }
 
-/// Makes the run's fill and line drawings from its nodes' shapes.
-void PrepareDrawRun(DrawRun &run, const NodeShapes *nodes, const ImgRectI &win, double xScale, double yScale) {
+/// Makes the run's fill and line drawings from its nodes' shapes: those that show in `win`, each cut to `area`.
+void PrepareDrawRun(DrawRun &run, const NodeShapes *nodes, const ImgRectI &area, const ImgRectI &win, double xScale,
+                    double yScale) {
     const ShapeStyle &style = nodes[run.first].node->Style();
     const auto make = [&](NodeDrawing &d, Ref<const Shape> NodeShapes::*part, const float *rgba) {
         d.colour = PremultipliedColour(rgba, style.opacity);
@@ -98,8 +99,8 @@ void PrepareDrawRun(DrawRun &run, const NodeShapes *nodes, const ImgRectI &win, 
         d.coverage = std::make_unique<ShapeCoverage>(xScale, yScale);
         for (size_t i = run.first; i < run.first + run.count; ++i)
             if (const Shape *shape = (nodes[i].*part).Get()) d.coverage->Add(*shape, run.count > 1);
-        d.box = d.coverage->PixelBox() & win;
-        if (d.box.IsNull()) d.coverage.reset();
+        d.box = d.coverage->PixelBox() & area;
+        if ((d.box & win).IsNull()) d.coverage.reset();
     };
     make(run.fill, &NodeShapes::fill, style.fillColor);
     make(run.line, &NodeShapes::line, style.lineColor);
@@ -166,7 +167,16 @@ bool ShapeTreeRenderer::Render(Request *req, const ShapeTree &tree, Image *image
         });
     };
     inParallel(nodes.size(), [&](size_t i) { ShapesOfNode(nodes[i], xScale, yScale); });
-    inParallel(runs.size(), [&](size_t i) { PrepareDrawRun(runs[i], nodes.data(), win, xScale, yScale); });
+    // Edges are cut only at the bands' rows, fixed in the image, and at the sides of the frame (or of a wider
+    // window): a cut moves the edge by up to half a step of the cell grid, so a window within the frame, or a
+    // field's rows, then get the same bits as the whole frame.
+    const auto bandOf = [](int y) {
+        return y >= 0 ? y / kRenderBandRows : -((kRenderBandRows - 1 - y) / kRenderBandRows);
+    };
+    const int firstBand = bandOf(win.y0), lastBand = bandOf(win.y1 - 1);
+    const ImgRectI sides = win | ImgRectI(0, 0, image->Width(), image->Height());
+    const ImgRectI area(sides.x0, firstBand * kRenderBandRows, sides.x1, (lastBand + 1) * kRenderBandRows);
+    inParallel(runs.size(), [&](size_t i) { PrepareDrawRun(runs[i], nodes.data(), area, win, xScale, yScale); });
     if (failed) return false;
     std::vector<const NodeDrawing *> drawings;
     for (const DrawRun &run : runs)
@@ -175,9 +185,10 @@ bool ShapeTreeRenderer::Render(Request *req, const ShapeTree &tree, Image *image
 
     const int depth = image->Depth(), width = win.Width();
     const bool direct = depth == DepthRGBAFlt32; // the image's rows are the working pixels
-    ParallelFor((win.Height() + kRenderBandRows - 1) / kRenderBandRows, [&](int b) {
-        const ImgRectI band(win.x0, win.y0 + b * kRenderBandRows, win.x1,
-                            std::min(win.y0 + (b + 1) * kRenderBandRows, win.y1));
+    ParallelFor(lastBand - firstBand + 1, [&](int b) {
+        const int bandY0 = (firstBand + b) * kRenderBandRows;
+        const ImgRectI rows = ImgRectI(area.x0, bandY0, area.x1, bandY0 + kRenderBandRows); // where edges are cut
+        const ImgRectI band = rows & win;                                                   // what is drawn
         try {
             std::vector<FltPixel> buffer(direct ? 0 : static_cast<size_t>(width) * band.Height());
             const auto row = [&](int y) {
@@ -194,9 +205,9 @@ bool ShapeTreeRenderer::Render(Request *req, const ShapeTree &tree, Image *image
             std::vector<std::pair<int, int>> spans;
             ShapeCoverage::Band cells;
             for (const NodeDrawing *d : drawings) {
-                const ImgRectI box = d->box & band;
+                const ImgRectI cut = d->box & rows, box = cut & band;
                 if (box.IsNull()) continue;
-                if (stop() || !cells.Build(*d->coverage, box)) {
+                if (stop() || !cells.Build(*d->coverage, cut)) {
                     failed = true;
                     return;
                 }

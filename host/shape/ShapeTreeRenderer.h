@@ -20,8 +20,9 @@
 //
 // Work: the shapes are flattened and stroked once (nodes in parallel); the
 // image is then drawn in bands of rows on the worker pool, each band visiting
-// only the pixels each drawing's box touches. The bands are fixed, so the
-// bits never depend on the number of workers.
+// only the pixels each drawing covers. The bands are fixed rows of the image
+// and edges are cut only there and at the frame's sides, so the bits depend
+// neither on the number of workers nor on the data window.
 //
 // Thread safety: Render may run from any number of threads at once, each into
 // its own image; the tree is only read.

@@ -1,6 +1,7 @@
 #include "operators/shape/sRender.h"
 
 #include <algorithm>
+#include <cstring>
 
 #include "host/core/Tags.h"
 #include "host/flow/DataTypes.h"
@@ -59,44 +60,63 @@ void sRender::CheckRequest(Request *req) {
     SourceOperator::CheckRequest(req);
 }
 
+Ref<Image> sRender::NewOutput(Request *req, const SourceFrame &f, const ImgRectI &size, const ImgRectI &window) const {
+    TagList tags{{ImgDocument, static_cast<const void *>(GetDoc())},
+                 {ImgWidth, size.Width()},
+                 {ImgHeight, size.Height()},
+                 {ImgXScale, f.aspectX},
+                 {ImgYScale, f.aspectY},
+                 {ImgProxyScale, f.proxyScale},
+                 {ImgDataWindow, &window},
+                 {ImgValidWindow, &window},
+                 {ImgNoData, req->IsPreCalc()},
+                 {ImgForRequest, 1},
+                 {ImgTakeWindows, 1}};
+    if (f.depth != 0) tags.Add({ImgDepth, f.depth});
+    if (f.proxyScale > 1) {
+        tags.Add({ImgFullWidth, std::max(f.width, 1)});
+        tags.Add({ImgFullHeight, std::max(f.height, 1)});
+    }
+    if (const RenderTask *task = req->GetTask()) tags.Add({ImgAbortFlag, static_cast<const void *>(task->AbortFlag())});
+    return NewImageTagList(tags);
+}
+
 void sRender::Process(Request *req) {
     const SourceFrame f = GetSourceFrame(req);
-    ImgRectI frame = FrameOf(req), window = frame;
-    {
-        const AutoImageRoI roi(req);
-        if (roi) window &= roi->rect;
-    }
-    TagList imgTags{{ImgDocument, static_cast<const void *>(GetDoc())},
-                    {ImgWidth, frame.Width()},
-                    {ImgHeight, frame.Height()},
-                    {ImgXScale, f.aspectX},
-                    {ImgYScale, f.aspectY},
-                    {ImgProxyScale, f.proxyScale},
-                    {ImgDataWindow, &window},
-                    {ImgValidWindow, &window},
-                    {ImgNoData, req->IsPreCalc()},
-                    {ImgForRequest, 1},
-                    {ImgTakeWindows, 1}};
-    if (f.depth != 0) imgTags.Add({ImgDepth, f.depth});
-    if (f.proxyScale > 1) {
-        imgTags.Add({ImgFullWidth, std::max(f.width, 1)});
-        imgTags.Add({ImgFullHeight, std::max(f.height, 1)});
-    }
-    if (const RenderTask *task = req->GetTask())
-        imgTags.Add({ImgAbortFlag, static_cast<const void *>(task->AbortFlag())});
-    Ref<Image> img = NewImageTagList(imgTags);
-    if (!img) {
+    const ImgRectI frame = FrameOf(req);
+    // A field holds the frame's rows 2y + dominance.
+    const int dominance = f.field ? f.fieldDominance : 0;
+    const int height = f.field ? std::max(frame.Height() / 2, 1) : frame.Height();
+    ImgRectI window(0, 0, frame.Width(), height);
+    if (const AutoImageRoI roi(req); roi) window &= roi->rect;
+    Ref<Image> img = NewOutput(req, f, ImgRectI(0, 0, frame.Width(), height), window);
+    // A field is drawn in the frame's rows it takes, then copied row by row.
+    const ImgRectI frameRows(window.x0, 2 * window.y0 + dominance, window.x1,
+                             std::min(2 * window.y1 + dominance, frame.Height()));
+    Ref<Image> drawn = !f.field || window.IsNull() ? img : NewOutput(req, f, frame, frameRows);
+    if (!img || !drawn) {
         FailOutOfMemory(req);
         return req->SetOutputData(output_, nullptr);
     }
     if (!req->IsPreCalc()) {
         static const ShapeTree empty;
         const auto *tree = dynamic_cast<const ShapeTree *>(req->GetInputData(input_));
-        if (!renderer_.Render(req, tree ? *tree : empty, img.Get())) {
+        bool ok = renderer_.Render(req, tree ? *tree : empty, drawn.Get());
+        if (ok && drawn != img && (ok = img->AllocScanLineData()))
+            for (int y = window.y0; y < window.y1; ++y)
+                if (const uint8_t *row = drawn->ScanLine(2 * y + dominance))
+                    std::memcpy(img->ScanLine(y), row, img->RowBytes());
+        if (!ok) {
             const RenderTask *task = req->GetTask();
             if (!(task && task->IsAborted()) && !img->CheckAbort()) FailOutOfMemory(req);
             return req->SetOutputData(output_, nullptr);
         }
+    }
+    if (f.field) {
+        img->SetScale(img->XScale(), img->YScale() * 2.0);
+        TagList fieldTags{{ImgField, dominance}};
+        if (dominance != 0) fieldTags.Add({ImgFieldOffset, 0.5 / height});
+        img->SetAttrsTagList(fieldTags);
     }
     req->SetOutputData(output_, img.Get());
 }

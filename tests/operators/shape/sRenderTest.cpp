@@ -4,6 +4,7 @@
 #include <gtest/gtest.h>
 
 #include <cmath>
+#include <cstring>
 #include <vector>
 
 #include "host/core/Tags.h"
@@ -260,6 +261,27 @@ TEST_F(SRender, ProxyScalePixelAspectAndTheFrameAskedOfTheTree) {
         const double area = 0.5 * 0.4 * pixels * pixels * c.aspectX;
         EXPECT_NEAR(SumAlpha(*img), area, 1e-6 * area);
         EXPECT_DOUBLE_EQ(source->tolerance, 2.0 / pixels);
+    }
+}
+
+TEST_F(SRender, AFieldHoldsItsRowsOfTheFrame) {
+    Add({{10.2, 12.7}, {150.9, 30.1}, {60.4, 140.3}}, Style(0.2f, 1.0f, 0.5f, 0.6f));
+    const Ref<Image> full = Render();
+    ASSERT_TRUE(full);
+    for (int field : {0, 1}) {
+        SCOPED_TRACE(field);
+        Request req(render, render->FindMainOutput(), 0.0, 0, nullptr);
+        req.SetField(field);
+        for (const auto &in : render->Inputs()) req.SlotOf(in.get()).data = in->ValueAt(0.0);
+        req.SetInputData(render->FindInput("Input"), source->tree.Get());
+        render->Process(&req);
+        const auto *img = dynamic_cast<const Image *>(req.GetOutputData(render->FindMainOutput()));
+        ASSERT_TRUE(img);
+        ASSERT_EQ(img->Height(), kH / 2);
+        EXPECT_DOUBLE_EQ(img->YScale(), 2 * full->YScale());
+        EXPECT_EQ(img->Attrs().GetLong(ImgField, -1), field);
+        for (int y = 0; y < kH / 2; ++y)
+            ASSERT_EQ(std::memcmp(img->ScanLine(y), full->ScanLine(2 * y + field), full->RowBytes()), 0) << y;
     }
 }
 
