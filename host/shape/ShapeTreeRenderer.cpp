@@ -122,7 +122,7 @@ void CompositeOver(const NodeDrawing &d, const float *cov, int n, FltPixel *px) 
 
 } // namespace
 
-bool ShapeTreeRenderer::Render(Request *req, const ShapeTree &tree, Image *image, bool clear) const {
+bool ShapeTreeRenderer::Render(Request *req, const ShapeTree &tree, Image *image) const {
     if (!image || image->IsMask()) return false;
     const ImgRectI win = image->DataWindow();
     if (image->IsNoData() || win.IsNull()) return true;
@@ -195,12 +195,8 @@ bool ShapeTreeRenderer::Render(Request *req, const ShapeTree &tree, Image *image
                 return direct ? image->Row<FltPixel>(y) : buffer.data() + static_cast<size_t>(y - band.y0) * width;
             };
             // The band buffer starts transparent; the image's own rows may need clearing.
-            for (int y = band.y0; y < band.y1; ++y) {
-                if (direct && clear && !zeroed)
-                    std::fill_n(row(y), width, FltPixel{});
-                else if (!direct && !clear)
-                    LoadFlt(depth, image->ScanLine(y), width, row(y));
-            }
+            if (direct && !zeroed)
+                for (int y = band.y0; y < band.y1; ++y) std::fill_n(row(y), width, FltPixel{});
             std::vector<float> cov(static_cast<size_t>(width));
             std::vector<std::pair<int, int>> spans;
             ShapeCoverage::Band cells;

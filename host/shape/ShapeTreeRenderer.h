@@ -40,13 +40,12 @@ public:
     void SetCombine(bool combine) { combine_ = combine; }
     bool Combine() const { return combine_; }
 
-    /// Draws `tree` into `image`'s data window (an RGBA image of any depth):
-    /// over transparent black when `clear`, else over the pixels it holds.
-    /// `req` (may be null) gives the render whose abort stops the work. False
-    /// on abort, a mask image, or when memory ran out (the rows are then
-    /// partly drawn). An image without pixels (pre-calculation) succeeds at
-    /// once.
-    bool Render(Request *req, const ShapeTree &tree, Image *image, bool clear = true) const;
+    /// Draws `tree` over transparent black into `image`'s data window (an
+    /// RGBA image of any depth). `req` (may be null) gives the render whose
+    /// abort stops the work. False on abort, a mask image, or when memory ran
+    /// out (the rows are then partly drawn). An image without pixels
+    /// (pre-calculation) succeeds at once.
+    bool Render(Request *req, const ShapeTree &tree, Image *image) const;
 
 private:
     bool combine_ = false;

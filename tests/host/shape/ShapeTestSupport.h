@@ -7,6 +7,7 @@
 
 #include "host/core/Tags.h"
 #include "host/shape/Shape.h"
+#include "host/shape/ShapeTree.h"
 
 namespace Orvane::shapetest {
 
@@ -68,6 +69,27 @@ inline double DistanceToPolyline(const ShapePoint &p, const Shape &s) {
         }
     }
     return best;
+}
+
+/// The corners of an axis-aligned box, anticlockwise.
+inline std::vector<ShapePoint> Box(double x0, double y0, double x1, double y1) {
+    return {{x0, y0}, {x1, y0}, {x1, y1}, {x0, y1}};
+}
+
+/// A filled style of straight colour (r, g, b, a) at `opacity`.
+inline ShapeStyle FillStyle(float r, float g, float b, float a, double opacity = 1.0) {
+    ShapeStyle s;
+    s.fillColor[0] = r, s.fillColor[1] = g, s.fillColor[2] = b, s.fillColor[3] = a, s.opacity = opacity;
+    return s;
+}
+
+/// Appends a node of `shape` and `style` to `parent`; gives the node.
+inline ShapeNode &AddNode(ShapeNode &parent, Ref<Shape> shape, const ShapeStyle &style) {
+    Ref<ShapeNode> n = MakeRef<ShapeNode>();
+    n->SetShape(std::move(shape));
+    n->SetStyle(style);
+    parent.AppendChild(n);
+    return *n;
 }
 
 } // namespace Orvane::shapetest

@@ -1,7 +1,5 @@
-// The shape tree renderer: combining against the over formula, depths, windows and worker counts against the
-// float frame, drawing over existing pixels, bad values and abort. (Areas, strokes and order: sRenderTest.cpp.)
-#include <cmath>
-#include <cstring>
+// The shape tree renderer: combining against the over formula; depths, windows and worker counts against the
+// float frame; bad values and abort. (Areas, strokes, order and fields: tests/operators/shape/sRenderTest.cpp.)
 #include <limits>
 
 #include "host/core/Parallel.h"
@@ -17,44 +15,18 @@ namespace {
 
 constexpr int kW = 120, kH = 90;
 
-Ref<Image> Frame(int depth = DepthRGBAFlt32, const ImgRectI &window = ImgRectI(0, 0, kW, kH)) {
-    return NewImageTagList({{ImgWidth, kW}, {ImgHeight, kH}, {ImgDepth, depth}, {ImgDataWindow, &window}});
-}
-
-/// An axis-aligned rectangle given in pixels; `clockwise` runs it the other way.
+/// A box given in pixels; `clockwise` runs it the other way.
 Ref<Shape> Rect(double x0, double y0, double x1, double y1, bool clockwise = false) {
-    std::vector<ShapePoint> p{{x0 / kW, y0 / kW}, {x1 / kW, y0 / kW}, {x1 / kW, y1 / kW}, {x0 / kW, y1 / kW}};
+    std::vector<ShapePoint> p = Box(x0 / kW, y0 / kW, x1 / kW, y1 / kW);
     if (clockwise) std::reverse(p.begin(), p.end());
     return Polygon(p);
 }
 
-ShapeStyle Fill(float r, float g, float b, float a) {
-    ShapeStyle s;
-    s.fillColor[0] = r, s.fillColor[1] = g, s.fillColor[2] = b, s.fillColor[3] = a;
-    return s;
-}
-
-void Add(ShapeTree &tree, Ref<Shape> shape, const ShapeStyle &style) {
-    Ref<ShapeNode> n = MakeRef<ShapeNode>();
-    n->SetShape(std::move(shape));
-    n->SetStyle(style);
-    tree.Root().AppendChild(std::move(n));
-}
-
-/// A disc with a round-joined stroke over a translucent rectangle: something of every kind to compare.
-Ref<ShapeTree> Scene() {
-    Ref<ShapeTree> t = MakeRef<ShapeTree>();
-    Add(*t, Rect(10.3, 5.7, 80.6, 60.2), Fill(0.2f, 0.9f, 0.4f, 0.6f));
-    ShapeStyle lined = Fill(0.9f, 0.3f, 0.1f, 1.0f);
-    lined.line = true, lined.lineWidth = 4.5 / kW, lined.join = ShapeJoinRound;
-    std::vector<ShapePoint> disc = EllipsePoints(70.0 / kW, 45.0 / kW, 30.0 / kW, 22.0 / kW, 256);
-    Add(*t, Polygon(disc), lined);
-    return t;
-}
+void Add(ShapeTree &tree, Ref<Shape> shape, const ShapeStyle &style) { AddNode(tree.Root(), std::move(shape), style); }
 
 Ref<Image> Draw(const ShapeTree &tree, bool combine = false, int depth = DepthRGBAFlt32,
                 const ImgRectI &window = ImgRectI(0, 0, kW, kH)) {
-    Ref<Image> img = Frame(depth, window);
+    Ref<Image> img = NewImageTagList({{ImgWidth, kW}, {ImgHeight, kH}, {ImgDepth, depth}, {ImgDataWindow, &window}});
     ShapeTreeRenderer r;
     r.SetCombine(combine);
     EXPECT_TRUE(r.Render(nullptr, tree, img.Get()));
@@ -64,20 +36,18 @@ Ref<Image> Draw(const ShapeTree &tree, bool combine = false, int depth = DepthRG
 TEST(ShapeTreeRenderer, CombiningLaysOverlapsOnceWhateverTheWindingAndOnlyForCombinableStyles) {
     const float a = 0.5f;
     struct Case {
-        const char *name;
         bool combine, sameStyle, clockwiseSecond;
         double overlapAlpha; ///< worked out from the over formula
-    } cases[] = {
-        {"combined", true, true, false, a},
-        {"combined, second wound the other way", true, true, true, a},
-        {"not combined", false, true, false, a + a * (1 - a)},
-        {"styles differ", true, false, false, a + a * (1 - a)},
-    };
+    } cases[] = {{true, true, false, a},
+                 {true, true, true, a},
+                 {false, true, false, a + a * (1 - a)},
+                 {true, false, false, a + a * (1 - a)}};
     for (const Case &c : cases) {
-        SCOPED_TRACE(c.name);
+        SCOPED_TRACE(testing::Message() << c.combine << c.sameStyle << c.clockwiseSecond);
         ShapeTree tree;
-        Add(tree, Rect(10, 10, 60, 50), Fill(1, 0, 0, a));
-        Add(tree, Rect(40, 30, 100, 80, c.clockwiseSecond), c.sameStyle ? Fill(1, 0, 0, a) : Fill(0, 0, 1, a));
+        Add(tree, Rect(10, 10, 60, 50), FillStyle(1, 0, 0, a));
+        Add(tree, Rect(40, 30, 100, 80, c.clockwiseSecond),
+            c.sameStyle ? FillStyle(1, 0, 0, a) : FillStyle(0, 0, 1, a));
         const Ref<Image> img = Draw(tree, c.combine);
         EXPECT_NEAR(img->GetFlt(50, 40).A, c.overlapAlpha, 1e-6);
         EXPECT_NEAR(img->GetFlt(20, 20).A, a, 1e-6);
@@ -87,8 +57,13 @@ TEST(ShapeTreeRenderer, CombiningLaysOverlapsOnceWhateverTheWindingAndOnlyForCom
 }
 
 TEST(ShapeTreeRenderer, DepthsWindowsAndWorkerCountsAgreeWithTheFloatFrame) {
-    const Ref<ShapeTree> tree = Scene();
-    const Ref<Image> full = Draw(*tree);
+    // A translucent rectangle under a disc with a round-joined line.
+    ShapeTree tree;
+    Add(tree, Rect(10.3, 5.7, 80.6, 60.2), FillStyle(0.2f, 0.9f, 0.4f, 0.6f));
+    ShapeStyle lined = FillStyle(0.9f, 0.3f, 0.1f, 1.0f);
+    lined.line = true, lined.lineWidth = 4.5 / kW, lined.join = ShapeJoinRound;
+    Add(tree, Polygon(EllipsePoints(70.0 / kW, 45.0 / kW, 30.0 / kW, 22.0 / kW, 256)), lined);
+    const Ref<Image> full = Draw(tree);
     struct Case {
         int depth;
         ImgRectI window;
@@ -107,7 +82,7 @@ TEST(ShapeTreeRenderer, DepthsWindowsAndWorkerCountsAgreeWithTheFloatFrame) {
     for (const Case &c : cases) {
         SCOPED_TRACE(testing::Message() << "depth " << c.depth << " workers " << c.workers);
         SetWorkerCount(c.workers);
-        const Ref<Image> img = Draw(*tree, false, c.depth, c.window);
+        const Ref<Image> img = Draw(tree, false, c.depth, c.window);
         SetWorkerCount(workers);
         for (int y = c.window.y0; y < c.window.y1; ++y)
             for (int x = c.window.x0; x < c.window.x1; ++x) {
@@ -118,28 +93,13 @@ TEST(ShapeTreeRenderer, DepthsWindowsAndWorkerCountsAgreeWithTheFloatFrame) {
     }
 }
 
-TEST(ShapeTreeRenderer, DrawsOverThePixelsThereWhenNotClearing) {
-    ShapeTree tree;
-    Add(tree, Rect(20, 20, 50, 50), Fill(1, 0, 0, 0.25f));
-    for (int depth : {DepthRGBAFlt32, DepthRGBAInt16}) {
-        const Ref<Image> img = Frame(depth);
-        img->Fill(FltPixel{0.0f, 0.5f, 0.0f, 0.5f});
-        ASSERT_TRUE(ShapeTreeRenderer().Render(nullptr, tree, img.Get(), false));
-        const FltPixel in = img->GetFlt(30, 30), out = img->GetFlt(60, 60);
-        EXPECT_NEAR(in.R, 0.25, 1e-4);
-        EXPECT_NEAR(in.G, 0.5 * 0.75, 1e-4);
-        EXPECT_NEAR(in.A, 0.25 + 0.5 * 0.75, 1e-4);
-        EXPECT_NEAR(out.G, 0.5, 1e-4);
-    }
-}
-
-TEST(ShapeTreeRenderer, BadValuesNeitherCrashNorLeaveInvalidPixels) {
+TEST(ShapeTreeRenderer, BadValuesNeitherCrashNorLeaveInvalidPixelsAndAbortStops) {
     const double nan = std::numeric_limits<double>::quiet_NaN(), inf = std::numeric_limits<double>::infinity();
     ShapeTree tree;
-    Add(tree, Polygon({{0.1, 0.1}, {nan, 0.2}, {0.3, 0.4}}), Fill(1, 1, 1, 1));
-    Add(tree, Polygon({{-1e300, -1e300}, {1e300, -1e300}, {0.0, 1e300}}), Fill(0.5f, 0.5f, 0.5f, 0.5f));
-    Add(tree, Polygon({{0.1, 0.1}, {inf, 0.2}, {0.3, 0.4}}), Fill(1, 1, 1, 1));
-    ShapeStyle odd = Fill(static_cast<float>(nan), 2.0f, -1.0f, 7.0f);
+    Add(tree, Polygon({{0.1, 0.1}, {nan, 0.2}, {0.3, 0.4}}), FillStyle(1, 1, 1, 1));
+    Add(tree, Polygon({{-1e300, -1e300}, {1e300, -1e300}, {0.0, 1e300}}), FillStyle(0.5f, 0.5f, 0.5f, 0.5f));
+    Add(tree, Polygon({{0.1, 0.1}, {inf, 0.2}, {0.3, 0.4}}), FillStyle(1, 1, 1, 1));
+    ShapeStyle odd = FillStyle(static_cast<float>(nan), 2.0f, -1.0f, 7.0f);
     odd.opacity = nan;
     odd.line = true, odd.lineWidth = 1e9;
     Add(tree, Rect(10, 10, 30, 30), odd);
@@ -156,14 +116,10 @@ TEST(ShapeTreeRenderer, BadValuesNeitherCrashNorLeaveInvalidPixels) {
     EXPECT_NEAR(img->GetFlt(50, 20).A, 0.75, 1e-5); // opacity 0.5 over it; a negative width draws no line
     const Ref<Image> mask = NewImageTagList({{ImgWidth, kW}, {ImgHeight, kH}, {ImgDepth, DepthAFlt32}});
     EXPECT_FALSE(ShapeTreeRenderer().Render(nullptr, tree, mask.Get()));
-}
-
-TEST(ShapeTreeRenderer, AnAbortedRenderStops) {
     RenderTask task;
     Request req(nullptr, nullptr, 0.0, 0, &task);
     task.Abort();
-    const Ref<Image> img = Frame();
-    EXPECT_FALSE(ShapeTreeRenderer().Render(&req, *Scene(), img.Get()));
+    EXPECT_FALSE(ShapeTreeRenderer().Render(&req, tree, Draw(ShapeTree()).Get()));
 }
 
 } // namespace
