@@ -75,6 +75,13 @@ Ref<Shape> RadialPolygonShape(int count, double rx, double ry, const std::vector
     return s;
 }
 
+Ref<const Shape> FiniteOrNull(Ref<const Shape> shape) {
+    if (!shape) return shape;
+    const ShapeBox b = shape->Bounds();
+    const bool finite = std::isfinite(b.x0) && std::isfinite(b.y0) && std::isfinite(b.x1) && std::isfinite(b.y1);
+    return finite || b.IsEmpty() ? shape : nullptr;
+}
+
 TagList SliderTags(double def, double low, double high, double min) {
     TagList t{
         {InputControl, CLSID_InputControl_Slider}, {InputDefault, def}, {InputSliderLow, low}, {InputSliderHigh, high}};
@@ -167,7 +174,7 @@ ShapeGenerator::Placement ShapeGenerator::PlacementOf(Request *req, const Varian
 
 Ref<ShapeNode> ShapeGenerator::PlacedNode(const Shape &local, const Placement &at, const VarianceState &state) const {
     Ref<ShapeNode> node = MakeRef<ShapeNode>();
-    node->SetShape(local.TransformOfShape(Matrix3::Translate(at.cx, at.cy) * Matrix3::Rotate(at.angle)));
+    node->SetShape(FiniteOrNull(local.TransformOfShape(Matrix3::Translate(at.cx, at.cy) * Matrix3::Rotate(at.angle))));
     node->SetAxis(at.cx, at.cy);
     node->SetStyle(GetStyle(state));
     return node;

@@ -84,6 +84,10 @@ TagList CountTags(double def, double low, double high, double min, double max);
 /// The whole number on `in`, rounded and held to min..max.
 int CountOf(Request *req, const Input *in, int def, int min, int max);
 
+/// `shape` when its points are all finite, else null: a value that is not a number (an expression's) draws nothing
+/// rather than reach the clipper.
+Ref<const Shape> FiniteOrNull(Ref<const Shape> shape);
+
 /// The registry row of shape tool `id` (path "Tools/Shape/<id>", its icon, category "Shape", no blend, material
 /// or motion blur controls, regions of interest); `generator` adds the source kind and the generator flags.
 TagList ShapeToolRow(const char *id, const char *classWord, const char *abbreviation, const char *help, bool generator);

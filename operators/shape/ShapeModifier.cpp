@@ -20,7 +20,7 @@ void ShapeModifier::ReplaceShapes(Request *req, const ShapeTree &in, ShapeTree &
         Ref<const Shape> shape = node.ShapeRef();
         if (shape) {
             state.SetShape(node);
-            shape = fn(node, state);
+            shape = FiniteOrNull(fn(node, state));
             if (shape.Get() == node.GetShape() && node.Children().empty())
                 return Ref<ShapeNode>(const_cast<ShapeNode *>(&node)); // kept, not copied
         }

@@ -9,6 +9,7 @@
 // Every node of copy k is marked copy k with a seed drawn from Random Seed,
 // k and the top node's place, so later tools' Step and Random parts make
 // the copies differ. Copy 0 keeps the input's shapes by reference.
+#include <algorithm>
 #include <cmath>
 
 #include "host/core/Tags.h"
@@ -18,6 +19,8 @@
 #include "operators/shape/ShapeModifier.h"
 
 namespace Orvane {
+
+constexpr int kMostNodes = 1 << 20;
 
 class sDuplicate : public ShapeModifier {
 public:
@@ -44,7 +47,8 @@ public:
         Ref<ShapeTree> out = MakeRef<ShapeTree>(req);
         const ShapeTree *in = GetInputTree(req, input_);
         if (!in) return SetOutputTree(req, out);
-        const int copies = CountOf(req, copies_, 5, 1, 10000);
+        // At most about a million nodes out, whatever the input holds.
+        const int copies = CountOf(req, copies_, 5, 1, std::clamp(kMostNodes / std::max(in->NodeCount(), 1), 1, 10000));
         const uint32_t seed = SeedOf(req);
         VarianceState state(req);
         const auto &tops = in->Root().Children();

@@ -57,6 +57,9 @@ TEST_F(Generators, AreasMatchClosedForms) {
         EXPECT_GE(got, c.area - kSlack) << c.tool; // curves lie on or outside their circles
         EXPECT_LE(got, c.area * (1 + c.relTol) + kSlack) << c.tool;
     }
+    // A number that is not one (an expression's) draws nothing, in a generator or a modifier, and fails nothing.
+    EXPECT_EQ(Top(*Tree(Add("sEllipse", {{"Width", NAN}}))).GetShape(), nullptr);
+    EXPECT_EQ(Top(*Tree(Chain("sJitter", Add("sStar"), {{"XAmount", NAN}}))).GetShape(), nullptr);
 }
 
 TEST_F(Generators, VerticesSitOnTheirCircleAndCenterFollowsTheAspect) {
