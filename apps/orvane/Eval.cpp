@@ -8,6 +8,7 @@
 #include <vector>
 
 #include "apps/orvane/Cli.h"
+
 #include "host/core/Parallel.h"
 #include "host/core/ScriptVal.h"
 #include "host/core/Suggest.h"
@@ -22,6 +23,7 @@
 #include "host/image/Pixel.h"
 #include "host/image/PixelConvert.h"
 #include "host/shape/ShapeTree.h"
+#include <fmt/format.h>
 
 namespace Orvane::Cli {
 namespace {
@@ -243,10 +245,19 @@ int RunEval(const std::vector<std::string> &rawArgs) {
             const ImgRectF b = tree->Bounds();
             std::printf("  nodes         %d\n", tree->NodeCount());
             if (!b.IsEmpty()) std::printf("  bounds        %g,%g - %g,%g\n", b.x0, b.y0, b.x1, b.y1);
-            const ScriptVal summary = tree->ToScript();
-            if (const ScriptVal *styles = summary.Find("Styles"))
-                for (size_t i = 1; i <= styles->ArrayLength(); ++i)
-                    std::printf("  style %-7zu %s\n", i, styles->At(i)->ToText().c_str());
+            int n = 0;
+            for (const ShapeStyle &st : tree->Styles()) {
+                std::string text;
+                const auto colour = [](const float *c) {
+                    return fmt::format("{:g} {:g} {:g} {:g}", c[0], c[1], c[2], c[3]);
+                };
+                if (st.fill) text += "fill " + colour(st.fillColor);
+                if (st.line)
+                    text += (text.empty() ? "" : ", ") +
+                            fmt::format("line {} width {:g}", colour(st.lineColor), st.lineWidth);
+                if (st.opacity != 1.0) text += fmt::format(", opacity {:g}", st.opacity);
+                std::printf("  style %-7d %s\n", ++n, text.empty() ? "not drawn" : text.c_str());
+            }
         } else if (result) {
             std::printf("  value         %s\n", result->ToScript().ToText().c_str());
         }

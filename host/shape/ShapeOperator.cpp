@@ -91,10 +91,17 @@ TagList Slider(int page, double def, double low, double high, double minAllowed)
 
 ShapeOperator::ShapeOperator(const Registry *reg, const ScriptVal &args, const TagList &tags, bool withStyle,
                              OvID outputType)
-    : ThreadedOperator(reg, args, tags) {
-    const int controls = AddControlPageTagList("Controls", {});
+    : ThreadedOperator(reg, args, tags), withStyle_(withStyle) {
+    AddControlPageTagList("Controls", {});
     output_ = AddOutputTagList("Output", "Output", {{LinkDataType, outputType}, {LinkMain, 1}});
-    if (!withStyle) return;
+}
+
+void ShapeOperator::FinishConstruction() {
+    if (withStyle_) AddStyleControls();
+    ThreadedOperator::FinishConstruction();
+}
+
+void ShapeOperator::AddStyleControls() {
     const int page = AddControlPageTagList("Style", {});
     style_ = std::make_unique<StyleInputs>();
     StyleInputs &s = *style_;
@@ -130,7 +137,6 @@ ShapeOperator::ShapeOperator(const Registry *reg, const ScriptVal &args, const T
         AddInputTagList("Miter Limit", "MiterLimit",
                         With(Slider(page, def.miterLimit, 1.0, 10.0, 1.0), {{LinkDataType, CLSID_DataType_Number}}));
     s.opacity = AddVarianceInputTagList("Opacity", "Opacity", Slider(page, def.opacity, 0.0, 1.0, 0.0));
-    SetCurrentPage(controls);
 }
 
 ShapeOperator::~ShapeOperator() = default;

@@ -65,11 +65,13 @@ private:
 
 class ORVANE_API ShapeOperator : public ThreadedOperator {
 public:
-    /// `withStyle`: the tool has the style controls (added at once, on page "Style"); the tool's own inputs go
-    /// on page "Controls". `outputType`: what "Output" carries (an image for the renderer).
+    /// `withStyle`: the tool has the style controls (on page "Style", added after the tool's own inputs, which go
+    /// on page "Controls"). `outputType`: what "Output" carries (an image for the renderer).
     ShapeOperator(const Registry *reg, const ScriptVal &args, const TagList &tags, bool withStyle,
                   OvID outputType = CLSID_DataType_ShapeTree);
     ~ShapeOperator() override;
+    /// Adds the style controls after the tool's own inputs.
+    void FinishConstruction() override;
 
     /// Passes the request's region (which carries the reference frame the trees are flattened for) to the shape
     /// inputs.
@@ -117,7 +119,10 @@ protected:
     Output *output_ = nullptr;
 
 private:
+    void AddStyleControls();
+
     struct StyleInputs;
+    bool withStyle_;
     std::unique_ptr<StyleInputs> style_;
     std::vector<std::unique_ptr<VarianceInput>> variance_;
 };

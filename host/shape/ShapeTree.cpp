@@ -165,12 +165,16 @@ ScriptVal ShapeTree::ToScript() const {
         for (double v : {b.x0, b.y0, b.x1, b.y1}) box.Append(v);
         t.Set("Bounds", std::move(box));
     }
-    std::vector<ShapeStyle> styles;
-    CollectStyles(*root_, styles);
     ScriptVal list = ScriptVal::Table();
-    for (const ShapeStyle &s : styles) list.Append(StyleSummary(s));
+    for (const ShapeStyle &s : Styles()) list.Append(StyleSummary(s));
     t.Set("Styles", std::move(list));
     return t;
+}
+
+std::vector<ShapeStyle> ShapeTree::Styles() const {
+    std::vector<ShapeStyle> styles;
+    CollectStyles(*root_, styles);
+    return styles;
 }
 
 bool ShapeTree::Equals(const Parameter &other) const {

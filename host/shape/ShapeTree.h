@@ -121,6 +121,8 @@ public:
     /// Nodes below the root.
     int NodeCount() const { return root_->CountNodes() - 1; }
     ImgRectF Bounds() const { return root_->TreeBounds(); }
+    /// The distinct styles of the nodes that draw (have a shape), in drawing order.
+    std::vector<ShapeStyle> Styles() const;
 
     OvID DataType() const override;
     /// A summary (nodes, bounds, the styles in drawing order); trees are not saved in documents.

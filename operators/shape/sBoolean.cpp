@@ -20,7 +20,8 @@ static ClassRegistration<sBoolean, ShapeOperator>
                     {RegIcon, "Icons.Tools.Icons.sBoolean"},
                     {RegNoBlendControls, 1},
                     {RegNoObjectMaterialControls, 1},
-                    {RegNoMotionBlurControls, 1}});
+                    {RegNoMotionBlurControls, 1},
+                    {RegSupportsRoI, 1}});
 
 namespace {
 

@@ -18,6 +18,7 @@ static ClassRegistration<sChangeStyle, ShapeOperator>
                     {RegNoBlendControls, 1},
                     {RegNoObjectMaterialControls, 1},
                     {RegNoMotionBlurControls, 1},
+                    {RegSupportsRoI, 1},
                     {RegNoCache, 1},
                     {RegShapeGenFilled, 1},
                     {RegShapeGenOutline, 1},

@@ -19,7 +19,8 @@ static ClassRegistration<sMerge, ShapeOperator>
                     {RegIcon, "Icons.Tools.Icons.sMerge"},
                     {RegNoBlendControls, 1},
                     {RegNoObjectMaterialControls, 1},
-                    {RegNoMotionBlurControls, 1}});
+                    {RegNoMotionBlurControls, 1},
+                    {RegSupportsRoI, 1}});
 
 sMerge::sMerge(const Registry *reg, const ScriptVal &args, const TagList &tags)
     : ShapeOperator(reg, args, tags, false) {

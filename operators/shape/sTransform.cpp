@@ -18,7 +18,8 @@ static ClassRegistration<sTransform, ShapeOperator>
                     {RegIcon, "Icons.Tools.Icons.sTransform"},
                     {RegNoBlendControls, 1},
                     {RegNoObjectMaterialControls, 1},
-                    {RegNoMotionBlurControls, 1}});
+                    {RegNoMotionBlurControls, 1},
+                    {RegSupportsRoI, 1}});
 
 namespace {
 
