@@ -1,0 +1,117 @@
+#pragma once
+// The six lens models of the kit, each a chain of a distortion polynomial and
+// linear extenders in unit coordinates (undistort runs the chain forward,
+// distort backward with Newton's method on the polynomial), the factory that
+// makes them in their listing order, and the model IDs derived from names.
+//
+// Thread safety: as tde4_ld_plugin.
+#include <memory>
+#include <string>
+#include <vector>
+
+#include "operators/warp/ldpk/Builtin.h"
+
+namespace Orvane {
+
+class tde4_ldp_anamorphic_deg_4_rotate_squeeze_xy : public ldpk::ldp_builtin {
+public:
+    tde4_ldp_anamorphic_deg_4_rotate_squeeze_xy();
+    bool initializeParameters() override;
+    const ldpk::generic_distortion_base &distortion() const override { return poly_; }
+
+protected:
+    void prepare() override;
+    ldpk::vec2d undistort_unit(ldpk::vec2d p) const override;
+    bool distort_unit(ldpk::vec2d q, ldpk::vec2d start, ldpk::vec2d &p) const override;
+    bool jacobian_unit(ldpk::vec2d p, ldpk::mat2d &j) const override;
+
+private:
+    ldpk::generic_anamorphic_distortion<4> poly_;
+    ldpk::rotation_extender rotation_;
+    ldpk::squeeze_x_extender squeeze_x_, pixel_aspect_;
+    ldpk::squeeze_y_extender squeeze_y_;
+    ldpk::linear_extender e1_, e2_;
+};
+
+class tde4_ldp_anamorphic_deg_6 : public ldpk::ldp_builtin {
+public:
+    tde4_ldp_anamorphic_deg_6();
+    const ldpk::generic_distortion_base &distortion() const override { return poly_; }
+
+protected:
+    void prepare() override;
+    ldpk::vec2d undistort_unit(ldpk::vec2d p) const override { return poly_.eval(p); }
+    bool distort_unit(ldpk::vec2d q, ldpk::vec2d start, ldpk::vec2d &p) const override;
+    bool jacobian_unit(ldpk::vec2d p, ldpk::mat2d &j) const override;
+
+private:
+    ldpk::generic_anamorphic_distortion<6> poly_;
+};
+
+class tde4_ldp_classic_3de_mixed : public ldpk::ldp_builtin {
+public:
+    tde4_ldp_classic_3de_mixed();
+    const ldpk::generic_distortion_base &distortion() const override { return poly_; }
+
+protected:
+    void prepare() override;
+    ldpk::vec2d undistort_unit(ldpk::vec2d p) const override { return poly_.eval(p); }
+    bool distort_unit(ldpk::vec2d q, ldpk::vec2d start, ldpk::vec2d &p) const override;
+    bool jacobian_unit(ldpk::vec2d p, ldpk::mat2d &j) const override;
+
+private:
+    ldpk::classic_3de_mixed_distortion poly_;
+};
+
+class tde4_ldp_radial_decentered_deg_4_cylindric : public ldpk::ldp_builtin {
+public:
+    tde4_ldp_radial_decentered_deg_4_cylindric();
+    const ldpk::generic_distortion_base &distortion() const override { return poly_; }
+
+protected:
+    void prepare() override;
+    ldpk::vec2d undistort_unit(ldpk::vec2d p) const override;
+    bool distort_unit(ldpk::vec2d q, ldpk::vec2d start, ldpk::vec2d &p) const override;
+    bool jacobian_unit(ldpk::vec2d p, ldpk::mat2d &j) const override;
+
+private:
+    ldpk::radial_decentered_distortion poly_;
+    ldpk::cylindric_extender_2 cylindric_;
+};
+
+/// Radial degree 8 behind a fisheye-to-perspective mapping. The current release cuts the
+/// result's radius at 50 (unit coordinates); release 1 leaves it uncut.
+class tde4_ldp_radial_deg_8 : public ldpk::ldp_builtin {
+public:
+    tde4_ldp_radial_deg_8();
+    const ldpk::generic_distortion_base &distortion() const override { return poly_; }
+    static constexpr double result_radius_limit = 50.0;
+
+protected:
+    tde4_ldp_radial_deg_8(const char *name, bool cut_result);
+    void prepare() override;
+    ldpk::vec2d undistort_unit(ldpk::vec2d p) const override;
+    bool distort_unit(ldpk::vec2d q, ldpk::vec2d start, ldpk::vec2d &p) const override;
+    bool jacobian_unit(ldpk::vec2d p, ldpk::mat2d &j) const override;
+
+private:
+    ldpk::generic_radial_distortion poly_;
+    double f_unit_ = 1.0; // focal length in unit coordinates
+    bool cut_result_;
+};
+
+class tde4_ldp_radial_deg_8_release_1 : public tde4_ldp_radial_deg_8 {
+public:
+    tde4_ldp_radial_deg_8_release_1();
+};
+
+namespace ldpk {
+/// The six models, made in their listing order.
+std::vector<std::unique_ptr<ldp_builtin>> make_models();
+/// A model's ID: its name without the characters that are not letters or digits and without
+/// leading digits; the fisheye degree 8 IDs are exchanged so that files saving the older plain
+/// ID find the release 1 model.
+std::string model_id(const std::string &name);
+} // namespace ldpk
+
+} // namespace Orvane
