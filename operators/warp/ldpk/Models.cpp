@@ -56,10 +56,10 @@ constexpr parameter_descriptor radial_8_params[] = {ORVANE_LDPK_TERM("Distortion
 // ---- anamorphic, degree 4, with lens rotation and squeeze ----
 
 tde4_ldp_anamorphic_deg_4_rotate_squeeze_xy::tde4_ldp_anamorphic_deg_4_rotate_squeeze_xy()
-    : ldp_builtin("3DE4 Anamorphic - Standard, Degree 4", anamorphic_4_params) {}
+    : polynomial_model("3DE4 Anamorphic - Standard, Degree 4", anamorphic_4_params) {}
 
 bool tde4_ldp_anamorphic_deg_4_rotate_squeeze_xy::initializeParameters() {
-    ldp_builtin::initializeParameters();
+    polynomial_model::initializeParameters();
     if (value(11) == 0.0)
         std::fputs("tde4_ldp_anamorphic_deg_4_rotate_squeeze_xy::initializeParameters, error: Squeeze-X is 0.\n",
                    stderr);
@@ -101,7 +101,7 @@ bool tde4_ldp_anamorphic_deg_4_rotate_squeeze_xy::jacobian_unit(vec2d p, mat2d &
 // ---- anamorphic, degree 6 ----
 
 tde4_ldp_anamorphic_deg_6::tde4_ldp_anamorphic_deg_6()
-    : ldp_builtin("3DE4 Anamorphic, Degree 6", anamorphic_6_params) {}
+    : polynomial_model("3DE4 Anamorphic, Degree 6", anamorphic_6_params) {}
 
 void tde4_ldp_anamorphic_deg_6::prepare() {
     double cx[9], cy[9];
@@ -109,37 +109,19 @@ void tde4_ldp_anamorphic_deg_6::prepare() {
     poly_.set_from_terms(cx, cy);
 }
 
-bool tde4_ldp_anamorphic_deg_6::distort_unit(vec2d q, vec2d start, vec2d &p) const {
-    return poly_.map_inverse_newton(q, start, p);
-}
-
-bool tde4_ldp_anamorphic_deg_6::jacobian_unit(vec2d p, mat2d &j) const {
-    j = poly_.jacobian(p);
-    return true;
-}
-
 // ---- classic ----
 
-tde4_ldp_classic_3de_mixed::tde4_ldp_classic_3de_mixed() : ldp_builtin("3DE Classic LD Model", classic_params) {}
+tde4_ldp_classic_3de_mixed::tde4_ldp_classic_3de_mixed() : polynomial_model("3DE Classic LD Model", classic_params) {}
 
 void tde4_ldp_classic_3de_mixed::prepare() {
     for (int i = 0; i < 5; ++i) poly_.set_coeff(i, value(i));
     poly_.prepare();
 }
 
-bool tde4_ldp_classic_3de_mixed::distort_unit(vec2d q, vec2d start, vec2d &p) const {
-    return poly_.map_inverse_newton(q, start, p);
-}
-
-bool tde4_ldp_classic_3de_mixed::jacobian_unit(vec2d p, mat2d &j) const {
-    j = poly_.jacobian(p);
-    return true;
-}
-
 // ---- radial decentered, degree 4, cylindric ----
 
 tde4_ldp_radial_decentered_deg_4_cylindric::tde4_ldp_radial_decentered_deg_4_cylindric()
-    : ldp_builtin("3DE4 Radial - Standard, Degree 4", radial_4_params) {}
+    : polynomial_model("3DE4 Radial - Standard, Degree 4", radial_4_params) {}
 
 void tde4_ldp_radial_decentered_deg_4_cylindric::prepare() {
     for (int i = 0; i < 6; ++i) poly_.set_coeff(i, value(i));
@@ -164,7 +146,7 @@ bool tde4_ldp_radial_decentered_deg_4_cylindric::jacobian_unit(vec2d p, mat2d &j
 tde4_ldp_radial_deg_8::tde4_ldp_radial_deg_8() : tde4_ldp_radial_deg_8("3DE4 Radial - Fisheye, Degree 8", true) {}
 
 tde4_ldp_radial_deg_8::tde4_ldp_radial_deg_8(const char *name, bool cut_result)
-    : ldp_builtin(name, radial_8_params), cut_result_(cut_result) {}
+    : polynomial_model(name, radial_8_params), cut_result_(cut_result) {}
 
 tde4_ldp_radial_deg_8_release_1::tde4_ldp_radial_deg_8_release_1()
     : tde4_ldp_radial_deg_8("3DE4 Radial - Fisheye, Degree 8, Release 1", false) {}

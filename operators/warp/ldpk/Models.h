@@ -13,11 +13,29 @@
 
 namespace Orvane {
 
-class tde4_ldp_anamorphic_deg_4_rotate_squeeze_xy : public ldpk::ldp_builtin {
+namespace ldpk {
+/// A model around one polynomial: its chain is the polynomial alone unless the model overrides it.
+template <class Polynomial> class polynomial_model : public ldp_builtin {
+public:
+    const generic_distortion_base &distortion() const override { return poly_; }
+
+protected:
+    using ldp_builtin::ldp_builtin;
+    vec2d undistort_unit(vec2d p) const override { return poly_.eval(p); }
+    bool distort_unit(vec2d q, vec2d start, vec2d &p) const override { return poly_.map_inverse_newton(q, start, p); }
+    bool jacobian_unit(vec2d p, mat2d &j) const override {
+        j = poly_.jacobian(p);
+        return true;
+    }
+    Polynomial poly_;
+};
+} // namespace ldpk
+
+class tde4_ldp_anamorphic_deg_4_rotate_squeeze_xy
+    : public ldpk::polynomial_model<ldpk::generic_anamorphic_distortion<4>> {
 public:
     tde4_ldp_anamorphic_deg_4_rotate_squeeze_xy();
     bool initializeParameters() override;
-    const ldpk::generic_distortion_base &distortion() const override { return poly_; }
 
 protected:
     void prepare() override;
@@ -26,47 +44,31 @@ protected:
     bool jacobian_unit(ldpk::vec2d p, ldpk::mat2d &j) const override;
 
 private:
-    ldpk::generic_anamorphic_distortion<4> poly_;
     ldpk::rotation_extender rotation_;
     ldpk::squeeze_x_extender squeeze_x_, pixel_aspect_;
     ldpk::squeeze_y_extender squeeze_y_;
     ldpk::linear_extender e1_, e2_;
 };
 
-class tde4_ldp_anamorphic_deg_6 : public ldpk::ldp_builtin {
+class tde4_ldp_anamorphic_deg_6 : public ldpk::polynomial_model<ldpk::generic_anamorphic_distortion<6>> {
 public:
     tde4_ldp_anamorphic_deg_6();
-    const ldpk::generic_distortion_base &distortion() const override { return poly_; }
 
 protected:
     void prepare() override;
-    ldpk::vec2d undistort_unit(ldpk::vec2d p) const override { return poly_.eval(p); }
-    bool distort_unit(ldpk::vec2d q, ldpk::vec2d start, ldpk::vec2d &p) const override;
-    bool jacobian_unit(ldpk::vec2d p, ldpk::mat2d &j) const override;
-
-private:
-    ldpk::generic_anamorphic_distortion<6> poly_;
 };
 
-class tde4_ldp_classic_3de_mixed : public ldpk::ldp_builtin {
+class tde4_ldp_classic_3de_mixed : public ldpk::polynomial_model<ldpk::classic_3de_mixed_distortion> {
 public:
     tde4_ldp_classic_3de_mixed();
-    const ldpk::generic_distortion_base &distortion() const override { return poly_; }
 
 protected:
     void prepare() override;
-    ldpk::vec2d undistort_unit(ldpk::vec2d p) const override { return poly_.eval(p); }
-    bool distort_unit(ldpk::vec2d q, ldpk::vec2d start, ldpk::vec2d &p) const override;
-    bool jacobian_unit(ldpk::vec2d p, ldpk::mat2d &j) const override;
-
-private:
-    ldpk::classic_3de_mixed_distortion poly_;
 };
 
-class tde4_ldp_radial_decentered_deg_4_cylindric : public ldpk::ldp_builtin {
+class tde4_ldp_radial_decentered_deg_4_cylindric : public ldpk::polynomial_model<ldpk::radial_decentered_distortion> {
 public:
     tde4_ldp_radial_decentered_deg_4_cylindric();
-    const ldpk::generic_distortion_base &distortion() const override { return poly_; }
 
 protected:
     void prepare() override;
@@ -75,16 +77,14 @@ protected:
     bool jacobian_unit(ldpk::vec2d p, ldpk::mat2d &j) const override;
 
 private:
-    ldpk::radial_decentered_distortion poly_;
     ldpk::cylindric_extender_2 cylindric_;
 };
 
 /// Radial degree 8 behind a fisheye-to-perspective mapping. The current release cuts the
 /// result's radius at 50 (unit coordinates); release 1 leaves it uncut.
-class tde4_ldp_radial_deg_8 : public ldpk::ldp_builtin {
+class tde4_ldp_radial_deg_8 : public ldpk::polynomial_model<ldpk::generic_radial_distortion> {
 public:
     tde4_ldp_radial_deg_8();
-    const ldpk::generic_distortion_base &distortion() const override { return poly_; }
     static constexpr double result_radius_limit = 50.0;
 
 protected:
@@ -95,7 +95,6 @@ protected:
     bool jacobian_unit(ldpk::vec2d p, ldpk::mat2d &j) const override;
 
 private:
-    ldpk::generic_radial_distortion poly_;
     double f_unit_ = 1.0; // focal length in unit coordinates
     bool cut_result_;
 };
