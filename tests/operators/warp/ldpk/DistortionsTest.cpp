@@ -137,19 +137,7 @@ TEST(LdpkPolynomials, MatchReferenceJacobianMatchesDifferencesAndBothInversionsI
     }
 }
 
-TEST(LdpkPolynomials, ZeroCoefficientsAreTheIdentityAndClassicFollowsChanges) {
-    std::vector<std::unique_ptr<generic_distortion_base>> zero;
-    zero.push_back(std::make_unique<generic_radial_distortion>());
-    zero.push_back(std::make_unique<radial_decentered_distortion>());
-    zero.push_back(std::make_unique<classic_3de_mixed_distortion>());
-    zero.push_back(std::make_unique<generic_anamorphic_distortion<4>>());
-    zero.push_back(std::make_unique<generic_anamorphic_distortion<6>>());
-    for (const auto &d : zero)
-        for (vec2d p : probe_points()) {
-            EXPECT_EQ(d->eval(p).x, p.x);
-            EXPECT_EQ(d->eval(p).y, p.y);
-        }
-
+TEST(LdpkPolynomials, ClassicFollowsChangesMadeAfterPrepare) {
     // A change after prepare() is seen at once: the derived coefficients follow without a new prepare().
     classic_3de_mixed_distortion classic;
     classic.prepare();
@@ -203,14 +191,6 @@ TEST(LdpkExtenders, MatricesInversesAndInvariants) {
     rot.set(90.0);
     EXPECT_NEAR(rot.eval({1, 0}).x, 0.0, 1e-15);
     EXPECT_NEAR(rot.eval({1, 0}).y, 1.0, 1e-15);
-    squeeze_x_extender sx;
-    sx.set(1.05);
-    squeeze_y_extender sy;
-    sy.set(0.95);
-    EXPECT_EQ(sx.eval({2, 3}).x, 2.1);
-    EXPECT_EQ(sx.eval({2, 3}).y, 3.0);
-    EXPECT_EQ(sy.eval({2, 3}).x, 2.0);
-    EXPECT_EQ(sy.eval({2, 3}).y, 3 * 0.95);
 
     const struct { double phi, b; } cylinders[] = {{0, 0.05}, {30, -0.08}, {-75, 0.1}, {90, 0.02}, {45, 0}};
     for (const auto &c : cylinders) {
@@ -229,11 +209,6 @@ TEST(LdpkExtenders, MatricesInversesAndInvariants) {
         EXPECT_NEAR(back.y, p.y, 1e-15);
     }
 
-    linear_extender lin;
-    lin.set({2, 1, 1, 1});
-    EXPECT_EQ(lin.inverse().m00, 1.0);
-    EXPECT_EQ(lin.inverse().m01, -1.0);
-    EXPECT_EQ(lin.inverse().m11, 2.0);
     // A squeeze of 0 is singular: its inverse is the zero matrix, not infinities.
     squeeze_x_extender flat;
     flat.set(0.0);
