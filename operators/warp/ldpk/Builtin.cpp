@@ -15,7 +15,7 @@ const char *const ldp_builtin::builtin_names[n_builtin] = {
     "tde4_custom_focus_distance_cm"};
 
 ldp_builtin::ldp_builtin(const char *name, std::span<const parameter_descriptor> params)
-    : name_(name), params_(params) {
+    : name_(name), params_(params.first(std::min<size_t>(params.size(), max_parameters))) {
     for (size_t i = 0; i < params_.size(); ++i) values_[i] = params_[i].default_value;
 }
 
@@ -93,7 +93,7 @@ void ldp_builtin::set_parameter_from_text(const char *identifier, const char *te
     char *end = nullptr;
     errno = 0;
     const double v = text ? std::strtod(text, &end) : 0.0;
-    if (!text || end == text || errno == ERANGE) throw error_could_not_read_value(identifier);
+    if (!text || end == text || errno == ERANGE || !std::isfinite(v)) throw error_could_not_read_value(identifier);
     while (*end == ' ' || *end == '\t' || *end == '\r' || *end == '\n') ++end;
     if (*end != '\0') throw error_could_not_read_value(identifier);
     setParameterValue(identifier, v);

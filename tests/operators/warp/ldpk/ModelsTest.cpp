@@ -350,6 +350,7 @@ TEST(LdpkModels, ErrorTextsAndReadingValues) {
         {"Lens Warp", "0.1", "ldpk::error: undefined parameter"},
         {"Distortion", "abc", "ldpk::error: could not read value for parameter 'Distortion'"},
         {"Distortion", "0.1 0.2", "ldpk::error: could not read value for parameter 'Distortion'"},
+        {"Distortion", "nan", "ldpk::error: could not read value for parameter 'Distortion'"},
         {"tde4_focal_length_cm", "", "ldpk::error: could not read value for parameter 'tde4_focal_length_cm'"},
         {"Distortion", " 0.1\r\n", nullptr},
         {"tde4_focal_length_cm", "5.0", nullptr},
