@@ -2,12 +2,14 @@
 
 #include <algorithm>
 #include <array>
+#include <cctype>
 #include <charconv>
 #include <cmath>
 #include <cstdint>
 #include <fstream>
 #include <istream>
 #include <optional>
+#include <type_traits>
 
 namespace Orvane::lensfiles {
 

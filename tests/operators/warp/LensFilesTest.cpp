@@ -87,10 +87,10 @@ TEST(LensData, ErrorsNameTheirParameterAndSetNothing) {
         {"Samples 2.5", value("Samples")},
         {"Mirror maybe", value("Mirror")},
         {"Degree 6 0.1\n" + std::string(5000, 'x'), "parse error - line 2 is too long"}};
-    for (const auto &[text, want] : cases) {
+    for (const auto &c : cases) {
         int calls = 0;
-        EXPECT_EQ(ErrorOf<Error>([&] { ReadText(text, &calls); }), want);
-        EXPECT_EQ(calls, 0) << text;
+        EXPECT_EQ(ErrorOf<Error>([&] { ReadText(c.first, &calls); }), c.second);
+        EXPECT_EQ(calls, 0) << c.first;
     }
     const auto where = [](const UndefinedParameter &e) { return e.name() + " @" + std::to_string(e.line()); };
     EXPECT_EQ(ErrorOf<UndefinedParameter>([&] { ReadText("Degree 6 0.1\n\n# note\nbogus  entry 1\n"); }, where),
