@@ -113,7 +113,7 @@ std::optional<bool> ParseBool(std::string_view s) {
     return std::nullopt;
 }
 
-ParameterValue ParseValue(std::string_view text, const ParameterSpec &param) {
+ParameterValue ParseValue(std::string_view text, const ParameterInfo &param) {
     std::optional<ParameterValue> v;
     switch (param.type) {
     case ParameterType::Bool: v = ParseBool(text); break;
@@ -129,9 +129,9 @@ ParameterValue ParseValue(std::string_view text, const ParameterSpec &param) {
 
 // ---- ".data" ---------------------------------------------------------------------------------------------
 
-std::vector<DataEntry> ReadDataEntries(std::istream &in, std::span<const ParameterSpec> params) {
+std::vector<DataEntry> ReadDataEntries(std::istream &in, std::span<const ParameterInfo> params) {
     std::vector<std::string> names;
-    for (const ParameterSpec &p : params) names.push_back(Normalise(p.name));
+    for (const ParameterInfo &p : params) names.push_back(Normalise(p.name));
     const auto find = [&](std::string_view name) -> std::optional<std::size_t> {
         const auto it = std::find(names.begin(), names.end(), name);
         if (it == names.end()) return std::nullopt;
@@ -160,7 +160,7 @@ std::vector<DataEntry> ReadDataEntries(std::istream &in, std::span<const Paramet
     return entries;
 }
 
-void ApplyDataEntries(std::span<const DataEntry> entries, std::span<const ParameterSpec> params,
+void ApplyDataEntries(std::span<const DataEntry> entries, std::span<const ParameterInfo> params,
                       const ParameterSetter &set) {
     for (const DataEntry &e : entries) {
         if (e.index >= params.size()) throw IndexOutOfRange(e.index, params.size());
@@ -170,7 +170,7 @@ void ApplyDataEntries(std::span<const DataEntry> entries, std::span<const Parame
     for (const DataEntry &e : entries) set(e.index, e.value);
 }
 
-void ReadData(std::istream &in, std::span<const ParameterSpec> params, const ParameterSetter &set) {
+void ReadData(std::istream &in, std::span<const ParameterInfo> params, const ParameterSetter &set) {
     ApplyDataEntries(ReadDataEntries(in, params), params, set);
 }
 
@@ -185,14 +185,14 @@ std::ifstream OpenRegular(const std::filesystem::path &path) {
 }
 } // namespace
 
-void ReadDataFile(const std::filesystem::path &path, std::span<const ParameterSpec> params,
+void ReadDataFile(const std::filesystem::path &path, std::span<const ParameterInfo> params,
                   const ParameterSetter &set) {
     std::ifstream in = OpenRegular(path);
     ReadData(in, params, set);
 }
 
-std::vector<ParameterSpec> PfBarrelParameters() {
-    std::vector<ParameterSpec> out;
+std::vector<ParameterInfo> PfBarrelParameters() {
+    std::vector<ParameterInfo> out;
     for (std::string_view name : PfBarrelParameterNames) out.push_back({std::string(name), ParameterType::Double});
     return out;
 }

@@ -88,7 +88,7 @@ struct ParseError : Error {
 
 enum class ParameterType { Bool, Int, Double, Text };
 
-struct ParameterSpec {
+struct ParameterInfo {
     std::string name;
     ParameterType type = ParameterType::Double;
 };
@@ -104,18 +104,18 @@ struct DataEntry {
 using ParameterSetter = std::function<void(std::size_t index, const ParameterValue &value)>;
 
 /// The stream's entries in file order, resolved against `params`.
-std::vector<DataEntry> ReadDataEntries(std::istream &in, std::span<const ParameterSpec> params);
+std::vector<DataEntry> ReadDataEntries(std::istream &in, std::span<const ParameterInfo> params);
 
 /// Checks every entry (index within the list, value of the parameter's type), then calls `set` for each.
-void ApplyDataEntries(std::span<const DataEntry> entries, std::span<const ParameterSpec> params,
+void ApplyDataEntries(std::span<const DataEntry> entries, std::span<const ParameterInfo> params,
                       const ParameterSetter &set);
 
 /// Reads a stream, or a file ("failed to open file" when it can't be opened), and applies its entries.
-void ReadData(std::istream &in, std::span<const ParameterSpec> params, const ParameterSetter &set);
-void ReadDataFile(const std::filesystem::path &path, std::span<const ParameterSpec> params, const ParameterSetter &set);
+void ReadData(std::istream &in, std::span<const ParameterInfo> params, const ParameterSetter &set);
+void ReadDataFile(const std::filesystem::path &path, std::span<const ParameterInfo> params, const ParameterSetter &set);
 
 /// The barrel model's parameters as a list, and a setter writing them into `s`.
-std::vector<ParameterSpec> PfBarrelParameters();
+std::vector<ParameterInfo> PfBarrelParameters();
 ParameterSetter PfBarrelSetter(PfBarrelSettings &s);
 
 // ---- ".pfb" ----------------------------------------------------------------------------------------------

@@ -16,7 +16,7 @@ namespace Orvane::lensfiles {
 namespace {
 
 using T = ParameterType;
-const std::vector<ParameterSpec> Params{{"tde4_focal_length_cm", T::Double},
+const std::vector<ParameterInfo> Params{{"tde4_focal_length_cm", T::Double},
                                         {"Distortion - Degree 2", T::Double},
                                         {"U - Degree 2", T::Double},
                                         {"Phi - Cylindric Direction", T::Double},
