@@ -28,8 +28,9 @@
 // Both readers bound what they take in: a line longer than MaxLineLength, more than MaxDataEntries entries or
 // more than MaxTableRows rows is an error, so no file makes them hang or grow without limit.
 //
-// Errors are exceptions derived from lensfiles::Error, with the texts the lens tool shows; the tool maps them
-// onto its own reports (the ".data" ones match the error kinds of the lens model kit).
+// Errors are exceptions derived from lensfiles::Error, whose texts are meant for the user as they stand. They are
+// kept apart from the lens model kit's error classes; the lens tool (not built yet) is to map them onto its own
+// reports (the ".data" ones match the kit's error kinds).
 //
 // Thread safety: the functions keep no state; each call uses only its arguments.
 #include <cstddef>
