@@ -94,47 +94,41 @@ TEST(FilmGates, FilmbackFit) {
     const double narrowW = 0.980 / 1920, narrowH = 0.735 / 1080; // width fits, height fits
     const double wideW = 2.066 / 1920, wideH = 0.906 / 1080;
     struct Case {
-        double pixelAspect, wFb, hFb;
+        double width, height, pixelAspect, wFb, hFb;
         int fit;
         double kx, ky;
     };
     const Case cases[] = {
         // Inside: the gate inside the image.
-        {1, 0.980, 0.735, 0, narrowH, narrowH},
-        {1, 2.066, 0.906, 0, wideW, wideW},
-        {2, 2.066, 0.906, 0, wideH, wideH},
+        {1920, 1080, 1, 0.980, 0.735, 0, narrowH, narrowH},
+        {1920, 1080, 1, 2.066, 0.906, 0, wideW, wideW},
+        {1920, 1080, 2, 2.066, 0.906, 0, wideH, wideH},
         // Outside: the image inside the gate.
-        {1, 0.980, 0.735, 3, narrowW, narrowW},
-        {1, 2.066, 0.906, 3, wideH, wideH},
-        {2, 2.066, 0.906, 3, wideW, wideW},
+        {1920, 1080, 1, 0.980, 0.735, 3, narrowW, narrowW},
+        {1920, 1080, 1, 2.066, 0.906, 3, wideH, wideH},
+        {1920, 1080, 2, 2.066, 0.906, 3, wideW, wideW},
+        // A 900 x 1000 image of pixel aspect 2 is exactly as wide (1.8) as a
+        // 1.8 x 1 gate: Inside then fits the width, Outside the height.
+        {900, 1000, 2, 1.8, 1.0, 0, 0.002, 0.002},
+        {900, 1000, 2, 1.8, 1.0, 3, 0.001, 0.001},
         // Width, Height and Stretch ignore the aspects.
-        {1, 0.980, 0.735, 1, narrowW, narrowW},
-        {2, 2.066, 0.906, 1, wideW, wideW},
-        {1, 0.980, 0.735, 2, narrowH, narrowH},
-        {2, 2.066, 0.906, 2, wideH, wideH},
-        {1, 0.980, 0.735, 4, narrowW, narrowH},
-        {2, 2.066, 0.906, 4, wideW, wideH},
+        {1920, 1080, 1, 0.980, 0.735, 1, narrowW, narrowW},
+        {1920, 1080, 2, 2.066, 0.906, 1, wideW, wideW},
+        {1920, 1080, 1, 0.980, 0.735, 2, narrowH, narrowH},
+        {1920, 1080, 2, 2.066, 0.906, 2, wideH, wideH},
+        {1920, 1080, 1, 0.980, 0.735, 4, narrowW, narrowH},
+        {1920, 1080, 2, 2.066, 0.906, 4, wideW, wideH},
         // Unknown methods leave pixels unscaled.
-        {1, 0.980, 0.735, 5, 1, 1},
-        {1, 0.980, 0.735, -1, 1, 1},
+        {1920, 1080, 1, 0.980, 0.735, 5, 1, 1},
+        {1920, 1080, 1, 0.980, 0.735, -1, 1, 1},
     };
     for (const Case &c : cases) {
-        SCOPED_TRACE(testing::Message() << "fit " << c.fit << " aspect " << c.pixelAspect << " gate " << c.wFb);
-        FilmbackScale k = FitFilmback(1920, 1080, c.pixelAspect, c.wFb, c.hFb, c.fit);
+        SCOPED_TRACE(testing::Message() << "fit " << c.fit << " image " << c.width << " aspect " << c.pixelAspect
+                                        << " gate " << c.wFb);
+        FilmbackScale k = FitFilmback(c.width, c.height, c.pixelAspect, c.wFb, c.hFb, c.fit);
         EXPECT_DOUBLE_EQ(k.x, c.kx);
         EXPECT_DOUBLE_EQ(k.y, c.ky);
     }
-}
-
-TEST(FilmGates, FilmbackFitAtEqualAspects) {
-    // A 900 x 1000 image of pixel aspect 2 is exactly as wide (1.8) as a
-    // 1.8 x 1 gate: Inside then fits the width, Outside the height.
-    FilmbackScale inside = FitFilmback(900, 1000, 2, 1.8, 1.0, 0);
-    EXPECT_DOUBLE_EQ(inside.x, 0.002);
-    EXPECT_DOUBLE_EQ(inside.y, 0.002);
-    FilmbackScale outside = FitFilmback(900, 1000, 2, 1.8, 1.0, 3);
-    EXPECT_DOUBLE_EQ(outside.x, 0.001);
-    EXPECT_DOUBLE_EQ(outside.y, 0.001);
 }
 
 } // namespace
