@@ -1,6 +1,7 @@
 #include "operators/media/formats/JpegStream.h"
 
 #include <algorithm>
+#include <climits>
 #include <cmath>
 #include <cstdlib>
 #include <cstring>
@@ -9,6 +10,7 @@
 #include <jerror.h>
 
 #include "host/image/Image.h"
+#include "host/image/PixelMemory.h"
 #include "host/image/PixelConvert.h"
 #include "host/media/IOClass.h"
 
@@ -166,6 +168,14 @@ JpegReader::JpegReader(IOClass *io) {
     detail::InitTrap(trap);
     cinfo.err = &trap.mgr;
     jpeg_create_decompress(&cinfo); // cannot fail: it only allocates a small pool
+    // Progressive and multi-scan files keep every coefficient of the frame
+    // while decoding (two bytes per sample at full size, whatever the proxy
+    // scale). That buffer counts against what the pixel memory limit has
+    // left, so a header claiming a huge frame fails before the allocation.
+    // libjpeg reads 0 as "no limit", hence the floor.
+    const size_t limit = PixelMemoryLimit(), used = PixelMemoryInUse();
+    cinfo.mem->max_memory_to_use = static_cast<long>(std::min<size_t>(
+        std::max<size_t>(limit > used ? limit - used : 0, size_t(1) << 20), static_cast<size_t>(LONG_MAX)));
     source.io = io;
     source.mgr.init_source = detail::InitSource;
     source.mgr.fill_input_buffer = detail::FillInput;
@@ -301,7 +311,9 @@ bool DecodeRows(JpegReader &r, Image &image, const std::atomic<bool> *abortFlag,
                 std::vector<Pixel> &pixels, std::string &error) {
     jpeg_decompress_struct &c = r.cinfo;
     if (setjmp(r.trap.jump)) {
-        error = std::string("JPEG: ") + r.trap.message;
+        error = c.err->msg_code == JERR_NO_BACKING_STORE
+                    ? "JPEG: decoding this multi-scan file needs more memory than the memory limit leaves"
+                    : std::string("JPEG: ") + r.trap.message;
         return false;
     }
     jpeg_start_decompress(&c);

@@ -1,5 +1,6 @@
 // JpegFormat, and IPLFormat (four-component streams holding R, G, B and A), against djpeg and ImageMagick.
 #include "host/flow/Parameter.h"
+#include "host/image/PixelMemory.h"
 #include "tests/operators/media/FormatTestSupport.h"
 
 namespace Orvane {
@@ -98,6 +99,31 @@ TEST_F(JpegFormatTest, ProxyScaleDecodesAsDjpegScales) {
         const Bytes ref = Djpeg(dir / "p.jpg", "-scale 1/" + std::to_string(scale));
         EXPECT_EQ(Mismatches(*r.image, ref, (101 + scale - 1) / scale, 60 / scale), 0);
     }
+}
+
+// A progressive file keeps all its coefficients while decoding (at least 8 MiB of luma here), whatever the proxy
+// scale: under a 4 MiB limit it fails with a clear message where the same picture as one scan reads; with room it
+// decodes exactly as djpeg does.
+TEST_F(JpegFormatTest, ProgressiveCoefficientsCountAgainstTheMemoryLimit) {
+    if (!HaveProgram("jpegtran") || !HaveProgram("djpeg")) GTEST_SKIP() << "jpegtran or djpeg is not installed";
+    TempDir dir;
+    const Bytes baseline = Save("JpegFormat", SmoothImage(2048, 2048).Get());
+    WriteFile(dir / "b.jpg", baseline);
+    ASSERT_TRUE(RunShell("jpegtran -progressive '" + (dir / "b.jpg") + "' > '" + (dir / "p.jpg") + "'"));
+    const Bytes progressive = ReadFile(dir / "p.jpg");
+    {
+        struct Restore {
+            ~Restore() { SetPixelMemoryLimit(0); }
+        } restore;
+        SetPixelMemoryLimit(size_t(4) << 20);
+        EXPECT_TRUE(LoadAt("JpegFormat", baseline, 4).image);
+        const LoadResult r = LoadAt("JpegFormat", progressive, 4);
+        EXPECT_FALSE(r.image);
+        EXPECT_EQ(r.error, "JPEG: decoding this multi-scan file needs more memory than the memory limit leaves");
+    }
+    const LoadResult r = LoadAt("JpegFormat", progressive, 4);
+    ASSERT_TRUE(r.image) << r.error;
+    EXPECT_EQ(Mismatches(*r.image, Djpeg(dir / "p.jpg", "-scale 1/4"), 512, 512), 0);
 }
 
 // A file whose JFIF densities differ reads with the pixel aspect they give.
