@@ -7,6 +7,9 @@
 #include "host/app/Application.h"
 #include "host/core/ScriptVal.h"
 #include "host/core/Suggest.h"
+#include "host/core/Tags.h"
+#include "host/flow/ControlCommand.h"
+#include "host/flow/DataTypes.h"
 #include "host/flow/DocumentIO.h"
 #include "host/flow/InputValue.h"
 #include "host/flow/Operator.h"
@@ -145,6 +148,17 @@ void ApplySet(OrvaneDoc &doc, const std::string &set, const char *what) {
                                       DidYouMean(inputId, ids));
     }
     const std::string place = std::string(what) + " " + toolName + "." + inputId + ": ";
+    if (in->Tags().GetID(InputControl) == CLSID_InputControl_Button) {
+        // A button that loads a file takes the file as its value.
+        const std::string file = set.substr(eq + 1);
+        std::string error;
+        if (!op->ControlCommand(CCMD_LoadFile, {{CCMD_FileName, static_cast<const void *>(file.c_str())},
+                                                {CCMD_FileInput, static_cast<const void *>(in)},
+                                                {CCMD_FileError, static_cast<void *>(&error)}}))
+            throw CliError(ExitUsage, place + "a button that takes no value");
+        if (!error.empty()) throw CliError(ExitFailed, place + error);
+        return;
+    }
     ScriptVal value;
     try {
         value = InputValueFromText(doc, in, set.substr(eq + 1));

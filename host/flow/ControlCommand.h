@@ -1,7 +1,8 @@
 #pragma once
 // Commands that a viewer, or the command line, sends to a tool
 // (Operator::ControlCommand): the select of a rectangle of the frame, with
-// which a keyer picks its colour ranges, and a tracking run.
+// which a keyer picks its colour ranges, a tracking run, and the reading
+// of a file into a tool's inputs (a lens data file, for example).
 //
 // A select names its rectangle in frame fractions, x to the right and y up
 // from the frame's bottom-left corner, so that it means the same at any
@@ -17,8 +18,9 @@
 namespace Orvane {
 
 enum ControlCommands : int {
-    CCMD_Select = 1, ///< a rectangle of the frame was selected (picked)
-    CCMD_Track = 2,  ///< track frame by frame from CCMD_TrackFrom to CCMD_TrackTo and write the paths
+    CCMD_Select = 1,   ///< a rectangle of the frame was selected (picked)
+    CCMD_Track = 2,    ///< track frame by frame from CCMD_TrackFrom to CCMD_TrackTo and write the paths
+    CCMD_LoadFile = 3, ///< read the file CCMD_FileName into the tool's inputs (its load button)
 };
 
 /// CCMD_Select: the rectangle's edges in frame fractions (double).
@@ -36,6 +38,14 @@ constexpr Tag CCMD_TrackFrom = 0x200d0010;
 constexpr Tag CCMD_TrackTo = 0x200d0011;
 /// CCMD_Track: the RenderTask the frames render in (pointer; its abort stops the run, keeping what was tracked).
 constexpr Tag CCMD_TrackTask = 0x600d0010;
+
+/// CCMD_LoadFile: the file (const char *), the button it stands for (const Input *; absent: the tool's only
+/// one), the time its values are written at (double; absent: not animated), and where a failure's text goes
+/// (std::string *). A tool that takes the command returns true, failed or not; the text is empty on success.
+constexpr Tag CCMD_FileName = 0x600d0020;
+constexpr Tag CCMD_FileInput = 0x600d0021;
+constexpr Tag CCMD_FileError = 0x600d0022;
+constexpr Tag CCMD_FileTime = 0x200d0020;
 
 /// A selected rectangle in frame fractions.
 struct PickRect {

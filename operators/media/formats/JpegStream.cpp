@@ -10,8 +10,8 @@
 #include <jerror.h>
 
 #include "host/image/Image.h"
-#include "host/image/PixelMemory.h"
 #include "host/image/PixelConvert.h"
+#include "host/image/PixelMemory.h"
 #include "host/media/IOClass.h"
 
 namespace Orvane {

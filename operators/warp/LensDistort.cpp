@@ -1,0 +1,572 @@
+#include "operators/warp/LensDistort.h"
+
+#include <algorithm>
+#include <cmath>
+#include <exception>
+
+#include "host/core/Tags.h"
+#include "host/flow/AnimCurve.h"
+#include "host/flow/ControlCommand.h"
+#include "host/flow/DataTypes.h"
+#include "host/flow/FilmGates.h"
+#include "host/flow/OrvaneDoc.h"
+#include "host/flow/RenderTask.h"
+#include "host/flow/Request.h"
+#include "host/image/EdgeSampler.h"
+#include "host/image/Image.h"
+#include "host/image/NewImage.h"
+#include "host/image/PixelConvert.h"
+#include "operators/frame/IdChoices.h"
+#include "operators/frame/Registration.h"
+#include "operators/warp/LensFiles.h"
+#include "operators/warp/SizingCommon.h"
+#include "operators/warp/ldpk/LdpkTypes.h"
+
+namespace Orvane {
+
+static const OvID CLSID_LensDistort("LensDistort");
+static ClassRegistration<LensDistort, ThreadedOperator> s_Registration(CLSID_LensDistort, &CLSID_ThreadedOperator,
+                                                                       {{RegTypeFlags, RegKindOperator | RegKindTool},
+                                                                        {RegClassName, "LensDistort"},
+                                                                        {RegPath, "Tools/Warp/LensDistort"},
+                                                                        {RegName, "Lens Distort"},
+                                                                        {RegCategory, "Warp"},
+                                                                        {RegAbbreviation, "Lens"},
+                                                                        {RegHelp, "Applies or remove lens distortion"},
+                                                                        {RegIcon, "Icons.Tools.Icons.LensDistort"},
+                                                                        {RegNoEffectMask, 1},
+                                                                        {RegNoObjectMaterialControls, 1},
+                                                                        {RegNoMotionBlurControls, 1},
+                                                                        {RegSupportsRoI, 1},
+                                                                        {RegSupportsDoD, 1}});
+
+namespace {
+
+constexpr IdChoice kClipping[] = {
+    {"None", "ClippingMode_None"}, {"Domain", "ClippingMode_Domain"}, {"Frame", "ClippingMode_Frame"}};
+constexpr int kSamplesPerAxis[] = {1, 2, 4, 8};
+constexpr int kClipNone = 0, kClipDomain = 1, kClipFrame = 2;
+/// Pixels the bilinear read reaches beyond a position's pixel.
+constexpr int kBilinearReach = 1;
+/// The longest walk between two boundary points (a bound against endless windows).
+constexpr int kMostWalkSteps = 1 << 16;
+
+Input *AddSlider(Operator *op, const char *name, const char *id, double low, double high, double def,
+                 const TagList &extra = {}) {
+    TagList tags{{LinkDataType, CLSID_DataType_Number},
+                 {InputControl, CLSID_InputControl_Slider},
+                 {InputSliderLow, low},
+                 {InputSliderHigh, high},
+                 {InputDefault, def}};
+    tags.Merge(extra);
+    return op->AddInputTagList(name, id, tags);
+}
+
+Input *AddMultiButton(Operator *op, const char *name, const char *id, std::initializer_list<const char *> labels,
+                      double def, const TagList &extra = {}) {
+    TagList tags{{LinkDataType, CLSID_DataType_Number},
+                 {InputControl, CLSID_InputControl_MultiButton},
+                 {InputInteger, 1},
+                 {InputMinAllowed, 0.0},
+                 {InputMaxAllowed, static_cast<double>(labels.size() - 1)},
+                 {InputDefault, def}};
+    for (const char *label : labels) tags.Add({ListAddItem, label});
+    tags.Merge(extra);
+    return op->AddInputTagList(name, id, tags);
+}
+
+struct Pos {
+    double x, y;
+};
+
+OvID ModelAt(const Input *in, double time) {
+    Ref<Parameter> v = in->ValueAt(time == TimeUndefined ? 0.0 : time);
+    const auto *id = dynamic_cast<const IDValue *>(v.Get());
+    return id ? id->value : OvID();
+}
+
+} // namespace
+
+LensDistort::LensDistort(const Registry *reg, const ScriptVal &args, const TagList &tags)
+    : ThreadedOperator(reg, args, tags), models_(lensdistort::MakeModels()) {
+    const FrameFormat ff = GetDoc() ? GetDoc()->GetFrameFormat() : FrameFormat();
+    mode_ = AddMultiButton(this, "Mode", "Mode", {"Distort", "Undistort"}, 1.0, {{ButtonsFillRow, 1}});
+    edgeMode_ = AddMultiButton(this, "Edges", "EdgeMode", {"Canvas", "Duplicate"}, 0.0, {{ButtonsFillRow, 1}});
+    clipping_ = AddInputTagList("Clipping Mode", "ClippingMode",
+                                WithIdChoices({{LinkDataType, CLSID_DataType_OvID},
+                                               {InputControl, CLSID_InputControl_MultiButtonID},
+                                               {InputDefaultId, ClippingMode_Domain}},
+                                              kClipping));
+    distortionMap_ = AddCheckbox(this, "Output Distortion Map", "OutputDistortionMap", 0.0, {{InputNotify, 1}});
+
+    BeginControlNestTagList("Lens Distortion Model", "LensDistortionModel", true, {});
+    TagList modelTags{{LinkDataType, CLSID_DataType_OvID},
+                      {InputControl, CLSID_InputControl_ComboID},
+                      {InputDefaultId, models_.front()->ID()},
+                      {InputNotify, 1}};
+    for (const auto &m : models_) {
+        modelTags.Add({ListAddItem, m->Name().c_str()});
+        modelTags.Add({ListItemId, m->ID()});
+    }
+    model_ = AddInputTagList("Model", "Model", modelTags);
+    for (const auto &m : models_) {
+        SetCurrentGroup(m->ID().Text());
+        std::vector<Input *> inputs;
+        for (const lensdistort::ModelParameter &p : m->Parameters()) {
+            switch (p.type) {
+            case ldpk::parameter_type::integer:
+                inputs.push_back(AddSlider(this, p.name.c_str(), p.id.c_str(), 0.0, 10.0, p.def, {{InputInteger, 1}}));
+                break;
+            case ldpk::parameter_type::boolean:
+                inputs.push_back(AddCheckbox(this, p.name.c_str(), p.id.c_str(), p.def));
+                break;
+            default: inputs.push_back(AddSlider(this, p.name.c_str(), p.id.c_str(), p.low, p.high, p.def)); break;
+            }
+            inputs.back()->SetAttrsTagList({{ControlVisible, m == models_.front()}});
+        }
+        modelInputs_.push_back(std::move(inputs));
+    }
+    SetCurrentGroup("");
+    EndControlNest();
+
+    BeginControlNestTagList("Camera Settings", "CameraSettings", false, {});
+    useSourceAspect_ = AddCheckbox(this, "Use Source Pixel Aspect", "UseSourcePixelAspect", 1.0, {{InputNotify, 1}});
+    pixelAspect_ = AddInputTagList("Pixel Aspect", "PixelAspect",
+                                   {{LinkDataType, CLSID_DataType_Point},
+                                    {InputControl, CLSID_InputControl_Offset},
+                                    {InputDefaultX, ff.aspectX},
+                                    {InputDefaultY, ff.aspectY},
+                                    {ControlDecimals, 6},
+                                    {InputDelayDefault, 1},
+                                    {ControlVisible, 0}});
+    focalLength_ = AddSlider(this, "Focal Length (mm)", "FocalLength", 2.5, 3500.0, 35.0,
+                             {{InputMinAllowed, 0.01}, {SliderRest, 45.0}});
+    TagList gateTags{{LinkDataType, CLSID_DataType_OvID},
+                     {InputControl, CLSID_InputControl_ComboID},
+                     {InputDefaultId, FilmGateID[kDefaultFilmGate]},
+                     {InputNotify, 1}};
+    for (size_t i = 0; i < kFilmGateCount; ++i) {
+        gateTags.Add({ListAddItem, FilmGateName[i]});
+        gateTags.Add({ListItemId, FilmGateID[i]});
+    }
+    filmGate_ = AddInputTagList("Film Gate", "FilmGate", gateTags);
+    const double gateW = ApertureTable[2 * kDefaultFilmGate], gateH = ApertureTable[2 * kDefaultFilmGate + 1];
+    apertureW_ = AddSlider(this, "Aperture Width (in)", "ApertureWidth", 0.1, 3.0, gateW,
+                           {{InputMinAllowed, 0.1}, {InputMaxAllowed, 3.0}});
+    apertureH_ = AddSlider(this, "Aperture Height (in)", "ApertureHeight", 0.1, 3.0, gateH,
+                           {{InputMinAllowed, 0.1}, {InputMaxAllowed, 3.0}});
+    TagList fitTags{{LinkDataType, CLSID_DataType_OvID},
+                    {InputControl, CLSID_InputControl_MultiButtonID},
+                    {InputDefaultId, FMID_Inside}};
+    static const char *const fitLabels[kFitMethodCount] = {"Inside", "Width", "Height", "Outside", "Stretch"};
+    for (size_t i = 0; i < kFitMethodCount; ++i) {
+        fitTags.Add({ListAddItem, fitLabels[i]});
+        fitTags.Add({ListItemId, FitMethodID[i]});
+    }
+    fit_ = AddInputTagList("Resolution Gate Fit", "ResolutionGateFit", fitTags);
+    shiftX_ = AddSlider(this, "Lens Shift X (apertures)", "LensShiftX", -0.2, 0.2, 0.0);
+    shiftY_ = AddSlider(this, "Lens Shift Y (apertures)", "LensShiftY", -0.2, 0.2, 0.0);
+    focusDistance_ = AddSlider(this, "Focus Distance (cm)", "FocalDist", 2.5, 3500.0, 100.0,
+                               {{InputMinAllowed, 0.01}, {SliderRest, 100.0}});
+    EndControlNest();
+
+    BeginControlNestTagList("Sampling Options", "SamplingOptions", false, {});
+    supersampling_ = AddMultiButton(this, "Supersampling [HiQ]", "Supersampling", {"1x1", "2x2", "4x4", "8x8"}, 0.0);
+    subsampleMode_ = AddMultiButton(this, "Subsample Mode [HiQ]", "SubsampleMode", {"Nearest", "Bilinear"}, 1.0);
+    EndControlNest();
+
+    load_ = AddButton(this, "Load Distortion Data", "Load");
+    input_ = AddSourceImageInput(this);
+    output_ = AddOutputTagList("Output", "Output", {{LinkDataType, CLSID_DataType_Image}, {LinkMain, 1}});
+}
+
+LensDistort::~LensDistort() = default;
+
+lensdistort::Model *LensDistort::ChosenModel(OvID id) const {
+    for (const auto &m : models_)
+        if (m->ID() == id) return m.get();
+    return models_.front().get();
+}
+
+void LensDistort::ShowModelInputs(OvID chosen) {
+    const lensdistort::Model *model = ChosenModel(chosen);
+    for (size_t i = 0; i < models_.size(); ++i)
+        for (Input *in : modelInputs_[i]) ShowInput(in, models_[i].get() == model);
+    for (Input *in :
+         {useSourceAspect_, focalLength_, filmGate_, apertureW_, apertureH_, fit_, shiftX_, shiftY_, focusDistance_})
+        ShowInput(in, model->HasCameraParameters());
+    ShowInput(pixelAspect_, model->HasCameraParameters() && ControlNumber(useSourceAspect_, TimeUndefined, 1.0) < 0.5);
+}
+
+void LensDistort::NotifyChanged(Input *in, Parameter *param, double time, TagList *tags) {
+    if (in == model_) {
+        if (const auto *id = dynamic_cast<const IDValue *>(param)) ShowModelInputs(id->value);
+    } else if (const auto *n = dynamic_cast<const Number *>(param)) {
+        if (in == useSourceAspect_) {
+            ShowModelInputs(ModelAt(model_, time));
+        } else if (in == distortionMap_) {
+            // The map is of positions: the edges and the sampler do not enter it.
+            ShowInput(edgeMode_, n->value < 0.5);
+            ShowInput(subsampleMode_, n->value < 0.5);
+        } else if (in == load_ && GetDoc()) {
+            GetDoc()->PrintF(
+                ConsoleError,
+                "%s: this program has no file dialog; load a lens file with orvane set FLOW %s.Load=FILE\n",
+                Name().c_str(), Name().c_str());
+        }
+    } else if (in == filmGate_) {
+        // A standard gate sets the aperture; the user gate keeps what is typed.
+        if (const auto *id = dynamic_cast<const IDValue *>(param); id && id->value != FilmGate_User)
+            if (const std::optional<FilmAperture> a = ApertureOf(id->value)) {
+                WriteControl(this, apertureW_, a->width, time);
+                WriteControl(this, apertureH_, a->height, time);
+            }
+    }
+    ThreadedOperator::NotifyChanged(in, param, time, tags);
+}
+
+// ---- lens files ------------------------------------------------------------------------------------------
+
+bool LensDistort::ControlCommand(int command, const TagList &tags) {
+    if (command != CCMD_LoadFile) return false;
+    const auto *in = tags.GetPtrAs<const Input>(CCMD_FileInput);
+    if (in && in != load_) return false;
+    const char *path = tags.GetPtrAs<const char>(CCMD_FileName);
+    auto *error = tags.GetPtrAs<std::string>(CCMD_FileError);
+    std::string message;
+    const bool ok = path && LoadLensFile(path, tags.GetDouble(CCMD_FileTime, TimeUndefined), message);
+    if (!ok) {
+        if (!path) message = "no file named";
+        // The caller that asks for the text reports it; otherwise the console has it.
+        if (error)
+            *error = message;
+        else if (GetDoc())
+            GetDoc()->PrintF(ConsoleError, "%s: %s\n", Name().c_str(), message.c_str());
+    }
+    return true;
+}
+
+bool LensDistort::LoadLensFile(const std::string &path, double time, std::string &error) {
+    lensdistort::Model *model = ChosenModel(ModelAt(model_, time));
+    const size_t index = static_cast<size_t>(
+        std::find_if(models_.begin(), models_.end(), [&](const auto &m) { return m.get() == model; }) -
+        models_.begin());
+    lensdistort::LoadedLens lens;
+    try {
+        lens = model->Load(path);
+    } catch (const lensfiles::UndefinedParameter &e) {
+        error = "cannot load lens data \"" + path + "\": " + e.what() + " '" + e.name() + "' at line " +
+                std::to_string(e.line());
+        return false;
+    } catch (const std::exception &e) {
+        error = "cannot load lens data \"" + path + "\": " + e.what();
+        return false;
+    }
+    const std::vector<Input *> &inputs = modelInputs_[index];
+    if (lens.frames.size() > 1) {
+        // A table per frame: keys at its frames, on every parameter.
+        for (size_t p = 0; p < inputs.size(); ++p) {
+            AnimCurve curve;
+            for (size_t f = 0; f < lens.frames.size(); ++f)
+                if (p < lens.frames[f].size())
+                    curve.SetKey(lens.firstFrame + static_cast<double>(f), MakeRef<Number>(lens.frames[f][p]));
+            inputs[p]->SetCurve(std::move(curve));
+        }
+    } else {
+        for (const auto &[p, v] : lens.values)
+            if (p >= 0 && static_cast<size_t>(p) < inputs.size()) WriteControl(this, inputs[p], v, time);
+    }
+    if (lens.focalLengthMm) WriteControl(this, focalLength_, *lens.focalLengthMm, time);
+    const double apertureW = lens.apertureWidthIn.value_or(ControlNumber(apertureW_, time, 1.0));
+    const double apertureH = lens.apertureHeightIn.value_or(ControlNumber(apertureH_, time, 1.0));
+    if (lens.apertureWidthIn || lens.apertureHeightIn) {
+        filmGate_->SetValue(MakeRef<IDValue>(FilmGate_User));
+        WriteControl(this, apertureW_, apertureW, time);
+        WriteControl(this, apertureH_, apertureH, time);
+    }
+    // The inverse of the offset the update makes: shift x aperture (inches).
+    if (lens.lensOffsetXCm) WriteControl(this, shiftX_, *lens.lensOffsetXCm / apertureW, time);
+    if (lens.lensOffsetYCm) WriteControl(this, shiftY_, *lens.lensOffsetYCm / apertureH, time);
+    if (lens.pixelAspect) {
+        WriteControl(this, useSourceAspect_, 0.0, time);
+        WriteControlPoint(this, pixelAspect_, *lens.pixelAspect, 1.0, time);
+        ShowModelInputs(model->ID());
+    }
+    if (lens.focusDistanceCm) WriteControl(this, focusDistance_, *lens.focusDistanceCm, time);
+    return true;
+}
+
+// ---- setup and windows -----------------------------------------------------------------------------------
+
+bool LensDistort::ReadSetup(Request *req, const Image *img, const ImageDomain *domain, Setup &s) {
+    s.model = ChosenModel(req->GetInputID(model_));
+    s.mode = req->GetInputNumber(mode_, 1.0) >= 0.5 ? 1 : 0;
+    s.samples = kSamplesPerAxis[std::clamp(static_cast<int>(req->GetInputNumber(supersampling_, 0.0)), 0, 3)];
+    s.bilinear = req->GetInputNumber(subsampleMode_, 1.0) >= 0.5;
+    s.edge = req->GetInputNumber(edgeMode_, 0.0) >= 0.5 ? EdgeDuplicate : EdgeCanvas;
+    if (DraftDropsFilter(req, true)) s.samples = 1, s.bilinear = true;
+    const OvID clip = GetClippingMode(req);
+    s.clipping = clip == ClippingMode_Frame ? kClipFrame : clip == ClippingMode_None ? kClipNone : kClipDomain;
+    s.distortionMap = req->GetInputNumber(distortionMap_, 0.0) >= 0.5;
+    double aspect = 1.0;
+    if (img) {
+        s.width = img->Width(), s.height = img->Height();
+        aspect = img->XScale() / img->YScale();
+    } else if (domain && domain->HasFrame()) {
+        s.width = domain->FrameWidth(), s.height = domain->FrameHeight();
+        aspect = domain->xScale / domain->yScale;
+    } else {
+        return false;
+    }
+    s.maxStep = std::max(s.width, s.height) * 0.1;
+    lensdistort::ModelSettings m;
+    m.width = s.width, m.height = s.height, m.pixelAspect = aspect;
+    if (s.model->HasCameraParameters()) {
+        m.focalLengthMm = req->GetInputNumber(focalLength_, 35.0);
+        m.apertureWidthIn = req->GetInputNumber(apertureW_, m.apertureWidthIn);
+        m.apertureHeightIn = req->GetInputNumber(apertureH_, m.apertureHeightIn);
+        m.shiftX = req->GetInputNumber(shiftX_, 0.0);
+        m.shiftY = req->GetInputNumber(shiftY_, 0.0);
+        m.focusDistanceCm = req->GetInputNumber(focusDistance_, 100.0);
+        m.fit = std::max(0, FindFitMethod(req->GetInputID(fit_, FMID_Inside)));
+        if (req->GetInputNumber(useSourceAspect_, 1.0) < 0.5)
+            if (const auto *p = dynamic_cast<const Point *>(req->GetInputData(pixelAspect_)); p && p->y != 0.0)
+                m.pixelAspect = p->x / p->y;
+    }
+    const size_t index = static_cast<size_t>(
+        std::find_if(models_.begin(), models_.end(), [&](const auto &x) { return x.get() == s.model; }) -
+        models_.begin());
+    std::vector<double> values;
+    for (size_t i = 0; i < modelInputs_[index].size(); ++i)
+        values.push_back(req->GetInputNumber(modelInputs_[index][i], s.model->Parameters()[i].def));
+    s.model->Update(m, values);
+    return true;
+}
+
+ImgRectI LensDistort::MappedBounds(const Setup &s, const ImgRectI &r, bool direct) {
+    if (r.IsNull()) return r;
+    // The boundary, counter-clockwise from the lower left corner, in unit steps.
+    const double x0 = r.x0, y0 = r.y0, x1 = r.x1, y1 = r.y1;
+    const Pos corners[5] = {{x0, y0}, {x1, y0}, {x1, y1}, {x0, y1}, {x0, y0}};
+    double minX = HUGE_VAL, minY = HUGE_VAL, maxX = -HUGE_VAL, maxY = -HUGE_VAL;
+    auto note = [&](double x, double y) {
+        minX = std::min(minX, x), maxX = std::max(maxX, x);
+        minY = std::min(minY, y), maxY = std::max(maxY, y);
+    };
+    const lensdistort::Model &m = *s.model;
+    // The inverse walk starts at the centre and reaches the first corner in unit steps.
+    Pos last{0.5 * s.width, 0.5 * s.height};
+    if (!direct) {
+        m.MapInverse(last.x, last.y, last.x, last.y, last.x, last.y);
+        const Pos c{0.5 * s.width, 0.5 * s.height};
+        const int n =
+            std::min(kMostWalkSteps, static_cast<int>(std::ceil(std::max(std::fabs(x0 - c.x), std::fabs(y0 - c.y)))));
+        for (int k = 1; k <= n; ++k) {
+            const double t = static_cast<double>(k) / n;
+            Pos q;
+            if (m.MapInverse(c.x + t * (x0 - c.x), c.y + t * (y0 - c.y), last.x, last.y, q.x, q.y) &&
+                std::fabs(q.x - last.x) + std::fabs(q.y - last.y) <= s.maxStep)
+                last = q;
+        }
+    }
+    int missed = 0; // steps since the last believable inverse
+    for (int side = 0; side < 4; ++side) {
+        const Pos a = corners[side], b = corners[side + 1];
+        const int n =
+            std::max(1, std::min(kMostWalkSteps,
+                                 static_cast<int>(std::ceil(std::max(std::fabs(b.x - a.x), std::fabs(b.y - a.y))))));
+        for (int k = 0; k < n; ++k) {
+            const double t = static_cast<double>(k) / n;
+            const double px = a.x + t * (b.x - a.x), py = a.y + t * (b.y - a.y);
+            Pos q;
+            if (direct) {
+                if (m.MapDirect(px, py, q.x, q.y)) note(q.x, q.y);
+                continue;
+            }
+            if (m.MapInverse(px, py, last.x, last.y, q.x, q.y) &&
+                std::fabs(q.x - last.x) + std::fabs(q.y - last.y) <= s.maxStep * (1 + missed)) {
+                last = q;
+                missed = 0;
+                note(q.x, q.y);
+            } else {
+                ++missed;
+            }
+        }
+    }
+    if (!(minX <= maxX && minY <= maxY)) return ImgRectI();
+    auto toInt = [](double v) {
+        return static_cast<int>(std::clamp(v, -double(DomainEndless), double(DomainEndless)));
+    };
+    return ImgRectI(toInt(std::floor(minX)) - 1, toInt(std::floor(minY)) - 1, toInt(std::ceil(maxX)) + 1,
+                    toInt(std::ceil(maxY)) + 1);
+}
+
+void LensDistort::CheckRequest(Request *req) {
+    ThreadedOperator::CheckRequest(req);
+    if (req->GetPri() != input_->Priority() || (req->GetFlags() & ReqFlagSkipRoI) || req->IsPreCalc()) return;
+    const AutoImageDoD dod(req, input_);
+    const AutoImageRoI roi(req);
+    if (!dod || !dod->HasFrame()) return;
+    Setup s;
+    if (!ReadSetup(req, nullptr, dod.Get(), s)) return;
+    if (s.edge == EdgeDuplicate) {
+        req->SetInputRoI(input_, nullptr); // the border pixels repeat: the whole input
+        return;
+    }
+    const ImgRectI asked = roi ? roi->rect : ImgRectI(0, 0, s.width, s.height);
+    ImgRectI need = MappedBounds(s, asked & ImgRectI(0, 0, s.width, s.height).Grown(s.width, s.height), s.mode == 0);
+    need = need.Grown(kBilinearReach, kBilinearReach);
+    if (s.clipping == kClipDomain) need &= dod->rect;
+    if (s.clipping == kClipFrame) need &= dod->frame;
+    const ImageDomain region = dod->WithRect(need);
+    req->SetInputRoI(input_, &region);
+}
+
+// ---- processing ------------------------------------------------------------------------------------------
+
+void LensDistort::Process(Request *req) {
+    auto *src = dynamic_cast<Image *>(req->GetInputData(input_));
+    if (!src) {
+        req->SetOutputData(output_, nullptr);
+        return;
+    }
+    Setup s;
+    ReadSetup(req, src, nullptr, s);
+    const bool precalc = req->IsPreCalc();
+    const ImgRectI frame(0, 0, s.width, s.height);
+    const AutoImageDoD dod(req, input_);
+    // The input's domain and data window, bounded so that the walk stays finite.
+    ImgRectI from = src->DataWindow() & frame.Grown(s.width, s.height);
+    if (dod) from &= dod->rect;
+    // A distortion map covers every position of the frame, whatever the source holds.
+    ImgRectI window = s.distortionMap ? frame : MappedBounds(s, from, s.mode == 1);
+    window &= src->DataWindow().Grown(s.width, s.height);
+    if (s.distortionMap) window = frame;
+    if (const AutoImageRoI roi(req); roi) window &= roi->rect;
+    if (s.clipping == kClipFrame) window &= frame;
+
+    Ref<Image> dst = NewSizedImage(*src, s.width, s.height, window, req);
+    if (dst && s.distortionMap && dst->Depth() != DepthRGBAFlt32)
+        dst = NewImageTagList(
+            {{ImgLikeImage, dst.Get()}, {ImgDepth, DepthRGBAFlt32}, {ImgDataWindow, &window}, {ImgNoData, precalc}});
+    if (!dst) {
+        FailOutOfMemory(req);
+        req->SetOutputData(output_, nullptr);
+        return;
+    }
+    if (!precalc && !window.IsNull()) {
+        if (!dst->AllocScanLineData() || !src->DownloadGPUMem()) {
+            FailOutOfMemory(req);
+            req->SetOutputData(output_, nullptr);
+            return;
+        }
+        // Reads beyond the data window give canvas (or the border, Duplicate) by the sampler's rules; a copy is
+        // made when the source is not float, or the frame is the window to read.
+        const ImgRectI read = s.clipping == kClipFrame ? frame : src->DataWindow();
+        Ref<Image> source(src);
+        if (!s.distortionMap && (src->Depth() != DepthRGBAFlt32 || read != src->DataWindow()))
+            source = src->CopyOfImageTagList({{ImgDataWindow, &read}, {ImgDepth, DepthRGBAFlt32}});
+        if (!source) {
+            FailOutOfMemory(req);
+            req->SetOutputData(output_, nullptr);
+            return;
+        }
+        setup_ = s;
+        source_ = source.Get();
+        dest_ = dst.Get();
+        if (s.width >= 3) DoMultiProcess(req, window.Height());
+        source_ = nullptr;
+        dest_ = nullptr;
+        if (req->GetTask() && req->GetTask()->IsAborted()) {
+            req->SetOutputData(output_, nullptr);
+            return;
+        }
+    }
+    req->SetOutputData(output_, dst.Get());
+}
+
+void LensDistort::ProcessChunk(Request *req, int chunk) {
+    if (req->GetTask() && req->GetTask()->IsAborted()) return;
+    const ImgRectI dw = dest_->DataWindow();
+    std::vector<FltPixel> row(static_cast<size_t>(dw.Width()));
+    ProcessRow(dw.y0 + chunk, row);
+    StoreFlt(dest_->Depth(), row.data(), dw.Width(), dest_->ScanLine(dw.y0 + chunk));
+}
+
+void LensDistort::ProcessRow(int y, std::vector<FltPixel> &row) const {
+    const Setup &s = setup_;
+    const lensdistort::Model &m = *s.model;
+    const ImgRectI dw = dest_->DataWindow();
+    const int n = s.samples;
+    const double step = 1.0 / n;
+    const float weight = 1.0f / static_cast<float>(n * n);
+    const EdgeSampler sampler(*source_, s.edge);
+
+    // One pixel: its samples mapped from `start` (the inverse) or directly; false when every sample dropped.
+    // `next` takes the mean result when no sample dropped.
+    auto pixel = [&](int x, Pos start, Pos &next) {
+        float sum[4] = {0, 0, 0, 0};
+        double sumX = 0, sumY = 0;
+        int kept = 0;
+        for (int j = 0; j < n; ++j)
+            for (int i = 0; i < n; ++i) {
+                const double px = x + (i + 0.5) * step, py = y + (j + 0.5) * step;
+                Pos q;
+                if (s.mode == 0) {
+                    if (!m.MapDirect(px, py, q.x, q.y)) continue;
+                } else if (!m.MapInverse(px, py, start.x, start.y, q.x, q.y) ||
+                           std::fabs(q.x - start.x) + std::fabs(q.y - start.y) > s.maxStep) {
+                    continue;
+                }
+                ++kept;
+                sumX += q.x, sumY += q.y;
+                if (s.distortionMap) {
+                    sum[0] += static_cast<float>(q.x - px), sum[1] += static_cast<float>(q.y - py);
+                } else if (s.bilinear) {
+                    sampler.AddBilinear(q.x, q.y, 1.0f, sum);
+                } else {
+                    sampler.AddNearest(q.x, q.y, 1.0f, sum);
+                }
+            }
+        FltPixel &out = row[static_cast<size_t>(x - dw.x0)];
+        if (kept == 0) {
+            out = FltPixel{};
+            return false;
+        }
+        const float scale = kept == n * n ? weight : 1.0f / static_cast<float>(kept);
+        out = s.distortionMap ? FltPixel{sum[0] * scale, sum[1] * scale, 0.f, 1.f}
+                              : FltPixel{sum[0] * scale, sum[1] * scale, sum[2] * scale, sum[3] * scale};
+        if (kept == n * n) next = {sumX / kept, sumY / kept};
+        return true;
+    };
+
+    if (s.mode == 0) {
+        Pos unused;
+        for (int x = dw.x0; x < dw.x1; ++x) pixel(x, {}, unused);
+        return;
+    }
+    // Undistort: two runs from the row's middle, each pixel starting from its neighbour's result.
+    const int mid = dw.x0 + (dw.Width() - 1) / 2;
+    Pos start{0.5 * s.width, 0.5 * s.height};
+    m.MapInverse(mid + 0.5, y + 0.5, start.x, start.y, start.x, start.y);
+    Pos next = start, rightStart = start;
+    for (int x = mid; x >= dw.x0; --x) {
+        const bool ok = pixel(x, start, next);
+        if (x == mid) rightStart = next; // the right run starts from the middle pixel's result
+        if (!ok) {
+            std::fill(row.begin(), row.begin() + (x - dw.x0), FltPixel{});
+            break;
+        }
+        start = next;
+    }
+    start = next = rightStart;
+    for (int x = mid + 1; x < dw.x1; ++x) {
+        if (!pixel(x, start, next)) {
+            std::fill(row.begin() + (x - dw.x0), row.end(), FltPixel{});
+            break;
+        }
+        start = next;
+    }
+}
+
+} // namespace Orvane
