@@ -65,8 +65,14 @@ public:
     /// error_undefined_parameter for an unknown name, error_could_not_read_value for bad text.
     void set_parameter_from_text(const char *identifier, const char *text);
 
-    vec2d to_unit(vec2d n) const;
-    vec2d from_unit(vec2d u) const;
+    vec2d to_unit(vec2d n) const {
+        return {((n.x - 0.5) * builtin_[1] - builtin_[3]) * inv_r_fb_,
+                ((n.y - 0.5) * builtin_[2] - builtin_[4]) * inv_r_fb_};
+    }
+    vec2d from_unit(vec2d u) const {
+        return {(r_fb_ * u.x + builtin_[1] * 0.5 + builtin_[3]) * inv_w_,
+                (r_fb_ * u.y + builtin_[2] * 0.5 + builtin_[4]) * inv_h_};
+    }
     double r_fb() const { return r_fb_; }
     /// The distortion object that the inverse iterates on (its counters are the model's).
     virtual const generic_distortion_base &distortion() const = 0;
@@ -97,7 +103,7 @@ private:
     std::array<double, max_parameters> values_{};
     // focal length, filmback w and h, lens centre offset x and y, pixel aspect, focus distance.
     std::array<double, n_builtin> builtin_{1.0, 0.8, 0.6, 0.0, 0.0, 1.0, 100.0};
-    double r_fb_ = 0.5;
+    double r_fb_ = 0.5, inv_r_fb_ = 2.0, inv_w_ = 1.0 / 0.8, inv_h_ = 1.0 / 0.6;
     std::array<vec2d, table_columns * table_rows> table_{};
     std::atomic<bool> table_ready_{false};
     std::mutex table_lock_;

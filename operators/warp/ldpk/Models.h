@@ -22,7 +22,7 @@ public:
 protected:
     using ldp_builtin::ldp_builtin;
     vec2d undistort_unit(vec2d p) const override { return poly_.eval(p); }
-    bool distort_unit(vec2d q, vec2d start, vec2d &p) const override { return poly_.map_inverse_newton(q, start, p); }
+    bool distort_unit(vec2d q, vec2d start, vec2d &p) const override { return newton_inverse(poly_, q, start, p); }
     bool jacobian_unit(vec2d p, mat2d &j) const override {
         j = poly_.jacobian(p);
         return true;
