@@ -502,7 +502,7 @@ void LensDistort::ProcessRow(int y, std::vector<FltPixel> &row) const {
     const float weight = 1.0f / static_cast<float>(n * n);
     const EdgeSampler sampler(*source_, s.edge);
 
-    // One pixel: its samples mapped directly, or by the inverse from `start` (the predicted result at the pixel's
+    // One pixel of Undistort: its samples mapped by the inverse from `start` (the predicted result at the pixel's
     // centre) moved to each sample by `slope` (the result's change per pixel along x) and, for the change along y,
     // that slope turned a quarter (a lens map is close to a similarity locally). Gives the number of samples
     // kept, and `result` the mean result when none dropped.
@@ -515,14 +515,10 @@ void LensDistort::ProcessRow(int y, std::vector<FltPixel> &row) const {
                 const double dx = (i + 0.5) * step - 0.5, dy = (j + 0.5) * step - 0.5;
                 const double px = x + 0.5 + dx, py = y + 0.5 + dy;
                 Pos q;
-                if (s.mode == 0) {
-                    if (!m.MapDirect(px, py, q.x, q.y)) continue;
-                } else {
-                    const Pos from{start.x + dx * slope.x - dy * slope.y, start.y + dx * slope.y + dy * slope.x};
-                    if (!m.MapInverse(px, py, from.x, from.y, q.x, q.y) ||
-                        std::fabs(q.x - from.x) + std::fabs(q.y - from.y) > s.maxStep)
-                        continue;
-                }
+                const Pos from{start.x + dx * slope.x - dy * slope.y, start.y + dx * slope.y + dy * slope.x};
+                if (!m.MapInverse(px, py, from.x, from.y, q.x, q.y) ||
+                    std::fabs(q.x - from.x) + std::fabs(q.y - from.y) > s.maxStep)
+                    continue;
                 ++kept;
                 sumX += q.x, sumY += q.y;
                 if (s.distortionMap) {
@@ -546,8 +542,35 @@ void LensDistort::ProcessRow(int y, std::vector<FltPixel> &row) const {
     };
 
     if (s.mode == 0) {
-        Pos unused;
-        for (int x = dw.x0; x < dw.x1; ++x) pixel(x, {}, {}, unused);
+        // Distort: the direct map of a whole row of samples per call, then the reads.
+        const int width = dw.Width(), count = width * n;
+        std::vector<double> xs(static_cast<size_t>(count)), ox(xs.size()), oy(xs.size());
+        const std::unique_ptr<bool[]> ok(new bool[xs.size()]);
+        std::vector<int> kept(static_cast<size_t>(width), 0);
+        for (int k = 0; k < count; ++k) xs[k] = dw.x0 + (k + 0.5) * step;
+        for (int j = 0; j < n; ++j) {
+            const double py = y + (j + 0.5) * step;
+            m.MapDirectRow(xs.data(), py, count, ox.data(), oy.data(), ok.get());
+            for (int k = 0; k < count; ++k) {
+                if (!ok[k]) continue;
+                float *sum = &row[static_cast<size_t>(k / n)].R;
+                ++kept[static_cast<size_t>(k / n)];
+                if (s.distortionMap) {
+                    sum[0] += static_cast<float>(ox[k] - xs[k]), sum[1] += static_cast<float>(oy[k] - py);
+                } else if (s.bilinear) {
+                    sampler.AddBilinear(ox[k], oy[k], 1.0f, sum);
+                } else {
+                    sampler.AddNearest(ox[k], oy[k], 1.0f, sum);
+                }
+            }
+        }
+        for (int p = 0; p < width; ++p) {
+            FltPixel &out = row[static_cast<size_t>(p)];
+            const int got = kept[static_cast<size_t>(p)];
+            const float scale = got == n * n ? weight : got ? 1.0f / static_cast<float>(got) : 0.f;
+            out = s.distortionMap && got ? FltPixel{out.R * scale, out.G * scale, 0.f, 1.f}
+                                         : FltPixel{out.R * scale, out.G * scale, out.B * scale, out.A * scale};
+        }
         return;
     }
     // Undistort: two runs from the row's middle. Each pixel starts from its neighbours' results: the last one,

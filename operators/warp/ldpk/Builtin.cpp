@@ -115,6 +115,10 @@ bool ldp_builtin::initializeParameters() {
     return true;
 }
 
+void ldp_builtin::undistort_span(const vec2d *in, vec2d *out, int n) const {
+    direct_span([this](vec2d p) { return undistort_unit(p); }, in, out, n);
+}
+
 bool ldp_builtin::undistort(double x0, double y0, double &x1, double &y1) {
     const vec2d p = from_unit(undistort_unit(to_unit({x0, y0})));
     x1 = p.x;

@@ -65,6 +65,10 @@ public:
     /// error_undefined_parameter for an unknown name, error_could_not_read_value for bad text.
     void set_parameter_from_text(const char *identifier, const char *text);
 
+    /// The direct function (undistort) of n normalised positions at once: out[i] from in[i], non-finite where
+    /// it fails. The models bind their chain here at compile time, so a row of positions costs no call each.
+    virtual void undistort_span(const vec2d *in, vec2d *out, int n) const;
+
     vec2d to_unit(vec2d n) const {
         return {((n.x - 0.5) * builtin_[1] - builtin_[3]) * inv_r_fb_,
                 ((n.y - 0.5) * builtin_[2] - builtin_[4]) * inv_r_fb_};
@@ -88,6 +92,11 @@ protected:
     /// Inverse of undistort_unit at q from `start`, both in unit coordinates.
     virtual bool distort_unit(vec2d q, vec2d start, vec2d &p) const = 0;
     virtual bool jacobian_unit(vec2d p, mat2d &j) const = 0;
+
+    /// undistort_span's loop around a model's own chain in unit coordinates.
+    template <class UnitMap> void direct_span(UnitMap unit_map, const vec2d *in, vec2d *out, int n) const {
+        for (int i = 0; i < n; ++i) out[i] = from_unit(unit_map(to_unit(in[i])));
+    }
 
     double value(int i) const { return values_[i]; }
     double focal_length_cm() const { return builtin_[0]; }

@@ -18,6 +18,10 @@ namespace ldpk {
 template <class Polynomial> class polynomial_model : public ldp_builtin {
 public:
     const generic_distortion_base &distortion() const override { return poly_; }
+    // A model that overrides undistort_unit overrides this too, with its own chain.
+    void undistort_span(const vec2d *in, vec2d *out, int n) const override {
+        direct_span([this](vec2d p) { return poly_.eval(p); }, in, out, n);
+    }
 
 protected:
     using ldp_builtin::ldp_builtin;
@@ -36,6 +40,11 @@ class tde4_ldp_anamorphic_deg_4_rotate_squeeze_xy
 public:
     tde4_ldp_anamorphic_deg_4_rotate_squeeze_xy();
     bool initializeParameters() override;
+
+    void undistort_span(const ldpk::vec2d *in, ldpk::vec2d *out, int n) const override {
+        direct_span([this](ldpk::vec2d p) { return tde4_ldp_anamorphic_deg_4_rotate_squeeze_xy::undistort_unit(p); },
+                    in, out, n);
+    }
 
 protected:
     void prepare() override;
@@ -70,6 +79,11 @@ class tde4_ldp_radial_decentered_deg_4_cylindric : public ldpk::polynomial_model
 public:
     tde4_ldp_radial_decentered_deg_4_cylindric();
 
+    void undistort_span(const ldpk::vec2d *in, ldpk::vec2d *out, int n) const override {
+        direct_span([this](ldpk::vec2d p) { return tde4_ldp_radial_decentered_deg_4_cylindric::undistort_unit(p); }, in,
+                    out, n);
+    }
+
 protected:
     void prepare() override;
     ldpk::vec2d undistort_unit(ldpk::vec2d p) const override;
@@ -86,6 +100,10 @@ class tde4_ldp_radial_deg_8 : public ldpk::polynomial_model<ldpk::generic_radial
 public:
     tde4_ldp_radial_deg_8();
     static constexpr double result_radius_limit = 50.0;
+
+    void undistort_span(const ldpk::vec2d *in, ldpk::vec2d *out, int n) const override {
+        direct_span([this](ldpk::vec2d p) { return tde4_ldp_radial_deg_8::undistort_unit(p); }, in, out, n);
+    }
 
 protected:
     tde4_ldp_radial_deg_8(const char *name, bool cut_result);
