@@ -54,6 +54,7 @@ void BM_LensDistort(benchmark::State &state, int mode, const char *model) {
     Operator *lens = AddToolOnFrame(state, doc, "LensDistort", numbers);
     if (!lens) return;
     lens->FindInput("Model")->SetValue(MakeRef<IDValue>(OvID(model)));
+    if (radial) lens->FindInput("FilmGate")->SetValue(MakeRef<IDValue>(OvID("FilmGate_User"))); // typed aperture
     // The output's data window (the mapped frame, Clipping Mode Domain) in the label: pixels/s counts the frame's.
     EvalOptions options;
     options.useCache = false;

@@ -151,10 +151,11 @@ LensDistort::LensDistort(const Registry *reg, const ScriptVal &args, const TagLi
     }
     filmGate_ = AddInputTagList("Film Gate", "FilmGate", gateTags);
     const double gateW = ApertureTable[2 * kDefaultFilmGate], gateH = ApertureTable[2 * kDefaultFilmGate + 1];
+    // Typed for the user gate only (shown then); the default gate is a standard one.
     apertureW_ = AddSlider(this, "Aperture Width (in)", "ApertureWidth", 0.1, 3.0, gateW,
-                           {{InputMinAllowed, 0.1}, {InputMaxAllowed, 3.0}});
+                           {{InputMinAllowed, 0.1}, {InputMaxAllowed, 3.0}, {ControlVisible, 0}});
     apertureH_ = AddSlider(this, "Aperture Height (in)", "ApertureHeight", 0.1, 3.0, gateH,
-                           {{InputMinAllowed, 0.1}, {InputMaxAllowed, 3.0}});
+                           {{InputMinAllowed, 0.1}, {InputMaxAllowed, 3.0}, {ControlVisible, 0}});
     TagList fitTags{{LinkDataType, CLSID_DataType_OvID},
                     {InputControl, CLSID_InputControl_MultiButtonID},
                     {InputDefaultId, FMID_Inside}};
@@ -192,10 +193,14 @@ void LensDistort::ShowModelInputs(OvID chosen) {
     const lensdistort::Model *model = ChosenModel(chosen);
     for (size_t i = 0; i < models_.size(); ++i)
         for (Input *in : modelInputs_[i]) ShowInput(in, models_[i].get() == model);
-    for (Input *in :
-         {useSourceAspect_, focalLength_, filmGate_, apertureW_, apertureH_, fit_, shiftX_, shiftY_, focusDistance_})
-        ShowInput(in, model->HasCameraParameters());
-    ShowInput(pixelAspect_, model->HasCameraParameters() && ControlNumber(useSourceAspect_, TimeUndefined, 1.0) < 0.5);
+    const bool camera = model->HasCameraParameters();
+    for (Input *in : {useSourceAspect_, focalLength_, filmGate_, fit_, shiftX_, shiftY_, focusDistance_})
+        ShowInput(in, camera);
+    // The aperture is typed only for the user gate; a standard gate brings its own.
+    const Ref<Parameter> gate = filmGate_->ValueAt(0.0);
+    const auto *gateId = dynamic_cast<const IDValue *>(gate.Get());
+    for (Input *in : {apertureW_, apertureH_}) ShowInput(in, camera && gateId && gateId->value == FilmGate_User);
+    ShowInput(pixelAspect_, camera && ControlNumber(useSourceAspect_, TimeUndefined, 1.0) < 0.5);
 }
 
 void LensDistort::NotifyChanged(Input *in, Parameter *param, double time, TagList *tags) {
@@ -215,12 +220,7 @@ void LensDistort::NotifyChanged(Input *in, Parameter *param, double time, TagLis
                 Name().c_str(), Name().c_str());
         }
     } else if (in == filmGate_) {
-        // A standard gate sets the aperture; the user gate keeps what is typed.
-        if (const auto *id = dynamic_cast<const IDValue *>(param); id && id->value != FilmGate_User)
-            if (const std::optional<FilmAperture> a = ApertureOf(id->value)) {
-                WriteControl(this, apertureW_, a->width, time);
-                WriteControl(this, apertureH_, a->height, time);
-            }
+        ShowModelInputs(ModelAt(model_, time));
     }
     ThreadedOperator::NotifyChanged(in, param, time, tags);
 }
@@ -290,9 +290,9 @@ bool LensDistort::LoadLensFile(const std::string &path, double time, std::string
     if (lens.pixelAspect) {
         WriteControl(this, useSourceAspect_, 0.0, time);
         WriteControlPoint(this, pixelAspect_, *lens.pixelAspect, 1.0, time);
-        ShowModelInputs(model->ID());
     }
     if (lens.focusDistanceCm) WriteControl(this, focusDistance_, *lens.focusDistanceCm, time);
+    ShowModelInputs(model->ID());
     return true;
 }
 
@@ -323,8 +323,11 @@ bool LensDistort::ReadSetup(Request *req, const Image *img, const ImageDomain *d
     m.width = s.width, m.height = s.height, m.pixelAspect = aspect;
     if (s.model->HasCameraParameters()) {
         m.focalLengthMm = req->GetInputNumber(focalLength_, 35.0);
-        m.apertureWidthIn = req->GetInputNumber(apertureW_, m.apertureWidthIn);
-        m.apertureHeightIn = req->GetInputNumber(apertureH_, m.apertureHeightIn);
+        // A standard gate gives its aperture; the user gate takes the typed one.
+        const OvID gate = req->GetInputID(filmGate_, FilmGateID[kDefaultFilmGate]);
+        const std::optional<FilmAperture> standard = gate == FilmGate_User ? std::nullopt : ApertureOf(gate);
+        m.apertureWidthIn = standard ? standard->width : req->GetInputNumber(apertureW_, m.apertureWidthIn);
+        m.apertureHeightIn = standard ? standard->height : req->GetInputNumber(apertureH_, m.apertureHeightIn);
         m.shiftX = req->GetInputNumber(shiftX_, 0.0);
         m.shiftY = req->GetInputNumber(shiftY_, 0.0);
         m.focusDistanceCm = req->GetInputNumber(focusDistance_, 100.0);

@@ -145,6 +145,7 @@ TEST_F(LensPeer, RadialModelMatchesOpenCvsRemap) {
         Operator *lens = AddTool(doc, "LensDistort", AddProbe(doc, src), {{"Mode", c.mode}, {"EdgeMode", c.edge}});
         SetID(lens, "Model", "DE4RadialStandardDegree4");
         SetID(lens, "ResolutionGateFit", c.fit);
+        SetID(lens, "FilmGate", "FilmGate_User"); // the aperture below is typed, not a standard gate's
         SetNumbers(lens, {{"DE4RadialStandardDegree4.DistortionDegree2", c.c2},
                           {"DE4RadialStandardDegree4.QuarticDistortionDegree4", c.c4},
                           {"ApertureWidth", c.apertureW},

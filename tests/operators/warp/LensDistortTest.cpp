@@ -238,6 +238,17 @@ TEST_F(LensTool, LensFilesLoadIntoTheInputs) {
     EXPECT_DOUBLE_EQ(Control(lens, "ApertureHeight"), 0.75);
     EXPECT_DOUBLE_EQ(Control(lens, "LensShiftX"), 0.1);
     Ref<Image> loaded = Render(lens);
+    // The file's aperture holds with the user gate only: a standard gate brings its own (0.980 x 0.735 in), as
+    // typing that aperture for the user gate does.
+    SetID(lens, "FilmGate", "FilmGate_35mmFullAperture");
+    Ref<Image> standard = Render(lens);
+    SetID(lens, "FilmGate", "FilmGate_User");
+    SetNumbers(lens, {{"ApertureWidth", 0.98}, {"ApertureHeight", 0.735}});
+    ExpectSamePixels(*Render(lens), *standard, ImgRectI(0, 0, W, H), "standard gate");
+    // (An aperture of another aspect fits the frame otherwise, and bends it otherwise.)
+    SetNumbers(lens, {{"ApertureWidth", 1.0}, {"ApertureHeight", 0.5}});
+    EXPECT_GT(std::fabs(Render(lens)->GetFlt(100, 70).R - standard->GetFlt(100, 70).R), 1e-3);
+    SetNumbers(lens, {{"ApertureWidth", 1.0}, {"ApertureHeight", 0.75}});
 
     // A bad file: nothing changes, and the reason names the file.
     for (const auto &[name, text] : std::vector<std::pair<std::string, std::string>>{
