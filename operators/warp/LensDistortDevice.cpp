@@ -33,24 +33,31 @@ void SetAnamorphic(LensDistortParams &p, const ldpk::generic_anamorphic_distorti
     }
 }
 
+/// The chain's matrices: undistort is outer (polynomial (inner p)); mix = outer inner - 1, taken in double.
+void SetMatrices(LensDistortParams &p, const ldpk::mat2d &inner, const ldpk::mat2d &outer) {
+    SetMatrix(p.inner, inner);
+    SetMatrix(p.outer, outer);
+    ldpk::mat2d mix = outer * inner;
+    mix.m00 -= 1.0, mix.m11 -= 1.0;
+    SetMatrix(p.mix, mix);
+}
+
 /// The chain of `plugin` into the block; false for a model the kernel does not have.
 bool SetChain(LensDistortParams &p, const ldpk::ldp_builtin &plugin) {
-    SetMatrix(p.inner, ldpk::mat2d{});
-    SetMatrix(p.outer, ldpk::mat2d{});
     if (const auto *radial = dynamic_cast<const tde4_ldp_radial_decentered_deg_4_cylindric *>(&plugin)) {
         p.polynomial = 0;
         for (int k = 0; k < 6; ++k) p.coeffX[k] = static_cast<float>(radial->polynomial().get_coeff(k));
-        SetMatrix(p.outer, radial->cylindric().matrix());
+        SetMatrices(p, ldpk::mat2d{}, radial->cylindric().matrix());
         return true;
     }
     if (const auto *a4 = dynamic_cast<const tde4_ldp_anamorphic_deg_4_rotate_squeeze_xy *>(&plugin)) {
         SetAnamorphic(p, a4->polynomial());
-        SetMatrix(p.inner, a4->e2().inverse());
-        SetMatrix(p.outer, a4->e1().matrix());
+        SetMatrices(p, a4->e2().inverse(), a4->e1().matrix());
         return true;
     }
     if (const auto *a6 = dynamic_cast<const tde4_ldp_anamorphic_deg_6 *>(&plugin)) {
         SetAnamorphic(p, a6->polynomial());
+        SetMatrices(p, ldpk::mat2d{}, ldpk::mat2d{});
         return true;
     }
     return false;

@@ -15,11 +15,13 @@ namespace Orvane {
 // workSize: the output's. samples: per axis (1, 2, 4, 8); bilinear: else
 // nearest; distortionMap: write the mean offset instead of colour.
 // The map of a sample p, per axis: u = (p - centre) scale + shift in the
-// model's unit coordinates; U = outer poly(inner u); the source position is
-// p + (U - u) invScale. polynomial: 0 radial decentered (coeffX: c2, u1, v1,
-// c4, u3, v3), 1 anamorphic (coeffX, coeffY: `terms` coefficients per axis
-// of x^2, y^2, x^4, x^2 y^2, y^4, x^6, x^4 y^2, x^2 y^4, y^6). inner, outer:
-// 2 x 2 matrices, row major.
+// model's unit coordinates; the source position is p + (U - u) invScale with
+// U = outer poly(inner u), the difference taken as outer (poly(v) - v) +
+// mix u, v = inner u and mix = outer inner - 1, so that no large terms cancel.
+// polynomial: 0 radial decentered (coeffX: c2, u1, v1, c4, u3, v3), 1
+// anamorphic (coeffX, coeffY: `terms` coefficients per axis of x^2, y^2, x^4,
+// x^2 y^2, y^4, x^6, x^4 y^2, x^2 y^4, y^6). inner, outer, mix: 2 x 2
+// matrices, row major.
 KROM_PARAM_STRUCT(LensDistortParams, {
     float canvas[4];
     int srcWindow[4];
@@ -38,15 +40,17 @@ KROM_PARAM_STRUCT(LensDistortParams, {
     float invScale[2];
     float inner[4];
     float outer[4];
+    float mix[4];
     float coeffX[9];
     float coeffY[9];
     int srcCompOrder, dstCompOrder;
 })
-static_assert(sizeof(LensDistortParams) == 240);
+static_assert(sizeof(LensDistortParams) == 256);
 static_assert(offsetof(LensDistortParams, workSize) == 64);
 static_assert(offsetof(LensDistortParams, centre) == 96);
-static_assert(offsetof(LensDistortParams, coeffX) == 160);
-static_assert(offsetof(LensDistortParams, srcCompOrder) == 232);
-static_assert(offsetof(LensDistortParams, dstCompOrder) == 236);
+static_assert(offsetof(LensDistortParams, mix) == 160);
+static_assert(offsetof(LensDistortParams, coeffX) == 176);
+static_assert(offsetof(LensDistortParams, srcCompOrder) == 248);
+static_assert(offsetof(LensDistortParams, dstCompOrder) == 252);
 
 } // namespace Orvane

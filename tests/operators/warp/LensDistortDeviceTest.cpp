@@ -15,9 +15,10 @@ namespace {
 constexpr int W = 96, H = 60; // 16:10 on the 4:3 default filmback: the fit is not a plain x / W
 constexpr FltPixel kCanvas{0.2f, 0.3f, 0.4f, 0.5f};
 /// How far a device position may lie from the rows': the device maps in float, the rows in double. The unit
-/// coordinates, the chain's result and the sum of sample and offset each carry a few float roundings of values that,
-/// back in pixels, are at most about the image's size (measured: about a tenth of this).
-const double kPositionTol = 8 * FLT_EPSILON * std::max(W, H);
+/// coordinates carry a few float roundings relative to the image's size, which the lens's displacement (whose slope
+/// is well below one) passes on scaled down; the offset itself is rounded relative to its own size. Both stay below a
+/// float step of the image's size (measured: about a tenth of it, here and at 3840 x 2160).
+const double kPositionTol = FLT_EPSILON * std::max(W, H);
 
 /// The largest difference of any channel.
 double ChannelDifference(const FltPixel &a, const FltPixel &b) {
