@@ -23,6 +23,8 @@ packages=("$@")
   netpbm imagemagick openexr libjpeg-turbo-progs
   # Blur, resize and merge results and speeds are compared with these.
   openimageio-tools libvips-tools
+  # Lens Distort's pixels are compared with OpenCV's lens map and remap, through its Python module.
+  python3-opencv
 )
 missing=()
 for p in "${packages[@]}"; do

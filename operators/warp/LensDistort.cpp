@@ -509,22 +509,23 @@ void LensDistort::ProcessRow(int y, std::vector<FltPixel> &row) const {
     const float weight = 1.0f / static_cast<float>(n * n);
     const EdgeSampler sampler(*source_, s.edge);
 
-    // One pixel: its samples mapped from `start` (the inverse) or directly; false when every sample dropped.
-    // `next` takes the mean result when no sample dropped.
-    auto pixel = [&](int x, Pos start, Pos &next) {
+    // One pixel of Undistort: its samples mapped by the inverse from `start` (the predicted result at the pixel's
+    // centre) moved to each sample by `slope` (the result's change per pixel along x) and, for the change along y,
+    // that slope turned a quarter (a lens map is close to a similarity locally). Gives the number of samples
+    // kept, and `result` the mean result when none dropped.
+    auto pixel = [&](int x, Pos start, Pos slope, Pos &result) {
         float sum[4] = {0, 0, 0, 0};
         double sumX = 0, sumY = 0;
         int kept = 0;
         for (int j = 0; j < n; ++j)
             for (int i = 0; i < n; ++i) {
-                const double px = x + (i + 0.5) * step, py = y + (j + 0.5) * step;
+                const double dx = (i + 0.5) * step - 0.5, dy = (j + 0.5) * step - 0.5;
+                const double px = x + 0.5 + dx, py = y + 0.5 + dy;
                 Pos q;
-                if (s.mode == 0) {
-                    if (!m.MapDirect(px, py, q.x, q.y)) continue;
-                } else if (!m.MapInverse(px, py, start.x, start.y, q.x, q.y) ||
-                           std::fabs(q.x - start.x) + std::fabs(q.y - start.y) > s.maxStep) {
+                const Pos from{start.x + dx * slope.x - dy * slope.y, start.y + dx * slope.y + dy * slope.x};
+                if (!m.MapInverse(px, py, from.x, from.y, q.x, q.y) ||
+                    std::fabs(q.x - from.x) + std::fabs(q.y - from.y) > s.maxStep)
                     continue;
-                }
                 ++kept;
                 sumX += q.x, sumY += q.y;
                 if (s.distortionMap) {
@@ -538,41 +539,81 @@ void LensDistort::ProcessRow(int y, std::vector<FltPixel> &row) const {
         FltPixel &out = row[static_cast<size_t>(x - dw.x0)];
         if (kept == 0) {
             out = FltPixel{};
-            return false;
+            return 0;
         }
         const float scale = kept == n * n ? weight : 1.0f / static_cast<float>(kept);
         out = s.distortionMap ? FltPixel{sum[0] * scale, sum[1] * scale, 0.f, 1.f}
                               : FltPixel{sum[0] * scale, sum[1] * scale, sum[2] * scale, sum[3] * scale};
-        if (kept == n * n) next = {sumX / kept, sumY / kept};
-        return true;
+        if (kept == n * n) result = {sumX / kept, sumY / kept};
+        return kept;
     };
 
     if (s.mode == 0) {
-        Pos unused;
-        for (int x = dw.x0; x < dw.x1; ++x) pixel(x, {}, unused);
+        // Distort: the direct map of a whole row of samples per call, then the reads.
+        const int width = dw.Width(), count = width * n;
+        std::vector<double> xs(static_cast<size_t>(count)), ox(xs.size()), oy(xs.size());
+        const std::unique_ptr<bool[]> ok(new bool[xs.size()]);
+        std::vector<int> kept(static_cast<size_t>(width), 0);
+        for (int k = 0; k < count; ++k) xs[k] = dw.x0 + (k + 0.5) * step;
+        for (int j = 0; j < n; ++j) {
+            const double py = y + (j + 0.5) * step;
+            m.MapDirectRow(xs.data(), py, count, ox.data(), oy.data(), ok.get());
+            for (int k = 0; k < count; ++k) {
+                if (!ok[k]) continue;
+                float *sum = &row[static_cast<size_t>(k / n)].R;
+                ++kept[static_cast<size_t>(k / n)];
+                if (s.distortionMap) {
+                    sum[0] += static_cast<float>(ox[k] - xs[k]), sum[1] += static_cast<float>(oy[k] - py);
+                } else if (s.bilinear) {
+                    sampler.AddBilinear(ox[k], oy[k], 1.0f, sum);
+                } else {
+                    sampler.AddNearest(ox[k], oy[k], 1.0f, sum);
+                }
+            }
+        }
+        for (int p = 0; p < width; ++p) {
+            FltPixel &out = row[static_cast<size_t>(p)];
+            const int got = kept[static_cast<size_t>(p)];
+            const float scale = got == n * n ? weight : got ? 1.0f / static_cast<float>(got) : 0.f;
+            out = s.distortionMap && got ? FltPixel{out.R * scale, out.G * scale, 0.f, 1.f}
+                                         : FltPixel{out.R * scale, out.G * scale, out.B * scale, out.A * scale};
+        }
         return;
     }
-    // Undistort: two runs from the row's middle, each pixel starting from its neighbour's result.
+    // Undistort: two runs from the row's middle. Each pixel starts from its neighbours' results: the last one,
+    // extended along the run by the last two or three (a line or a parabola through them), which puts the start
+    // within a small fraction of a pixel of the answer so that Newton's method ends after a round or two. Only
+    // pixels whose samples were all kept feed the prediction; a pixel with every sample dropped ends the run.
     const int mid = dw.x0 + (dw.Width() - 1) / 2;
-    Pos start{0.5 * s.width, 0.5 * s.height};
-    m.MapInverse(mid + 0.5, y + 0.5, start.x, start.y, start.x, start.y);
-    Pos next = start, rightStart = start;
-    for (int x = mid; x >= dw.x0; --x) {
-        const bool ok = pixel(x, start, next);
-        if (x == mid) rightStart = next; // the right run starts from the middle pixel's result
-        if (!ok) {
-            std::fill(row.begin(), row.begin() + (x - dw.x0), FltPixel{});
-            break;
+    Pos seed{0.5 * s.width, 0.5 * s.height};
+    m.MapInverse(mid + 0.5, y + 0.5, seed.x, seed.y, seed.x, seed.y);
+    Pos middle = seed; // the middle pixel's result, where the right run starts
+    bool middleFull = false;
+    for (const int dir : {-1, 1}) {
+        Pos h[3] = {dir < 0 ? seed : middle, {}, {}}; // the latest full results, newest first
+        int known = dir > 0 && middleFull ? 1 : 0;    // how many of them are results of pixels
+        for (int x = dir < 0 ? mid : mid + 1; x >= dw.x0 && x < dw.x1; x += dir) {
+            Pos start = h[0], slope{0, 0};
+            if (known >= 2) {
+                slope = {(h[0].x - h[1].x) * dir, (h[0].y - h[1].y) * dir};
+                start = known == 2 ? Pos{2 * h[0].x - h[1].x, 2 * h[0].y - h[1].y}
+                                   : Pos{3 * (h[0].x - h[1].x) + h[2].x, 3 * (h[0].y - h[1].y) + h[2].y};
+            }
+            Pos result = start;
+            const int kept = pixel(x, start, slope, result);
+            if (kept == n * n) {
+                h[2] = h[1], h[1] = h[0], h[0] = result;
+                known = std::min(known + 1, 3);
+                if (x == mid) middle = result, middleFull = true;
+            } else if (kept == 0) {
+                // Every sample dropped: the inverse ran away, and the rest of this run is cleared.
+                if (dir < 0)
+                    std::fill(row.begin(), row.begin() + (x - dw.x0), FltPixel{});
+                else
+                    std::fill(row.begin() + (x - dw.x0), row.end(), FltPixel{});
+                break;
+            }
         }
-        start = next;
-    }
-    start = next = rightStart;
-    for (int x = mid + 1; x < dw.x1; ++x) {
-        if (!pixel(x, start, next)) {
-            std::fill(row.begin() + (x - dw.x0), row.end(), FltPixel{});
-            break;
-        }
-        start = next;
     }
 }
 

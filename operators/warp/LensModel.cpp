@@ -21,6 +21,10 @@ std::string LettersAndDigits(const std::string &name) {
 
 } // namespace
 
+void Model::MapDirectRow(const double *x, double y, int n, double *ox, double *oy, bool *ok) const {
+    for (int i = 0; i < n; ++i) ok[i] = MapDirect(x[i], y, ox[i], oy[i]);
+}
+
 // ---- ModelEq ---------------------------------------------------------------------------------------------
 
 ModelEq::ModelEq(std::unique_ptr<ldpk::ldp_builtin> plugin)
@@ -91,6 +95,18 @@ bool ModelEq::MapDirect(double x, double y, double &ox, double &oy) const {
     ox = centreX_ + (nx - 0.5) * fromNormX_;
     oy = centreY_ + (ny - 0.5) * fromNormY_;
     return ok;
+}
+
+void ModelEq::MapDirectRow(const double *x, double y, int n, double *ox, double *oy, bool *ok) const {
+    std::vector<ldpk::vec2d> positions(static_cast<size_t>(n));
+    const double ny = 0.5 + (y - centreY_) * toNormY_;
+    for (int i = 0; i < n; ++i) positions[i] = {0.5 + (x[i] - centreX_) * toNormX_, ny};
+    plugin_->undistort_span(positions.data(), positions.data(), n);
+    for (int i = 0; i < n; ++i) {
+        ox[i] = centreX_ + (positions[i].x - 0.5) * fromNormX_;
+        oy[i] = centreY_ + (positions[i].y - 0.5) * fromNormY_;
+        ok[i] = std::isfinite(ox[i]) && std::isfinite(oy[i]);
+    }
 }
 
 bool ModelEq::MapInverse(double x, double y, double startX, double startY, double &ox, double &oy) const {

@@ -78,6 +78,9 @@ public:
     virtual LoadedLens Load(const std::filesystem::path &path) = 0;
     virtual bool MapDirect(double x, double y, double &ox, double &oy) const = 0;
     virtual bool MapInverse(double x, double y, double startX, double startY, double &ox, double &oy) const = 0;
+    /// MapDirect of the n positions (x[i], y) of a row; ok[i] says whether each succeeded. One call per row:
+    /// the kit's models run their chain over it without a call per position.
+    virtual void MapDirectRow(const double *x, double y, int n, double *ox, double *oy, bool *ok) const;
 
 protected:
     Model(std::string name, OvID id, bool hasCamera) : name_(std::move(name)), id_(id), hasCamera_(hasCamera) {}
@@ -97,6 +100,7 @@ public:
     LoadedLens Load(const std::filesystem::path &path) override;
     bool MapDirect(double x, double y, double &ox, double &oy) const override;
     bool MapInverse(double x, double y, double startX, double startY, double &ox, double &oy) const override;
+    void MapDirectRow(const double *x, double y, int n, double *ox, double *oy, bool *ok) const override;
     ldpk::ldp_builtin &Plugin() const { return *plugin_; }
     /// The normalisation of the last Update: x_n = 0.5 + (x - CentreX()) ToNormX(), the same for y.
     double ToNormX() const { return toNormX_; }

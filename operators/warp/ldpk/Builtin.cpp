@@ -106,19 +106,17 @@ bool ldp_builtin::initializeParameters() {
     if (fl == 0.0) std::fputs("ldp_builtin: focal length is 0.\n", stderr);
     if (pa == 0.0) std::fputs("ldp_builtin: pixel aspect is 0.\n", stderr);
     r_fb_ = 0.5 * std::sqrt(w * w + h * h);
+    // The coordinate maps run for every position: they multiply by these rather than divide.
+    inv_r_fb_ = 1.0 / r_fb_;
+    inv_w_ = 1.0 / w;
+    inv_h_ = 1.0 / h;
     prepare();
     table_ready_.store(false, std::memory_order_release);
     return true;
 }
 
-vec2d ldp_builtin::to_unit(vec2d n) const {
-    const auto &[fl, w, h, xlco, ylco, pa, fd] = builtin_;
-    return {((n.x - 0.5) * w - xlco) / r_fb_, ((n.y - 0.5) * h - ylco) / r_fb_};
-}
-
-vec2d ldp_builtin::from_unit(vec2d u) const {
-    const auto &[fl, w, h, xlco, ylco, pa, fd] = builtin_;
-    return {(r_fb_ * u.x + w * 0.5 + xlco) / w, (r_fb_ * u.y + h * 0.5 + ylco) / h};
+void ldp_builtin::undistort_span(const vec2d *in, vec2d *out, int n) const {
+    direct_span([this](vec2d p) { return undistort_unit(p); }, in, out, n);
 }
 
 bool ldp_builtin::undistort(double x0, double y0, double &x1, double &y1) {

@@ -65,8 +65,18 @@ public:
     /// error_undefined_parameter for an unknown name, error_could_not_read_value for bad text.
     void set_parameter_from_text(const char *identifier, const char *text);
 
-    vec2d to_unit(vec2d n) const;
-    vec2d from_unit(vec2d u) const;
+    /// The direct function (undistort) of n normalised positions at once: out[i] from in[i], non-finite where
+    /// it fails. The models bind their chain here at compile time, so a row of positions costs no call each.
+    virtual void undistort_span(const vec2d *in, vec2d *out, int n) const;
+
+    vec2d to_unit(vec2d n) const {
+        return {((n.x - 0.5) * builtin_[1] - builtin_[3]) * inv_r_fb_,
+                ((n.y - 0.5) * builtin_[2] - builtin_[4]) * inv_r_fb_};
+    }
+    vec2d from_unit(vec2d u) const {
+        return {(r_fb_ * u.x + builtin_[1] * 0.5 + builtin_[3]) * inv_w_,
+                (r_fb_ * u.y + builtin_[2] * 0.5 + builtin_[4]) * inv_h_};
+    }
     double r_fb() const { return r_fb_; }
     /// The built-in values the unit coordinates depend on (cm).
     double filmback_width() const { return builtin_[1]; }
@@ -88,6 +98,11 @@ protected:
     virtual bool distort_unit(vec2d q, vec2d start, vec2d &p) const = 0;
     virtual bool jacobian_unit(vec2d p, mat2d &j) const = 0;
 
+    /// undistort_span's loop around a model's own chain in unit coordinates.
+    template <class UnitMap> void direct_span(UnitMap unit_map, const vec2d *in, vec2d *out, int n) const {
+        for (int i = 0; i < n; ++i) out[i] = from_unit(unit_map(to_unit(in[i])));
+    }
+
     double value(int i) const { return values_[i]; }
     double focal_length_cm() const { return builtin_[0]; }
     double pixel_aspect() const { return builtin_[5]; }
@@ -102,7 +117,7 @@ private:
     std::array<double, max_parameters> values_{};
     // focal length, filmback w and h, lens centre offset x and y, pixel aspect, focus distance.
     std::array<double, n_builtin> builtin_{1.0, 0.8, 0.6, 0.0, 0.0, 1.0, 100.0};
-    double r_fb_ = 0.5;
+    double r_fb_ = 0.5, inv_r_fb_ = 2.0, inv_w_ = 1.0 / 0.8, inv_h_ = 1.0 / 0.6;
     std::array<vec2d, table_columns * table_rows> table_{};
     std::atomic<bool> table_ready_{false};
     std::mutex table_lock_;

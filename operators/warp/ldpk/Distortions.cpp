@@ -8,8 +8,10 @@
 namespace Orvane::ldpk {
 
 namespace {
+// Workers on many rows update the counters of one model at once. Each store is made only when it changes the
+// value, so in the common case (the same count as before) the shared line is only read, not bounced between cores.
 void remember_rounds(std::atomic<int> &present, std::atomic<int> &largest, int rounds) {
-    present.store(rounds, std::memory_order_relaxed);
+    if (present.load(std::memory_order_relaxed) != rounds) present.store(rounds, std::memory_order_relaxed);
     int seen = largest.load(std::memory_order_relaxed);
     while (rounds > seen && !largest.compare_exchange_weak(seen, rounds, std::memory_order_relaxed)) {
     }
@@ -33,37 +35,17 @@ bool generic_distortion_base::map_inverse(vec2d q, vec2d &p) const {
         if (e < epsilon_) break;
     }
     for (int i = 0; i < post_iterations_; ++i) p = p + q - eval(p);
-    last_error_.store(e, std::memory_order_relaxed);
+    if (e >= epsilon_) last_error_.store(e, std::memory_order_relaxed);
     return e < epsilon_;
 }
 
 bool generic_distortion_base::map_inverse_newton(vec2d q, vec2d start, vec2d &p) const {
-    p = start;
-    double e = 0.0;
-    int rounds = 0;
-    while (rounds < newton_max_rounds) {
-        const vec2d d = q - eval(p);
-        e = d.norm();
-        p = p + jacobian(p).inverse() * d;
-        ++rounds;
-        if (e < newton_tolerance) break;
-    }
+    return newton_inverse(*this, q, start, p);
+}
+
+void generic_distortion_base::note_newton(int rounds, double residual) const {
     remember_rounds(n_iterations_, n_max_iterations_, rounds);
-    last_error_.store(e, std::memory_order_relaxed);
-    return e < newton_tolerance;
-}
-
-vec2d generic_radial_distortion::eval(vec2d p) const {
-    const double r2 = p.norm2();
-    const double k = 1.0 + r2 * (c_[0] + r2 * (c_[1] + r2 * (c_[2] + r2 * c_[3])));
-    return k * p;
-}
-
-mat2d generic_radial_distortion::jacobian(vec2d p) const {
-    const double r2 = p.norm2();
-    const double k = 1.0 + r2 * (c_[0] + r2 * (c_[1] + r2 * (c_[2] + r2 * c_[3])));
-    const double dk = 2.0 * (c_[0] + r2 * (2.0 * c_[1] + r2 * (3.0 * c_[2] + r2 * 4.0 * c_[3]))); // dK/dr2 x 2
-    return {k + dk * p.x * p.x, dk * p.x * p.y, dk * p.x * p.y, k + dk * p.y * p.y};
+    if (residual >= newton_tolerance) last_error_.store(residual, std::memory_order_relaxed);
 }
 
 bool generic_radial_distortion::derive(double *dg, int n_parameters, vec2d p) const {
@@ -78,25 +60,6 @@ bool generic_radial_distortion::derive(double *dg, int n_parameters, vec2d p) co
         dg[2 * i + 1] = rn * p.y;
     }
     return true;
-}
-
-vec2d radial_decentered_distortion::eval(vec2d p) const {
-    const auto &[c2, u1, v1, c4, u3, v3] = c_;
-    const double x = p.x, y = p.y, r2 = p.norm2();
-    const double k = 1.0 + r2 * (c2 + r2 * c4), a = u1 + u3 * r2, b = v1 + v3 * r2;
-    return {k * x + (r2 + 2 * x * x) * a + 2 * x * y * b, k * y + (r2 + 2 * y * y) * b + 2 * x * y * a};
-}
-
-mat2d radial_decentered_distortion::jacobian(vec2d p) const {
-    const auto &[c2, u1, v1, c4, u3, v3] = c_;
-    const double x = p.x, y = p.y, r2 = p.norm2();
-    const double k = 1.0 + r2 * (c2 + r2 * c4), kr = c2 + 2.0 * r2 * c4;
-    const double a = u1 + u3 * r2, b = v1 + v3 * r2;
-    const double px = r2 + 2 * x * x, py = r2 + 2 * y * y;
-    return {k + 2 * x * x * kr + 6 * x * a + 2 * x * px * u3 + 2 * y * b + 4 * x * x * y * v3,
-            2 * x * y * kr + 2 * y * a + 2 * y * px * u3 + 2 * x * b + 4 * x * y * y * v3,
-            2 * x * y * kr + 2 * x * b + 2 * x * py * v3 + 2 * y * a + 4 * x * x * y * u3,
-            k + 2 * y * y * kr + 6 * y * b + 2 * y * py * v3 + 2 * x * a + 4 * x * y * y * u3};
 }
 
 bool radial_decentered_distortion::derive(double *dg, int n_parameters, vec2d p) const {
@@ -143,12 +106,6 @@ mat2d classic_3de_mixed_distortion::jacobian(vec2d p) const {
             1 + d.cyx * x2 + 3 * d.cyy * y2 + d.cyxx * x2 * x2 + 3 * d.cyyx * x2 * y2 + 5 * d.cyyy * y2 * y2};
 }
 
-namespace {
-// Exponents of x and y of each anamorphic term, in coefficient order.
-constexpr int term_x[9] = {2, 0, 4, 2, 0, 6, 4, 2, 0};
-constexpr int term_y[9] = {0, 2, 0, 2, 4, 0, 2, 4, 6};
-} // namespace
-
 template <int Degree> void generic_anamorphic_distortion<Degree>::set_from_terms(const double *cx, const double *cy) {
     for (int axis = 0; axis < 2; ++axis) {
         const double *c = axis == 0 ? cx : cy;
@@ -165,34 +122,6 @@ template <int Degree> void generic_anamorphic_distortion<Degree>::set_from_terms
             a[8] = c[5] - c[6] + c[7] - c[8];
         }
     }
-}
-
-template <int Degree> vec2d generic_anamorphic_distortion<Degree>::eval(vec2d p) const {
-    double xp[7] = {1, p.x, 0, 0, 0, 0, 0}, yp[7] = {1, p.y, 0, 0, 0, 0, 0};
-    for (int i = 2; i <= Degree; ++i) xp[i] = xp[i - 1] * p.x, yp[i] = yp[i - 1] * p.y;
-    double px = 1.0, py = 1.0;
-    for (int k = 0; k < per_axis; ++k) {
-        const double m = xp[term_x[k]] * yp[term_y[k]];
-        px += this->c_[k] * m;
-        py += this->c_[per_axis + k] * m;
-    }
-    return {p.x * px, p.y * py};
-}
-
-template <int Degree> mat2d generic_anamorphic_distortion<Degree>::jacobian(vec2d p) const {
-    double xp[7] = {1, p.x, 0, 0, 0, 0, 0}, yp[7] = {1, p.y, 0, 0, 0, 0, 0};
-    for (int i = 2; i <= Degree; ++i) xp[i] = xp[i - 1] * p.x, yp[i] = yp[i - 1] * p.y;
-    // X = x P(x, y): dX/dx = P + x dP/dx = 1 + sum a (1 + i) x^i y^j, dX/dy = x dP/dy.
-    mat2d j{1.0, 0.0, 0.0, 1.0};
-    for (int k = 0; k < per_axis; ++k) {
-        const int ex = term_x[k], ey = term_y[k];
-        const double a = this->c_[k], b = this->c_[per_axis + k], m = xp[ex] * yp[ey];
-        j.m00 += a * (1 + ex) * m;
-        j.m11 += b * (1 + ey) * m;
-        if (ey > 0) j.m01 += a * ey * xp[ex + 1] * yp[ey - 1];
-        if (ex > 0) j.m10 += b * ex * xp[ex - 1] * yp[ey + 1];
-    }
-    return j;
 }
 
 template class generic_anamorphic_distortion<4>;

@@ -36,6 +36,8 @@ public:
     /// Newton's inverse of eval at q from `start`, with the analytic Jacobian.
     /// False when the residual did not get below the Newton tolerance.
     bool map_inverse_newton(vec2d q, vec2d start, vec2d &p) const;
+    /// Records one Newton inversion in the counters: its rounds and, when it did not converge, its residual.
+    void note_newton(int rounds, double residual) const;
 
     double epsilon() const { return epsilon_; }
     int max_iterations() const { return max_iterations_; }
@@ -43,10 +45,13 @@ public:
     /// Rounds of the last Newton inversion and the most seen since the last reset.
     int iterations() const { return n_iterations_.load(std::memory_order_relaxed); }
     int largest_iterations() const { return n_max_iterations_.load(std::memory_order_relaxed); }
+    /// The residual left by the last inversion that did not converge (0 until one fails). Converging calls
+    /// leave it alone, so the many calls of a frame write nothing shared.
     double last_error() const { return last_error_.load(std::memory_order_relaxed); }
     void reset_counters() const {
         n_iterations_.store(0, std::memory_order_relaxed);
         n_max_iterations_.store(0, std::memory_order_relaxed);
+        last_error_.store(0.0, std::memory_order_relaxed);
     }
 
     static constexpr int newton_max_rounds = 20;
@@ -56,10 +61,29 @@ private:
     double epsilon_ = 1e-6;
     int max_iterations_ = 20;
     int post_iterations_ = 2;
-    mutable std::atomic<int> n_iterations_{0};
+    // On a cache line of their own: the coefficients that every worker reads stay off the line they write.
+    alignas(64) mutable std::atomic<int> n_iterations_{0};
     mutable std::atomic<int> n_max_iterations_{0};
     mutable std::atomic<double> last_error_{0.0};
 };
+
+/// Newton's inverse of `poly`'s eval at q from `start`: each round adds J^-1 (q - f(p)) to p, and the rounds end
+/// once |q - f(p)| (taken before the step) is below the tolerance, or after newton_max_rounds. With Poly a final
+/// class the calls in the loop are bound at compile time and inlined.
+template <class Poly> bool newton_inverse(const Poly &poly, vec2d q, vec2d start, vec2d &p) {
+    p = start;
+    double e = 0.0;
+    int rounds = 0;
+    while (rounds < generic_distortion_base::newton_max_rounds) {
+        const vec2d d = q - poly.eval(p);
+        e = d.norm();
+        p = p + poly.jacobian(p).inverse() * d;
+        ++rounds;
+        if (e < generic_distortion_base::newton_tolerance) break;
+    }
+    poly.note_newton(rounds, e);
+    return e < generic_distortion_base::newton_tolerance;
+}
 
 /// Coefficients held in a fixed array, set by index.
 template <int N> class coefficient_distortion : public generic_distortion_base {
@@ -75,7 +99,7 @@ protected:
 };
 
 /// K = 1 + c2 r2 + c4 r2^2 + c6 r2^3 + c8 r2^4; (X, Y) = K (x, y). Coefficients c2, c4, c6, c8.
-class generic_radial_distortion : public coefficient_distortion<4> {
+class generic_radial_distortion final : public coefficient_distortion<4> {
 public:
     vec2d eval(vec2d p) const override;
     mat2d jacobian(vec2d p) const override;
@@ -83,7 +107,7 @@ public:
 };
 
 /// Radial degree 4 with decentering; coefficients c2, u1, v1, c4, u3, v3.
-class radial_decentered_distortion : public coefficient_distortion<6> {
+class radial_decentered_distortion final : public coefficient_distortion<6> {
 public:
     vec2d eval(vec2d p) const override;
     mat2d jacobian(vec2d p) const override;
@@ -93,7 +117,7 @@ public:
 /// The classic mixed model; parameters ld (distortion), sq (squeeze), cx, cy (curvature), qu (quartic).
 /// Its polynomial coefficients are derived from these by prepare(); every parameter change
 /// marks them stale, and a stale set is derived on the spot (without storing) when evaluated.
-class classic_3de_mixed_distortion : public coefficient_distortion<5> {
+class classic_3de_mixed_distortion final : public coefficient_distortion<5> {
 public:
     classic_3de_mixed_distortion() { c_[1] = 1.0; }
     void set_coeff(int i, double value) override;
@@ -115,7 +139,7 @@ private:
 /// X = x (1 + a20 x^2 + a02 y^2 + a40 x^4 + a22 x^2 y^2 + a04 y^4 [+ a60 x^6 + a42 x^4 y^2 + a24 x^2 y^4
 /// + a06 y^6]), Y the same with b. The coefficients are a20, a02, a40, a22, a04 (and a60, a42, a24, a06),
 /// then the b set in the same order; set_from_terms derives them from the Cx and Cy terms.
-template <int Degree> class generic_anamorphic_distortion : public coefficient_distortion<Degree == 4 ? 10 : 18> {
+template <int Degree> class generic_anamorphic_distortion final : public coefficient_distortion<Degree == 4 ? 10 : 18> {
     static_assert(Degree == 4 || Degree == 6);
 
 public:
@@ -125,6 +149,73 @@ public:
     vec2d eval(vec2d p) const override;
     mat2d jacobian(vec2d p) const override;
 };
+
+// The polynomials' evaluations run for every pixel and every Newton round: they are inline.
+inline vec2d generic_radial_distortion::eval(vec2d p) const {
+    const double r2 = p.norm2();
+    const double k = 1.0 + r2 * (c_[0] + r2 * (c_[1] + r2 * (c_[2] + r2 * c_[3])));
+    return k * p;
+}
+
+inline mat2d generic_radial_distortion::jacobian(vec2d p) const {
+    const double r2 = p.norm2();
+    const double k = 1.0 + r2 * (c_[0] + r2 * (c_[1] + r2 * (c_[2] + r2 * c_[3])));
+    const double dk = 2.0 * (c_[0] + r2 * (2.0 * c_[1] + r2 * (3.0 * c_[2] + r2 * 4.0 * c_[3]))); // dK/dr2 x 2
+    return {k + dk * p.x * p.x, dk * p.x * p.y, dk * p.x * p.y, k + dk * p.y * p.y};
+}
+
+inline vec2d radial_decentered_distortion::eval(vec2d p) const {
+    const auto &[c2, u1, v1, c4, u3, v3] = c_;
+    const double x = p.x, y = p.y, r2 = p.norm2();
+    const double k = 1.0 + r2 * (c2 + r2 * c4), a = u1 + u3 * r2, b = v1 + v3 * r2;
+    return {k * x + (r2 + 2 * x * x) * a + 2 * x * y * b, k * y + (r2 + 2 * y * y) * b + 2 * x * y * a};
+}
+
+inline mat2d radial_decentered_distortion::jacobian(vec2d p) const {
+    const auto &[c2, u1, v1, c4, u3, v3] = c_;
+    const double x = p.x, y = p.y, r2 = p.norm2();
+    const double k = 1.0 + r2 * (c2 + r2 * c4), kr = c2 + 2.0 * r2 * c4;
+    const double a = u1 + u3 * r2, b = v1 + v3 * r2;
+    const double px = r2 + 2 * x * x, py = r2 + 2 * y * y;
+    return {k + 2 * x * x * kr + 6 * x * a + 2 * x * px * u3 + 2 * y * b + 4 * x * x * y * v3,
+            2 * x * y * kr + 2 * y * a + 2 * y * px * u3 + 2 * x * b + 4 * x * y * y * v3,
+            2 * x * y * kr + 2 * x * b + 2 * x * py * v3 + 2 * y * a + 4 * x * x * y * u3,
+            k + 2 * y * y * kr + 6 * y * b + 2 * y * py * v3 + 2 * x * a + 4 * x * y * y * u3};
+}
+
+namespace detail {
+// Exponents of x and y of each anamorphic term, in coefficient order.
+constexpr int term_x[9] = {2, 0, 4, 2, 0, 6, 4, 2, 0};
+constexpr int term_y[9] = {0, 2, 0, 2, 4, 0, 2, 4, 6};
+} // namespace detail
+
+template <int Degree> inline vec2d generic_anamorphic_distortion<Degree>::eval(vec2d p) const {
+    double xp[7] = {1, p.x, 0, 0, 0, 0, 0}, yp[7] = {1, p.y, 0, 0, 0, 0, 0};
+    for (int i = 2; i <= Degree; ++i) xp[i] = xp[i - 1] * p.x, yp[i] = yp[i - 1] * p.y;
+    double px = 1.0, py = 1.0;
+    for (int k = 0; k < per_axis; ++k) {
+        const double m = xp[detail::term_x[k]] * yp[detail::term_y[k]];
+        px += this->c_[k] * m;
+        py += this->c_[per_axis + k] * m;
+    }
+    return {p.x * px, p.y * py};
+}
+
+template <int Degree> inline mat2d generic_anamorphic_distortion<Degree>::jacobian(vec2d p) const {
+    double xp[7] = {1, p.x, 0, 0, 0, 0, 0}, yp[7] = {1, p.y, 0, 0, 0, 0, 0};
+    for (int i = 2; i <= Degree; ++i) xp[i] = xp[i - 1] * p.x, yp[i] = yp[i - 1] * p.y;
+    // X = x P(x, y): dX/dx = P + x dP/dx = 1 + sum a (1 + i) x^i y^j, dX/dy = x dP/dy.
+    mat2d j{1.0, 0.0, 0.0, 1.0};
+    for (int k = 0; k < per_axis; ++k) {
+        const int ex = detail::term_x[k], ey = detail::term_y[k];
+        const double a = this->c_[k], b = this->c_[per_axis + k], m = xp[ex] * yp[ey];
+        j.m00 += a * (1 + ex) * m;
+        j.m11 += b * (1 + ey) * m;
+        if (ey > 0) j.m01 += a * ey * xp[ex + 1] * yp[ey - 1];
+        if (ex > 0) j.m10 += b * ex * xp[ex - 1] * yp[ey + 1];
+    }
+    return j;
+}
 
 extern template class generic_anamorphic_distortion<4>;
 extern template class generic_anamorphic_distortion<6>;

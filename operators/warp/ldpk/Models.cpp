@@ -88,7 +88,7 @@ vec2d tde4_ldp_anamorphic_deg_4_rotate_squeeze_xy::undistort_unit(vec2d p) const
 
 bool tde4_ldp_anamorphic_deg_4_rotate_squeeze_xy::distort_unit(vec2d q, vec2d start, vec2d &p) const {
     vec2d inner;
-    const bool ok = poly_.map_inverse_newton(e1_.eval_inv(q), e2_.eval_inv(start), inner);
+    const bool ok = newton_inverse(poly_, e1_.eval_inv(q), e2_.eval_inv(start), inner);
     p = e2_.eval(inner);
     return ok;
 }
@@ -133,7 +133,7 @@ vec2d tde4_ldp_radial_decentered_deg_4_cylindric::undistort_unit(vec2d p) const 
 }
 
 bool tde4_ldp_radial_decentered_deg_4_cylindric::distort_unit(vec2d q, vec2d start, vec2d &p) const {
-    return poly_.map_inverse_newton(cylindric_.eval_inv(q), start, p);
+    return newton_inverse(poly_, cylindric_.eval_inv(q), start, p);
 }
 
 bool tde4_ldp_radial_decentered_deg_4_cylindric::jacobian_unit(vec2d p, mat2d &j) const {
@@ -167,7 +167,7 @@ vec2d tde4_ldp_radial_deg_8::undistort_unit(vec2d p) const {
 
 bool tde4_ldp_radial_deg_8::distort_unit(vec2d q, vec2d start, vec2d &p) const {
     vec2d inner;
-    const bool ok = poly_.map_inverse_newton(q, ldpk::fisheye_to_perspective(start, f_unit_), inner);
+    const bool ok = newton_inverse(poly_, q, ldpk::fisheye_to_perspective(start, f_unit_), inner);
     p = ldpk::perspective_to_fisheye(inner, f_unit_);
     return ok;
 }

@@ -19,11 +19,15 @@ template <class Polynomial> class polynomial_model : public ldp_builtin {
 public:
     const generic_distortion_base &distortion() const override { return poly_; }
     const Polynomial &polynomial() const { return poly_; }
+    // A model that overrides undistort_unit overrides this too, with its own chain.
+    void undistort_span(const vec2d *in, vec2d *out, int n) const override {
+        direct_span([this](vec2d p) { return poly_.eval(p); }, in, out, n);
+    }
 
 protected:
     using ldp_builtin::ldp_builtin;
     vec2d undistort_unit(vec2d p) const override { return poly_.eval(p); }
-    bool distort_unit(vec2d q, vec2d start, vec2d &p) const override { return poly_.map_inverse_newton(q, start, p); }
+    bool distort_unit(vec2d q, vec2d start, vec2d &p) const override { return newton_inverse(poly_, q, start, p); }
     bool jacobian_unit(vec2d p, mat2d &j) const override {
         j = poly_.jacobian(p);
         return true;
@@ -40,6 +44,11 @@ public:
     /// The chain's linear parts: undistort is e1 (polynomial (e2^-1 p)).
     const ldpk::linear_extender &e1() const { return e1_; }
     const ldpk::linear_extender &e2() const { return e2_; }
+
+    void undistort_span(const ldpk::vec2d *in, ldpk::vec2d *out, int n) const override {
+        direct_span([this](ldpk::vec2d p) { return tde4_ldp_anamorphic_deg_4_rotate_squeeze_xy::undistort_unit(p); },
+                    in, out, n);
+    }
 
 protected:
     void prepare() override;
@@ -76,6 +85,11 @@ public:
     /// The extender after the polynomial: undistort is cylindric (polynomial (p)).
     const ldpk::cylindric_extender_2 &cylindric() const { return cylindric_; }
 
+    void undistort_span(const ldpk::vec2d *in, ldpk::vec2d *out, int n) const override {
+        direct_span([this](ldpk::vec2d p) { return tde4_ldp_radial_decentered_deg_4_cylindric::undistort_unit(p); }, in,
+                    out, n);
+    }
+
 protected:
     void prepare() override;
     ldpk::vec2d undistort_unit(ldpk::vec2d p) const override;
@@ -92,6 +106,10 @@ class tde4_ldp_radial_deg_8 : public ldpk::polynomial_model<ldpk::generic_radial
 public:
     tde4_ldp_radial_deg_8();
     static constexpr double result_radius_limit = 50.0;
+
+    void undistort_span(const ldpk::vec2d *in, ldpk::vec2d *out, int n) const override {
+        direct_span([this](ldpk::vec2d p) { return tde4_ldp_radial_deg_8::undistort_unit(p); }, in, out, n);
+    }
 
 protected:
     tde4_ldp_radial_deg_8(const char *name, bool cut_result);
