@@ -20,6 +20,10 @@
 //     the image (as the engine keeps it for the next device tool), so the
 //     input already lives on the device: kernel, download and the output's
 //     memory only. Device arguments only.
+//   LensDistort_Distort        Distort with the anamorphic degree 4 model
+//                              (squeezed and rotated), 1 x 1 bilinear: the
+//                              rows, or the "LensDistort" kernel; the frame
+//                              uploaded each time as above.
 //   Background_FourCorner      Four Corner mode, four different corners.
 //   Background_Gradient3x3     Linear gradient with the 3x3 sub-pixel grid.
 //     A generator has no input to upload: on a device the iteration pays the
@@ -172,6 +176,33 @@ BENCHMARK(BM_DeviceBrightnessContrast_MatrixResident)
 void SetInput(Operator *op, const char *id, Ref<Parameter> value) {
     if (Input *in = op->FindInput(id)) in->SetValue(std::move(value));
 }
+
+void BM_DeviceLensDistort_Distort(benchmark::State &state) {
+    if (!LoadLibrary(state)) return;
+    RenderTask task;
+    if (!ChooseDevice(state, task)) return;
+    OrvaneDoc doc;
+    Output *source = AddFrameSource(doc);
+    Operator *lens = doc.AddTool(OvID("LensDistort"));
+    if (!source || !lens) {
+        state.SkipWithError("cannot make the tools");
+        return;
+    }
+    lens->FindInput("Input")->ConnectTo(source);
+    SetInput(lens, "Mode", MakeRef<Number>(0));
+    SetInput(lens, "Model", MakeRef<IDValue>(OvID("DE4AnamorphicStandardDegree4")));
+    const std::pair<const char *, double> values[] = {
+        {"Cx02Degree2", -0.05}, {"Cy02Degree2", -0.03}, {"Cx22Degree2", 0.01}, {"Cx04Degree4", 0.006},
+        {"Cy04Degree4", 0.004}, {"LensRotation", 0.5},  {"SqueezeX", 1.02}};
+    for (const auto &[id, v] : values)
+        SetInput(lens, ("DE4AnamorphicStandardDegree4." + std::string(id)).c_str(), MakeRef<Number>(v));
+    DeviceLoop(state, lens, task, true);
+}
+BENCHMARK(BM_DeviceLensDistort_Distort)
+    ->ArgName("device")
+    ->DenseRange(0, 2)
+    ->UseRealTime()
+    ->Unit(benchmark::kMillisecond);
 
 /// A UHD float32 Background set up by `setUp`, rendered per iteration.
 template <class SetUp> void RunBackground(benchmark::State &state, SetUp setUp) {

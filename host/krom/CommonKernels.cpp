@@ -6,6 +6,7 @@
 #include "host/krom/kernels/GeneratorKernelParams.h"
 #include "host/krom/kernels/KernelTexts.h"
 #include "host/krom/kernels/KeyKernelParams.h"
+#include "host/krom/kernels/LensDistortKernelParams.h"
 #include "host/krom/kernels/MaskKernelParams.h"
 #include "host/krom/kernels/MergeKernelParams.h"
 #include "host/krom/kernels/ResizeKernelParams.h"
@@ -48,6 +49,7 @@ const std::vector<CommonKernel> &CommonKernels() {
         {"ChromaKeyer", ChromaKeyerParamsText, kChromaKeyerKernel},
         {"LumaKey", LumaKeyParamsText, kLumaKeyKernel},
         {"DifferenceKeyer", DifferenceKeyerParamsText, kDifferenceKeyerKernel},
+        {"LensDistort", LensDistortParamsText, kLensDistortKernel},
         {"ResizeAcross", ResizeParamsText, kResizeKernels},
         {"ResizeDown", ResizeParamsText, kResizeKernels},
         {"UltraKeyer", UltraKeyerParamsText, kUltraKeyerKernel},

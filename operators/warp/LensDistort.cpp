@@ -18,6 +18,7 @@
 #include "host/image/PixelConvert.h"
 #include "operators/frame/IdChoices.h"
 #include "operators/frame/Registration.h"
+#include "operators/warp/LensDistortDevice.h"
 #include "operators/warp/LensFiles.h"
 #include "operators/warp/SizingCommon.h"
 #include "operators/warp/ldpk/LdpkTypes.h"
@@ -38,7 +39,8 @@ static ClassRegistration<LensDistort, ThreadedOperator> s_Registration(CLSID_Len
                                                                         {RegNoObjectMaterialControls, 1},
                                                                         {RegNoMotionBlurControls, 1},
                                                                         {RegSupportsRoI, 1},
-                                                                        {RegSupportsDoD, 1}});
+                                                                        {RegSupportsDoD, 1},
+                                                                        {RegSupportsGPUImages, 1}});
 
 namespace {
 
@@ -458,6 +460,11 @@ void LensDistort::Process(Request *req) {
         return;
     }
     if (!precalc && !window.IsNull()) {
+        if (s.width >= 3 && s.mode == 0 && lensdistort::DeviceTakes(*s.model) && IsGPUEnabled(req, true) &&
+            lensdistort::DistortOnDevice(req, s, *src, *dst)) {
+            req->SetOutputData(output_, dst.Get());
+            return;
+        }
         if (!dst->AllocScanLineData() || !src->DownloadGPUMem()) {
             FailOutOfMemory(req);
             req->SetOutputData(output_, nullptr);

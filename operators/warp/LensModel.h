@@ -102,6 +102,11 @@ public:
     bool MapInverse(double x, double y, double startX, double startY, double &ox, double &oy) const override;
     void MapDirectRow(const double *x, double y, int n, double *ox, double *oy, bool *ok) const override;
     ldpk::ldp_builtin &Plugin() const { return *plugin_; }
+    /// The normalisation of the last Update: x_n = 0.5 + (x - CentreX()) ToNormX(), the same for y.
+    double ToNormX() const { return toNormX_; }
+    double ToNormY() const { return toNormY_; }
+    double CentreX() const { return centreX_; }
+    double CentreY() const { return centreY_; }
 
 private:
     std::unique_ptr<ldpk::ldp_builtin> plugin_;

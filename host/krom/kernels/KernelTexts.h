@@ -33,6 +33,8 @@ extern const char kChromaKeyerKernel[];
 extern const char kLumaKeyKernel[];
 /// "DifferenceKeyer".
 extern const char kDifferenceKeyerKernel[];
+/// "LensDistort".
+extern const char kLensDistortKernel[];
 /// "ResizeAcross" and "ResizeDown".
 extern const char kResizeKernels[];
 /// "UltraKeyer", "UltraKeyerSoft", "UltraKeyerCombine", "UltraKeyerSubtract".

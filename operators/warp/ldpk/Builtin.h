@@ -78,6 +78,11 @@ public:
                 (r_fb_ * u.y + builtin_[2] * 0.5 + builtin_[4]) * inv_h_};
     }
     double r_fb() const { return r_fb_; }
+    /// The built-in values the unit coordinates depend on (cm).
+    double filmback_width() const { return builtin_[1]; }
+    double filmback_height() const { return builtin_[2]; }
+    double lens_centre_offset_x() const { return builtin_[3]; }
+    double lens_centre_offset_y() const { return builtin_[4]; }
     /// The distortion object that the inverse iterates on (its counters are the model's).
     virtual const generic_distortion_base &distortion() const = 0;
     /// The start-value table, built if needed: cell (c, r) at c + r x table_columns.

@@ -18,6 +18,7 @@ namespace ldpk {
 template <class Polynomial> class polynomial_model : public ldp_builtin {
 public:
     const generic_distortion_base &distortion() const override { return poly_; }
+    const Polynomial &polynomial() const { return poly_; }
     // A model that overrides undistort_unit overrides this too, with its own chain.
     void undistort_span(const vec2d *in, vec2d *out, int n) const override {
         direct_span([this](vec2d p) { return poly_.eval(p); }, in, out, n);
@@ -40,6 +41,9 @@ class tde4_ldp_anamorphic_deg_4_rotate_squeeze_xy
 public:
     tde4_ldp_anamorphic_deg_4_rotate_squeeze_xy();
     bool initializeParameters() override;
+    /// The chain's linear parts: undistort is e1 (polynomial (e2^-1 p)).
+    const ldpk::linear_extender &e1() const { return e1_; }
+    const ldpk::linear_extender &e2() const { return e2_; }
 
     void undistort_span(const ldpk::vec2d *in, ldpk::vec2d *out, int n) const override {
         direct_span([this](ldpk::vec2d p) { return tde4_ldp_anamorphic_deg_4_rotate_squeeze_xy::undistort_unit(p); },
@@ -78,6 +82,8 @@ protected:
 class tde4_ldp_radial_decentered_deg_4_cylindric : public ldpk::polynomial_model<ldpk::radial_decentered_distortion> {
 public:
     tde4_ldp_radial_decentered_deg_4_cylindric();
+    /// The extender after the polynomial: undistort is cylindric (polynomial (p)).
+    const ldpk::cylindric_extender_2 &cylindric() const { return cylindric_; }
 
     void undistort_span(const ldpk::vec2d *in, ldpk::vec2d *out, int n) const override {
         direct_span([this](ldpk::vec2d p) { return tde4_ldp_radial_decentered_deg_4_cylindric::undistort_unit(p); }, in,
