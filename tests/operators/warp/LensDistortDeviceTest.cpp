@@ -135,11 +135,14 @@ TEST_F(LensDevice, DistortMatchesTheRows) {
                         changed += d > 1e-5 + quantum;
                         moved = std::max({moved, std::fabs(double(r.R)), std::fabs(double(r.G))});
                     }
-                if (v.bilinear)
+                if (v.bilinear) {
                     EXPECT_LE(worst, tol);
-                else
+                } else {
                     EXPECT_LE(changed, dw.Width() * dw.Height() / 100) << "pixels off by a step";
-                if (v.map) EXPECT_GT(moved, 1.0) << "the lens moves pixels";
+                }
+                if (v.map) {
+                    EXPECT_GT(moved, 1.0) << "the lens moves pixels";
+                }
             }
     }
 }
