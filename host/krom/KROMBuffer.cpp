@@ -51,11 +51,17 @@ bool KROMBuffer::MakeImage(IDeviceContext *ctx, int width, int height, int depth
 std::unique_ptr<KROMBuffer> KROMBuffer::CreateImage(IDeviceContext *ctx, const Image *img, unsigned flags) {
     std::unique_ptr<KROMBuffer> buf(new KROMBuffer);
     buf->context_ = ctx;
-    if (!ctx || !img) {
-        buf->error_ = "no device or no image";
+    if (!img) {
+        buf->error_ = "no image";
         return buf;
     }
     const ImgRectI dw = img->DataWindow();
+    if (!ctx) {
+        buf->host_ = img;
+        buf->width_ = dw.Width();
+        buf->height_ = dw.Height();
+        return buf;
+    }
     if (flags & KROMBufferWrite) {
         if (!buf->MakeImage(ctx, dw.Width(), dw.Height(), img->Depth(), flags)) buf->memory_.reset();
         return buf;

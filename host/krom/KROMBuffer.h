@@ -10,6 +10,10 @@
 // image of img's data window and depth; the caller hands it to the image
 // (SetGPUMem, dirty) once the kernel has run.
 //
+// With a null context (a kernel served by a provider on the CPU,
+// KernelProvider.h) CreateImage(nullptr, img, flags) wraps the image itself:
+// HostImage() gives it, and the provider reads or fills its rows.
+//
 // A device image's GPUMemory holds a share lock (read or write) for the
 // buffer's life. Creation never fails outright: a buffer that could not be
 // made says so through IsValid and Error.
@@ -51,7 +55,9 @@ public:
     /// Copies `size` bytes into the buffer (for images: the pixels).
     bool Upload(const void *data, size_t size);
 
-    bool IsValid() const { return memory_ != nullptr; }
+    bool IsValid() const { return memory_ != nullptr || host_ != nullptr; }
+    /// The image a host buffer wraps (null for device memory).
+    const Image *HostImage() const { return host_; }
     const std::string &Error() const { return error_; }
     bool IsImage() const { return gpu_.Get() != nullptr; }
     /// The component order (KROMDialect.h) of a device image; 0 for a buffer.
@@ -69,6 +75,7 @@ private:
     bool Lock(unsigned flags);
 
     IDeviceContext *context_ = nullptr;
+    const Image *host_ = nullptr;
     std::shared_ptr<IDeviceMemory> memory_;
     Ref<GPUMemory> gpu_;
     bool locked_ = false;

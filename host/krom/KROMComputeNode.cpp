@@ -1,11 +1,14 @@
 #include "host/krom/KROMComputeNode.h"
 
+#include <algorithm>
+
 #include "host/flow/RenderTask.h"
 #include "host/flow/Request.h"
 #include "host/image/Image.h"
 #include "host/krom/CommonKernels.h"
 #include "host/krom/GPUMemory.h"
 #include "host/krom/KROMBuffer.h"
+#include "host/krom/KernelProvider.h"
 
 namespace Orvane {
 
@@ -17,6 +20,8 @@ std::unique_ptr<KROMComputeNode> KROMComputeNode::Create(IDeviceContext *ctx, co
     node->paramText_ = paramStructText ? paramStructText : "";
     node->common_ = source == nullptr;
     if (source) node->source_ = source;
+    node->provider_ = FindKernelProvider(node->name_);
+    if (node->provider_) return node; // served by code: no context or text needed
     if (!ctx)
         node->error_ = "no device";
     else if (node->name_.empty())
@@ -63,7 +68,28 @@ void KROMComputeNode::AddKernelOption(const char *name, const ScriptVal &value) 
     }
 }
 
+bool KROMComputeNode::RunProvider() {
+    ProviderCall call;
+    call.kernel = name_;
+    call.block = block_.get();
+    call.blockSize = blockSize_;
+    call.floatLists = floatLists_;
+    call.abort = abort_;
+    for (const auto &[name, buf] : images_) {
+        if (!buf || !buf->HostImage()) {
+            error_ = "kernel " + name_ + ": \"" + name + "\" is not an image in main memory";
+            return false;
+        }
+        if (std::find(outputs_.begin(), outputs_.end(), name) != outputs_.end())
+            call.outputs[name] = const_cast<Image *>(buf->HostImage());
+        else
+            call.inputs[name] = buf->HostImage();
+    }
+    return provider_->Run(call, error_);
+}
+
 bool KROMComputeNode::RunSession() {
+    if (provider_) return RunProvider();
     if (!IsValid()) return false;
     auto fail = [this](std::string why) {
         error_ = std::move(why);

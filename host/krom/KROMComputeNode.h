@@ -21,9 +21,14 @@
 // the component orders at the given offsets of the block, and gives the
 // output image its device memory.
 //
+// A kernel with a registered provider (KernelProvider.h) needs no context
+// and no text: RunSession hands the block, the images of host buffers and
+// the float lists to the provider.
+//
 // Ownership: the caller owns the node; the block is shared, so that it lives
 // as long as a queued run needs it.
 // Thread safety: a node belongs to one thread.
+#include <atomic>
 #include <cstring>
 #include <map>
 #include <memory>
@@ -40,6 +45,7 @@ namespace Orvane {
 
 class Image;
 class KROMBuffer;
+class KernelProvider;
 class Request;
 
 /// The kernel option that names a kernel of the common library.
@@ -63,9 +69,13 @@ public:
         std::memcpy(bytes.data(), &value, sizeof(T));
         scalars_[name] = std::move(bytes);
     }
+    /// A list of floats (a provider kernel's argument, such as stroke points).
+    void SetParam(const char *name, std::vector<float> values) { floatLists_[name] = std::move(values); }
+    /// The flag a provider kernel watches to stop early.
+    void SetAbortFlag(const std::atomic<bool> *abort) { abort_ = abort; }
     void AddKernelOption(const char *name, const ScriptVal &value);
 
-    bool IsValid() const { return context_ != nullptr && error_.empty(); }
+    bool IsValid() const { return (context_ != nullptr || provider_ != nullptr) && error_.empty(); }
     /// Compiles (once per context) and runs the kernel over the first
     /// output's size; false with Error() set when anything fails.
     bool RunSession();
@@ -96,6 +106,10 @@ private:
     std::vector<std::string> outputs_;
     std::map<std::string, DeviceSampler> samplers_;
     std::map<std::string, std::vector<uint8_t>> scalars_;
+    std::map<std::string, std::vector<float>> floatLists_;
+    std::shared_ptr<KernelProvider> provider_;
+    const std::atomic<bool> *abort_ = nullptr;
+    bool RunProvider();
 };
 
 } // namespace Orvane
