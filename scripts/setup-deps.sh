@@ -16,6 +16,8 @@ packages=("$@")
   # The device path: OpenCL headers and loader, and PoCL, which runs OpenCL
   # kernels on the CPU so that every machine exercises the device path.
   ocl-icd-opencl-dev opencl-headers pocl-opencl-icd
+  # Object mattes from strokes: segmentation (GrabCut) and dense optical flow (DIS).
+  libopencv-dev
   clang-format
   # The fuzz harnesses and the clang preset (libFuzzer and the sanitizers come with it).
   clang

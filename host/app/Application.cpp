@@ -7,12 +7,15 @@
 #include "host/core/Registry.h"
 #include "host/core/Tags.h"
 #include "host/flow/Parameter.h"
+#include "host/segment/BuiltinProviders.h"
 
 namespace Orvane {
 
 Application::Application() {
     // Both fast row paths are on by default; tests switch them to compare.
     SetAttrsTagList({{AppFastPower, 1}, {AppVectorRows, 1}});
+    // The host's own kernel providers come first, so providers registered later take over while available.
+    RegisterBuiltinProviders();
 }
 
 Application *GetApp() {
