@@ -209,27 +209,83 @@ cv::Mat GuidedFilter(const cv::Mat &guide, const cv::Mat &p, int r) {
     return mean(a).mul(guide) + mean(b);
 }
 
-/// The soft matte at full size: the working-size foreground scaled up, then guided by the frame's grey levels
-/// within a margin of the object's bounding box (elsewhere the matte is 0).
+/// The frame's 8-bit colours back in linear light (the scale edges mix colours on), as float BGR.
+cv::Mat DecodeLinear(const cv::Mat &bgr) {
+    static const cv::Mat table = [] {
+        cv::Mat t(1, 256, CV_32F);
+        for (int i = 0; i < 256; ++i) t.at<float>(i) = static_cast<float>(std::pow(i / 255.0, 2.2));
+        return t;
+    }();
+    cv::Mat linear;
+    cv::LUT(bgr, table, linear);
+    return linear;
+}
+
+/// The soft matte at full size. The working-size foreground is scaled up and cut at one half; in a band of
+/// `radius` pixels either side of that edge each pixel's colour C is taken as a mix of the nearby object colour F
+/// (the mean over the band's inner side within a few radii) and background colour B (the same outside):
+/// alpha = (C - B).(F - B) / |F - B|^2, which puts a soft edge, motion blur or a ramp where the picture has it.
+/// Where F and B are too alike to tell apart the scaled-up foreground stands. A guided filter by the frame's grey
+/// levels then smooths the texture's noise out of the band. Work is limited to the object's box and a margin;
+/// elsewhere the matte is 0.
 cv::Mat RefineEdge(const cv::Mat &foreground, const cv::Mat &bgr, double scale) {
     cv::Mat matte = cv::Mat::zeros(bgr.size(), CV_32F);
     if (cv::countNonZero(foreground) == 0) return matte;
-    cv::Mat upscaled;
-    foreground.convertTo(upscaled, CV_32F);
-    if (foreground.size() != bgr.size()) cv::resize(upscaled, upscaled, bgr.size(), 0, 0, cv::INTER_LINEAR);
-    // The radius spans the upscale's blur (1/scale pixels) and a little more, so the edge settles on the picture's.
-    const int radius = std::max(2, static_cast<int>(std::lround(1.5 / scale)));
+    // The band covers the segmentation's uncertainty at working size (a few of its pixels), at full size.
+    const int radius = std::max(3, static_cast<int>(std::lround(3 / scale)));
+    const int smoothRadius = std::max(1, static_cast<int>(std::lround(1 / scale)));
     cv::Rect box = cv::boundingRect(foreground);
     box = cv::Rect(
         cv::Point(static_cast<int>(box.x / scale), static_cast<int>(box.y / scale)),
         cv::Point(static_cast<int>(std::ceil(box.br().x / scale)), static_cast<int>(std::ceil(box.br().y / scale))));
-    const int margin = 2 * radius + 2;
+    const int margin = 4 * radius + 2;
     box = cv::Rect(box.x - margin, box.y - margin, box.width + 2 * margin, box.height + 2 * margin) &
           cv::Rect(0, 0, bgr.cols, bgr.rows);
+
+    cv::Mat soft;
+    foreground.convertTo(soft, CV_32F);
+    if (foreground.size() != bgr.size()) cv::resize(soft, soft, bgr.size(), 0, 0, cv::INTER_LINEAR);
+    soft = soft(box).clone();
+    const cv::Mat hard = soft >= 0.5f;
+    const cv::Mat kernel = cv::getStructuringElement(cv::MORPH_ELLIPSE, cv::Size(2 * radius + 1, 2 * radius + 1));
+    cv::Mat inner, outer;
+    cv::erode(hard, inner, kernel);
+    cv::dilate(hard, outer, kernel);
+    cv::Mat innerF, outsideF;
+    inner.convertTo(innerF, CV_32F, 1 / 255.0);
+    outer.convertTo(outsideF, CV_32F, -1 / 255.0, 1.0);
+
+    // Local means of the object's and the background's colours, from the sure sides of the band.
+    const cv::Mat colour = DecodeLinear(bgr(box));
+    const cv::Size window(6 * radius + 1, 6 * radius + 1);
+    auto localMean = [&](const cv::Mat &weight, cv::Mat &mean, cv::Mat &count) {
+        cv::Mat weighted, w3;
+        cv::merge(std::vector<cv::Mat>{weight, weight, weight}, w3);
+        cv::multiply(colour, w3, weighted);
+        cv::boxFilter(weighted, mean, CV_32F, window, cv::Point(-1, -1), false);
+        cv::boxFilter(weight, count, CV_32F, window, cv::Point(-1, -1), false);
+    };
+    cv::Mat fSum, fCount, bSum, bCount;
+    localMean(innerF, fSum, fCount);
+    localMean(outsideF, bSum, bCount);
+    constexpr float minSeparation = 0.02f * 0.02f; // squared linear distance below which F and B are "alike"
+    cv::Mat alpha = soft.clone();
+    for (int r = 0; r < alpha.rows; ++r) {
+        const uint8_t *in = inner.ptr<uint8_t>(r), *out = outer.ptr<uint8_t>(r);
+        const cv::Vec3f *c = colour.ptr<cv::Vec3f>(r), *fs = fSum.ptr<cv::Vec3f>(r), *bs = bSum.ptr<cv::Vec3f>(r);
+        const float *fn = fCount.ptr<float>(r), *bn = bCount.ptr<float>(r);
+        float *a = alpha.ptr<float>(r);
+        for (int x = 0; x < alpha.cols; ++x) {
+            if (in[x] || !out[x] || fn[x] < 1 || bn[x] < 1) continue;
+            const cv::Vec3f f = fs[x] / fn[x], b = bs[x] / bn[x], fb = f - b;
+            const float separation = fb.dot(fb);
+            if (separation >= minSeparation) a[x] = std::clamp((c[x] - b).dot(fb) / separation, 0.f, 1.f);
+        }
+    }
     cv::Mat grey;
     cv::cvtColor(bgr(box), grey, cv::COLOR_BGR2GRAY);
     grey.convertTo(grey, CV_32F, 1 / 255.0);
-    cv::Mat refined = GuidedFilter(grey, upscaled(box), radius);
+    cv::Mat refined = GuidedFilter(grey, alpha, smoothRadius);
     cv::min(cv::max(refined, 0.f), 1.f, matte(box));
     return matte;
 }

@@ -9,6 +9,9 @@
 #include "host/core/Tags.h"
 #include "host/image/NewImage.h"
 #include "host/image/PixelConvert.h"
+#include "host/krom/KROMBuffer.h"
+#include "host/krom/KROMComputeNode.h"
+#include "host/krom/KernelProvider.h"
 
 namespace Orvane::Test {
 namespace {
@@ -135,6 +138,41 @@ double BlobIoU(const Image &matte, int width, int height, int frame) {
             either += truth || found;
         }
     return either == 0 ? 1.0 : static_cast<double>(both) / either;
+}
+
+ObjectMaskRun RunObjectMask(const Image &frame, const Image *carried, std::shared_ptr<const void> block,
+                            size_t blockSize, const std::vector<float> &pos, const std::vector<float> &neg,
+                            const ImgRectI *outWindow) {
+    ObjectMaskRun r;
+    auto make = [&frame](const ImgRectI &window, int depth) {
+        Ref<Image> img = NewImageTagList(
+            {{ImgWidth, frame.Width()}, {ImgHeight, frame.Height()}, {ImgDepth, depth}, {ImgDataWindow, &window}});
+        img->AllocScanLineData();
+        return img;
+    };
+    const ImgRectI window = outWindow ? *outWindow : frame.DataWindow();
+    r.matte = make(window, DepthRGBAFlt32);
+    r.carry = make(window, DepthAFlt32);
+    Ref<Image> dummy = make(ImgRectI(0, 0, 1, 1), DepthAFlt32);
+    auto node = KROMComputeNode::Create(nullptr, "GetObjectMask", nullptr, OrvaneSemanticSegmentationParamsText, false);
+    if (!node->IsValid()) {
+        r.error = node->Error();
+        return r;
+    }
+    auto src = KROMBuffer::CreateImage(nullptr, const_cast<Image *>(&frame), KROMBufferRead);
+    auto in = KROMBuffer::CreateImage(nullptr, const_cast<Image *>(carried ? carried : dummy.Get()), KROMBufferRead);
+    auto dst = KROMBuffer::CreateImage(nullptr, r.matte.Get(), KROMBufferWrite);
+    auto out = KROMBuffer::CreateImage(nullptr, r.carry.Get(), KROMBufferWrite);
+    node->SetParamStruct(std::move(block), blockSize);
+    node->AddInput("src", src.get());
+    node->AddInput("cachePropMaskIn", in.get());
+    node->SetParam("posStroke", pos);
+    node->SetParam("negStroke", neg);
+    node->AddOutput("cachePropMaskOut", out.get());
+    node->AddOutput("dst", dst.get());
+    r.ok = node->RunSession();
+    r.error = node->Error();
+    return r;
 }
 
 } // namespace Orvane::Test

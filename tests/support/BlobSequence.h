@@ -13,6 +13,8 @@
 // the ellipse inside the frame. Colours are linear, alpha 1 (premultiplied trivially) unless `alpha` scales them.
 //
 // Thread safety: the functions share no state.
+#include <memory>
+#include <string>
 #include <vector>
 
 #include "host/image/Image.h"
@@ -36,5 +38,17 @@ std::vector<float> BlobNegativeStrokes(int width, int height, int frame);
 
 /// Intersection over union of a matte's alpha >= 0.5 with the true mask over the frame (1 when both are empty).
 double BlobIoU(const Image &matte, int width, int height, int frame);
+
+/// One call of the kernel "GetObjectMask" as the tool makes it: a KROMComputeNode on host buffers, the frame as
+/// "src", `carried` (null: a 1 x 1 dummy) as "cachePropMaskIn", the strokes, and new outputs over the frame's data
+/// window (or `outWindow`): an RGBA float matte and a float mask to carry.
+struct ObjectMaskRun {
+    bool ok = false;
+    std::string error;
+    Ref<Image> matte, carry;
+};
+ObjectMaskRun RunObjectMask(const Image &frame, const Image *carried, std::shared_ptr<const void> block,
+                            size_t blockSize, const std::vector<float> &pos, const std::vector<float> &neg,
+                            const ImgRectI *outWindow = nullptr);
 
 } // namespace Orvane::Test

@@ -11,8 +11,6 @@
 #include "host/core/Tags.h"
 #include "host/image/Image.h"
 #include "host/image/NewImage.h"
-#include "host/krom/KROMBuffer.h"
-#include "host/krom/KROMComputeNode.h"
 #include "host/krom/KernelProvider.h"
 #include "host/segment/BuiltinProviders.h"
 #include "tests/support/BlobSequence.h"
@@ -50,42 +48,11 @@ std::shared_ptr<const void> WireBlock(const BlockFields &f, size_t size = 56) {
     return std::shared_ptr<const void>(bytes, bytes.get());
 }
 
-Ref<Image> Blank(const ImgRectI &window, int depth) {
-    Ref<Image> img = NewImageTagList({{ImgWidth, W}, {ImgHeight, H}, {ImgDepth, depth}, {ImgDataWindow, &window}});
-    EXPECT_TRUE(img->AllocScanLineData());
-    return img;
-}
+using Result = blob::ObjectMaskRun;
 
-struct Result {
-    bool ok = false;
-    std::string error;
-    Ref<Image> matte, carry;
-};
-
-/// One call of the kernel as the tool makes it. `carried` null: a 1 x 1 dummy. `outWindow` overrides the outputs'.
 Result Call(const Image &frame, const Image *carried, const BlockFields &f, const std::vector<float> &pos,
             const std::vector<float> &neg, size_t blockSize = 56, const ImgRectI *outWindow = nullptr) {
-    Result r;
-    const ImgRectI window = outWindow ? *outWindow : frame.DataWindow();
-    r.matte = Blank(window, DepthRGBAFlt32);
-    r.carry = Blank(window, DepthAFlt32);
-    Ref<Image> dummy = Blank(ImgRectI(0, 0, 1, 1), DepthAFlt32);
-    auto node = KROMComputeNode::Create(nullptr, "GetObjectMask", nullptr, OrvaneSemanticSegmentationParamsText, false);
-    EXPECT_TRUE(node->IsValid()) << node->Error();
-    auto src = KROMBuffer::CreateImage(nullptr, const_cast<Image *>(&frame), KROMBufferRead);
-    auto in = KROMBuffer::CreateImage(nullptr, const_cast<Image *>(carried ? carried : dummy.Get()), KROMBufferRead);
-    auto dst = KROMBuffer::CreateImage(nullptr, r.matte.Get(), KROMBufferWrite);
-    auto out = KROMBuffer::CreateImage(nullptr, r.carry.Get(), KROMBufferWrite);
-    node->SetParamStruct(WireBlock(f, blockSize), blockSize);
-    node->AddInput("src", src.get());
-    node->AddInput("cachePropMaskIn", in.get());
-    node->SetParam("posStroke", pos);
-    node->SetParam("negStroke", neg);
-    node->AddOutput("cachePropMaskOut", out.get());
-    node->AddOutput("dst", dst.get());
-    r.ok = node->RunSession();
-    r.error = node->Error();
-    return r;
+    return blob::RunObjectMask(frame, carried, WireBlock(f, blockSize), blockSize, pos, neg, outWindow);
 }
 
 /// The matte's four channels agree and lie in 0..1; the carried mask is the matte cut at one half.
@@ -112,7 +79,7 @@ protected:
 TEST_F(ObjectMask, ReferenceFrameFromStrokesMatchesTheObject) {
     // On two colour families the segmentation should miss little more than the soft edge: the ellipse (30 x 18
     // pixels across its semi-axes, ~1700 pixels) has a rim of ~150, so half a pixel wrong all round costs ~0.04 of
-    // IoU. 0.93 allows that and a little more (this build gives 0.974); strokes read upside down give 0.02.
+    // IoU. 0.95 allows a third of a pixel all round (this build gives 0.983); strokes read upside down give 0.02.
     const ImgRectI offset(-6, 4, W - 10, H + 3); // cut on the right, grown above, not at the origin
     struct Case {
         const char *name;
@@ -134,16 +101,16 @@ TEST_F(ObjectMask, ReferenceFrameFromStrokesMatchesTheObject) {
             Call(*frame, nullptr, f, blob::BlobPositiveStrokes(W, H, 0), blob::BlobNegativeStrokes(W, H, 0));
         ASSERT_TRUE(r.ok) << c.name << ": " << r.error;
         EXPECT_EQ(r.matte->DataWindow(), frame->DataWindow());
-        EXPECT_GT(blob::BlobIoU(*r.matte, W, H, 0), 0.93) << c.name;
+        EXPECT_GT(blob::BlobIoU(*r.matte, W, H, 0), 0.95) << c.name;
         ExpectMatteForm(r, c.name);
     }
 }
 
 TEST_F(ObjectMask, TracksTheObjectThroughTheSequenceBothWays) {
     // Each frame re-segments a band around the carried edge, so errors do not pile up: the worst frame of the run
-    // should stay within about a pixel of the edge all round, IoU above 0.9 (this build's worst is 0.956). The
-    // object moves up to 8 pixels a frame, more than the band: carrying the mask without the flow gives 0.57, a
-    // flow used the wrong way round 0.
+    // should do as well as the reference frame, IoU above 0.95 (this build's worst is the reference frame, 0.983).
+    // The object moves up to 8 pixels a frame, more than the band: carrying the mask without the flow gives 0.88,
+    // a flow used the wrong way round 0.
     struct Case {
         const char *name;
         bool reverse;
@@ -170,7 +137,7 @@ TEST_F(ObjectMask, TracksTheObjectThroughTheSequenceBothWays) {
             if (iou < worst) worst = iou, worstFrame = frame;
             carried = r.carry;
         }
-        EXPECT_GT(worst, 0.9) << c.name << ", worst at frame " << worstFrame;
+        EXPECT_GT(worst, 0.95) << c.name << ", worst at frame " << worstFrame;
     }
 }
 
@@ -193,7 +160,10 @@ TEST_F(ObjectMask, NothingMarkedGivesAnEmptyMatte) {
 TEST_F(ObjectMask, BadInputsFailWithAReason) {
     Ref<Image> frame = blob::MakeBlobFrame(W, H, 0);
     Ref<Image> noRows = NewImageTagList({{ImgWidth, W}, {ImgHeight, H}, {ImgDepth, DepthRGBAFlt32}});
-    Ref<Image> smallMask = Blank(ImgRectI(0, 0, W / 2, H), DepthAFlt32);
+    const ImgRectI half(0, 0, W / 2, H);
+    Ref<Image> smallMask =
+        NewImageTagList({{ImgWidth, W}, {ImgHeight, H}, {ImgDepth, DepthAFlt32}, {ImgDataWindow, &half}});
+    ASSERT_TRUE(smallMask->AllocScanLineData());
     const ImgRectI smaller(0, 0, W - 1, H);
     const float nan = std::numeric_limits<float>::quiet_NaN(), inf = std::numeric_limits<float>::infinity();
     BlockFields ref, carry;
