@@ -231,8 +231,10 @@ cv::Mat DecodeLinear(const cv::Mat &bgr) {
 cv::Mat RefineEdge(const cv::Mat &foreground, const cv::Mat &bgr, double scale) {
     cv::Mat matte = cv::Mat::zeros(bgr.size(), CV_32F);
     if (cv::countNonZero(foreground) == 0) return matte;
-    // The band covers the segmentation's uncertainty at working size (a few of its pixels), at full size.
-    const int radius = std::max(3, static_cast<int>(std::lround(3 / scale)));
+    // The band covers the segmentation's uncertainty at working size (a few of its pixels) and at least 0.5% of
+    // the frame's long side, about as wide as a defocused or motion-blurred edge gets before it is a blur.
+    const int longSide = std::max(bgr.cols, bgr.rows);
+    const int radius = std::max({3, static_cast<int>(std::lround(3 / scale)), longSide / 200});
     const int smoothRadius = std::max(1, static_cast<int>(std::lround(1 / scale)));
     cv::Rect box = cv::boundingRect(foreground);
     box = cv::Rect(
