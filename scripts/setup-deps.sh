@@ -16,8 +16,6 @@ packages=("$@")
   # The device path: OpenCL headers and loader, and PoCL, which runs OpenCL
   # kernels on the CPU so that every machine exercises the device path.
   ocl-icd-opencl-dev opencl-headers pocl-opencl-icd
-  # Object mattes from strokes: segmentation (GrabCut) and dense optical flow (DIS).
-  libopencv-dev
   clang-format
   # The fuzz harnesses and the clang preset (libFuzzer and the sanitizers come with it).
   clang
@@ -27,6 +25,8 @@ packages=("$@")
   openimageio-tools libvips-tools
   # Lens Distort's pixels are compared with OpenCV's lens map and remap, through its Python module.
   python3-opencv
+  # Object mattes from strokes: segmentation, optical flow and the network runner of OpenCV.
+  libopencv-dev
 )
 missing=()
 for p in "${packages[@]}"; do
