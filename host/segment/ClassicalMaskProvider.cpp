@@ -37,6 +37,8 @@ constexpr int kBetterWorkSide = 960;
 /// GrabCut iterations: from strokes, and when refining a carried mask.
 constexpr int kReferenceIterations[2] = {3, 5};
 constexpr int kTrackIterations[2] = {2, 4};
+/// Smallest working side the flow runs on (its patches are 8 pixels, its pyramid halves the frame).
+constexpr int kMinFlowSide = 16;
 /// Fewest labelled pixels of a class GrabCut's five-component colour model can learn from.
 constexpr int kMinClassSamples = 16;
 /// Guided filter regularisation on a 0..1 grey guide: edges of a contrast
@@ -424,7 +426,10 @@ bool ClassicalObjectMaskProvider::Compute(const ProviderCall &call, const Settin
         cv::Mat carried = ReadMask(*carryIn);
         if (scale < 1.0) cv::resize(carried, carried, work.size(), 0, 0, cv::INTER_AREA);
         // Move the mask with the picture: the flow from this frame back to the kept one says where each pixel was.
-        if (previous && previous->grey.size() == grey.size()) {
+        // Without a kept frame of this size nothing says how far the mask is off: it is trusted least.
+        const bool kept = previous && previous->grey.size() == grey.size();
+        strokeTime = kept ? previous->strokeTime : s.time - s.refineRange;
+        if (kept && std::min(grey.cols, grey.rows) >= kMinFlowSide) {
             auto dis = cv::DISOpticalFlow::create(s.better ? cv::DISOpticalFlow::PRESET_MEDIUM
                                                            : cv::DISOpticalFlow::PRESET_FAST);
             cv::Mat flow;
@@ -436,7 +441,6 @@ bool ClassicalObjectMaskProvider::Compute(const ProviderCall &call, const Settin
                 for (int c = 0; c < flow.cols; ++c) m[c] = cv::Point2f(c + f[c].x, r + f[c].y);
             }
             cv::remap(carried, carried, map, cv::noArray(), cv::INTER_LINEAR, cv::BORDER_CONSTANT, 0);
-            strokeTime = previous->strokeTime;
         }
         if (s.keyframe) strokeTime = s.time;
         if (aborted()) return fail("aborted");

@@ -141,19 +141,38 @@ TEST_F(ObjectMask, TracksTheObjectThroughTheSequenceBothWays) {
     }
 }
 
-TEST_F(ObjectMask, NothingMarkedGivesAnEmptyMatte) {
-    Ref<Image> frame = blob::MakeBlobFrame(W, H, 3);
-    BlockFields f;
-    f.ref = 1;
-    const std::vector<float> onlyNegative = blob::BlobNegativeStrokes(W, H, 3);
-    for (const auto &neg : {std::vector<float>{}, onlyNegative}) {
-        const Result r = Call(*frame, nullptr, f, {}, neg);
-        ASSERT_TRUE(r.ok) << r.error;
+TEST_F(ObjectMask, NothingMarkedGivesAnEmptyMatteAndTinyFramesWork) {
+    // Nothing marked: an empty matte, and success. A frame too small to model or to flow: a matte all the same, and
+    // a carried mask taken on to the next frame (the flow refuses frames under 12 pixels).
+    const ImgRectI tiny(0, 0, 5, 4);
+    Ref<Image> frame = blob::MakeBlobFrame(W, H, 3), small = blob::MakeBlobFrame(W, H, 0, DepthRGBAFlt32, &tiny);
+    const float nan = std::numeric_limits<float>::quiet_NaN();
+    struct Case {
+        const char *name;
+        const Image *frame;
+        std::vector<float> pos, neg;
+        bool expectEmpty;
+    } cases[] = {
+        {"no strokes", frame.Get(), {}, {}, true},
+        {"negative strokes only", frame.Get(), {}, blob::BlobNegativeStrokes(W, H, 3), true},
+        {"5 x 4 frame", small.Get(), {0.5f, 1.5f, 4.5f, 1.5f, nan, nan}, {}, false},
+    };
+    for (const Case &c : cases) {
+        BlockFields f;
+        f.ref = 1;
+        Result r = Call(*c.frame, nullptr, f, c.pos, c.neg);
+        ASSERT_TRUE(r.ok) << c.name << ": " << r.error;
+        ExpectMatteForm(r, c.name);
         int marked = 0;
-        for (int y = 0; y < H; ++y)
-            for (int x = 0; x < W; ++x) marked += r.matte->GetFlt(x, y).A != 0;
-        EXPECT_EQ(marked, 0);
-        ExpectMatteForm(r, "empty");
+        const ImgRectI &w = r.matte->DataWindow();
+        for (int y = w.y0; y < w.y1; ++y)
+            for (int x = w.x0; x < w.x1; ++x) marked += r.matte->GetFlt(x, y).A != 0;
+        EXPECT_EQ(marked == 0, c.expectEmpty) << c.name;
+        f.ref = 0;
+        f.hasMask = f.tracking = f.time = 1;
+        r = Call(*c.frame, r.carry.Get(), f, {}, {});
+        ASSERT_TRUE(r.ok) << c.name << ", tracked: " << r.error;
+        ExpectMatteForm(r, c.name);
     }
 }
 
