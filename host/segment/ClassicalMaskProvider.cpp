@@ -1,7 +1,7 @@
 // The classical provider of "GetObjectMask": a stroke-seeded GrabCut on the
 // reference frame, carried to later frames by dense optical flow and
-// re-segmented in a band around the carried edge, with a guided-filter soft
-// edge at full size. docs/MAGIC_MASK_PROVIDERS.md describes the steps.
+// re-segmented in a band around the carried edge, with a soft edge at full
+// size from the local object and background colours. docs/MAGIC_MASK_PROVIDERS.md describes the steps.
 //
 // All matrices keep Orvane's row order (row 0 is the data window's bottom
 // row): segmentation and flow do not care which way up a picture is, and
@@ -316,6 +316,63 @@ int BandWidth(int framesSinceStrokes, int refineRange, int workSide) {
     return static_cast<int>(std::lround(narrow + (wide - narrow) * t));
 }
 
+/// `mask` moved from the previous frame to this one: the flow from `grey` back to `previousGrey` says where each
+/// pixel was (bilinear, 0 outside).
+cv::Mat WarpBackward(const cv::Mat &mask, const cv::Mat &grey, const cv::Mat &previousGrey, bool better) {
+    auto dis = cv::DISOpticalFlow::create(better ? cv::DISOpticalFlow::PRESET_MEDIUM : cv::DISOpticalFlow::PRESET_FAST);
+    cv::Mat flow;
+    dis->calc(grey, previousGrey, flow);
+    cv::Mat map(flow.size(), CV_32FC2);
+    for (int r = 0; r < flow.rows; ++r) {
+        const cv::Point2f *f = flow.ptr<cv::Point2f>(r);
+        cv::Point2f *m = map.ptr<cv::Point2f>(r);
+        for (int c = 0; c < flow.cols; ++c) m[c] = cv::Point2f(c + f[c].x, r + f[c].y);
+    }
+    cv::Mat warped;
+    cv::remap(mask, warped, map, cv::noArray(), cv::INTER_LINEAR, cv::BORDER_CONSTANT, 0);
+    return warped;
+}
+
+/// The reference frame: the positive strokes' convex hull, widened, is probably the object (a user strokes along
+/// the object's inside, so the hull holds mostly its colours and seeds a good foreground model); the rest probably
+/// background; the strokes themselves sure.
+cv::Mat SegmentFromStrokes(const cv::Mat &work, const std::vector<Stroke> &positive,
+                           const std::vector<Stroke> &negative, double scale, int strokeWidth, int iterations) {
+    cv::Mat trimap(work.size(), CV_8U, cv::Scalar(cv::GC_PR_BGD));
+    std::vector<cv::Point2f> points;
+    for (const Stroke &st : positive)
+        for (const cv::Point2f &p : st) points.push_back(ToCell(p, scale));
+    std::vector<cv::Point> hull;
+    cv::Mat pointsInt;
+    cv::Mat(points).convertTo(pointsInt, CV_32S);
+    cv::convexHull(pointsInt, hull);
+    cv::fillConvexPoly(trimap, hull, cv::GC_PR_FGD);
+    cv::polylines(trimap, hull, true, cv::GC_PR_FGD, 2 * strokeWidth);
+    DrawStrokes(trimap, positive, scale, cv::GC_FGD, strokeWidth);
+    DrawStrokes(trimap, negative, scale, cv::GC_BGD, strokeWidth);
+    return Segment(work, trimap, cv::Rect(0, 0, work.cols, work.rows), iterations);
+}
+
+/// A tracked frame: re-segments a band of `band` pixels around the carried 0/1 mask, with a keyframe's strokes on
+/// top (sure on the strokes, probable a band around them, so the segmentation may grow or cut the mask there).
+cv::Mat SegmentAround(const cv::Mat &carried, const cv::Mat &work, const std::vector<Stroke> &positive,
+                      const std::vector<Stroke> &negative, double scale, int band, int strokeWidth, int iterations) {
+    cv::Mat trimap = TrimapAround(carried, band);
+    DrawStrokes(trimap, positive, scale, cv::GC_PR_FGD, 2 * band + strokeWidth);
+    DrawStrokes(trimap, negative, scale, cv::GC_PR_BGD, 2 * band + strokeWidth);
+    DrawStrokes(trimap, positive, scale, cv::GC_FGD, strokeWidth);
+    DrawStrokes(trimap, negative, scale, cv::GC_BGD, strokeWidth);
+    // Only the region around what is not sure background needs segmenting; the colour models then describe the
+    // object's surroundings rather than the whole frame.
+    const cv::Mat notSureBackground = trimap != cv::GC_BGD;
+    if (cv::countNonZero(notSureBackground) == 0) return cv::Mat::zeros(work.size(), CV_8U);
+    const int margin = 4 * band + 8;
+    cv::Rect roi = cv::boundingRect(notSureBackground);
+    roi = cv::Rect(roi.x - margin, roi.y - margin, roi.width + 2 * margin, roi.height + 2 * margin) &
+          cv::Rect(0, 0, work.cols, work.rows);
+    return Segment(work, trimap, roi, iterations);
+}
+
 class ClassicalObjectMaskProvider final : public KernelProvider {
 public:
     const char *Name() const override { return "classical"; }
@@ -430,60 +487,17 @@ bool ClassicalObjectMaskProvider::Compute(const ProviderCall &call, const Settin
         const bool kept = previous && previous->grey.size() == grey.size();
         strokeTime = kept ? previous->strokeTime : s.time - s.refineRange;
         if (kept && std::min(grey.cols, grey.rows) >= kMinFlowSide) {
-            auto dis = cv::DISOpticalFlow::create(s.better ? cv::DISOpticalFlow::PRESET_MEDIUM
-                                                           : cv::DISOpticalFlow::PRESET_FAST);
-            cv::Mat flow;
-            dis->calc(grey, previous->grey, flow);
-            cv::Mat map(flow.size(), CV_32FC2);
-            for (int r = 0; r < flow.rows; ++r) {
-                const cv::Point2f *f = flow.ptr<cv::Point2f>(r);
-                cv::Point2f *m = map.ptr<cv::Point2f>(r);
-                for (int c = 0; c < flow.cols; ++c) m[c] = cv::Point2f(c + f[c].x, r + f[c].y);
-            }
-            cv::remap(carried, carried, map, cv::noArray(), cv::INTER_LINEAR, cv::BORDER_CONSTANT, 0);
+            carried = WarpBackward(carried, grey, previous->grey, s.better);
         }
         if (s.keyframe) strokeTime = s.time;
         if (aborted()) return fail("aborted");
-        const cv::Mat carriedBinary = (carried >= 0.5f) / 255;
         const int band = BandWidth(s.time - strokeTime, s.refineRange, workLong);
-        cv::Mat trimap = TrimapAround(carriedBinary, band);
-        // A keyframe's own strokes: sure labels on the strokes, probable ones a band around them, so the
-        // segmentation may grow or cut the carried mask there.
-        DrawStrokes(trimap, positive, scale, cv::GC_PR_FGD, 2 * band + strokeWidth);
-        DrawStrokes(trimap, negative, scale, cv::GC_PR_BGD, 2 * band + strokeWidth);
-        DrawStrokes(trimap, positive, scale, cv::GC_FGD, strokeWidth);
-        DrawStrokes(trimap, negative, scale, cv::GC_BGD, strokeWidth);
-        // Only the region around what is not sure background needs segmenting; the colour models then describe
-        // the object's surroundings rather than the whole frame.
-        const cv::Mat notSureBackground = trimap != cv::GC_BGD;
-        if (cv::countNonZero(notSureBackground) == 0) {
-            foreground = cv::Mat::zeros(work.size(), CV_8U);
-        } else {
-            const int margin = 4 * band + 8;
-            cv::Rect roi = cv::boundingRect(notSureBackground);
-            roi = cv::Rect(roi.x - margin, roi.y - margin, roi.width + 2 * margin, roi.height + 2 * margin) &
-                  cv::Rect(0, 0, work.cols, work.rows);
-            foreground = Segment(work, trimap, roi, kTrackIterations[s.better]);
-        }
+        foreground = SegmentAround((carried >= 0.5f) / 255, work, positive, negative, scale, band, strokeWidth,
+                                   kTrackIterations[s.better]);
     } else if (positive.empty()) {
         foreground = cv::Mat::zeros(work.size(), CV_8U); // nothing marked and nothing carried: an empty matte
     } else {
-        // From strokes alone: the positive strokes' convex hull, widened, is probably the object (a user strokes
-        // along the object's inside, so the hull holds mostly its colours and seeds a good foreground model); the
-        // rest probably background; the strokes themselves sure.
-        cv::Mat trimap(work.size(), CV_8U, cv::Scalar(cv::GC_PR_BGD));
-        std::vector<cv::Point2f> points;
-        for (const Stroke &st : positive)
-            for (const cv::Point2f &p : st) points.push_back(ToCell(p, scale));
-        std::vector<cv::Point> hull;
-        cv::Mat pointsInt;
-        cv::Mat(points).convertTo(pointsInt, CV_32S);
-        cv::convexHull(pointsInt, hull);
-        cv::fillConvexPoly(trimap, hull, cv::GC_PR_FGD);
-        cv::polylines(trimap, hull, true, cv::GC_PR_FGD, 2 * strokeWidth);
-        DrawStrokes(trimap, positive, scale, cv::GC_FGD, strokeWidth);
-        DrawStrokes(trimap, negative, scale, cv::GC_BGD, strokeWidth);
-        foreground = Segment(work, trimap, cv::Rect(0, 0, work.cols, work.rows), kReferenceIterations[s.better]);
+        foreground = SegmentFromStrokes(work, positive, negative, scale, strokeWidth, kReferenceIterations[s.better]);
     }
     if (aborted()) return fail("aborted");
 

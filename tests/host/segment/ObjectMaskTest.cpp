@@ -8,11 +8,11 @@
 #include <string>
 #include <vector>
 
+#include "host/app/Application.h"
 #include "host/core/Tags.h"
 #include "host/image/Image.h"
 #include "host/image/NewImage.h"
 #include "host/krom/KernelProvider.h"
-#include "host/segment/BuiltinProviders.h"
 #include "tests/support/BlobSequence.h"
 
 namespace Orvane {
@@ -71,7 +71,10 @@ void ExpectMatteForm(const Result &r, const std::string &label) {
 class ObjectMask : public ::testing::Test {
 protected:
     void SetUp() override {
-        RegisterBuiltinProviders();
+        GetApp(); // start-up registers the host's providers
+        auto provider = FindKernelProvider("GetObjectMask");
+        ASSERT_TRUE(provider);
+        ASSERT_STREQ(provider->Name(), "classical");
         PurgeKROMMagicMaskTrackerCache();
     }
 };
