@@ -115,7 +115,10 @@ cv::Mat ToBgr8(const Image &src, bool premultiplied) {
         0, w.Height(),
         [&](int r0, int r1) {
             std::vector<FltPixel> row(w.Width());
-            auto code = [&](float v) { return encode[static_cast<int>(std::clamp(v, 0.f, 1.f) * 4096.f + 0.5f)]; };
+            // NaN reads as 0 (a comparison with NaN is false), infinity as 1.
+            auto code = [&](float v) {
+                return v > 0.f ? encode[static_cast<int>(std::min(v, 1.f) * 4096.f + 0.5f)] : 0;
+            };
             for (int r = r0; r < r1; ++r) {
                 LoadFlt(src.Depth(), src.ScanLine(w.y0 + r), w.Width(), row.data());
                 uint8_t *out = bgr.ptr<uint8_t>(r);

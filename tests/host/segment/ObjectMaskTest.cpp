@@ -145,11 +145,14 @@ TEST_F(ObjectMask, TracksTheObjectThroughTheSequenceBothWays) {
 }
 
 TEST_F(ObjectMask, NothingMarkedGivesAnEmptyMatteAndTinyFramesWork) {
-    // Nothing marked: an empty matte, and success. A frame too small to model or to flow: a matte all the same, and
-    // a carried mask taken on to the next frame (the flow refuses frames under 12 pixels).
+    // Nothing marked: an empty matte, and success. A frame too small to model or to flow, or with pixels that are
+    // not numbers: a matte all the same, and a carried mask taken on to the next frame (the flow refuses frames
+    // under 12 pixels).
     const ImgRectI tiny(0, 0, 5, 4);
     Ref<Image> frame = blob::MakeBlobFrame(W, H, 3), small = blob::MakeBlobFrame(W, H, 0, DepthRGBAFlt32, &tiny);
-    const float nan = std::numeric_limits<float>::quiet_NaN();
+    Ref<Image> broken = blob::MakeBlobFrame(W, H, 0);
+    const float nan = std::numeric_limits<float>::quiet_NaN(), inf = std::numeric_limits<float>::infinity();
+    for (int i = 0; i < W * H; i += 7) broken->PutFlt(i % W, i / W, FltPixel{nan, inf, -inf, i % 2 ? nan : inf});
     struct Case {
         const char *name;
         const Image *frame;
@@ -159,6 +162,7 @@ TEST_F(ObjectMask, NothingMarkedGivesAnEmptyMatteAndTinyFramesWork) {
         {"no strokes", frame.Get(), {}, {}, true},
         {"negative strokes only", frame.Get(), {}, blob::BlobNegativeStrokes(W, H, 3), true},
         {"5 x 4 frame", small.Get(), {0.5f, 1.5f, 4.5f, 1.5f, nan, nan}, {}, false},
+        {"NaN and infinite pixels", broken.Get(), blob::BlobPositiveStrokes(W, H, 0), {}, false},
     };
     for (const Case &c : cases) {
         BlockFields f;
