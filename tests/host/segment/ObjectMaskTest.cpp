@@ -5,6 +5,7 @@
 #include <cmath>
 #include <cstring>
 #include <limits>
+#include <map>
 #include <string>
 #include <vector>
 
@@ -142,6 +143,40 @@ TEST_F(ObjectMask, TracksTheObjectThroughTheSequenceBothWays) {
         }
         EXPECT_GT(worst, 0.95) << c.name << ", worst at frame " << worstFrame;
     }
+}
+
+TEST_F(ObjectMask, ToolsTrackingAtOnceKeepTheirOwnFrames) {
+    // Two tools (operator ids 1 and 2) track the sequence in opposite directions, calls interleaved: each must get
+    // bit for bit what it gets alone, so neither flows from the other's kept frame.
+    constexpr int steps = 6;
+    auto track = [](std::vector<uint32_t> tools) {
+        std::map<uint32_t, Ref<Image>> carried;
+        std::map<uint32_t, std::vector<Ref<Image>>> mattes;
+        for (int i = 0; i < steps; ++i)
+            for (uint32_t tool : tools) {
+                const int frame = tool == 1 ? i : kBlobFrames - 1 - i;
+                BlockFields f;
+                f.operatorId = tool;
+                f.time = frame;
+                f.ref = f.key = i == 0;
+                f.hasMask = f.tracking = i > 0;
+                const Result r = Call(*blob::MakeBlobFrame(W, H, frame), carried[tool].Get(), f,
+                                      i == 0 ? blob::BlobPositiveStrokes(W, H, frame) : std::vector<float>{}, {});
+                EXPECT_TRUE(r.ok) << r.error;
+                carried[tool] = r.carry;
+                mattes[tool].push_back(r.matte);
+            }
+        PurgeKROMMagicMaskTrackerCache();
+        return mattes;
+    };
+    auto together = track({1, 2}), first = track({1}), second = track({2});
+    for (auto [tool, alone] : {std::pair{1u, &first}, {2u, &second}})
+        for (int i = 0; i < steps; ++i)
+            for (int y = 0; y < H; ++y)
+                ASSERT_EQ(std::memcmp(together[tool][i]->ScanLine(y), (*alone)[tool][i]->ScanLine(y),
+                                      together[tool][i]->RowBytes()),
+                          0)
+                    << "tool " << tool << " step " << i << " row " << y;
 }
 
 TEST_F(ObjectMask, NothingMarkedGivesAnEmptyMatteAndTinyFramesWork) {
