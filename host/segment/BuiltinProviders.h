@@ -4,7 +4,9 @@
 // so that a provider registered later (a learned model) takes over while it is
 // available and the built-in one serves otherwise.
 //
-// "GetObjectMask": the classical provider (ClassicalMaskProvider.h).
+// "GetObjectMask": the classical provider (ClassicalMaskProvider.h), then the
+// network provider when ORVANE_MAGIC_MASK_MODEL names a network that loads
+// (OnnxObjectMask.h).
 //
 // Thread safety: RegisterBuiltinProviders may be called from any thread, any
 // number of times; only the first call registers.
