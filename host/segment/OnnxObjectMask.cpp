@@ -1,6 +1,7 @@
 #include "host/segment/OnnxObjectMask.h"
 
 #include <algorithm>
+#include <cctype>
 #include <cmath>
 #include <cstdio>
 #include <cstdlib>
@@ -29,7 +30,9 @@ OnnxObjectMaskProvider::OnnxObjectMaskProvider(const std::string &path) {
         net.setPreferableTarget(cv::dnn::DNN_TARGET_CPU);
         net_ = std::make_unique<Net>(Net{std::move(net)});
     } catch (const cv::Exception &e) {
-        loadError_ = "\"" + path + "\" is not a network that loads: " + e.msg;
+        std::string why = e.msg;
+        while (!why.empty() && std::isspace(static_cast<unsigned char>(why.back()))) why.pop_back();
+        loadError_ = "\"" + path + "\" is not a network that loads: " + why;
     }
 }
 
