@@ -37,7 +37,11 @@ static ClassRegistration<MagicMask, ThreadedOperator> s_Registration(CLSID_Magic
                                                                       {RegAbbreviation, "MagM"},
                                                                       {RegHelp, "Creates a mask for a selected object"},
                                                                       {RegIcon, "Icons.Tools.Icons.MagicMask"},
-                                                                      {RegNoMotionBlurControls, 1}});
+                                                                      {RegNoMotionBlurControls, 1},
+                                                                      {RegHasOperatorControl, 1},
+                                                                      {RegNoAutoProxy, 1},
+                                                                      {RegUnpredictable, 1},
+                                                                      {RegSupportsGPUImages, 1}});
 
 namespace {
 
@@ -45,8 +49,6 @@ constexpr const char *kKernel = "GetObjectMask";
 /// A control's tips (one or more) and a button's caption, for a panel to show.
 constexpr Tag ControlTipText = 0x68040010; // may repeat
 constexpr Tag ButtonCaption = 0x30050010;
-/// Set on inputs that keep one value (no animation).
-constexpr Tag InputNotAnimated = 0x10040011;
 /// Run kind 4 ends its leg at the render end within this.
 constexpr double kEndSlack = 5e-5;
 
@@ -97,7 +99,7 @@ TagList RangeHalf(int member, double def, double high, const char *rowLabel) {
 }
 
 TagList Passive(TagList t) {
-    t.Add({InputPassive, 1}), t.Add({InputNotAnimated, 1});
+    t.Add({InputPassive, 1}), t.Add({InputExternal, 0}); // one value, neither animated nor linked
     return t;
 }
 
@@ -418,6 +420,9 @@ void MagicMask::Process(Request *req) {
 }
 
 void MagicMask::NotifyChanged(Input *in, Parameter *param, double time, TagList *tags) {
+    if (in == filter_)
+        if (const auto *id = dynamic_cast<const IDValue *>(param))
+            passes_->SetAttrsTagList({{ControlVisible, id->value == OvID("Multi-box")}});
     if (param && GetDoc()) {
         const double start = GetDoc()->RenderStart(), end = GetDoc()->RenderEnd();
         auto run = [this](double from, double to) {
