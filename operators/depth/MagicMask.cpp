@@ -2,8 +2,6 @@
 
 #include <algorithm>
 #include <cmath>
-#include <cstdarg>
-#include <cstdio>
 #include <vector>
 
 #include "host/flow/ControlCommand.h"
@@ -224,15 +222,6 @@ MagicMask::MagicMask(const Registry *reg, const ScriptVal &args, const TagList &
 
 MagicMask::~MagicMask() = default;
 
-void MagicMask::Fail(const char *fmt, ...) {
-    char line[512];
-    va_list ap;
-    va_start(ap, fmt);
-    std::vsnprintf(line, sizeof line, fmt, ap);
-    va_end(ap);
-    if (GetDoc()) GetDoc()->PrintF(ConsoleError, "%s: %s\n", Name().c_str(), line);
-}
-
 bool MagicMask::IsTracking() const {
     std::lock_guard lock(state_);
     return isTracking_;
@@ -293,12 +282,13 @@ MagicMask::Step MagicMask::DoMagicMask(double time, Request *req, Image *in, Ima
 bool MagicMask::RunKernel(double time, Request *req, const Settings &s, const Image *in, const Image *propIn,
                           Ref<Image> &propOut, Ref<Image> &matte) {
     if (!FindKernelProvider(kKernel)) {
-        Fail("no provider of the kernel \"%s\" is registered", kKernel);
+        Fail(req, "%s: no provider of the kernel \"%s\" is registered\n", Name().c_str(), kKernel);
         return false;
     }
     auto node = KROMComputeNode::Create(nullptr, kKernel, nullptr, OrvaneSemanticSegmentationParamsText, false);
     if (!node || !node->IsValid()) {
-        Fail("the kernel \"%s\" cannot run: %s", kKernel, node ? node->Error().c_str() : "no node");
+        Fail(req, "%s: the kernel \"%s\" cannot run: %s\n", Name().c_str(), kKernel,
+             node ? node->Error().c_str() : "no node");
         return false;
     }
     if (!in->DownloadGPUMem()) return false;
@@ -348,7 +338,8 @@ bool MagicMask::RunKernel(double time, Request *req, const Settings &s, const Im
     node->AddOutput("dst", dst.get());
     node->SetAbortFlag(in->AbortFlag());
     if (!node->RunSession()) {
-        if (!in->CheckAbort()) Fail("the kernel \"%s\" failed: %s", kKernel, node->Error().c_str());
+        if (!in->CheckAbort())
+            Fail(req, "%s: the kernel \"%s\" failed: %s\n", Name().c_str(), kKernel, node->Error().c_str());
         return false;
     }
     return true;
@@ -446,7 +437,8 @@ void MagicMask::NotifyChanged(Input *in, Parameter *param, double time, TagList 
             std::lock_guard lock(state_);
             kept_.clear();
         }
-        if (in == cacheRegen_) Fail("the disk cache is not built; tracked frames are kept in memory");
+        if (in == cacheRegen_)
+            Fail(nullptr, "%s: the disk cache is not built; tracked frames are kept in memory\n", Name().c_str());
     }
     ThreadedOperator::NotifyChanged(in, param, time, tags);
 }
@@ -459,7 +451,7 @@ bool MagicMask::ControlCommand(int command, const TagList &tags) {
 
 bool MagicMask::RunTracking(double from, double to, RenderTask *task) {
     if (!std::isfinite(from) || !std::isfinite(to)) {
-        Fail("a run needs finite frames");
+        Fail(nullptr, "%s: a run needs finite frames\n", Name().c_str());
         return false;
     }
     RenderTask own;
@@ -506,7 +498,7 @@ bool MagicMask::RunTracking(double from, double to, RenderTask *task) {
         std::lock_guard lock(state_);
         runTask_ = nullptr;
     }
-    if (done == 0) Fail("nothing was tracked from frame %g", from);
+    if (done == 0) Fail(nullptr, "%s: nothing was tracked from frame %g\n", Name().c_str(), from);
     return done > 0;
 }
 

@@ -90,7 +90,6 @@ private:
                    Ref<Image> &propOut, Ref<Image> &matte);
     bool RefineMatte(Request *req, Ref<Image> &out);
     bool ErodeDilate(Request *req, Image *img, double amount) const;
-    void Fail(const char *fmt, ...) __attribute__((format(printf, 2, 3)));
     void EndRun(RenderTask *task);
 
     Input *mode_, *refineRange_, *strokeMode_, *deleteStrokes_, *trackReverse_, *trackBidirectional_, *trackForward_,
