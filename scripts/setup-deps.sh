@@ -25,6 +25,8 @@ packages=("$@")
   openimageio-tools libvips-tools
   # Lens Distort's pixels are compared with OpenCV's lens map and remap, through its Python module.
   python3-opencv
+  # Object mattes from strokes: segmentation, optical flow and the network runner of OpenCV.
+  libopencv-dev
 )
 missing=()
 for p in "${packages[@]}"; do
