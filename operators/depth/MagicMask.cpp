@@ -377,9 +377,21 @@ bool MagicMask::RefineMatte(Request *req, Ref<Image> &out) {
     return KeyerMatte::PostMultiply(req, out.Get(), v);
 }
 
+bool MagicMask::CheckRunSource(Request *req, const Image *src) {
+    if (!src) return false;
+    sourceSeen_ = true;
+    std::lock_guard lock(state_);
+    // The propagated masks are images of one frame size: a run keeps to its first frame's.
+    const std::pair size{src->Width(), src->Height()};
+    if (!runSize_) runSize_ = size;
+    if (*runSize_ == size) return true;
+    Fail(req, "%s: Non-uniform size for tracking source at time %g\n", Name().c_str(), req->Time());
+    return false;
+}
+
 void MagicMask::Process(Request *req) {
     auto *src = dynamic_cast<Image *>(req->GetInputData(input_));
-    if (!src) {
+    if ((req->GetFlags() & ReqFlagTrackStep) ? !CheckRunSource(req, src) : !src) {
         req->SetOutputData(output_, nullptr);
         return;
     }
@@ -478,8 +490,15 @@ bool MagicMask::RunTracking(double from, double to, RenderTask *task) {
     options.useCache = false;
     const long frames = std::lround(std::fabs(to - from)) + 1;
     long done = 0;
-    for (; done < frames && !task->IsAborted() && !stop_; ++done)
-        if (!Evaluate(output_, from + step * static_cast<double>(done), options)) break;
+    for (; done < frames && !task->IsAborted() && !stop_; ++done) {
+        const double time = from + step * static_cast<double>(done);
+        sourceSeen_ = false;
+        if (Evaluate(output_, time, options)) continue;
+        // A source that failed upstream never reaches Process: say why the run stops here.
+        if (!sourceSeen_ && !task->IsAborted())
+            Fail(nullptr, "%s: Cannot get tracking source for time %g\n", Name().c_str(), time);
+        break;
+    }
     {
         std::lock_guard lock(state_);
         if (done > 0) {
@@ -521,6 +540,7 @@ void MagicMask::OnEndRender() {
             ended = true;
             // The run's own state goes: where it stood, and the propagated masks (the mattes stay for renders).
             step_ = 1, legStart_ = presentTime_ = 0.0;
+            runSize_.reset();
             for (auto &[frame, kept] : kept_) kept.propMask = Ref<Image>();
         }
     }

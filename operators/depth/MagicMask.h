@@ -90,6 +90,8 @@ private:
                    Ref<Image> &propOut, Ref<Image> &matte);
     bool RefineMatte(Request *req, Ref<Image> &out);
     bool ErodeDilate(Request *req, Image *img, double amount) const;
+    /// A frame of a run needs a source image of the run's frame size; false with the tool's line.
+    bool CheckRunSource(Request *req, const Image *src);
     void EndRun(RenderTask *task);
 
     Input *mode_, *refineRange_, *strokeMode_, *deleteStrokes_, *trackReverse_, *trackBidirectional_, *trackForward_,
@@ -105,6 +107,7 @@ private:
     uint32_t operatorId_;
     int algoVer_;
     std::atomic<bool> stop_{false};
+    std::atomic<bool> sourceSeen_{false}; ///< the run's frame reached Process with an image
 
     mutable std::mutex state_;
     bool isTracking_ = false;
@@ -114,7 +117,8 @@ private:
     double presentTime_ = 0.0;                           ///< the frame the run is at
     double legStart_ = 0.0, runEnd_ = 0.0;
     int step_ = 1;
-    RenderTask *runTask_ = nullptr; ///< the task of the leg under way
+    std::optional<std::pair<int, int>> runSize_; ///< the frame size of the run's first frame
+    RenderTask *runTask_ = nullptr;              ///< the task of the leg under way
     std::map<int, Kept> kept_;
 };
 

@@ -279,6 +279,12 @@ TEST_F(MagicMaskTest, RunsPropagateFrameToFrameAndRecordWhatTheyCovered) {
     op->FindInput("Strokes")->SetValue(Strokes({{0.5, 0.5}}, {}));
     ASSERT_TRUE(Render(op, 3.0));
     EXPECT_EQ(provider->calls.size(), 9u);
+
+    // A run whose source gives no image says so and tracks nothing.
+    ASSERT_TRUE(op->FindInput("Input")->ConnectTo(T::AddImageSource(doc, "Empty", {})->Out()));
+    EXPECT_FALSE(Track(op, 1, 2, task));
+    EXPECT_NE(T::ConsoleText(doc).find("error: Mask: Cannot get tracking source for time 1\n"), std::string::npos)
+        << T::ConsoleText(doc);
 }
 
 TEST_F(MagicMaskTest, AForwardLegThatReachesTheEndStaysOpenOnceForAReverseLeg) {
