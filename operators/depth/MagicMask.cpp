@@ -266,8 +266,10 @@ MagicMask::Step MagicMask::DoMagicMask(double time, Request *req, Image *in, Ima
             auto prev = kept_.find(frame - step_);
             if (Frame(legStart_) != frame && prev != kept_.end() && prev->second.key == s.key)
                 propIn = prev->second.propMask;
-        } else if (auto it = kept_.find(frame); it != kept_.end() && it->second.key == s.key) {
-            matte = it->second.matte; // a tracked frame, rendered again with the run's settings
+        } else if (auto it = kept_.find(frame); it != kept_.end() && it->second.key == s.key &&
+                                                it->second.matte->Width() == in->Width() &&
+                                                it->second.matte->Height() == in->Height()) {
+            matte = it->second.matte; // a tracked frame, rendered again with the run's settings and frame size
         }
     }
     if (!matte) {
