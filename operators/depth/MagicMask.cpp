@@ -222,21 +222,6 @@ MagicMask::MagicMask(const Registry *reg, const ScriptVal &args, const TagList &
 
 MagicMask::~MagicMask() = default;
 
-bool MagicMask::IsTracking() const {
-    std::lock_guard lock(state_);
-    return isTracking_;
-}
-
-int MagicMask::RunKind() const {
-    std::lock_guard lock(state_);
-    return runKind_;
-}
-
-size_t MagicMask::CachedFrames() const {
-    std::lock_guard lock(state_);
-    return kept_.size();
-}
-
 MagicMask::Settings MagicMask::ReadSettings(Request *req) const {
     Settings s;
     if (auto *strokes = dynamic_cast<MagicMaskStrokes *>(req->GetInputData(strokes_)))

@@ -68,15 +68,9 @@ public:
     /// console line when no provider serves the kernel or it fails.
     Step DoMagicMask(double time, Request *req, Image *in, Image *out);
 
-    // ---- the run's state (also for tests) ----
     static constexpr int RunNone = -1, RunReverse = 0, RunForward = 4;
-    bool IsTracking() const;
-    int RunKind() const;
     /// Steps from `from` to `to` (either way); false with the tool's line when nothing was done.
     bool RunTracking(double from, double to, RenderTask *task);
-    /// Frames with a kept matte.
-    size_t CachedFrames() const;
-    uint32_t OperatorId() const { return operatorId_; }
 
 private:
     struct Kept {
