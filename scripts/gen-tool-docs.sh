@@ -1,14 +1,15 @@
 #!/usr/bin/env bash
 # Writes the tool reference in docs/tools/ from the registry: one page per
-# built tool (orvane describe CLASS --markdown) and an index. A test compares
-# the pages with the program, so run this after changing a tool's controls.
+# built tool (orvane describe CLASS --markdown; formats and data types have
+# none) and an index. A test compares the pages with the program, so run this
+# after changing a tool's controls.
 #   scripts/gen-tool-docs.sh [path/to/orvane]
 set -euo pipefail
 cd "$(dirname "$0")/.."
 orvane="${1:-build/bin/orvane}"
 out=docs/tools
 rm -f "$out"/*.md
-mapfile -t rows < <("$orvane" tools | awk 'NR > 1 && $NF == "yes" && $3 != "format" { print $1 }')
+mapfile -t rows < <("$orvane" tools | awk 'NR > 1 && $NF == "yes" && $3 != "format" && $3 != "data" { print $1 }')
 {
   echo "# Tool reference"
   echo

@@ -76,6 +76,7 @@ int RunRender(const std::vector<std::string> &args);
 int RunColorSpaces(const std::vector<std::string> &args);
 int RunPick(const std::vector<std::string> &args);
 int RunTrack(const std::vector<std::string> &args);
+int RunStroke(const std::vector<std::string> &args);
 int RunScript(const std::vector<std::string> &args);
 
 } // namespace Orvane::Cli

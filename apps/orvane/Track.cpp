@@ -1,5 +1,6 @@
-// orvane track: runs a tool's trackers over a range of frames, as the track
-// buttons do, and saves the flow with the paths they made.
+// orvane track: runs a tool's trackers (or a Magic Mask's object run) over a
+// range of frames, as the track buttons do, and saves the flow with what they
+// made.
 #include <algorithm>
 #include <atomic>
 #include <csignal>
@@ -146,6 +147,7 @@ int RunTrack(const std::vector<std::string> &args) {
             }
         }
     }
+    op->OnEndRender(); // a run a tool keeps open between legs ends with the command
     sigaction(SIGINT, &oldInt, nullptr);
     sigaction(SIGTERM, &oldTerm, nullptr);
     g_trackTask = nullptr;

@@ -109,6 +109,14 @@ const Command kCommands[] = {
   tracked (no tracker enabled, or no pattern found), 130 interrupted (what
   was tracked is saved).
 )"},
+    {"stroke", RunStroke, R"(orvane stroke FLOW TOOL add|sub|clear [X,Y ...] [--lenient]
+  Adds a stroke to a Magic Mask's strokes, as drawing on the picture does, and
+  saves the flow: add marks the object, sub marks what is not the object,
+  clear removes every stroke. X,Y are frame fractions (0..1), x to the right
+  and y up from the bottom-left corner; a stroke runs through its points in
+  order. The tool tracks them with orvane track (docs/MAGIC_MASK.md).
+  Exit: 0 saved, 2 bad command line or document.
+)"},
     {"script", RunScript, R"(orvane script [options] FILE.lua [ARGS...]
   Runs a Lua script with the full Lua library, the script classes (EXRIO: OpenEXR
   files with several parts) and images (Image.New); arg[0] is FILE, arg[1]...

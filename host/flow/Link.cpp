@@ -82,6 +82,9 @@ Ref<Parameter> ParameterFromScript(OvID dataType, const ScriptVal &v) {
         std::string problem;
         return PolyLine::FromScript(dataType, v, problem);
     }
+    // A data type a tool library registers as a parameter class reads its document form in its constructor.
+    if (const Registry *row = ClassRegistry ? ClassRegistry->Find(dataType, RegFamilyDataType) : nullptr)
+        return Ref<Parameter>::Adopt(dynamic_cast<Parameter *>(row->New(v, {})));
     return nullptr;
 }
 

@@ -206,7 +206,8 @@ TEST(CliDescribe, TheToolReferenceIsWhatTheProgramSays) {
     size_t built = 0;
     std::istringstream lines(tools.out);
     for (std::string line; std::getline(lines, line);)
-        built += line.size() > 3 && line.compare(line.size() - 3, 3, "yes") == 0 && !Contains(line, " format ");
+        built += line.size() > 3 && line.compare(line.size() - 3, 3, "yes") == 0 && !Contains(line, " format ") &&
+                 !Contains(line, " data type "); // formats and data types are no tools
     EXPECT_EQ(pages, built) << "one page per built tool";
 }
 

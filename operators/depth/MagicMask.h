@@ -1,0 +1,119 @@
+#pragma once
+// MagicMask: a matte for an object the user marks with strokes
+// (MagicMaskStrokes.h). The segmentation is the kernel "GetObjectMask",
+// served by whichever provider is registered (host/krom/KernelProvider.h);
+// the tool owns the strokes, the tracking run and the matte's refinement.
+//
+// Process: the core step (DoMagicMask) runs the kernel on the input frame
+// and puts the matte in the alpha of a copy of the input; the "Matte" page
+// then works on that alpha in this order: blur (Filter, Blur, Num Passes),
+// erode/dilate (a square minimum or maximum of |ErodeDilate| x the frame's
+// width pixels), threshold and gamma, invert, the solid and garbage mattes;
+// last, the colour is multiplied by the new alpha when Post Multiply Image is
+// on. RestoreFringe is kept with the document but changes nothing yet.
+//
+// The run: CCMD_Track (ControlCommand.h) or a track button steps frame by
+// frame from its first frame; each frame's propagated mask ("cachePropMaskOut")
+// is kept in memory and handed to the next frame as "cachePropMaskIn". The
+// first frame of a run is its reference frame: ReferenceTime takes it, and
+// ProcessedFramesLow/High take the span the run covered. The kept frames
+// (propagated mask and raw matte, keyed by the strokes, mode, refine range
+// and algorithm version) let a later render of a tracked frame reuse the
+// run's matte; a frame not kept, or kept under other settings, is computed
+// on its own (no propagated mask). The cache lives in memory only: it does
+// not outlast the tool, and does not see changes upstream of the tool (Clear
+// Cache drops it). There is no disk cache; Regenerate All says so.
+//
+// Run kinds: -1 no run, 4 a forward leg, 0 a reverse leg (or a forward leg
+// that reached the render end, left open for a reverse leg to follow).
+//
+// Thread safety: the run's state and the mask cache are under the tool's
+// state lock; Process may run on a render thread while ControlCommand waits
+// for it on the main thread. NotifyChanged and ControlCommand run on the
+// main thread between renders.
+#include <atomic>
+#include <cstdint>
+#include <map>
+#include <memory>
+#include <mutex>
+#include <optional>
+
+#include "host/core/Tags.h"
+#include "host/flow/Operator.h"
+
+namespace Orvane {
+
+class Image;
+class MaskInputs;
+class RenderTask;
+
+/// The tool's attribute (construction tags) giving the kernel's algorithm version (default 1).
+constexpr Tag MagicMaskAlgorithmVersion = 0x1000012c;
+
+class MagicMask : public ThreadedOperator {
+public:
+    MagicMask(const Registry *reg, const ScriptVal &args, const TagList &tags);
+    ~MagicMask() override;
+    size_t SizeOf() const override { return sizeof(*this); }
+
+    void Process(Request *req) override;
+    void NotifyChanged(Input *in, Parameter *param, double time, TagList *tags) override;
+    bool ControlCommand(int command, const TagList &tags) override;
+    void OnEndRender() override;
+
+    enum class Step { Done, Skipped, Failed };
+    /// The core step: `out`'s alpha := the kernel's matte of `in` at `time`.
+    /// Skipped (nothing done) for a no-data image, an output window empty in
+    /// width or height, or windows that differ; Failed with the tool's
+    /// console line when no provider serves the kernel or it fails.
+    Step DoMagicMask(double time, Request *req, Image *in, Image *out);
+
+    static constexpr int RunNone = -1, RunReverse = 0, RunForward = 4;
+    /// Steps from `from` to `to` (either way); false with the tool's line when nothing was done.
+    bool RunTracking(double from, double to, RenderTask *task);
+
+private:
+    struct Kept {
+        Ref<Image> propMask, matte;
+        uint64_t key = 0;
+    };
+    struct Settings; // what one request renders with
+
+    Settings ReadSettings(Request *req) const;
+    bool RunKernel(double time, Request *req, const Settings &s, const Image *in, const Image *propIn,
+                   Ref<Image> &propOut, Ref<Image> &matte);
+    bool RefineMatte(Request *req, Ref<Image> &out);
+    bool ErodeDilate(Request *req, Image *img, double amount) const;
+    /// A frame of a run needs a source image of the run's frame size; false with the tool's line.
+    bool CheckRunSource(Request *req, const Image *src);
+    void EndRun(RenderTask *task);
+
+    Input *mode_, *refineRange_, *strokeMode_, *deleteStrokes_, *trackReverse_, *trackBidirectional_, *trackForward_,
+        *trackReverseOne_, *stopTracking_, *trackForwardOne_, *clearCurrent_, *clearRange_, *clearAll_, *goToStart_,
+        *goToRefTime_, *goToEnd_, *cacheRegen_, *cacheClear_, *referenceTimeIn_, *processedLow_, *processedHigh_,
+        *postMultiply_;
+    Input *filter_, *matteBlur_, *passes_, *erodeDilate_, *matteGamma_, *lowThreshold_, *highThreshold_,
+        *restoreFringe_, *invertMatte_;
+    std::unique_ptr<MaskInputs> solid_, garbage_;
+    Input *strokes_, *input_;
+    Output *output_;
+
+    uint32_t operatorId_;
+    int algoVer_;
+    std::atomic<bool> stop_{false};
+    std::atomic<bool> sourceSeen_{false}; ///< the run's frame reached Process with an image
+
+    mutable std::mutex state_;
+    bool isTracking_ = false;
+    int runKind_ = RunNone;
+    double referenceTime_ = 0.0;
+    std::optional<std::pair<double, double>> processed_; ///< frames the runs covered
+    double presentTime_ = 0.0;                           ///< the frame the run is at
+    double legStart_ = 0.0, runEnd_ = 0.0;
+    int step_ = 1;
+    std::optional<std::pair<int, int>> runSize_; ///< the frame size of the run's first frame
+    RenderTask *runTask_ = nullptr;              ///< the task of the leg under way
+    std::map<int, Kept> kept_;
+};
+
+} // namespace Orvane
