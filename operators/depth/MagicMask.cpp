@@ -257,13 +257,65 @@ MagicMask::Step MagicMask::DoMagicMask(double time, Request *req, Image *in, Ima
             matte = it->second.matte; // a tracked frame, rendered again with the run's settings and frame size
         }
     }
+    if (!matte && !tracking && !CatchUp(time, req, s, in, propIn)) return Step::Failed;
     if (!matte) {
         Ref<Image> propOut;
         if (!RunKernel(time, req, s, in, propIn.Get(), propOut, matte)) return Step::Failed;
         std::lock_guard lock(state_);
         if (tracking) kept_[frame] = Kept{propOut, matte, s.key};
+        lastCall_ = frame;
+        if (!tracking && propIn) {
+            // Rendered inside the tracked span: the mask carried on, kept for the next frame of a render.
+            kept_[frame] = Kept{Ref<Image>(), matte, s.key};
+            chain_ = Chain{frame, propOut, s.key};
+        }
     }
     return MatteCore_DoCopyChannel(req, matte.Get(), out, MatteAlpha, MatteAlpha) ? Step::Done : Step::Failed;
+}
+
+bool MagicMask::CatchUp(double time, Request *req, const Settings &s, const Image *in, Ref<Image> &propIn) {
+    // A frame of the tracked span rendered without its run's matte in memory (another process, or a change): the
+    // masks are carried again from the reference frame, frame by frame as the run did, so that the render gives
+    // the tracked matte rather than one from the reference frame's strokes alone. A render going on frame by frame
+    // carries on from the last frame it did.
+    const int frame = Frame(time), ref = Frame(req->GetInputNumber(referenceTimeIn_, 0.0));
+    const double low = req->GetInputNumber(processedLow_, 0.0), high = req->GetInputNumber(processedHigh_, 0.0);
+    if (frame == ref || !(high > low) || time < low - kEndSlack || time > high + kEndSlack) return true;
+    const Output *source = input_->Link();
+    if (!source) return true;
+    const int step = frame > ref ? 1 : -1;
+    int from = ref;
+    {
+        std::lock_guard lock(state_);
+        // Carry on from the chain's last frame when it lies on the way and the provider last saw that frame.
+        if (chain_ && chain_->key == s.key && lastCall_ == chain_->frame && (frame - chain_->frame) * step > 0 &&
+            (chain_->frame - ref) * step >= 0) {
+            from = chain_->frame + step;
+            propIn = chain_->propMask;
+        }
+    }
+    if (from == ref) PurgeKROMMagicMaskTrackerCache();
+    EvalOptions options;
+    options.task = req->GetTask();
+    for (int f = from; f != frame; f += step) {
+        const Ref<Parameter> value = Evaluate(const_cast<Output *>(source), f, options);
+        auto *src = dynamic_cast<Image *>(value.Get());
+        if (!src || src->Width() != in->Width() || src->Height() != in->Height()) {
+            Fail(req,
+                 src ? "%s: Non-uniform size for tracking source at time %g\n"
+                     : "%s: Cannot get tracking source for time %g\n",
+                 Name().c_str(), static_cast<double>(f));
+            return false;
+        }
+        Ref<Image> propOut, matte;
+        if (!RunKernel(f, req, s, src, propIn.Get(), propOut, matte)) return false;
+        propIn = propOut;
+        std::lock_guard lock(state_);
+        kept_[f] = Kept{Ref<Image>(), matte, s.key};
+        chain_ = Chain{f, propOut, s.key};
+        lastCall_ = f;
+    }
+    return true;
 }
 
 bool MagicMask::RunKernel(double time, Request *req, const Settings &s, const Image *in, const Image *propIn,
@@ -528,6 +580,7 @@ void MagicMask::OnEndRender() {
             // The run's own state goes: where it stood, and the propagated masks (the mattes stay for renders).
             step_ = 1, legStart_ = presentTime_ = 0.0;
             runSize_.reset();
+            lastCall_.reset(); // the providers forget the run's frames
             for (auto &[frame, kept] : kept_) kept.propMask = Ref<Image>();
         }
     }

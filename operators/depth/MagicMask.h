@@ -82,6 +82,10 @@ private:
     Settings ReadSettings(Request *req) const;
     bool RunKernel(double time, Request *req, const Settings &s, const Image *in, const Image *propIn,
                    Ref<Image> &propOut, Ref<Image> &matte);
+    /// For a render of a frame inside the tracked span: carries the masks from the reference frame (or the last
+    /// frame the render did) up to the frame before `time`, giving `propIn` for this frame. False with the tool's
+    /// line when a source frame is missing or of another size.
+    bool CatchUp(double time, Request *req, const Settings &s, const Image *in, Ref<Image> &propIn);
     bool RefineMatte(Request *req, Ref<Image> &out);
     bool ErodeDilate(Request *req, Image *img, double amount) const;
     /// A frame of a run needs a source image of the run's frame size; false with the tool's line.
@@ -114,6 +118,13 @@ private:
     std::optional<std::pair<int, int>> runSize_; ///< the frame size of the run's first frame
     RenderTask *runTask_ = nullptr;              ///< the task of the leg under way
     std::map<int, Kept> kept_;
+    struct Chain {
+        int frame;
+        Ref<Image> propMask;
+        uint64_t key;
+    };
+    std::optional<Chain> chain_;  ///< where a render's carrying of the masks stands
+    std::optional<int> lastCall_; ///< the frame of the provider's last call by this tool
 };
 
 } // namespace Orvane

@@ -124,7 +124,9 @@ protected:
         return op.Get();
     }
     static Ref<Image> Render(Operator *op, double time) {
-        return T::EvalImage(op, time, EvalOptions{.useCache = false});
+        EvalOptions options;
+        options.useCache = false;
+        return T::EvalImage(op, time, options);
     }
     static bool Track(Operator *op, double from, double to, RenderTask &task) {
         return op->ControlCommand(
@@ -177,7 +179,10 @@ TEST_F(MagicMaskTest, FillsTheParameterBlockAndHandsTheStrokesOverInPixels) {
     EXPECT_TRUE(calls[3].pos.empty() && calls[3].neg.empty());
 
     // A pre-calculation (windows only, no pixels) leaves the image alone: no kernel.
-    ASSERT_TRUE(Evaluate(op->FindMainOutput(), 0.0, EvalOptions{.flags = ReqFlagPreCalc, .useCache = false}));
+    EvalOptions shapeOnly;
+    shapeOnly.flags = ReqFlagPreCalc;
+    shapeOnly.useCache = false;
+    ASSERT_TRUE(Evaluate(op->FindMainOutput(), 0.0, shapeOnly));
     EXPECT_EQ(calls.size(), 6u);
 }
 
@@ -270,15 +275,25 @@ TEST_F(MagicMaskTest, RunsPropagateFrameToFrameAndRecordWhatTheyCovered) {
     EXPECT_EQ(Value(op, "ProcessedFramesHigh"), 8.0);
     EXPECT_EQ(provider->purges, 2); // each run ended with its leg
 
-    // A tracked frame renders from the run's matte; another frame, or other strokes, run the kernel afresh.
+    // A tracked frame renders from the run's matte; a frame outside the tracked span runs the kernel alone.
     Ref<Image> tracked = Render(op, 3.0);
     ASSERT_TRUE(tracked && provider->calls.size() == 7u);
     EXPECT_NEAR(tracked->GetFlt(6, 0).A, 6 / 15.0, 1e-6);
     ASSERT_TRUE(Render(op, 9.0));
     EXPECT_EQ(Call(7), std::tuple(9, 0, 1, 0, 30, 1, 0, 0, kDummy));
+    // With other strokes the tracked span is carried again from the reference frame (8) down to the frame asked
+    // for, as the run did; a render going on to the next frame carries on from there with one call.
     op->FindInput("Strokes")->SetValue(Strokes({{0.5, 0.5}}, {}));
     ASSERT_TRUE(Render(op, 3.0));
-    EXPECT_EQ(provider->calls.size(), 9u);
+    ASSERT_EQ(provider->calls.size(), 14u);
+    const int carried[] = {8, 7, 6, 5, 4, 3};
+    for (size_t i = 0; i < 6; ++i) {
+        EXPECT_EQ(std::get<0>(Call(8 + i)), carried[i]) << i;
+        EXPECT_EQ(std::get<8>(Call(8 + i)), i == 0 ? kDummy : kFull) << i;
+    }
+    ASSERT_TRUE(Render(op, 2.0));
+    ASSERT_EQ(provider->calls.size(), 15u);
+    EXPECT_EQ(Call(14), std::tuple(2, 0, 1, 0, 30, 1, 0, 1, kFull));
 
     // A run whose source gives no image says so and tracks nothing.
     ASSERT_TRUE(op->FindInput("Input")->ConnectTo(T::AddImageSource(doc, "Empty", {})->Out()));
