@@ -2,6 +2,7 @@
 // block, images and float lists by name, and the registry serves the last available provider.
 #include <gtest/gtest.h>
 
+#include "host/core/Tags.h"
 #include "host/image/Image.h"
 #include "host/image/NewImage.h"
 #include "host/krom/KROMBuffer.h"
