@@ -68,8 +68,9 @@ uintmax_t LimitBytes() {
     return mib << 20;
 }
 
-/// Drops the least recently written files while the folder's files add up to more than the limit.
-void Prune(const std::string &folder) {
+/// Drops the least recently written files while the folder's files add up to more than the limit; `keep`, the
+/// file just written, stays whatever its time stamp says.
+void Prune(const std::string &folder, const fs::path &keep) {
     struct Entry {
         fs::path path;
         uintmax_t bytes;
@@ -92,7 +93,7 @@ void Prune(const std::string &folder) {
     std::sort(entries.begin(), entries.end(), [](const Entry &a, const Entry &b) { return a.written < b.written; });
     for (const Entry &e : entries) {
         if (total <= limit) break;
-        if (fs::remove(e.path, ec)) total -= e.bytes;
+        if (e.path != keep && fs::remove(e.path, ec)) total -= e.bytes;
     }
 }
 
@@ -141,7 +142,7 @@ bool Store(const std::string &tool, uint64_t key, int frame, const Image &matte,
         fs::remove(temp, ec);
         return false;
     }
-    Prune(folder);
+    Prune(folder, final);
     return true;
 }
 

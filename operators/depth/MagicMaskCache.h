@@ -14,7 +14,7 @@
 // ("off" switches the cache off), else $XDG_CACHE_HOME/orvane/magicmask,
 // else ~/.cache/orvane/magicmask. Its size is bounded: after each write the
 // files beyond the limit (4 GiB, or $ORVANE_MAGIC_MASK_CACHE_LIMIT in MiB)
-// go, the least recently written first.
+// go, the least recently written first (never the file just written).
 //
 // File form: a 48-byte header (magic "OVMMASK1", the key, the frame, the data
 // window x0, y0, x1, y1, the frame's width and height, the plane count 2,

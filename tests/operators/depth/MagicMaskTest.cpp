@@ -121,6 +121,7 @@ protected:
     }
     void TearDown() override {
         UnregisterKernelProvider("GetObjectMask", provider.get());
+        unsetenv("ORVANE_MAGIC_MASK_CACHE_LIMIT");
         if (oldCache)
             setenv(kCacheVar, oldCache->c_str(), 1);
         else
@@ -413,6 +414,26 @@ TEST_F(MagicMaskTest, AnotherDocumentReadsTrackedMattesFromTheDiskCacheOnlyForTh
     EXPECT_EQ(provider->calls.size() - before, 6u) << T::ConsoleText(doc); // frames 2 to 5, as a run
     EXPECT_EQ(std::get<6>(Call(provider->calls.size() - 1)), 1);           // the calls were a run's
     EXPECT_EQ(CacheFiles().size(), 4u);
+}
+
+TEST_F(MagicMaskTest, TheDiskCacheKeepsToItsLimitByDroppingTheOldestFrames) {
+    // Frames of 1024 x 256 make files of 2 MiB (a 48-byte header, then two float planes); with a limit of 3 MiB a
+    // run of three frames leaves only the last one's.
+    setenv("ORVANE_MAGIC_MASK_CACHE_LIMIT", "3", 1);
+    const int w = 1024, h = 256;
+    Ref<Image> plate = NewImageTagList({{ImgWidth, w}, {ImgHeight, h}, {ImgDepth, DepthRGBAFlt32}});
+    ASSERT_TRUE(plate->AllocScanLineData());
+    plate->Fill(FltPixel{0.5f, 0.25f, 0.75f, 1.f});
+    Operator *op = AddMask(doc);
+    ASSERT_TRUE(op->FindInput("Input")->ConnectTo(T::AddImageSource(doc, "Big", plate)->Out()));
+    RenderTask task;
+    ASSERT_TRUE(Track(op, 1, 3, task)) << T::ConsoleText(doc);
+    const auto files = CacheFiles();
+    ASSERT_EQ(files.size(), 1u);
+    EXPECT_EQ(std::filesystem::file_size(files[0]), 48u + 2u * w * h * sizeof(float));
+    int32_t frame = -1;
+    std::ifstream(files[0], std::ios::binary).seekg(16).read(reinterpret_cast<char *>(&frame), sizeof frame);
+    EXPECT_EQ(frame, 3);
 }
 
 TEST_F(MagicMaskTest, StrokeButtonsEditTheStrokes) {
