@@ -1,6 +1,8 @@
 #include "operators/depth/MagicMaskCache.h"
 
 #include <algorithm>
+#include <atomic>
+#include <cmath>
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
@@ -116,7 +118,10 @@ bool Store(const std::string &tool, uint64_t key, int frame, const Image &matte,
     if (folder.empty() || !Fits(matte, propMask)) return false;
     std::error_code ec;
     fs::create_directories(folder, ec);
-    const std::string final = FilePath(folder, tool, key), temp = final + ".tmp" + std::to_string(::getpid());
+    // A temporary name of its own for each writer, in this process and in others.
+    static std::atomic<unsigned> writes{0};
+    const std::string final = FilePath(folder, tool, key),
+                      temp = final + ".tmp" + std::to_string(::getpid()) + "-" + std::to_string(writes++);
     const Header header = MakeHeader(key, frame, matte);
     const ImgRectI dw = matte.DataWindow();
     const int w = dw.x1 - dw.x0;
@@ -164,7 +169,10 @@ bool Load(const std::string &tool, uint64_t key, int frame, Image &matte, Image 
         if (!in.read(reinterpret_cast<char *>(row.data()), static_cast<std::streamsize>(w * sizeof(float))))
             return false;
         float *rgba = matte.Row<float>(y);
-        for (size_t x = 0; x < w; ++x) rgba[4 * x] = rgba[4 * x + 1] = rgba[4 * x + 2] = rgba[4 * x + 3] = row[x];
+        for (size_t x = 0; x < w; ++x) { // a matte is 0..1 whatever a damaged file says
+            const float a = std::isfinite(row[x]) ? std::clamp(row[x], 0.f, 1.f) : 0.f;
+            rgba[4 * x] = rgba[4 * x + 1] = rgba[4 * x + 2] = rgba[4 * x + 3] = a;
+        }
     }
     for (int y = dw.y0; y < dw.y1; ++y)
         if (!in.read(reinterpret_cast<char *>(propMask.Row<float>(y)), static_cast<std::streamsize>(w * sizeof(float))))
