@@ -24,15 +24,18 @@ constexpr char kMagic[8] = {'O', 'V', 'K', 'R', 'N', 'L', '0', '1'};
 
 } // namespace
 
-std::string KernelCacheFolder() {
-    if (const char *dir = std::getenv("ORVANE_KERNEL_CACHE")) {
+std::string UserCacheFolder(const char *envVar, const char *subfolder) {
+    if (const char *dir = std::getenv(envVar)) {
         if (std::string(dir) == "off") return {};
         if (*dir) return dir;
     }
-    if (const char *xdg = std::getenv("XDG_CACHE_HOME"); xdg && *xdg) return std::string(xdg) + "/orvane/kernels";
-    if (const char *home = std::getenv("HOME"); home && *home) return std::string(home) + "/.cache/orvane/kernels";
+    const std::string tail = std::string("/orvane/") + subfolder;
+    if (const char *xdg = std::getenv("XDG_CACHE_HOME"); xdg && *xdg) return xdg + tail;
+    if (const char *home = std::getenv("HOME"); home && *home) return home + ("/.cache" + tail);
     return {};
 }
+
+std::string KernelCacheFolder() { return UserCacheFolder("ORVANE_KERNEL_CACHE", "kernels"); }
 
 std::string KernelCacheKey(const std::string &driver, const std::string &options, const std::string &text) {
     uint64_t a = 0xcbf29ce484222325ull, b = 0x84222325cbf29ce4ull;

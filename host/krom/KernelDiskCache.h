@@ -19,6 +19,10 @@
 
 namespace Orvane {
 
+/// A per-user cache folder: $`envVar` when set ("" when it is "off"), else
+/// $XDG_CACHE_HOME/orvane/`subfolder`, else ~/.cache/orvane/`subfolder`; ""
+/// when there is no home either. Shared by the host's disk caches.
+ORVANE_API std::string UserCacheFolder(const char *envVar, const char *subfolder);
 /// The cache folder, or "" when the cache is off or there is no home.
 ORVANE_API std::string KernelCacheFolder();
 /// A file name for the key parts (hex of two independent 64-bit hashes).

@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <cmath>
+#include <functional>
 #include <vector>
 
 #include "host/flow/ControlCommand.h"
@@ -18,6 +19,7 @@
 #include "host/krom/KernelProvider.h"
 #include "host/matte/MaskInputs.h"
 #include "host/matte/MatteSteps.h"
+#include "operators/depth/MagicMaskCache.h"
 #include "operators/depth/MagicMaskStrokes.h"
 #include "operators/filter/BlurControls.h"
 #include "operators/frame/Registration.h"
@@ -241,6 +243,7 @@ MagicMask::Step MagicMask::DoMagicMask(double time, Request *req, Image *in, Ima
     const int frame = Frame(time);
 
     Ref<Image> propIn, matte;
+    std::optional<uint64_t> diskKey; // set for a frame whose matte belongs in the disk cache
     bool tracking = false;
     {
         std::lock_guard lock(state_);
@@ -257,10 +260,22 @@ MagicMask::Step MagicMask::DoMagicMask(double time, Request *req, Image *in, Ima
             matte = it->second.matte; // a tracked frame, rendered again with the run's settings and frame size
         }
     }
+    if (!matte && (tracking || InTrackedSpan(req, time))) {
+        // A run's frame is written to the disk cache; a frame of the tracked span not in memory may be read from it.
+        if (!in->DownloadGPUMem()) return Step::Failed;
+        diskKey = MagicMaskCache::FrameKey(s.key, frame, *in);
+        if (!tracking && (matte = LoadCached(frame, *diskKey, in))) {
+            std::lock_guard lock(state_);
+            kept_[frame] = Kept{Ref<Image>(), matte, s.key};
+        }
+    }
     if (!matte && !tracking && !CatchUp(time, req, s, in, propIn)) return Step::Failed;
     if (!matte) {
         Ref<Image> propOut;
         if (!RunKernel(time, req, s, in, propIn.Get(), propOut, matte)) return Step::Failed;
+        // The reference frame and the carried frames are the run's mattes; a lone frame in the span is not.
+        if (diskKey && (tracking || propIn || frame == Frame(req->GetInputNumber(referenceTimeIn_, 0.0))))
+            MagicMaskCache::Store(Name(), *diskKey, frame, *matte, *propOut);
         std::lock_guard lock(state_);
         if (tracking) kept_[frame] = Kept{propOut, matte, s.key};
         lastCall_ = frame;
@@ -279,8 +294,7 @@ bool MagicMask::CatchUp(double time, Request *req, const Settings &s, const Imag
     // the tracked matte rather than one from the reference frame's strokes alone. A render going on frame by frame
     // carries on from the last frame it did.
     const int frame = Frame(time), ref = Frame(req->GetInputNumber(referenceTimeIn_, 0.0));
-    const double low = req->GetInputNumber(processedLow_, 0.0), high = req->GetInputNumber(processedHigh_, 0.0);
-    if (frame == ref || !(high > low) || time < low - kEndSlack || time > high + kEndSlack) return true;
+    if (frame == ref || !InTrackedSpan(req, time)) return true;
     const Output *source = input_->Link();
     if (!source) return true;
     const int step = frame > ref ? 1 : -1;
@@ -307,15 +321,34 @@ bool MagicMask::CatchUp(double time, Request *req, const Settings &s, const Imag
                  Name().c_str(), static_cast<double>(f));
             return false;
         }
-        Ref<Image> propOut, matte;
-        if (!RunKernel(f, req, s, src, propIn.Get(), propOut, matte)) return false;
+        if (!src->DownloadGPUMem()) return false;
+        const uint64_t key = MagicMaskCache::FrameKey(s.key, f, *src);
+        Ref<Image> propOut, matte = LoadCached(f, key, src, &propOut);
+        const bool computed = !matte;
+        if (computed) {
+            if (!RunKernel(f, req, s, src, propIn.Get(), propOut, matte)) return false;
+            MagicMaskCache::Store(Name(), key, f, *matte, *propOut);
+        }
         propIn = propOut;
         std::lock_guard lock(state_);
         kept_[f] = Kept{Ref<Image>(), matte, s.key};
         chain_ = Chain{f, propOut, s.key};
-        lastCall_ = f;
+        if (computed) lastCall_ = f;
     }
     return true;
+}
+
+bool MagicMask::InTrackedSpan(Request *req, double time) const {
+    const double low = req->GetInputNumber(processedLow_, 0.0), high = req->GetInputNumber(processedHigh_, 0.0);
+    return high > low && time >= low - kEndSlack && time <= high + kEndSlack;
+}
+
+Ref<Image> MagicMask::LoadCached(int frame, uint64_t key, const Image *like, Ref<Image> *propMask) const {
+    const ImgRectI window = like->DataWindow();
+    Ref<Image> matte = WorkImage(like, DepthRGBAFlt32, window), prop = WorkImage(like, DepthAFlt32, window);
+    if (!matte || !prop || !MagicMaskCache::Load(Name(), key, frame, *matte, *prop)) return {};
+    if (propMask) *propMask = prop;
+    return matte;
 }
 
 bool MagicMask::RunKernel(double time, Request *req, const Settings &s, const Image *in, const Image *propIn,
@@ -483,15 +516,84 @@ void MagicMask::NotifyChanged(Input *in, Parameter *param, double time, TagList 
             OnEndRender();
         }
         if (in == stopTracking_) stop_ = true;
-        if (in == clearAll_) strokes_->ResetValue();
+        const bool editable = !GetDoc()->IsWriteProtected();
+        if (in == deleteStrokes_ && editable) DeleteLastStroke(time);
+        if (in == clearCurrent_ && editable) ClearStrokes([time](double key) { return Frame(key) == Frame(time); });
+        if (in == clearRange_ && editable)
+            ClearStrokes([start, end](double key) { return key >= start - kEndSlack && key <= end + kEndSlack; });
+        if (in == clearAll_ && editable) strokes_->ResetValue();
         if (in == cacheClear_) {
+            MagicMaskCache::Clear(Name());
             std::lock_guard lock(state_);
             kept_.clear();
+            chain_.reset();
         }
-        if (in == cacheRegen_)
-            Fail(nullptr, "%s: the disk cache is not built; tracked frames are kept in memory\n", Name().c_str());
+        if (in == cacheRegen_) RegenerateAll();
     }
     ThreadedOperator::NotifyChanged(in, param, time, tags);
+}
+
+void MagicMask::ClearStrokes(const std::function<bool(double keyTime)> &pick) {
+    if (!strokes_->IsAnimated()) {
+        strokes_->ResetValue(); // constant strokes hold on every frame, the current one and the range's among them
+        return;
+    }
+    AnimCurve left;
+    for (const Keyframe &k : strokes_->Curve()->Keys())
+        if (!pick(k.time)) left.SetKey(k.time, k.value, k.interp);
+    if (left.Empty())
+        strokes_->ResetValue();
+    else
+        strokes_->SetCurve(std::move(left));
+}
+
+void MagicMask::DeleteLastStroke(double time) {
+    // Without a selection on the picture, the stroke to delete is the last one added to the list Stroke Mode
+    // draws into (Sub: the negative strokes, else the positive ones), in the value in effect at `time`.
+    const Ref<Parameter> mode = strokeMode_->ValueAt(time);
+    const auto *number = dynamic_cast<const Number *>(mode.Get());
+    const bool negative = number && std::lround(number->value) == 1;
+    auto withoutLast = [negative](const Ref<Parameter> &value) -> Ref<Parameter> {
+        const auto *strokes = dynamic_cast<const MagicMaskStrokes *>(value.Get());
+        if (!strokes || (negative ? strokes->neg : strokes->pos).empty()) return {};
+        Ref<Parameter> copy = strokes->Copy();
+        auto &list = negative ? static_cast<MagicMaskStrokes *>(copy.Get())->neg
+                              : static_cast<MagicMaskStrokes *>(copy.Get())->pos;
+        list.pop_back();
+        return copy;
+    };
+    if (!strokes_->IsAnimated()) {
+        if (Ref<Parameter> value = withoutLast(strokes_->Constant())) strokes_->SetValue(value);
+        return;
+    }
+    // The key in effect: the last at or before `time`, else the first.
+    const std::vector<Keyframe> &keys = strokes_->Curve()->Keys();
+    auto it =
+        std::find_if(keys.rbegin(), keys.rend(), [time](const Keyframe &k) { return k.time <= time + kEndSlack; });
+    const Keyframe &key = it != keys.rend() ? *it : keys.front();
+    if (Ref<Parameter> value = withoutLast(key.value)) {
+        AnimCurve curve = *strokes_->Curve();
+        curve.SetKey(key.time, value, key.interp);
+        strokes_->SetCurve(std::move(curve));
+    }
+}
+
+void MagicMask::RegenerateAll() {
+    // The tracked span is tracked again from the reference frame out to both of its ends, rewriting the mattes in
+    // memory and on disk.
+    auto number = [](const Input *in) {
+        const auto *n = dynamic_cast<const Number *>(in->Constant().Get());
+        return n ? n->value : 0.0;
+    };
+    const double ref = number(referenceTimeIn_), low = number(processedLow_), high = number(processedHigh_);
+    if (!(high > low) || ref < low - kEndSlack || ref > high + kEndSlack) {
+        Fail(nullptr, "%s: nothing tracked to regenerate\n", Name().c_str());
+        return;
+    }
+    RenderTask task;
+    bool ok = ref >= high || RunTracking(ref, high, &task);
+    if (ok && ref > low && !task.IsAborted()) RunTracking(ref, low, &task);
+    OnEndRender();
 }
 
 bool MagicMask::ControlCommand(int command, const TagList &tags) {

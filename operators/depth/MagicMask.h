@@ -10,7 +10,7 @@
 // erode/dilate (a square minimum or maximum of |ErodeDilate| x the frame's
 // width pixels), threshold and gamma, invert, the solid and garbage mattes;
 // last, the colour is multiplied by the new alpha when Post Multiply Image is
-// on. RestoreFringe is kept with the document but changes nothing yet.
+// on. RestoreFringe is kept with the document but has no effect yet.
 //
 // The run: CCMD_Track (ControlCommand.h) or a track button steps frame by
 // frame from its first frame; each frame's propagated mask ("cachePropMaskOut")
@@ -19,10 +19,19 @@
 // ProcessedFramesLow/High take the span the run covered. The kept frames
 // (propagated mask and raw matte, keyed by the strokes, mode, refine range
 // and algorithm version) let a later render of a tracked frame reuse the
-// run's matte; a frame not kept, or kept under other settings, is computed
-// on its own (no propagated mask). The cache lives in memory only: it does
-// not outlast the tool, and does not see changes upstream of the tool (Clear
-// Cache drops it). There is no disk cache; Regenerate All says so.
+// run's matte. Each frame of a run, and each frame a render carries through
+// the tracked span, is also written to the disk cache (MagicMaskCache.h,
+// keyed besides by the source frame's pixels), which a later process reads
+// before carrying the masks again from the reference frame (CatchUp). A frame
+// outside the span is computed on its own (no propagated mask). Clear Cache
+// deletes the tool's files and the kept frames; Regenerate All tracks the
+// span again from the reference frame out to its ends.
+//
+// Stroke buttons: Delete Strokes removes the last stroke of the list Stroke
+// Mode draws into (there is no selection); Clear Current removes the strokes
+// keyed on the current frame, Clear Range those keyed within the render
+// range, Clear All every stroke; with constant strokes the first two clear
+// them all too (a constant holds on every frame).
 //
 // Run kinds: -1 no run, 4 a forward leg, 0 a reverse leg (or a forward leg
 // that reached the render end, left open for a reverse leg to follow).
@@ -33,6 +42,7 @@
 // main thread between renders.
 #include <atomic>
 #include <cstdint>
+#include <functional>
 #include <map>
 #include <memory>
 #include <mutex>
@@ -86,6 +96,13 @@ private:
     /// frame the render did) up to the frame before `time`, giving `propIn` for this frame. False with the tool's
     /// line when a source frame is missing or of another size.
     bool CatchUp(double time, Request *req, const Settings &s, const Image *in, Ref<Image> &propIn);
+    /// The frame lies in the span the runs covered (Processed Frames).
+    bool InTrackedSpan(Request *req, double time) const;
+    /// The disk cache's matte (and propagated mask) of `frame` under `key`, in images like `like`; null on a miss.
+    Ref<Image> LoadCached(int frame, uint64_t key, const Image *like, Ref<Image> *propMask = nullptr) const;
+    void ClearStrokes(const std::function<bool(double keyTime)> &pick);
+    void DeleteLastStroke(double time);
+    void RegenerateAll();
     bool RefineMatte(Request *req, Ref<Image> &out);
     bool ErodeDilate(Request *req, Image *img, double amount) const;
     /// A frame of a run needs a source image of the run's frame size; false with the tool's line.

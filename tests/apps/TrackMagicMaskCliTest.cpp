@@ -3,6 +3,7 @@
 #include <gtest/gtest.h>
 
 #include <cmath>
+#include <cstdlib>
 #include <filesystem>
 #include <string>
 
@@ -17,8 +18,25 @@ namespace {
 
 namespace fs = std::filesystem;
 
+/// Points the Magic Mask disk cache at a folder of the test for its lifetime (a user's cache must not leak in).
+struct CacheFolder {
+    explicit CacheFolder(const fs::path &dir) {
+        if (const char *old = std::getenv(kVar)) previous = old;
+        setenv(kVar, dir.c_str(), 1);
+    }
+    ~CacheFolder() {
+        if (previous.empty())
+            unsetenv(kVar);
+        else
+            setenv(kVar, previous.c_str(), 1);
+    }
+    static constexpr const char *kVar = "ORVANE_MAGIC_MASK_CACHE";
+    std::string previous;
+};
+
 TEST(MagicMaskCli, StrokesAndRuns) {
     TempDir dir;
+    const CacheFolder cache(dir.Path() / "cache");
     const fs::path path = dir.Path() / "magic-mask.flow";
     fs::copy_file(fs::path(ORVANE_SOURCE_DIR) / "examples/magic-mask.flow", path);
     const std::string flow = Quote(path.string()), example = ReadFile(path);
@@ -60,6 +78,7 @@ TEST(MagicMaskCli, StrokesAndRuns) {
 TEST(MagicMaskCli, TheExampleTracksItsObjectAndGradesIt) {
     Orvane::Test::LoadOperators();
     TempDir dir;
+    const CacheFolder cache(dir.Path() / "cache");
     const fs::path path = dir.Path() / "magic-mask.flow";
     fs::copy_file(fs::path(ORVANE_SOURCE_DIR) / "examples/magic-mask.flow", path);
     const std::string flow = Quote(path.string());

@@ -1,13 +1,19 @@
 // The Magic Mask tool against a provider of the object-mask kernel made here: a colour-distance matte (the mean
 // colour under the positive strokes against the mean under the negative ones), so every expected matte is worked
 // out from the plate alone. Covers the parameter block, the strokes' document form, a failing or absent provider,
-// the matte page, and tracking runs (propagation, the processed span, run ends).
+// the matte page, tracking runs (propagation, the processed span, run ends), the disk cache of tracked mattes and
+// the stroke buttons.
 #include <gtest/gtest.h>
 
 #include <algorithm>
 #include <cmath>
+#include <cstdlib>
+#include <filesystem>
+#include <fstream>
+#include <functional>
 #include <memory>
 #include <mutex>
+#include <optional>
 #include <string>
 #include <tuple>
 #include <vector>
@@ -106,11 +112,27 @@ Ref<Parameter> RampStrokes() { return Strokes({{15.5 / kW, 0.5 / kH, 15.5 / kW, 
 class MagicMaskTest : public ::testing::Test {
 protected:
     void SetUp() override {
+        // Every test writes its tracked mattes into a folder of its own (a user's cache must not leak in).
+        if (const char *old = std::getenv(kCacheVar)) oldCache = old;
+        setenv(kCacheVar, cacheDir.path.c_str(), 1);
         T::LoadOperators();
         RegisterKernelProvider("GetObjectMask", provider);
         doc.SetRenderRange(0, 10);
     }
-    void TearDown() override { UnregisterKernelProvider("GetObjectMask", provider.get()); }
+    void TearDown() override {
+        UnregisterKernelProvider("GetObjectMask", provider.get());
+        unsetenv("ORVANE_MAGIC_MASK_CACHE_LIMIT");
+        if (oldCache)
+            setenv(kCacheVar, oldCache->c_str(), 1);
+        else
+            unsetenv(kCacheVar);
+    }
+    static constexpr const char *kCacheVar = "ORVANE_MAGIC_MASK_CACHE";
+    std::vector<std::filesystem::path> CacheFiles() const {
+        std::vector<std::filesystem::path> files;
+        for (const auto &e : std::filesystem::directory_iterator(cacheDir.path)) files.push_back(e.path());
+        return files;
+    }
 
     /// A Magic Mask named `name` on a ramp, with the ramp's strokes and `settings`.
     Operator *AddMask(OrvaneDoc &d, const char *name = "Mask", TagList tags = {},
@@ -147,6 +169,8 @@ protected:
                 p.algoVer,   p.isTracking, p.hasCachePropMask, c.propWindow};
     }
 
+    T::TempDir cacheDir;
+    std::optional<std::string> oldCache;
     std::shared_ptr<ColourDistanceProvider> provider = std::make_shared<ColourDistanceProvider>();
     OrvaneDoc doc;
 };
@@ -320,6 +344,150 @@ TEST_F(MagicMaskTest, AForwardLegThatReachesTheEndStaysOpenOnceForAReverseLeg) {
     EXPECT_EQ(Call(3), std::tuple(8, 1, 1, 0, 30, 1, 1, 0, kDummy));
     ASSERT_TRUE(Render(op, 3.0)); // a frame no run covered, after the runs
     EXPECT_EQ(Call(provider->calls.size() - 1), std::tuple(3, 0, 1, 0, 30, 1, 0, 0, kDummy));
+}
+
+TEST_F(MagicMaskTest, AnotherDocumentReadsTrackedMattesFromTheDiskCacheOnlyForTheSamePlateAndStrokes) {
+    Operator *op = AddMask(doc);
+    RenderTask task;
+    ASSERT_TRUE(Track(op, 2, 5, task)) << T::ConsoleText(doc);
+    ASSERT_EQ(CacheFiles().size(), 4u);
+    const std::string saved = SaveDocument(doc);
+    const Ref<Image> tracked = Render(op, 3.0);
+    ASSERT_TRUE(tracked);
+
+    // Each row: what differs in the second document (or its cache), then the kernel calls a render of frame 3
+    // takes: none from the cache, else the masks carried from the reference frame (2) to 3.
+    const struct {
+        const char *what;
+        std::function<void(OrvaneDoc &)> change;
+        size_t calls;
+    } cases[] = {
+        {"nothing", [](OrvaneDoc &) {}, 0},
+        {"one source pixel",
+         [](OrvaneDoc &d) {
+             Ref<Image> plate = Ramp();
+             plate->PutFlt(7, 2, {0.f, 0.f, 0.f, 1.f});
+             dynamic_cast<T::ImageSourceTool *>(d.FindTool("MaskSrc"))->SetImage(plate);
+         },
+         2},
+        {"a stroke",
+         [](OrvaneDoc &d) {
+             d.FindTool("Mask")->FindInput("Strokes")->SetValue(Strokes({{0.9, 0.5}}, {{0.1, 0.5}}));
+         },
+         2},
+        {"the mode",
+         [](OrvaneDoc &d) {
+             T::SetNumbers(d.FindTool("Mask"), {{"Mode", 1}});
+         },
+         2},
+        {"truncated files",
+         [this](OrvaneDoc &) {
+             for (const auto &f : CacheFiles()) std::filesystem::resize_file(f, std::filesystem::file_size(f) - 4);
+         },
+         2},
+        {"a foreign header of the right size",
+         [this](OrvaneDoc &) {
+             for (const auto &f : CacheFiles())
+                 std::fstream(f, std::ios::in | std::ios::out | std::ios::binary).write("XXXX", 4);
+         },
+         2},
+    };
+    for (const auto &c : cases) {
+        OrvaneDoc other;
+        ASSERT_TRUE(LoadDocument(saved, other).ok) << c.what;
+        dynamic_cast<T::ImageSourceTool *>(other.FindTool("MaskSrc"))->SetImage(Ramp());
+        c.change(other);
+        const size_t before = provider->calls.size();
+        const Ref<Image> out = Render(other.FindTool("Mask"), 3.0);
+        ASSERT_TRUE(out) << c.what << ": " << T::ConsoleText(other);
+        EXPECT_EQ(provider->calls.size() - before, c.calls) << c.what;
+        for (int x = 0; x < kW && c.calls == 0; ++x) EXPECT_EQ(out->GetFlt(x, 1).A, tracked->GetFlt(x, 1).A) << x;
+    }
+
+    // Clear Cache deletes the tool's files and the kept mattes; Regenerate All tracks the span again and rewrites them.
+    T::SetNumbers(op, {{"CacheClear", 1}});
+    EXPECT_TRUE(CacheFiles().empty());
+    size_t before = provider->calls.size();
+    ASSERT_TRUE(Render(op, 3.0));
+    EXPECT_EQ(provider->calls.size() - before, 2u); // carried from the reference frame again
+    T::SetNumbers(op, {{"CacheClear", 1}, {"CacheRegen", 1}});
+    EXPECT_EQ(provider->calls.size() - before, 6u) << T::ConsoleText(doc); // frames 2 to 5, as a run
+    EXPECT_EQ(std::get<6>(Call(provider->calls.size() - 1)), 1);           // the calls were a run's
+    EXPECT_EQ(CacheFiles().size(), 4u);
+}
+
+TEST_F(MagicMaskTest, TheDiskCacheKeepsToItsLimitByDroppingTheOldestFrames) {
+    // Frames of 1024 x 256 make files of 2 MiB (a 48-byte header, then two float planes); with a limit of 3 MiB a
+    // run of three frames leaves only the last one's.
+    setenv("ORVANE_MAGIC_MASK_CACHE_LIMIT", "3", 1);
+    const int w = 1024, h = 256;
+    Ref<Image> plate = NewImageTagList({{ImgWidth, w}, {ImgHeight, h}, {ImgDepth, DepthRGBAFlt32}});
+    ASSERT_TRUE(plate->AllocScanLineData());
+    plate->Fill(FltPixel{0.5f, 0.25f, 0.75f, 1.f});
+    Operator *op = AddMask(doc);
+    ASSERT_TRUE(op->FindInput("Input")->ConnectTo(T::AddImageSource(doc, "Big", plate)->Out()));
+    RenderTask task;
+    ASSERT_TRUE(Track(op, 1, 3, task)) << T::ConsoleText(doc);
+    const auto files = CacheFiles();
+    ASSERT_EQ(files.size(), 1u);
+    EXPECT_EQ(std::filesystem::file_size(files[0]), 48u + 2u * w * h * sizeof(float));
+    int32_t frame = -1;
+    std::ifstream(files[0], std::ios::binary).seekg(16).read(reinterpret_cast<char *>(&frame), sizeof frame);
+    EXPECT_EQ(frame, 3);
+}
+
+TEST_F(MagicMaskTest, StrokeButtonsEditTheStrokes) {
+    // Keys on frames 0 (the current frame: the render start), 4 and 12 (outside the render range 0 to 10), each
+    // with two positive strokes and one negative. A result lists (key frame, positive, negative) per key, a
+    // constant as frame -1.
+    using Summary = std::vector<std::tuple<double, size_t, size_t>>;
+    const Ref<Parameter> three = Strokes({{0.1, 0.1}, {0.2, 0.2}}, {{0.3, 0.3}});
+    const struct {
+        bool animated;
+        std::vector<std::pair<const char *, double>> presses;
+        Summary expected;
+    } cases[] = {
+        {false, {{"DeleteStrokes", 1}}, {{-1, 1, 1}}},
+        {false, {{"StrokeMode", 1}, {"DeleteStrokes", 1}}, {{-1, 2, 0}}},
+        {false, {{"DeleteStrokes", 1}, {"DeleteStrokes", 1}, {"DeleteStrokes", 1}}, {{-1, 0, 1}}},
+        {false, {{"ClearCurrent", 1}}, {{-1, 0, 0}}},
+        {false, {{"ClearRange", 1}}, {{-1, 0, 0}}},
+        {true, {{"DeleteStrokes", 1}}, {{0, 1, 1}, {4, 2, 1}, {12, 2, 1}}},
+        {true, {{"ClearCurrent", 1}}, {{4, 2, 1}, {12, 2, 1}}},
+        {true, {{"ClearRange", 1}}, {{12, 2, 1}}},
+        {true, {{"ClearAll", 1}}, {{-1, 0, 0}}},
+    };
+    for (size_t i = 0; i < std::size(cases); ++i) {
+        OrvaneDoc local;
+        local.SetRenderRange(0, 10);
+        Operator *op = AddMask(local);
+        Input *strokes = op->FindInput("Strokes");
+        if (cases[i].animated) {
+            AnimCurve curve;
+            for (double t : {0.0, 4.0, 12.0}) curve.SetKey(t, three, KeyInterp::Hold);
+            ASSERT_TRUE(strokes->SetCurve(curve));
+        } else {
+            ASSERT_TRUE(strokes->SetValue(three));
+        }
+        for (const auto &[id, value] : cases[i].presses) T::SetNumbers(op, {{id, value}});
+        Summary got;
+        auto add = [&got](double t, const Ref<Parameter> &v) {
+            const ScriptVal form = v ? v->ToScript() : ScriptVal::Table();
+            auto count = [&form](const char *key) { return form.Find(key) ? form.Find(key)->ArrayLength() : 0; };
+            got.emplace_back(t, count("PosStrokes"), count("NegStrokes"));
+        };
+        if (strokes->IsAnimated())
+            for (const Keyframe &k : strokes->Curve()->Keys()) add(k.time, k.value);
+        else
+            add(-1, strokes->Constant());
+        EXPECT_EQ(got, cases[i].expected) << "case " << i;
+    }
+    // The positive stroke left is the first one drawn.
+    OrvaneDoc local;
+    Operator *op = AddMask(local);
+    op->FindInput("Strokes")->SetValue(three);
+    T::SetNumbers(op, {{"DeleteStrokes", 1}});
+    EXPECT_TRUE(op->FindInput("Strokes")->Constant()->Equals(*Strokes({{0.1, 0.1}}, {{0.3, 0.3}})));
 }
 
 } // namespace
