@@ -437,6 +437,9 @@ bool MagicMask::RefineMatte(Request *req, Ref<Image> &out) {
     v.high = req->GetInputNumber(highThreshold_, 1.0);
     v.invert = req->GetInputNumber(invertMatte_, 0.0) >= 0.5;
     v.postMultiply = req->GetInputNumber(postMultiply_, 1.0) >= 0.5;
+    if (req->GetInputNumber(restoreFringe_, 0.0) > 0.0 && GetDoc())
+        GetDoc()->PrintF(req, ConsoleWarning, "%s: Restore Fringe is not built yet and has no effect (time = %g)\n",
+                         Name().c_str(), req->Time());
     Image *img = out.Get();
     if (!KeyerMatte::BlurMatte(req, img, v) || !ErodeDilate(req, img, req->GetInputNumber(erodeDilate_, 0.0)) ||
         !KeyerMatte::Levels(req, img, v) || !KeyerMatte::Invert(req, img, v))
