@@ -1,10 +1,14 @@
 #include "apps/orvane/Cli.h"
 
+#include <algorithm>
+#include <cctype>
 #include <cmath>
 #include <cstdio>
 #include <cstdlib>
+#include <map>
 
 #include "host/app/Application.h"
+#include "host/app/FrameSpec.h"
 #include "host/core/ScriptVal.h"
 #include "host/core/Suggest.h"
 #include "host/core/Tags.h"
@@ -17,6 +21,75 @@
 #include "host/flow/RenderTask.h"
 
 namespace Orvane::Cli {
+
+size_t ParseSize(const std::string &text, const std::string &what) {
+    size_t used = 0;
+    double v = 0;
+    try {
+        v = std::stod(text, &used);
+    } catch (...) {
+        used = 0;
+    }
+    std::string unit = text.substr(used);
+    for (char &c : unit) c = static_cast<char>(std::toupper(static_cast<unsigned char>(c)));
+    if (!unit.empty() && unit.back() == 'B') unit.pop_back();
+    if (unit.size() == 2 && unit[1] == 'I') unit.pop_back();
+    static const std::map<std::string, double> kUnits = {
+        {"", 1.0}, {"K", 1024.0}, {"M", 1048576.0}, {"G", 1073741824.0}, {"T", 1099511627776.0}};
+    const auto u = kUnits.find(unit);
+    if (!used || u == kUnits.end() || !(v > 0) || !(v * u->second < 1e18))
+        throw CliError(ExitUsage, what + ": bad size '" + text + "' (examples: 512M, 8G)");
+    return static_cast<size_t>(v * u->second);
+}
+
+std::string FrameRuns(std::vector<int64_t> frames) {
+    std::sort(frames.begin(), frames.end());
+    frames.erase(std::unique(frames.begin(), frames.end()), frames.end());
+    std::string out;
+    for (size_t i = 0; i < frames.size();) {
+        size_t j = i;
+        while (j + 1 < frames.size() && frames[j + 1] == frames[j] + 1) ++j;
+        if (!out.empty()) out += ",";
+        out += std::to_string(frames[i]);
+        if (j > i) out += "-" + std::to_string(frames[j]);
+        i = j + 1;
+    }
+    return out;
+}
+
+std::vector<Operator *> ChooseSavers(const OrvaneDoc &doc, const std::vector<std::string> &names,
+                                     const std::string &command, const std::string &flow) {
+    std::vector<Operator *> savers;
+    const OvID saverClass("Saver");
+    auto isSaver = [&](const Operator *op) { return op->GetRegistry() && op->GetRegistry()->IsClassType(saverClass); };
+    if (names.empty()) {
+        for (Operator *op : doc.Tools())
+            if (isSaver(op)) savers.push_back(op);
+        if (savers.empty()) throw CliError(ExitUsage, command + ": " + flow + " has no Saver to render");
+    } else {
+        for (const std::string &name : names) {
+            Operator *op = doc.FindTool(name);
+            if (!op || !isSaver(op)) throw CliError(ExitUsage, command + ": the flow has no Saver '" + name + "'");
+            if (std::find(savers.begin(), savers.end(), op) == savers.end()) savers.push_back(op);
+        }
+    }
+    return savers;
+}
+
+std::vector<int64_t> RenderFrames(const OrvaneDoc &doc, const std::string &spec, const std::string &command) {
+    if (spec.empty())
+        return FrameRange(static_cast<int64_t>(std::floor(doc.RenderStart())),
+                          static_cast<int64_t>(std::floor(doc.RenderEnd())));
+    std::vector<int64_t> frames;
+    std::string error;
+    if (!ParseFrameSpec(spec, frames, error)) throw CliError(ExitUsage, command + ": --frames: " + error);
+    return frames;
+}
+
+void SpanWholeRange(RenderTask &task, const std::vector<int64_t> &frames) {
+    task.startTime = frames.empty() ? 0.0 : static_cast<double>(*std::min_element(frames.begin(), frames.end()));
+    task.endTime = frames.empty() ? 0.0 : static_cast<double>(*std::max_element(frames.begin(), frames.end()));
+}
 
 void LoadLibrary() {
     std::string error;

@@ -1,12 +1,14 @@
 #pragma once
 // Shared pieces of the orvane command line: exit codes, errors, loading the
 // tool library and documents, JSON text.
+#include <cstdint>
 #include <stdexcept>
 #include <string>
 #include <vector>
 
 namespace Orvane {
 class IDeviceContext;
+class Operator;
 class OrvaneDoc;
 class RenderTask;
 } // namespace Orvane
@@ -15,8 +17,9 @@ namespace Orvane::Cli {
 
 enum ExitCode : int {
     ExitOk = 0,
-    ExitUsage = 2,  ///< a bad command line or document
-    ExitFailed = 3, ///< a tool failed: nothing (or not everything) was produced
+    ExitUsage = 2,     ///< a bad command line or document
+    ExitFailed = 3,    ///< a tool failed: nothing (or not everything) was produced
+    ExitNoCluster = 4, ///< the cluster's commands (sbatch) are not on PATH: nothing was submitted
     ExitInterrupted = 130,
 };
 
@@ -56,6 +59,26 @@ void ReportDeviceLog(const RenderTask &task);
 std::string JsonString(const std::string &s);
 std::string JsonNumber(double v);
 
+/// A memory size ("512M", "8G", "1.5G"; K, M, G, T with an optional B or iB;
+/// plain bytes without a unit) in bytes; a usage error naming `what`
+/// ("render: --memory-limit") otherwise.
+size_t ParseSize(const std::string &text, const std::string &what);
+/// "1001-1012,1015": a frame list in ascending runs.
+std::string FrameRuns(std::vector<int64_t> frames);
+
+/// The Savers a render writes: those `names` gives, else every Saver of the
+/// document; a usage error (starting "COMMAND: ") for none or an unknown name.
+std::vector<Operator *> ChooseSavers(const OrvaneDoc &doc, const std::vector<std::string> &names,
+                                     const std::string &command, const std::string &flow);
+/// The frames of a render: the frame list `spec` (host/app/FrameSpec.h), else
+/// the document's render range.
+std::vector<int64_t> RenderFrames(const OrvaneDoc &doc, const std::string &spec, const std::string &command);
+/// Gives the task the whole list's first and last frame: Saver-relative
+/// numbering counts from there, so every chunk of a job array names its
+/// files alike, and a name without a number gets one when the whole list has
+/// several frames.
+void SpanWholeRange(RenderTask &task, const std::vector<int64_t> &frames);
+
 /// Parses "a,b,c,..." into exactly `count` numbers (count 0: any number >= 1).
 std::vector<double> ParseNumberList(const std::string &text, size_t count, const char *what);
 
@@ -78,5 +101,8 @@ int RunPick(const std::vector<std::string> &args);
 int RunTrack(const std::vector<std::string> &args);
 int RunStroke(const std::vector<std::string> &args);
 int RunScript(const std::vector<std::string> &args);
+int RunSubmit(const std::vector<std::string> &args);
+int RunStatus(const std::vector<std::string> &args);
+int RunResubmit(const std::vector<std::string> &args);
 
 } // namespace Orvane::Cli

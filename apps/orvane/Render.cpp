@@ -55,26 +55,6 @@ struct RenderArgs {
     bool skipExisting = false, json = false, lenient = false, allowScripts = false, strictScripts = false;
 };
 
-size_t ParseSize(const std::string &text) {
-    size_t used = 0;
-    double v = 0;
-    try {
-        v = std::stod(text, &used);
-    } catch (...) {
-        used = 0;
-    }
-    std::string unit = text.substr(used);
-    for (char &c : unit) c = static_cast<char>(std::toupper(static_cast<unsigned char>(c)));
-    if (!unit.empty() && unit.back() == 'B') unit.pop_back();
-    if (unit.size() == 2 && unit[1] == 'I') unit.pop_back();
-    static const std::map<std::string, double> kUnits = {
-        {"", 1.0}, {"K", 1024.0}, {"M", 1048576.0}, {"G", 1073741824.0}, {"T", 1099511627776.0}};
-    const auto u = kUnits.find(unit);
-    if (!used || u == kUnits.end() || !(v > 0))
-        throw CliError(ExitUsage, "render: bad --memory-limit '" + text + "' (examples: 512M, 8G)");
-    return static_cast<size_t>(v * u->second);
-}
-
 RenderArgs ParseArgs(const std::vector<std::string> &args) {
     RenderArgs a;
     std::vector<std::string> positional;
@@ -103,7 +83,7 @@ RenderArgs ParseArgs(const std::vector<std::string> &args) {
         } else if (arg == "--proxy") {
             a.proxy = whole("proxy scale", 1);
         } else if (arg == "--memory-limit") {
-            a.memoryLimit = ParseSize(value());
+            a.memoryLimit = ParseSize(value(), "render: --memory-limit");
         } else if (arg == "--device") {
             a.device = value();
         } else if (arg == "--skip-existing") {
@@ -137,22 +117,6 @@ RenderTask *g_task = nullptr;
 extern "C" void OnSignal(int) {
     // The first signal stops after the frame in hand; a second one abandons it.
     if (g_signals.fetch_add(1) >= 1 && g_task) g_task->Abort();
-}
-
-/// "1001-1012,1015": a frame list in ascending runs.
-std::string FrameRuns(std::vector<int64_t> frames) {
-    std::sort(frames.begin(), frames.end());
-    frames.erase(std::unique(frames.begin(), frames.end()), frames.end());
-    std::string out;
-    for (size_t i = 0; i < frames.size();) {
-        size_t j = i;
-        while (j + 1 < frames.size() && frames[j + 1] == frames[j] + 1) ++j;
-        if (!out.empty()) out += ",";
-        out += std::to_string(frames[i]);
-        if (j > i) out += "-" + std::to_string(frames[j]);
-        i = j + 1;
-    }
-    return out;
 }
 
 /// A field of a JSON event: its name and its value as JSON text.
@@ -374,35 +338,11 @@ int RunRender(const std::vector<std::string> &rawArgs) {
     LoadFlow(a.flow, doc, a.lenient, a.json);
     for (const std::string &set : a.sets) ApplySet(doc, set);
 
-    // The Savers to render: those named, else all of them.
-    std::vector<Operator *> savers;
-    const OvID saverClass("Saver");
-    auto isSaver = [&](const Operator *op) { return op->GetRegistry() && op->GetRegistry()->IsClassType(saverClass); };
-    if (a.savers.empty()) {
-        for (Operator *op : doc.Tools())
-            if (isSaver(op)) savers.push_back(op);
-        if (savers.empty()) throw CliError(ExitUsage, "render: " + a.flow + " has no Saver to render");
-    } else {
-        for (const std::string &name : a.savers) {
-            Operator *op = doc.FindTool(name);
-            if (!op || !isSaver(op)) throw CliError(ExitUsage, "render: the flow has no Saver '" + name + "'");
-            if (std::find(savers.begin(), savers.end(), op) == savers.end()) savers.push_back(op);
-        }
-    }
-
-    std::vector<int64_t> frames;
+    const std::vector<Operator *> savers = ChooseSavers(doc, a.savers, "render", a.flow);
+    std::vector<int64_t> frames = RenderFrames(doc, a.frames, "render");
+    RenderTask task;
+    SpanWholeRange(task, frames);
     std::string error;
-    if (a.frames.empty()) {
-        frames = FrameRange(static_cast<int64_t>(std::floor(doc.RenderStart())),
-                            static_cast<int64_t>(std::floor(doc.RenderEnd())));
-    } else if (!ParseFrameSpec(a.frames, frames, error)) {
-        throw CliError(ExitUsage, "render: --frames: " + error);
-    }
-    // Saver-relative numbering counts from the whole range's first frame, so
-    // every chunk of a job array numbers its files alike; a name without a
-    // number gets one when the whole range has several frames.
-    const int64_t rangeStart = frames.empty() ? 0 : *std::min_element(frames.begin(), frames.end());
-    const int64_t rangeEnd = frames.empty() ? 0 : *std::max_element(frames.begin(), frames.end());
     if (!a.chunk.empty() && !TakeChunk(a.chunk, frames, error)) throw CliError(ExitUsage, "render: --chunk: " + error);
 
     Log log(a.json, frames.size());
@@ -412,11 +352,8 @@ int RunRender(const std::vector<std::string> &rawArgs) {
         SetPixelPoolLimit(a.memoryLimit / 4);
     }
 
-    RenderTask task;
     task.SetDevice(ChooseDevice("render", a.device, doc, a.json));
     task.proxyScale = a.proxy;
-    task.startTime = static_cast<double>(rangeStart);
-    task.endTime = static_cast<double>(rangeEnd);
     EvalOptions options;
     options.task = &task;
     options.flags = a.proxy > 1 ? ReqFlagProxy : 0;

@@ -46,6 +46,36 @@ const Command kCommands[] = {
   Exit: 0 all written, 2 bad command line or document, 3 a frame failed (or, with
   --strict-scripts, a script was not run), 130 interrupted.
 )"},
+    {"submit", RunSubmit, R"(orvane submit FLOW [options]
+  Submits the flow's render to a Slurm cluster as one job array (docs/FARM.md):
+  checks the flow, copies it with absolute file names into a job folder beside
+  the first Saver's files (orvane-jobs/FLOW-TIME/: the copy, job.json, the batch
+  script, the tasks' logs) and runs sbatch. Prints the job ID and the folder.
+  --frames SPEC         frames to render, as for render (default: the render range)
+  --chunks N            N array tasks, each a contiguous piece of the frames
+  --chunk-size N        N frames a task (default 10)
+  --saver NAME          render only this Saver (repeatable)
+  --partition P, --time LIMIT   the Slurm partition and time limit
+  --mem SIZE            memory a task asks for (512M, 8G); its render bounds its
+                        image memory to three quarters of it
+  --cpus N              CPUs a task asks for; its render runs N threads
+  --after JOBID         start once that job has ended well
+  --dry-run             print the batch script; write and submit nothing
+  Exit: 0 submitted, 2 bad command line or document, 3 sbatch refused the job,
+  4 sbatch is not on PATH (nothing written or submitted).
+)"},
+    {"status", RunStatus, R"(orvane status JOBFOLDER
+  Says, per chunk of a submitted job, done (every frame's files exist),
+  running, failed (its missing frames and first error) or pending, from the
+  files, the tasks' logs and Slurm's view when squeue or sacct is on PATH.
+  Exit: 0 every frame written, 2 not a job folder, 3 frames missing.
+)"},
+    {"resubmit", RunResubmit, R"(orvane resubmit JOBFOLDER [--dry-run]
+  Submits again the chunks of a job with missing frames that Slurm does not
+  hold queued or running; frames written stay (--skip-existing).
+  --dry-run             print the batch script; write and submit nothing
+  Exit: as for submit; 0 also when nothing is left to submit.
+)"},
     {"eval", RunEval, R"(orvane eval FLOW TOOL[.OUTPUT] [options]
   Evaluates one output of a flow and prints its size, windows, depth, channel
   statistics, the pixels asked for and the console lines. Savers write nothing.

@@ -9,11 +9,11 @@
 namespace Orvane::clitest {
 namespace {
 
-constexpr const char *kFlow = "Orvane.Document { Tools = { Background1 = Background { } } }\n";
+constexpr const char *kTrackFlow = "Orvane.Document { Tools = { Background1 = Background { } } }\n";
 
 TEST(TrackCli, RefusesWhatCannotBeTrackedAndLeavesTheFlowAlone) {
     TempDir dir;
-    const auto path = dir.File("t.flow", kFlow);
+    const auto path = dir.File("t.flow", kTrackFlow);
     const std::string flow = Quote(path.string());
     const struct {
         std::string args;
@@ -31,7 +31,7 @@ TEST(TrackCli, RefusesWhatCannotBeTrackedAndLeavesTheFlowAlone) {
         const CliRun run = Orvane(c.args);
         EXPECT_EQ(run.exitCode, c.exit) << c.args << "\n" << run.err;
         EXPECT_NE(run.err.find(c.message), std::string::npos) << c.args << "\n" << run.err;
-        EXPECT_EQ(ReadFile(path), kFlow) << c.args;
+        EXPECT_EQ(ReadFile(path), kTrackFlow) << c.args;
     }
     const CliRun help = Orvane("--help");
     EXPECT_NE(help.out.find("orvane track FLOW TOOL [options]"), std::string::npos) << help.out;
