@@ -116,7 +116,7 @@ public:
             out = Value();
             Space();
             return i_ == s_.size();
-        } catch (const std::runtime_error &) {
+        } catch (const std::exception &) { // a bad number or escape as well as a syntax error
             return false;
         }
     }

@@ -191,7 +191,9 @@ std::string Synopsis(const Command &c) {
 void PrintUsage(std::FILE *to) {
     std::fputs("usage: orvane COMMAND [ARGS]   (orvane COMMAND --help for details)\n\ncommands:\n", to);
     for (const Command &c : kCommands) std::fprintf(to, "  %s\n", Synopsis(c).c_str());
-    std::fputs("\nexit codes: 0 done, 2 bad command line or document, 3 a tool or frame failed, 130 interrupted\n", to);
+    std::fputs("\nexit codes: 0 done, 2 bad command line or document, 3 a tool or frame failed, 4 Slurm not reachable "
+               "(submit), 130 interrupted\n",
+               to);
 }
 
 bool AsksForHelp(const std::vector<std::string> &args) {

@@ -211,6 +211,26 @@ TEST(CliFarm, TasksRenderWhatALocalRenderDoesAndStatusAndResubmitFollowThem) {
     EXPECT_FALSE(Contains(dry.out, "--dependency"));
     EXPECT_FALSE(fs::exists(job / "submit-2.sh"));
 
+    // Slurm's view, where its commands answer: the queue holds task 0 running, accounting says task 3 ran out of
+    // time. A running chunk is not submitted again.
+    std::ofstream(bin / "squeue") << "#!/bin/sh\necho '4242_0|RUNNING'\n";
+    std::ofstream(bin / "sacct") << "#!/bin/sh\necho '4242_1|COMPLETED'\necho '4242_3|TIMEOUT'\n";
+    fs::permissions(bin / "squeue", fs::perms::owner_all);
+    fs::permissions(bin / "sacct", fs::perms::owner_all);
+    CliRun viewed, skipRunning;
+    {
+        PathOnly path(bin);
+        viewed = Orvane("status " + Quote(job.string()));
+        skipRunning = Orvane("resubmit " + Quote(job.string()) + " --dry-run");
+    }
+    EXPECT_FALSE(Contains(viewed.out, "Slurm not reachable"));
+    EXPECT_TRUE(Has(viewed.out, "chunk 1/4 frames 1-6: running (missing 1-6)\n"));
+    EXPECT_TRUE(
+        Has(viewed.out, "chunk 4/4 frames 19-24: failed (missing 19-24): slurm: TIMEOUT; no error in the logs\n"));
+    EXPECT_EQ(After(skipRunning.out, "#SBATCH --array="), "2-3");
+    fs::remove(bin / "squeue");
+    fs::remove(bin / "sacct");
+
     // With the input back, the resubmitted tasks complete the job; frames written stay as they are.
     fs::rename(dir.Path() / "g.0014.png", missing);
     CliRun again;
