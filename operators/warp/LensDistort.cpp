@@ -435,6 +435,10 @@ void LensDistort::Process(Request *req) {
         req->SetOutputData(output_, nullptr);
         return;
     }
+    auto outOfMemory = [&] {
+        FailOutOfMemory(req);
+        req->SetOutputData(output_, nullptr);
+    };
     Setup s;
     ReadSetup(req, src, nullptr, s);
     const bool precalc = req->IsPreCalc();
@@ -455,9 +459,7 @@ void LensDistort::Process(Request *req) {
         dst = NewImageTagList(
             {{ImgLikeImage, dst.Get()}, {ImgDepth, DepthRGBAFlt32}, {ImgDataWindow, &window}, {ImgNoData, precalc}});
     if (!dst) {
-        FailOutOfMemory(req);
-        req->SetOutputData(output_, nullptr);
-        return;
+        return outOfMemory();
     }
     if (!precalc && !window.IsNull()) {
         if (s.width >= 3 && s.mode == 0 && lensdistort::DeviceTakes(*s.model) && IsGPUEnabled(req, true) &&
@@ -466,9 +468,7 @@ void LensDistort::Process(Request *req) {
             return;
         }
         if (!dst->AllocScanLineData() || !src->DownloadGPUMem()) {
-            FailOutOfMemory(req);
-            req->SetOutputData(output_, nullptr);
-            return;
+            return outOfMemory();
         }
         // Reads beyond the data window give canvas (or the border, Duplicate) by the sampler's rules; a copy is
         // made when the source is not float, or the frame is the window to read.
@@ -477,9 +477,7 @@ void LensDistort::Process(Request *req) {
         if (!s.distortionMap && (src->Depth() != DepthRGBAFlt32 || read != src->DataWindow()))
             source = src->CopyOfImageTagList({{ImgDataWindow, &read}, {ImgDepth, DepthRGBAFlt32}});
         if (!source) {
-            FailOutOfMemory(req);
-            req->SetOutputData(output_, nullptr);
-            return;
+            return outOfMemory();
         }
         setup_ = s;
         source_ = source.Get();
