@@ -27,6 +27,8 @@ packages=("$@")
   python3-opencv
   # Object mattes from strokes: segmentation, optical flow and the network runner of OpenCV.
   libopencv-dev
+  # Farm rendering is tested on a one-node Slurm cluster (scripts/slurm-cluster.sh).
+  slurm-wlm munge
 )
 missing=()
 for p in "${packages[@]}"; do

@@ -517,18 +517,56 @@ struct ChunkState {
     bool queued = false; ///< Slurm has the task in its queue, running or waiting
 };
 
+/// The array task numbers of a Slurm task list such as "0", "1-3" or "0,2-5%2".
+std::vector<int> ArrayTasks(const std::string &list) {
+    std::vector<int> tasks;
+    std::stringstream parts(list.substr(0, list.find('%')));
+    for (std::string part; std::getline(parts, part, ',');) {
+        int first = 0, last = 0;
+        const char *text = part.c_str();
+        char *end = nullptr;
+        first = static_cast<int>(std::strtol(text, &end, 10));
+        if (end == text) continue;
+        last = *end == '-' ? static_cast<int>(std::strtol(end + 1, &end, 10)) : first;
+        for (int t = first; t <= last && t - first < 100000; ++t) tasks.push_back(t);
+    }
+    return tasks;
+}
+
 /// Slurm's state of each array task of the job's submissions (latest first
-/// wins), when squeue or sacct is on PATH; `reachable` false otherwise.
+/// wins); `reachable` false when Slurm's controller does not answer.
 std::map<int, std::string> SlurmStates(const Job &job, bool &reachable) {
     std::map<int, std::string> states;
-    const std::string squeue = FindOnPath("squeue"), sacct = FindOnPath("sacct");
-    reachable = !squeue.empty() || !sacct.empty();
+    const std::string squeue = FindOnPath("squeue"), scontrol = FindOnPath("scontrol"), sacct = FindOnPath("sacct");
+    // Every query has a time limit: a controller that does not answer must not hold status up.
+    auto query = [](const std::string &command) {
+        int status = 0;
+        std::string out = Capture("timeout 30 " + command + " 2>/dev/null", status);
+        return status == 0 ? out : std::string();
+    };
+    int answered = 1;
+    if (!scontrol.empty())
+        Capture("timeout 30 " + ShellWord(scontrol) + " ping >/dev/null 2>&1", answered);
+    else if (!squeue.empty())
+        Capture("timeout 30 " + ShellWord(squeue) + " -h -o %i >/dev/null 2>&1", answered);
+    reachable = answered == 0;
     if (!reachable) return states;
     for (const Job::Submission &sub : job.submissions) {
         std::map<int, std::string> found;
+        // The controller remembers ended tasks for a while: one line per task, or per range of tasks
+        // that were never started ("ArrayTaskId=1-3").
+        auto readControl = [&](const std::string &command) {
+            std::stringstream lines(query(command));
+            for (std::string line; std::getline(lines, line);) {
+                const size_t task = line.find(" ArrayTaskId="), state = line.find(" JobState=");
+                if (task == std::string::npos || state == std::string::npos) continue;
+                const std::string list = line.substr(task + 13, line.find(' ', task + 1) - task - 13);
+                const std::string value = line.substr(state + 10, line.find(' ', state + 1) - state - 10);
+                for (int t : ArrayTasks(list)) found.emplace(t, value);
+            }
+        };
         auto read = [&](const std::string &command, char separator) {
-            int status = 0;
-            std::stringstream lines(Capture(command + " 2>/dev/null", status));
+            std::stringstream lines(query(command));
             for (std::string line; std::getline(lines, line);) {
                 const size_t sep = line.find(separator), under = line.find('_');
                 if (sep == std::string::npos || under == std::string::npos || under > sep) continue;
@@ -537,8 +575,10 @@ std::map<int, std::string> SlurmStates(const Job &job, bool &reachable) {
                     found.emplace(std::stoi(id), state.substr(0, state.find(' ')));
             }
         };
-        // The queue knows running and pending tasks; accounting (where kept) how the others ended.
+        // The queue knows running and pending tasks; the controller and accounting (where kept) how the
+        // others ended.
         if (!squeue.empty()) read(ShellWord(squeue) + " -h -r -j " + sub.job + " -o '%i|%T'", '|');
+        if (!scontrol.empty()) readControl(ShellWord(scontrol) + " -o show job " + sub.job);
         if (!sacct.empty()) read(ShellWord(sacct) + " -n -P -X -j " + sub.job + " -o JobID,State", '|');
         for (const auto &[task, state] : found) states[task] = state;
     }
@@ -557,7 +597,11 @@ std::string FirstError(const Job &job, int task, bool &finished, bool &logged) {
         if (!JsonReader(line).Read(event)) continue;
         const std::string kind = TextField(event, "event");
         if (kind == "summary") finished = true;
-        if (kind == "error" && first.empty()) first = TextField(event, "error");
+        // The render's own words for a stop ("frames written before the stop are listed above") point into
+        // the log; here the missing frames are listed instead.
+        if (kind == "error" && first.empty())
+            first = TextField(event, "code") == "interrupted" ? "the render was stopped by a signal"
+                                                              : TextField(event, "error");
     }
     if (!first.empty()) return first;
     std::ifstream errors(TaskErrors(job, task));
@@ -698,7 +742,8 @@ int RunSubmit(const std::vector<std::string> &args) {
     if (a.dryRun) {
         job.folder = parent / name;
         job.flow = (job.folder / fs::path(a.flow).filename()).string();
-        std::printf("# --dry-run: nothing written, nothing submitted\n");
+        // The script alone on standard output, so that it can be saved and handed to sbatch as it is.
+        std::fprintf(stderr, "--dry-run: nothing written, nothing submitted\n");
         SubmitTasks(job, tasks, true, true, frames);
         return ExitOk;
     }
@@ -757,7 +802,7 @@ int RunResubmit(const std::vector<std::string> &args) {
     OrvaneDoc doc;
     LoadFlow(job.flow, doc, true);
     const std::vector<int64_t> frames = RenderFrames(doc, job.frames, "resubmit");
-    if (dryRun) std::printf("# --dry-run: nothing written, nothing submitted\n");
+    if (dryRun) std::fprintf(stderr, "--dry-run: nothing written, nothing submitted\n");
     const std::string id = SubmitTasks(job, tasks, false, dryRun, frames);
     if (!dryRun)
         std::printf("submitted job %s: %zu chunks\njob folder: %s\n", id.c_str(), tasks.size(),
