@@ -141,6 +141,44 @@ TEST(CliFarm, WithoutSbatchNothingIsWrittenOrSubmitted) {
     EXPECT_FALSE(fs::exists(dir.Path() / "out"));
 }
 
+TEST(CliFarm, TheCopyOfALoadersClipListNamesItsFilesAbsolutely) {
+    TempDir dir;
+    // Two 4-frame clips one after the other, by names relative to the flow, the second with a proxy.
+    for (const char *name : {"a", "b"})
+        ASSERT_EQ(Orvane("render " + Quote(dir.File(std::string(name) + ".flow",
+                                                    FarmFlow((dir.Path() / name / "f.####.png").string(), 4))
+                                               .string()))
+                      .exitCode,
+                  0);
+    const auto flow = dir.File(
+        "list.flow", "Orvane.Document { Version = 1, RenderRange = { 1, 8 }, Tools = {\n"
+                     "  In = Loader { Clips = { { Filename = \"a/f.0001.png\", GlobalStart = 1 },\n"
+                     "    { Filename = \"b/f.0001.png\", ProxyFilename = \"b/f.0001.png\", GlobalStart = 5 } },\n"
+                     "    Inputs = { } },\n"
+                     "  Out = Saver { Inputs = { Clip = \"out/c.####.tga\", CreateDir = 1, Input = In.Output } },\n"
+                     "} }\n");
+    ASSERT_EQ(Orvane("render " + Quote(flow.string()) + " --frames 8").exitCode, 0);
+    const std::string reference = ReadFile(dir.Path() / "out/c.0008.tga");
+    fs::remove(dir.Path() / "out/c.0008.tga");
+
+    const fs::path bin = dir.Path() / "bin";
+    FakeSbatch(bin);
+    CliRun submitted;
+    {
+        PathOnly path(bin);
+        submitted = Orvane("submit " + Quote(flow.string()) + " --frames 8");
+    }
+    ASSERT_EQ(submitted.exitCode, 0) << submitted.err;
+    const fs::path job = After(submitted.out, "job folder: ");
+    const std::string copy = ReadFile(job / "list.flow");
+    EXPECT_TRUE(Has(copy, "Filename = \"" + (dir.Path() / "a/f.0001.png").string() + "\""));
+    EXPECT_TRUE(Has(copy, "ProxyFilename = \"" + (dir.Path() / "b/f.0001.png").string() + "\""));
+    EXPECT_FALSE(Contains(copy, "\"b/f.0001.png\""));
+    // The copy, in its own folder, renders what the original did.
+    EXPECT_EQ(RunTask(job / "submit-1.sh", 0), 0);
+    EXPECT_EQ(ReadFile(dir.Path() / "out/c.0008.tga"), reference);
+}
+
 TEST(CliFarm, TasksRenderWhatALocalRenderDoesAndStatusAndResubmitFollowThem) {
     TempDir dir;
     // The input: 24 gradient frames, frame 14 missing. The shot reads them and writes TGA files, both by names

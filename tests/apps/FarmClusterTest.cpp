@@ -89,6 +89,15 @@ TEST_F(FarmCluster, FourChunksWriteTheFilesOfALocalRender) {
     const CliRun tested = Shell("sbatch --test-only " + Quote(script.string()));
     EXPECT_EQ(tested.exitCode, 0) << tested.out;
 
+    // A job Slurm refuses: exit 3 with its reason; the folder stays, with no submission recorded.
+    const CliRun refused = Orvane("submit " + Quote(shot.string()) + " --chunks 4 --partition nosuch");
+    EXPECT_EQ(refused.exitCode, 3);
+    EXPECT_TRUE(Has(refused.err, "sbatch did not take the job (exit 1): sbatch: error: invalid partition"));
+    const fs::path kept =
+        refused.err.substr(refused.err.find("(the script is ") + 15,
+                           refused.err.rfind("/submit-1.sh)") - refused.err.find("(the script is ") - 15);
+    EXPECT_TRUE(Has(ReadFile(kept / "job.json"), "\"submissions\": []\n"));
+
     const CliRun submitted = Orvane("submit " + Quote(shot.string()) + " --chunks 4");
     ASSERT_EQ(submitted.exitCode, 0) << submitted.err;
     const std::string id = JobId(submitted);
