@@ -5,7 +5,7 @@
 # the last task leaving the queue. The node runs as many tasks at once as it has
 # CPUs, so the same 4 chunks are also run locally that many at a time: the
 # difference between those two is the submission, scheduling and task start-up.
-#   bench/farm-overhead.sh [BUILD_DIR]   (default build/; needs root, slurm-wlm, munge)
+#   bench/farm-overhead.sh [BUILD_DIR]   (default build/; needs slurm-wlm and munge)
 set -euo pipefail
 root=$(cd "$(dirname "$0")/.." && pwd)
 orvane="$(cd "${1:-$root/build}" && pwd)/bin/orvane"

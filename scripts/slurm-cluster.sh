@@ -1,7 +1,8 @@
 #!/usr/bin/env bash
 # A one-node Slurm cluster in a folder of its own, for the farm tests and for
 # trying `orvane submit` on one machine. It needs Debian's slurm-wlm and munge
-# (scripts/setup-deps.sh installs them) and runs as root, as Slurm's daemons do.
+# (scripts/setup-deps.sh installs them). Its daemons run as the user who starts
+# it, root or not, and run that user's jobs.
 #   scripts/slurm-cluster.sh start DIR   makes DIR, starts munged, slurmctld and
 #                                        slurmd there and waits for the node
 #   scripts/slurm-cluster.sh stop DIR    cancels its jobs and stops the daemons
@@ -127,6 +128,7 @@ TaskPlugin=task/none
 JobAcctGatherType=jobacct_gather/none
 AccountingStorageType=accounting_storage/none
 JobCompType=jobcomp/none
+MailProg=/bin/true
 MpiDefault=none
 SwitchType=switch/none
 SelectType=select/cons_tres
