@@ -522,12 +522,11 @@ std::vector<int> ArrayTasks(const std::string &list) {
     std::vector<int> tasks;
     std::stringstream parts(list.substr(0, list.find('%')));
     for (std::string part; std::getline(parts, part, ',');) {
-        int first = 0, last = 0;
         const char *text = part.c_str();
         char *end = nullptr;
-        first = static_cast<int>(std::strtol(text, &end, 10));
+        const int first = static_cast<int>(std::strtol(text, &end, 10));
         if (end == text) continue;
-        last = *end == '-' ? static_cast<int>(std::strtol(end + 1, &end, 10)) : first;
+        const int last = *end == '-' ? static_cast<int>(std::strtol(end + 1, &end, 10)) : first;
         for (int t = first; t <= last && t - first < 100000; ++t) tasks.push_back(t);
     }
     return tasks;
